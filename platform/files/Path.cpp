@@ -1,0 +1,33 @@
+#include "platform/files/Path.h"
+
+#include <sys/stat.h>
+
+namespace adminhost {
+namespace {
+
+std::string root = "/";
+
+}  // namespace
+
+void setSystemRoot(std::string directory) {
+    while (directory.size() > 1 && directory.back() == '/') {
+        directory.pop_back();
+    }
+    root = directory.empty() ? "/" : std::move(directory);
+}
+
+const std::string& systemRoot() noexcept { return root; }
+
+DiskPath diskPath(const HostPath& path) {
+    if (root == "/" || !path.text().starts_with('/')) {
+        return DiskPath(path.text());
+    }
+    return DiskPath(root + path.text());
+}
+
+bool exists(const DiskPath& path) noexcept {
+    struct stat status {};
+    return ::stat(path.c_str(), &status) == 0;
+}
+
+}  // namespace adminhost

@@ -1,0 +1,48 @@
+#pragma once
+
+// Paths and the system root.
+//
+// A HostPath is a path as the service's administrator knows it: what settings hold and operations answer and log. A
+// DiskPath is where it lies on this disk. What touches the disk takes a DiskPath only; diskPath() is the one way from
+// the first to the second. Both compare and copy as their text; neither is normalised.
+
+#include <compare>
+#include <string>
+#include <utility>
+
+namespace adminhost {
+
+class HostPath {
+  public:
+    HostPath() = default;
+    explicit HostPath(std::string text) : _text(std::move(text)) {}
+    [[nodiscard]] const std::string& text() const noexcept { return _text; }
+    friend auto operator<=>(const HostPath&, const HostPath&) = default;
+
+  private:
+    std::string _text;
+};
+
+class DiskPath {
+  public:
+    DiskPath() = default;
+    explicit DiskPath(std::string text) : _text(std::move(text)) {}
+    [[nodiscard]] const std::string& text() const noexcept { return _text; }
+    [[nodiscard]] const char* c_str() const noexcept { return _text.c_str(); }
+    friend auto operator<=>(const DiskPath&, const DiskPath&) = default;
+
+  private:
+    std::string _text;
+};
+
+/// Sets the directory below which every absolute host path lies: "/" at first. Set once, before requests are served.
+void setSystemRoot(std::string directory);
+[[nodiscard]] const std::string& systemRoot() noexcept;
+
+/// The host path below the system root. A relative path stays as it is: relative to the current directory.
+[[nodiscard]] DiskPath diskPath(const HostPath& path);
+
+/// Whether a file system entry exists there (a link is followed). False also when it cannot be known.
+[[nodiscard]] bool exists(const DiskPath& path) noexcept;
+
+}  // namespace adminhost

@@ -1,0 +1,55 @@
+#pragma once
+
+// What the host gives a request handler: the base class, the forms of an answer, the defaults and fresh UUID texts.
+
+#include "platform/value/Value.h"
+
+#include <string>
+#include <string_view>
+#include <utility>
+
+namespace adminhost {
+
+/// What an operation answers: a response dictionary, nothing, or the framework's error response.
+class Response {
+  public:
+    enum class Kind { nothing, dictionary, error };
+
+    /// Nothing.
+    Response() noexcept = default;
+    Response(std::nullptr_t) noexcept {}
+    Response(Dictionary dictionary) noexcept : _kind(Kind::dictionary), _dictionary(std::move(dictionary)) {}
+    /// The error response for a code text; a dictionary of "error" (the code) and "message" (a sentence for people).
+    [[nodiscard]] static Response error(std::string_view code, std::string_view message);
+
+    [[nodiscard]] Kind kind() const noexcept { return _kind; }
+    /// Empty for nothing.
+    [[nodiscard]] const Dictionary& dictionary() const noexcept { return _dictionary; }
+    [[nodiscard]] Dictionary& dictionary() noexcept { return _dictionary; }
+
+  private:
+    Kind _kind = Kind::nothing;
+    Dictionary _dictionary;
+};
+
+/// Base of every request handler.
+class PluginRequestHandler {
+  public:
+    PluginRequestHandler() = default;
+    PluginRequestHandler(const PluginRequestHandler&) = delete;
+    PluginRequestHandler& operator=(const PluginRequestHandler&) = delete;
+    virtual ~PluginRequestHandler() = default;
+
+    /// The framework's standard error response for an error-code text.
+    [[nodiscard]] Response responseForError(std::string_view code) const;
+};
+
+/// The process's user defaults: values of the daemon's configuration that plug-ins read. Null for an unknown name.
+[[nodiscard]] const Value& userDefault(std::string_view name) noexcept;
+/// Set by the worker before requests are served.
+void setUserDefault(std::string_view name, Value value);
+
+/// A fresh random UUID (RFC 4122, version 4) in its canonical text of 36 characters, upper case.
+[[nodiscard]] std::string makeUUIDString();
+
+}  // namespace adminhost

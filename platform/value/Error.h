@@ -1,0 +1,19 @@
+#pragma once
+
+// Error record: how an operation says what went wrong.
+
+#include <cstdint>
+#include <optional>
+#include <string>
+
+namespace adminhost {
+
+struct Error {
+    std::string domain;
+    std::int64_t code = 0;
+    std::optional<std::string> description;
+
+    friend bool operator==(const Error&, const Error&) = default;
+};
+
+}  // namespace adminhost

@@ -1,0 +1,202 @@
+#include "platform/value/Value.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace adminhost {
+namespace {
+
+/// Up to this many keys a look-up compares keys one by one, which is faster than hashing and needs no index.
+constexpr std::size_t linearLimit = 16;
+constexpr std::size_t notFound = static_cast<std::size_t>(-1);
+const Value nullValue;
+
+}  // namespace
+
+Dictionary::Dictionary() noexcept = default;
+Dictionary::Dictionary(const Dictionary&) = default;
+Dictionary::Dictionary(Dictionary&&) noexcept = default;
+Dictionary& Dictionary::operator=(const Dictionary&) = default;
+Dictionary& Dictionary::operator=(Dictionary&&) noexcept = default;
+Dictionary::~Dictionary() = default;
+
+Dictionary::Dictionary(std::initializer_list<DictionaryEntry> entries) {
+    for (const DictionaryEntry& entry : entries) {
+        set(entry.key, entry.value);
+    }
+}
+
+std::size_t Dictionary::indexOf(std::string_view key) const noexcept {
+    if (_entries.size() <= linearLimit) {
+        const auto found =
+            std::find_if(_entries.begin(), _entries.end(), [&](const DictionaryEntry& entry) { return entry.key == key; });
+        return found == _entries.end() ? notFound : static_cast<std::size_t>(found - _entries.begin());
+    }
+    const auto found = _index.find(key);
+    return found == _index.end() ? notFound : found->second;
+}
+
+void Dictionary::rebuildIndex() {
+    _index.clear();
+    if (_entries.size() <= linearLimit) {
+        return;
+    }
+    for (std::size_t i = 0; i < _entries.size(); ++i) {
+        _index.emplace(_entries[i].key, i);
+    }
+}
+
+const Value* Dictionary::find(std::string_view key) const noexcept {
+    const std::size_t index = indexOf(key);
+    return index == notFound ? nullptr : &_entries[index].value;
+}
+
+Value* Dictionary::find(std::string_view key) noexcept {
+    const std::size_t index = indexOf(key);
+    return index == notFound ? nullptr : &_entries[index].value;
+}
+
+const Value& Dictionary::get(std::string_view key) const noexcept {
+    const Value* value = find(key);
+    return value == nullptr ? nullValue : *value;
+}
+
+const Value& Dictionary::at(std::string_view keyPath) const noexcept {
+    const Dictionary* dictionary = this;
+    for (;;) {
+        const std::size_t dot = keyPath.find('.');
+        const Value& value = dictionary->get(keyPath.substr(0, dot));
+        if (dot == std::string_view::npos) {
+            return value;
+        }
+        dictionary = value.dictionary();
+        if (dictionary == nullptr) {
+            return nullValue;
+        }
+        keyPath.remove_prefix(dot + 1);
+    }
+}
+
+void Dictionary::set(std::string_view key, Value value) {
+    if (value.isNull()) {
+        remove(key);
+        return;
+    }
+    const std::size_t index = indexOf(key);
+    if (index != notFound) {
+        _entries[index].value = std::move(value);
+        return;
+    }
+    _entries.push_back({std::string(key), std::move(value)});
+    if (_entries.size() == linearLimit + 1) {
+        rebuildIndex();
+    } else if (_entries.size() > linearLimit) {
+        _index.emplace(key, _entries.size() - 1);
+    }
+}
+
+bool Dictionary::remove(std::string_view key) {
+    const std::size_t index = indexOf(key);
+    if (index == notFound) {
+        return false;
+    }
+    _entries.erase(_entries.begin() + static_cast<std::ptrdiff_t>(index));
+    rebuildIndex();
+    return true;
+}
+
+void Dictionary::clear() noexcept {
+    _entries.clear();
+    _index.clear();
+}
+
+std::size_t Dictionary::size() const noexcept { return _entries.size(); }
+bool Dictionary::empty() const noexcept { return _entries.empty(); }
+Dictionary::const_iterator Dictionary::begin() const noexcept { return _entries.begin(); }
+Dictionary::const_iterator Dictionary::end() const noexcept { return _entries.end(); }
+
+bool operator==(const Dictionary& a, const Dictionary& b) {
+    return a.size() == b.size() && std::all_of(a.begin(), a.end(), [&](const DictionaryEntry& entry) {
+               const Value* other = b.find(entry.key);
+               return other != nullptr && *other == entry.value;
+           });
+}
+
+Value::Value(Array value) noexcept : _value(std::move(value)) {}
+Value::Value(const Value&) = default;
+Value::Value(Value&& other) noexcept : _value(std::exchange(other._value, std::monostate{})) {}
+Value& Value::operator=(const Value&) = default;
+Value& Value::operator=(Value&& other) noexcept {
+    if (this != &other) {
+        // Taken out first: the other value may lie inside this one.
+        auto taken = std::exchange(other._value, std::monostate{});
+        _value = std::move(taken);
+    }
+    return *this;
+}
+Value::~Value() = default;
+
+Value::Type Value::type() const noexcept {
+    constexpr Type types[] = {Type::null, Type::boolean, Type::integer, Type::integer, Type::real,
+                              Type::string, Type::date, Type::data, Type::array, Type::dictionary};
+    return types[_value.index()];
+}
+
+std::optional<bool> Value::boolean() const noexcept {
+    const bool* value = std::get_if<bool>(&_value);
+    return value == nullptr ? std::nullopt : std::optional(*value);
+}
+
+std::optional<std::int64_t> Value::integer() const noexcept {
+    const auto* value = std::get_if<std::int64_t>(&_value);
+    return value == nullptr ? std::nullopt : std::optional(*value);
+}
+
+std::optional<std::uint64_t> Value::unsignedInteger() const noexcept {
+    if (const auto* value = std::get_if<std::uint64_t>(&_value)) {
+        return *value;
+    }
+    const auto* value = std::get_if<std::int64_t>(&_value);
+    return value == nullptr || *value < 0 ? std::nullopt : std::optional(static_cast<std::uint64_t>(*value));
+}
+
+std::optional<double> Value::real() const noexcept {
+    const double* value = std::get_if<double>(&_value);
+    return value == nullptr ? std::nullopt : std::optional(*value);
+}
+
+std::optional<Date> Value::date() const noexcept {
+    const Date* value = std::get_if<Date>(&_value);
+    return value == nullptr ? std::nullopt : std::optional(*value);
+}
+
+const Array* Value::array() const noexcept { return std::get_if<Array>(&_value); }
+Array* Value::array() noexcept { return std::get_if<Array>(&_value); }
+
+bool operator==(const Value& a, const Value& b) { return a._value == b._value; }
+
+std::string_view nameOf(Value::Type type) noexcept {
+    switch (type) {
+        case Value::Type::null:
+            return "null";
+        case Value::Type::boolean:
+            return "true or false";
+        case Value::Type::integer:
+            return "whole number";
+        case Value::Type::real:
+            return "number";
+        case Value::Type::string:
+            return "text";
+        case Value::Type::date:
+            return "date";
+        case Value::Type::data:
+            return "data";
+        case Value::Type::array:
+            return "list";
+        case Value::Type::dictionary:
+            return "dictionary";
+    }
+    return "value";
+}
+
+}  // namespace adminhost

@@ -1,0 +1,150 @@
+#pragma once
+
+// Property-list values: what requests, answers, settings files and tool output are made of.
+//
+// A Value is a regular type: copyable, comparable, cheap to move. It owns everything below it. A moved-from Value is null.
+// Equality is equality of type and content: the integer 1, the real 1.0 and true are three different values. A
+// non-negative integer is one value whichever of the two integer types it was made from.
+
+#include <chrono>
+#include <concepts>
+#include <cstdint>
+#include <initializer_list>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+#include <variant>
+#include <vector>
+
+namespace adminhost {
+
+class Value;
+struct DictionaryEntry;
+
+using Data = std::vector<std::uint8_t>;
+using Date = std::chrono::sys_seconds;  ///< seconds since 1970-01-01T00:00:00Z, the resolution of a property list
+using Array = std::vector<Value>;
+
+/// String-keyed values in insertion order. A key stands at most once, and never with a null value: storing null
+/// removes the key. Look-up takes constant time however many keys there are; removal is linear.
+/// Iterators and pointers to values are invalidated by every change.
+class Dictionary {
+  public:
+    using const_iterator = std::vector<DictionaryEntry>::const_iterator;
+
+    Dictionary() noexcept;
+    Dictionary(std::initializer_list<DictionaryEntry> entries);
+    Dictionary(const Dictionary&);
+    Dictionary(Dictionary&&) noexcept;
+    Dictionary& operator=(const Dictionary&);
+    Dictionary& operator=(Dictionary&&) noexcept;
+    ~Dictionary();
+
+    /// The value under the key, or null if there is none.
+    [[nodiscard]] const Value* find(std::string_view key) const noexcept;
+    [[nodiscard]] Value* find(std::string_view key) noexcept;
+    [[nodiscard]] bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
+    /// The value under the key; a null Value (of static life) if there is none.
+    [[nodiscard]] const Value& get(std::string_view key) const noexcept;
+    /// Follows a key path ("optionalArguments.variant") through nested dictionaries; a null Value where it ends early.
+    [[nodiscard]] const Value& at(std::string_view keyPath) const noexcept;
+
+    /// Stores the value; an existing key keeps its place. A null value removes the key.
+    void set(std::string_view key, Value value);
+    /// Removes the key if it is there; answers whether it was.
+    bool remove(std::string_view key);
+    void clear() noexcept;
+
+    [[nodiscard]] std::size_t size() const noexcept;
+    [[nodiscard]] bool empty() const noexcept;
+    [[nodiscard]] const_iterator begin() const noexcept;
+    [[nodiscard]] const_iterator end() const noexcept;
+
+    /// Same keys with equal values, in any order.
+    friend bool operator==(const Dictionary& a, const Dictionary& b);
+
+  private:
+    [[nodiscard]] std::size_t indexOf(std::string_view key) const noexcept;
+    void rebuildIndex();
+
+    struct Hash {
+        using is_transparent = void;
+        std::size_t operator()(std::string_view text) const noexcept { return std::hash<std::string_view>{}(text); }
+    };
+
+    std::vector<DictionaryEntry> _entries;
+    /// Only kept once there are more than a few keys.
+    std::unordered_map<std::string, std::size_t, Hash, std::equal_to<>> _index;
+};
+
+class Value {
+  public:
+    enum class Type { null, boolean, integer, real, string, date, data, array, dictionary };
+
+    Value() noexcept = default;
+    Value(std::nullptr_t) noexcept {}
+    template <std::same_as<bool> B>
+    Value(B value) noexcept : _value(value) {}
+    template <std::integral I>
+        requires(!std::same_as<I, bool> && !std::same_as<I, char>)
+    Value(I value) noexcept {
+        if constexpr (std::unsigned_integral<I>) {
+            if (value > static_cast<std::uint64_t>(INT64_MAX)) {
+                _value = static_cast<std::uint64_t>(value);
+                return;
+            }
+        }
+        _value = static_cast<std::int64_t>(value);
+    }
+    Value(double value) noexcept : _value(value) {}
+    Value(std::string value) noexcept : _value(std::move(value)) {}
+    Value(std::string_view value) : _value(std::string(value)) {}
+    Value(const char* value) : _value(std::string(value)) {}
+    Value(Date value) noexcept : _value(value) {}
+    Value(Data value) noexcept : _value(std::move(value)) {}
+    Value(Array value) noexcept;
+    Value(Dictionary value) noexcept : _value(std::move(value)) {}
+    Value(const Value&);
+    Value(Value&&) noexcept;
+    Value& operator=(const Value&);
+    Value& operator=(Value&&) noexcept;
+    ~Value();
+
+    [[nodiscard]] Type type() const noexcept;
+    [[nodiscard]] bool isNull() const noexcept { return std::holds_alternative<std::monostate>(_value); }
+    [[nodiscard]] bool isInteger() const noexcept { return type() == Type::integer; }
+
+    // Each answers null (or nothing) when the value is of another type; none converts.
+    [[nodiscard]] std::optional<bool> boolean() const noexcept;
+    /// Nothing also for an integer above the signed range.
+    [[nodiscard]] std::optional<std::int64_t> integer() const noexcept;
+    /// Nothing for a negative integer.
+    [[nodiscard]] std::optional<std::uint64_t> unsignedInteger() const noexcept;
+    [[nodiscard]] std::optional<double> real() const noexcept;
+    [[nodiscard]] std::optional<Date> date() const noexcept;
+    [[nodiscard]] const std::string* string() const noexcept { return std::get_if<std::string>(&_value); }
+    [[nodiscard]] const Data* data() const noexcept { return std::get_if<Data>(&_value); }
+    [[nodiscard]] const Array* array() const noexcept;
+    [[nodiscard]] Array* array() noexcept;
+    [[nodiscard]] const Dictionary* dictionary() const noexcept { return std::get_if<Dictionary>(&_value); }
+    [[nodiscard]] Dictionary* dictionary() noexcept { return std::get_if<Dictionary>(&_value); }
+
+    friend bool operator==(const Value& a, const Value& b);
+
+  private:
+    std::variant<std::monostate, bool, std::int64_t, std::uint64_t, double, std::string, Date, Data, Array, Dictionary>
+        _value;
+};
+
+struct DictionaryEntry {
+    std::string key;
+    Value value;
+
+    friend bool operator==(const DictionaryEntry&, const DictionaryEntry&) = default;
+};
+
+/// The name of a type as messages to people use it: "text", "dictionary", "whole number", ...
+[[nodiscard]] std::string_view nameOf(Value::Type type) noexcept;
+
+}  // namespace adminhost

@@ -1,0 +1,80 @@
+#include "platform/value/Value.h"
+
+#include <gtest/gtest.h>
+
+namespace adminhost {
+namespace {
+
+TEST(Value, IntegerAndRealAndTrueAreThreeDifferentValues) {
+    EXPECT_NE(Value(1), Value(1.0));
+    EXPECT_NE(Value(1), Value(true));
+    EXPECT_NE(Value(1.0), Value(true));
+}
+
+TEST(Value, NonNegativeIntegersAreEqualWhicheverTypeTheyWereMadeFrom) {
+    EXPECT_EQ(Value(std::int64_t{7}), Value(std::uint64_t{7}));
+    EXPECT_EQ(Value(UINT64_MAX).unsignedInteger(), UINT64_MAX);
+    EXPECT_EQ(Value(UINT64_MAX).integer(), std::nullopt);
+    EXPECT_EQ(Value(-1).unsignedInteger(), std::nullopt);
+}
+
+TEST(Value, MovedFromValueIsNull) {
+    Value a("text");
+    const Value b = std::move(a);
+    EXPECT_TRUE(a.isNull());  // NOLINT(bugprone-use-after-move): that it is null is the contract
+    EXPECT_EQ(b, Value("text"));
+}
+
+TEST(Value, MayBeAssignedFromAValueInsideItself) {
+    Value a(Array{Value("inner")});
+    a = Value((*a.array())[0]);
+    EXPECT_EQ(a, Value("inner"));
+    Value b(Dictionary{{"k", Array{Value(1)}}});
+    b = std::move(*b.dictionary()->find("k"));
+    EXPECT_EQ(b, Value(Array{Value(1)}));
+}
+
+TEST(Dictionary, KeepsInsertionOrderAndAnExistingKeysPlace) {
+    Dictionary d;
+    for (int i = 0; i < 100; ++i) {
+        d.set("k" + std::to_string(i), i);
+    }
+    d.set("k3", "changed");
+    ASSERT_TRUE(d.remove("k50"));
+    int i = 0;
+    for (const DictionaryEntry& entry : d) {
+        if (i == 50) {
+            ++i;
+        }
+        EXPECT_EQ(entry.key, "k" + std::to_string(i));
+        EXPECT_EQ(d.get(entry.key), entry.value);
+        ++i;
+    }
+    EXPECT_EQ(d.size(), 99U);
+    EXPECT_EQ(d.get("k3"), Value("changed"));
+    EXPECT_FALSE(d.contains("k50"));
+}
+
+TEST(Dictionary, StoringNullRemovesTheKey) {
+    Dictionary d{{"a", 1}, {"b", 2}};
+    d.set("a", nullptr);
+    EXPECT_FALSE(d.contains("a"));
+    d.set("c", Value());
+    EXPECT_EQ(d.size(), 1U);
+}
+
+TEST(Dictionary, FollowsKeyPathsAndAnswersNullWhereTheyEndEarly) {
+    const Dictionary d{{"optionalArguments", Dictionary{{"variant", "getConfig"}}}, {"text", "x"}};
+    EXPECT_EQ(d.at("optionalArguments.variant"), Value("getConfig"));
+    EXPECT_TRUE(d.at("optionalArguments.languages").isNull());
+    EXPECT_TRUE(d.at("text.variant").isNull());
+    EXPECT_TRUE(d.at("").isNull());
+}
+
+TEST(Dictionary, EqualityIgnoresOrder) {
+    EXPECT_EQ((Dictionary{{"a", 1}, {"b", 2}}), (Dictionary{{"b", 2}, {"a", 1}}));
+    EXPECT_NE((Dictionary{{"a", 1}}), (Dictionary{{"a", 1}, {"b", 2}}));
+}
+
+}  // namespace
+}  // namespace adminhost
