@@ -16,7 +16,9 @@ void setSystemRoot(std::string directory) {
     root = directory.empty() ? "/" : std::move(directory);
 }
 
-const std::string& systemRoot() noexcept { return root; }
+const std::string& systemRoot() noexcept {
+    return root;
+}
 
 DiskPath diskPath(const HostPath& path) {
     if (root == "/" || !path.text().starts_with('/')) {

@@ -1,0 +1,67 @@
+#include "platform/files/File.h"
+
+#include <cerrno>
+#include <system_error>
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace adminhost {
+namespace {
+
+class Descriptor {
+  public:
+    explicit Descriptor(int descriptor) noexcept : _descriptor(descriptor) {}
+    Descriptor(const Descriptor&) = delete;
+    Descriptor& operator=(const Descriptor&) = delete;
+    ~Descriptor() {
+        if (_descriptor >= 0) {
+            ::close(_descriptor);
+        }
+    }
+    [[nodiscard]] int get() const noexcept { return _descriptor; }
+
+  private:
+    int _descriptor;
+};
+
+std::nullopt_t fail(const DiskPath& path, int number, Error* error) {
+    if (error != nullptr) {
+        *error = Error{"posix", number, "cannot read " + path.text() + ": " + std::generic_category().message(number)};
+    }
+    return std::nullopt;
+}
+
+}  // namespace
+
+std::optional<std::string> readFile(const DiskPath& path, std::size_t maximum, Error* error) {
+    const Descriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    struct stat status {};
+    if (file.get() < 0 || ::fstat(file.get(), &status) != 0) {
+        return fail(path, errno, error);
+    }
+    if (!S_ISREG(status.st_mode)) {
+        return fail(path, S_ISDIR(status.st_mode) ? EISDIR : EINVAL, error);
+    }
+    std::string bytes;
+    std::size_t room = static_cast<std::size_t>(status.st_size) + 1;  // one more, so that growth is noticed
+    for (;;) {
+        if (bytes.size() > maximum || static_cast<std::size_t>(status.st_size) > maximum) {
+            return fail(path, EFBIG, error);
+        }
+        const std::size_t used = bytes.size();
+        bytes.resize(used + room);
+        const ssize_t count = ::read(file.get(), bytes.data() + used, room);
+        bytes.resize(used + (count > 0 ? static_cast<std::size_t>(count) : 0));
+        if (count == 0) {
+            return bytes;
+        }
+        if (count < 0 && errno != EINTR) {
+            return fail(path, errno, error);
+        }
+        room = 64UL << 10U;
+    }
+}
+
+}  // namespace adminhost

@@ -1,0 +1,58 @@
+#include "platform/files/File.h"
+
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+namespace adminhost {
+namespace {
+
+class ReadFile : public testing::Test {
+  protected:
+    void SetUp() override {
+        std::string pattern = testing::TempDir() + "readfile.XXXXXX";
+        ASSERT_NE(::mkdtemp(pattern.data()), nullptr);
+        _directory = pattern;
+    }
+    void TearDown() override { std::filesystem::remove_all(_directory); }
+
+    std::filesystem::path _directory;
+};
+
+TEST_F(ReadFile, AnswersAllBytesUpToTheMaximumAndNotOneMore) {
+    const DiskPath path(_directory / "f");
+    std::ofstream(path.text()) << std::string("ab\0c", 4);
+    EXPECT_EQ(readFile(path, 4), std::string("ab\0c", 4));
+    Error error;
+    EXPECT_EQ(readFile(path, 3, &error), std::nullopt);
+    EXPECT_EQ(error.code, EFBIG);
+}
+
+TEST_F(ReadFile, EmptyFileIsEmptyText) {
+    std::ofstream(_directory / "f");
+    EXPECT_EQ(readFile(DiskPath(_directory / "f"), 10), "");
+}
+
+TEST_F(ReadFile, MissingFileDirectoryAndPipeAreErrorsThatNameThePath) {
+    Error error;
+    EXPECT_EQ(readFile(DiskPath(_directory / "none"), 10, &error), std::nullopt);
+    EXPECT_EQ(error.code, ENOENT);
+    EXPECT_NE(error.description->find("none"), std::string::npos);
+    EXPECT_EQ(readFile(DiskPath(_directory), 10, &error), std::nullopt);
+    EXPECT_EQ(error.code, EISDIR);
+    ASSERT_EQ(::mkfifo((_directory / "pipe").c_str(), 0600), 0);
+    EXPECT_EQ(readFile(DiskPath(_directory / "pipe"), 10, &error), std::nullopt);
+    EXPECT_EQ(error.code, EINVAL);
+}
+
+TEST_F(ReadFile, FilesWithoutASizeAreReadToTheirEnd) {
+    const auto status = readFile(DiskPath("/proc/self/status"), 1U << 20U);
+    ASSERT_TRUE(status);
+    EXPECT_NE(status->find("Name:"), std::string::npos);
+}
+
+}  // namespace
+}  // namespace adminhost
