@@ -1,0 +1,184 @@
+#include "tests/support/SampleRoot.h"
+
+#include <array>
+#include <cerrno>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <stdexcept>
+#include <system_error>
+
+#include <fcntl.h>
+#include <nlohmann/json.hpp>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace adminhost::test {
+
+namespace fs = std::filesystem;
+
+namespace {
+
+// Tests of the task room use this as well, so it does not go through that room.
+std::string run(const std::vector<std::string>& command) {
+    std::array<int, 2> pipe{};
+    if (::pipe2(pipe.data(), O_CLOEXEC) != 0) {
+        throw std::system_error(errno, std::generic_category(), "pipe");
+    }
+    posix_spawn_file_actions_t actions{};
+    ::posix_spawn_file_actions_init(&actions);
+    ::posix_spawn_file_actions_adddup2(&actions, pipe[1], STDOUT_FILENO);
+    std::vector<char*> arguments;
+    arguments.reserve(command.size() + 1);
+    for (const auto& argument : command) {
+        arguments.push_back(const_cast<char*>(argument.c_str()));
+    }
+    arguments.push_back(nullptr);
+    pid_t child = -1;
+    const int failure = ::posix_spawnp(&child, arguments[0], &actions, nullptr, arguments.data(), environ);
+    ::posix_spawn_file_actions_destroy(&actions);
+    ::close(pipe[1]);
+    std::string output;
+    std::array<char, 65536> piece{};
+    for (ssize_t count = 0; failure == 0 && (count = ::read(pipe[0], piece.data(), piece.size())) > 0;) {
+        output.append(piece.data(), static_cast<std::size_t>(count));
+    }
+    ::close(pipe[0]);
+    int status = 0;
+    if (failure != 0 || ::waitpid(child, &status, 0) != child || status != 0) {
+        throw std::runtime_error(command[0] + " failed (start " + std::to_string(failure) + ", status " +
+                                 std::to_string(status) + ")");
+    }
+    return output;
+}
+
+const char* const callsLog = "/var/log/tool-calls.log";
+
+}  // namespace
+
+SampleRoot::SampleRoot(const SampleSizes& sizes) {
+    std::string pattern = (fs::temp_directory_path() / "sample-XXXXXX").string();
+    if (::mkdtemp(pattern.data()) == nullptr) {
+        throw std::system_error(errno, std::generic_category(), "mkdtemp " + pattern);
+    }
+    _base = fs::canonical(pattern).string();
+    _path = _base + "/root";
+    std::vector<std::string> command{SOURCE_DIR "/demo/make-root", _path};
+    const auto add = [&command](const char* option, const std::optional<int>& size) {
+        if (size) {
+            command.insert(command.end(), {option, std::to_string(*size)});
+        }
+    };
+    add("--cameras", sizes.cameras);
+    add("--workflows", sizes.workflows);
+    add("--properties", sizes.properties);
+    add("--jobs", sizes.jobs);
+    add("--access-entries", sizes.accessEntries);
+    add("--accounts", sizes.accounts);
+    try {
+        run(command);
+    } catch (...) {
+        std::error_code ignored;
+        fs::remove_all(_base, ignored);
+        throw;
+    }
+}
+
+SampleRoot::~SampleRoot() {
+    std::error_code ignored;
+    try {
+        clearSwitches();
+        if (fs::exists(disk("/var/run/lumioserverd.pid"))) {
+            run({disk("/usr/sbin/lumioctl"), "server", "stop"});
+        }
+    } catch (const std::exception&) {
+        // The daemon ends by itself when its pid file goes with the directory.
+    }
+    fs::remove_all(_base, ignored);
+}
+
+std::string SampleRoot::databasePath() const {
+    return disk("/var/lumio/server/db/lumio.sqlite3");
+}
+
+std::string SampleRoot::sharedFilesystemPath() const {
+    return disk("/Library/SorvaneProducer/Shared");
+}
+
+std::string SampleRoot::memberPreferencesPath() const {
+    return sharedFilesystemPath() + "/Server/member_preferences_" + uuidOf("member", "media1") + ".plist";
+}
+
+std::string SampleRoot::clusterPreferencesPath() const {
+    return sharedFilesystemPath() + "/Server/cluster_preferences.plist";
+}
+
+std::string SampleRoot::identityPreferencesPath() const {
+    return disk("/Library/Preferences/com.brenn.lumioserverd.plist");
+}
+
+std::string SampleRoot::sql(const std::string& statements) const {
+    return run({"sqlite3", "-batch", "-init", "/dev/null", "-list", "-noheader", databasePath(), statements});
+}
+
+std::string SampleRoot::read(const std::string& hostPath) const {
+    std::ifstream file(disk(hostPath), std::ios::binary);
+    std::ostringstream content;
+    if (!file || !(content << file.rdbuf() || file.peek() == std::ifstream::traits_type::eof())) {
+        throw std::runtime_error("cannot read " + hostPath);
+    }
+    return content.str();
+}
+
+void SampleRoot::write(const std::string& hostPath, const std::string& content) const {
+    const fs::path file = disk(hostPath);
+    fs::create_directories(file.parent_path());
+    std::ofstream out(file, std::ios::binary | std::ios::trunc);
+    if (!(out << content << std::flush)) {
+        throw std::runtime_error("cannot write " + hostPath);
+    }
+}
+
+void SampleRoot::remove(const std::string& hostPath) const {
+    fs::remove_all(disk(hostPath));
+}
+
+void SampleRoot::setSwitch(const std::string& name, const std::string& content) const {
+    write("/etc/demo/" + name, content);
+}
+
+void SampleRoot::clearSwitches() const {
+    remove("/etc/demo");
+    fs::create_directories(disk("/etc/demo"));
+}
+
+void SampleRoot::recordToolCalls() const {
+    write(callsLog, "");
+}
+
+std::vector<ToolCall> SampleRoot::toolCalls() const {
+    std::vector<ToolCall> calls;
+    std::istringstream lines(read(callsLog));
+    for (std::string line; std::getline(lines, line);) {
+        const auto call = nlohmann::json::parse(line);
+        calls.push_back(
+            {call.at("tool"), call.at("arguments"), call.value("environment", std::map<std::string, std::string>{})});
+    }
+    return calls;
+}
+
+std::string SampleRoot::uuidOf(const std::string& kind, const std::string& name) {
+    static std::map<std::pair<std::string, std::string>, std::string> known;
+    auto& uuid = known[{kind, name}];
+    if (uuid.empty()) {
+        uuid = run(
+            {"/usr/bin/python3", "-B", "-S", "-c",
+             "import sys; sys.path.insert(0, sys.argv[1]); import names; print(names.uuid_of(*sys.argv[2:]), end='')",
+             SOURCE_DIR "/demo/sample", kind, name});
+    }
+    return uuid;
+}
+
+}  // namespace adminhost::test

@@ -1,0 +1,84 @@
+#pragma once
+
+// A root directory of the sample service for one test: made by demo/make-root in a temporary directory of its own
+// (below TMPDIR), removed with it, its daemon stopped first.
+//
+// What goes wrong while preparing throws std::runtime_error: the test then fails with its text.
+
+#include "platform/files/Path.h"
+
+#include <map>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace adminhost::test {
+
+/// Sizes of the sample library; what is not set has the library's own believable content.
+struct SampleSizes {
+    std::optional<int> cameras;
+    std::optional<int> workflows;
+    std::optional<int> properties;
+    std::optional<int> jobs;
+    std::optional<int> accessEntries;  ///< for each camera and workflow
+    std::optional<int> accounts;
+};
+
+/// One recorded run of a stand-in.
+struct ToolCall {
+    std::string tool;  ///< its host path
+    std::vector<std::string> arguments;
+    std::map<std::string, std::string> environment;  ///< KRB5CCNAME, if it was set
+
+    friend bool operator==(const ToolCall&, const ToolCall&) = default;
+};
+
+class SampleRoot {
+  public:
+    explicit SampleRoot(const SampleSizes& sizes = {});
+    ~SampleRoot();
+    SampleRoot(const SampleRoot&) = delete;
+    SampleRoot& operator=(const SampleRoot&) = delete;
+
+    [[nodiscard]] const std::string& path() const noexcept { return _path; }  ///< without a slash at the end
+    [[nodiscard]] const std::string& directory() const noexcept {
+        return _base;
+    }  ///< holds the root: room for a test's own files
+
+    /// Where a host path ("/var/lumio/server") lies on the disk. Independent of the process's system root.
+    [[nodiscard]] std::string disk(const std::string& hostPath) const { return _path + hostPath; }
+
+    [[nodiscard]] std::string databasePath() const;             ///< disk path
+    [[nodiscard]] std::string sharedFilesystemPath() const;     ///< disk path
+    [[nodiscard]] std::string memberPreferencesPath() const;    ///< disk path
+    [[nodiscard]] std::string clusterPreferencesPath() const;   ///< disk path
+    [[nodiscard]] std::string identityPreferencesPath() const;  ///< disk path
+
+    /// Runs SQL through the real sqlite3 tool; answers its output in list mode ("a|b" lines). Throws when the tool
+    /// fails.
+    std::string sql(const std::string& statements) const;
+
+    /// A file's whole content; throws when it cannot be read.
+    [[nodiscard]] std::string read(const std::string& hostPath) const;
+    /// Writes a file, with its directories.
+    void write(const std::string& hostPath, const std::string& content) const;
+    void remove(const std::string& hostPath) const;  ///< a file or a whole directory; nothing if it is not there
+
+    /// Makes a stand-in behave: its switch, for example ("lumioctl.exit", "3"). See demo/README.md.
+    void setSwitch(const std::string& name, const std::string& content) const;
+    void clearSwitches() const;
+
+    /// From now on the stand-ins record their calls; recorded ones are forgotten.
+    void recordToolCalls() const;
+    [[nodiscard]] std::vector<ToolCall> toolCalls() const;  ///< in their order
+
+    /// The UUID that the sample service uses for a user ("user", "anna") or group ("group", "editors") of its account
+    /// files, and for a camera ("camera", name) or workflow ("workflow", directory name) of the library.
+    [[nodiscard]] static std::string uuidOf(const std::string& kind, const std::string& name);
+
+  private:
+    std::string _base;
+    std::string _path;
+};
+
+}  // namespace adminhost::test
