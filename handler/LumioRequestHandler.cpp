@@ -1,0 +1,39 @@
+#include "handler/LumioRequestHandler.h"
+
+namespace lumio {
+
+using adminhost::Response;
+
+// What this release declares but does not offer yet says so, and never pretends to have done anything.
+
+Response LumioRequestHandler::writeSettingsWithRequest(const Dictionary&) {
+    return responseForError("NOT_AVAILABLE");
+}
+Response LumioRequestHandler::getStateWithRequest(const Dictionary&) {
+    return responseForError("NOT_AVAILABLE");
+}
+Response LumioRequestHandler::getLogPathsWithRequest(const Dictionary&) {
+    return responseForError("NOT_AVAILABLE");
+}
+Response LumioRequestHandler::startServiceWithVariant(const Value&) {
+    return responseForError("NOT_AVAILABLE");
+}
+Response LumioRequestHandler::stopServiceWithVariant(const Value&) {
+    return responseForError("NOT_AVAILABLE");
+}
+Response LumioRequestHandler::validateSettingsWithRequest(const Dictionary&) {
+    return responseForError("NOT_AVAILABLE");
+}
+Response LumioRequestHandler::createNimboAccountWithRequest(const Dictionary&) {
+    return responseForError("NOT_AVAILABLE");
+}
+
+Response LumioRequestHandler::recycleServiceWithVariant(const Value&) {
+    return nullptr;
+}
+
+std::vector<std::string_view> LumioRequestHandler::listOfResourceDateKeys() {
+    return {"updated_at", "created_at", "used_at"};
+}
+
+}  // namespace lumio

@@ -1,0 +1,85 @@
+#pragma once
+
+// The request handler: the operations through which administrators reach the service.
+//
+// An operation that serves a command has the command's name followed by WithRequest. It blocks until its answer is
+// built and reports failure inside the answer. Nothing is kept between requests. Every diagnostic
+// line starts with "adminhost_lumio: ". Each operation is written in the source file of its group.
+
+#include "handler/SettingsStore.h"
+#include "platform/framework/PluginRequestHandler.h"
+#include "platform/value/Value.h"
+
+#include <cstdint>
+#include <optional>
+#include <string_view>
+#include <vector>
+
+namespace lumio {
+
+class LumioRequestHandler : public adminhost::PluginRequestHandler, public SettingsStore {
+  public:
+    using Array = adminhost::Array;
+    using Dictionary = adminhost::Dictionary;
+    using Response = adminhost::Response;
+    using Value = adminhost::Value;
+
+    // Settings (ReadSettings.cpp, WriteSettings.cpp)
+
+    /// "readStatus", the preferences setup script's status, and "configuration", narrowed by
+    /// "optionalArguments.variant".
+    [[nodiscard]] Response readSettingsWithRequest(const Dictionary& request);
+    [[nodiscard]] Response writeSettingsWithRequest(const Dictionary& request);
+
+    // Service state and control (ServiceState.cpp); the variant may be null
+
+    [[nodiscard]] Response getStateWithRequest(const Dictionary& request);
+    [[nodiscard]] Response getLogPathsWithRequest(const Dictionary& request);
+    [[nodiscard]] Response startServiceWithVariant(const Value& variant);
+    [[nodiscard]] Response stopServiceWithVariant(const Value& variant);
+    /// Does nothing and answers nothing.
+    [[nodiscard]] Response recycleServiceWithVariant(const Value& variant);
+    [[nodiscard]] Response validateSettingsWithRequest(const Dictionary& request);
+    [[nodiscard]] Response createNimboAccountWithRequest(const Dictionary& request);
+
+    // Resources (resources/ResourceRequests.cpp)
+
+    /// "command", the list and "readStatus" 0; on failure only "readStatus", the error's code.
+    [[nodiscard]] Response getWorkflowsWithRequest(const Dictionary& request);
+    [[nodiscard]] Response getCamerasWithRequest(const Dictionary& request);
+    [[nodiscard]] Response getPropertiesWithRequest(const Dictionary& request);
+    // Each applies an array of change records, entry by entry; null does nothing. The answer is nothing.
+    Response setWorkflowACLWithRequest(const Array* changes);
+    Response processCameraChangesWithRequest(const Array* changes);
+    Response processPropertyChangesWithRequest(const Array* changes);
+
+    // Pieces of reading settings
+
+    // Each adds its file's share to the configuration; a file that cannot be loaded adds nothing.
+    void copyIdentityPreferencesToConfig(Dictionary& config) const;
+    void copyClusterPreferencesToConfig(Dictionary& config) const;
+    void copyMemberPreferencesToConfig(Dictionary& config) const;
+    void copyLibraryInformationToConfig(Dictionary& config) const;
+    /// Stores each value that the source has under one of the keys; a key the source lacks leaves the destination as it
+    /// is.
+    static void copyKeys(const std::vector<std::string_view>& keys, const Dictionary& source, Dictionary& destination);
+    // The keys that are read from, and written to, each file. The library's are only read.
+    [[nodiscard]] static std::vector<std::string_view> identityPreferencesKeysToCopy();
+    [[nodiscard]] static std::vector<std::string_view> libraryInformationKeysToCopy();
+    [[nodiscard]] static std::vector<std::string_view> memberPreferencesKeysToCopy();
+    [[nodiscard]] static std::vector<std::string_view> clusterPreferencesKeysToCopy();
+
+    // Pieces of writing settings
+
+    /// Runs the service's preferences setup script; its output is dropped. Its exit status, 0 on success.
+    [[nodiscard]] std::int32_t setupPreferences() const;
+
+    /// "updated_at", "created_at", "used_at": the resources' own date keys. No operation calls it.
+    [[nodiscard]] static std::vector<std::string_view> listOfResourceDateKeys();
+
+  private:
+    /// What the resolver said in its most recent did-not-resolve callback.
+    std::optional<Dictionary> mBJError;
+};
+
+}  // namespace lumio

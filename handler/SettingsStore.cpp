@@ -1,0 +1,167 @@
+#include "handler/SettingsStore.h"
+
+#include "platform/files/File.h"
+#include "platform/plist/PropertyList.h"
+#include "platform/value/Text.h"
+
+#include <unicode/uchar.h>
+#include <unicode/utf8.h>
+
+namespace lumio {
+
+using adminhost::Dictionary;
+using adminhost::HostPath;
+using adminhost::Value;
+
+namespace {
+
+constexpr std::size_t locationFileMaximum = std::size_t{1} << 20U;
+
+std::optional<Dictionary> load(const HostPath& path) {
+    std::optional<Value> value = adminhost::readPropertyList(adminhost::diskPath(path));
+    if (!value || value->dictionary() == nullptr) {
+        return std::nullopt;
+    }
+    return std::move(*value->dictionary());
+}
+
+std::optional<Dictionary> loadOrCached(const HostPath& path, std::string_view cachedName) {
+    // An entry that exists but cannot be loaded does not fall back to the cached copy.
+    if (adminhost::exists(adminhost::diskPath(path))) {
+        return load(path);
+    }
+    return load(HostPath(std::string(SettingsStore::stateDirectory).append(cachedName)));
+}
+
+std::optional<std::string> identityText(std::string_view key) {
+    const std::optional<Dictionary> identity = SettingsStore::identityPreferences();
+    if (!identity || !identity->contains(key)) {
+        return std::nullopt;
+    }
+    return textOf(identity->get(key));
+}
+
+bool separates(UChar32 character) noexcept {
+    switch (character) {
+        case '\t':
+        case '\n':
+        case '\v':
+        case '\f':
+        case '\r':
+        case 0x85:    // next line
+        case 0x2028:  // line separator
+        case 0x2029:  // paragraph separator
+            return true;
+        default:
+            return u_charType(character) == U_SPACE_SEPARATOR;
+    }
+}
+
+/// Hands out the tokens of a text. Every separator ends a token, so two in a row give an empty one.
+class Tokens {
+  public:
+    explicit Tokens(std::string_view text) noexcept : _text(text) {}
+
+    std::optional<std::string_view> next() noexcept {
+        if (_done) {
+            return std::nullopt;
+        }
+        const std::size_t begin = _at;
+        while (_at < _text.size()) {
+            const std::size_t end = _at;
+            UChar32 character = 0;
+            U8_NEXT(_text.data(), _at, _text.size(), character);
+            if (separates(character)) {
+                return _text.substr(begin, end - begin);
+            }
+        }
+        _done = true;
+        return _text.substr(begin);
+    }
+
+  private:
+    std::string_view _text;
+    std::size_t _at = 0;
+    bool _done = false;
+};
+
+/// The database value of the production section. Words are all that counts: indentation and nesting play no part.
+std::optional<std::string_view> productionDatabase(std::string_view text) {
+    Tokens tokens(text);
+    bool inProduction = false;
+    while (const std::optional<std::string_view> token = tokens.next()) {
+        if (!inProduction) {
+            inProduction = *token == "production:";
+        } else if (*token == "development:") {
+            return std::nullopt;
+        } else if (*token == "database:") {
+            return tokens.next();
+        }
+    }
+    return std::nullopt;
+}
+
+}  // namespace
+
+std::string SettingsStore::sharedFilesystemPath() {
+    return identityText("shared_filesystem").value_or(std::string(defaultSharedFilesystem));
+}
+
+std::optional<std::string> SettingsStore::memberUUID() {
+    return identityText("member_uuid");
+}
+
+HostPath SettingsStore::identityPreferencesPath() {
+    return HostPath("/Library/Preferences/com.brenn.lumioserverd.plist");
+}
+
+HostPath SettingsStore::libraryInformationPath() {
+    return HostPath(sharedFilesystemPath() + "/lumioserverd.plist");
+}
+
+HostPath SettingsStore::memberPreferencesPath() {
+    // Without a member UUID the name holds "(null)", and no such file is normally found.
+    return HostPath(sharedFilesystemPath() + "/Server/member_preferences_" + adminhost::textOf(memberUUID()) +
+                    ".plist");
+}
+
+HostPath SettingsStore::clusterPreferencesPath() {
+    return HostPath(sharedFilesystemPath() + "/Server/cluster_preferences.plist");
+}
+
+std::optional<Dictionary> SettingsStore::identityPreferences() {
+    return load(identityPreferencesPath());
+}
+
+std::optional<Dictionary> SettingsStore::libraryInformation() {
+    return load(libraryInformationPath());
+}
+
+std::optional<Dictionary> SettingsStore::memberPreferences() {
+    return loadOrCached(memberPreferencesPath(), "/cached_member_preferences.plist");
+}
+
+std::optional<Dictionary> SettingsStore::clusterPreferences() {
+    return loadOrCached(clusterPreferencesPath(), "/cached_cluster_preferences.plist");
+}
+
+HostPath SettingsStore::dbPath() {
+    const HostPath location(std::string(stateDirectory).append("/database.yml"));
+    const std::optional<std::string> text = adminhost::readFile(adminhost::diskPath(location), locationFileMaximum);
+    if (text && adminhost::isUtf8(*text)) {
+        std::string_view value = productionDatabase(*text).value_or("");
+        if (value.size() > 1 && value.front() == '"' && value.back() == '"') {
+            value = value.substr(1, value.size() - 2);
+        }
+        if (!value.empty()) {
+            return HostPath(std::string(value));
+        }
+    }
+    return HostPath(sharedFilesystemPath() + "/Server/db.sqlite3");
+}
+
+bool SettingsStore::dbPathExists() {
+    return adminhost::exists(adminhost::diskPath(dbPath()));
+}
+
+}  // namespace lumio

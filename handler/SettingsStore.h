@@ -1,0 +1,47 @@
+#pragma once
+
+// Where the service keeps its settings and its database, and the loaders of its four settings files.
+//
+// Nothing is cached: every call reads the disk again. No operation reports an error: a file that cannot be read or
+// parsed, or whose top level is no dictionary, counts as missing, and the database path always has an answer.
+
+#include "platform/files/Path.h"
+#include "platform/value/Value.h"
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace lumio {
+
+class SettingsStore {
+  public:
+    static constexpr std::string_view defaultSharedFilesystem = "/Library/SorvaneProducer/Shared";
+    static constexpr std::string_view stateDirectory = "/var/lumio/server";
+
+    /// The identity preferences' "shared_filesystem" as it stands there, never normalised; without it the default
+    /// shared file system.
+    [[nodiscard]] static std::string sharedFilesystemPath();
+    /// The identity preferences' "member_uuid".
+    [[nodiscard]] static std::optional<std::string> memberUUID();
+
+    [[nodiscard]] static adminhost::HostPath identityPreferencesPath();
+    [[nodiscard]] static adminhost::HostPath libraryInformationPath();
+    [[nodiscard]] static adminhost::HostPath memberPreferencesPath();
+    [[nodiscard]] static adminhost::HostPath clusterPreferencesPath();
+
+    [[nodiscard]] static std::optional<adminhost::Dictionary> identityPreferences();
+    [[nodiscard]] static std::optional<adminhost::Dictionary> libraryInformation();
+    /// The file on the shared file system if an entry of its name exists there, readable or not; else the cached copy.
+    [[nodiscard]] static std::optional<adminhost::Dictionary> memberPreferences();
+    /// As memberPreferences.
+    [[nodiscard]] static std::optional<adminhost::Dictionary> clusterPreferences();
+
+    /// The service's database file: the production entry of the location file, else "Server/db.sqlite3" on the shared
+    /// file system. A relative path is answered as it stands.
+    [[nodiscard]] static adminhost::HostPath dbPath();
+    /// Whether a file system entry exists at dbPath.
+    [[nodiscard]] static bool dbPathExists();
+};
+
+}  // namespace lumio

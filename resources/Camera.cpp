@@ -1,0 +1,55 @@
+#include "resources/Camera.h"
+
+#include "platform/log/Log.h"
+#include "platform/value/Text.h"
+
+#include <cstdlib>
+
+namespace lumio {
+
+using adminhost::Dictionary;
+using adminhost::Error;
+
+namespace {
+
+std::uint64_t count(const std::string& statement, std::string_view what) {
+    std::optional<Error> error;
+    const auto rows = Camera::querySorvaneDatabase<Dictionary>(statement, error);
+    if (error) {
+        adminhost::logEvent(std::string("Error getting ").append(what) + " camera count: " + textOf(*error));
+    }
+    if (!rows || rows->empty()) {
+        return 0;
+    }
+    const std::string* number = rows->back().get("count(*)").string();
+    return number == nullptr ? 0 : static_cast<std::uint64_t>(std::strtoll(number->c_str(), nullptr, 10));
+}
+
+}  // namespace
+
+std::optional<std::vector<std::unique_ptr<Camera>>> Camera::allCamerasWithError(std::optional<Error>& error) {
+    return querySorvaneDatabase(
+        "select id,name,uuid,create_user_uuid,created_at,update_user_uuid,updated_at,last_recording_uuid,use_user_uuid,"
+        "used_at,recording_status,access_control_enabled from cameras where (disabled != 't' OR disabled is NULL)",
+        error);
+}
+
+std::uint64_t Camera::getTotalCameraCount() {
+    return count("select count(*) from cameras where (disabled != 't' OR disabled is NULL);", "total");
+}
+
+std::uint64_t Camera::getOnlineCameraCount() {
+    return count(
+        "select count(*) from cameras where ((recording_status!=\"offline\") AND (disabled != 't' OR disabled is "
+        "NULL));",
+        "online");
+}
+
+std::uint64_t Camera::getRunningCameraCount() {
+    return count(
+        "select count(*) from cameras where ((recording_status like \"capturing%\" OR recording_status=\"paused\") AND "
+        "(disabled != 't' OR disabled is NULL));",
+        "running");
+}
+
+}  // namespace lumio

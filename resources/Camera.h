@@ -1,0 +1,29 @@
+#pragma once
+
+// Capture cameras: rows of the cameras table.
+
+#include "resources/Resource.h"
+
+#include <cstdint>
+
+namespace lumio {
+
+class Camera final : public ResourceClass<Camera> {
+  public:
+    /// Every enabled camera, without its access list (dictionary() expands it); nothing, with the error, on failure.
+    [[nodiscard]] static std::optional<std::vector<std::unique_ptr<Camera>>> allCamerasWithError(
+        std::optional<adminhost::Error>& error);
+
+    // Numbers of enabled cameras: all, those not "offline", and those "capturing..." or "paused". A failure is logged
+    // and counts 0. A camera without recording status is not counted as online.
+    [[nodiscard]] static std::uint64_t getTotalCameraCount();
+    [[nodiscard]] static std::uint64_t getOnlineCameraCount();
+    [[nodiscard]] static std::uint64_t getRunningCameraCount();
+
+    [[nodiscard]] std::string_view resourceType() const noexcept override { return "camera"; }
+
+  protected:
+    [[nodiscard]] std::string_view className() const noexcept override { return "Camera"; }
+};
+
+}  // namespace lumio

@@ -1,0 +1,57 @@
+#include "resources/QueryRunner.h"
+
+#include "handler/SettingsStore.h"
+#include "platform/task/Task.h"
+
+namespace lumio {
+
+using adminhost::Dictionary;
+using adminhost::Error;
+
+std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
+    constexpr std::string_view separator = " = ";
+    std::vector<Dictionary> records;
+    if (output.find('\n') == std::string_view::npos) {
+        return records;
+    }
+    // Every row is closed by an empty line; the last row's is the empty element behind the final line feed. An output
+    // that does not end in a line feed therefore loses its last row, which the tool never printed whole.
+    Dictionary pending;
+    for (std::size_t begin = 0; begin <= output.size();) {
+        const std::size_t end = std::min(output.find('\n', begin), output.size());
+        const std::string_view line = output.substr(begin, end - begin);
+        begin = end + 1;
+        if (line.empty()) {
+            records.push_back(std::move(pending));
+            pending = Dictionary();
+            continue;
+        }
+        const std::size_t split = line.find(separator);
+        // A line without separator, such as the second line of a value, is its own value.
+        const bool splits = split != std::string_view::npos;
+        std::string_view key = splits ? line.substr(0, split) : line;
+        const std::string_view value = splits ? line.substr(split + separator.size()) : line;
+        // Column names are padded on the left; one that holds a blank itself keeps only its last word.
+        if (const std::size_t blank = key.rfind(' '); blank != std::string_view::npos) {
+            key.remove_prefix(blank + 1);
+        }
+        pending.set(key, value);
+    }
+    return records;
+}
+
+std::optional<std::vector<Dictionary>> runStatement(const std::string& statement, std::optional<Error>& error) {
+    static const adminhost::HostPath tool("/usr/bin/sqlite3");
+    const std::string database = adminhost::diskPath(SettingsStore::dbPath()).text();
+    std::string output;
+    std::string errorText;
+    const std::int32_t status =
+        adminhost::launch_task(adminhost::diskPath(tool), {"-line", database, statement}, &output, &errorText);
+    if (status != 0) {
+        error = Error{"sqliteQuery", status, "Can't execute sqlite3 query: " + errorText};
+        return std::nullopt;
+    }
+    return recordsOfLineOutput(output);
+}
+
+}  // namespace lumio

@@ -1,0 +1,28 @@
+#pragma once
+
+// Statements on the service's database, each run by one start of the sqlite3 tool in its line output mode.
+//
+// The statement is one argument of the tool, never seen by a shell; its caller has inserted values verbatim. That is
+// the service's contract: nothing is escaped, quoted otherwise or bound here.
+
+#include "platform/value/Error.h"
+#include "platform/value/Value.h"
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace lumio {
+
+/// Runs the statement on the database at SettingsStore::dbPath(). The rows in output order, each a dictionary of texts
+/// by column name (NULL is the empty text); empty for a statement that prints nothing. Nothing when the tool fails, and
+/// only then the error is written: domain "sqliteQuery", the tool's exit status (-1 if it could not be started) and its
+/// error text. Rows printed before a failure are dropped.
+[[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> runStatement(const std::string& statement,
+                                                                             std::optional<adminhost::Error>& error);
+
+/// The rows in the tool's line output.
+[[nodiscard]] std::vector<adminhost::Dictionary> recordsOfLineOutput(std::string_view output);
+
+}  // namespace lumio

@@ -1,0 +1,109 @@
+#pragma once
+
+// One row of the service's database that administrators work with: its record, its identity and its access list.
+//
+// A resource lives for one request. Its record comes from a query (initWithDictionary) or, for a resource known only by
+// its UUID, from the database on the first use of data(). Changes go to the database or the configuration tool at once
+// and are not reflected in the record. Operations named init... answer a new object that the caller owns.
+
+#include "platform/value/Error.h"
+#include "platform/value/Value.h"
+#include "resources/QueryRunner.h"
+
+#include <concepts>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace lumio {
+
+class Resource {
+  public:
+    Resource() = default;
+    Resource(const Resource&) = delete;
+    Resource& operator=(const Resource&) = delete;
+    virtual ~Resource() = default;
+
+    /// Always a plain Resource, whichever class it is asked through. That is deliberate.
+    [[nodiscard]] static std::unique_ptr<Resource> resourceWithDictionary(adminhost::Dictionary dictionary);
+    /// Does nothing.
+    static void initialize() {}
+
+    /// Runs a statement; each row becomes an object of the result class: Dictionary, or a class with
+    /// initWithDictionary. Nothing, and only then an error, when the tool fails (QueryRunner.h).
+    template <class ResultClass>
+    [[nodiscard]] static auto querySorvaneDatabase(const std::string& statement,
+                                                   std::optional<adminhost::Error>& error) {
+        std::optional<std::vector<adminhost::Dictionary>> rows = runStatement(statement, error);
+        if constexpr (std::same_as<ResultClass, adminhost::Dictionary>) {
+            return rows;
+        } else {
+            std::optional<std::vector<std::unique_ptr<ResultClass>>> results;
+            if (rows) {
+                results.emplace().reserve(rows->size());
+                for (adminhost::Dictionary& row : *rows) {
+                    results->push_back(ResultClass::initWithDictionary(std::move(row)));
+                }
+            }
+            return results;
+        }
+    }
+
+    /// The UUID that the resource was made with, else the record's "uuid".
+    [[nodiscard]] const std::optional<std::string>& guid();
+    void setGuid(std::optional<std::string> guid) { _guid = std::move(guid); }
+    /// The record; if there is none yet, the row of the UUID, raw (dates as text, no "_id_"), when the database has
+    /// exactly one. Null otherwise; the next call tries again.
+    [[nodiscard]] const adminhost::Dictionary* data();
+    /// Replaces the record; nothing clears it.
+    void setData(std::optional<adminhost::Dictionary> data) { _data = std::move(data); }
+    /// The record as administrators see it, or null. Does not load a missing record.
+    [[nodiscard]] virtual const adminhost::Dictionary* dictionary();
+    /// "CLASS - guid: UUID, " and the record from the next line on: the fields as they stand, nothing is loaded.
+    [[nodiscard]] std::string description() const;
+
+    /// The type word: "" here, "workflow", "camera" or "property" below.
+    [[nodiscard]] virtual std::string_view resourceType() const noexcept { return ""; }
+    /// Removes the resource. Nothing happens here, and no error is reported.
+    [[nodiscard]] virtual std::optional<adminhost::Error> delete_() { return std::nullopt; }
+
+  protected:
+    [[nodiscard]] virtual std::string_view className() const noexcept { return "Resource"; }
+    /// The columns whose local times become dates when a row is read.
+    [[nodiscard]] virtual std::vector<std::string_view> listOfResourceDateKeys() const;
+    /// What initWithDictionary does with the row.
+    virtual void readRow(adminhost::Dictionary row);
+
+    std::optional<adminhost::Dictionary> _data;
+    std::optional<std::string> _guid;
+};
+
+/// The construction and query operations that every resource class has for its own objects.
+template <class Self>
+class ResourceClass : public Resource {
+  public:
+    [[nodiscard]] static std::unique_ptr<Self> init() { return std::make_unique<Self>(); }
+
+    [[nodiscard]] static std::unique_ptr<Self> initWithGUID(std::optional<std::string> guid) {
+        std::unique_ptr<Self> resource = init();
+        resource->setGuid(std::move(guid));
+        return resource;
+    }
+
+    [[nodiscard]] static std::unique_ptr<Self> initWithDictionary(adminhost::Dictionary row) {
+        std::unique_ptr<Self> resource = init();
+        static_cast<ResourceClass&>(*resource).readRow(std::move(row));
+        return resource;
+    }
+
+    using Resource::querySorvaneDatabase;
+    /// As above, the receiving class itself being the result class.
+    [[nodiscard]] static auto querySorvaneDatabase(const std::string& statement,
+                                                   std::optional<adminhost::Error>& error) {
+        return Resource::querySorvaneDatabase<Self>(statement, error);
+    }
+};
+
+}  // namespace lumio
