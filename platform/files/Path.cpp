@@ -27,6 +27,14 @@ DiskPath diskPath(const HostPath& path) {
     return DiskPath(root + path.text());
 }
 
+HostPath hostPath(const DiskPath& path) {
+    const std::string& text = path.text();
+    if (root == "/" || !text.starts_with(root) || text.size() <= root.size() || text[root.size()] != '/') {
+        return HostPath(text);
+    }
+    return HostPath(text.substr(root.size()));
+}
+
 bool exists(const DiskPath& path) noexcept {
     struct stat status {};
     return ::stat(path.c_str(), &status) == 0;

@@ -42,6 +42,9 @@ void setSystemRoot(std::string directory);
 /// The host path below the system root. A relative path stays as it is: relative to the current directory.
 [[nodiscard]] DiskPath diskPath(const HostPath& path);
 
+/// The way back, for texts that people read: the host path of a place below the system root; any other path as it is.
+[[nodiscard]] HostPath hostPath(const DiskPath& path);
+
 /// Whether a file system entry exists there (a link is followed). False also when it cannot be known.
 [[nodiscard]] bool exists(const DiskPath& path) noexcept;
 

@@ -3,17 +3,21 @@
 // Child processes: run a tool to completion, without a shell.
 //
 // Each function blocks until the tool has exited and answers its exit status; a death by signal is 128 + the signal's
-// number. A tool that cannot be started (missing, not executable, an argument with a NUL byte or above the kernel's
-// 128 KiB) is -1, with the system's text in the captured error. The tool gets exactly the given arguments (argv[0] is the tool's path),
-// standard input /dev/null where no input is given, the directory "/" , umask 022, no signal blocked or
-// ignored, no descriptor of ours, and the daemon's environment extended by the given one.
+// number. A tool that cannot be started (missing, not executable, its path not absolute, an argument with a NUL byte or
+// above the kernel's 128 KiB with the NUL that ends it) is -1, with "TOOL: " and the system's text in the captured
+// error, TOOL being the tool's host path. The tool gets exactly the given arguments (argv[0] is the tool's path on
+// disk), standard input /dev/null where no input is given, the directory "/", no signal blocked or ignored, no
+// descriptor of ours, and the daemon's environment extended by the given one. Its umask is the process's, which
+// prepareForTasks() has set to 022. A tool need not read its input: what it leaves is dropped.
 //
-// Standard output and error are captured whole, up to 256 MiB each; more is a failure (-1), never a truncation. Bytes
-// that are not UTF-8 arrive as U+FFFD each: captured text must be able to travel in a property list, and those bytes
-// are lost. A tool may leave a daemon behind that holds the pipes: once the tool itself has exited, what is in the
-// pipes is read, at most 200 ms are waited for more, and the daemon lives on.
+// Standard output and error are captured whole, up to 256 MiB each; more is a failure: the tool's process group is
+// killed and -1 answered, never a truncation. Bytes that are not UTF-8 arrive as U+FFFD each: captured text must be
+// able to travel in a property list, and those bytes are lost. A tool may leave a daemon behind that holds the pipes:
+// once the tool itself has exited, what is in the pipes is read, at most 200 ms are waited for more, and the daemon
+// lives on (its later output meets a closed pipe).
 //
-// A null place for captured text means that the stream is read and dropped. Places are replaced, not appended to.
+// A null place for captured text means that the stream is read and dropped, within the same bound. Places are
+// replaced, not appended to; both are empty after a failure but for the error's text.
 
 #include "platform/files/Path.h"
 
@@ -27,21 +31,24 @@
 
 namespace adminhost {
 
-[[nodiscard]] std::int32_t launch_task(const DiskPath& tool, const std::vector<std::string>& arguments, std::string* output,
-                                       std::string* error);
+[[nodiscard]] std::int32_t launch_task(const DiskPath& tool, const std::vector<std::string>& arguments,
+                                       std::string* output, std::string* error);
 
 [[nodiscard]] std::int32_t launch_task_with_input(const DiskPath& tool, const std::vector<std::string>& arguments,
                                                   const std::optional<std::string>& input, std::string* output,
                                                   std::string* error);
 
-[[nodiscard]] std::int32_t launch_task_with_input_and_environment(const DiskPath& tool,
-                                                                  const std::vector<std::string>& arguments,
-                                                                  const std::optional<std::string>& input, std::string* output,
-                                                                  std::string* error,
-                                                                  const std::map<std::string, std::string>& environment);
+[[nodiscard]] std::int32_t launch_task_with_input_and_environment(
+    const DiskPath& tool, const std::vector<std::string>& arguments, const std::optional<std::string>& input,
+    std::string* output, std::string* error, const std::map<std::string, std::string>& environment);
+
+/// Makes the process fit to launch tools: umask 022, and SIGCHLD, which the process may have inherited as ignored (exit
+/// statuses would be lost), at its default. Called once at the start of a process that launches tools.
+void prepareForTasks() noexcept;
 
 /// The moment at which a running tool of this process is killed with its process group (status 128 + 9, and no further
-/// tool is started: -1); nothing means no bound. The worker sets it for each request.
+/// tool is started: -1); nothing means no bound. It applies to tools started after the call. The worker sets it for
+/// each request.
 void setTaskDeadline(std::optional<std::chrono::steady_clock::time_point> deadline) noexcept;
 
 /// Variables added to every tool's environment from now on. Set once, before requests are served.

@@ -1,0 +1,44 @@
+#pragma once
+
+// One running child process with our ends of its pipes. The destructor kills the process group of a child that was not
+// waited for, so that no way out of a launch leaves a zombie or a stray.
+
+#include "platform/files/FileDescriptor.h"
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include <sys/types.h>
+
+namespace adminhost {
+
+class Child {
+  public:
+    Child() = default;
+    Child(const Child&) = delete;
+    Child& operator=(const Child&) = delete;
+    ~Child();
+
+    /// Starts the tool in a process group of its own; withInput says whether it reads a pipe instead of /dev/null.
+    /// Answers the system's error number, 0 for success. Called once.
+    [[nodiscard]] int start(const std::string& tool, const std::vector<std::string>& arguments,
+                            const std::vector<std::string>& environment, bool withInput);
+
+    /// SIGKILL for the child's process group; without effect once it has been waited for.
+    void kill() noexcept;
+
+    /// Waits for the exit of this very child: its status, 128 + the number of the signal that ended it, or -1 if the
+    /// system cannot tell.
+    [[nodiscard]] std::int32_t wait() noexcept;
+
+    FileDescriptor input;   ///< write end, non-blocking; empty without input
+    FileDescriptor output;  ///< read end, non-blocking
+    FileDescriptor error;   ///< read end, non-blocking
+    FileDescriptor exit;    ///< becomes readable when the child has exited
+
+  private:
+    pid_t _pid = 0;  ///< 0 when there is nothing to wait for
+};
+
+}  // namespace adminhost
