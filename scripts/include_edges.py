@@ -1,0 +1,84 @@
+#!/usr/bin/python3
+"""Fails on an include edge that the picture in docs/architecture.md does not have.
+
+usage: include_edges.py [ROOT]   (the project's root: by default the directory above this script's)
+"""
+
+import pathlib
+import re
+import sys
+
+SOURCES = {".cpp", ".h"}
+INCLUDE = re.compile(r'^\s*#\s*include\s*"([^"]+)"')
+BASE = {"platform"}
+BELOW = BASE | {"codec", "krb5"}
+LAYER = BELOW | {"settings", "handler", "grid", "resources", "commands"}
+
+# Room: the rooms that it may include besides itself. "settings" is the settings store in handler/, "requests" the
+# handler's operations in resources/: the only ones there that know the handler.
+MAY_INCLUDE = {
+    "platform": set(),
+    "codec": BASE,
+    "krb5": BASE,
+    "commands": BASE,
+    "settings": BELOW,
+    "resources": BELOW | {"settings"},
+    "requests": LAYER,
+    "handler": LAYER,
+    "grid": LAYER,
+    "plugin": LAYER,
+    "adminhostd": BASE,
+    "adminhostctl": BASE,
+}
+CONTROL_MAY_INCLUDE = ("platform/value/", "platform/plist/", "platform/json/")
+FREE = {"tests", "bench", "fuzz"}
+
+
+def room(path):
+    top = path.split("/", 1)[0]
+    if re.fullmatch(r"handler/SettingsStore\w*\.(h|cpp)", path):
+        return "settings"
+    if path == "resources/ResourceRequests.cpp":
+        return "requests"
+    return top
+
+
+def refused(source, included):
+    """Why `source` may not include `included`, or None."""
+    origin, target = room(source), room(included)
+    if target in FREE:
+        return f"{origin} must not include {target}"
+    if origin == "adminhostctl" and target == "platform" and not included.startswith(CONTROL_MAY_INCLUDE):
+        return "adminhostctl knows only " + ", ".join(CONTROL_MAY_INCLUDE)
+    if target == origin or target in MAY_INCLUDE[origin]:
+        return None
+    return f"{origin} must not include {target}"
+
+
+def check(root):
+    for path in sorted(root.glob("*/**/*")):
+        name = path.relative_to(root).as_posix()
+        top = name.split("/", 1)[0]
+        if path.suffix not in SOURCES or top in FREE or top.startswith((".", "build")) or top == "node_modules":
+            continue
+        if top not in MAY_INCLUDE:
+            yield f"{name}: a room that the picture does not have"
+            continue
+        for number, line in enumerate(path.read_text(encoding="utf-8").splitlines(), 1):
+            match = INCLUDE.match(line)
+            # Includes are written from the project's root; what is not there is generated or a mistake the compiler finds.
+            if match and match[1].split("/", 1)[0] in MAY_INCLUDE.keys() | FREE:
+                why = refused(name, match[1])
+                if why:
+                    yield f"{name}:{number}: {match[1]}: {why}"
+
+
+def main():
+    root = pathlib.Path(sys.argv[1]) if len(sys.argv) > 1 else pathlib.Path(__file__).resolve().parent.parent
+    findings = list(check(root))
+    for finding in findings:
+        print(finding)
+    sys.exit(1 if findings else 0)
+
+
+main()
