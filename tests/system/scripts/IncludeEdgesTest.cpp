@@ -1,5 +1,3 @@
-#include <sys/wait.h>
-
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -8,6 +6,7 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/wait.h>
 
 namespace {
 
@@ -77,10 +76,14 @@ TEST_F(IncludeEdges, EachRefusedEdgeIsNamedWithFileAndLine) {
 
 TEST_F(IncludeEdges, EdgesOfThePictureAreAccepted) {
     const std::pair<const char*, const char*> edges[] = {
-        {"plugin/Plugin.cpp", "handler/LumioRequestHandler.h"}, {"handler/ReadSettings.cpp", "resources/Camera.h"},
-        {"resources/Camera.cpp", "handler/SettingsStore.h"},    {"resources/ResourceRequests.cpp", "handler/LumioRequestHandler.h"},
-        {"handler/SettingsStore.cpp", "platform/plist/PropertyList.h"}, {"adminhostctl/Main.cpp", "platform/value/Value.h"},
-        {"adminhostd/Main.cpp", "platform/log/Log.h"},          {"tests/unit/x/Test.cpp", "plugin/Plugin.h"},
+        {"plugin/Plugin.cpp", "handler/LumioRequestHandler.h"},
+        {"handler/ReadSettings.cpp", "resources/Camera.h"},
+        {"resources/Camera.cpp", "handler/SettingsStore.h"},
+        {"resources/ResourceRequests.cpp", "handler/LumioRequestHandler.h"},
+        {"handler/SettingsStore.cpp", "platform/plist/PropertyList.h"},
+        {"adminhostctl/Main.cpp", "platform/value/Value.h"},
+        {"adminhostd/Main.cpp", "platform/log/Log.h"},
+        {"tests/unit/x/Test.cpp", "plugin/Plugin.h"},
     };
     for (const auto& [source, included] : edges) {
         const Result result = checkEdge(source, included);
