@@ -1,0 +1,2 @@
+find_package(OpenSSL REQUIRED)
+target_link_libraries(adminhost PRIVATE OpenSSL::Crypto)
