@@ -1,0 +1,32 @@
+#pragma once
+
+// The JSON form of values, as the daemon's clients send and read it.
+//
+// A date is {"$date": "2026-01-31T08:00:00Z"} (UTC, whole seconds), data is {"$data": BASE64}, a real that JSON cannot
+// write is {"$real": "nan"}, "infinity" or "-infinity". A dictionary's key that begins with "$" carries a second "$".
+// Null as a dictionary's value means that the key is absent; inside a list it is refused, because values have no null
+// there. Integers stay integers over the whole signed and unsigned 64-bit range; a number with a fraction or an
+// exponent is a real.
+
+#include "platform/value/Error.h"
+#include "platform/value/Value.h"
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace adminhost {
+
+constexpr std::size_t jsonMaximumDepth = 512;  ///< nested lists and dictionaries
+
+/// Parses one JSON text. Nothing on failure; then, if error is given, it is of domain "json" and its description begins
+/// with "line L, column C: " (from 1; columns count characters). Refused besides broken syntax: invalid UTF-8, a key
+/// that stands twice, nesting beyond the maximum, an integer outside the 64-bit range, null in a list, a key with a
+/// single "$" that is none of the forms above.
+[[nodiscard]] std::optional<Value> parseJson(std::string_view text, Error* error = nullptr);
+
+/// The JSON text of a value; no line feed at its end. Pretty: one entry a line, two blanks of indentation a level.
+/// Bytes of a string that are not UTF-8 are written as U+FFFD.
+[[nodiscard]] std::string jsonOf(const Value& value, bool pretty = false);
+
+}  // namespace adminhost

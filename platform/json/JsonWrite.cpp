@@ -1,0 +1,164 @@
+#include "platform/json/Json.h"
+#include "platform/json/JsonForms.h"
+#include "platform/value/Text.h"
+
+#include <charconv>
+#include <cmath>
+#include <utility>
+
+namespace adminhost {
+namespace {
+
+class Writer {
+  public:
+    explicit Writer(bool pretty) : _pretty(pretty) {}
+
+    void write(const Value& value, std::size_t level);
+    [[nodiscard]] std::string take() { return std::move(_text); }
+
+  private:
+    void writeNumber(auto number) {
+        char buffer[64];
+        _text.append(buffer, std::to_chars(buffer, buffer + sizeof buffer, number).ptr);
+    }
+    void writeReal(double real);
+    void writeString(std::string_view bytes);
+    void writeWrapped(std::string_view form, std::string_view text) {
+        _text += "{\"";
+        _text += form;
+        _text += _pretty ? "\": \"" : "\":\"";
+        _text += text;
+        _text += "\"}";
+    }
+    void newLine(std::size_t level) {
+        if (_pretty) {
+            _text += '\n';
+            _text.append(level * 2, ' ');
+        }
+    }
+
+    bool _pretty;
+    std::string _text;
+};
+
+void Writer::writeReal(double real) {
+    if (std::isnan(real)) {
+        writeWrapped("$real", "nan");
+    } else if (std::isinf(real)) {
+        writeWrapped("$real", real > 0 ? "infinity" : "-infinity");
+    } else {
+        const std::size_t start = _text.size();
+        writeNumber(real);
+        if (_text.find_first_of(".e", start) == std::string::npos) {
+            _text += ".0";  // else it would be read back as an integer
+        }
+    }
+}
+
+void Writer::writeString(std::string_view bytes) {
+    if (!isUtf8(bytes)) {
+        writeString(utf8Of(bytes));
+        return;
+    }
+    constexpr std::string_view digits = "0123456789abcdef";
+    _text += '"';
+    for (const char c : bytes) {
+        switch (c) {
+            case '"':
+            case '\\':
+                _text += '\\';
+                _text += c;
+                break;
+            case '\n':
+                _text += "\\n";
+                break;
+            case '\r':
+                _text += "\\r";
+                break;
+            case '\t':
+                _text += "\\t";
+                break;
+            default:
+                if (static_cast<unsigned char>(c) < 0x20 || c == 0x7f) {
+                    _text += "\\u00";
+                    _text += digits[static_cast<unsigned char>(c) >> 4U];
+                    _text += digits[static_cast<unsigned char>(c) & 0x0fU];
+                } else {
+                    _text += c;
+                }
+        }
+    }
+    _text += '"';
+}
+
+void Writer::write(const Value& value, std::size_t level) {
+    switch (value.type()) {
+        case Value::Type::null:
+            _text += "null";
+            return;
+        case Value::Type::boolean:
+            _text += *value.boolean() ? "true" : "false";
+            return;
+        case Value::Type::integer:
+            if (const auto number = value.integer()) {
+                writeNumber(*number);
+            } else {
+                writeNumber(*value.unsignedInteger());
+            }
+            return;
+        case Value::Type::real:
+            writeReal(*value.real());
+            return;
+        case Value::Type::string:
+            writeString(*value.string());
+            return;
+        case Value::Type::date:
+            writeWrapped("$date", json::dateText(*value.date()));
+            return;
+        case Value::Type::data:
+            writeWrapped("$data", json::base64Text(*value.data()));
+            return;
+        case Value::Type::array: {
+            const char* separator = "[";
+            for (const Value& element : *value.array()) {
+                _text += std::exchange(separator, ",");
+                newLine(level + 1);
+                write(element, level + 1);
+            }
+            if (value.array()->empty()) {
+                _text += "[]";
+                return;
+            }
+            newLine(level);
+            _text += ']';
+            return;
+        }
+        case Value::Type::dictionary: {
+            const char* separator = "{";
+            for (const DictionaryEntry& entry : *value.dictionary()) {
+                _text += std::exchange(separator, ",");
+                newLine(level + 1);
+                writeString(entry.key.starts_with('$') ? '$' + entry.key : entry.key);
+                _text += _pretty ? ": " : ":";
+                write(entry.value, level + 1);
+            }
+            if (value.dictionary()->empty()) {
+                _text += "{}";
+                return;
+            }
+            newLine(level);
+            _text += '}';
+            return;
+        }
+    }
+}
+
+}  // namespace
+
+std::string jsonOf(const Value& value, bool pretty) {
+    Writer writer(pretty);
+    writer.write(value, 0);
+    return writer.take();
+}
+
+}  // namespace adminhost
