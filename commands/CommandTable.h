@@ -1,0 +1,91 @@
+#pragma once
+
+// The plug-in's commands as their descriptions (the .toml files of this room) say: the table that requests are checked
+// against, and the form in which the daemon's clients get the descriptions. The tables are constants; everything here
+// may be called at any time.
+
+#include "platform/framework/Plugin.h"
+#include "platform/value/Value.h"
+
+#include <cstdint>
+#include <span>
+#include <string_view>
+#include <vector>
+
+namespace lumio {
+
+/// The values that fit a key. A boolean may also come as number or text, because operations read both as booleans;
+/// a real may come as whole number; a scalar is any single value but data.
+enum class KeyType : std::uint8_t { any, scalar, text, integer, real, boolean, date, data, list, dictionary };
+
+/// What a statement or an argument that carries the value demands of it. Bits.
+enum Rule : std::uint8_t {
+    ruleStatement = 1U,    ///< stands between double quotes in a statement
+    ruleNotAColumn = 2U,   ///< is not the name of a column: the database would read the column instead
+    ruleRowNumber = 4U,    ///< a whole number in decimal
+    ruleIdentifier = 8U,   ///< letters, digits and hyphens
+    ruleArgument = 16U,    ///< stands in a tool's argument of its own
+    ruleShortNames = 32U,  ///< the "shortName" entries of the list stand together in one tool's arguments
+};
+
+/// What a change entry does. Bits, so that a key can name those for which it is read.
+enum Change : std::uint8_t { changeNothing = 1U, changeAdded = 2U, changeRemoved = 4U, changeChanged = 8U };
+
+/// How a list's elements say what they do.
+struct EntryDescription {
+    std::string_view addedBy;                      ///< the flag of an addition; empty when there are none
+    std::string_view removedBy;                    ///< the flag of a removal; empty when there are none
+    bool addedFirst;                               ///< which flag counts when both are set
+    bool leadingZeros;                             ///< a flag "01" is true
+    Change otherwise;                              ///< what an entry without flags does
+    std::span<const std::string_view> addedKinds;  ///< additions of another "type" do nothing; empty: there is no type
+    std::span<const std::string_view> columns;     ///< of the table that the entries change
+    std::span<const std::string_view> together;    ///< keys whose texts stand in one statement
+};
+
+struct KeyDescription {
+    std::string_view name;  ///< "[]" for a list's elements
+    KeyType type;
+    std::uint8_t rules;                        ///< Rule bits
+    std::uint8_t readFor;                      ///< Change bits; only told apart within change entries
+    std::span<const std::string_view> with;    ///< read only when one of these stands in the same changed entry
+    std::span<const KeyDescription> children;  ///< keys of a dictionary, or the one element description of a list
+    const EntryDescription* entry;             ///< for a dictionary that is a change entry, else null
+};
+
+struct CommandDescription {
+    std::string_view name;
+    std::string_view summary;
+    bool needsDatabase;  ///< refused while the database tool does not work as it must
+    bool revision;       ///< its answer carries the settings' revision
+    bool revisionGuard;  ///< may be made to depend on a revision
+    bool changes;        ///< changes something
+    std::span<const KeyDescription> keys;
+};
+
+/// All commands, in the order in which people read them.
+[[nodiscard]] std::span<const CommandDescription> commands() noexcept;
+
+/// Null for an unknown name.
+[[nodiscard]] const CommandDescription* findCommand(std::string_view name) noexcept;
+
+/// The descriptions as the daemon hands them on: an array of dictionaries (README.md describes them).
+[[nodiscard]] adminhost::Value describeCommands();
+
+/// Whether the operations can carry the request: everything that is wrong with it, in the order of the descriptions.
+/// Looked at are the types of described keys and, in change entries, the keys that the entry's change reads. Keys that
+/// no description names pass, and so does a missing key: operations answer for those themselves.
+[[nodiscard]] std::vector<adminhost::Finding> checkRequest(std::string_view command,
+                                                           const adminhost::Dictionary& request) noexcept;
+
+/// One step of the descriptions' flat form, from which describeCommands() builds them.
+struct DescriptionToken {
+    enum class Kind : std::uint8_t { dictionary, list, text, integer, boolean, date };
+    Kind kind;
+    std::string_view key;   ///< within a dictionary
+    std::string_view text;  ///< of a text
+    std::int64_t number;    ///< count of a dictionary or list; value of the others (a date in seconds since 1970)
+};
+[[nodiscard]] std::span<const DescriptionToken> descriptionTokens() noexcept;
+
+}  // namespace lumio

@@ -1,0 +1,398 @@
+#!/usr/bin/python3
+"""Reads the command descriptions of this directory and writes what is made from them.
+
+    generate.py table OUT.cpp   the tables of CommandTable.h
+    generate.py docs OUT.md     the reference of the commands
+    generate.py check OUT.md    status 1, with a message, unless OUT.md is what docs would write
+
+A description that is not right (an unknown word, a key whose parent is not described, an example that does not fit) is
+an error with the file's name.
+"""
+
+import base64
+import datetime
+import json
+import pathlib
+import sys
+import tomllib
+
+TYPES = ["any", "scalar", "text", "integer", "real", "boolean", "date", "data", "list", "dictionary"]
+RULES = {
+    "statement": "ruleStatement",
+    "not_a_column": "ruleNotAColumn",
+    "row_number": "ruleRowNumber",
+    "identifier": "ruleIdentifier",
+    "argument": "ruleArgument",
+    "short_names": "ruleShortNames",
+}
+RULE_TEXTS = {
+    "statement": "no double quote, line feed or NUL; at most 95 kB",
+    "not_a_column": "not the name of a column of its table, in any case (`rowid`, `oid`, `_rowid_` neither)",
+    "row_number": "a decimal number",
+    "identifier": "letters, digits and hyphens, not beginning with a hyphen",
+    "argument": "no NUL, not beginning with a hyphen; at most 95 kB",
+    "short_names": "all names together at most 1.5 MB",
+}
+CHANGES = {"added": "changeAdded", "removed": "changeRemoved", "changed": "changeChanged", "ignored": "changeNothing"}
+UNITS = ["bytes", "megabytes", "seconds", "minutes", "people"]
+
+COMMAND_WORDS = {"order", "summary", "description", "needs_database", "revision", "revision_guard", "changes", "available",
+                 "errors", "keys", "answer", "include", "example"}
+KEY_WORDS = {"type", "entered_as", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"}
+ANSWER_WORDS = {"type", "unit", "secret", "help"}
+ENTRY_WORDS = {"added_by", "removed_by", "first", "leading_zeros", "otherwise", "added_kinds", "columns", "together"}
+
+
+class Wrong(Exception):
+    pass
+
+
+def need(condition, message):
+    if not condition:
+        raise Wrong(message)
+
+
+def split(path):
+    """"a.b[].c" -> ["a", "b", "[]", "c"]"""
+    return [step for part in path.split(".") for step in ([part[:-2], "[]"] if part.endswith("[]") else [part])]
+
+
+def parent(path):
+    return path[:-2] if path.endswith("[]") else path.rpartition(".")[0]
+
+
+def check_keys(keys, words, what):
+    for path, key in keys.items():
+        where = f"{what} {path}"
+        need(set(key) <= words, f"{where}: unknown word {sorted(set(key) - words)}")
+        need(key.get("type") in TYPES, f"{where}: type must be one of {TYPES}")
+        need(key.get("entered_as", "text") in TYPES, f"{where}: unknown entered_as")
+        need(set(key.get("rules", [])) <= set(RULES), f"{where}: unknown rule")
+        need(set(key.get("for", [])) <= set(CHANGES), f"{where}: unknown change")
+        need(key.get("unit", "bytes") in UNITS, f"{where}: unknown unit")
+        need(set(key.get("entry", {})) <= ENTRY_WORDS, f"{where}: unknown word in entry")
+        need(key.get("help", "").strip(), f"{where}: help is missing")
+        above = parent(path)
+        if above:
+            need(above in keys, f"{where}: {above} is not described")
+            wanted = "list" if path.endswith("[]") else "dictionary"
+            need(keys[above]["type"] == wanted, f"{where}: {above} must be a {wanted}")
+
+
+def fits(value, kind):
+    single = isinstance(value, (str, bool, int, float, datetime.datetime))
+    return {
+        "any": True,
+        "scalar": single,
+        "text": isinstance(value, str),
+        "integer": isinstance(value, int) and not isinstance(value, bool),
+        "real": isinstance(value, (int, float)) and not isinstance(value, bool),
+        "boolean": isinstance(value, bool),
+        "date": isinstance(value, datetime.datetime),
+        "data": isinstance(value, bytes),
+        "list": isinstance(value, list),
+        "dictionary": isinstance(value, dict),
+    }[kind]
+
+
+def check_example(value, keys, path, what):
+    if path:
+        need(path in keys, f"example's {what}: {path} is not described")
+        need(fits(value, keys[path]["type"]), f"example's {what}: {path} is not a {keys[path]['type']}")
+    if isinstance(value, dict):
+        for key, below in value.items():
+            check_example(below, keys, f"{path}.{key}" if path else key, what)
+    elif isinstance(value, list):
+        for below in value:
+            check_example(below, keys, f"{path}[]", what)
+
+
+def from_json(pairs):
+    value = dict(pairs)
+    if set(value) == {"$date"}:
+        return datetime.datetime.fromisoformat(value["$date"].replace("Z", "+00:00"))
+    if set(value) == {"$data"}:
+        return base64.b64decode(value["$data"])
+    return value
+
+
+def included(commands, answer, includes, seen):
+    """The answer keys with those taken over from other commands' answers."""
+    answer = dict(answer)
+    for under, source in includes.items():
+        name, _, path = source.partition(":")
+        need(name in commands and name not in seen, f"include: no command {name}")
+        other = commands[name]
+        keys = included(commands, other.get("answer", {}), other.get("include", {}), seen | {name})
+        need(not path or path in keys, f"include: {source} is not described")
+        for key, description in keys.items():
+            if key == path or not path or key.startswith((path + ".", path + "[]")):
+                answer.setdefault((under + key[len(path):]).strip("."), description)
+    return answer
+
+
+def load(directory):
+    commands = {}
+    for file in sorted(directory.glob("*.toml")):
+        try:
+            commands[file.stem] = tomllib.loads(file.read_text(encoding="utf-8"))
+        except tomllib.TOMLDecodeError as error:
+            raise Wrong(f"{file.name}: {error}") from error
+    for name, command in commands.items():
+        try:
+            need(set(command) <= COMMAND_WORDS, f"unknown word {sorted(set(command) - COMMAND_WORDS)}")
+            need(command.get("summary", "").strip(), "summary is missing")
+            need(isinstance(command.get("order"), int), "order is missing")
+            command["all_answers"] = included(commands, command.get("answer", {}), command.get("include", {}), {name})
+            keys = command.setdefault("keys", {})
+            for path, key in keys.items():  # a setting is described once, where it is read
+                key.setdefault("help", command["all_answers"].get(path, {}).get("help", ""))
+            check_keys(keys, KEY_WORDS, "key")
+            check_keys(command["all_answers"], ANSWER_WORDS, "answer")
+            for error in command.get("errors", []):
+                need(set(error) in ({"key", "meaning"}, {"code", "meaning"}), "an error has key or code, and meaning")
+                need("key" not in error or error["key"] in command["all_answers"], f"error {error}: not an answer key")
+            need("request" in command.get("example", {}), "example.request is missing")
+            for what, described in (("request", keys), ("answer", command["all_answers"])):
+                if what in command["example"]:
+                    value = json.loads(command["example"][what], object_pairs_hook=from_json)
+                    check_example(value, described, "", what)
+                    command["example"][what] = value
+        except Wrong as error:
+            raise Wrong(f"{name}.toml: {error}") from error
+    orders = [command["order"] for command in commands.values()]
+    need(len(set(orders)) == len(orders), "two commands have the same order")
+    return dict(sorted(commands.items(), key=lambda item: item[1]["order"]))
+
+
+# The description that clients get: also the source of docs and of the table.
+
+def key_description(path, key):
+    described = {"path": path, "type": key["type"], "help": key["help"].strip()}
+    if key.get("entered_as"):
+        described["enteredAs"] = key["entered_as"]
+    for word in ("secret", "required"):
+        if key.get(word):
+            described[word] = True
+    for word in ("allowed", "rules"):
+        if key.get(word):
+            described[word] = key[word]
+    if key.get("unit"):
+        described["unit"] = key["unit"]
+    return described
+
+
+def describe(name, command):
+    return {
+        "name": name,
+        "summary": command["summary"].strip(),
+        "description": " ".join(command.get("description", command["summary"]).split()),
+        "needsDatabase": command.get("needs_database", False),
+        "revision": command.get("revision", False),
+        "revisionGuard": command.get("revision_guard", False),
+        "changes": command.get("changes", False),
+        "keys": [key_description(path, key) for path, key in command["keys"].items()],
+        "answer": [key_description(path, key) for path, key in command["all_answers"].items()],
+        "errors": command.get("errors", []),
+        "example": command["example"],
+    }
+
+
+# C++
+
+def quoted(text):
+    out = ""
+    for byte in text.encode():
+        char = chr(byte)
+        out += "\\" + char if char in "\"\\" else char if 32 <= byte < 127 else f"\\{byte:03o}"
+    return f'"{out}"'
+
+
+class Table:
+    """Writes the constants below others first, so that each can name what it points to."""
+
+    def __init__(self):
+        self.lines = []
+        self.count = 0
+
+    def name(self, prefix):
+        self.count += 1
+        return f"{prefix}{self.count}"
+
+    def texts(self, texts):
+        if not texts:
+            return "{}"
+        name = self.name("texts")
+        self.lines.append(f"constexpr std::string_view {name}[] = {{{', '.join(quoted(t) for t in texts)}}};")
+        return name
+
+    def entry(self, entry):
+        if entry is None:
+            return "nullptr"
+        parts = [
+            quoted(entry.get("added_by", "")),
+            quoted(entry.get("removed_by", "")),
+            "true" if entry.get("first", "removed") == "added" else "false",
+            "true" if entry.get("leading_zeros") else "false",
+            CHANGES[entry.get("otherwise", "changed")],
+            self.texts(entry.get("added_kinds")),
+            self.texts(entry.get("columns")),
+            self.texts(entry.get("together")),
+        ]
+        name = self.name("entry")
+        self.lines.append(f"constexpr EntryDescription {name} = {{{', '.join(parts)}}};")
+        return "&" + name
+
+    def keys(self, keys, under):
+        rows = []
+        for path, key in keys.items():
+            if parent(path) != under:
+                continue
+            children = self.keys(keys, path)
+            rules = " | ".join(RULES[rule] for rule in key.get("rules", [])) or "0"
+            changes = " | ".join(CHANGES[change] for change in key.get("for", CHANGES))
+            rows.append(f"{{{quoted(split(path)[-1])}, KeyType::{key['type']}, {rules}, {changes}, "
+                        f"{self.texts(key.get('with'))}, {children}, {self.entry(key.get('entry'))}}}")
+        if not rows:
+            return "{}"
+        name = self.name("keys")
+        self.lines.append(f"constexpr KeyDescription {name}[] = {{\n    " + ",\n    ".join(rows) + ",\n};")
+        return name
+
+    def commands(self, commands):
+        rows = []
+        for name, command in commands.items():
+            described = describe(name, command)
+            flags = ", ".join("true" if described[flag] else "false"
+                              for flag in ("needsDatabase", "revision", "revisionGuard", "changes"))
+            rows.append(f"{{{quoted(name)}, {quoted(described['summary'])}, {flags}, {self.keys(command['keys'], '')}}}")
+        self.lines.append("constexpr CommandDescription table[] = {\n    " + ",\n    ".join(rows) + ",\n};")
+
+    def tokens(self, value, key=""):
+        def token(kind, text="", number=0):
+            return f"{{DescriptionToken::Kind::{kind}, {quoted(key)}, {quoted(text)}, {number}}}"
+        if isinstance(value, dict):
+            return [token("dictionary", number=len(value))] + [t for k, v in value.items() for t in self.tokens(v, k)]
+        if isinstance(value, list):
+            return [token("list", number=len(value))] + [t for v in value for t in self.tokens(v)]
+        if isinstance(value, bool):
+            return [token("boolean", number=int(value))]
+        if isinstance(value, int):
+            return [token("integer", number=value)]
+        if isinstance(value, datetime.datetime):
+            return [token("date", number=int(value.timestamp()))]
+        need(isinstance(value, str), f"a description cannot carry {value!r}")
+        return [token("text", value)]
+
+
+def table(commands):
+    out = Table()
+    out.commands(commands)
+    tokens = out.tokens([describe(name, command) for name, command in commands.items()])
+    out.lines.append("constexpr DescriptionToken tokens[] = {\n    " + ",\n    ".join(tokens) + ",\n};")
+    return (
+        "// Made from commands/*.toml by commands/generate.py.\n\n"
+        '#include "commands/CommandTable.h"\n\n'
+        "namespace lumio {\nnamespace {\n\n" + "\n".join(out.lines) + "\n\n}  // namespace\n\n"
+        "std::span<const CommandDescription> commands() noexcept { return table; }\n"
+        "std::span<const DescriptionToken> descriptionTokens() noexcept { return tokens; }\n\n"
+        "}  // namespace lumio\n"
+    )
+
+
+# Documentation
+
+TYPE_TEXTS = {"any": "anything", "scalar": "single value", "integer": "whole number", "real": "number", "boolean": "yes or no"}
+
+
+def cell(text):
+    return text.replace("|", "\\|").replace("\n", " ")
+
+
+def key_rows(keys):
+    rows = []
+    for key in keys:
+        notes = [key["help"]]
+        if key.get("allowed"):
+            notes.append("One of " + ", ".join(f"`{word}`" for word in key["allowed"]) + ".")
+        if key.get("required"):
+            notes.append("Needed.")
+        if key.get("secret"):
+            notes.append("Secret.")
+        for rule in key.get("rules", []):
+            notes.append(f"Check: {RULE_TEXTS[rule]}.")
+        kind = TYPE_TEXTS.get(key["type"], key["type"])
+        if key.get("unit") and key["unit"] != "people":
+            kind += f", {key['unit']}"
+        rows.append(f"| `{key['path']}` | {kind} | {cell(' '.join(notes))} |")
+    return rows
+
+
+def to_json(value):
+    if isinstance(value, datetime.datetime):
+        return {"$date": value.strftime("%Y-%m-%dT%H:%M:%SZ")}
+    raise TypeError(value)
+
+
+def docs(commands):
+    out = [
+        "# Commands", "",
+        "Made from `commands/*.toml` by `commands/generate.py docs docs/commands.md`; change those, not this page.", "",
+        "Lists are written `name[]`; a dictionary's keys follow after a dot. A key that is \"needed\" is answered for by",
+        "the command itself when it is missing. Where a check is named, a request that does not pass it is refused",
+        "whole, before anything is changed.", "",
+        "| command | what it does |", "|---|---|",
+    ]
+    out += [f"| [`{name}`](#{name.lower()}) | {cell(command['summary'])} |" for name, command in commands.items()]
+    for name, command in commands.items():
+        described = describe(name, command)
+        out += ["", f"## {name}", "", command.get("description", command["summary"]).strip(), ""]
+        if not command.get("available", True):
+            out += ["Not served by this release: it answers the error `NOT_AVAILABLE`.", ""]
+        notes = [text for flag, text in (
+            ("changes", "It changes something."),
+            ("needsDatabase", "It needs the service's database tool."),
+            ("revision", "Its answer carries the settings' revision."),
+            ("revisionGuard", "It can be made to depend on the revision that was read."),
+        ) if described[flag]]
+        if notes:
+            out += [" ".join(notes), ""]
+        if described["keys"]:
+            out += ["| key | type | |", "|---|---|---|"] + key_rows(described["keys"]) + [""]
+        if described["answer"]:
+            out += ["| answer | type | |", "|---|---|---|"] + key_rows(described["answer"]) + [""]
+        else:
+            out += ["It answers nothing.", ""]
+        if described["errors"]:
+            out += ["| error | meaning |", "|---|---|"]
+            out += [f"| `{error.get('key', error.get('code'))}` | {cell(error['meaning'])} |" for error in described["errors"]]
+            out.append("")
+        out += ["Example:", "", "```json"]
+        out += [json.dumps(described["example"][what], default=to_json, indent=2, ensure_ascii=False)
+                for what in ("request", "answer") if what in described["example"]]
+        out.append("```")
+    return "\n".join(out) + "\n"
+
+
+def main(arguments):
+    if len(arguments) != 2 or arguments[0] not in ("table", "docs", "check"):
+        print(__doc__, file=sys.stderr)
+        return 2
+    what, path = arguments[0], pathlib.Path(arguments[1])
+    try:
+        commands = load(pathlib.Path(__file__).resolve().parent)
+        text = table(commands) if what == "table" else docs(commands)
+    except Wrong as error:
+        print(f"commands: {error}", file=sys.stderr)
+        return 1
+    if what == "check":
+        if path.read_text(encoding="utf-8") != text:
+            print(f"{path} is stale: run commands/generate.py docs {path}", file=sys.stderr)
+            return 1
+        return 0
+    path.parent.mkdir(parents=True, exist_ok=True)
+    path.write_text(text, encoding="utf-8")
+    return 0
+
+
+sys.exit(main(sys.argv[1:]))

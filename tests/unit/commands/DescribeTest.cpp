@@ -1,0 +1,107 @@
+#include "commands/CommandTable.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace {
+
+using adminhost::Dictionary;
+using adminhost::Value;
+
+Dictionary describe(std::string_view name) {
+    const Value all = lumio::describeCommands();
+    for (const Value& command : *all.array()) {
+        if (*command.dictionary()->get("name").string() == name) {
+            return *command.dictionary();
+        }
+    }
+    return {};
+}
+
+Dictionary keyOf(const Dictionary& command, const char* list, std::string_view path) {
+    for (const Value& key : *command.get(list).array()) {
+        if (*key.dictionary()->get("path").string() == path) {
+            return *key.dictionary();
+        }
+    }
+    return {};
+}
+
+TEST(CommandTable, HoldsEveryCommandOfThePlugInOnce) {
+    std::vector<std::string_view> names;
+    for (const auto& command : lumio::commands()) {
+        names.push_back(command.name);
+        EXPECT_EQ(lumio::findCommand(command.name), &command);
+        EXPECT_FALSE(command.summary.empty()) << command.name;
+    }
+    EXPECT_THAT(names, testing::ElementsAre("readSettings", "writeSettings", "getState", "getLogPaths", "startService",
+                                            "stopService", "recycleService", "validateSettings", "createNimboAccount",
+                                            "getWorkflows", "getCameras", "getProperties"));
+    EXPECT_EQ(lumio::findCommand("readsettings"), nullptr);
+    EXPECT_EQ(lumio::findCommand(""), nullptr);
+}
+
+TEST(CommandTable, DescriptionsStandInTheTablesOrderWithItsFlags) {
+    const Value all = lumio::describeCommands();
+    ASSERT_NE(all.array(), nullptr);
+    ASSERT_EQ(all.array()->size(), lumio::commands().size());
+    for (std::size_t i = 0; i < all.array()->size(); ++i) {
+        const Dictionary& described = *(*all.array())[i].dictionary();
+        const lumio::CommandDescription& command = lumio::commands()[i];
+        EXPECT_EQ(described.get("name"), Value(command.name));
+        EXPECT_EQ(described.get("summary"), Value(command.summary));
+        EXPECT_EQ(described.get("needsDatabase"), Value(command.needsDatabase));
+        EXPECT_EQ(described.get("revision"), Value(command.revision));
+        EXPECT_EQ(described.get("revisionGuard"), Value(command.revisionGuard));
+        EXPECT_EQ(described.get("changes"), Value(command.changes));
+        EXPECT_NE(described.get("example").dictionary(), nullptr);
+    }
+}
+
+TEST(CommandTable, RevisionsAreReadBySettingsAndGuardTheirWriting) {
+    EXPECT_TRUE(lumio::findCommand("readSettings")->revision);
+    EXPECT_TRUE(lumio::findCommand("writeSettings")->revisionGuard);
+    EXPECT_FALSE(lumio::findCommand("getCameras")->revision);
+    EXPECT_FALSE(lumio::findCommand("readSettings")->changes);
+}
+
+TEST(CommandTable, PasswordsAreSecret) {
+    EXPECT_EQ(keyOf(describe("writeSettings"), "keys", "configuration.nimbo_client_password").get("secret"),
+              Value(true));
+    EXPECT_EQ(keyOf(describe("validateSettings"), "keys", "nimbo_client_password").get("secret"), Value(true));
+    EXPECT_EQ(keyOf(describe("createNimboAccount"), "keys", "directoryPassword").get("secret"), Value(true));
+    EXPECT_EQ(keyOf(describe("createNimboAccount"), "keys", "directoryNode").get("secret"), Value());
+}
+
+TEST(CommandTable, AnAnswerTakesOverTheKeysOfOtherAnswers) {
+    EXPECT_EQ(keyOf(describe("readSettings"), "answer", "configuration.cameras[].created_at").get("type"),
+              Value("date"));
+    EXPECT_EQ(keyOf(describe("writeSettings"), "answer", "configuration.workflows[].allowedUsersAndGroups[].type")
+                  .get("type"),
+              Value("text"));
+    EXPECT_EQ(keyOf(describe("stopService"), "answer", "sharedFileSystemFreeSpace").get("unit"), Value("bytes"));
+}
+
+TEST(CommandTable, ASettingIsDescribedOnce) {
+    const char* const path = "configuration.server_port";
+    EXPECT_EQ(keyOf(describe("writeSettings"), "keys", path).get("help"),
+              keyOf(describe("readSettings"), "answer", path).get("help"));
+    EXPECT_EQ(keyOf(describe("writeSettings"), "keys", path).get("enteredAs"), Value("integer"));
+}
+
+TEST(CommandTable, ExamplesPassTheCheck) {
+    const Value all = lumio::describeCommands();
+    for (const Value& command : *all.array()) {
+        const std::string& name = *command.dictionary()->get("name").string();
+        EXPECT_THAT(lumio::checkRequest(name, *command.dictionary()->at("example.request").dictionary()),
+                    testing::IsEmpty())
+            << name;
+    }
+}
+
+TEST(CommandTable, ExamplesCarryDates) {
+    EXPECT_EQ(describe("getState").at("example.answer.startTime"),
+              Value(adminhost::Date(std::chrono::seconds(1769846400))));
+}
+
+}  // namespace
