@@ -16,6 +16,7 @@ set_to=$root/etc/demo/$switches
 answer=
 if [ -f "$set_to.daemon" ]; then
     /usr/bin/setsid /bin/sleep "$(cat "$set_to.daemon")" &
+    echo $! >"$root/var/run/$switches.daemon.pid"
 fi
 if [ -f "$set_to.sleep" ]; then
     /bin/sleep "$(cat "$set_to.sleep")"

@@ -2,6 +2,7 @@
 
 #include <array>
 #include <cerrno>
+#include <csignal>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -90,6 +91,11 @@ SampleRoot::~SampleRoot() {
     std::error_code ignored;
     try {
         clearSwitches();
+        for (const auto* name : {"setup_preferences", "setup_library", "lumioctl", "lumioconfig", "nimbo"}) {
+            if (const auto daemon = daemonLeftBy(name)) {
+                ::kill(*daemon, SIGKILL);
+            }
+        }
         if (fs::exists(disk("/var/run/lumioserverd.pid"))) {
             run({disk("/usr/sbin/lumioctl"), "server", "stop"});
         }
@@ -152,6 +158,17 @@ void SampleRoot::setSwitch(const std::string& name, const std::string& content) 
 void SampleRoot::clearSwitches() const {
     remove("/etc/demo");
     fs::create_directories(disk("/etc/demo"));
+}
+
+std::optional<int> SampleRoot::daemonLeftBy(const std::string& switchName) const {
+    std::ifstream file(disk("/var/run/" + switchName + ".daemon.pid"));
+    int pid = 0;
+    std::string command;
+    // By then another process may have that id.
+    if (file >> pid && std::ifstream("/proc/" + std::to_string(pid) + "/comm") >> command && command == "sleep") {
+        return pid;
+    }
+    return std::nullopt;
 }
 
 void SampleRoot::recordToolCalls() const {

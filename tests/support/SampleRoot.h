@@ -1,7 +1,7 @@
 #pragma once
 
 // A root directory of the sample service for one test: made by demo/make-root in a temporary directory of its own
-// (below TMPDIR), removed with it, its daemon stopped first.
+// (below TMPDIR), removed with it; the daemons that its stand-ins left are ended first.
 //
 // What goes wrong while preparing throws std::runtime_error: the test then fails with its text.
 
@@ -67,6 +67,8 @@ class SampleRoot {
     /// Makes a stand-in behave: its switch, for example ("lumioctl.exit", "3"). See demo/README.md.
     void setSwitch(const std::string& name, const std::string& content) const;
     void clearSwitches() const;
+    /// The process that a "NAME.daemon" switch left behind: its id while it lives, else nothing.
+    [[nodiscard]] std::optional<int> daemonLeftBy(const std::string& switchName) const;
 
     /// From now on the stand-ins record their calls; recorded ones are forgotten.
     void recordToolCalls() const;
