@@ -1,0 +1,43 @@
+#pragma once
+
+// The realm that the tests of this room share: started at first use, once per program.
+
+#include "krb5/KRB5CredentialCache.h"
+#include "tests/support/Kdc.h"
+
+#include <memory>
+#include <string>
+
+#include <gtest/gtest.h>
+
+namespace lumio {
+
+inline constexpr const char* alicePassword = "alice secret";
+
+/// Principals: alice (no preauthentication), paul (preauthentication), expired, locked, short (10 seconds),
+/// robot (keytab client.keytab), host/localhost and nimbo/admin (keytab krb5.keytab).
+support::Kdc& realm();
+
+/// Runs with the realm's KRB5 environment in an empty directory of its own, and puts both back.
+class RealmTest : public testing::Test {
+  protected:
+    RealmTest();
+    ~RealmTest() override;
+
+    [[nodiscard]] std::string path(const std::string& name) const { return _directory / name; }
+    /// A new file cache bound to the principal.
+    [[nodiscard]] std::unique_ptr<KRB5CredentialCache> cacheOf(const KRB5Principal& principal,
+                                                               const std::string& name = "cc") const;
+    [[nodiscard]] std::unique_ptr<KRB5Principal> principal(const std::string& text) const;
+    /// A copy of the credential, with another end time, stored as the only one of the cache.
+    void storeWithEnd(KRB5CredentialCache& cache, const KRB5Credential& credential, krb5_timestamp end) const;
+
+    support::ScopedEnvironment _environment;
+    std::filesystem::path _directory;
+    std::shared_ptr<KRB5Context> _context;
+};
+
+std::string contentsOf(const std::string& path);
+void write(const std::string& path, const std::string& bytes);
+
+}  // namespace lumio
