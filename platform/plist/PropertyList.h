@@ -2,8 +2,11 @@
 
 // Property-list files: parsed strictly, written whole, atomically and durably.
 //
-// Format of the XML form: the property-list document type, version 1.0; a leading document type declaration without
-// internal subset is skipped on reading and none is written. Dates are UTC ("2026-01-31T08:00:00Z").
+// The XML form: one value in a <plist> element, version 1.0 (or none stated); a leading document type declaration
+// without internal subset is skipped on reading and none is written. Dates are UTC ("2026-01-31T08:00:00Z"), integers
+// decimal, data base64 with padding; white space may surround a number, a date or data. Encodings: UTF-8, UTF-16,
+// US-ASCII and ISO-8859-1, as the declaration says. The binary form ("bplist00") is recognised by its first bytes; it
+// is read, never written, and the fraction of a second of its dates is dropped.
 
 #include "platform/files/Path.h"
 #include "platform/value/Error.h"
@@ -19,21 +22,26 @@ namespace adminhost {
 constexpr std::size_t plistMaximumSize = std::size_t{64} << 20U;  ///< bytes
 constexpr int plistMaximumDepth = 512;                            ///< nested arrays and dictionaries
 
-/// Parses a property list. Nothing on failure; then, if error is given, it says what is wrong and where (line and column from 1).
-/// Refused: invalid UTF-8, a key without a value, unknown elements, text after the end, a second root, a document type
-/// with an internal subset, integers outside -2^63 ... 2^64-1, more than the maximum size or depth.
+/// Parses a property list. Nothing on failure; then, if error is given, it says what is wrong and where (line and
+/// column from 1; in the binary form the byte from 0), in the domain "propertyList", code 1. Refused: invalid UTF-8, a
+/// key without a value, a key that stands twice, unknown elements and attributes, text after the end, a second root, a
+/// document type with an internal subset, integers outside -2^63 ... 2^64-1, dates that the calendar does not have,
+/// more than the maximum size or depth. In the binary form also: objects inside themselves, object identifiers, null,
+/// and more content than the maximum size, however often an object is referred to.
 [[nodiscard]] std::optional<Value> parsePropertyList(std::string_view bytes, Error* error = nullptr);
 
 /// The XML form. Nothing, with the error, when a value cannot be carried: null, a string or key with a NUL or another
-/// character that XML 1.0 does not allow, invalid UTF-8, too deep.
+/// character that XML 1.0 does not allow, invalid UTF-8, a date outside the years 0000 to 9999, too deep, or more than
+/// the maximum size. The error names the value by its key path.
 [[nodiscard]] std::optional<std::string> xmlPropertyList(const Value& value, Error* error = nullptr);
 
-/// Reads and parses a whole file (64 MiB at most, regular files only). Nothing if it cannot be read or parsed.
+/// Reads and parses a whole file (64 MiB at most, regular files or links to one only). Nothing if it cannot be read or
+/// parsed; the error is readFile()'s or parsePropertyList()'s, with the path in front.
 [[nodiscard]] std::optional<Value> readPropertyList(const DiskPath& path, Error* error = nullptr);
 
-/// Replaces the file: temporary file in the same directory, owner, mode, access control list and extended attributes
-/// of the old file kept (a new file is 0644), fsync, rename, fsync of the directory. On failure the old file stands
-/// untouched, no temporary file is left, and the error names the step, the host path and the system's text.
+/// Replaces the file by the XML form of the value, atomically and durably: see replaceFile() in
+/// platform/files/ReplaceFile.h for what is kept of the old file and what happens on failure. A value that cannot be
+/// serialised changes nothing.
 [[nodiscard]] std::optional<Error> writePropertyList(const Value& value, const HostPath& path);
 
 }  // namespace adminhost

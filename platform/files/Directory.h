@@ -1,0 +1,23 @@
+#pragma once
+
+// Opening the directory of a file that is about to be changed with the privileges of this process.
+
+#include "platform/files/FileDescriptor.h"
+#include "platform/files/Path.h"
+
+#include <string>
+
+namespace adminhost {
+
+/// A file's directory, open for reading, and its name in it.
+struct FilePlace {
+    FileDescriptor directory;
+    std::string name;
+};
+
+/// Finds the place of a file, which need not exist. Links on the way are followed only where nobody but root and this
+/// process's own user can have put them: a link in a directory that others may write to is ELOOP. Answers the system's
+/// error number, 0 for success; a path that ends in no name ("/", "a/", "a/..") is EINVAL.
+[[nodiscard]] int openPlace(const DiskPath& path, FilePlace& place);
+
+}  // namespace adminhost

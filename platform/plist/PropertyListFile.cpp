@@ -1,0 +1,44 @@
+#include "platform/files/File.h"
+#include "platform/files/ReplaceFile.h"
+#include "platform/plist/Formats.h"
+#include "platform/plist/PropertyList.h"
+
+#include <utility>
+
+#include <fmt/format.h>
+
+namespace adminhost {
+
+std::optional<Value> parsePropertyList(std::string_view bytes, Error* error) {
+    Error ignored;
+    Error& place = error != nullptr ? *error : ignored;
+    if (bytes.size() > plistMaximumSize) {
+        place = plist::contentError(fmt::format("larger than {} bytes", plistMaximumSize));
+        return std::nullopt;
+    }
+    return bytes.starts_with("bplist") ? plist::parseBinary(bytes, place) : plist::parseXml(bytes, place);
+}
+
+std::optional<Value> readPropertyList(const DiskPath& path, Error* error) {
+    const auto bytes = readFile(path, plistMaximumSize, error);
+    if (!bytes) {
+        return std::nullopt;
+    }
+    auto value = parsePropertyList(*bytes, error);
+    if (!value && error != nullptr) {
+        error->description = fmt::format("{}: {}", hostPath(path).text(), error->description.value_or(""));
+    }
+    return value;
+}
+
+std::optional<Error> writePropertyList(const Value& value, const HostPath& path) {
+    Error error;
+    const auto text = xmlPropertyList(value, &error);
+    if (!text) {
+        error.description = fmt::format("cannot serialise {}: {}", path.text(), error.description.value_or(""));
+        return error;
+    }
+    return replaceFile(*text, path);
+}
+
+}  // namespace adminhost

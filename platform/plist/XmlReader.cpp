@@ -1,0 +1,356 @@
+#include "platform/plist/Formats.h"
+#include "platform/plist/PropertyList.h"
+
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <cstring>
+#include <exception>
+#include <memory>
+#include <utility>
+#include <vector>
+
+#include <expat.h>
+#include <fmt/format.h>
+
+namespace adminhost::plist {
+namespace {
+
+enum class Element { plist, dict, array, key, string, integer, real, date, data, true_, false_, unknown };
+
+constexpr std::array<std::string_view, 11> elementNames = {"plist", "dict", "array", "key",  "string", "integer",
+                                                           "real",  "date", "data",  "true", "false"};
+
+Element elementOf(std::string_view name) noexcept {
+    const auto found = std::find(elementNames.begin(), elementNames.end(), name);
+    return static_cast<Element>(found - elementNames.begin());
+}
+
+std::string_view nameOf(Element element) noexcept {
+    return elementNames.at(static_cast<std::size_t>(element));
+}
+
+/// Names and keys from a file in a message: not longer than a reader wants to see.
+std::string shortened(std::string_view text) {
+    constexpr std::size_t longest = 60;
+    if (text.size() <= longest) {
+        return std::string(text);
+    }
+    std::size_t end = longest;
+    while (end > 0 && (static_cast<unsigned char>(text[end]) & 0xC0U) == 0x80U) {
+        --end;
+    }
+    return std::string(text.substr(0, end)) + "...";
+}
+
+constexpr std::string_view whiteSpace = " \t\r\n";
+
+std::string_view trimmed(std::string_view text) noexcept {
+    const std::size_t first = text.find_first_not_of(whiteSpace);
+    if (first == std::string_view::npos) {
+        return {};
+    }
+    return text.substr(first, text.find_last_not_of(whiteSpace) + 1 - first);
+}
+
+template <typename Number>
+bool readWhole(std::string_view text, Number& number) noexcept {
+    const auto [end, failure] = std::from_chars(text.data(), text.data() + text.size(), number);
+    return failure == std::errc{} && end == text.data() + text.size();
+}
+
+/// Decimal digits after an optional sign; hexadecimal forms are no part of the format.
+std::optional<Value> integerOf(std::string_view text) {
+    if (text.starts_with('+') && text.size() > 1 && text[1] != '-') {
+        text.remove_prefix(1);
+    }
+    std::int64_t negative = 0;
+    std::uint64_t positive = 0;
+    if (text.starts_with('-')) {
+        return readWhole(text, negative) ? std::optional<Value>(negative) : std::nullopt;
+    }
+    return readWhole(text, positive) ? std::optional<Value>(positive) : std::nullopt;
+}
+
+std::optional<Value> realOf(std::string_view text) {
+    if (text.starts_with('+') && text.size() > 1 && text[1] != '-') {
+        text.remove_prefix(1);
+    }
+    double number = 0;
+    // "nan(...)" is the C library's, not the format's.
+    if (text.find('(') != std::string_view::npos || !readWhole(text, number)) {
+        return std::nullopt;
+    }
+    return number;
+}
+
+/// "2026-01-31T08:00:00Z" and no other form; a real date of the calendar.
+std::optional<Value> dateOf(std::string_view text) {
+    constexpr std::string_view form = "dddd-dd-ddTdd:dd:ddZ";
+    const auto fits = [](char c, char f) { return f == 'd' ? c >= '0' && c <= '9' : c == f; };
+    if (text.size() != form.size() || !std::equal(text.begin(), text.end(), form.begin(), fits)) {
+        return std::nullopt;
+    }
+    const auto numberAt = [&](std::size_t at, std::size_t length) {
+        int number = 0;
+        std::from_chars(text.data() + at, text.data() + at + length, number);
+        return number;
+    };
+    using namespace std::chrono;
+    const year_month_day day{year(numberAt(0, 4)), month(static_cast<unsigned>(numberAt(5, 2))),
+                             std::chrono::day(static_cast<unsigned>(numberAt(8, 2)))};
+    const int hour = numberAt(11, 2);
+    const int minute = numberAt(14, 2);
+    const int second = numberAt(17, 2);
+    if (!day.ok() || hour > 23 || minute > 59 || second > 59) {
+        return std::nullopt;
+    }
+    return Date(sys_days(day) + hours(hour) + minutes(minute) + seconds(second));
+}
+
+class XmlReader {
+  public:
+    explicit XmlReader(const char* encoding) : _parser(::XML_ParserCreate(encoding), &::XML_ParserFree) {
+        if (!_parser) {
+            throw std::bad_alloc();
+        }
+        XML_Parser parser = _parser.get();
+        ::XML_SetUserData(parser, this);
+        ::XML_SetElementHandler(
+            parser,
+            [](void* self, const XML_Char* name, const XML_Char** attributes) {
+                guarded(self, [&](XmlReader& reader) { reader.begin(name, attributes); });
+            },
+            [](void* self, const XML_Char*) { guarded(self, [](XmlReader& reader) { reader.end(); }); });
+        ::XML_SetCharacterDataHandler(parser, [](void* self, const XML_Char* text, int length) {
+            guarded(self, [&](XmlReader& reader) { reader.characters({text, static_cast<std::size_t>(length)}); });
+        });
+        ::XML_SetStartDoctypeDeclHandler(
+            parser, [](void* self, const XML_Char*, const XML_Char*, const XML_Char*, int hasInternalSubset) {
+                guarded(self, [&](XmlReader& reader) {
+                    if (hasInternalSubset != 0) {
+                        reader.fail("a document type with an internal subset is not accepted");
+                    }
+                });
+            });
+        // After a document type expat passes over entities that it does not know; their text would be missing.
+        ::XML_SetSkippedEntityHandler(parser, [](void* self, const XML_Char* name, int) {
+            guarded(self, [&](XmlReader& reader) { reader.fail(fmt::format("unknown entity &{};", shortened(name))); });
+        });
+    }
+
+    std::optional<Value> parse(std::string_view bytes, Error& error) {
+        const auto status = ::XML_Parse(_parser.get(), bytes.data(), static_cast<int>(bytes.size()), XML_TRUE);
+        if (_message.empty() && status != XML_STATUS_OK) {
+            fail(::XML_ErrorString(::XML_GetErrorCode(_parser.get())));
+        }
+        if (!_message.empty()) {
+            error = contentError(std::move(_message));
+            return std::nullopt;
+        }
+        return std::move(_root);
+    }
+
+  private:
+    struct Container {
+        bool isDictionary = false;
+        bool hasKey = false;
+        std::string key;
+        Dictionary dictionary;
+        Array array;
+    };
+
+    /// Runs a handler; nothing may be thrown through expat's own frames.
+    template <typename Handler>
+    static void guarded(void* self, Handler handler) noexcept {
+        XmlReader& reader = *static_cast<XmlReader*>(self);
+        if (!reader._message.empty()) {
+            return;  // expat may call on for a moment after it has been told to stop
+        }
+        try {
+            handler(reader);
+        } catch (const std::exception& failure) {
+            reader.fail(failure.what());
+        }
+    }
+
+    void fail(std::string_view what) {
+        _message = fmt::format("line {}, column {}: {}", ::XML_GetCurrentLineNumber(_parser.get()),
+                               ::XML_GetCurrentColumnNumber(_parser.get()) + 1, what);
+        ::XML_StopParser(_parser.get(), XML_FALSE);
+    }
+
+    void begin(std::string_view name, const XML_Char** attributes) {
+        const Element element = elementOf(name);
+        if (element == Element::unknown) {
+            return fail(fmt::format("unknown element <{}>", shortened(name)));
+        }
+        if (_leaf) {
+            return fail(fmt::format("<{}> inside <{}>", name, nameOf(*_leaf)));
+        }
+        for (const XML_Char** attribute = attributes; *attribute != nullptr; attribute += 2) {
+            if (element != Element::plist || std::strcmp(attribute[0], "version") != 0) {
+                return fail(fmt::format("<{}> with an unknown attribute {}", name, shortened(attribute[0])));
+            }
+            if (std::strcmp(attribute[1], "1.0") != 0) {
+                return fail(fmt::format("unknown version \"{}\"", shortened(attribute[1])));
+            }
+        }
+        if ((element == Element::plist) == _inPlist) {
+            return fail(_inPlist ? "<plist> inside <plist>" : fmt::format("<{}> instead of <plist>", name));
+        }
+        if (element == Element::plist) {
+            _inPlist = true;
+            return;
+        }
+        if (!mayStand(element)) {
+            return;
+        }
+        if (element != Element::dict && element != Element::array) {
+            _leaf = element;
+            _text.clear();
+            return;
+        }
+        if (_containers.size() == static_cast<std::size_t>(plistMaximumDepth)) {
+            return fail(fmt::format("nested more than {} deep", plistMaximumDepth));
+        }
+        _containers.emplace_back().isDictionary = element == Element::dict;
+    }
+
+    /// Whether the element may come at this place; if not, the error is set.
+    bool mayStand(Element element) {
+        if (_containers.empty()) {
+            if (_root || element == Element::key) {
+                fail(_root ? "a second value in <plist>" : "<key> outside <dict>");
+                return false;
+            }
+            return true;
+        }
+        const Container& parent = _containers.back();
+        if (!parent.isDictionary && element == Element::key) {
+            fail("<key> inside <array>");
+        } else if (parent.isDictionary && parent.hasKey && element == Element::key) {
+            fail(fmt::format("the key \"{}\" has no value", shortened(parent.key)));
+        } else if (parent.isDictionary && !parent.hasKey && element != Element::key) {
+            fail(fmt::format("<{}> without a key", nameOf(element)));
+        } else {
+            return true;
+        }
+        return false;
+    }
+
+    void characters(std::string_view text) {
+        if (_leaf) {
+            _text.append(text);
+        } else if (text.find_first_not_of(whiteSpace) != std::string_view::npos) {
+            fail("text outside the elements that hold text");
+        }
+    }
+
+    void end() {
+        if (_leaf) {
+            endLeaf(*std::exchange(_leaf, std::nullopt));
+        } else if (!_containers.empty()) {
+            Container container = std::move(_containers.back());
+            if (container.hasKey) {
+                return fail(fmt::format("the key \"{}\" has no value", shortened(container.key)));
+            }
+            _containers.pop_back();
+            store(container.isDictionary ? Value(std::move(container.dictionary)) : Value(std::move(container.array)));
+        } else if (!_root) {
+            fail("<plist> without a value");
+        }
+    }
+
+    void endLeaf(Element element) {
+        std::optional<Value> value;
+        switch (element) {
+            case Element::key:
+                _containers.back().key = _text;
+                _containers.back().hasKey = true;
+                return;
+            case Element::string:
+                value = Value(_text);
+                break;
+            case Element::integer:
+                value = integerOf(trimmed(_text));
+                break;
+            case Element::real:
+                value = realOf(trimmed(_text));
+                break;
+            case Element::date:
+                value = dateOf(trimmed(_text));
+                break;
+            case Element::data:
+                if (auto data = dataOfBase64(_text)) {
+                    value = Value(std::move(*data));
+                }
+                break;
+            default:
+                if (_text.empty()) {
+                    value = Value(element == Element::true_);
+                }
+        }
+        if (!value) {
+            return fail(fmt::format("\"{}\" is no <{}>", shortened(_text), nameOf(element)));
+        }
+        store(std::move(*value));
+    }
+
+    void store(Value value) {
+        if (_containers.empty()) {
+            _root = std::move(value);
+            return;
+        }
+        Container& parent = _containers.back();
+        if (!parent.isDictionary) {
+            parent.array.push_back(std::move(value));
+            return;
+        }
+        const std::size_t before = parent.dictionary.size();
+        parent.dictionary.set(parent.key, std::move(value));
+        parent.hasKey = false;
+        if (parent.dictionary.size() == before) {
+            fail(fmt::format("the key \"{}\" stands twice", shortened(parent.key)));
+        }
+    }
+
+    std::unique_ptr<XML_ParserStruct, decltype(&::XML_ParserFree)> _parser;
+    std::string _message;  ///< of the first error
+    std::vector<Container> _containers;
+    std::optional<Element> _leaf;  ///< the open element that holds text
+    std::string _text;             ///< of that element
+    std::optional<Value> _root;
+    bool _inPlist = false;
+};
+
+/// Line and column after the text, both from 1.
+std::string placeAfter(std::string_view text) {
+    const auto lines = std::count(text.begin(), text.end(), '\n');
+    const std::size_t lastLine = text.rfind('\n') + 1;  // npos + 1 is 0
+    const auto columns = std::count_if(text.begin() + static_cast<std::ptrdiff_t>(lastLine), text.end(),
+                                       [](char c) { return (static_cast<unsigned char>(c) & 0xC0U) != 0x80U; });
+    return fmt::format("line {}, column {}", lines + 1, columns + 1);
+}
+
+}  // namespace
+
+std::optional<Value> parseXml(std::string_view bytes, Error& error) {
+    using namespace std::string_view_literals;
+    const bool bigEndian = bytes.starts_with("\xFE\xFF"sv) || bytes.starts_with("\0<"sv);
+    if (!bigEndian && !bytes.starts_with("\xFF\xFE"sv) && !bytes.starts_with("<\0"sv)) {
+        return XmlReader(nullptr).parse(bytes, error);
+    }
+    // expat does not notice unpaired surrogates in UTF-16, so it gets the text in UTF-8.
+    if (bytes.front() != '<' && bytes.front() != '\0') {
+        bytes.remove_prefix(2);
+    }
+    const FromUtf16 converted = utf8OfUtf16(bytes, bigEndian);
+    if (converted.end < bytes.size()) {
+        error = contentError(placeAfter(converted.text) + ": invalid UTF-16");
+        return std::nullopt;
+    }
+    return XmlReader("UTF-8").parse(converted.text, error);
+}
+
+}  // namespace adminhost::plist
