@@ -1,0 +1,135 @@
+#pragma once
+
+// The directory service: people and groups, in one or more nodes.
+//
+//     Error error;
+//     auto node = DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode, &error);
+//     auto records = node ? node->records(query, &error) : std::nullopt;
+//
+// A node is opened for one request and closed by its destruction; what it learnt of who asks (authenticate) goes with
+// it. Failures are errors with a code and a description for people. A query answers everything it found or an error,
+// never a part. All calls come from one thread. Texts that nodes answer are such that a property list can carry them.
+
+#include "platform/value/Error.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace adminhost {
+
+namespace directory {
+
+inline constexpr std::string_view users = "dsRecTypeStandard:Users";
+inline constexpr std::string_view groups = "dsRecTypeStandard:Groups";
+
+inline constexpr std::string_view recordName = "dsAttrTypeStandard:RecordName";  ///< login or group name
+inline constexpr std::string_view realName = "dsAttrTypeStandard:RealName";      ///< full name
+inline constexpr std::string_view generatedUID = "dsAttrTypeStandard:GeneratedUID";
+inline constexpr std::string_view uniqueID = "dsAttrTypeStandard:UniqueID";              ///< user id, decimal
+inline constexpr std::string_view primaryGroupID = "dsAttrTypeStandard:PrimaryGroupID";  ///< group id, decimal
+inline constexpr std::string_view homeDirectory = "dsAttrTypeStandard:NFSHomeDirectory";
+inline constexpr std::string_view userShell = "dsAttrTypeStandard:UserShell";
+inline constexpr std::string_view groupMembership = "dsAttrTypeStandard:GroupMembership";  ///< members' logins
+inline constexpr std::string_view authenticationAuthority = "dsAttrTypeStandard:AuthenticationAuthority";
+
+/// Domain of the directory's own errors. Codes: 1 no such node, 2 not supported by the node, 3 no such record; a back
+/// end's failures keep the domain and code of the back end.
+inline constexpr const char* errorDomain = "directory";
+inline constexpr std::int64_t noSuchNode = 1;
+inline constexpr std::int64_t notSupported = 2;
+inline constexpr std::int64_t noSuchRecord = 3;
+
+}  // namespace directory
+
+using DirectoryAttributes = std::map<std::string, std::vector<std::string>, std::less<>>;
+
+struct DirectoryQuery {
+    enum class Match : std::uint32_t {
+        equal = 0x2001,       ///< the whole value; UUIDs without regard to case
+        beginsWith = 0x2002,  ///< the beginning of the value, without regard to case
+    };
+
+    std::vector<std::string> recordTypes;
+    std::string attribute;
+    Match match = Match::equal;
+    std::vector<std::string> values;      ///< any of them
+    std::vector<std::string> attributes;  ///< to return; what a record lacks is absent
+    std::size_t maximum = 0;              ///< the first so many records; 0 is no limit
+};
+
+struct DirectoryRecord {
+    std::string type;
+    std::string node;  ///< name of the node that holds it
+    DirectoryAttributes attributes;
+
+    /// The values of an attribute, empty when there are none.
+    [[nodiscard]] const std::vector<std::string>& values(std::string_view attribute) const noexcept;
+    /// The first value of an attribute, or null.
+    [[nodiscard]] const std::string* first(std::string_view attribute) const noexcept;
+};
+
+class DirectoryNode {
+  public:
+    DirectoryNode() = default;
+    DirectoryNode(const DirectoryNode&) = delete;
+    DirectoryNode& operator=(const DirectoryNode&) = delete;
+    virtual ~DirectoryNode() = default;
+
+    [[nodiscard]] virtual const std::string& name() const noexcept = 0;
+    /// The records that match, each once, in an order that is the same for the same content. Nothing on failure.
+    [[nodiscard]] virtual std::optional<std::vector<DirectoryRecord>> records(const DirectoryQuery& query,
+                                                                              Error* error = nullptr) = 0;
+
+    // Changes. A node that cannot change anything answers an error that says so.
+
+    /// Signs in as a user record of the node; changes are then made with that user's rights.
+    [[nodiscard]] virtual std::optional<Error> authenticate(std::string_view username, std::string_view password);
+    [[nodiscard]] virtual std::optional<Error> createRecord(std::string_view type, std::string_view name,
+                                                            const DirectoryAttributes& attributes);
+    [[nodiscard]] virtual std::optional<Error> deleteRecord(std::string_view type, std::string_view name);
+    /// Sets a record's password without giving the old one.
+    [[nodiscard]] virtual std::optional<Error> setPassword(std::string_view type, std::string_view name,
+                                                           std::string_view password);
+
+  protected:
+    [[nodiscard]] Error unsupported(std::string_view operation) const;
+};
+
+/// A node that can be opened: its name, and how. Opening answers null with the error on failure.
+struct DirectoryNodeSource {
+    std::string name;
+    std::function<std::unique_ptr<DirectoryNode>(Error*)> open;
+};
+
+class DirectorySession {
+  public:
+    /// The node that searches all nodes of the session in order. It fails as soon as one of them does.
+    static constexpr std::uint32_t authenticationSearchNode = 0x2201;
+    static constexpr std::string_view authenticationSearchNodeName = "/Search";
+
+    explicit DirectorySession(std::vector<DirectoryNodeSource> nodes) : _nodes(std::move(nodes)) {}
+
+    /// The process's session: the accounts of this machine until setDirectoryNodes() says otherwise.
+    [[nodiscard]] static DirectorySession& defaultSession();
+
+    /// Null, with the error, when there is no such node or it cannot be opened.
+    [[nodiscard]] std::unique_ptr<DirectoryNode> openNode(std::uint32_t nodeType, Error* error = nullptr) const;
+    [[nodiscard]] std::unique_ptr<DirectoryNode> openNode(std::string_view name, Error* error = nullptr) const;
+    [[nodiscard]] const std::vector<DirectoryNodeSource>& nodes() const noexcept { return _nodes; }
+
+  private:
+    friend void setDirectoryNodes(std::vector<DirectoryNodeSource> nodes);
+    std::vector<DirectoryNodeSource> _nodes;
+};
+
+/// Sets the nodes of the default session, in search order. Called by the worker before requests are served.
+void setDirectoryNodes(std::vector<DirectoryNodeSource> nodes);
+
+}  // namespace adminhost

@@ -1,0 +1,24 @@
+#pragma once
+
+// The directory node of this machine's own accounts: the files /etc/passwd and /etc/group below the system root.
+//
+// Read by the C library's own file readers, not the name service, which might enumerate a company. Users come before
+// groups, each in file order. The node changes nothing: it is read only (see DirectoryNode). docs/directory-mapping.md
+// says how a line becomes a record.
+
+#include "platform/directory/Directory.h"
+#include "platform/files/Path.h"
+
+#include <optional>
+#include <string_view>
+
+namespace adminhost {
+
+inline constexpr std::string_view localAccountsNodeName = "/Local";
+
+/// The source of the node. All nodes opened from one source share one pass over the accounts for as long as the files
+/// do not change. With a file of UUIDs ("user:NAME UUID" or "group:NAME UUID" on each line), an account has the UUID
+/// that stands there or none, and a query fails when that file cannot be read; without, a name-based one.
+[[nodiscard]] DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile = std::nullopt);
+
+}  // namespace adminhost

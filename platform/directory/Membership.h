@@ -1,0 +1,37 @@
+#pragma once
+
+// Membership: from UUIDs of the directory to the ids and names of the system.
+//
+// All look-ups go through the nodes of the default session and so see the accounts below the system root, not the name
+// service of the machine the process runs on. A directory that cannot answer counts as "not found".
+
+#include "platform/directory/Uuid.h"
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace adminhost {
+
+struct PosixId {
+    enum class Kind : int { user = 0, group = 1 };
+    std::uint32_t id = 0;
+    Kind kind = Kind::user;
+
+    friend bool operator==(const PosixId&, const PosixId&) = default;
+};
+
+/// The UUID of a text of 36 characters, in either case; nothing for any other text.
+[[nodiscard]] std::optional<Uuid> mbr_string_to_uuid(std::string_view text) noexcept;
+
+/// The user or group id of the first record with the UUID (nodes in order, users before groups).
+[[nodiscard]] std::optional<PosixId> mbr_uuid_to_id(const Uuid& uuid);
+
+/// The login name of a user id, as getpwuid: of several accounts with the id, the first. Nodes are asked in order
+/// until one knows the id; one that fails is passed over.
+[[nodiscard]] std::optional<std::string> userNameOf(std::uint32_t userId);
+/// The name of a group id, as getgrgid.
+[[nodiscard]] std::optional<std::string> groupNameOf(std::uint32_t groupId);
+
+}  // namespace adminhost

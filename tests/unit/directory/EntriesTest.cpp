@@ -1,0 +1,119 @@
+#include "platform/directory/Entries.h"
+#include "platform/directory/Membership.h"
+#include "platform/directory/Uuid.h"
+#include "tests/unit/directory/TemporaryAccounts.h"
+
+#include <gmock/gmock.h>
+
+namespace adminhost {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+class Entries : public testing::Test {
+  protected:
+    Entries() {
+        _root.users(
+            "anna:x:1001:1000:Anna Berg:/home/anna:/bin/sh\nberta:x:1002:1000:Annegret Zorn:/:\n"
+            "Andi:x:1003:1000::/:\nroot:x:0:0:root:/root:\ntoor:x:0:0::/:\n");
+        _root.groups("root:x:0:\nanimators:x:2000:anna\nbert:x:2001:\n");
+    }
+    static std::vector<std::string> shortNames(const std::optional<Array>& entries) {
+        std::vector<std::string> names;
+        for (const Value& entry : entries.value_or(Array())) {
+            names.push_back(*entry.dictionary()->get("shortName").string());
+        }
+        return names;
+    }
+
+    TemporaryAccounts _root;
+};
+
+TEST_F(Entries, EntryHasNamesUuidTwiceAndKind) {
+    const auto entries = directoryEntries("anna", 0);
+    ASSERT_TRUE(entries);
+    const std::string uuid = "81CEF789-6423-555F-BB64-F7BD915968D3";
+    EXPECT_EQ(
+        *entries,
+        (Array{Dictionary{
+            {"shortName", "anna"}, {"longName", "Anna Berg"}, {"guid", uuid}, {"_id_", uuid}, {"type", "user"}}}));
+}
+
+TEST_F(Entries, EntryWithoutFullNameShowsTheShortName) {
+    const auto entries = directoryEntries("animators", 0);
+    ASSERT_EQ(entries.value_or(Array()).size(), 1U);
+    EXPECT_EQ(entries->at(0).dictionary()->get("longName"), Value("animators"));
+    EXPECT_EQ(entries->at(0).dictionary()->get("type"), Value("group"));
+}
+
+TEST_F(Entries, WhatARecordLacksIsAbsent) {
+    const DirectoryRecord record{"dsRecTypeStandard:Computers", "/Local", {}};
+    EXPECT_EQ(directoryEntryOf(record), (Dictionary{{"type", "group"}}));
+}
+
+TEST_F(Entries, BeginningOfShortOrFullNameMatchesWithoutRegardToCaseShortNamesFirst) {
+    EXPECT_THAT(shortNames(directoryEntries("AN", 0)), ElementsAre("anna", "Andi", "animators", "berta"));
+    EXPECT_THAT(shortNames(directoryEntries("anne", 0)), ElementsAre("berta"));
+    EXPECT_THAT(shortNames(directoryEntries("nn", 0)), IsEmpty());
+}
+
+TEST_F(Entries, LimitCountsEachRecordOnceAndIsFilled) {
+    EXPECT_THAT(shortNames(directoryEntries("an", 2)), ElementsAre("anna", "Andi"));
+    EXPECT_THAT(shortNames(directoryEntries("an", 3)), ElementsAre("anna", "Andi", "animators"));
+    EXPECT_THAT(shortNames(directoryEntries("an", 4)), ElementsAre("anna", "Andi", "animators", "berta"));
+    EXPECT_THAT(shortNames(directoryEntries("an", 5)), ElementsAre("anna", "Andi", "animators", "berta"));
+}
+
+TEST_F(Entries, EmptyTextFindsAll) {
+    EXPECT_EQ(directoryEntries("", 0).value_or(Array()).size(), 8U);
+}
+
+TEST_F(Entries, DirectoryThatFailsIsAnError) {
+    std::filesystem::remove(_root.path("etc/passwd"));
+    Error error;
+    EXPECT_FALSE(directoryEntries("an", 0, &error));
+    EXPECT_EQ(error.code, ENOENT);
+    EXPECT_FALSE(directoryEntriesOf("anna", &error));
+}
+
+TEST_F(Entries, NameOrUuidIsFoundWithItsNode) {
+    for (const char* text : {"anna", "81CEF789-6423-555F-BB64-F7BD915968D3", "81cef789-6423-555f-bb64-f7bd915968d3"}) {
+        const auto entries = directoryEntriesOf(text);
+        ASSERT_EQ(entries.value_or(Array()).size(), 1U) << text;
+        EXPECT_EQ(entries->at(0).dictionary()->get("node"), Value("/Local"));
+        EXPECT_EQ(entries->at(0).dictionary()->get("shortName"), Value("anna"));
+    }
+    EXPECT_THAT(shortNames(directoryEntriesOf("root")), ElementsAre("root", "root"));
+    EXPECT_THAT(shortNames(directoryEntriesOf("nobody")), IsEmpty());
+}
+
+TEST_F(Entries, MembershipMapsUuidsToIdsWithTheirKind) {
+    const auto uuid = mbr_string_to_uuid("81cef789-6423-555f-bb64-f7bd915968d3");
+    ASSERT_TRUE(uuid);
+    EXPECT_EQ(mbr_uuid_to_id(*uuid), (PosixId{1001, PosixId::Kind::user}));
+    EXPECT_EQ(mbr_uuid_to_id(nameBasedUuid(localAccountsNamespace, "group:animators")),
+              (PosixId{2000, PosixId::Kind::group}));
+    EXPECT_EQ(static_cast<int>(PosixId::Kind::user), 0);
+    EXPECT_EQ(static_cast<int>(PosixId::Kind::group), 1);
+    EXPECT_FALSE(mbr_uuid_to_id(nameBasedUuid(localAccountsNamespace, "user:gone")));
+    EXPECT_FALSE(mbr_string_to_uuid("garbage"));
+}
+
+TEST_F(Entries, MembershipOfAnUnreadableDirectoryIsNotFound) {
+    std::filesystem::remove(_root.path("etc/passwd"));
+    EXPECT_FALSE(mbr_uuid_to_id(*mbr_string_to_uuid("81cef789-6423-555f-bb64-f7bd915968d3")));
+    EXPECT_FALSE(userNameOf(1001));
+    EXPECT_EQ(groupNameOf(2000), "animators");
+}
+
+TEST_F(Entries, NamesOfIdsComeFromTheAccountsBelowTheSystemRootTheFirstOfSeveral) {
+    EXPECT_EQ(userNameOf(1001), "anna");
+    EXPECT_EQ(userNameOf(0), "root");
+    EXPECT_EQ(groupNameOf(2000), "animators");
+    EXPECT_FALSE(userNameOf(4711));
+    EXPECT_FALSE(groupNameOf(1001)) << "a user's id is no group's";
+}
+
+}  // namespace
+}  // namespace adminhost
