@@ -12,7 +12,7 @@ constexpr std::array<std::int8_t, 128> makeTable() {
     std::array<std::int8_t, 128> table{};
     table.fill(base64Invalid);
     for (std::size_t i = 0; i < base64Alphabet.size(); ++i) {
-        table[static_cast<std::size_t>(base64Alphabet[i])] = static_cast<std::int8_t>(i);
+        table[static_cast<unsigned char>(base64Alphabet[i])] = static_cast<std::int8_t>(i);
     }
     table['='] = base64Pad;
     table[' '] = base64Blank;

@@ -63,7 +63,8 @@ void ByteBuffer::append(std::uint8_t byte) noexcept {
     if (_bytes.size() == _bytes.capacity() && !grow()) {
         // Written without allocating: this is where memory has run out.
         char event[96];
-        std::snprintf(event, sizeof event, "Cannot append any more bytes to buffer at %p.", static_cast<void*>(this));
+        static_cast<void>(std::snprintf(event, sizeof event, "Cannot append any more bytes to buffer at %p.",
+                                        static_cast<void*>(this)));
         adminhost::logEvent(event);
         return;
     }

@@ -1,0 +1,93 @@
+#include "platform/bundle/Bundle.h"
+
+#include "platform/bundle/Language.h"
+#include "platform/files/File.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <system_error>
+
+namespace adminhost {
+namespace {
+
+namespace fs = std::filesystem;
+
+/// More entries than any bundle has; a directory that others fill does not hold a request up.
+constexpr std::size_t maximumEntries = 4096;
+
+bool isDirectory(const fs::path& path) {
+    std::error_code error;
+    return fs::is_directory(path, error);
+}
+
+}  // namespace
+
+Bundle::Bundle(HostPath path) : _path(std::move(path)) {
+    const fs::path directory = diskPath(_path).text();
+    for (const fs::path& place : {directory / "Contents/Resources", directory / "Resources", directory}) {
+        std::error_code error;
+        std::size_t seen = 0;
+        for (fs::directory_iterator entry(place, error), end; !error && entry != end && seen < maximumEntries;
+             entry.increment(error), ++seen) {
+            std::error_code failed;
+            std::string name = entry->path().stem().string();
+            if (entry->is_directory(failed) && isLanguage(name)) {
+                _localizations.push_back({std::move(name), DiskPath(entry->path().string())});
+            }
+        }
+    }
+    std::stable_sort(_localizations.begin(), _localizations.end(),
+                     [](const Localization& a, const Localization& b) { return a.name < b.name; });
+}
+
+std::optional<Bundle> Bundle::open(const HostPath& path) {
+    if (path.text().empty() || !isDirectory(diskPath(path).text())) {
+        return std::nullopt;
+    }
+    return Bundle(path);
+}
+
+std::vector<std::string> Bundle::localizations() const {
+    std::vector<std::string> names;
+    for (const Localization& localization : _localizations) {
+        if (names.empty() || names.back() != localization.name) {
+            names.push_back(localization.name);
+        }
+    }
+    return names;
+}
+
+std::optional<DiskPath> Bundle::stringsTable(std::string_view table, std::string_view localization) const {
+    for (const Localization& candidate : _localizations) {
+        if (candidate.name == localization) {
+            DiskPath path(candidate.directory.text() + "/" + std::string(table) + ".strings");
+            if (exists(path)) {
+                return path;
+            }
+        }
+    }
+    return std::nullopt;
+}
+
+std::optional<Dictionary> readStringsTable(const DiskPath& path, Error* error) {
+    const std::optional<std::string> bytes = readFile(path, stringsTableMaximumSize, error);
+    return bytes ? parseStringsTable(*bytes, error) : std::nullopt;
+}
+
+std::optional<Dictionary> localizedTable(const Bundle& bundle, std::string_view table,
+                                         const std::vector<std::string>& preferredLanguages) {
+    const std::vector<std::string> localizations = bundle.localizations();
+    for (const std::string& localization : matchingLocalizations(localizations, preferredLanguages)) {
+        if (const auto path = bundle.stringsTable(table, localization)) {
+            return readStringsTable(*path);
+        }
+    }
+    for (const std::string& localization : equivalentLocalizations(localizations, "English")) {
+        if (const auto path = bundle.stringsTable(table, localization)) {
+            return readStringsTable(*path);
+        }
+    }
+    return std::nullopt;
+}
+
+}  // namespace adminhost

@@ -1,0 +1,54 @@
+#pragma once
+
+// Bundles: directories that carry texts in several languages.
+//
+// A bundle's localizations are the subdirectories of its "Contents/Resources", of its "Resources" and of itself that
+// are named after a language (Language.h), with or without an extension. A strings table is a file TABLE.strings in one
+// of them. A bundle may lie on a file system that others write to: what is read is bounded, and nothing waits for a
+// pipe.
+
+#include "platform/bundle/StringsTable.h"
+#include "platform/files/Path.h"
+#include "platform/value/Value.h"
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+namespace adminhost {
+
+class Bundle {
+  public:
+    /// Nothing if no directory is there.
+    [[nodiscard]] static std::optional<Bundle> open(const HostPath& path);
+
+    [[nodiscard]] const HostPath& path() const noexcept { return _path; }
+    /// The localizations' names as they are spelled, without extension; each once, in alphabetical order.
+    [[nodiscard]] std::vector<std::string> localizations() const;
+    /// Where the table of that localization (spelled as localizations() does) lies; nothing if it has none.
+    [[nodiscard]] std::optional<DiskPath> stringsTable(std::string_view table, std::string_view localization) const;
+
+  private:
+    struct Localization {
+        std::string name;
+        DiskPath directory;
+    };
+
+    explicit Bundle(HostPath path);
+
+    HostPath _path;
+    std::vector<Localization> _localizations;  ///< by name, then in the order in which they are looked into
+};
+
+/// Reads a strings table of any form: XML, binary or quoted text. Nothing if it cannot be read, is no dictionary or is
+/// larger than stringsTableMaximumSize.
+[[nodiscard]] std::optional<Dictionary> readStringsTable(const DiskPath& path, Error* error = nullptr);
+
+/// The table in the best of the preferred languages (names or codes, most preferred first) that has it, else in
+/// "English". The first one found is answered: if it cannot be read, nothing is.
+[[nodiscard]] std::optional<Dictionary> localizedTable(const Bundle& bundle, std::string_view table,
+                                                       const std::vector<std::string>& preferredLanguages);
+
+}  // namespace adminhost

@@ -1,0 +1,26 @@
+#pragma once
+
+// Names and codes of languages, and which of a bundle's localizations suit a person.
+
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace adminhost {
+
+/// Whether the text names a language: an English name ("French", "Simplified Chinese"; in any case, "_" and "-" may
+/// stand for blanks) or a code ("fr", "pt_BR", "zh-Hant").
+[[nodiscard]] bool isLanguage(std::string_view nameOrCode);
+
+/// The localizations that suit the preferred languages, best first, each at most once. For every preferred language in
+/// its order: the one spelled the same; those of the same language, script and region under another spelling ("English"
+/// and "en"; what is not said is filled in with what is likely: "zh-TW" is "zh-Hant"); the language without a region;
+/// the language of another region. Never another language, and never another script of the same language.
+[[nodiscard]] std::vector<std::string> matchingLocalizations(const std::vector<std::string>& localizations,
+                                                             const std::vector<std::string>& preferredLanguages);
+
+/// The localizations that are the named one under any spelling, the exact spelling first.
+[[nodiscard]] std::vector<std::string> equivalentLocalizations(const std::vector<std::string>& localizations,
+                                                               std::string_view nameOrCode);
+
+}  // namespace adminhost

@@ -1,0 +1,413 @@
+#include "platform/bundle/StringsTable.h"
+
+#include "platform/plist/PropertyList.h"
+#include "platform/value/Text.h"
+
+#include <algorithm>
+#include <cstring>
+#include <string>
+
+#include <fmt/format.h>
+
+namespace adminhost {
+namespace {
+
+constexpr std::string_view byteOrderMark = "\xEF\xBB\xBF";
+
+void setError(Error* error, std::string description) {
+    if (error != nullptr) {
+        *error = Error{"stringsTable", 1, std::move(description)};
+    }
+}
+
+void appendUtf8(std::string& text, char32_t character) {
+    const auto add = [&](char32_t bits) { text += static_cast<char>(bits); };
+    if (character < 0x80) {
+        add(character);
+    } else if (character < 0x800) {
+        add(0xC0 | (character >> 6U));
+        add(0x80 | (character & 0x3FU));
+    } else if (character < 0x10000) {
+        add(0xE0 | (character >> 12U));
+        add(0x80 | ((character >> 6U) & 0x3FU));
+        add(0x80 | (character & 0x3FU));
+    } else {
+        add(0xF0 | (character >> 18U));
+        add(0x80 | ((character >> 12U) & 0x3FU));
+        add(0x80 | ((character >> 6U) & 0x3FU));
+        add(0x80 | (character & 0x3FU));
+    }
+}
+
+bool isHighSurrogate(char32_t unit) noexcept {
+    return unit >= 0xD800 && unit < 0xDC00;
+}
+bool isLowSurrogate(char32_t unit) noexcept {
+    return unit >= 0xDC00 && unit < 0xE000;
+}
+char32_t joined(char32_t high, char32_t low) noexcept {
+    return 0x10000 + ((high - 0xD800) << 10U) + (low - 0xDC00);
+}
+
+/// Nothing if it is not well-formed.
+std::optional<std::string> textOfUtf16(std::string_view bytes, bool bigEndian) {
+    if (bytes.size() % 2 != 0) {
+        return std::nullopt;
+    }
+    const auto unitAt = [&](std::size_t at) -> char32_t {
+        const auto first = static_cast<unsigned char>(bytes[at]);
+        const auto second = static_cast<unsigned char>(bytes[at + 1]);
+        return bigEndian ? (char32_t{first} << 8U) | second : (char32_t{second} << 8U) | first;
+    };
+    std::string text;
+    for (std::size_t at = 0; at < bytes.size(); at += 2) {
+        char32_t unit = unitAt(at);
+        if (isHighSurrogate(unit) && at + 2 < bytes.size() && isLowSurrogate(unitAt(at + 2))) {
+            at += 2;
+            unit = joined(unit, unitAt(at));
+        } else if (isHighSurrogate(unit) || isLowSurrogate(unit)) {
+            return std::nullopt;
+        }
+        appendUtf8(text, unit);
+    }
+    return text;
+}
+
+/// The table's text in UTF-8 without a byte-order mark; nothing if it is in no encoding that is read.
+std::optional<std::string> textOfTable(std::string_view bytes) {
+    if (bytes.starts_with("\xFE\xFF") || bytes.starts_with("\xFF\xFE")) {
+        return textOfUtf16(bytes.substr(2), bytes[0] == '\xFE');
+    }
+    // A table begins with a character of ASCII, which tells the byte order where no mark does.
+    if (bytes.size() >= 2 && (bytes[0] == '\0') != (bytes[1] == '\0')) {
+        return textOfUtf16(bytes, bytes[0] == '\0');
+    }
+    if (bytes.starts_with(byteOrderMark)) {
+        bytes.remove_prefix(byteOrderMark.size());
+    }
+    return isUtf8(bytes) ? std::optional<std::string>(bytes) : std::nullopt;
+}
+
+bool isBlank(char c) noexcept {
+    return c == ' ' || (c >= '\t' && c <= '\r');
+}
+bool isOctal(char c) noexcept {
+    return c >= '0' && c <= '7';
+}
+int hexValue(char c) noexcept {
+    if (c >= '0' && c <= '9') {
+        return c - '0';
+    }
+    c = static_cast<char>(c | 0x20);
+    return c >= 'a' && c <= 'f' ? c - 'a' + 10 : -1;
+}
+bool isUnquoted(char c) noexcept {
+    return (c >= '0' && c <= '9') || (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') ||
+           (c != '\0' && std::strchr("_$/:.-", c) != nullptr);
+}
+
+class Parser {
+  public:
+    explicit Parser(std::string_view text) : _text(text) {}
+
+    std::optional<Dictionary> table() {
+        Dictionary entries;
+        if (!skip()) {
+            return std::nullopt;
+        }
+        const bool braced = take('{');
+        if (!readEntries(entries, braced) || !skip()) {
+            return std::nullopt;
+        }
+        if (!atEnd()) {
+            fail("a key is expected here");
+            return std::nullopt;
+        }
+        return entries;
+    }
+
+    [[nodiscard]] std::string problem() const {
+        const std::string_view before = _text.substr(0, _at);
+        const auto line = std::count(before.begin(), before.end(), '\n') + 1;
+        const std::string_view lineStart = before.substr(before.rfind('\n') + 1);
+        const auto column =
+            std::count_if(lineStart.begin(), lineStart.end(), [](char c) { return (c & 0xC0) != 0x80; }) + 1;
+        return fmt::format("line {}, column {}: {}", line, column, _problem);
+    }
+
+  private:
+    [[nodiscard]] bool atEnd() const noexcept { return _at == _text.size(); }
+    [[nodiscard]] bool startsWith(std::string_view what) const noexcept { return _text.substr(_at).starts_with(what); }
+
+    bool take(char c) noexcept {
+        if (atEnd() || _text[_at] != c) {
+            return false;
+        }
+        ++_at;
+        return true;
+    }
+
+    bool fail(const char* problem) noexcept {
+        _problem = problem;
+        return false;
+    }
+
+    /// Blanks and comments.
+    bool skip() {
+        for (;;) {
+            while (!atEnd() && isBlank(_text[_at])) {
+                ++_at;
+            }
+            if (startsWith("//")) {
+                _at = std::min(_text.find_first_of("\n\r", _at), _text.size());
+            } else if (startsWith("/*")) {
+                const std::size_t end = _text.find("*/", _at + 2);
+                if (end == std::string_view::npos) {
+                    return fail("this comment has no end");
+                }
+                _at = end + 2;
+            } else {
+                return true;
+            }
+        }
+    }
+
+    bool readEntries(Dictionary& entries, bool braced) {
+        for (;;) {
+            if (!skip()) {
+                return false;
+            }
+            if (braced && take('}')) {
+                return true;
+            }
+            if (atEnd()) {
+                return !braced || fail("a key or \"}\" is expected here");
+            }
+            std::string key;
+            if (!readText(key, "a key is expected here") || !skip()) {
+                return false;
+            }
+            Value value(key);
+            if (take('=') && (!skip() || !readValue(value) || !skip())) {
+                return false;
+            }
+            if (!take(';')) {
+                return fail("\";\" is expected here");
+            }
+            entries.set(key, std::move(value));
+        }
+    }
+
+    bool readValue(Value& value) {
+        if (_depth == stringsTableMaximumDepth) {
+            return fail("lists and dictionaries are nested too deep here");
+        }
+        ++_depth;
+        bool good = false;
+        if (take('{')) {
+            Dictionary dictionary;
+            good = readEntries(dictionary, true);
+            value = std::move(dictionary);
+        } else if (take('(')) {
+            Array array;
+            good = readArray(array);
+            value = std::move(array);
+        } else if (take('<')) {
+            Data data;
+            good = readData(data);
+            value = std::move(data);
+        } else {
+            std::string text;
+            good = readText(text, "a value is expected here");
+            value = std::move(text);
+        }
+        --_depth;
+        return good;
+    }
+
+    bool readArray(Array& array) {
+        for (;;) {
+            if (!skip()) {
+                return false;
+            }
+            if (take(')')) {
+                return true;
+            }
+            Value value;
+            if (!readValue(value) || !skip()) {
+                return false;
+            }
+            array.push_back(std::move(value));
+            if (!take(',') && (atEnd() || _text[_at] != ')')) {
+                return fail("\",\" or \")\" is expected here");
+            }
+        }
+    }
+
+    bool readData(Data& data) {
+        int high = -1;
+        for (; !atEnd(); ++_at) {
+            const int digit = hexValue(_text[_at]);
+            if (digit >= 0) {
+                if (high >= 0) {
+                    data.push_back(static_cast<std::uint8_t>(high * 16 + digit));
+                }
+                high = high >= 0 ? -1 : digit;
+            } else if (!isBlank(_text[_at])) {
+                break;
+            }
+        }
+        return (high < 0 && take('>')) || fail("hexadecimal digits in pairs and \">\" are expected here");
+    }
+
+    bool readText(std::string& text, const char* expected) {
+        if (take('"')) {
+            return readQuoted(text, '"');
+        }
+        if (take('\'')) {
+            return readQuoted(text, '\'');
+        }
+        const std::size_t start = _at;
+        while (!atEnd() && isUnquoted(_text[_at]) && !startsWith("//") && !startsWith("/*")) {
+            ++_at;
+        }
+        text = _text.substr(start, _at - start);
+        return !text.empty() || fail(expected);
+    }
+
+    bool readQuoted(std::string& text, char quote) {
+        const std::size_t start = _at - 1;
+        while (!atEnd()) {
+            const char c = _text[_at];
+            if (c == '\0') {
+                return fail("a text cannot hold the character NUL");
+            }
+            if (c == '\\') {
+                if (!readEscape(text)) {
+                    return false;
+                }
+                continue;
+            }
+            ++_at;
+            if (c == quote) {
+                return true;
+            }
+            text += c;
+        }
+        _at = start;
+        return fail("this text has no closing quote");
+    }
+
+    bool readEscape(std::string& text) {
+        const std::size_t start = _at++;
+        if (atEnd()) {
+            return fail("this text has no closing quote");
+        }
+        const char c = _text[_at];
+        char32_t character = 0;
+        if (isOctal(c)) {
+            const std::size_t end = std::min(_at + 3, _text.size());
+            for (; _at < end && isOctal(_text[_at]); ++_at) {
+                character = character * 8 + static_cast<char32_t>(_text[_at] - '0');
+            }
+            if (character > 0xFF) {
+                _at = start;
+                return fail("an octal escape ends at \\377");
+            }
+        } else if (c == 'U' || c == 'u') {
+            if (!readUnicodeEscape(character)) {
+                _at = start;
+                return fail("an escape of four hexadecimal digits that name a character is expected here");
+            }
+        } else {
+            constexpr std::string_view letters = "abfnrtv";
+            constexpr std::string_view meanings = "\a\b\f\n\r\t\v";
+            const std::size_t letter = letters.find(c);
+            // Any other character stands for itself; its further bytes follow by themselves.
+            text += letter == std::string_view::npos ? c : meanings[letter];
+            ++_at;
+            return c != '\0' || fail("a text cannot hold the character NUL");
+        }
+        if (character == 0) {
+            _at = start;
+            return fail("a text cannot hold the character NUL");
+        }
+        appendUtf8(text, character);
+        return true;
+    }
+
+    /// From the letter on; a pair of escapes for a character beyond U+FFFF.
+    bool readUnicodeEscape(char32_t& character) {
+        if (!readUnit(character) || isLowSurrogate(character)) {
+            return false;
+        }
+        if (isHighSurrogate(character)) {
+            char32_t low = 0;
+            if (!take('\\') || (!startsWith("U") && !startsWith("u")) || !readUnit(low) || !isLowSurrogate(low)) {
+                return false;
+            }
+            character = joined(character, low);
+        }
+        return true;
+    }
+
+    bool readUnit(char32_t& unit) {
+        ++_at;
+        unit = 0;
+        for (int i = 0; i < 4; ++i, ++_at) {
+            const int digit = atEnd() ? -1 : hexValue(_text[_at]);
+            if (digit < 0) {
+                return false;
+            }
+            unit = unit * 16 + static_cast<char32_t>(digit);
+        }
+        return true;
+    }
+
+    std::string_view _text;
+    std::size_t _at = 0;
+    int _depth = 0;
+    const char* _problem = "";
+};
+
+std::optional<Dictionary> parseAsPropertyList(std::string_view bytes, Error* error) {
+    std::optional<Value> value = parsePropertyList(bytes, error);
+    if (!value) {
+        return std::nullopt;
+    }
+    if (value->dictionary() == nullptr) {
+        setError(error,
+                 fmt::format("a strings table is a dictionary, this property list is a {}", nameOf(value->type())));
+        return std::nullopt;
+    }
+    return std::move(*value->dictionary());
+}
+
+}  // namespace
+
+std::optional<Dictionary> parseStringsTable(std::string_view bytes, Error* error) {
+    if (bytes.size() > stringsTableMaximumSize) {
+        setError(error, fmt::format("a strings table of more than {} bytes is not read", stringsTableMaximumSize));
+        return std::nullopt;
+    }
+    if (bytes.starts_with("bplist")) {
+        return parseAsPropertyList(bytes, error);
+    }
+    const std::optional<std::string> text = textOfTable(bytes);
+    if (!text) {
+        setError(error, "a strings table is in UTF-8 or UTF-16, this one is in neither");
+        return std::nullopt;
+    }
+    const auto first = std::find_if_not(text->begin(), text->end(), isBlank);
+    if (first != text->end() && *first == '<') {
+        return parseAsPropertyList(bytes, error);
+    }
+    Parser parser(*text);
+    std::optional<Dictionary> table = parser.table();
+    if (!table) {
+        setError(error, parser.problem());
+    }
+    return table;
+}
+
+}  // namespace adminhost
