@@ -1,6 +1,7 @@
 #include "tests/support/SampleRoot.h"
 
-#include <array>
+#include "tests/support/Program.h"
+
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
@@ -10,10 +11,7 @@
 #include <stdexcept>
 #include <system_error>
 
-#include <fcntl.h>
 #include <nlohmann/json.hpp>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 namespace adminhost::test {
@@ -22,37 +20,12 @@ namespace fs = std::filesystem;
 
 namespace {
 
-// Tests of the task room use this as well, so it does not go through that room.
 std::string run(const std::vector<std::string>& command) {
-    std::array<int, 2> pipe{};
-    if (::pipe2(pipe.data(), O_CLOEXEC) != 0) {
-        throw std::system_error(errno, std::generic_category(), "pipe");
+    const ProgramResult result = runProgram(command);
+    if (result.status != 0) {
+        throw std::runtime_error(command[0] + " ended with status " + std::to_string(result.status));
     }
-    posix_spawn_file_actions_t actions{};
-    ::posix_spawn_file_actions_init(&actions);
-    ::posix_spawn_file_actions_adddup2(&actions, pipe[1], STDOUT_FILENO);
-    std::vector<char*> arguments;
-    arguments.reserve(command.size() + 1);
-    for (const auto& argument : command) {
-        arguments.push_back(const_cast<char*>(argument.c_str()));
-    }
-    arguments.push_back(nullptr);
-    pid_t child = -1;
-    const int failure = ::posix_spawnp(&child, arguments[0], &actions, nullptr, arguments.data(), environ);
-    ::posix_spawn_file_actions_destroy(&actions);
-    ::close(pipe[1]);
-    std::string output;
-    std::array<char, 65536> piece{};
-    for (ssize_t count = 0; failure == 0 && (count = ::read(pipe[0], piece.data(), piece.size())) > 0;) {
-        output.append(piece.data(), static_cast<std::size_t>(count));
-    }
-    ::close(pipe[0]);
-    int status = 0;
-    if (failure != 0 || ::waitpid(child, &status, 0) != child || status != 0) {
-        throw std::runtime_error(command[0] + " failed (start " + std::to_string(failure) + ", status " +
-                                 std::to_string(status) + ")");
-    }
-    return output;
+    return result.output;
 }
 
 const char* const callsLog = "/var/log/tool-calls.log";
@@ -190,10 +163,9 @@ std::string SampleRoot::uuidOf(const std::string& kind, const std::string& name)
     static std::map<std::pair<std::string, std::string>, std::string> known;
     auto& uuid = known[{kind, name}];
     if (uuid.empty()) {
-        uuid = run(
-            {"/usr/bin/python3", "-B", "-S", "-c",
-             "import sys; sys.path.insert(0, sys.argv[1]); import names; print(names.uuid_of(*sys.argv[2:]), end='')",
-             SOURCE_DIR "/demo/sample", kind, name});
+        const char* const program =
+            "import sys; sys.path.insert(0, sys.argv[1]); import names; print(names.uuid_of(*sys.argv[2:]), end='')";
+        uuid = run({"/usr/bin/python3", "-B", "-S", "-c", program, SOURCE_DIR "/demo/sample", kind, name});
     }
     return uuid;
 }

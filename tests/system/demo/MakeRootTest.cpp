@@ -1,16 +1,17 @@
+#include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 
 #include <algorithm>
-#include <cstdlib>
 #include <filesystem>
-#include <set>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/wait.h>
 
 namespace {
 
+using adminhost::test::Errors;
+using adminhost::test::ProgramResult;
+using adminhost::test::runProgram;
 using adminhost::test::SampleRoot;
 using adminhost::test::SampleSizes;
 using testing::HasSubstr;
@@ -18,12 +19,11 @@ namespace fs = std::filesystem;
 
 // What Python's own property-list reader, an independent one, says of a file: the text form of the value.
 std::string plistText(const SampleRoot& root, const std::string& hostPath) {
-    const std::string output = root.directory() + "/plist.txt";
-    const std::string command =
-        "/usr/bin/python3 -S -c 'import plistlib, sys; print(plistlib.load(open(sys.argv[1], \"rb\")), end=\"\")' '" +
-        root.disk(hostPath) + "' >'" + output + "'";
-    EXPECT_EQ(std::system(command.c_str()), 0) << hostPath;
-    return root.read("/../plist.txt");
+    const ProgramResult result = runProgram(
+        {"/usr/bin/python3", "-S", "-c", "import plistlib, sys; print(plistlib.load(open(sys.argv[1], 'rb')), end='')",
+         root.disk(hostPath)});
+    EXPECT_EQ(result.status, 0) << hostPath;
+    return result.output;
 }
 
 TEST(MakeRoot, SettingsFilesAreProperyListsAtTheirPlaces) {
@@ -80,12 +80,10 @@ TEST(MakeRoot, FortyJobsOfWhichSomeRunAndSomeNeverReachedTheGrid) {
 TEST(MakeRoot, ProtectedPropertyIsWhatTheCipherToolDeciphers) {
     const SampleRoot root;
     root.write("/../cipher.txt", root.sql("select value from properties where name = 'mail_password'"));
-    const std::string command =
-        "openssl enc -d -a -aes-128-cbc -K 6c756d696f2d73616d706c652d6b6579 -iv 4c756d696f50726f7065727479495631 -in "
-        "'" +
-        root.directory() + "/cipher.txt' -out '" + root.directory() + "/plain.txt'";
-    ASSERT_EQ(std::system(command.c_str()), 0);
-    EXPECT_EQ(root.read("/../plain.txt"), "correct horse battery staple, and a good deal more than one line of text");
+    const ProgramResult plain =
+        runProgram({"openssl", "enc", "-d", "-a", "-aes-128-cbc", "-K", "6c756d696f2d73616d706c652d6b6579", "-iv",
+                    "4c756d696f50726f7065727479495631", "-in", root.directory() + "/cipher.txt"});
+    EXPECT_EQ(plain.output, "correct horse battery staple, and a good deal more than one line of text");
     EXPECT_EQ(root.sql("select count(*) from properties where protect = 't'"), "3\n");
     EXPECT_EQ(root.sql("select instr(value, char(10)) from properties where name = 'mail_password'"), "77\n");
 }
@@ -132,17 +130,15 @@ TEST(MakeRoot, SizesSetTheNumberOfRows) {
 TEST(MakeRoot, TheSameSizesMakeTheSameFiles) {
     const SampleRoot one;
     const SampleRoot other;
-    const std::string command = "diff -r --no-dereference '" + one.path() + "' '" + other.path() + "'";
-    EXPECT_EQ(std::system(command.c_str()), 0);
+    const ProgramResult difference = runProgram({"diff", "-r", "--no-dereference", one.path(), other.path()});
+    EXPECT_EQ(difference.status, 0) << difference.output;
 }
 
 TEST(MakeRoot, RefusesADirectoryThatIsNotEmpty) {
     const SampleRoot root;
-    const std::string command =
-        SOURCE_DIR "/demo/make-root '" + root.path() + "' 2>'" + root.directory() + "/error.txt'";
-    const int status = std::system(command.c_str());
-    EXPECT_EQ(WEXITSTATUS(status), 2);
-    EXPECT_THAT(root.read("/../error.txt"), HasSubstr("is not empty"));
+    const ProgramResult result = runProgram({SOURCE_DIR "/demo/make-root", root.path()}, Errors::merge);
+    EXPECT_EQ(result.status, 2);
+    EXPECT_THAT(result.output, HasSubstr("is not empty"));
 }
 
 TEST(MakeRoot, RemovesItsDirectoryAtTheEnd) {

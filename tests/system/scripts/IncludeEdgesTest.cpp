@@ -1,21 +1,19 @@
+#include "tests/support/Program.h"
+
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
 #include <string>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/wait.h>
 
 namespace {
 
+using adminhost::test::Errors;
+using adminhost::test::ProgramResult;
+using adminhost::test::runProgram;
 namespace fs = std::filesystem;
-
-struct Result {
-    int status;
-    std::string output;
-};
 
 // A tree of one source file with one include, and what the script says of it.
 class IncludeEdges : public testing::Test {
@@ -26,17 +24,11 @@ class IncludeEdges : public testing::Test {
     }
     ~IncludeEdges() override { fs::remove_all(_tree); }
 
-    Result check(const std::string& root) {
-        const std::string output = _tree + "/output.txt";
-        const std::string command =
-            "/usr/bin/python3 -B " SOURCE_DIR "/scripts/include_edges.py '" + root + "' >'" + output + "' 2>&1";
-        const int status = std::system(command.c_str());
-        std::ostringstream text;
-        text << std::ifstream(output).rdbuf();
-        return {WEXITSTATUS(status), text.str()};
+    static ProgramResult check(const std::string& root) {
+        return runProgram({"/usr/bin/python3", "-B", SOURCE_DIR "/scripts/include_edges.py", root}, Errors::merge);
     }
 
-    Result checkEdge(const std::string& source, const std::string& included) {
+    ProgramResult checkEdge(const std::string& source, const std::string& included) {
         fs::remove_all(_tree + "/tree");
         const fs::path file = _tree + "/tree/" + source;
         fs::create_directories(file.parent_path());
@@ -48,7 +40,7 @@ class IncludeEdges : public testing::Test {
 };
 
 TEST_F(IncludeEdges, TheProjectHasOnlyThoseOfThePicture) {
-    const Result result = check(SOURCE_DIR);
+    const ProgramResult result = check(SOURCE_DIR);
     EXPECT_EQ(result.status, 0) << result.output;
 }
 
@@ -68,7 +60,7 @@ TEST_F(IncludeEdges, EachRefusedEdgeIsNamedWithFileAndLine) {
         {"handler/ReadSettings.cpp", "plugin/Plugin.h"},
     };
     for (const auto& [source, included] : edges) {
-        const Result result = checkEdge(source, included);
+        const ProgramResult result = checkEdge(source, included);
         EXPECT_EQ(result.status, 1) << source << " -> " << included;
         EXPECT_THAT(result.output, testing::StartsWith(std::string(source) + ":2: " + included + ": "));
     }
@@ -86,13 +78,13 @@ TEST_F(IncludeEdges, EdgesOfThePictureAreAccepted) {
         {"tests/unit/x/Test.cpp", "plugin/Plugin.h"},
     };
     for (const auto& [source, included] : edges) {
-        const Result result = checkEdge(source, included);
+        const ProgramResult result = checkEdge(source, included);
         EXPECT_EQ(result.status, 0) << source << " -> " << included << ": " << result.output;
     }
 }
 
 TEST_F(IncludeEdges, ARoomThatThePictureDoesNotHaveIsRefused) {
-    const Result result = checkEdge("utilities/Everything.cpp", "platform/value/Value.h");
+    const ProgramResult result = checkEdge("utilities/Everything.cpp", "platform/value/Value.h");
     EXPECT_EQ(result.status, 1);
     EXPECT_THAT(result.output, testing::HasSubstr("a room that the picture does not have"));
 }

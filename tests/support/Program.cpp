@@ -1,0 +1,54 @@
+#include "tests/support/Program.h"
+
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <stdexcept>
+#include <system_error>
+
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace adminhost::test {
+
+ProgramResult runProgram(const std::vector<std::string>& command, Errors errors) {
+    std::array<int, 2> pipe{};
+    if (::pipe2(pipe.data(), O_CLOEXEC) != 0) {
+        throw std::system_error(errno, std::generic_category(), "pipe");
+    }
+    posix_spawn_file_actions_t actions{};
+    ::posix_spawn_file_actions_init(&actions);
+    ::posix_spawn_file_actions_adddup2(&actions, pipe[1], STDOUT_FILENO);
+    if (errors == Errors::merge) {
+        ::posix_spawn_file_actions_adddup2(&actions, pipe[1], STDERR_FILENO);
+    }
+    std::vector<char*> arguments;
+    arguments.reserve(command.size() + 1);
+    for (const auto& argument : command) {
+        arguments.push_back(const_cast<char*>(argument.c_str()));
+    }
+    arguments.push_back(nullptr);
+    pid_t child = -1;
+    const int failure = ::posix_spawnp(&child, arguments[0], &actions, nullptr, arguments.data(), environ);
+    ::posix_spawn_file_actions_destroy(&actions);
+    ::close(pipe[1]);
+    ProgramResult result;
+    std::array<char, 65536> piece{};
+    for (ssize_t count = 0; failure == 0 && (count = ::read(pipe[0], piece.data(), piece.size())) > 0;) {
+        result.output.append(piece.data(), static_cast<std::size_t>(count));
+    }
+    ::close(pipe[0]);
+    if (failure != 0) {
+        throw std::runtime_error("cannot start " + command[0] + ": " + std::strerror(failure));
+    }
+    int status = 0;
+    if (::waitpid(child, &status, 0) != child) {
+        throw std::system_error(errno, std::generic_category(), "waitpid");
+    }
+    result.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    return result;
+}
+
+}  // namespace adminhost::test

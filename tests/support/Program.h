@@ -1,0 +1,21 @@
+#pragma once
+
+// Runs a program of the test's own environment to its end, without a shell. Independent of what is tested.
+
+#include <string>
+#include <vector>
+
+namespace adminhost::test {
+
+struct ProgramResult {
+    int status = 0;  ///< exit status; 128 + number after a death by signal
+    std::string output;
+};
+
+enum class Errors { pass, merge };  ///< standard error: to the test's own, or into the output
+
+/// command[0] is looked up in PATH unless it has a slash. Waits for the end of the output as well as the program's.
+/// Throws std::runtime_error when it cannot be started.
+[[nodiscard]] ProgramResult runProgram(const std::vector<std::string>& command, Errors errors = Errors::pass);
+
+}  // namespace adminhost::test
