@@ -1,0 +1,277 @@
+#include "handler/LumioRequestHandler.h"
+#include "tests/support/TemporaryRoot.h"
+
+#include <filesystem>
+
+#include <gtest/gtest.h>
+
+namespace lumio {
+namespace {
+
+using adminhost::Dictionary;
+using adminhost::Response;
+using adminhost::Value;
+
+constexpr std::string_view script = "/usr/share/sorvaneproducer/lumioserverd/script/setup_lumioserverd_preferences";
+constexpr std::string_view database = "/shared/Server/db.sqlite3";
+
+class ReadSettings : public testing::Test {
+  protected:
+    void SetUp() override { root.writeTool(script, "#!/bin/sh\nexit 0\n"); }
+
+    void writeSettings() const {
+        root.writePropertyList("/Library/Preferences/com.brenn.lumioserverd.plist",
+                               "<key>shared_filesystem</key><string>/shared</string>"
+                               "<key>member_uuid</key><string>M</string><key>private</key><true/>");
+        root.writePropertyList(
+            "/shared/lumioserverd.plist",
+            "<key>library_version</key><integer>7</integer><key>server_uuid</key><string>S</string>");
+        writeMember("<key>server_host</key><string>mediahost</string><key>server_port</key><string>8170</string>");
+        root.writePropertyList("/shared/Server/cluster_preferences.plist",
+                               "<key>nimbo_controller</key><string>grid.example</string><key>unknown</key><true/>");
+    }
+    void writeMember(std::string_view content) const {
+        root.writePropertyList("/shared/Server/member_preferences_M.plist", content);
+    }
+    void writeDatabase() const {
+        root.sql(
+            database,
+            "create table cameras(id integer primary key,name,uuid,create_user_uuid,created_at,update_user_uuid,"
+            "updated_at,last_recording_uuid,use_user_uuid,used_at,recording_status,access_control_enabled,disabled);"
+            "insert into cameras(name,uuid,recording_status) values('Aula','C-1','offline');");
+    }
+    Dictionary read(std::optional<std::string_view> variant = std::nullopt) {
+        Dictionary request;
+        if (variant) {
+            request.set("optionalArguments", Dictionary{{"variant", *variant}});
+        }
+        response = handler.readSettingsWithRequest(request);
+        EXPECT_EQ(response.kind(), Response::Kind::dictionary);
+        const Dictionary* config = response.dictionary().get("configuration").dictionary();
+        return config == nullptr ? Dictionary{} : *config;
+    }
+    [[nodiscard]] std::string catalogFor(std::string_view port) {
+        writeMember("<key>server_host</key><string>h</string><key>server_port</key>" + std::string(port));
+        return *read("getConfig").get("catalog_url").string();
+    }
+
+    adminhost::test::TemporaryRoot root;
+    LumioRequestHandler handler;
+    Response response;
+};
+
+TEST_F(ReadSettings, WithoutSettingsFilesAndDatabaseAnswersOnlyTheDefaultSharedFilesystem) {
+    EXPECT_EQ(read(), (Dictionary{{"default_shared_filesystem", "/Library/SorvaneProducer/Shared"}}));
+    EXPECT_EQ(response.dictionary().get("readStatus"), Value(0));
+    EXPECT_EQ(response.dictionary().size(), 2U);
+}
+
+TEST_F(ReadSettings, ReadStatusIsThePreferencesScriptsStatusAndTheConfigurationIsGatheredAllTheSame) {
+    writeSettings();
+    root.writeTool(script, "#!/bin/sh\nexit 9\n");
+    EXPECT_EQ(read().get("member_uuid"), Value("M"));
+    EXPECT_EQ(response.dictionary().get("readStatus"), Value(9));
+}
+
+TEST_F(ReadSettings, ScriptThatIsMissingIsAStatusOfMinusOne) {
+    std::filesystem::remove(root.path(script));
+    (void)read();
+    EXPECT_EQ(response.dictionary().get("readStatus"), Value(-1));
+}
+
+TEST_F(ReadSettings, ScriptRunsBeforeAnythingIsGatheredAlsoForANarrowedRead) {
+    root.writeTool(script, "#!/bin/sh\necho run >> " + root.path("/runs").string() + "\n");
+    (void)read();
+    (void)read("getCameras");
+    (void)read("nonsense");
+    EXPECT_EQ(root.read("/runs"), "run\nrun\nrun\n");
+}
+
+TEST_F(ReadSettings, SettingsThatTheScriptWritesAreSeenByTheSameRead) {
+    writeSettings();
+    std::filesystem::rename(root.path("/Library/Preferences/com.brenn.lumioserverd.plist"), root.path("/saved.plist"));
+    root.writeTool(script, "#!/bin/sh\nmv " + root.path("/saved.plist").string() + " " +
+                               root.path("/Library/Preferences/com.brenn.lumioserverd.plist").string() + "\n");
+    EXPECT_EQ(read().get("member_uuid"), Value("M"));
+}
+
+TEST_F(ReadSettings, CopiesTheKeysOfTheTablesAndNoOthersInTheirOrder) {
+    writeSettings();
+    const Dictionary config = read("getConfig");
+    std::vector<std::string> keys;
+    for (const auto& entry : config) {
+        if (entry.key != "nimbo_client_password_is_set") {
+            keys.push_back(entry.key);
+        }
+    }
+    EXPECT_EQ(keys, (std::vector<std::string>{"default_shared_filesystem", "member_uuid", "shared_filesystem",
+                                              "nimbo_controller", "server_host", "server_port", "web_app_url",
+                                              "catalog_url", "library_version", "server_uuid"}));
+    EXPECT_EQ(config.get("library_version"), Value(7));
+}
+
+TEST_F(ReadSettings, KeyThatTheFileLacksIsAbsent) {
+    writeSettings();
+    EXPECT_FALSE(read().contains("tunnel_agent_host"));
+}
+
+TEST_F(ReadSettings, UrlsAreBuiltFromHostAndPortTexts) {
+    writeSettings();
+    const Dictionary config = read();
+    EXPECT_EQ(config.get("web_app_url"), Value("https://mediahost:8170/sorvaneproducer/capture"));
+    EXPECT_EQ(config.get("catalog_url"), Value("http://mediahost:8171/sorvaneproducer/catalogs"));
+}
+
+TEST_F(ReadSettings, UrlsNeedBothHostAndPort) {
+    writeSettings();
+    writeMember("<key>server_host</key><string>h</string>");
+    EXPECT_FALSE(read().contains("web_app_url"));
+    writeMember("<key>server_port</key><integer>1</integer>");
+    EXPECT_FALSE(read().contains("catalog_url"));
+}
+
+TEST_F(ReadSettings, PortThatIsNotNumericGivesACatalogPortOfOne) {
+    writeSettings();
+    EXPECT_EQ(catalogFor("<string>http</string>"), "http://h:1/sorvaneproducer/catalogs");
+}
+
+TEST_F(ReadSettings, CatalogPortReadsEveryKindOfPort) {
+    writeSettings();
+    EXPECT_EQ(catalogFor("<integer>8170</integer>"), "http://h:8171/sorvaneproducer/catalogs");
+    EXPECT_EQ(catalogFor("<string> \t+80x</string>"), "http://h:81/sorvaneproducer/catalogs");
+    EXPECT_EQ(catalogFor("<string>-5</string>"), "http://h:-4/sorvaneproducer/catalogs");
+    EXPECT_EQ(catalogFor("<real>80.9</real>"), "http://h:81/sorvaneproducer/catalogs");
+    EXPECT_EQ(catalogFor("<true/>"), "http://h:2/sorvaneproducer/catalogs");
+    EXPECT_EQ(catalogFor("<array/>"), "http://h:1/sorvaneproducer/catalogs");
+}
+
+TEST_F(ReadSettings, CatalogPortIsClampedTo32BitsAndWraps) {
+    writeSettings();
+    const std::string wrapped = "http://h:-2147483648/sorvaneproducer/catalogs";
+    EXPECT_EQ(catalogFor("<string>2147483647</string>"), wrapped);
+    EXPECT_EQ(catalogFor("<string>99999999999999999999</string>"), wrapped);
+    EXPECT_EQ(catalogFor("<integer>18446744073709551615</integer>"), wrapped);
+    EXPECT_EQ(catalogFor("<real>1e300</real>"), wrapped);
+    EXPECT_EQ(catalogFor("<string>-99999999999999999999</string>"), "http://h:-2147483647/sorvaneproducer/catalogs");
+    EXPECT_EQ(catalogFor("<real>nan</real>"), "http://h:1/sorvaneproducer/catalogs");
+}
+
+TEST_F(ReadSettings, WebAddressShowsTheNumberOfAPort) {
+    writeSettings();
+    writeMember("<key>server_host</key><string>h</string><key>server_port</key><integer>443</integer>");
+    EXPECT_EQ(read().get("web_app_url"), Value("https://h:443/sorvaneproducer/capture"));
+}
+
+TEST_F(ReadSettings, WithoutVariantAddsSettingsAndCameras) {
+    writeSettings();
+    writeDatabase();
+    const Dictionary config = read();
+    EXPECT_TRUE(config.contains("member_uuid"));
+    ASSERT_NE(config.get("cameras").array(), nullptr);
+    EXPECT_EQ(config.get("cameras").array()->size(), 1U);
+}
+
+TEST_F(ReadSettings, VariantGetCamerasAnswersOnlyTheCameras) {
+    writeSettings();
+    writeDatabase();
+    const Dictionary config = read("getCameras");
+    EXPECT_EQ(config.size(), 2U);
+    EXPECT_TRUE(config.contains("cameras"));
+    EXPECT_TRUE(config.contains("default_shared_filesystem"));
+}
+
+TEST_F(ReadSettings, VariantGetConfigHasNeitherCamerasNorWorkflows) {
+    writeSettings();
+    writeDatabase();
+    const Dictionary config = read("getConfig");
+    EXPECT_TRUE(config.contains("member_uuid"));
+    EXPECT_FALSE(config.contains("cameras"));
+    EXPECT_FALSE(config.contains("workflows"));
+}
+
+TEST_F(ReadSettings, VariantsAreExactAndCaseSensitive) {
+    writeSettings();
+    writeDatabase();
+    EXPECT_EQ(read("getcameras").size(), 1U);
+    EXPECT_EQ(read("").size(), 1U);
+    EXPECT_EQ(read("getConfig ").size(), 1U);
+}
+
+TEST_F(ReadSettings, VariantThatIsNoTextAnswersNothingBeyondTheDefault) {
+    writeSettings();
+    response = handler.readSettingsWithRequest(Dictionary{{"optionalArguments", Dictionary{{"variant", 1}}}});
+    EXPECT_EQ(response.dictionary().get("configuration").dictionary()->size(), 1U);
+}
+
+TEST_F(ReadSettings, OptionalArgumentsThatAreNoDictionaryReadAsNoVariant) {
+    writeSettings();
+    response = handler.readSettingsWithRequest(Dictionary{{"optionalArguments", "getCameras"}});
+    EXPECT_TRUE(response.dictionary().get("configuration").dictionary()->contains("member_uuid"));
+}
+
+TEST_F(ReadSettings, WithoutDatabaseTheListVariantsAnswerOnlyTheDefaultAndMakeNoDatabaseFile) {
+    writeSettings();
+    root.writeTool(script, "#!/bin/sh\nexit 4\n");
+    for (const char* variant : {"getCameras", "getWorkflows", "getProperties"}) {
+        EXPECT_EQ(read(variant).size(), 1U) << variant;
+        EXPECT_EQ(response.dictionary().get("readStatus"), Value(4));
+    }
+    (void)read();
+    EXPECT_FALSE(std::filesystem::exists(root.path(database)));
+}
+
+TEST_F(ReadSettings, FailedListingAddsNothingAndDoesNotReachReadStatus) {
+    writeSettings();
+    root.write(database, "this is no database, but long enough to be looked at as one");
+    const Dictionary config = read();
+    EXPECT_FALSE(config.contains("cameras"));
+    EXPECT_TRUE(config.contains("member_uuid"));
+    EXPECT_EQ(response.dictionary().get("readStatus"), Value(0));
+}
+
+TEST_F(ReadSettings, SettingsFileThatCannotBeLoadedAddsNothing) {
+    writeSettings();
+    writeMember("<key>broken");
+    const Dictionary config = read();
+    EXPECT_FALSE(config.contains("server_host"));
+    EXPECT_TRUE(config.contains("library_version"));
+}
+
+TEST_F(ReadSettings, KeyTablesAreAsTheFilesKnowThem) {
+    EXPECT_EQ(LumioRequestHandler::identityPreferencesKeysToCopy().size(), 2U);
+    EXPECT_EQ(LumioRequestHandler::libraryInformationKeysToCopy().size(), 2U);
+    EXPECT_EQ(LumioRequestHandler::memberPreferencesKeysToCopy().size(), 12U);
+    EXPECT_EQ(LumioRequestHandler::clusterPreferencesKeysToCopy().size(), 13U);
+    EXPECT_EQ(LumioRequestHandler::memberPreferencesKeysToCopy().back(), "tunnel_timeout_seconds");
+    EXPECT_EQ(LumioRequestHandler::clusterPreferencesKeysToCopy().back(), "nimbo_grid_id");
+}
+
+TEST_F(ReadSettings, CopyKeysReplacesWhatTheSourceHasAndLeavesTheRest) {
+    Dictionary destination{{"a", 1}, {"b", 2}};
+    LumioRequestHandler::copyKeys({"a", "b", "c"}, Dictionary{{"a", "new"}, {"c", 3}, {"d", 4}}, destination);
+    EXPECT_EQ(destination, (Dictionary{{"a", "new"}, {"b", 2}, {"c", 3}}));
+}
+
+TEST_F(ReadSettings, SetupScriptThatLeavesADaemonHoldingItsPipesDoesNotHoldTheAnswer) {
+    root.writeTool(script, "#!/bin/sh\nsleep 60 &\necho $! > " + root.path("/pid").string() + "\nexit 0\n");
+    (void)read();
+    EXPECT_EQ(response.dictionary().get("readStatus"), Value(0));
+    const pid_t daemon = std::stoi(root.read("/pid"));
+    EXPECT_EQ(::kill(daemon, 0), 0) << "the daemon lives on";
+    ::kill(daemon, SIGKILL);
+}
+
+TEST(RequestHandler, RecycleServiceAnswersNothingWhateverTheVariant) {
+    LumioRequestHandler handler;
+    EXPECT_EQ(handler.recycleServiceWithVariant(nullptr).kind(), Response::Kind::nothing);
+    EXPECT_EQ(handler.recycleServiceWithVariant("withDetails").kind(), Response::Kind::nothing);
+    EXPECT_EQ(handler.recycleServiceWithVariant(Dictionary{{"a", 1}}).kind(), Response::Kind::nothing);
+}
+
+TEST(RequestHandler, ResourceDateKeysAreThree) {
+    EXPECT_EQ(LumioRequestHandler::listOfResourceDateKeys(),
+              (std::vector<std::string_view>{"updated_at", "created_at", "used_at"}));
+}
+
+}  // namespace
+}  // namespace lumio
