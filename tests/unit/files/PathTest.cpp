@@ -1,0 +1,85 @@
+#include "platform/files/Path.h"
+
+#include <filesystem>
+#include <string>
+
+#include <gtest/gtest.h>
+#include <stdlib.h>
+#include <unistd.h>
+
+namespace {
+
+using namespace adminhost;
+
+class Path : public testing::Test {
+  protected:
+    void TearDown() override { setSystemRoot("/"); }
+};
+
+TEST_F(Path, RootIsTheDisksAtFirst) {
+    EXPECT_EQ(systemRoot(), "/");
+    EXPECT_EQ(diskPath(HostPath("/var/lumio")).text(), "/var/lumio");
+}
+
+TEST_F(Path, AbsoluteHostPathLiesBelowTheRoot) {
+    setSystemRoot("/srv/root");
+    EXPECT_EQ(diskPath(HostPath("/var/lumio")).text(), "/srv/root/var/lumio");
+    EXPECT_EQ(diskPath(HostPath("/")).text(), "/srv/root/");
+}
+
+TEST_F(Path, RelativeHostPathStaysAsItIs) {
+    setSystemRoot("/srv/root");
+    EXPECT_EQ(diskPath(HostPath("db/prod.sqlite3")).text(), "db/prod.sqlite3");
+    EXPECT_EQ(diskPath(HostPath("")).text(), "");
+}
+
+TEST_F(Path, TrailingSlashesOfTheRootAreDropped) {
+    setSystemRoot("/srv/root//");
+    EXPECT_EQ(systemRoot(), "/srv/root");
+    EXPECT_EQ(diskPath(HostPath("/a")).text(), "/srv/root/a");
+}
+
+TEST_F(Path, RootOfNothingButSlashesIsTheDisks) {
+    for (const char* root : {"/", "//", ""}) {
+        setSystemRoot(root);
+        EXPECT_EQ(systemRoot(), "/");
+        EXPECT_EQ(diskPath(HostPath("/a")).text(), "/a");
+    }
+}
+
+TEST_F(Path, PathsAreNotNormalised) {
+    setSystemRoot("/srv/root");
+    EXPECT_EQ(diskPath(HostPath("/a//b/../c/")).text(), "/srv/root/a//b/../c/");
+}
+
+TEST_F(Path, HostPathIsTheWayBack) {
+    setSystemRoot("/srv/root");
+    EXPECT_EQ(hostPath(DiskPath("/srv/root/var/lumio")).text(), "/var/lumio");
+    EXPECT_EQ(hostPath(DiskPath("/srv/rooted/x")).text(), "/srv/rooted/x");
+    EXPECT_EQ(hostPath(DiskPath("/srv/root")).text(), "/srv/root");
+    EXPECT_EQ(hostPath(DiskPath("/etc/passwd")).text(), "/etc/passwd");
+    EXPECT_EQ(hostPath(DiskPath("db/x")).text(), "db/x");
+    setSystemRoot("/");
+    EXPECT_EQ(hostPath(DiskPath("/etc/passwd")).text(), "/etc/passwd");
+}
+
+TEST_F(Path, ExistsFollowsLinks) {
+    std::string place = std::filesystem::temp_directory_path() / "path-XXXXXX";
+    ASSERT_NE(::mkdtemp(place.data()), nullptr);
+    ASSERT_EQ(::symlink("missing", (place + "/link").c_str()), 0);
+    EXPECT_TRUE(exists(DiskPath(place)));
+    EXPECT_FALSE(exists(DiskPath(place + "/missing")));
+    EXPECT_FALSE(exists(DiskPath(place + "/link")));
+    EXPECT_FALSE(exists(DiskPath("")));
+    std::filesystem::create_directory(place + "/missing");
+    EXPECT_TRUE(exists(DiskPath(place + "/link")));
+    std::filesystem::remove_all(place);
+}
+
+TEST_F(Path, PathsCompareAsTheirTexts) {
+    EXPECT_EQ(HostPath("/a"), HostPath("/a"));
+    EXPECT_NE(HostPath("/a"), HostPath("/a/"));
+    EXPECT_LT(DiskPath("/a"), DiskPath("/b"));
+}
+
+}  // namespace

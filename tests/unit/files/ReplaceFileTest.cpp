@@ -1,0 +1,372 @@
+#include "platform/files/Directory.h"
+#include "platform/files/ReplaceFile.h"
+
+#include <cerrno>
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <regex>
+#include <set>
+#include <string>
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/file.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <sys/xattr.h>
+#include <unistd.h>
+
+namespace {
+
+using namespace adminhost;
+namespace fs = std::filesystem;
+using testing::ElementsAre;
+using testing::UnorderedElementsAre;
+
+class ReplaceFile : public testing::Test {
+  protected:
+    void SetUp() override {
+        std::string place = fs::temp_directory_path() / "replace-XXXXXX";
+        ASSERT_NE(::mkdtemp(place.data()), nullptr);
+        _dir = place;
+    }
+    void TearDown() override {
+        setSystemRoot("/");
+        fs::remove_all(_dir);
+    }
+
+    [[nodiscard]] std::string path(const std::string& name = "file") const { return _dir / name; }
+    void write(const std::string& name, const std::string& bytes, mode_t mode = 0644) const {
+        std::ofstream(path(name)) << bytes;
+        ASSERT_EQ(::chmod(path(name).c_str(), mode), 0);
+    }
+    [[nodiscard]] std::string read(const std::string& name = "file") const {
+        std::ifstream file(path(name));
+        return {std::istreambuf_iterator<char>(file), {}};
+    }
+    [[nodiscard]] struct stat statusOf(const std::string& name = "file") const {
+        struct stat status {};
+        EXPECT_EQ(::lstat(path(name).c_str(), &status), 0);
+        return status;
+    }
+    [[nodiscard]] mode_t modeOf(const std::string& name = "file") const { return statusOf(name).st_mode & 07777U; }
+    [[nodiscard]] std::set<std::string> names() const {
+        std::set<std::string> all;
+        for (const auto& entry : fs::directory_iterator(_dir)) {
+            all.insert(entry.path().filename());
+        }
+        return all;
+    }
+    [[nodiscard]] std::optional<Error> replace(std::string_view bytes, const std::string& name = "file") const {
+        return replaceFile(bytes, HostPath(path(name)));
+    }
+    static std::string attribute(const std::string& path, const char* name) {
+        char value[256];
+        const ssize_t size = ::getxattr(path.c_str(), name, value, sizeof value);
+        return size < 0 ? std::string("none") : std::string(value, static_cast<std::size_t>(size));
+    }
+
+    fs::path _dir;
+    const std::string _leftover = ".file.adminhost-0123456789abcdef";
+};
+
+TEST_F(ReplaceFile, NewFileIs0644WhateverTheUmask) {
+    const mode_t before = ::umask(077);
+    EXPECT_EQ(replace("bytes"), std::nullopt);
+    ::umask(before);
+    EXPECT_EQ(read(), "bytes");
+    EXPECT_EQ(modeOf(), 0644U);
+    EXPECT_THAT(names(), ElementsAre("file"));
+}
+
+TEST_F(ReplaceFile, ModeOfTheOldFileIsKept) {
+    for (const mode_t mode : {0600U, 0640U, 0666U, 0755U, 0444U}) {
+        fs::remove(path());
+        write("file", "old", mode);
+        EXPECT_EQ(replace("new"), std::nullopt);
+        EXPECT_EQ(read(), "new");
+        EXPECT_EQ(modeOf(), mode);
+    }
+}
+
+TEST_F(ReplaceFile, OwnerOfTheOldFileIsKept) {
+    write("file", "old", 0640);
+    // Only the superuser may give files away; another user's file keeps the owner that it has.
+    const bool given = ::chown(path().c_str(), 33, 44) == 0;
+    const struct stat before = statusOf();
+    EXPECT_EQ(before.st_uid, given ? 33 : ::geteuid());
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_EQ(statusOf().st_uid, before.st_uid);
+    EXPECT_EQ(statusOf().st_gid, before.st_gid);
+    EXPECT_EQ(modeOf(), 0640U);
+    EXPECT_NE(statusOf().st_ino, before.st_ino);
+}
+
+TEST_F(ReplaceFile, ExtendedAttributesAreKept) {
+    write("file", "old");
+    ASSERT_EQ(::setxattr(path().c_str(), "user.note", "kept\0x", 6, 0), 0) << "needs a file system with attributes";
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_EQ(attribute(path(), "user.note"), std::string("kept\0x", 6));
+    EXPECT_EQ(read(), "new");
+}
+
+/// The binary form of: user::rw-, user:33:r--, group::---, mask::r--, other::---
+const std::string accessListBytes(
+    "\2\0\0\0"
+    "\1\0\6\0\xFF\xFF\xFF\xFF"
+    "\2\0\4\0\x21\0\0\0"
+    "\4\0\0\0\xFF\xFF\xFF\xFF"
+    "\x10\0\4\0\xFF\xFF\xFF\xFF"
+    "\x20\0\0\0\xFF\xFF\xFF\xFF",
+    44);
+
+TEST_F(ReplaceFile, AccessControlListIsKept) {
+    write("file", "old", 0600);
+    ASSERT_EQ(::setxattr(path().c_str(), "system.posix_acl_access", accessListBytes.data(), accessListBytes.size(), 0),
+              0)
+        << "needs a file system with access control lists";
+    const mode_t mode = modeOf();
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_EQ(attribute(path(), "system.posix_acl_access"), accessListBytes);
+    EXPECT_EQ(modeOf(), mode);
+}
+
+TEST_F(ReplaceFile, ListThatTheDirectoryGivesNewFilesDoesNotReachAFileWithoutOne) {
+    write("file", "old", 0640);
+    ASSERT_EQ(::setxattr(_dir.c_str(), "system.posix_acl_default", accessListBytes.data(), accessListBytes.size(), 0),
+              0)
+        << "needs a file system with access control lists";
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_EQ(attribute(path(), "system.posix_acl_access"), "none");
+    EXPECT_EQ(modeOf(), 0640U);
+}
+
+TEST_F(ReplaceFile, LinkInTheFilesPlaceIsReplacedAndItsTargetUntouched) {
+    write("target", "target", 0600);
+    fs::create_symlink("target", path());
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(S_ISREG(statusOf().st_mode));
+    EXPECT_EQ(modeOf(), 0644U);
+    EXPECT_EQ(read("target"), "target");
+    EXPECT_EQ(read(), "new");
+}
+
+TEST_F(ReplaceFile, OtherNamesOfTheFileKeepTheOldBytes) {
+    write("file", "old");
+    fs::create_hard_link(path(), path("other"));
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_EQ(read("other"), "old");
+}
+
+TEST_F(ReplaceFile, DirectoryInTheFilesPlaceIsAnError) {
+    fs::create_directory(path());
+    const auto error = replace("new");
+    ASSERT_TRUE(error);
+    EXPECT_EQ(*error, (Error{"posix", EISDIR, "cannot replace " + path() + ": Is a directory"}));
+    EXPECT_THAT(names(), ElementsAre("file"));
+}
+
+TEST_F(ReplaceFile, PipeInTheFilesPlaceIsAnErrorAndNotWaitedFor) {
+    ASSERT_EQ(::mkfifo(path().c_str(), 0600), 0);
+    const auto error = replace("new");
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->code, EINVAL);
+    EXPECT_THAT(names(), ElementsAre("file"));
+}
+
+TEST_F(ReplaceFile, MissingDirectoryIsAnErrorThatNamesTheHostPath) {
+    setSystemRoot(_dir);
+    const auto error = replaceFile("new", HostPath("/Server/cluster_preferences.plist"));
+    ASSERT_TRUE(error);
+    EXPECT_EQ(*error,
+              (Error{"posix", ENOENT,
+                     "cannot open the directory of /Server/cluster_preferences.plist: No such file or directory"}));
+}
+
+TEST_F(ReplaceFile, PathsThatNameNoFileAreErrors) {
+    for (const std::string bad : {"/", "", "/tmp/", "/tmp/..", "/tmp/."}) {
+        const auto error = replaceFile("x", HostPath(bad));
+        ASSERT_TRUE(error) << bad;
+        EXPECT_EQ(error->code, EINVAL) << bad;
+    }
+    EXPECT_TRUE(replaceFile("x", HostPath(std::string("/tmp/a\0b", 8))));
+}
+
+TEST_F(ReplaceFile, FileInTheDirectorysPlaceIsAnError) {
+    write("file", "old");
+    const auto error = replace("new", "file/name");
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->code, ENOTDIR);
+    EXPECT_EQ(read(), "old");
+}
+
+TEST_F(ReplaceFile, NameTooLongForItsTemporaryFileIsAnError) {
+    const auto error = replace("new", std::string(250, 'x'));
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->code, ENAMETOOLONG);
+    EXPECT_THAT(error->description.value_or(""), testing::StartsWith("cannot create temporary file for "));
+    EXPECT_TRUE(names().empty());
+}
+
+TEST_F(ReplaceFile, FullDiskLeavesTheOldFileAndNoTemporary) {
+    write("file", "old", 0600);
+    const pid_t pid = ::fork();
+    if (pid == 0) {  // a bound on the size of files cuts a write short as a full disk does
+        ::signal(SIGXFSZ, SIG_IGN);
+        const rlimit limit{100'000, 100'000};
+        ::setrlimit(RLIMIT_FSIZE, &limit);
+        const auto error = replace(std::string(1'000'000, 'x'));
+        const std::string expected = "cannot write temporary file for " + path() + ": File too large";
+        ::_exit(error && error->code == EFBIG && error->description == expected ? 0 : 1);
+    }
+    int status = -1;
+    ASSERT_EQ(::waitpid(pid, &status, 0), pid);
+    EXPECT_EQ(status, 0);
+    EXPECT_EQ(read(), "old");
+    EXPECT_THAT(names(), ElementsAre("file"));
+}
+
+TEST_F(ReplaceFile, LeftoversOfKilledWritersAreRemoved) {
+    write("file", "old");
+    write(_leftover, "half", 0600);
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_THAT(names(), ElementsAre("file"));
+}
+
+TEST_F(ReplaceFile, LeftoversOfOtherFilesAndLikeNamesStay) {
+    const std::set<std::string> others = {".other.adminhost-0123456789abcdef", ".file.adminhost-0123456789abcde",
+                                          ".file.adminhost-0123456789abcdeg", "file.adminhost-0123456789abcdef",
+                                          ".file.adminhost-0123456789abcdef0"};
+    for (const std::string& name : others) {
+        write(name, "x");
+    }
+    EXPECT_EQ(replace("new"), std::nullopt);
+    std::set<std::string> expected = others;
+    expected.insert("file");
+    EXPECT_EQ(names(), expected);
+}
+
+TEST_F(ReplaceFile, TemporaryFileOfALivingWriterStays) {
+    write(_leftover, "being written", 0600);
+    const int writer = ::open(path(_leftover).c_str(), O_WRONLY | O_CLOEXEC);
+    ASSERT_EQ(::flock(writer, LOCK_EX), 0);
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_THAT(names(), UnorderedElementsAre("file", _leftover));
+    ::close(writer);
+    EXPECT_EQ(replace("newer"), std::nullopt);
+    EXPECT_THAT(names(), ElementsAre("file"));
+}
+
+TEST_F(ReplaceFile, LinkNamedLikeALeftoverHarmsNothing) {
+    write("target", "target");
+    fs::create_symlink("target", path(_leftover));
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_EQ(read("target"), "target");
+}
+
+TEST_F(ReplaceFile, LinkOnTheWayIsFollowedWhereOnlyWeCanHavePutIt) {
+    fs::create_directory(path("real"));
+    fs::create_symlink("real", path("relative"));
+    fs::create_symlink(path("real"), path("absolute"));
+    EXPECT_EQ(replace("1", "relative/file"), std::nullopt);
+    EXPECT_EQ(read("real/file"), "1");
+    EXPECT_EQ(replace("2", "absolute/../real//./file"), std::nullopt);
+    EXPECT_EQ(read("real/file"), "2");
+}
+
+TEST_F(ReplaceFile, LinkOnTheWayInADirectoryThatOthersMayWriteIsRefused) {
+    fs::create_directory(path("shared"));
+    fs::create_directory(path("elsewhere"));
+    fs::create_symlink(path("elsewhere"), path("shared/Server"));
+    for (const mode_t mode : {0777U, 0775U, 01777U}) {
+        ASSERT_EQ(::chmod(path("shared").c_str(), mode), 0);
+        const auto error = replace("x", "shared/Server/file");
+        ASSERT_TRUE(error);
+        EXPECT_EQ(error->code, ELOOP);
+    }
+    EXPECT_TRUE(fs::is_empty(path("elsewhere")));
+    ASSERT_EQ(::chmod(path("shared").c_str(), 0755), 0);
+    EXPECT_EQ(replace("x", "shared/Server/file"), std::nullopt);
+}
+
+TEST_F(ReplaceFile, LinksInACircleAreAnError) {
+    fs::create_symlink("b", path("a"));
+    fs::create_symlink("a", path("b"));
+    const auto error = replace("x", "a/file");
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->code, ELOOP);
+}
+
+TEST_F(ReplaceFile, RelativePathIsBelowTheCurrentDirectory) {
+    const fs::path before = fs::current_path();
+    fs::current_path(_dir);
+    fs::create_directory("sub");
+    const auto plain = replaceFile("1", HostPath("file"));
+    const auto below = replaceFile("2", HostPath("sub/file"));
+    fs::current_path(before);
+    EXPECT_EQ(plain, std::nullopt);
+    EXPECT_EQ(below, std::nullopt);
+    EXPECT_EQ(read(), "1");
+    EXPECT_EQ(read("sub/file"), "2");
+}
+
+TEST_F(ReplaceFile, NoDescriptorIsLeft) {
+    const auto open = [] { return std::distance(fs::directory_iterator("/proc/self/fd"), fs::directory_iterator{}); };
+    const auto before = open();
+    EXPECT_EQ(replace("1"), std::nullopt);
+    EXPECT_EQ(replace("2"), std::nullopt);
+    EXPECT_TRUE(replace("3", "missing/file"));
+    EXPECT_TRUE(replace("3", "file/file"));
+    EXPECT_EQ(open(), before);
+}
+
+TEST_F(ReplaceFile, UnreadableFileIsKeptBesideUnderADatedNameAndStaysInPlace) {
+    write("file", "garbage", 0640);
+    const auto kept = keepUnreadable(HostPath(path()));
+    ASSERT_TRUE(kept);
+    EXPECT_THAT(kept->text(), testing::StartsWith(path() + ".unreadable-2"));
+    EXPECT_TRUE(
+        std::regex_match(kept->text().substr(path().size()), std::regex("\\.unreadable-\\d{4}-\\d{2}-\\d{2}T\\d{6}Z")));
+    EXPECT_EQ(read(fs::path(kept->text()).filename()), "garbage");
+    EXPECT_EQ(read(), "garbage");
+    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_EQ(modeOf(), 0640U);
+    EXPECT_EQ(read(fs::path(kept->text()).filename()), "garbage");
+}
+
+TEST_F(ReplaceFile, SeveralUnreadableFilesAreAllKept) {
+    std::set<std::string> kept;
+    for (int i = 0; i < 5; ++i) {
+        write("file", "garbage " + std::to_string(i));
+        const auto name = keepUnreadable(HostPath(path()));
+        ASSERT_TRUE(name);
+        kept.insert(name->text());
+        EXPECT_EQ(read(fs::path(name->text()).filename()), "garbage " + std::to_string(i));
+        fs::remove(path());
+    }
+    EXPECT_EQ(kept.size(), 5U);
+}
+
+TEST_F(ReplaceFile, UnreadableLinkIsKeptAsALink) {
+    fs::create_symlink("nowhere", path());
+    const auto kept = keepUnreadable(HostPath(path()));
+    ASSERT_TRUE(kept);
+    EXPECT_EQ(fs::read_symlink(kept->text()), "nowhere");
+}
+
+TEST_F(ReplaceFile, NothingOrADirectoryCannotBeKept) {
+    Error error;
+    EXPECT_FALSE(keepUnreadable(HostPath(path()), &error));
+    EXPECT_EQ(error, (Error{"posix", ENOENT, "cannot look at " + path() + ": No such file or directory"}));
+    fs::create_directory(path());
+    EXPECT_FALSE(keepUnreadable(HostPath(path()), &error));
+    EXPECT_EQ(error.code, EISDIR);
+    EXPECT_THAT(names(), ElementsAre("file"));
+}
+
+}  // namespace

@@ -1,0 +1,79 @@
+#include "platform/framework/PluginRequestHandler.h"
+
+#include <regex>
+#include <set>
+#include <string>
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using namespace adminhost;
+
+TEST(Response, IsNothingAtFirst) {
+    EXPECT_EQ(Response().kind(), Response::Kind::nothing);
+    EXPECT_EQ(Response(nullptr).kind(), Response::Kind::nothing);
+    EXPECT_TRUE(Response().dictionary().empty());
+}
+
+TEST(Response, CarriesItsDictionary) {
+    Response response(Dictionary{{"readStatus", 0}});
+    EXPECT_EQ(response.kind(), Response::Kind::dictionary);
+    response.dictionary().set("writeStatus", 400);
+    EXPECT_EQ(response.dictionary(), (Dictionary{{"readStatus", 0}, {"writeStatus", 400}}));
+}
+
+TEST(Response, EmptyDictionaryIsNotNothing) {
+    EXPECT_EQ(Response(Dictionary{}).kind(), Response::Kind::dictionary);
+}
+
+TEST(PluginRequestHandler, ErrorResponseHasCodeAndASentence) {
+    const PluginRequestHandler handler;
+    for (const char* code :
+         {"CANNOT_START_SERVICE_ERR", "CANNOT_STOP_SERVICE_ERR", "NOT_AVAILABLE", "INTERNAL_ERROR"}) {
+        const Response response = handler.responseForError(code);
+        EXPECT_EQ(response.kind(), Response::Kind::error);
+        EXPECT_EQ(response.dictionary().get("error"), Value(code));
+        ASSERT_NE(response.dictionary().get("message").string(), nullptr);
+        EXPECT_EQ(response.dictionary().get("message").string()->back(), '.');
+        EXPECT_EQ(response.dictionary().size(), 2U);
+    }
+}
+
+TEST(PluginRequestHandler, UnknownCodeIsKeptInItsErrorResponse) {
+    const Response response = PluginRequestHandler().responseForError("SOMETHING_ELSE");
+    EXPECT_EQ(response.kind(), Response::Kind::error);
+    EXPECT_EQ(response.dictionary(),
+              (Dictionary{{"error", "SOMETHING_ELSE"}, {"message", "The plug-in answered an error."}}));
+}
+
+TEST(UserDefaults, UnknownNameIsNull) {
+    EXPECT_TRUE(userDefault("adminhost.test.unknown").isNull());
+}
+
+TEST(UserDefaults, ValueIsKeptReplacedAndRemovedByNull) {
+    setUserDefault("adminhost.test.a", Array{1, "two"});
+    EXPECT_EQ(userDefault("adminhost.test.a"), Value(Array{1, "two"}));
+    setUserDefault("adminhost.test.a", true);
+    EXPECT_EQ(userDefault("adminhost.test.a"), Value(true));
+    setUserDefault("adminhost.test.a", nullptr);
+    EXPECT_TRUE(userDefault("adminhost.test.a").isNull());
+}
+
+TEST(UUIDString, IsCanonicalUpperCaseOfVersion4) {
+    const std::regex form("[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}");
+    for (int i = 0; i < 1000; ++i) {
+        const std::string text = makeUUIDString();
+        ASSERT_TRUE(std::regex_match(text, form)) << text;
+    }
+}
+
+TEST(UUIDString, IsFreshEachTime) {
+    std::set<std::string> all;
+    for (int i = 0; i < 10'000; ++i) {
+        all.insert(makeUUIDString());
+    }
+    EXPECT_EQ(all.size(), 10'000U);
+}
+
+}  // namespace
