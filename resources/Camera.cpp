@@ -1,6 +1,7 @@
 #include "resources/Camera.h"
 
 #include "platform/log/Log.h"
+#include "platform/task/Task.h"
 #include "platform/value/Text.h"
 
 #include <cstdlib>
@@ -32,6 +33,16 @@ std::optional<std::vector<std::unique_ptr<Camera>>> Camera::allCamerasWithError(
         "select id,name,uuid,create_user_uuid,created_at,update_user_uuid,updated_at,last_recording_uuid,use_user_uuid,"
         "used_at,recording_status,access_control_enabled from cameras where (disabled != 't' OR disabled is NULL)",
         error);
+}
+
+std::optional<Error> Camera::delete_() {
+    static const adminhost::HostPath tool("/usr/bin/lumioconfig");
+    const std::int32_t status =
+        guid() ? adminhost::launch_task(adminhost::diskPath(tool), {"--remove_camera", *guid()}, nullptr, nullptr) : -1;
+    if (status != 0) {
+        return Error{"adminhost_lumio", status, std::nullopt};
+    }
+    return std::nullopt;
 }
 
 std::uint64_t Camera::getTotalCameraCount() {

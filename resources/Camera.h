@@ -21,6 +21,9 @@ class Camera final : public ResourceClass<Camera> {
     [[nodiscard]] static std::uint64_t getRunningCameraCount();
 
     [[nodiscard]] std::string_view resourceType() const noexcept override { return "camera"; }
+    /// Removes the camera with the service's configuration tool, which owns its rows. An error of the domain
+    /// "adminhost_lumio" has the tool's exit status; a camera without UUID is -1, and no tool runs.
+    [[nodiscard]] std::optional<adminhost::Error> delete_() override;
 
   protected:
     [[nodiscard]] std::string_view className() const noexcept override { return "Camera"; }

@@ -1,5 +1,6 @@
 #include "resources/Resource.h"
 
+#include "platform/bundle/Bundle.h"
 #include "platform/value/Text.h"
 
 namespace lumio {
@@ -11,6 +12,12 @@ std::unique_ptr<Resource> Resource::resourceWithDictionary(Dictionary dictionary
     auto resource = std::make_unique<Resource>();
     resource->readRow(std::move(dictionary));
     return resource;
+}
+
+std::optional<Dictionary> Resource::localizationsForResourceNamed(std::string_view name,
+                                                                  const adminhost::Bundle& bundle,
+                                                                  const std::vector<std::string>& preferredLanguages) {
+    return adminhost::localizedTable(bundle, name, preferredLanguages);
 }
 
 std::vector<std::string_view> Resource::listOfResourceDateKeys() const {
@@ -53,6 +60,9 @@ const Dictionary* Resource::data() {
 }
 
 const Dictionary* Resource::dictionary() {
+    if (!_aclsAreExpanded) {
+        expandACLs();
+    }
     return _data ? &*_data : nullptr;
 }
 

@@ -17,6 +17,10 @@
 #include <string_view>
 #include <vector>
 
+namespace adminhost {
+class Bundle;
+}
+
 namespace lumio {
 
 class Resource {
@@ -30,6 +34,10 @@ class Resource {
     [[nodiscard]] static std::unique_ptr<Resource> resourceWithDictionary(adminhost::Dictionary dictionary);
     /// Does nothing.
     static void initialize() {}
+    /// The bundle's strings table of that name in the best of the preferred languages, else in "English"; nothing if it
+    /// has none, or if the first one found cannot be read.
+    [[nodiscard]] static std::optional<adminhost::Dictionary> localizationsForResourceNamed(
+        std::string_view name, const adminhost::Bundle& bundle, const std::vector<std::string>& preferredLanguages);
 
     /// Runs a statement; each row becomes an object of the result class: Dictionary, or a class with
     /// initWithDictionary. Nothing, and only then an error, when the tool fails (QueryRunner.h).
@@ -59,7 +67,8 @@ class Resource {
     [[nodiscard]] const adminhost::Dictionary* data();
     /// Replaces the record; nothing clears it.
     void setData(std::optional<adminhost::Dictionary> data) { _data = std::move(data); }
-    /// The record as administrators see it, or null. Does not load a missing record.
+    /// The record as administrators see it, or null: with its access list expanded, which happens once. A missing
+    /// record is not loaded for it.
     [[nodiscard]] virtual const adminhost::Dictionary* dictionary();
     /// "CLASS - guid: UUID, " and the record from the next line on: the fields as they stand, nothing is loaded.
     [[nodiscard]] std::string description() const;
@@ -69,7 +78,45 @@ class Resource {
     /// Removes the resource. Nothing happens here, and no error is reported.
     [[nodiscard]] virtual std::optional<adminhost::Error> delete_() { return std::nullopt; }
 
+    // Access control (AccessLists.cpp)
+
+    /// Whether access control is on, by the record if there is one (none is loaded), else as last set.
+    [[nodiscard]] bool aclEnabled();
+    /// Switches access control on or off in the database; needs a UUID. A failure is dropped without a message.
+    void setACLEnabled(bool enabled);
+    /// The UUIDs of the access list in row order, duplicates kept. A failure is logged and gives an empty list.
+    [[nodiscard]] std::vector<std::string> getUserAndGroupACLs();
+    /// Adds and removes people and groups with the service's configuration tool, one run for each kind of change.
+    /// Entries that cannot be understood or resolved are skipped; an addition without "shortName" ends it before any
+    /// run.
+    void changeACLsWithRequest(const adminhost::Array* entries);
+    /// Runs the configuration tool for the names, if there are any; neither its status nor its output is looked at.
+    void _executeLumioConfigWithCommand(std::string_view command, std::string_view resourceType,
+                                        std::string_view resourceID, std::string_view recordType,
+                                        const std::vector<std::string>& shortNames);
+    /// The user entries of the expanded access list.
+    [[nodiscard]] adminhost::Array allowedUsers() const;
+    /// The user entries too, never the groups. This sameness is deliberate: clients count on it.
+    [[nodiscard]] adminhost::Array allowedGroups() const;
+    [[nodiscard]] std::size_t countOfAllowedUsers() const { return allowedUsers().size(); }
+    [[nodiscard]] std::size_t countOfAllowedGroups() const { return allowedGroups().size(); }
+    // Null when the index is out of range.
+    [[nodiscard]] adminhost::Value objectInAllowedUsersAtIndex(std::size_t index) const;
+    [[nodiscard]] adminhost::Value objectInAllowedGroupsAtIndex(std::size_t index) const;
+
   protected:
+    /// Adds "useUser" and "allowedUsersAndGroups" to the record and makes its access switch a boolean. Works on the
+    /// record as it stands: run a second time it would take the boolean true for a text other than "t".
+    void expandACLs();
+    /// The directory's entries for the UUIDs, of one record type or of people and groups. A failing directory is told
+    /// on standard output and gives an empty list.
+    [[nodiscard]] static std::vector<adminhost::Dictionary> getDirectoryDetailsForUUIDs(
+        const std::vector<std::string>& uuids, std::optional<std::string_view> recordType = std::nullopt);
+    [[nodiscard]] static std::vector<adminhost::Dictionary> getUserDetailsForUUIDs(
+        const std::vector<std::string>& uuids);
+    [[nodiscard]] static std::vector<adminhost::Dictionary> getGroupDetailsForUUIDs(
+        const std::vector<std::string>& uuids);
+
     [[nodiscard]] virtual std::string_view className() const noexcept { return "Resource"; }
     /// The columns whose local times become dates when a row is read.
     [[nodiscard]] virtual std::vector<std::string_view> listOfResourceDateKeys() const;
@@ -78,6 +125,8 @@ class Resource {
 
     std::optional<adminhost::Dictionary> _data;
     std::optional<std::string> _guid;
+    bool _aclsAreExpanded = false;
+    bool _aclEnabled = false;
 };
 
 /// The construction and query operations that every resource class has for its own objects.

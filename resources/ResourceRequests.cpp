@@ -1,4 +1,6 @@
 #include "handler/LumioRequestHandler.h"
+#include "platform/log/Log.h"
+#include "platform/value/Text.h"
 #include "resources/Camera.h"
 
 namespace lumio {
@@ -7,6 +9,7 @@ using adminhost::Array;
 using adminhost::Dictionary;
 using adminhost::Error;
 using adminhost::Response;
+using adminhost::Value;
 
 namespace {
 
@@ -20,6 +23,32 @@ Response listing(std::string_view command, std::string_view key, Array list) {
     answer.set(key, std::move(list));
     answer.set("readStatus", 0);
     return answer;
+}
+
+/// Applies each change entry in order; an element that is no dictionary is passed over.
+template <class Change>
+void forEachEntry(const Array* changes, Change change) {
+    if (changes == nullptr) {
+        return;
+    }
+    for (const Value& element : *changes) {
+        if (const Dictionary* entry = element.dictionary()) {
+            change(*entry);
+        }
+    }
+}
+
+std::optional<std::string> identifierOf(const Dictionary& entry) {
+    const Value* identifier = entry.find("_id_");
+    return identifier == nullptr ? std::nullopt : std::optional(textOf(*identifier));
+}
+
+/// Applies the access switch and the access-list changes of an entry.
+void changeAccess(Resource& resource, const Dictionary& entry) {
+    if (const Value* enabled = entry.find("access_control_enabled")) {
+        resource.setACLEnabled(flagOf(*enabled));
+    }
+    resource.changeACLsWithRequest(entry.get("allowedUsersAndGroups").array());
 }
 
 }  // namespace
@@ -38,6 +67,21 @@ Response LumioRequestHandler::getCamerasWithRequest(const Dictionary&) {
     return listing("getCameras", "cameras", std::move(list));
 }
 
+Response LumioRequestHandler::processCameraChangesWithRequest(const Array* changes) {
+    forEachEntry(changes, [](const Dictionary& entry) {
+        const auto camera = Camera::initWithGUID(identifierOf(entry));
+        if (flagOf(entry.get("_obsoleteid_"))) {
+            if (const auto error = camera->delete_()) {
+                adminhost::logEvent("adminhost_lumio: could not delete camera with uuid: " + textOf(entry.get("_id_")) +
+                                    ", error: " + textOf(*error));
+            }
+            return;
+        }
+        changeAccess(*camera, entry);
+    });
+    return nullptr;
+}
+
 Response LumioRequestHandler::getWorkflowsWithRequest(const Dictionary&) {
     return responseForError("NOT_AVAILABLE");
 }
@@ -46,9 +90,6 @@ Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary&) {
 }
 
 Response LumioRequestHandler::setWorkflowACLWithRequest(const Array*) {
-    return responseForError("NOT_AVAILABLE");
-}
-Response LumioRequestHandler::processCameraChangesWithRequest(const Array*) {
     return responseForError("NOT_AVAILABLE");
 }
 Response LumioRequestHandler::processPropertyChangesWithRequest(const Array*) {

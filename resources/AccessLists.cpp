@@ -1,0 +1,259 @@
+// The operations of a resource that concern who may use it.
+
+#include "platform/directory/Entries.h"
+#include "platform/directory/Membership.h"
+#include "platform/log/Log.h"
+#include "platform/task/Task.h"
+#include "platform/value/Text.h"
+#include "resources/Resource.h"
+
+#include <algorithm>
+#include <cctype>
+#include <cstdio>
+#include <unordered_set>
+
+namespace lumio {
+
+namespace directory = adminhost::directory;
+using adminhost::Array;
+using adminhost::Dictionary;
+using adminhost::DirectorySession;
+using adminhost::Error;
+using adminhost::Value;
+
+namespace {
+
+std::string lowerCase(std::string text) {
+    std::transform(text.begin(), text.end(), text.begin(), [](unsigned char c) { return std::tolower(c); });
+    return text;
+}
+
+/// "camera" -> "Camera", the form in which access rows name a type.
+std::string capitalised(std::string_view word) {
+    std::string text(word);
+    if (!text.empty()) {
+        text.front() = static_cast<char>(std::toupper(static_cast<unsigned char>(text.front())));
+    }
+    return text;
+}
+
+bool isType(const Value& type, std::string_view word) {
+    return type.string() != nullptr && lowerCase(*type.string()) == word;
+}
+
+/// Keeps the first entry of each UUID; entries without one are dropped.
+void dropDuplicates(std::vector<Dictionary>& entries) {
+    std::unordered_set<std::string> seen;
+    std::erase_if(entries, [&](const Dictionary& entry) {
+        const std::string* guid = entry.get("guid").string();
+        return guid == nullptr || !seen.insert(lowerCase(*guid)).second;
+    });
+}
+
+struct Names {
+    std::vector<std::string> users;
+    std::vector<std::string> groups;
+};
+
+/// Appends the login or group name behind a UUID text, if it has one.
+void appendNameOf(const Value& uuidText, Names& names) {
+    const auto uuid = uuidText.string() == nullptr ? std::nullopt : adminhost::mbr_string_to_uuid(*uuidText.string());
+    const auto id = uuid ? adminhost::mbr_uuid_to_id(*uuid) : std::nullopt;
+    if (!id) {
+        return;
+    }
+    const bool isUser = id->kind == adminhost::PosixId::Kind::user;
+    const auto name = isUser ? adminhost::userNameOf(id->id) : adminhost::groupNameOf(id->id);
+    if (name && !name->empty()) {
+        (isUser ? names.users : names.groups).push_back(*name);
+    }
+}
+
+Value elementAt(const Array& array, std::size_t index) {
+    return index < array.size() ? array[index] : Value();
+}
+
+}  // namespace
+
+bool Resource::aclEnabled() {
+    if (_data) {
+        _aclEnabled = booleanOf(_data->get("access_control_enabled"));
+    }
+    return _aclEnabled;
+}
+
+void Resource::setACLEnabled(bool enabled) {
+    if (!guid()) {
+        return;
+    }
+    std::optional<Error> error;
+    (void)querySorvaneDatabase<Dictionary>(std::string("update ").append(resourceType()) +
+                                               "s set access_control_enabled=\"" + (enabled ? "t" : "f") +
+                                               "\" where uuid=\"" + *guid() + "\"",
+                                           error);
+    if (!error) {
+        _aclEnabled = enabled;
+    }
+}
+
+std::vector<std::string> Resource::getUserAndGroupACLs() {
+    std::optional<Error> error;
+    const auto rows = querySorvaneDatabase<Dictionary>(
+        "select record_uuid from access_control_entries where resource_type = '" + capitalised(resourceType()) +
+            "' and resource_id = '" + textOf(_data ? _data->get("id") : Value()) + "'",
+        error);
+    if (!rows) {
+        adminhost::logEvent("getUserAndGroupACLs SQL query returned error: " + textOf(error));
+        return {};
+    }
+    std::vector<std::string> uuids;
+    for (const Dictionary& row : *rows) {
+        if (const Value* uuid = row.find("record_uuid")) {
+            uuids.push_back(textOf(*uuid));
+        }
+    }
+    return uuids;
+}
+
+std::vector<Dictionary> Resource::getDirectoryDetailsForUUIDs(const std::vector<std::string>& uuids,
+                                                              std::optional<std::string_view> recordType) {
+    adminhost::DirectoryQuery query;
+    if (recordType) {
+        query.recordTypes = {std::string(*recordType)};
+    } else {
+        query.recordTypes = {std::string(directory::users), std::string(directory::groups)};
+    }
+    query.attribute = directory::generatedUID;
+    query.values = uuids;
+    query.attributes = {std::string(directory::recordName), std::string(directory::realName),
+                        std::string(directory::generatedUID)};
+    Error error;
+    const auto node = DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode, &error);
+    const auto records = node ? node->records(query, &error) : std::nullopt;
+    if (!records) {
+        std::printf("Tarn query error for users: %s\n", error.description.value_or("").c_str());
+        std::fflush(stdout);
+        return {};
+    }
+    std::vector<Dictionary> entries;
+    entries.reserve(records->size());
+    for (const adminhost::DirectoryRecord& record : *records) {
+        entries.push_back(adminhost::directoryEntryOf(record));
+    }
+    return entries;
+}
+
+std::vector<Dictionary> Resource::getUserDetailsForUUIDs(const std::vector<std::string>& uuids) {
+    return getDirectoryDetailsForUUIDs(uuids, directory::users);
+}
+
+std::vector<Dictionary> Resource::getGroupDetailsForUUIDs(const std::vector<std::string>& uuids) {
+    return getDirectoryDetailsForUUIDs(uuids, directory::groups);
+}
+
+void Resource::expandACLs() {
+    if (_data) {
+        const std::string* user = _data->get("use_user_uuid").string();
+        if (user != nullptr && !user->empty()) {
+            const std::vector<Dictionary> entries = getUserDetailsForUUIDs({*user});
+            if (!entries.empty()) {
+                const Dictionary& last = entries.back();
+                _data->set("useUser", last.get(last.contains("longName") ? "longName" : "shortName"));
+            }
+        }
+        _data->set("access_control_enabled", _data->get("access_control_enabled") == Value("t"));
+    }
+    const std::vector<std::string> uuids = getUserAndGroupACLs();
+    _aclsAreExpanded = true;
+    std::vector<Dictionary> entries;
+    if (!uuids.empty()) {
+        entries = getDirectoryDetailsForUUIDs(uuids);
+        // More records than UUIDs means that some UUID was found in several places.
+        if (entries.size() > uuids.size()) {
+            dropDuplicates(entries);
+        }
+    }
+    if (_data) {
+        _data->set("allowedUsersAndGroups",
+                   Array(std::make_move_iterator(entries.begin()), std::make_move_iterator(entries.end())));
+    }
+}
+
+void Resource::changeACLsWithRequest(const Array* entries) {
+    if (entries == nullptr || entries->empty()) {
+        return;
+    }
+    Names toAdd;
+    Names toRemove;
+    for (const Value& element : *entries) {
+        const Dictionary* entry = element.dictionary();
+        if (entry == nullptr) {
+            continue;
+        }
+        if (booleanOf(entry->get("_newid_"))) {
+            const bool isUser = isType(entry->get("type"), "user");
+            if (!isUser && !isType(entry->get("type"), "group")) {
+                continue;  // and not tried as a removal
+            }
+            const Value* name = entry->find("shortName");
+            if (name == nullptr) {
+                return;
+            }
+            (isUser ? toAdd.users : toAdd.groups).push_back(textOf(*name));
+        } else if (booleanOf(entry->get("_obsoleteid_"))) {
+            appendNameOf(entry->get("_id_"), toRemove);
+        }
+    }
+    if (!guid()) {
+        return;
+    }
+    const std::string_view type = resourceType();
+    _executeLumioConfigWithCommand("--add_access", type, *guid(), "user", toAdd.users);
+    _executeLumioConfigWithCommand("--add_access", type, *guid(), "group", toAdd.groups);
+    _executeLumioConfigWithCommand("--remove_access", type, *guid(), "user", toRemove.users);
+    _executeLumioConfigWithCommand("--remove_access", type, *guid(), "group", toRemove.groups);
+}
+
+void Resource::_executeLumioConfigWithCommand(std::string_view command, std::string_view resourceType,
+                                              std::string_view resourceID, std::string_view recordType,
+                                              const std::vector<std::string>& shortNames) {
+    if (shortNames.empty()) {
+        return;
+    }
+    std::vector<std::string> arguments;
+    for (const std::string_view word :
+         {command, std::string_view("--resource_type"), resourceType, std::string_view("--resource_uuid"), resourceID,
+          std::string_view("--record_type"), recordType}) {
+        arguments.emplace_back(word);
+    }
+    for (const std::string& name : shortNames) {
+        arguments.emplace_back("--shortname");
+        arguments.push_back(name);
+    }
+    static const adminhost::HostPath tool("/usr/bin/lumioconfig");
+    (void)adminhost::launch_task(adminhost::diskPath(tool), arguments, nullptr, nullptr);
+}
+
+Array Resource::allowedUsers() const {
+    Array users;
+    const Array* entries = _data ? _data->get("allowedUsersAndGroups").array() : nullptr;
+    if (entries != nullptr) {
+        std::copy_if(entries->begin(), entries->end(), std::back_inserter(users), [](const Value& entry) {
+            return entry.dictionary() != nullptr && entry.dictionary()->get("type") == Value("user");
+        });
+    }
+    return users;
+}
+
+Array Resource::allowedGroups() const {
+    return allowedUsers();
+}
+
+Value Resource::objectInAllowedUsersAtIndex(std::size_t index) const {
+    return elementAt(allowedUsers(), index);
+}
+Value Resource::objectInAllowedGroupsAtIndex(std::size_t index) const {
+    return elementAt(allowedGroups(), index);
+}
+
+}  // namespace lumio
