@@ -39,7 +39,7 @@ UNITS = ["bytes", "megabytes", "seconds", "minutes", "people"]
 COMMAND_WORDS = {"order", "summary", "description", "needs_database", "revision", "revision_guard", "changes", "available",
                  "errors", "keys", "answer", "include", "example"}
 KEY_WORDS = {"type", "entered_as", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"}
-ANSWER_WORDS = {"type", "unit", "secret", "help"}
+ANSWER_WORDS = {"type", "unit", "secret", "column", "help"}
 ENTRY_WORDS = {"added_by", "removed_by", "first", "leading_zeros", "otherwise", "added_kinds", "columns", "together"}
 
 
@@ -177,8 +177,9 @@ def key_description(path, key):
     for word in ("allowed", "rules"):
         if key.get(word):
             described[word] = key[word]
-    if key.get("unit"):
-        described["unit"] = key["unit"]
+    for word in ("unit", "column"):
+        if key.get(word):
+            described[word] = key[word]
     return described
 
 

@@ -1,0 +1,114 @@
+#include "adminhostctl/Connection.h"
+
+#include "adminhostctl/Failure.h"
+
+#include <cerrno>
+#include <cstring>
+#include <memory>
+#include <utility>
+
+#include <curl/curl.h>
+
+namespace adminhost::ctl {
+namespace {
+
+std::size_t append(char* bytes, std::size_t size, std::size_t count, void* place) noexcept {
+    static_cast<std::string*>(place)->append(bytes, size * count);
+    return size * count;
+}
+
+struct FreeList {
+    void operator()(curl_slist* list) const noexcept { curl_slist_free_all(list); }
+};
+using HeaderList = std::unique_ptr<curl_slist, FreeList>;
+
+struct FreeText {
+    void operator()(char* text) const noexcept { curl_free(text); }
+};
+
+}  // namespace
+
+/// Owns the transfer handle.
+class Connection::Handle {
+  public:
+    Handle() : _curl(curl_easy_init()) {
+        if (_curl == nullptr) {
+            throw std::bad_alloc();
+        }
+    }
+    ~Handle() { curl_easy_cleanup(_curl); }
+    Handle(const Handle&) = delete;
+    Handle& operator=(const Handle&) = delete;
+
+    [[nodiscard]] CURL* get() const noexcept { return _curl; }
+    template <typename T>
+    void set(CURLoption option, T value) const noexcept {
+        curl_easy_setopt(_curl, option, value);
+    }
+
+  private:
+    CURL* _curl;
+};
+
+Connection::Connection(std::string socketPath)
+    : _socketPath(std::move(socketPath)), _handle(std::make_unique<Handle>()) {}
+Connection::~Connection() = default;
+Connection::Connection(Connection&&) noexcept = default;
+Connection& Connection::operator=(Connection&&) noexcept = default;
+
+HttpAnswer Connection::get(const std::string& path) {
+    return send(path, nullptr);
+}
+HttpAnswer Connection::post(const std::string& path, const std::string& body) {
+    return send(path, &body);
+}
+
+HttpAnswer Connection::send(const std::string& path, const std::string* body) {
+    HttpAnswer answer;
+    const std::string address = "http://localhost" + path;
+    // Without an empty Expect header, larger bodies would wait for a permission that the daemon need not give.
+    HeaderList headers(curl_slist_append(nullptr, "Content-Type: application/json"));
+    curl_slist_append(headers.get(), "Expect:");
+    curl_slist_append(headers.get(), "Accept: application/json");
+
+    curl_easy_reset(_handle->get());
+    _handle->set(CURLOPT_UNIX_SOCKET_PATH, _socketPath.c_str());
+    _handle->set(CURLOPT_URL, address.c_str());
+    _handle->set(CURLOPT_PROTOCOLS_STR, "http");
+    _handle->set(CURLOPT_NOPROXY, "*");
+    _handle->set(CURLOPT_NOSIGNAL, 1L);
+    _handle->set(CURLOPT_CONNECTTIMEOUT, 10L);
+    _handle->set(CURLOPT_HTTPHEADER, headers.get());
+    _handle->set(CURLOPT_WRITEFUNCTION, &append);
+    _handle->set(CURLOPT_WRITEDATA, &answer.body);
+    if (body != nullptr) {
+        _handle->set(CURLOPT_POST, 1L);
+        _handle->set(CURLOPT_POSTFIELDS, body->data());
+        _handle->set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body->size()));
+    }
+    const CURLcode result = curl_easy_perform(_handle->get());
+    if (result != CURLE_OK) {
+        long number = 0;
+        curl_easy_getinfo(_handle->get(), CURLINFO_OS_ERRNO, &number);
+        if (result == CURLE_COULDNT_CONNECT && (number == EACCES || number == EPERM)) {
+            throw Failure(ExitStatus::notPermitted, "you may not talk to the daemon at " + _socketPath);
+        }
+        const std::string why = result == CURLE_COULDNT_CONNECT && number != 0 ? std::strerror(static_cast<int>(number))
+                                                                               : curl_easy_strerror(result);
+        throw Failure(ExitStatus::notReachable, "the daemon cannot be reached at " + _socketPath + ": " + why);
+    }
+    curl_easy_getinfo(_handle->get(), CURLINFO_RESPONSE_CODE, &answer.status);
+    curl_header* header = nullptr;
+    if (curl_easy_header(_handle->get(), "Request-Id", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
+        answer.requestId = header->value;
+    }
+    return answer;
+}
+
+std::string Connection::escaped(const std::string& segment) {
+    const std::unique_ptr<char, FreeText> text(
+        curl_easy_escape(nullptr, segment.data(), static_cast<int>(segment.size())));
+    return text ? std::string(text.get()) : std::string();
+}
+
+}  // namespace adminhost::ctl

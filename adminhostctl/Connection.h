@@ -1,0 +1,42 @@
+#pragma once
+
+// HTTP over the daemon's Unix socket.
+
+#include <memory>
+#include <string>
+
+namespace adminhost::ctl {
+
+struct HttpAnswer {
+    long status = 0;
+    std::string body;
+    std::string requestId;  ///< the daemon's name for the request; empty if it gave none
+};
+
+/// One connection, kept open between requests. Throws Failure when the daemon cannot be reached (notReachable) or the
+/// socket may not be opened (notPermitted). Waits for an answer as long as the daemon takes: the daemon bounds
+/// requests.
+class Connection {
+  public:
+    explicit Connection(std::string socketPath);
+    ~Connection();
+    Connection(Connection&&) noexcept;
+    Connection& operator=(Connection&&) noexcept;
+
+    /// The path is the address below "http://host", each of its segments already escaped.
+    [[nodiscard]] HttpAnswer get(const std::string& path);
+    /// The body is JSON.
+    [[nodiscard]] HttpAnswer post(const std::string& path, const std::string& body);
+
+    /// Escapes one segment of a path.
+    [[nodiscard]] static std::string escaped(const std::string& segment);
+
+  private:
+    class Handle;
+    [[nodiscard]] HttpAnswer send(const std::string& path, const std::string* body);
+
+    std::string _socketPath;
+    std::unique_ptr<Handle> _handle;
+};
+
+}  // namespace adminhost::ctl

@@ -1,0 +1,33 @@
+#pragma once
+
+// How the command line ends when something does not work out.
+
+#include <stdexcept>
+#include <string>
+
+namespace adminhost::ctl {
+
+enum class ExitStatus : int {
+    done = 0,
+    answeredError = 1,  ///< the service answered an error
+    usage = 2,
+    notReachable = 3,  ///< no daemon behind the socket
+    notPermitted = 4,
+};
+
+/// Ends the program with a message for people and a status; caught in one place, main().
+class Failure : public std::runtime_error {
+  public:
+    Failure(ExitStatus status, const std::string& message) : std::runtime_error(message), _status(status) {}
+    [[nodiscard]] ExitStatus status() const noexcept { return _status; }
+
+  private:
+    ExitStatus _status;
+};
+
+/// What was written on the command line cannot be carried out.
+[[nodiscard]] inline Failure usageError(const std::string& message) {
+    return {ExitStatus::usage, message};
+}
+
+}  // namespace adminhost::ctl

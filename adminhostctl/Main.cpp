@@ -1,0 +1,92 @@
+// adminhostctl: administrate the service from the command line, through the daemon.
+
+#include "adminhostctl/Failure.h"
+#include "adminhostctl/Prompt.h"
+#include "adminhostctl/Request.h"
+#include "adminhostctl/Service.h"
+#include "adminhostctl/Verbs.h"
+
+#include <algorithm>
+#include <cstdlib>
+#include <iostream>
+#include <string>
+#include <vector>
+
+#include <CLI/CLI.hpp>
+#include <sys/ioctl.h>
+#include <unistd.h>
+
+namespace {
+
+using adminhost::ctl::ExitStatus;
+using adminhost::ctl::Format;
+
+constexpr const char* defaultSocket = "/run/adminhostd/adminhostd.sock";
+constexpr std::size_t widthWithoutTerminal = 120;
+
+/// Columns of the terminal; COLUMNS, or a fixed number, where the output is none.
+std::size_t outputWidth() {
+    winsize size{};
+    if (::isatty(STDOUT_FILENO) == 1 && ::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0) {
+        return std::max<std::size_t>(size.ws_col, 40);
+    }
+    const char* const columns = std::getenv("COLUMNS");
+    const unsigned long number = columns != nullptr ? std::strtoul(columns, nullptr, 10) : 0;
+    return number >= 40 && number <= 10'000 ? number : widthWithoutTerminal;
+}
+
+int statusOf(ExitStatus status) {
+    return static_cast<int>(status);
+}
+
+int runMain(int count, char** words) {
+    adminhost::ctl::Options options;
+    std::string socket = defaultSocket;
+    std::string format = "text";
+    std::vector<std::string> rest;
+    CLI::App app(
+        "Administrates the service through its daemon. \"adminhostctl help\" lists the verbs, \"adminhostctl "
+        "commands\" the "
+        "service's commands.",
+        "adminhostctl");
+    app.add_option("--socket", socket, "The daemon's socket")->envname("ADMINHOST_SOCKET")->type_name("PATH");
+    app.add_option("--format", format, "How to write the answer: text (for reading), json or plist")
+        ->check(CLI::IsMember({"text", "json", "plist"}))
+        ->type_name("FORMAT");
+    app.add_option("--file", options.file, "The request, as JSON or property list; - is standard input")
+        ->type_name("FILE");
+    app.add_flag("--names", options.names, "Only names, one a line");
+    app.add_option("words", rest, "A verb or a command, and its arguments: KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-")
+        ->required()
+        ->type_name("WORD");
+    try {
+        app.parse(count, words);
+    } catch (const CLI::ParseError& error) {
+        return app.exit(error) == 0 ? statusOf(ExitStatus::done) : statusOf(ExitStatus::usage);
+    }
+    options.format = format == "json" ? Format::json : format == "plist" ? Format::plist : Format::text;
+    options.width = outputWidth();
+    try {
+        adminhost::ctl::Service service(socket);
+        const adminhost::ctl::Sources sources{&adminhost::ctl::readSource, &adminhost::ctl::askSecret,
+                                              adminhost::ctl::inputIsTerminal()};
+        const ExitStatus status = adminhost::ctl::run({service, options, sources, std::cout, std::cerr}, rest);
+        std::cout.flush();
+        return statusOf(std::cout ? status : ExitStatus::usage);
+    } catch (const adminhost::ctl::Failure& failure) {
+        std::cout.flush();
+        std::cerr << "adminhostctl: " << failure.what() << '\n';
+        return statusOf(failure.status());
+    }
+}
+
+}  // namespace
+
+int main(int count, char** words) {
+    try {
+        return runMain(count, words);
+    } catch (const std::exception& error) {
+        std::cerr << "adminhostctl: " << error.what() << '\n';
+        return statusOf(ExitStatus::answeredError);
+    }
+}

@@ -1,0 +1,146 @@
+#include "adminhostctl/Prompt.h"
+
+#include "adminhostctl/Failure.h"
+
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstring>
+#include <memory>
+
+#include <termios.h>
+#include <unistd.h>
+
+namespace adminhost::ctl {
+namespace {
+
+constexpr std::size_t maximumSize = std::size_t{64} << 20U;
+
+struct CloseFile {
+    void operator()(std::FILE* file) const noexcept { static_cast<void>(std::fclose(file)); }
+};
+
+// A handler can reach nothing but static storage.
+volatile std::sig_atomic_t caughtSignal = 0;
+void remember(int number) noexcept {
+    caughtSignal = number;
+}
+
+/// While it lives, signals that would end or stop the program are remembered instead and interrupt reading.
+class SignalGuard {
+  public:
+    SignalGuard() noexcept {
+        caughtSignal = 0;
+        struct sigaction action {};
+        action.sa_handler = &remember;
+        sigemptyset(&action.sa_mask);
+        for (std::size_t i = 0; i < signals.size(); ++i) {
+            sigaction(signals.at(i), &action, &_before.at(i));
+        }
+    }
+    ~SignalGuard() {
+        for (std::size_t i = 0; i < signals.size(); ++i) {
+            sigaction(signals.at(i), &_before.at(i), nullptr);
+        }
+    }
+    SignalGuard(const SignalGuard&) = delete;
+    SignalGuard& operator=(const SignalGuard&) = delete;
+
+  private:
+    static constexpr std::array<int, 5> signals = {SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGTSTP};
+    std::array<struct sigaction, 5> _before{};
+};
+
+/// While it lives, the terminal does not show what is typed.
+class EchoGuard {
+  public:
+    EchoGuard() noexcept : _changed(tcgetattr(STDIN_FILENO, &_before) == 0) {
+        termios silent = _before;
+        silent.c_lflag &= ~static_cast<tcflag_t>(ECHO);
+        silent.c_lflag |= ECHONL;
+        _changed = _changed && tcsetattr(STDIN_FILENO, TCSAFLUSH, &silent) == 0;
+    }
+    ~EchoGuard() {
+        if (_changed) {
+            tcsetattr(STDIN_FILENO, TCSAFLUSH, &_before);
+        }
+    }
+    EchoGuard(const EchoGuard&) = delete;
+    EchoGuard& operator=(const EchoGuard&) = delete;
+
+    [[nodiscard]] bool changed() const noexcept { return _changed; }
+
+  private:
+    termios _before{};
+    bool _changed;
+};
+
+}  // namespace
+
+bool inputIsTerminal() noexcept {
+    return ::isatty(STDIN_FILENO) == 1;
+}
+
+std::string readSource(const std::string& path) {
+    const bool isInput = path == "-";
+    static bool inputWasRead = false;
+    if (isInput && inputWasRead) {
+        throw usageError("standard input can be read only once");
+    }
+    inputWasRead = inputWasRead || isInput;
+    const std::unique_ptr<std::FILE, CloseFile> opened(isInput ? nullptr : std::fopen(path.c_str(), "rbe"));
+    std::FILE* const file = isInput ? stdin : opened.get();
+    if (file == nullptr) {
+        throw usageError(path + ": " + std::strerror(errno));
+    }
+    std::string bytes;
+    std::array<char, 65536> buffer{};
+    while (const std::size_t count = std::fread(buffer.data(), 1, buffer.size(), file)) {
+        bytes.append(buffer.data(), count);
+        if (bytes.size() > maximumSize) {
+            throw usageError((isInput ? "standard input" : path) + " is larger than 64 MiB");
+        }
+    }
+    if (std::ferror(file) != 0) {
+        throw usageError((isInput ? "standard input" : path) + ": " + std::strerror(errno));
+    }
+    return bytes;
+}
+
+std::string askSecret(const std::string& key) {
+    std::string line;
+    bool ended = false;
+    {
+        const SignalGuard signals;
+        const EchoGuard echo;
+        if (!echo.changed()) {
+            throw usageError("the terminal does not hide what is typed; give " + key + " with a file");
+        }
+        const std::string question = key + ": ";
+        static_cast<void>(!::write(STDERR_FILENO, question.data(), question.size()));
+        char c = 0;
+        while (true) {
+            const ssize_t count = ::read(STDIN_FILENO, &c, 1);
+            if (count == 1 && c != '\n') {
+                line.push_back(c);
+            } else if (count == 1) {
+                break;
+            } else {
+                ended = true;
+                break;
+            }
+        }
+    }
+    if (const int number = caughtSignal; number != 0) {
+        // The terminal is as it was; now let the signal do what it does.
+        static_cast<void>(std::raise(number));
+        throw usageError("interrupted");
+    }
+    if (ended && line.empty()) {
+        throw usageError(key + " was not given");
+    }
+    return line;
+}
+
+}  // namespace adminhost::ctl

@@ -1,0 +1,235 @@
+#include "adminhostctl/Reading.h"
+
+#include "adminhostctl/Table.h"
+#include "adminhostctl/Width.h"
+#include "platform/value/Text.h"
+
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <ctime>
+#include <optional>
+#include <vector>
+
+#include <fmt/format.h>
+
+namespace adminhost::ctl {
+namespace {
+
+bool isTable(const Value& value) {
+    const Array* array = value.array();
+    return array != nullptr && !array->empty() &&
+           std::all_of(array->begin(), array->end(), [](const Value& v) { return v.dictionary() != nullptr; });
+}
+
+bool isPeople(const Value& value) {
+    return isTable(value) && std::all_of(value.array()->begin(), value.array()->end(),
+                                         [](const Value& v) { return !personText(*v.dictionary()).empty(); });
+}
+
+/// Whether the value gets lines of its own below its key.
+bool isSection(const Value& value) {
+    return (value.dictionary() != nullptr && !value.dictionary()->empty()) || (isTable(value) && !isPeople(value));
+}
+
+/// The number of an integer, also of one that is stored as text.
+std::optional<std::uint64_t> countOf(const Value& value) {
+    if (const std::string* text = value.string()) {
+        std::uint64_t number = 0;
+        const char* const end = text->data() + text->size();
+        const auto result = std::from_chars(text->data(), end, number);
+        return result.ec == std::errc() && result.ptr == end ? std::optional(number) : std::nullopt;
+    }
+    return value.unsignedInteger();
+}
+
+std::string withUnit(const Value& value, const std::string& unit) {
+    const auto count = countOf(value);
+    if (!count) {
+        return {};
+    }
+    if (unit == "bytes") {
+        return sizeText(*count);
+    }
+    if (unit == "megabytes" && *count < UINT64_MAX / 1'000'000) {
+        return sizeText(*count * 1'000'000);
+    }
+    if (unit == "seconds" || unit == "minutes") {
+        return fmt::format("{} {}", *count, unit == "seconds" ? "s" : "min");
+    }
+    return {};
+}
+
+}  // namespace
+
+std::string sizeText(std::uint64_t bytes) {
+    constexpr std::array<const char*, 7> units = {"bytes", "kB", "MB", "GB", "TB", "PB", "EB"};
+    if (bytes < 1000) {
+        return fmt::format("{} {}", bytes, bytes == 1 ? "byte" : "bytes");
+    }
+    double size = static_cast<double>(bytes);
+    std::size_t unit = 0;
+    // What would be rounded to 1000 is one of the next unit.
+    while (size >= 999.5 && unit + 1 < units.size()) {
+        size /= 1000;
+        ++unit;
+    }
+    return fmt::format("{:.{}f} {}", size, size < 99.95 ? 1 : 0, units.at(unit));
+}
+
+std::string dateText(Date date) {
+    const std::time_t seconds = date.time_since_epoch().count();
+    std::tm parts{};
+    if (::localtime_r(&seconds, &parts) == nullptr) {
+        return textOf(Value(date));
+    }
+    constexpr std::array<const char*, 12> months = {"Jan", "Feb", "Mar", "Apr", "May", "Jun",
+                                                    "Jul", "Aug", "Sep", "Oct", "Nov", "Dec"};
+    return fmt::format("{} {} {}, {:02}:{:02}", parts.tm_mday, months.at(static_cast<std::size_t>(parts.tm_mon)),
+                       parts.tm_year + 1900L, parts.tm_hour, parts.tm_min);
+}
+
+std::string personText(const Dictionary& entry) {
+    const std::string* type = entry.get("type").string();
+    const std::string* name = entry.get("longName").string();
+    if (name == nullptr || name->empty()) {
+        name = entry.get("shortName").string();
+    }
+    if (type == nullptr || (*type != "user" && *type != "group")) {
+        return {};
+    }
+    const std::string* guid = entry.get("guid").string();
+    if (name == nullptr && guid == nullptr) {
+        return {};
+    }
+    return shown(name != nullptr ? *name : *guid) + " (" + *type + ")";
+}
+
+std::string Reading::cell(const Value& value, const std::string& path) const {
+    if (const KeyDescription* key = _description.answerKey(path); key != nullptr && !key->unit.empty()) {
+        std::string text = withUnit(value, key->unit);
+        if (!text.empty()) {
+            return text;
+        }
+    }
+    if (const auto boolean = value.boolean()) {
+        return *boolean ? "yes" : "no";
+    }
+    if (const auto date = value.date()) {
+        return dateText(*date);
+    }
+    if (const Data* data = value.data()) {
+        return sizeText(data->size()) + " of data";
+    }
+    if (const Array* array = value.array()) {
+        std::string text;
+        for (const Value& element : *array) {
+            const Dictionary* entry = element.dictionary();
+            std::string one = entry != nullptr ? personText(*entry) : std::string();
+            text += (text.empty() ? "" : ", ") + (one.empty() ? cell(element, path + "[]") : one);
+        }
+        return text.empty() ? "none" : text;
+    }
+    if (const Dictionary* dictionary = value.dictionary()) {
+        std::string text;
+        for (const DictionaryEntry& entry : *dictionary) {
+            text += (text.empty() ? "" : ", ") + shown(entry.key) + ": " + cell(entry.value, path + '.' + entry.key);
+        }
+        return text.empty() ? "none" : text;
+    }
+    return shown(textOf(value));
+}
+
+void Reading::appendTable(std::string& text, const Array& rows, const std::string& path, std::size_t indent) const {
+    std::vector<std::string> keys;
+    std::vector<std::string> headings;
+    const std::string element = path + "[].";
+    for (const KeyDescription& key : _description.answerKeys()) {
+        if (!key.column.empty() && key.path.starts_with(element) &&
+            key.path.find('.', element.size()) == std::string::npos) {
+            keys.push_back(key.path.substr(element.size()));
+            headings.push_back(key.column);
+        }
+    }
+    if (keys.empty()) {  // no description says which columns are worth reading
+        for (const Value& row : rows) {
+            for (const DictionaryEntry& entry : *row.dictionary()) {
+                if (std::find(keys.begin(), keys.end(), entry.key) == keys.end()) {
+                    keys.push_back(entry.key);
+                }
+            }
+        }
+        for (const std::string& key : keys) {
+            headings.push_back(shown(key));
+        }
+    }
+    Table table(std::move(headings));
+    for (const Value& row : rows) {
+        std::vector<std::string> cells;
+        for (const std::string& key : keys) {
+            const Value* value = row.dictionary()->find(key);
+            cells.push_back(value != nullptr ? cell(*value, element + key) : std::string());
+        }
+        table.addRow(std::move(cells));
+    }
+    text += table.text(_width, indent);
+}
+
+void Reading::appendDictionary(std::string& text, const Dictionary& dictionary, const std::string& path,
+                               std::size_t indent) const {
+    std::size_t longest = 0;
+    for (const DictionaryEntry& entry : dictionary) {
+        longest = isSection(entry.value) ? longest : std::max(longest, widthOf(shown(entry.key)));
+    }
+    const auto below = [&](const DictionaryEntry& entry) { return path.empty() ? entry.key : path + '.' + entry.key; };
+    const std::size_t column = indent + longest + 2;
+    // Single values first: between tables they would be lost.
+    for (const DictionaryEntry& entry : dictionary) {
+        if (isSection(entry.value)) {
+            continue;
+        }
+        const std::string key = shown(entry.key);
+        std::string line = std::string(indent, ' ') + key + std::string(column - indent - widthOf(key), ' ');
+        bool first = true;
+        for (const std::string& part :
+             wrapped(cell(entry.value, below(entry)), std::max(_width, column + 20) - column)) {
+            line += (first ? "" : std::string(column, ' ')) + part;
+            line.erase(line.find_last_not_of(' ') + 1);
+            text += line + '\n';
+            line.clear();
+            first = false;
+        }
+    }
+    bool empty = text.empty();
+    for (const DictionaryEntry& entry : dictionary) {
+        if (!isSection(entry.value)) {
+            continue;
+        }
+        text += empty ? "" : "\n";
+        empty = false;
+        text.append(indent, ' ').append(shown(entry.key));
+        if (const Dictionary* inner = entry.value.dictionary()) {
+            text += '\n';
+            appendDictionary(text, *inner, below(entry), indent + 2);
+        } else {
+            text += " (" + std::to_string(entry.value.array()->size()) + ")\n";
+            appendTable(text, *entry.value.array(), below(entry), indent + 2);
+        }
+    }
+}
+
+std::string Reading::text(const Value& value, const std::string& path) const {
+    std::string text;
+    if (value.dictionary() != nullptr && !value.dictionary()->empty()) {
+        appendDictionary(text, *value.dictionary(), path, 0);
+    } else if (isTable(value) && !isPeople(value)) {
+        appendTable(text, *value.array(), path, 0);
+    } else {
+        for (const std::string& line : wrapped(cell(value, path), _width)) {
+            text += line + '\n';
+        }
+    }
+    return text;
+}
+
+}  // namespace adminhost::ctl

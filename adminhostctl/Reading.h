@@ -1,0 +1,39 @@
+#pragma once
+
+// Answers as people read them: aligned keys, tables for lists of dictionaries, sizes, durations and dates in words.
+
+#include "adminhostctl/Description.h"
+#include "platform/value/Value.h"
+
+#include <cstddef>
+#include <string>
+
+namespace adminhost::ctl {
+
+/// How an answer is shown. Units and headings come from the command's description; what it does not describe is shown
+/// all the same, by its type.
+class Reading {
+  public:
+    Reading(const Description& description, std::size_t width) noexcept : _description(description), _width(width) {}
+
+    /// The text of a value that stands at the path of the answer; "" is the whole answer. Ends in a line feed.
+    [[nodiscard]] std::string text(const Value& value, const std::string& path = {}) const;
+
+  private:
+    void appendDictionary(std::string& text, const Dictionary& dictionary, const std::string& path,
+                          std::size_t indent) const;
+    void appendTable(std::string& text, const Array& rows, const std::string& path, std::size_t indent) const;
+    [[nodiscard]] std::string cell(const Value& value, const std::string& path) const;
+
+    const Description& _description;
+    std::size_t _width;
+};
+
+/// "1.2 TB": decimal units.
+[[nodiscard]] std::string sizeText(std::uint64_t bytes);
+/// "31 Jan 2026, 09:00", local time.
+[[nodiscard]] std::string dateText(Date date);
+/// "Anna Berg (user)" for a dictionary that names a person or group; empty for another one.
+[[nodiscard]] std::string personText(const Dictionary& entry);
+
+}  // namespace adminhost::ctl

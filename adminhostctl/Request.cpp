@@ -1,0 +1,324 @@
+#include "adminhostctl/Request.h"
+
+#include "adminhostctl/Failure.h"
+#include "platform/json/Json.h"
+#include "platform/plist/PropertyList.h"
+#include "platform/value/Text.h"
+
+#include <algorithm>
+#include <cctype>
+#include <charconv>
+#include <cstdio>
+#include <ctime>
+#include <optional>
+#include <set>
+#include <span>
+
+namespace adminhost::ctl {
+namespace {
+
+enum class Form { text, json, file };
+
+struct Argument {
+    std::string key;
+    Form form;
+    std::string value;
+};
+
+Argument parseArgument(const std::string& word) {
+    const std::size_t at = word.find_first_of("=@");
+    if (at == std::string::npos || at == 0 || word.starts_with(":=")) {
+        throw usageError("\"" + word + "\" is no KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-");
+    }
+    if (word[at] == '@') {
+        return {word.substr(0, at), Form::file, word.substr(at + 1)};
+    }
+    if (word[at - 1] == ':') {
+        return {word.substr(0, at - 1), Form::json, word.substr(at + 1)};
+    }
+    return {word.substr(0, at), Form::text, word.substr(at + 1)};
+}
+
+/// One step of a key path: a dictionary's key, or the number of a list's element.
+struct Step {
+    std::string text;
+    std::optional<std::size_t> index;
+};
+
+std::vector<Step> stepsOf(const std::string& key) {
+    std::vector<Step> steps;
+    std::size_t begin = 0;
+    while (true) {
+        const std::size_t dot = key.find('.', begin);
+        steps.push_back({key.substr(begin, dot - begin), std::nullopt});
+        if (steps.back().text.empty()) {
+            throw usageError("\"" + key + "\" is no key path");
+        }
+        if (dot == std::string::npos) {
+            return steps;
+        }
+        begin = dot + 1;
+    }
+}
+
+std::optional<std::size_t> indexOf(const std::string& segment) {
+    std::size_t index = 0;
+    const char* const end = segment.data() + segment.size();
+    const auto result = std::from_chars(segment.data(), end, index);
+    return result.ec == std::errc() && result.ptr == end ? std::optional(index) : std::nullopt;
+}
+
+/// The path as descriptions write it ("configuration.properties.0.name" is "configuration.properties[].name"); says of
+/// each step whether it is a list's element.
+std::string describedPath(const Description& command, std::vector<Step>& steps) {
+    std::string path;
+    for (Step& step : steps) {
+        const KeyDescription* above = command.key(path);
+        const auto index = above != nullptr && above->type == "list" ? indexOf(step.text) : std::nullopt;
+        if (index) {
+            step.index = index;
+            path += "[]";
+        } else {
+            path += (path.empty() ? "" : ".") + step.text;
+        }
+    }
+    return path;
+}
+
+/// Whether something above the path takes any value, whatever stands in it.
+bool isBelowAny(const Description& command, const std::string& path) {
+    for (std::size_t at = path.find_last_of(".["); at != std::string::npos && at > 0;
+         at = path.find_last_of(".[", at - 1)) {
+        const KeyDescription* above = command.key(path.substr(0, at));
+        if (above != nullptr && above->type == "any") {
+            return true;
+        }
+    }
+    return false;
+}
+
+void store(Value& node, std::span<const Step> steps, Value value, const std::string& key) {
+    if (steps.empty()) {
+        node = std::move(value);
+        return;
+    }
+    const Step& step = steps.front();
+    if (node.isNull()) {
+        node = step.index ? Value(Array{}) : Value(Dictionary{});
+    }
+    if (Array* array = node.array(); array != nullptr && step.index) {
+        if (*step.index > array->size()) {
+            throw usageError(key + ": the list has " + std::to_string(array->size()) + " elements, so " + step.text +
+                             " is neither one of them nor the next");
+        }
+        if (*step.index == array->size()) {
+            array->emplace_back();
+        }
+        store((*array)[*step.index], steps.subspan(1), std::move(value), key);
+        return;
+    }
+    Dictionary* dictionary = node.dictionary();
+    if (dictionary == nullptr || step.index) {
+        throw usageError(key + ": " + step.text + " does not stand in a " + (step.index ? "list" : "dictionary"));
+    }
+    if (Value* below = dictionary->find(step.text)) {
+        store(*below, steps.subspan(1), std::move(value), key);
+        return;
+    }
+    Value below;
+    store(below, steps.subspan(1), std::move(value), key);
+    dictionary->set(step.text, std::move(below));
+}
+
+/// The key path of a secret in a value that stands on the command line; empty if there is none.
+std::string secretIn(const Description& command, const Value& value, const std::string& path) {
+    if (const KeyDescription* key = command.key(path); key != nullptr && key->secret) {
+        return path;
+    }
+    if (const Dictionary* dictionary = value.dictionary()) {
+        for (const DictionaryEntry& entry : *dictionary) {
+            std::string found = secretIn(command, entry.value, path.empty() ? entry.key : path + '.' + entry.key);
+            if (!found.empty()) {
+                return found;
+            }
+        }
+    } else if (const Array* array = value.array()) {
+        for (const Value& element : *array) {
+            std::string found = secretIn(command, element, path + "[]");
+            if (!found.empty()) {
+                return found;
+            }
+        }
+    }
+    return {};
+}
+
+std::string lowered(std::string text) {
+    std::transform(text.begin(), text.end(), text.begin(),
+                   [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
+    return text;
+}
+
+template <typename Number>
+std::optional<Value> numberOf(const std::string& text) {
+    Number number{};
+    const char* const end = text.data() + text.size();
+    const auto result = std::from_chars(text.data(), end, number);
+    return !text.empty() && result.ec == std::errc() && result.ptr == end ? std::optional<Value>(number) : std::nullopt;
+}
+
+std::optional<Value> booleanOfText(const std::string& text) {
+    const std::string word = lowered(text);
+    if (word == "yes" || word == "true" || word == "on" || word == "y" || word == "t" || word == "1") {
+        return true;
+    }
+    if (word == "no" || word == "false" || word == "off" || word == "n" || word == "f" || word == "0") {
+        return false;
+    }
+    return std::nullopt;
+}
+
+/// "2026-01-31T08:00:00Z", or local time: "2026-01-31 08:00:00", "2026-01-31 08:00", "2026-01-31".
+std::optional<Value> dateOfText(const std::string& text) {
+    if (auto value = parseJson("{\"$date\": " + jsonOf(text) + "}"); value && value->date()) {
+        return value;
+    }
+    for (const char* const rest : {"", ":00", " 00:00:00"}) {
+        if (const auto date = localDateOf(text + rest)) {
+            return Value(*date);
+        }
+    }
+    return std::nullopt;
+}
+
+Value parseStructure(std::string_view bytes, const std::string& from) {
+    const std::size_t begin = bytes.find_first_not_of(" \t\r\n");
+    Error error;
+    auto value = begin != std::string_view::npos && bytes[begin] == '<' ? parsePropertyList(bytes, &error)
+                                                                        : parseJson(bytes, &error);
+    if (!value) {
+        throw usageError(from + ": " + error.description.value_or("cannot be read"));
+    }
+    return std::move(*value);
+}
+
+bool isStructure(const KeyDescription& key) {
+    return key.type == "list" || key.type == "dictionary";
+}
+
+std::string withoutLineEnd(std::string text) {
+    if (text.ends_with('\n')) {
+        text.pop_back();
+        if (text.ends_with('\r')) {
+            text.pop_back();
+        }
+    }
+    return text;
+}
+
+Value valueOfFile(const KeyDescription& key, const std::string& path, const Sources& sources) {
+    if (path.empty()) {
+        throw usageError(key.path + "@ needs the name of a file, or - for standard input");
+    }
+    if (path == "-" && key.secret && sources.terminal) {
+        return sources.ask(key.path);
+    }
+    std::string bytes = sources.read(path);
+    if (key.type == "data") {
+        return Data(bytes.begin(), bytes.end());
+    }
+    if (isStructure(key)) {
+        return parseStructure(bytes, path);
+    }
+    if (!isUtf8(bytes)) {
+        throw usageError(path + " is no UTF-8 text");
+    }
+    return valueOfText(key, withoutLineEnd(std::move(bytes)));
+}
+
+}  // namespace
+
+Value valueOfText(const KeyDescription& key, const std::string& text) {
+    const std::string& type = key.enteredAs.empty() ? key.type : key.enteredAs;
+    if (isStructure(key) || type == "data") {
+        throw usageError(key.path + " takes a " + type + ": write " + key.path +
+                         (type == "data" ? "@FILE" : ":=JSON or " + key.path + "@FILE"));
+    }
+    std::optional<Value> value;
+    std::string wanted;
+    if (type == "integer") {
+        value = numberOf<std::int64_t>(text);
+        if (!value) {
+            value = numberOf<std::uint64_t>(text);
+        }
+        wanted = "whole number";
+    } else if (type == "real") {
+        value = numberOf<double>(text);
+        wanted = "number";
+    } else if (type == "boolean") {
+        value = booleanOfText(text);
+        wanted = "yes or no";
+    } else if (type == "date") {
+        value = dateOfText(text);
+        wanted = "date such as \"2026-01-31 08:00\"";
+    } else {
+        value = text;
+    }
+    if (!value) {
+        throw usageError(key.path + ": \"" + text + "\" is no " + wanted);
+    }
+    return std::move(*value);
+}
+
+Dictionary parseRequest(std::string_view bytes, const std::string& from) {
+    Value value = parseStructure(bytes, from);
+    Dictionary* dictionary = value.dictionary();
+    if (dictionary == nullptr) {
+        throw usageError(from + ": a request is a dictionary, not " + std::string(nameOf(value.type())));
+    }
+    return std::move(*dictionary);
+}
+
+Dictionary buildRequest(const Description& command, Dictionary base, const std::vector<std::string>& arguments,
+                        const Sources& sources) {
+    Value request(std::move(base));
+    std::set<std::string> given;
+    for (const std::string& word : arguments) {
+        const Argument argument = parseArgument(word);
+        if (!given.insert(argument.key).second) {
+            throw usageError(argument.key + " is given twice");
+        }
+        std::vector<Step> steps = stepsOf(argument.key);
+        const std::string path = describedPath(command, steps);
+        const KeyDescription* key = command.key(path);
+        KeyDescription any;
+        if (key == nullptr && isBelowAny(command, path)) {
+            any.path = argument.key;
+            key = &any;
+        }
+        if (key == nullptr && argument.form != Form::json) {
+            throw usageError(command.name() + " has no key " + argument.key + "; see adminhostctl help " +
+                             command.name() + ", or write " + argument.key + ":=JSON to send it all the same");
+        }
+        Value value;
+        if (argument.form == Form::file) {
+            value = valueOfFile(*key, argument.value, sources);
+        } else {
+            value = argument.form == Form::json ? parseStructure(argument.value, argument.key) : Value(argument.value);
+            if (const std::string secret = secretIn(command, value, path); !secret.empty()) {
+                throw usageError(secret + " is secret and others can read command lines: write " + argument.key +
+                                 (secret == path ? "@FILE, or " + argument.key + "@- to be asked" : "@FILE"));
+            }
+            if (argument.form == Form::text) {
+                value = valueOfText(*key, argument.value);
+            }
+        }
+        if (value.isNull()) {
+            throw usageError(argument.key + ": null is no value; leave the key out instead");
+        }
+        store(request, steps, std::move(value), argument.key);
+    }
+    return std::move(*request.dictionary());
+}
+
+}  // namespace adminhost::ctl

@@ -1,0 +1,39 @@
+#pragma once
+
+// The request dictionary, from what stands on the command line.
+
+#include "adminhostctl/Description.h"
+#include "platform/value/Value.h"
+
+#include <functional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace adminhost::ctl {
+
+/// Where values come from that do not stand on the command line. Each throws Failure when it cannot be read.
+struct Sources {
+    /// The bytes of a file; "-" is standard input.
+    std::function<std::string(const std::string& path)> read;
+    /// Asks a person without showing what is typed; only called when standard input is a terminal.
+    std::function<std::string(const std::string& key)> ask;
+    bool terminal = false;  ///< standard input is one
+};
+
+/// Builds the request. Each argument is KEY=TEXT (converted to the key's type), KEY:=JSON, KEY@FILE or KEY@- (standard
+/// input; a secret is asked for at a terminal). KEY is a path with dots; a number names a list's element, which must be
+/// there or be the next one. A file of text loses one line end at its end; where a list or a dictionary belongs it
+/// holds JSON or an XML property list. Arguments replace what stands in the base request.
+/// Throws Failure(usage): an argument of another form, a key that is not described (KEY:=JSON may bring one), a
+/// text that does not fit its key, a secret on the command line, a key twice.
+[[nodiscard]] Dictionary buildRequest(const Description& command, Dictionary base,
+                                      const std::vector<std::string>& arguments, const Sources& sources);
+
+/// The dictionary of a whole request: JSON, or an XML property list. Throws Failure(usage) with line and column.
+[[nodiscard]] Dictionary parseRequest(std::string_view bytes, const std::string& from);
+
+/// The value of a text for a key; throws Failure(usage) when it does not fit.
+[[nodiscard]] Value valueOfText(const KeyDescription& key, const std::string& text);
+
+}  // namespace adminhost::ctl

@@ -1,0 +1,54 @@
+#pragma once
+
+// The daemon, as the verbs use it.
+
+#include "adminhostctl/Connection.h"
+#include "adminhostctl/Description.h"
+#include "platform/value/Value.h"
+
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace adminhost::ctl {
+
+/// A plug-in that the daemon runs.
+struct PluginInfo {
+    std::string name;
+    std::vector<Description> commands;
+};
+
+/// A command and the plug-in that serves it.
+struct CommandRef {
+    std::string plugin;
+    Description description;
+};
+
+class Service {
+  public:
+    explicit Service(std::string socketPath) : _connection(std::move(socketPath)) {}
+
+    /// What runs now: the daemon's own account of itself.
+    [[nodiscard]] Value overview();
+    /// Every plug-in with its commands.
+    [[nodiscard]] const std::vector<PluginInfo>& plugins();
+    /// The command of that name, "PLUGIN/COMMAND" where two plug-ins have it. Throws Failure(usage) with the known
+    /// ones.
+    [[nodiscard]] CommandRef command(const std::string& name);
+    /// The answer; nothing for an answer of nothing. Throws Failure with the daemon's message, its findings and, after
+    /// a failure inside the service, the log lines of the request.
+    [[nodiscard]] std::optional<Value> perform(const CommandRef& command, const Dictionary& request);
+
+  private:
+    [[nodiscard]] Value get(const std::string& path);
+    [[noreturn]] void fail(const HttpAnswer& answer);
+
+    Connection _connection;
+    std::optional<std::vector<PluginInfo>> _plugins;
+};
+
+/// What the answer says of a failure: a status that is not 0, or a key that the description lists under its errors.
+/// One sentence; empty when the answer is none of an error.
+[[nodiscard]] std::string errorOf(const Description& command, const Dictionary& answer);
+
+}  // namespace adminhost::ctl

@@ -1,0 +1,117 @@
+#include "adminhostctl/Table.h"
+
+#include "adminhostctl/Width.h"
+
+#include <algorithm>
+#include <cctype>
+#include <numeric>
+#include <utility>
+
+namespace adminhost::ctl {
+namespace {
+
+constexpr std::size_t gap = 2;
+constexpr std::size_t leastWidth = 12;  ///< columns are not narrowed below
+
+std::string capitals(std::string text) {
+    std::transform(text.begin(), text.end(), text.begin(),
+                   [](unsigned char c) { return c == '_' ? ' ' : static_cast<char>(std::toupper(c)); });
+    return text;
+}
+
+bool isNumber(std::string_view text) {
+    return !text.empty() && text.find_first_not_of("0123456789.,-") == std::string_view::npos;
+}
+
+}  // namespace
+
+Table::Table(std::vector<std::string> headings) : _headings(std::move(headings)) {
+    for (std::string& heading : _headings) {
+        heading = capitals(std::move(heading));
+    }
+}
+
+void Table::addRow(std::vector<std::string> cells) {
+    cells.resize(_headings.size());
+    _rows.push_back(std::move(cells));
+}
+
+/// Narrows the widest columns until all fit; answers whether they do.
+bool Table::narrow(std::vector<Column>& columns, std::size_t width, std::size_t indent) {
+    const std::size_t gaps = columns.empty() ? 0 : gap * (columns.size() - 1);
+    std::size_t total = std::accumulate(columns.begin(), columns.end(), indent + gaps,
+                                        [](std::size_t sum, const Column& column) { return sum + column.width; });
+    while (total > width) {
+        const auto widest = std::max_element(columns.begin(), columns.end(),
+                                             [](const Column& a, const Column& b) { return a.width < b.width; });
+        if (widest->width <= leastWidth) {
+            return false;
+        }
+        --widest->width;
+        --total;
+    }
+    return true;
+}
+
+std::vector<Table::Column> Table::columns() const {
+    std::vector<Column> columns;
+    for (std::size_t at = 0; at < _headings.size(); ++at) {
+        Column column{at, widthOf(_headings[at]), true};
+        bool empty = true;
+        for (const auto& row : _rows) {
+            empty = empty && row[at].empty();
+            column.number = column.number && (row[at].empty() || isNumber(row[at]));
+            for (const std::string& line : wrapped(row[at], SIZE_MAX)) {
+                column.width = std::max(column.width, widthOf(line));
+            }
+        }
+        if (!empty) {
+            columns.push_back(column);
+        }
+    }
+    return columns;
+}
+
+void Table::appendRow(std::string& text, const std::vector<std::string>& cells, const std::vector<Column>& columns,
+                      std::size_t indent) const {
+    std::vector<std::vector<std::string>> lines;
+    std::size_t height = 1;
+    for (const Column& column : columns) {
+        lines.push_back(wrapped(cells[column.at], column.width));
+        height = std::max(height, lines.back().size());
+    }
+    for (std::size_t i = 0; i < height; ++i) {
+        std::string line(indent, ' ');
+        for (std::size_t c = 0; c < columns.size(); ++c) {
+            const std::string cell = i < lines[c].size() ? lines[c][i] : std::string();
+            const std::size_t used = widthOf(cell);
+            const std::string fill(columns[c].width > used ? columns[c].width - used : 0, ' ');
+            line += columns[c].number ? fill + cell : cell + fill;
+            line.append(gap, ' ');
+        }
+        line.erase(line.find_last_not_of(' ') + 1);
+        text += line + '\n';
+    }
+}
+
+std::string Table::text(std::size_t width, std::size_t indent) const {
+    const std::vector<Column> natural = columns();
+    std::vector<Column> columns = natural;
+    std::string leftOut;
+    while (!narrow(columns, width, indent) && columns.size() > 1) {
+        const std::size_t last = columns.size() - 1;
+        leftOut.insert(0, _headings[natural[last].at] + (leftOut.empty() ? "" : ", "));
+        columns.assign(natural.begin(), natural.begin() + static_cast<std::ptrdiff_t>(last));
+    }
+    std::string text;
+    appendRow(text, _headings, columns, indent);
+    for (const auto& row : _rows) {
+        appendRow(text, row, columns, indent);
+    }
+    if (!leftOut.empty()) {
+        text.append(indent, ' ').append("(not shown for want of room: " + leftOut + ")\n");
+    }
+    return text;
+}
+
+}  // namespace adminhost::ctl

@@ -1,0 +1,38 @@
+#pragma once
+
+// A table for reading, fitted to a width.
+
+#include <cstddef>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace adminhost::ctl {
+
+/// Headings in capitals, two blanks between columns, numbers to the right. A table that is too wide has its widest
+/// columns narrowed and their texts wrapped; if that is not enough, its last columns are left out and named below.
+class Table {
+  public:
+    explicit Table(std::vector<std::string> headings);
+
+    /// One cell for each heading; texts as shown() answers them.
+    void addRow(std::vector<std::string> cells);
+    /// Every line ends in a line feed and begins with so many blanks. Columns that are empty in all rows are left out.
+    [[nodiscard]] std::string text(std::size_t width, std::size_t indent) const;
+
+  private:
+    struct Column {
+        std::size_t at;
+        std::size_t width;
+        bool number;
+    };
+    [[nodiscard]] std::vector<Column> columns() const;
+    [[nodiscard]] static bool narrow(std::vector<Column>& columns, std::size_t width, std::size_t indent);
+    void appendRow(std::string& text, const std::vector<std::string>& cells, const std::vector<Column>& columns,
+                   std::size_t indent) const;
+
+    std::vector<std::string> _headings;
+    std::vector<std::vector<std::string>> _rows;
+};
+
+}  // namespace adminhost::ctl

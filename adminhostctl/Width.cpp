@@ -1,0 +1,134 @@
+#include "adminhostctl/Width.h"
+
+#include "platform/value/Text.h"
+
+#include <algorithm>
+#include <clocale>
+#include <cstdint>
+#include <cwchar>
+
+#include <fmt/format.h>
+
+namespace adminhost::ctl {
+namespace {
+
+/// One character of well-formed UTF-8.
+struct Character {
+    char32_t code;
+    std::size_t size;
+};
+
+Character characterAt(std::string_view text, std::size_t at) noexcept {
+    const auto byte = [&](std::size_t i) { return static_cast<unsigned char>(text[at + i]); };
+    const unsigned first = byte(0);
+    const std::size_t size = first < 0x80 ? 1 : first < 0xE0 ? 2 : first < 0xF0 ? 3 : 4;
+    if (size == 1 || at + size > text.size()) {
+        return {first, 1};
+    }
+    char32_t code = first & (0xFFU >> (size + 1));
+    for (std::size_t i = 1; i < size; ++i) {
+        code = (code << 6U) | (byte(i) & 0x3FU);
+    }
+    return {code, size};
+}
+
+/// Widths are those of the C library's Unicode locale, whatever locale the program runs in.
+class UnicodeLocale {
+  public:
+    UnicodeLocale() noexcept : _locale(::newlocale(LC_CTYPE_MASK, "C.UTF-8", nullptr)) {}
+    ~UnicodeLocale() {
+        if (_locale != nullptr) {
+            ::freelocale(_locale);
+        }
+    }
+    UnicodeLocale(const UnicodeLocale&) = delete;
+    UnicodeLocale& operator=(const UnicodeLocale&) = delete;
+
+    [[nodiscard]] std::size_t width(char32_t code) const noexcept {
+        if (code < 0x80 || _locale == nullptr) {
+            return 1;
+        }
+        const ::locale_t before = ::uselocale(_locale);
+        const int width = ::wcwidth(static_cast<wchar_t>(code));
+        ::uselocale(before);
+        return width < 0 ? 1 : static_cast<std::size_t>(width);
+    }
+
+  private:
+    ::locale_t _locale;
+};
+
+std::size_t widthOfCode(char32_t code) {
+    static const UnicodeLocale locale;
+    return locale.width(code);
+}
+
+bool isActedOn(char32_t code) noexcept {
+    return code < 0x20 || (code >= 0x7F && code < 0xA0) || code == 0x061C || (code >= 0x200E && code <= 0x200F) ||
+           (code >= 0x2028 && code <= 0x202E) || (code >= 0x2066 && code <= 0x2069);
+}
+
+/// Length of the longest beginning that takes at most so many columns; at least one character.
+std::size_t fitting(std::string_view text, std::size_t width) {
+    std::size_t at = 0;
+    std::size_t used = 0;
+    while (at < text.size()) {
+        const Character character = characterAt(text, at);
+        const std::size_t more = widthOfCode(character.code);
+        if (used + more > width && at > 0) {
+            break;
+        }
+        used += more;
+        at += character.size;
+    }
+    return at;
+}
+
+}  // namespace
+
+std::string shown(std::string_view text) {
+    const std::string clean = utf8Of(text);
+    std::string out;
+    for (std::size_t at = 0; at < clean.size();) {
+        const Character character = characterAt(clean, at);
+        if (character.code != '\n' && isActedOn(character.code)) {
+            out += character.code < 0x100 ? fmt::format("\\x{:02x}", static_cast<std::uint32_t>(character.code))
+                                          : fmt::format("\\u{:04x}", static_cast<std::uint32_t>(character.code));
+        } else {
+            out.append(clean, at, character.size);
+        }
+        at += character.size;
+    }
+    return out;
+}
+
+std::size_t widthOf(std::string_view text) {
+    std::size_t width = 0;
+    for (std::size_t at = 0; at < text.size();) {
+        const Character character = characterAt(text, at);
+        width += widthOfCode(character.code);
+        at += character.size;
+    }
+    return width;
+}
+
+std::vector<std::string> wrapped(std::string_view text, std::size_t width) {
+    std::vector<std::string> lines;
+    do {
+        std::size_t end = std::min(text.find('\n'), text.size());
+        std::string_view line = text.substr(0, end);
+        text.remove_prefix(std::min(end + 1, text.size()));
+        while (widthOf(line) > width) {
+            std::size_t cut = fitting(line, width);
+            const std::size_t blank = line.rfind(' ', cut);
+            const bool atBlank = blank != std::string_view::npos && blank > 0;
+            cut = atBlank ? blank : cut;
+            lines.emplace_back(line.substr(0, cut));
+            line.remove_prefix(cut + (atBlank ? 1U : 0U));
+        }
+        lines.emplace_back(line);
+    } while (!text.empty());
+    return lines;
+}
+
+}  // namespace adminhost::ctl

@@ -1,0 +1,278 @@
+#include "adminhostctl/Failure.h"
+#include "adminhostctl/Request.h"
+#include "commands/CommandTable.h"
+
+#include <map>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace {
+
+using adminhost::Array;
+using adminhost::Data;
+using adminhost::Date;
+using adminhost::Dictionary;
+using adminhost::Value;
+using adminhost::ctl::Description;
+using adminhost::ctl::ExitStatus;
+using adminhost::ctl::Failure;
+using adminhost::ctl::KeyDescription;
+using adminhost::ctl::Sources;
+using testing::HasSubstr;
+
+Description describe(std::string_view name) {
+    const Value all = lumio::describeCommands();
+    for (const Value& command : *all.array()) {
+        if (command.dictionary()->get("name") == Value(name)) {
+            return Description(*command.dictionary());
+        }
+    }
+    return {};
+}
+
+/// Files that a test gives, and a person who types.
+struct Given {
+    std::map<std::string, std::string> files;
+    std::string typed;
+    bool terminal = false;
+
+    [[nodiscard]] Sources sources() const {
+        return {[this](const std::string& path) {
+                    const auto found = files.find(path);
+                    if (found == files.end()) {
+                        throw adminhost::ctl::usageError(path + ": No such file or directory");
+                    }
+                    return found->second;
+                },
+                [this](const std::string&) { return typed; }, terminal};
+    }
+};
+
+Dictionary build(std::string_view command, const std::vector<std::string>& arguments, const Given& given = {},
+                 Dictionary base = {}) {
+    return adminhost::ctl::buildRequest(describe(command), std::move(base), arguments, given.sources());
+}
+
+std::string usageOf(std::string_view command, const std::vector<std::string>& arguments, const Given& given = {},
+                    Dictionary base = {}) {
+    try {
+        build(command, arguments, given, std::move(base));
+    } catch (const Failure& failure) {
+        EXPECT_EQ(failure.status(), ExitStatus::usage);
+        return failure.what();
+    }
+    ADD_FAILURE() << "no usage error";
+    return {};
+}
+
+KeyDescription keyOf(const char* type) {
+    KeyDescription key;
+    key.path = "key";
+    key.type = type;
+    return key;
+}
+Value convert(const char* type, const std::string& text) {
+    return adminhost::ctl::valueOfText(keyOf(type), text);
+}
+std::string refused(const char* type, const std::string& text) {
+    try {
+        convert(type, text);
+    } catch (const Failure& failure) {
+        EXPECT_EQ(failure.status(), ExitStatus::usage);
+        return failure.what();
+    }
+    ADD_FAILURE() << type << " took " << text;
+    return {};
+}
+
+TEST(BuildRequest, ADottedKeyMakesNestedDictionaries) {
+    EXPECT_EQ(build("readSettings", {"optionalArguments.variant=getCameras"}),
+              (Dictionary{{"optionalArguments", Dictionary{{"variant", "getCameras"}}}}));
+}
+
+TEST(BuildRequest, NoArgumentsMakeAnEmptyRequest) {
+    EXPECT_TRUE(build("getCameras", {}).empty());
+}
+
+TEST(BuildRequest, ATextIsConvertedToTheTypeInWhichASettingIsEntered) {
+    EXPECT_EQ(build("writeSettings", {"configuration.server_port=8170", "configuration.server_host=8170",
+                                      "configuration.sorvane_capture_web_enabled=yes"}),
+              (Dictionary{{"configuration", Dictionary{{"server_port", 8170},
+                                                       {"server_host", "8170"},
+                                                       {"sorvane_capture_web_enabled", true}}}}));
+}
+
+TEST(BuildRequest, ATextThatDoesNotFitItsKeyIsAUsageError) {
+    EXPECT_EQ(usageOf("writeSettings", {"configuration.server_port=eighty"}),
+              "configuration.server_port: \"eighty\" is no whole number");
+}
+
+TEST(BuildRequest, JsonSaysItsTypeItself) {
+    EXPECT_EQ(build("readSettings", {"optionalArguments.languages:=[\"de\", \"en\"]"}),
+              (Dictionary{{"optionalArguments", Dictionary{{"languages", Array{"de", "en"}}}}}));
+    EXPECT_EQ(build("writeSettings", {"configuration.server_port:=\"8170\""}),
+              (Dictionary{{"configuration", Dictionary{{"server_port", "8170"}}}}));
+}
+
+TEST(BuildRequest, BrokenJsonIsAUsageErrorWithItsPlace) {
+    EXPECT_THAT(usageOf("readSettings", {"optionalArguments:={\"a\" 1}"}),
+                HasSubstr("optionalArguments: line 1, column 6: "));
+    EXPECT_THAT(usageOf("readSettings", {"optionalArguments:=null"}), HasSubstr("null is no value"));
+}
+
+TEST(BuildRequest, OnlyJsonBringsAKeyThatIsNotDescribed) {
+    EXPECT_THAT(usageOf("readSettings", {"optionalArguments.variannt=getConfig"}),
+                HasSubstr("has no key optionalArguments.variannt"));
+    EXPECT_THAT(usageOf("readSettings", {"colour@file"}), HasSubstr("has no key colour"));
+    EXPECT_EQ(build("readSettings", {"colour:=5"}), (Dictionary{{"colour", 5}}));
+}
+
+TEST(BuildRequest, AKeyThatTakesAnythingTakesText) {
+    EXPECT_EQ(build("getState", {"variant=withDetails"}), (Dictionary{{"variant", "withDetails"}}));
+    EXPECT_EQ(build("getState", {"variant.deep.er=x"}),
+              (Dictionary{{"variant", Dictionary{{"deep", Dictionary{{"er", "x"}}}}}}));
+}
+
+TEST(BuildRequest, AListTakesJsonOrAFileButNoText) {
+    EXPECT_THAT(usageOf("readSettings", {"optionalArguments.languages=de"}),
+                HasSubstr("takes a list: write optionalArguments.languages:=JSON or optionalArguments.languages@FILE"));
+    EXPECT_EQ(build("readSettings", {"optionalArguments.languages@f"}, {{{"f", " [\"de\"]\n"}}, "", false}),
+              (Dictionary{{"optionalArguments", Dictionary{{"languages", Array{"de"}}}}}));
+}
+
+TEST(BuildRequest, NumbersNameTheElementsOfAList) {
+    EXPECT_EQ(
+        build("writeSettings", {"configuration.properties.0._newid_=yes", "configuration.properties.0.name=a",
+                                "configuration.properties.1._id_=4", "configuration.properties.1.value=7"}),
+        (Dictionary{{"configuration", Dictionary{{"properties", Array{Dictionary{{"_newid_", true}, {"name", "a"}},
+                                                                      Dictionary{{"_id_", 4}, {"value", "7"}}}}}}}));
+    EXPECT_THAT(usageOf("writeSettings", {"configuration.properties.1.name=a"}),
+                HasSubstr("neither one of them nor the next"));
+}
+
+TEST(BuildRequest, ArgumentsReplaceWhatTheFileHolds) {
+    const Dictionary base = {{"configuration", Dictionary{{"server_port", 1}, {"server_host", "a"}}}};
+    EXPECT_EQ(build("writeSettings", {"configuration.server_port=2"}, {}, base),
+              (Dictionary{{"configuration", Dictionary{{"server_port", 2}, {"server_host", "a"}}}}));
+}
+
+TEST(BuildRequest, AKeyBelowSomethingThatIsNoDictionaryIsAUsageError) {
+    EXPECT_THAT(usageOf("writeSettings", {"configuration.server_port=2"}, {}, {{"configuration", "text"}}),
+                HasSubstr("server_port does not stand in a dictionary"));
+}
+
+TEST(BuildRequest, AKeyGivenTwiceIsAUsageError) {
+    EXPECT_THAT(usageOf("getState", {"variant=a", "variant=b"}), HasSubstr("given twice"));
+}
+
+TEST(BuildRequest, WordsOfAnotherFormAreUsageErrors) {
+    for (const char* word : {"variant", "=x", "@x", ":=5", "", "a..b=x", ".a=x", "a.=x"}) {
+        EXPECT_THAT(usageOf("getState", {word}), HasSubstr("is no ")) << word;
+    }
+}
+
+TEST(BuildRequest, AValueMayHoldTheSignsThatSeparate) {
+    EXPECT_EQ(build("getState", {"variant=a=b@c:=d"}), (Dictionary{{"variant", "a=b@c:=d"}}));
+    EXPECT_EQ(build("getState", {"variant="}), (Dictionary{{"variant", ""}}));
+}
+
+TEST(BuildRequest, ASecretIsRefusedOnTheCommandLine) {
+    EXPECT_THAT(usageOf("validateSettings", {"nimbo_client_password=hunter2"}),
+                testing::AllOf(HasSubstr("nimbo_client_password is secret"), testing::Not(HasSubstr("hunter2"))));
+    EXPECT_THAT(usageOf("validateSettings", {"nimbo_client_password:=\"hunter2\""}), HasSubstr("is secret"));
+    EXPECT_THAT(usageOf("writeSettings", {"configuration:={\"nimbo_client_password\": \"hunter2\"}"}),
+                HasSubstr("configuration.nimbo_client_password is secret"));
+}
+
+TEST(BuildRequest, ASecretComesFromAFileWithoutItsLineEnd) {
+    for (const char* content : {"hunter2", "hunter2\n", "hunter2\r\n"}) {
+        EXPECT_EQ(build("validateSettings", {"nimbo_client_password@f"}, {{{"f", content}}, "", false}),
+                  (Dictionary{{"nimbo_client_password", "hunter2"}}));
+    }
+    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@f"}, {{{"f", "two\nlines\n\n"}}, "", false}),
+              (Dictionary{{"nimbo_client_password", "two\nlines\n"}}));
+}
+
+TEST(BuildRequest, ASecretIsAskedForAtATerminalAndReadFromAPipe) {
+    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@-"}, {{}, "typed", true}),
+              (Dictionary{{"nimbo_client_password", "typed"}}));
+    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@-"}, {{{"-", "piped\n"}}, "typed", false}),
+              (Dictionary{{"nimbo_client_password", "piped"}}));
+    EXPECT_EQ(build("validateSettings", {"shared_filesystem@-"}, {{{"-", "/srv\n"}}, "typed", true}),
+              (Dictionary{{"shared_filesystem", "/srv"}}))
+        << "what is no secret is read, not asked for";
+}
+
+TEST(BuildRequest, AFileThatCannotServeIsAUsageError) {
+    EXPECT_THAT(usageOf("getState", {"variant@missing"}), HasSubstr("missing: No such file"));
+    EXPECT_THAT(usageOf("getState", {"variant@"}), HasSubstr("needs the name of a file"));
+    EXPECT_THAT(usageOf("validateSettings", {"shared_filesystem@f"}, {{{"f", "\xFF"}}, "", false}),
+                HasSubstr("no UTF-8 text"));
+}
+
+TEST(ParseRequest, ReadsJsonAndPropertyLists) {
+    const Dictionary wanted = {{"variant", "withDetails"}};
+    EXPECT_EQ(adminhost::ctl::parseRequest("{\"variant\": \"withDetails\"}", "f"), wanted);
+    EXPECT_EQ(adminhost::ctl::parseRequest(
+                  "\n<plist version=\"1.0\"><dict><key>variant</key><string>withDetails</string></dict></plist>", "f"),
+              wanted);
+}
+
+TEST(ParseRequest, NamesFileLineAndColumn) {
+    for (const auto& [bytes, message] :
+         std::map<std::string, std::string>{{"{\n  \"a\" 1}", "f: line 2, column "},
+                                            {"[1]", "f: a request is a dictionary, not list"},
+                                            {"", "f: line 1, column "}}) {
+        try {
+            static_cast<void>(adminhost::ctl::parseRequest(bytes, "f"));
+            ADD_FAILURE() << bytes;
+        } catch (const Failure& failure) {
+            EXPECT_EQ(failure.status(), ExitStatus::usage);
+            EXPECT_THAT(failure.what(), HasSubstr(message));
+        }
+    }
+}
+
+TEST(ValueOfText, ReadsWholeNumbersOfTheWholeRange) {
+    EXPECT_EQ(convert("integer", "-9223372036854775808"), Value(INT64_MIN));
+    EXPECT_EQ(convert("integer", "18446744073709551615"), Value(UINT64_MAX));
+    for (const char* text : {"", "1.0", "1e3", " 1", "1 ", "0x1", "18446744073709551616", "+1"}) {
+        EXPECT_THAT(refused("integer", text), HasSubstr("is no whole number")) << text;
+    }
+}
+
+TEST(ValueOfText, ReadsNumbersBooleansAndText) {
+    EXPECT_EQ(convert("real", "1.5"), Value(1.5));
+    EXPECT_THAT(refused("real", "1,5"), HasSubstr("is no number"));
+    for (const char* text : {"yes", "TRUE", "on", "1", "t", "Y"}) {
+        EXPECT_EQ(convert("boolean", text), Value(true)) << text;
+    }
+    for (const char* text : {"no", "False", "off", "0", "f"}) {
+        EXPECT_EQ(convert("boolean", text), Value(false)) << text;
+    }
+    EXPECT_THAT(refused("boolean", "maybe"), HasSubstr("is no yes or no"));
+    EXPECT_EQ(convert("text", "5"), Value("5"));
+    EXPECT_EQ(convert("scalar", "5"), Value("5")) << "nothing says that it is entered as a number";
+}
+
+TEST(ValueOfText, ReadsDatesInUniversalAndInLocalTime) {
+    const Value wanted(Date(std::chrono::seconds(1769846400)));
+    EXPECT_EQ(convert("date", "2026-01-31T08:00:00Z"), wanted);
+    EXPECT_EQ(convert("date", "2026-01-31 09:00:00"), wanted);
+    EXPECT_EQ(convert("date", "2026-01-31 09:00"), wanted);
+    EXPECT_EQ(convert("date", "2026-01-31"), Value(Date(std::chrono::seconds(1769846400 - 9 * 3600))));
+    for (const char* text : {"yesterday", "2026-02-30", "2026-01-31 25:00", ""}) {
+        EXPECT_THAT(refused("date", text), HasSubstr("is no date")) << text;
+    }
+}
+
+TEST(ValueOfText, DataComesFromAFile) {
+    EXPECT_THAT(refused("data", "AAEC"), HasSubstr("write key@FILE"));
+    Dictionary command = {{"name", "x"}, {"keys", Array{Dictionary{{"path", "blob"}, {"type", "data"}}}}};
+    const Given given{{{"f", std::string("\0\xFF\n", 3)}}, "", false};
+    EXPECT_EQ(adminhost::ctl::buildRequest(Description(command), {}, {"blob@f"}, given.sources()),
+              (Dictionary{{"blob", Data{0, 0xFF, '\n'}}}));
+}
+
+}  // namespace
