@@ -148,6 +148,9 @@ CommandRef Service::command(const std::string& name) {
     if (found.size() == 1) {
         return found.front();
     }
+    if (plugins().empty()) {
+        throw Failure(ExitStatus::answeredError, "the daemon has loaded no plug-in; adminhostctl status says more");
+    }
     if (found.empty()) {
         throw usageError("there is no command " + shown(name) + "; there are " + joined(plugins()));
     }

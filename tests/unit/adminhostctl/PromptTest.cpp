@@ -1,0 +1,123 @@
+#include "adminhostctl/Failure.h"
+#include "adminhostctl/Prompt.h"
+
+#include <csignal>
+#include <functional>
+#include <string>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <pty.h>
+#include <sys/wait.h>
+#include <termios.h>
+#include <unistd.h>
+
+namespace {
+
+using testing::HasSubstr;
+using testing::Not;
+
+/// A child process on a terminal of its own.
+class OnTerminal {
+  public:
+    explicit OnTerminal(const std::function<int()>& program) {
+        _pid = ::forkpty(&_terminal, nullptr, nullptr, nullptr);
+        if (_pid == 0) {
+            ::_exit(program());
+        }
+    }
+    ~OnTerminal() { ::close(_terminal); }
+    OnTerminal(const OnTerminal&) = delete;
+    OnTerminal& operator=(const OnTerminal&) = delete;
+
+    void type(const std::string& text) const {
+        ASSERT_EQ(::write(_terminal, text.data(), text.size()), static_cast<ssize_t>(text.size()));
+    }
+    /// Reads what the terminal shows until the text has come, or the child has ended.
+    const std::string& showsUntil(const std::string& text) {
+        while (_shown.find(text) == std::string::npos) {
+            char bytes[256];
+            const ssize_t count = ::read(_terminal, bytes, sizeof bytes);
+            if (count <= 0) {
+                break;
+            }
+            _shown.append(bytes, static_cast<std::size_t>(count));
+        }
+        return _shown;
+    }
+    [[nodiscard]] bool echoes() const {
+        termios now{};
+        return ::tcgetattr(_terminal, &now) == 0 && (now.c_lflag & ECHO) != 0;
+    }
+    [[nodiscard]] int wait() const {
+        int status = 0;
+        EXPECT_EQ(::waitpid(_pid, &status, 0), _pid);
+        return status;
+    }
+
+  private:
+    int _terminal = -1;
+    pid_t _pid = -1;
+    std::string _shown;
+};
+
+int say(const std::string& text) {
+    return ::write(STDOUT_FILENO, text.data(), text.size()) < 0 ? 1 : 0;
+}
+
+int askAndSayLength() {
+    try {
+        const std::string secret = adminhost::ctl::askSecret("password");
+        return say("length " + std::to_string(secret.size()) + (secret == "hunter2" ? " right." : " wrong."));
+    } catch (const adminhost::ctl::Failure& failure) {
+        say(std::string("failed: ") + failure.what() + ".");
+        return static_cast<int>(failure.status());
+    }
+}
+
+TEST(AskSecret, ShowsNothingOfWhatIsTyped) {
+    OnTerminal child(&askAndSayLength);
+    EXPECT_THAT(child.showsUntil("password: "), HasSubstr("password: "));
+    child.type("hunter2\n");
+    EXPECT_THAT(child.showsUntil("."), testing::AllOf(HasSubstr("length 7 right."), Not(HasSubstr("hunter2"))));
+    EXPECT_EQ(child.wait(), 0);
+}
+
+TEST(AskSecret, PutsTheTerminalBackBeforeASignalEndsTheProgram) {
+    OnTerminal child([] {
+        try {
+            static_cast<void>(adminhost::ctl::askSecret("password"));
+        } catch (const adminhost::ctl::Failure&) {
+            return 7;
+        }
+        return 0;
+    });
+    child.showsUntil("password: ");
+    EXPECT_FALSE(child.echoes());
+    child.type("hun\x03");  // the terminal's interrupt character
+    const int status = child.wait();
+    EXPECT_TRUE(WIFSIGNALED(status));
+    EXPECT_EQ(WTERMSIG(status), SIGINT);
+    EXPECT_TRUE(child.echoes());
+}
+
+TEST(AskSecret, AnEndOfInputWithoutALineIsAUsageError) {
+    OnTerminal child(&askAndSayLength);
+    child.showsUntil("password: ");
+    child.type("\x04");  // end of input
+    EXPECT_THAT(child.showsUntil("given."), HasSubstr("password was not given"));
+    EXPECT_EQ(WEXITSTATUS(child.wait()), 2);
+}
+
+TEST(ReadSource, SaysWhichFileCannotBeRead) {
+    try {
+        static_cast<void>(adminhost::ctl::readSource("/nowhere/file"));
+        ADD_FAILURE();
+    } catch (const adminhost::ctl::Failure& failure) {
+        EXPECT_THAT(failure.what(), HasSubstr("/nowhere/file: No such file"));
+        EXPECT_EQ(failure.status(), adminhost::ctl::ExitStatus::usage);
+    }
+}
+
+}  // namespace

@@ -1,0 +1,95 @@
+// The generator refuses descriptions that are not right, so that a slip is found while building.
+
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <string>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace {
+
+using testing::HasSubstr;
+
+constexpr const char* sound = R"(order = 1
+summary = "Do it"
+[keys.a]
+type = "text"
+help = "An A."
+[example]
+request = '{"a": "x"}'
+)";
+
+/// A directory with a copy of the generator and descriptions of its own.
+class Generate : public testing::Test {
+  protected:
+    void SetUp() override {
+        std::string name = (std::filesystem::temp_directory_path() / "generate.XXXXXX").string();
+        ASSERT_NE(::mkdtemp(name.data()), nullptr);
+        _directory = name;
+        std::filesystem::copy_file(std::string(SOURCE_DIR) + "/commands/generate.py", _directory / "generate.py");
+    }
+    void TearDown() override { std::filesystem::remove_all(_directory); }
+
+    void write(const char* file, const std::string& text) const { std::ofstream(_directory / file) << text; }
+
+    /// What the generator says, followed by its exit status.
+    std::string run(const std::string& arguments) const {
+        const std::string command =
+            "/usr/bin/python3 -B '" + (_directory / "generate.py").string() + "' " + arguments + " 2>&1";
+        std::string said;
+        std::FILE* pipe = ::popen(command.c_str(), "r");
+        char bytes[256];
+        while (pipe != nullptr && std::fgets(bytes, sizeof bytes, pipe) != nullptr) {
+            said += bytes;
+        }
+        return said + "status " + std::to_string(::pclose(pipe) >> 8);
+    }
+    std::string table() const { return run("table '" + (_directory / "table.cpp").string() + "'"); }
+
+    /// What is said of the sound description with one text replaced by another.
+    std::string with(const std::string& from, const std::string& to) const {
+        std::string text = sound;
+        text.replace(text.find(from), from.size(), to);
+        write("doIt.toml", text);
+        return table();
+    }
+
+    std::filesystem::path _directory;
+};
+
+TEST_F(Generate, TakesASoundDescription) {
+    write("doIt.toml", sound);
+    EXPECT_EQ(table(), "status 0");
+    EXPECT_TRUE(std::filesystem::exists(_directory / "table.cpp"));
+}
+
+TEST_F(Generate, RefusesWhatIsNotRightAndNamesTheFile) {
+    EXPECT_THAT(with("summary", "sumary"), testing::AllOf(HasSubstr("doIt.toml: unknown word"), HasSubstr("status 1")));
+    EXPECT_THAT(with("\"text\"", "\"string\""), HasSubstr("doIt.toml: key a: type must be one of"));
+    EXPECT_THAT(with("help = \"An A.\"", ""), HasSubstr("key a: help is missing"));
+    EXPECT_THAT(with("help", "rules = [\"safe\"]\nhelp"), HasSubstr("key a: unknown rule"));
+    EXPECT_THAT(with("[keys.a]", "[keys.\"b.a\"]"), HasSubstr("key b.a: b is not described"));
+    EXPECT_THAT(with("{\"a\": \"x\"}", "{\"a\": 5}"), HasSubstr("example's request: a is not a text"));
+    EXPECT_THAT(with("{\"a\": \"x\"}", "{\"z\": 5}"), HasSubstr("example's request: z is not described"));
+    EXPECT_THAT(with("order = 1", "order = "), HasSubstr("doIt.toml: "));
+}
+
+TEST_F(Generate, RefusesTwoCommandsOfTheSameOrder) {
+    write("doIt.toml", sound);
+    write("doThat.toml", sound);
+    EXPECT_THAT(table(), HasSubstr("two commands have the same order"));
+}
+
+TEST_F(Generate, NoticesAStalePage) {
+    write("doIt.toml", sound);
+    const std::string page = "'" + (_directory / "page.md").string() + "'";
+    EXPECT_EQ(run("docs " + page), "status 0");
+    EXPECT_EQ(run("check " + page), "status 0");
+    write("page.md", "something else");
+    EXPECT_THAT(run("check " + page), testing::AllOf(HasSubstr("is stale"), HasSubstr("status 1")));
+}
+
+}  // namespace
