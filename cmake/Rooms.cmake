@@ -16,6 +16,11 @@ else()
     add_compile_options($<$<NOT:$<CONFIG:Debug>>:-D_FORTIFY_SOURCE=2>)
 endif()
 
+if(ADMINHOST_FUZZ)  # everything that a harness reaches reports its coverage
+    add_compile_options(-fsanitize=fuzzer-no-link,address,undefined -fno-sanitize-recover=all -fno-omit-frame-pointer)
+    add_link_options(-fsanitize=address,undefined)
+endif()
+
 # adminhost_room(NAME SOURCES... LIBS...): a static library of a room's sources.
 function(adminhost_room name)
     cmake_parse_arguments(ROOM "" "" "SOURCES;LIBS" ${ARGN})

@@ -29,7 +29,6 @@ class CountingIterator {
         return *this;
     }
     friend bool operator==(const CountingIterator& a, const CountingIterator& b) { return a._at == b._at; }
-    friend bool operator!=(const CountingIterator& a, const CountingIterator& b) { return a._at != b._at; }
 
   private:
     const char* _at;
