@@ -1,9 +1,9 @@
 // The generator refuses descriptions that are not right, so that a slip is found while building.
 
-#include <cstdio>
+#include "tests/support/Program.h"
+
 #include <filesystem>
 #include <fstream>
-#include <memory>
 #include <string>
 
 #include <gmock/gmock.h>
@@ -36,18 +36,13 @@ class Generate : public testing::Test {
     void write(const char* file, const std::string& text) const { std::ofstream(_directory / file) << text; }
 
     /// What the generator says, followed by its exit status.
-    std::string run(const std::string& arguments) const {
-        const std::string command =
-            "/usr/bin/python3 -B '" + (_directory / "generate.py").string() + "' " + arguments + " 2>&1";
-        std::string said;
-        std::FILE* pipe = ::popen(command.c_str(), "r");
-        char bytes[256];
-        while (pipe != nullptr && std::fgets(bytes, sizeof bytes, pipe) != nullptr) {
-            said += bytes;
-        }
-        return said + "status " + std::to_string(::pclose(pipe) >> 8);
+    std::string run(const std::string& what, const std::string& file) const {
+        const auto result = adminhost::test::runProgram(
+            {"/usr/bin/python3", "-B", (_directory / "generate.py").string(), what, (_directory / file).string()},
+            adminhost::test::Errors::merge);
+        return result.output + "status " + std::to_string(result.status);
     }
-    std::string table() const { return run("table '" + (_directory / "table.cpp").string() + "'"); }
+    std::string table() const { return run("table", "table.cpp"); }
 
     /// What is said of the sound description with one text replaced by another.
     std::string with(const std::string& from, const std::string& to) const {
@@ -85,11 +80,10 @@ TEST_F(Generate, RefusesTwoCommandsOfTheSameOrder) {
 
 TEST_F(Generate, NoticesAStalePage) {
     write("doIt.toml", sound);
-    const std::string page = "'" + (_directory / "page.md").string() + "'";
-    EXPECT_EQ(run("docs " + page), "status 0");
-    EXPECT_EQ(run("check " + page), "status 0");
+    EXPECT_EQ(run("docs", "page.md"), "status 0");
+    EXPECT_EQ(run("check", "page.md"), "status 0");
     write("page.md", "something else");
-    EXPECT_THAT(run("check " + page), testing::AllOf(HasSubstr("is stale"), HasSubstr("status 1")));
+    EXPECT_THAT(run("check", "page.md"), testing::AllOf(HasSubstr("is stale"), HasSubstr("status 1")));
 }
 
 }  // namespace
