@@ -5,9 +5,10 @@
 #include "krb5/KRB5Keytab.h"
 #include "platform/value/Text.h"
 
-#include <cstdio>
 #include <ctime>
+#include <iomanip>
 #include <iostream>
+#include <sstream>
 #include <string>
 #include <string_view>
 
@@ -18,12 +19,20 @@ std::string timeText(adminhost::Date date) {
     const std::time_t seconds = std::chrono::system_clock::to_time_t(date);
     std::tm local{};
     localtime_r(&seconds, &local);
-    char text[32];
-    return {text, std::strftime(text, sizeof text, "%m/%d/%Y %H:%M:%S", &local)};
+    std::ostringstream text;
+    text << std::put_time(&local, "%m/%d/%y %H:%M:%S");
+    return text.str();
 }
 
 std::string textOf(const std::unique_ptr<KRB5Principal>& principal) {
     return adminhost::textOf(principal ? principal->stringValue() : std::nullopt);
+}
+
+/// The short name, as klist prints it; enctypeString() is the long one.
+std::string enctypeName(const KRB5KeytabEntry& entry) {
+    char name[100];
+    const auto enctype = static_cast<krb5_enctype>(entry.enctype());
+    return krb5_enctype_to_name(enctype, 0, name, sizeof name) == 0 ? name : entry.enctypeString();
 }
 
 bool listCache(const std::string& type, const std::string& name) {
@@ -39,7 +48,7 @@ bool listCache(const std::string& type, const std::string& name) {
     }
     std::cout << "Ticket cache: " << adminhost::textOf(cache->type()) << ":" << adminhost::textOf(cache->name())
               << "\nDefault principal: " << textOf(principal)
-              << "\n\nValid starting       Expires              Service principal\n";
+              << "\n\nValid starting     Expires            Service principal\n";
     for (const KRB5Credential& credential : cache->credentials()) {
         const auto server = credential.serverPrincipal();
         if (server && server->realm() == "X-CACHECONF:") {
@@ -63,12 +72,12 @@ bool listKeytab(const std::string& type, const std::string& name) {
         std::cerr << "cannot open keytab " << type << ":" << name << "\n";
         return false;
     }
-    std::cout << "Keytab name: " << keytab->description() << "\nKVNO Timestamp           Principal\n"
-              << "---- ------------------- ------------------------------------------------------\n";
+    std::cout << "Keytab name: " << keytab->description() << "\nKVNO Timestamp         Principal\n"
+              << "---- ----------------- --------------------------------------------------------\n";
     for (const KRB5KeytabEntry& entry : keytab->entries()) {
         const std::string vno = std::to_string(entry.vno());
         std::cout << std::string(vno.size() < 4 ? 4 - vno.size() : 0, ' ') << vno << " " << timeText(entry.timestamp())
-                  << " " << textOf(entry.principal()) << " (" << entry.enctypeString() << ") \n";
+                  << " " << textOf(entry.principal()) << " (" << enctypeName(entry) << ") \n";
     }
     if (keytab->errorCode() != KRB5_KT_END) {
         std::cerr << keytab->errorMessage() << "\n";

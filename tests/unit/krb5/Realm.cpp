@@ -72,6 +72,8 @@ std::string contentsOf(const std::string& path) {
 }
 
 void write(const std::string& path, const std::string& bytes) {
+    // A new file: some file systems wait for the disk when an old one is rewritten.
+    std::filesystem::remove(path);
     std::ofstream file(path, std::ios::binary);
     file << bytes;
     ASSERT_TRUE(file.flush()) << path;

@@ -1,0 +1,227 @@
+// Kerberos when the world is broken: KDCs, clocks, disks and files.
+
+#include "krb5/KRB5CredentialCache.h"
+#include "tests/unit/krb5/Realm.h"
+
+#include <csignal>
+#include <ctime>
+
+#include <netinet/in.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <sys/time.h>
+#include <unistd.h>
+
+namespace {
+
+int clockShift = 0;
+
+}  // namespace
+
+/// The clock that the Kerberos library reads, in front of the real one.
+extern "C" int gettimeofday(timeval* __restrict now, void* __restrict /*zone*/) noexcept {
+    timespec real{};
+    clock_gettime(CLOCK_REALTIME, &real);
+    now->tv_sec = real.tv_sec + clockShift;
+    now->tv_usec = real.tv_nsec / 1000;
+    return 0;
+}
+
+namespace lumio {
+namespace {
+
+/// For a while, this program's clock is that many seconds fast.
+class ShiftedClock {
+  public:
+    explicit ShiftedClock(int seconds) { clockShift = seconds; }
+    ShiftedClock(const ShiftedClock&) = delete;
+    ShiftedClock& operator=(const ShiftedClock&) = delete;
+    ~ShiftedClock() { clockShift = 0; }
+};
+
+/// A loopback port that is taken and refuses connections.
+class ClosedPort {
+  public:
+    ClosedPort() : _socket(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+        sockaddr_in address{};
+        address.sin_family = AF_INET;
+        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t length = sizeof address;
+        EXPECT_EQ(bind(_socket, reinterpret_cast<const sockaddr*>(&address), length), 0);
+        EXPECT_EQ(getsockname(_socket, reinterpret_cast<sockaddr*>(&address), &length), 0);
+        _port = ntohs(address.sin_port);
+    }
+    ClosedPort(const ClosedPort&) = delete;
+    ClosedPort& operator=(const ClosedPort&) = delete;
+    ~ClosedPort() { close(_socket); }
+    [[nodiscard]] int port() const { return _port; }
+
+  private:
+    int _socket;
+    int _port = 0;
+};
+
+/// No file of this process grows beyond the size: a full disk.
+class FullDisk {
+  public:
+    explicit FullDisk(rlim_t size) : _formerHandler(std::signal(SIGXFSZ, SIG_IGN)) {
+        getrlimit(RLIMIT_FSIZE, &_former);
+        const rlimit limit{size, _former.rlim_max};
+        EXPECT_EQ(setrlimit(RLIMIT_FSIZE, &limit), 0);
+    }
+    FullDisk(const FullDisk&) = delete;
+    FullDisk& operator=(const FullDisk&) = delete;
+    ~FullDisk() {
+        setrlimit(RLIMIT_FSIZE, &_former);
+        static_cast<void>(std::signal(SIGXFSZ, _formerHandler));
+    }
+
+  private:
+    rlimit _former{};
+    void (*_formerHandler)(int);
+};
+
+class BadInput : public RealmTest {
+  protected:
+    /// Makes _context one whose realm has its KDC at that port.
+    void useKdcAt(int port, const std::string& libdefaults = {}) {
+        write(path("krb5.conf"), support::Kdc::clientConfiguration("NIMBO.TEST", port, libdefaults));
+        setenv("KRB5_CONFIG", path("krb5.conf").c_str(), 1);  // put back by the fixture
+        _context = KRB5Context::context();
+    }
+    /// The realm's own configuration with further lines in [libdefaults].
+    void useConfigurationWith(const std::string& libdefaults) {
+        std::string text = contentsOf(realm().configuration());
+        text.insert(text.find("[realms]"), libdefaults);
+        write(path("krb5.conf"), text);
+        setenv("KRB5_CONFIG", path("krb5.conf").c_str(), 1);
+        _context = KRB5Context::context();
+    }
+    [[nodiscard]] std::unique_ptr<KRB5CredentialCache> unbound(const std::string& name) const {
+        return KRB5CredentialCache::initWithName(path(name), KRB5CredentialCacheFileType, nullptr, _context);
+    }
+    /// What opening the cache for alice, and acquiring into it, record. Opening must fail.
+    [[nodiscard]] std::int64_t statusOfAcquiringInto(const std::string& name) const {
+        const auto alice = principal("alice");
+        EXPECT_EQ(KRB5CredentialCache::initWithName(path(name), KRB5CredentialCacheFileType, alice.get(), _context),
+                  nullptr);
+        const auto cache = unbound(name);
+        EXPECT_NE(cache, nullptr);
+        cache->acquireInitialCredentialWithPrincipal(alice.get(), nullptr, alicePassword);
+        EXPECT_FALSE(cache->errorMessage().empty());
+        const auto status = cache->errorCode();
+        EXPECT_TRUE(cache->credentials().empty());
+        return status;
+    }
+};
+
+TEST_F(BadInput, KdcDownIsUnreachable) {
+    const ClosedPort port;
+    useKdcAt(port.port());
+    const auto cache = cacheOf(*principal("alice"));
+    EXPECT_TRUE(cache->acquireInitialCredentialIfNecessaryWithPassword(alicePassword));
+    EXPECT_EQ(cache->errorCode(), KRB5_KDC_UNREACH);
+    EXPECT_NE(cache->errorMessage().find("NIMBO.TEST"), std::string::npos) << cache->errorMessage();
+    EXPECT_TRUE(cache->credentials().empty());
+}
+
+TEST_F(BadInput, ClockFarOffIsLearntFromTheKdcUnlessForbidden) {
+    for (const int days : {-5, 5}) {
+        const ShiftedClock clock(days * 24 * 3600);
+        useConfigurationWith("");
+        const auto cache = cacheOf(*principal("paul"));
+        EXPECT_TRUE(cache->acquireInitialCredentialIfNecessaryWithPassword(alicePassword));
+        EXPECT_EQ(cache->errorCode(), 0) << days << ": " << cache->errorMessage();
+        EXPECT_FALSE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(nullptr)) << days;
+
+        useConfigurationWith(" kdc_timesync = 0\n");
+        const auto strict = cacheOf(*principal("paul"), "strict");
+        EXPECT_TRUE(strict->acquireInitialCredentialIfNecessaryWithPassword(alicePassword));
+        EXPECT_EQ(strict->errorCode(), KRB5KRB_AP_ERR_SKEW) << strict->errorMessage();
+        EXPECT_TRUE(strict->credentials().empty());
+        std::filesystem::remove(path("cc"));
+    }
+}
+
+TEST_F(BadInput, ClockFarBehindWithoutPreauthenticationGivesATicketThatHasEnded) {
+    // Nothing tells the client the time before it asks, so it asks for a ticket that ends in the past, and gets it.
+    const ShiftedClock clock(-5 * 24 * 3600);
+    useConfigurationWith("");
+    const auto cache = cacheOf(*principal("alice"));
+    EXPECT_TRUE(cache->acquireInitialCredentialIfNecessaryWithPassword(alicePassword));
+    EXPECT_EQ(cache->errorCode(), 0) << cache->errorMessage();
+    EXPECT_TRUE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(nullptr));
+    EXPECT_EQ(cache->errorCode(), 0);
+}
+
+TEST_F(BadInput, CacheInMissingDirectory) {
+    EXPECT_EQ(statusOfAcquiringInto("missing/cc"), KRB5_FCC_NOFILE);
+}
+
+TEST_F(BadInput, CacheBelowAFileOrWhereADirectoryIs) {
+    write(path("file"), "x");
+    EXPECT_EQ(statusOfAcquiringInto("file/cc"), KRB5_FCC_NOFILE);
+    std::filesystem::create_directory(path("directory"));
+    EXPECT_NE(statusOfAcquiringInto("directory"), 0);
+}
+
+TEST_F(BadInput, CacheOnAFullDiskCannotBeBound) {
+    const FullDisk full(4);
+    EXPECT_NE(statusOfAcquiringInto("cc"), 0);
+}
+
+TEST_F(BadInput, TicketThatDoesNotFitOnTheDiskIsStillNecessary) {
+    const auto alice = principal("alice");
+    const auto cache = cacheOf(*alice);
+    const FullDisk full(std::filesystem::file_size(path("cc")) + 20);
+    EXPECT_TRUE(cache->acquireInitialCredentialIfNecessaryWithPassword(alicePassword));
+    EXPECT_EQ(cache->errorCode(), 0) << "how the request went; storing is not recorded";
+    EXPECT_EQ(cache->initialCredential(), nullptr);
+    EXPECT_NE(cache->errorCode(), 0);
+}
+
+TEST_F(BadInput, CacheCutAtAnyByteIsListedAsFarAsItGoesAndInitialisedByOpeningItForAPrincipal) {
+    const auto alice = principal("alice");
+    {
+        const auto cache = cacheOf(*alice);
+        cache->acquireInitialCredentialWithPassword(alicePassword);
+        ASSERT_EQ(support::run({"/usr/bin/kvno", "-c", path("cc"), "host/localhost"}).status, 0);
+        ASSERT_EQ(cache->credentials().size(), 2U);
+    }
+    const std::string bytes = contentsOf(path("cc"));
+    int bound = 0;
+    for (std::size_t length = 0; length < bytes.size(); ++length) {
+        write(path("cut"), bytes.substr(0, length));
+        const auto cut = unbound("cut");
+        ASSERT_NE(cut, nullptr);
+        const auto listed = cut->credentials();
+        EXPECT_LT(listed.size(), 2U) << length;
+        const bool readable = cut->principal() != nullptr;
+        bound += readable ? 1 : 0;
+        const bool hasTicket = cut->initialCredential() != nullptr;
+        EXPECT_EQ(hasTicket, listed.size() == 1) << length;
+        EXPECT_FALSE(hasTicket && !readable) << length;
+        const bool necessary = cut->initialCredentialAcquisitionIsNecessaryForPrincipal(alice.get());
+        EXPECT_FALSE(necessary && hasTicket) << length;
+
+        const auto opened =
+            KRB5CredentialCache::initWithName(path("cut"), KRB5CredentialCacheFileType, alice.get(), _context);
+        ASSERT_NE(opened, nullptr) << length;
+        EXPECT_EQ(opened->errorCode(), 0);
+        EXPECT_EQ(*opened->principal(), *alice);
+    }
+    EXPECT_GT(bound, 0);
+    EXPECT_LT(bound, static_cast<int>(bytes.size()));
+}
+
+TEST_F(BadInput, GarbageInsteadOfACacheIsInitialised) {
+    write(path("cc"), std::string(5000, '\xff'));
+    EXPECT_TRUE(unbound("cc")->credentials().empty());
+    const auto cache = unbound("cc");
+    static_cast<void>(cache->principal());
+    EXPECT_EQ(cache->errorCode(), KRB5_CCACHE_BADVNO);
+    EXPECT_EQ(*cacheOf(*principal("alice"))->principal(), *principal("alice"));
+}
+
+}  // namespace
+}  // namespace lumio

@@ -1,0 +1,82 @@
+// Follows a password through the layer: the library's call and the wiping function are defined here once more, in
+// front of the real ones.
+
+#include "krb5/KRB5CredentialCache.h"
+#include "tests/unit/krb5/Realm.h"
+
+#include <vector>
+
+#include <dlfcn.h>
+
+namespace {
+
+struct Wiped {
+    const void* start;
+    std::size_t size;
+};
+
+const char* passwordSeen = nullptr;
+std::string passwordTextSeen;
+std::vector<Wiped> wiped;
+
+void wipe(void* start, std::size_t size) {
+    auto* bytes = static_cast<volatile char*>(start);
+    for (std::size_t i = 0; i < size; ++i) {
+        bytes[i] = 0;
+    }
+    if (passwordSeen != nullptr) {
+        wiped.push_back({start, size});
+    }
+}
+
+}  // namespace
+
+extern "C" {
+
+krb5_error_code krb5_get_init_creds_password(krb5_context context, krb5_creds* creds, krb5_principal client,
+                                             const char* password, krb5_prompter_fct prompter, void* data,
+                                             krb5_deltat start_time, const char* in_tkt_service,
+                                             krb5_get_init_creds_opt* options) {
+    passwordSeen = password;
+    passwordTextSeen = password;
+    wiped.clear();
+    const auto real =
+        reinterpret_cast<decltype(&krb5_get_init_creds_password)>(dlsym(RTLD_NEXT, "krb5_get_init_creds_password"));
+    return real(context, creds, client, password, prompter, data, start_time, in_tkt_service, options);
+}
+
+void explicit_bzero(void* start, std::size_t size) noexcept {
+    wipe(start, size);
+}
+
+// What the former is called when the compiler fortifies.
+void __explicit_bzero_chk(void* start, std::size_t size,
+                          std::size_t /*room*/) noexcept {  // NOLINT(*-reserved-identifier)
+    wipe(start, size);
+}
+}
+
+namespace lumio {
+namespace {
+
+class Password : public RealmTest {};
+
+TEST_F(Password, CopyGivenToTheLibraryIsWipedWholeWhetherTheRequestSucceedsOrFails) {
+    for (const std::string text : {alicePassword, "a wrong one"}) {
+        passwordSeen = nullptr;
+        const auto cache = cacheOf(*principal("alice"));
+        cache->acquireInitialCredentialWithPassword(text);
+        EXPECT_EQ(cache->errorCode() == 0, text == alicePassword);
+        ASSERT_NE(passwordSeen, nullptr);
+        EXPECT_EQ(passwordTextSeen, text);
+        bool found = false;
+        for (const Wiped& area : wiped) {
+            found = found || (area.start == passwordSeen && area.size >= text.size() + 1);
+        }
+        EXPECT_TRUE(found) << text;
+        passwordSeen = nullptr;
+    }
+}
+
+}  // namespace
+}  // namespace lumio
