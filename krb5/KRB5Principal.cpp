@@ -50,7 +50,10 @@ std::unique_ptr<KRB5Principal> KRB5Principal::initWithNativePrincipal(krb5_const
         return nullptr;
     }
     const auto text = utf8TextOf(unparsed.get());
-    return text ? initWithString(*text, std::move(context)) : nullptr;
+    if (!text) {
+        return nullptr;
+    }
+    return initWithString(*text, std::move(context));
 }
 
 std::unique_ptr<KRB5Principal> KRB5Principal::principalWithNativePrincipal(krb5_const_principal nativePrincipal,

@@ -41,6 +41,7 @@ class Descriptor {
 pid_t spawn(const std::vector<std::string>& arguments, const std::filesystem::path& input,
             const std::filesystem::path& output) {
     std::vector<char*> argv;
+    argv.reserve(arguments.size() + 1);
     for (const std::string& argument : arguments) {
         argv.push_back(const_cast<char*>(argument.c_str()));
     }

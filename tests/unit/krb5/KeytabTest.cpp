@@ -4,8 +4,31 @@
 
 #include <array>
 
+#if defined(ADMINHOST_SANITIZED)
+#include <sanitizer/lsan_interface.h>
+#endif
+
 namespace lumio {
 namespace {
+
+/// While it lives, lost memory is not reported: the library (1.20.1) loses what it had read of an entry that ends too
+/// early, and hands nothing out that could be freed. valgrind.supp says the same to valgrind.
+class LibraryLeaks {
+  public:
+#if defined(ADMINHOST_SANITIZED)
+    LibraryLeaks() {
+        __lsan_disable();
+    }
+    ~LibraryLeaks() {
+        __lsan_enable();
+    }
+#else
+    LibraryLeaks() {}
+    ~LibraryLeaks() {}
+#endif
+    LibraryLeaks(const LibraryLeaks&) = delete;
+    LibraryLeaks& operator=(const LibraryLeaks&) = delete;
+};
 
 class Keytab : public RealmTest {
   protected:
@@ -254,6 +277,7 @@ TEST_F(Keytab, FileCutAtAnyByteGivesThePartThatCanBeRead) {
     ASSERT_EQ(whole.size(), 3U);
     for (std::size_t length = 0; length < bytes.size(); ++length) {
         write(path("kt"), bytes.substr(0, length));
+        const LibraryLeaks tolerated;
         const auto table = keytab();
         const auto entries = table->entries();
         EXPECT_NE(table->errorCode(), 0) << length;
