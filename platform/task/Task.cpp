@@ -187,7 +187,7 @@ std::vector<std::string> environmentWith(const Environment& first, const Environ
         }
     }
     for (const auto& [name, value] : added) {
-        all.push_back(name + '=' + value);
+        all.emplace_back(name).append(1, '=').append(value);
     }
     return all;
 }

@@ -1,5 +1,6 @@
 #include "platform/files/Path.h"
 
+#include <compare>
 #include <filesystem>
 #include <string>
 
@@ -79,7 +80,7 @@ TEST_F(Path, ExistsFollowsLinks) {
 TEST_F(Path, PathsCompareAsTheirTexts) {
     EXPECT_EQ(HostPath("/a"), HostPath("/a"));
     EXPECT_NE(HostPath("/a"), HostPath("/a/"));
-    EXPECT_LT(DiskPath("/a"), DiskPath("/b"));
+    EXPECT_TRUE(std::is_lt(DiskPath("/a") <=> DiskPath("/b")));
 }
 
 }  // namespace

@@ -217,7 +217,7 @@ TEST_F(ReplaceFile, FullDiskLeavesTheOldFileAndNoTemporary) {
     write("file", "old", 0600);
     const pid_t pid = ::fork();
     if (pid == 0) {  // a bound on the size of files cuts a write short as a full disk does
-        ::signal(SIGXFSZ, SIG_IGN);
+        (void)::signal(SIGXFSZ, SIG_IGN);
         const rlimit limit{100'000, 100'000};
         ::setrlimit(RLIMIT_FSIZE, &limit);
         const auto error = replace(std::string(1'000'000, 'x'));

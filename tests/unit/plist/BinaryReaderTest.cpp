@@ -137,9 +137,8 @@ TEST_F(BinaryReaderOracle, DepthOf512IsReadAnd513IsRefused) {
             "sys.setrecursionlimit(10000)\n"
             "plistlib.dump(value, open(sys.argv[1], 'wb'), fmt=plistlib.FMT_BINARY)\n",
             {path("binary"), std::to_string(depth)});
-        EXPECT_THAT(errorOf(readBytes("binary")),
-                    depth == 512 ? testing::Matcher<std::string>("accepted")
-                                 : testing::Matcher<std::string>(testing::EndsWith("nested more than 512 deep")));
+        const std::string error = errorOf(readBytes("binary"));
+        EXPECT_TRUE(depth == 512 ? error == "accepted" : error.ends_with(": nested more than 512 deep")) << error;
     }
 }
 

@@ -23,8 +23,6 @@ namespace {
 
 using namespace adminhost;
 using namespace std::chrono_literals;
-using testing::EndsWith;
-using testing::HasSubstr;
 using testing::StartsWith;
 
 namespace fs = std::filesystem;
@@ -53,7 +51,7 @@ class Task : public testing::Test {
         return launch_task_with_input(DiskPath("/bin/sh"), {"-c", script}, input, &_output, &_error);
     }
     fs::path write(const std::string& name, const std::string& text, mode_t mode) {
-        const fs::path path = _dir / name;
+        fs::path path = _dir / name;
         std::ofstream(path) << text;
         EXPECT_EQ(::chmod(path.c_str(), mode), 0);
         return path;
