@@ -82,7 +82,9 @@ TEST_F(LocalDate, RefusesWhatIsNotAWholeRealDate) {
     EXPECT_TRUE(localDateOf("2024-02-29 00:00:00"));
 }
 
-TEST_F(LocalDate, InsideADaylightSavingGapIsStillADate) { EXPECT_TRUE(localDateOf("2026-03-29 02:30:00")); }
+TEST_F(LocalDate, InsideADaylightSavingGapIsStillADate) {
+    EXPECT_TRUE(localDateOf("2026-03-29 02:30:00"));
+}
 
 TEST(Utf8, WellFormedTextPassesAndEachOffendingByteIsReplaced) {
     EXPECT_TRUE(isUtf8("a\xC3\xA0\xE2\x82\xAC\xF0\x9F\x98\x80"));

@@ -1,0 +1,131 @@
+#include "adminhostd/Daemon.h"
+
+#include "adminhostd/DatabaseTool.h"
+#include "adminhostd/Front.h"
+#include "adminhostd/ListeningSocket.h"
+#include "adminhostd/Notify.h"
+#include "adminhostd/Places.h"
+#include "platform/log/Log.h"
+
+#include <algorithm>
+#include <csignal>
+#include <optional>
+
+#include <sys/signalfd.h>
+
+namespace adminhost {
+namespace {
+
+using namespace std::chrono_literals;
+using Clock = std::chrono::steady_clock;
+
+constexpr auto runningBound = 10s;  ///< for the running operation when the daemon is to stop
+constexpr auto sendingBound = 2s;   ///< for its clients to take their answers then
+
+FileDescriptor stopSignals() {
+    sigset_t signals;
+    ::sigemptyset(&signals);
+    ::sigaddset(&signals, SIGTERM);
+    ::sigaddset(&signals, SIGINT);
+    ::sigprocmask(SIG_BLOCK, &signals, nullptr);
+    std::signal(SIGPIPE, SIG_IGN);
+    return FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
+}
+
+class Daemon {
+  public:
+    Daemon(const Options& options, const PluginSelection& plugins, const ToolConfiguration& tools,
+           ListeningSocket& socket)
+        : _options(options),
+          _socket(socket),
+          _signals(stopSignals()),
+          _front({workerConfiguration(options, plugins, tools.directory()), options.logToStandardError,
+                  options.queueLimit, options.deadline},
+                 plugins.refused) {}
+
+    void run() {
+        for (;;) {
+            // Clients that come before the first worker is ready wait in the socket's backlog.
+            if (!_server && _front.queue().settled() && !_stopBy) {
+                _server.emplace(
+                    _socket.take(), _options.clientTimeout,
+                    [this](const Exchange& exchange) { return _front.head(exchange); },
+                    [this](Exchange& exchange) { _front.serve(exchange); });
+                notify("READY=1");
+            }
+            if (finished()) {
+                return;
+            }
+            wait();
+            _front.queue().run();
+            if (_server) {
+                _server->run();
+            }
+        }
+    }
+
+  private:
+    void wait() {
+        _entries.clear();
+        _entries.push_back({_signals.get(), POLLIN, 0});
+        _entries.push_back({_server ? _server->descriptor() : -1, POLLIN, 0});
+        _front.queue().addTo(_entries);
+        int timeout = _server ? _server->timeout().value_or(-1) : -1;
+        for (const auto& due : {_front.queue().due(), _stopBy}) {
+            if (due) {
+                const auto left = std::chrono::ceil<std::chrono::milliseconds>(*due - Clock::now()).count();
+                const int bounded = static_cast<int>(std::clamp<std::int64_t>(left, 0, 60'000));
+                timeout = timeout < 0 ? bounded : std::min(timeout, bounded);
+            }
+        }
+        ::poll(_entries.data(), _entries.size(), timeout);
+        if (_entries.front().revents != 0) {
+            stop();
+        }
+    }
+
+    void stop() {
+        signalfd_siginfo ignored{};
+        while (::read(_signals.get(), &ignored, sizeof ignored) > 0) {
+        }
+        if (_stopBy) {
+            return;
+        }
+        notify("STOPPING=1");
+        _stopBy = Clock::now() + runningBound + sendingBound;
+        _socket.remove();
+        if (_server) {
+            _server->quiesce();
+        }
+        _front.queue().stop(runningBound);
+    }
+
+    bool finished() {
+        if (!_stopBy || !_front.queue().stopped()) {
+            return false;
+        }
+        _stopBy = std::min(*_stopBy, Clock::now() + sendingBound);
+        return !_server || _server->open() == 0 || Clock::now() >= *_stopBy;
+    }
+
+    const Options& _options;
+    ListeningSocket& _socket;
+    FileDescriptor _signals;
+    Front _front;
+    std::optional<HttpServer> _server;
+    std::optional<Clock::time_point> _stopBy;
+    std::vector<pollfd> _entries;
+};
+
+}  // namespace
+
+int runDaemon(const Options& options) {
+    setLogSink(options.logToStandardError ? standardErrorSink() : syslogSink());
+    ListeningSocket socket(socketPath(options), groupOf(options.socketGroup));
+    const ToolConfiguration tools(privateParent(options));
+    const PluginSelection plugins = selectPlugins(options);
+    Daemon(options, plugins, tools, socket).run();
+    return 0;
+}
+
+}  // namespace adminhost

@@ -1,0 +1,94 @@
+#include "adminhostd/Options.h"
+
+#include <cstdlib>
+#include <iostream>
+#include <stdexcept>
+
+#include <CLI/CLI.hpp>
+
+namespace adminhost {
+namespace {
+
+constexpr const char* defaultConfiguration = "/etc/adminhostd.toml";
+
+}  // namespace
+
+std::optional<Options> readOptions(int count, const char* const* arguments, int& status) {
+    Options options;
+    std::vector<std::string> plugins;
+    std::string socket;
+    std::string configuration;
+    std::string log;
+
+    CLI::App app("Server administration daemon: serves the operations of its plug-ins over a Unix socket.",
+                 "adminhostd");
+    app.add_option("--root", options.root, "Directory below which all fixed places lie")->type_name("DIR");
+    app.add_option("--plugin", plugins, "Plug-in to load, instead of those of the plug-in directory")
+        ->type_name("FILE")
+        ->allow_extra_args(false);
+    app.add_option("--socket", socket, "Socket to listen at, taken as it stands")->type_name("PATH");
+    app.add_option("--config", configuration, "Configuration file (/etc/adminhostd.toml below the root)")
+        ->type_name("FILE");
+    app.add_option("--log", log, "Where the log goes: syslog or stderr")->check(CLI::IsMember({"syslog", "stderr"}));
+    app.add_flag("--check", options.check, "Look at configuration, plug-ins and places, say what is wrong, and end");
+    app.set_version_flag("--version", std::string("adminhostd ") + ADMINHOST_RELEASE);
+    try {
+        app.parse(count, arguments);
+    } catch (const CLI::ParseError& error) {
+        status = app.exit(error, std::cout, std::cerr) == 0 ? 0 : 2;
+        return std::nullopt;
+    }
+    setSystemRoot(options.root);
+    options.root = systemRoot();
+    try {
+        const DiskPath standard = diskPath(HostPath(defaultConfiguration));
+        if (!configuration.empty()) {
+            readConfiguration(configuration, options);
+        } else if (exists(standard)) {
+            readConfiguration(standard.text(), options);
+        }
+    } catch (const std::runtime_error& error) {
+        std::cerr << "adminhostd: " << error.what() << '\n';
+        status = 1;
+        return std::nullopt;
+    }
+    if (!plugins.empty()) {
+        options.plugins.clear();
+        for (const std::string& file : plugins) {
+            options.plugins.emplace_back(file);
+        }
+    }
+    if (!socket.empty()) {
+        options.socket = DiskPath(socket);
+    }
+    if (!log.empty()) {
+        options.logToStandardError = log == "stderr";
+    }
+    return options;
+}
+
+Array languagesOfEnvironment() {
+    Array languages;
+    for (const char* name : {"LANGUAGE", "LC_ALL", "LC_MESSAGES", "LANG"}) {
+        const char* text = std::getenv(name);
+        std::string_view left = text == nullptr ? "" : text;
+        while (!left.empty()) {
+            const std::size_t colon = left.find(':');
+            std::string language(left.substr(0, colon));
+            left.remove_prefix(colon == std::string_view::npos ? left.size() : colon + 1);
+            // "de_DE.UTF-8@euro" is the language "de_DE@euro" in an encoding.
+            if (const std::size_t dot = language.find('.'); dot != std::string::npos) {
+                language.erase(dot, language.find('@', dot) - dot);
+            }
+            if (!language.empty() && language != "C" && language != "POSIX") {
+                languages.emplace_back(std::move(language));
+            }
+        }
+        if (!languages.empty()) {
+            break;  // each variable overrides those after it
+        }
+    }
+    return languages;
+}
+
+}  // namespace adminhost

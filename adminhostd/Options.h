@@ -1,0 +1,40 @@
+#pragma once
+
+// How the daemon is set up: its command line and its configuration file.
+
+#include "platform/files/Path.h"
+#include "platform/value/Value.h"
+
+#include <chrono>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace adminhost {
+
+struct Options {
+    std::string root = "/";
+    std::vector<DiskPath> plugins;  ///< instead of the plug-in directory's, when there are any
+    HostPath pluginDirectory{"/usr/lib/adminhostd/plugins"};
+    HostPath runDirectory{"/run/adminhostd"};
+    std::optional<DiskPath> socket;               ///< instead of the one in the run directory
+    std::string socketGroup;                      ///< empty: the daemon's own
+    std::optional<Array> languages;               ///< instead of those of the environment
+    std::chrono::milliseconds deadline{300'000};  ///< of one operation
+    std::chrono::seconds clientTimeout{30};
+    std::size_t queueLimit = 64;
+    bool logToStandardError = false;
+    bool check = false;
+};
+
+/// Reads both; the command line wins. Sets the system root. Nothing when the daemon is to end at once: help was
+/// printed, or what is wrong was; then status is the exit status.
+[[nodiscard]] std::optional<Options> readOptions(int count, const char* const* arguments, int& status);
+
+/// Applies a configuration file to the options. Throws std::runtime_error with file, line, what is wrong and the mend.
+void readConfiguration(const std::string& file, Options& options);
+
+/// The languages that the environment names, the most wanted first.
+[[nodiscard]] Array languagesOfEnvironment();
+
+}  // namespace adminhost

@@ -1,0 +1,179 @@
+#include "adminhostd/Places.h"
+
+#include "adminhostd/DatabaseTool.h"
+#include "adminhostd/ListeningSocket.h"
+#include "adminhostd/PluginFile.h"
+#include "adminhostd/WorkerProcess.h"
+
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <iostream>
+#include <stdexcept>
+
+#include <fmt/format.h>
+#include <grp.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace adminhost {
+namespace {
+
+Value refusedFile(const DiskPath& file, const std::string& reason) {
+    return Dictionary{{"file", file.text()}, {"reason", reason}};
+}
+
+/// The worker's first words, or what hinders it from speaking.
+Dictionary helloOf(const Dictionary& configuration, std::string& problem) {
+    const auto worker = WorkerProcess::start(true);
+    if (!worker || !worker->send(FrameType::configure, configuration)) {
+        problem = fmt::format("The worker cannot be started: {}", std::strerror(errno));
+        return {};
+    }
+    for (int waited = 0; waited < 300; ++waited) {
+        std::vector<pollfd> entries;
+        worker->addTo(entries);
+        ::poll(entries.data(), entries.size(), 100);
+        worker->converse();
+        while (const auto frame = worker->next()) {
+            if (frame->type == FrameType::hello && frame->payload.dictionary() != nullptr) {
+                worker->finish(1000);
+                return *frame->payload.dictionary();
+            }
+        }
+        if (worker->ending()) {
+            problem = "The worker " + *worker->ending() + " before it was ready.";
+            return {};
+        }
+    }
+    problem = "The worker does not get ready: a plug-in hangs while it is loaded.";
+    return {};
+}
+
+}  // namespace
+
+PluginSelection selectPlugins(const Options& options) {
+    PluginSelection selection;
+    if (!options.plugins.empty()) {
+        for (const DiskPath& file : options.plugins) {
+            struct stat status {};
+            if (::stat(file.c_str(), &status) == 0 && (status.st_mode & S_IWOTH) != 0) {
+                selection.refused.push_back(
+                    refusedFile(file, file.text() + " may be written by everybody; chmod o-w it"));
+            } else {
+                selection.files.push_back(file);
+            }
+        }
+        return selection;
+    }
+    const DiskPath directory = diskPath(options.pluginDirectory);
+    if (const auto reason = distrust(directory)) {
+        selection.refused.push_back(refusedFile(directory, *reason));
+        return selection;
+    }
+    const auto files = pluginsIn(directory);
+    if (!files) {
+        selection.refused.push_back(refusedFile(directory, directory.text() + ": " + std::strerror(errno)));
+        return selection;
+    }
+    for (const DiskPath& file : *files) {
+        if (const auto reason = distrust(file)) {
+            selection.refused.push_back(refusedFile(file, *reason));
+        } else {
+            selection.files.push_back(file);
+        }
+    }
+    return selection;
+}
+
+std::string socketPath(const Options& options) {
+    if (options.socket) {
+        return options.socket->text();
+    }
+    const std::string directory = diskPath(options.runDirectory).text();
+    std::error_code ignored;
+    // What hinders this shows when the socket is made.
+    std::filesystem::create_directories(directory, ignored);
+    return directory + "/adminhostd.sock";
+}
+
+gid_t groupOf(const std::string& name) {
+    if (name.empty()) {
+        return ListeningSocket::sameGroup;
+    }
+    const group* entry = ::getgrnam(name.c_str());
+    if (entry == nullptr) {
+        throw std::runtime_error(
+            fmt::format("there is no group \"{}\"; make it or correct socket_group in the configuration", name));
+    }
+    return entry->gr_gid;
+}
+
+std::string privateParent(const Options& options) {
+    return options.socket ? std::filesystem::temp_directory_path().string() : diskPath(options.runDirectory).text();
+}
+
+Dictionary workerConfiguration(const Options& options, const PluginSelection& plugins,
+                               const std::string& toolConfiguration) {
+    Array files;
+    for (const DiskPath& file : plugins.files) {
+        files.emplace_back(file.text());
+    }
+    return {{"root", options.root},
+            {"plugins", std::move(files)},
+            {"languages", options.languages ? *options.languages : languagesOfEnvironment()},
+            {"environment", Dictionary{{"XDG_CONFIG_HOME", toolConfiguration}}}};
+}
+
+int check(const Options& options) {
+    std::vector<std::string> problems;
+    std::string loaded;
+    const std::string socket = socketPath(options);
+    const std::string directory = std::filesystem::path(socket).parent_path().string();
+    if (::access(directory.empty() ? "." : directory.c_str(), W_OK | X_OK) != 0) {
+        problems.push_back(
+            fmt::format("The socket {} cannot be made: {}; make its directory, or choose another with --socket", socket,
+                        std::strerror(errno)));
+    }
+    try {
+        static_cast<void>(groupOf(options.socketGroup));
+        const PluginSelection plugins = selectPlugins(options);
+        const ToolConfiguration tools(std::filesystem::temp_directory_path().string());
+        std::string problem;
+        const Dictionary hello = helloOf(workerConfiguration(options, plugins, tools.directory()), problem);
+        if (!problem.empty()) {
+            problems.push_back(problem);
+        }
+        Array refused = plugins.refused;
+        if (const Array* others = hello.get("refused").array()) {
+            refused.insert(refused.end(), others->begin(), others->end());
+        }
+        for (const Value& entry : refused) {
+            problems.push_back(*entry.dictionary()->get("reason").string());
+        }
+        if (const std::string* text = hello.get("databaseTool").string()) {
+            problems.push_back("Commands that need the database will be refused: " + *text);
+        }
+        if (const Array* list = hello.get("plugins").array()) {
+            for (const Value& entry : *list) {
+                loaded += fmt::format(" {} {}", *entry.dictionary()->get("name").string(),
+                                      *entry.dictionary()->get("version").string());
+            }
+        }
+        if (loaded.empty() && problems.empty()) {
+            problems.push_back("There is no plug-in in " + diskPath(options.pluginDirectory).text() +
+                               "; install one, or name one with --plugin");
+        }
+    } catch (const std::exception& error) {
+        problems.emplace_back(error.what());
+    }
+    for (const std::string& problem : problems) {
+        std::cout << problem << '\n';
+    }
+    if (problems.empty()) {
+        std::cout << "Nothing is wrong. Plug-ins:" << loaded << ". Socket: " << socket << '\n';
+    }
+    return problems.empty() ? 0 : 1;
+}
+
+}  // namespace adminhost

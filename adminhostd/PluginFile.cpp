@@ -1,0 +1,156 @@
+#include "adminhostd/PluginFile.h"
+
+#include "platform/files/FileDescriptor.h"
+
+#include <algorithm>
+#include <bit>
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+
+#include <dlfcn.h>
+#include <elf.h>
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace adminhost {
+namespace {
+
+constexpr std::size_t notesMaximum = std::size_t{64} << 10U;
+constexpr std::size_t segmentsMaximum = 256;
+
+bool readAt(int file, std::uint64_t offset, void* place, std::size_t size) {
+    return ::pread(file, place, size, static_cast<off_t>(offset)) == static_cast<ssize_t>(size);
+}
+
+std::size_t padded(std::size_t size) {
+    return (size + 3) & ~std::size_t{3};
+}
+
+/// The description of our note in the bytes of one note segment.
+std::optional<std::string> identityIn(std::string_view notes) {
+    while (notes.size() >= sizeof(Elf64_Nhdr)) {
+        Elf64_Nhdr header{};
+        std::memcpy(&header, notes.data(), sizeof header);
+        notes.remove_prefix(sizeof header);
+        if (notes.size() < padded(header.n_namesz)) {
+            return std::nullopt;
+        }
+        const std::string_view name = notes.substr(0, header.n_namesz);
+        notes.remove_prefix(padded(header.n_namesz));
+        const std::string_view description = notes.substr(0, header.n_descsz);
+        if (header.n_type == buildNoteType && name.substr(0, name.find('\0')) == buildNoteName) {
+            return std::string(description.substr(0, description.find('\0')));
+        }
+        notes.remove_prefix(std::min(notes.size(), padded(header.n_descsz)));
+    }
+    return std::nullopt;
+}
+
+}  // namespace
+
+std::optional<std::string> distrust(const DiskPath& path) {
+    struct stat status {};
+    if (::stat(path.c_str(), &status) != 0) {
+        return fmt::format("{}: {}", path.text(), std::strerror(errno));
+    }
+    if (status.st_uid != 0 && status.st_uid != ::geteuid()) {
+        return fmt::format("{} belongs to uid {}; chown it to root", path.text(), status.st_uid);
+    }
+    if ((status.st_mode & (S_IWGRP | S_IWOTH)) != 0) {
+        return fmt::format("{} may be written by group or others; chmod go-w it", path.text());
+    }
+    return std::nullopt;
+}
+
+std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory) {
+    std::error_code failure;
+    std::vector<DiskPath> files;
+    for (std::filesystem::directory_iterator at(directory.text(), failure), end; !failure && at != end;
+         at.increment(failure)) {
+        if (at->path().extension() == ".so") {
+            files.emplace_back(at->path().string());
+        }
+    }
+    if (failure) {
+        errno = failure.value();
+        return std::nullopt;
+    }
+    std::sort(files.begin(), files.end());
+    return files;
+}
+
+std::optional<std::string> buildIdentityOf(const DiskPath& path, std::string& problem) {
+    const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+    if (!file.isOpen()) {
+        problem = fmt::format("{}: {}", path.text(), std::strerror(errno));
+        return std::nullopt;
+    }
+    constexpr int ownOrder = std::endian::native == std::endian::little ? ELFDATA2LSB : ELFDATA2MSB;
+    Elf64_Ehdr header{};
+    if (!readAt(file.get(), 0, &header, sizeof header) || std::memcmp(header.e_ident, ELFMAG, SELFMAG) != 0 ||
+        header.e_ident[EI_CLASS] != ELFCLASS64 || header.e_ident[EI_DATA] != ownOrder || header.e_type != ET_DYN ||
+        header.e_phentsize != sizeof(Elf64_Phdr)) {
+        problem = fmt::format("{} is no shared object of this kind of machine", path.text());
+        return std::nullopt;
+    }
+    for (std::size_t i = 0; i < std::min<std::size_t>(header.e_phnum, segmentsMaximum); ++i) {
+        Elf64_Phdr segment{};
+        if (!readAt(file.get(), header.e_phoff + i * sizeof segment, &segment, sizeof segment)) {
+            break;
+        }
+        if (segment.p_type != PT_NOTE || segment.p_filesz > notesMaximum) {
+            continue;
+        }
+        std::string notes(segment.p_filesz, '\0');
+        if (readAt(file.get(), segment.p_offset, notes.data(), notes.size())) {
+            if (auto identity = identityIn(notes)) {
+                return identity;
+            }
+        }
+    }
+    problem = fmt::format("{} carries no build note: it is no plug-in of this daemon", path.text());
+    return std::nullopt;
+}
+
+const Plugin* loadPlugin(const DiskPath& file, std::string& problem) {
+    const auto identity = buildIdentityOf(file, problem);
+    if (!identity) {
+        return nullptr;
+    }
+    if (*identity != ADMINHOST_BUILD_IDENTITY) {
+        problem = fmt::format("{} is of another build (\"{}\", this daemon is \"{}\"); install the one of this release",
+                              file.text(), *identity, ADMINHOST_BUILD_IDENTITY);
+        return nullptr;
+    }
+    // A name without a slash would be searched for in the library path.
+    const std::string name = file.text().find('/') == std::string::npos ? "./" + file.text() : file.text();
+    void* library = ::dlopen(name.c_str(), RTLD_NOW | RTLD_LOCAL);
+    if (library == nullptr) {
+        problem = fmt::format("{} cannot be loaded: {}", file.text(), ::dlerror());
+        return nullptr;
+    }
+    using EntryPoint = const Plugin* (*)();
+    const auto entry = reinterpret_cast<EntryPoint>(::dlsym(library, "adminhost_plugin"));
+    if (entry == nullptr) {
+        problem = fmt::format("{} has no entry point adminhost_plugin", file.text());
+        return nullptr;
+    }
+    const Plugin* plugin = entry();
+    if (plugin == nullptr || plugin->name == nullptr || plugin->version == nullptr || plugin->describe == nullptr ||
+        plugin->check == nullptr || plugin->revision == nullptr || plugin->perform == nullptr) {
+        problem = fmt::format("{} offers an incomplete table of functions", file.text());
+        return nullptr;
+    }
+    const std::string_view word = plugin->name;
+    if (word.empty() || word.find_first_not_of("abcdefghijklmnopqrstuvwxyz0123456789_-") != std::string_view::npos ||
+        word == "requests") {
+        problem = fmt::format("{} has the name \"{}\", which cannot stand in an address", file.text(), word);
+        return nullptr;
+    }
+    return plugin;
+}
+
+}  // namespace adminhost

@@ -1,0 +1,29 @@
+#pragma once
+
+// Plug-in files: which may be loaded, which build they are of, and loading them.
+
+#include "platform/files/Path.h"
+#include "platform/framework/Plugin.h"
+
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace adminhost {
+
+/// Why whoever may write there could give the daemon code to run: the directory or file must belong to root (or to the
+/// daemon's own account) and must not be writable by group or others. With the mend; nothing when all is well.
+[[nodiscard]] std::optional<std::string> distrust(const DiskPath& path);
+
+/// The plug-ins (*.so) of a directory in the order of their names. Nothing if it cannot be read; errno says why.
+[[nodiscard]] std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory);
+
+/// The build identity in the file's note, read without running any of its code. Nothing, with the problem, when the
+/// file is no shared object for a 64-bit machine of this kind or carries no note.
+[[nodiscard]] std::optional<std::string> buildIdentityOf(const DiskPath& file, std::string& problem);
+
+/// Loads a plug-in whose note is that of this build. Null, with the problem and its mend, when it is another build's,
+/// cannot be loaded, or has no entry point or an incomplete table. A loaded plug-in stays loaded.
+[[nodiscard]] const Plugin* loadPlugin(const DiskPath& file, std::string& problem);
+
+}  // namespace adminhost

@@ -1,0 +1,93 @@
+#include "adminhostd/RequestBody.h"
+
+#include "platform/json/Json.h"
+#include "platform/plist/PropertyList.h"
+
+#include <algorithm>
+
+#include <fmt/format.h>
+#include <strings.h>
+
+namespace adminhost {
+namespace {
+
+std::string_view trimmed(std::string_view text) {
+    constexpr const char* blanks = " \t";
+    const std::size_t first = text.find_first_not_of(blanks);
+    return first == std::string_view::npos ? std::string_view()
+                                           : text.substr(first, text.find_last_not_of(blanks) - first + 1);
+}
+
+bool same(std::string_view a, std::string_view b) {
+    return a.size() == b.size() && ::strncasecmp(a.data(), b.data(), a.size()) == 0;
+}
+
+}  // namespace
+
+std::optional<BodyForm> bodyFormOf(std::string_view contentType) {
+    const std::size_t semicolon = contentType.find(';');
+    const std::string_view type = trimmed(contentType.substr(0, semicolon));
+    std::string_view parameters = semicolon == std::string_view::npos ? "" : contentType.substr(semicolon + 1);
+    while (!parameters.empty()) {
+        const std::size_t end = std::min(parameters.find(';'), parameters.size());
+        const std::string_view parameter = trimmed(parameters.substr(0, end));
+        parameters.remove_prefix(std::min(end + 1, parameters.size()));
+        const std::size_t equals = std::min(parameter.find('='), parameter.size());
+        if (same(parameter.substr(0, equals), "charset")) {
+            std::string_view charset = parameter.substr(std::min(equals + 1, parameter.size()));
+            if (charset.size() >= 2 && charset.front() == '"' && charset.back() == '"') {
+                charset = charset.substr(1, charset.size() - 2);
+            }
+            if (!same(charset, "utf-8")) {
+                return std::nullopt;
+            }
+        }
+    }
+    if (type.empty() || same(type, "application/json")) {
+        return BodyForm::json;
+    }
+    return same(type, "application/x-plist") ? std::optional(BodyForm::propertyList) : std::nullopt;
+}
+
+std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, std::string& problem) {
+    if (body.empty()) {
+        return Dictionary();
+    }
+    Error error;
+    auto value = form == BodyForm::json ? parseJson(body, &error) : parsePropertyList(body, &error);
+    if (!value) {
+        problem = error.description.value_or("The body cannot be read.");
+        return std::nullopt;
+    }
+    if (value->dictionary() == nullptr) {
+        problem =
+            fmt::format("line 1, column 1: a request is a dictionary, not a value of type {}", nameOf(value->type()));
+        return std::nullopt;
+    }
+    return std::move(*value->dictionary());
+}
+
+std::optional<Array> revisionsOf(std::string_view ifMatch) {
+    Array revisions;
+    ifMatch = trimmed(ifMatch);
+    if (ifMatch == "*") {
+        return revisions;
+    }
+    while (!ifMatch.empty()) {
+        const std::size_t end = ifMatch.find('"', 1);
+        if (ifMatch.front() != '"' || end == std::string_view::npos) {
+            return std::nullopt;
+        }
+        revisions.emplace_back(ifMatch.substr(1, end - 1));
+        ifMatch = trimmed(ifMatch.substr(end + 1));
+        if (!ifMatch.empty()) {
+            if (ifMatch.front() != ',') {
+                return std::nullopt;
+            }
+            ifMatch = trimmed(ifMatch.substr(1));
+        }
+    }
+    return revisions;
+}
+
+}  // namespace adminhost

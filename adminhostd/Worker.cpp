@@ -1,0 +1,220 @@
+#include "adminhostd/Worker.h"
+
+#include "adminhostd/DatabaseTool.h"
+#include "adminhostd/Frame.h"
+#include "adminhostd/PluginFile.h"
+#include "platform/files/Path.h"
+#include "platform/log/Log.h"
+#include "platform/task/Task.h"
+
+#include <algorithm>
+#include <chrono>
+#include <csignal>
+#include <exception>
+#include <map>
+#include <vector>
+
+#include <fmt/format.h>
+
+namespace adminhost {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+/// Hands every event to the front, which writes the system log and keeps the request's lines.
+class ForwardingSink final : public LogSink {
+  public:
+    explicit ForwardingSink(int descriptor) : _descriptor(descriptor) {}
+    void write(std::string_view event) noexcept override {
+        try {
+            // Lost only together with the front itself.
+            static_cast<void>(writeFrame(_descriptor, FrameType::log, Value(event)));
+        } catch (...) {
+            return;
+        }
+    }
+
+  private:
+    int _descriptor;
+};
+
+class Worker {
+  public:
+    explicit Worker(int descriptor) : _descriptor(descriptor), _sink(descriptor) { setLogSink(_sink); }
+    ~Worker() { setLogSink(standardErrorSink()); }
+    Worker(const Worker&) = delete;
+    Worker& operator=(const Worker&) = delete;
+
+    int run();
+
+  private:
+    Value configure(const Dictionary& configuration);
+    void load(const DiskPath& file, Array& plugins, Array& refused);
+    Value perform(const Dictionary& order);
+    Value performWith(const Plugin& plugin, std::string_view command, const Dictionary& order);
+
+    int _descriptor;
+    ForwardingSink _sink;
+    FrameReader _reader;
+    std::vector<const Plugin*> _plugins;
+};
+
+std::string textAt(const Dictionary& dictionary, std::string_view key) {
+    const std::string* text = dictionary.get(key).string();
+    return text == nullptr ? std::string() : *text;
+}
+
+void Worker::load(const DiskPath& file, Array& plugins, Array& refused) {
+    std::string problem;
+    const Plugin* plugin = loadPlugin(file, problem);
+    if (plugin != nullptr && std::any_of(_plugins.begin(), _plugins.end(), [&](const Plugin* other) {
+            return std::string_view(other->name) == plugin->name;
+        })) {
+        problem = fmt::format("{}: a plug-in of the name \"{}\" is already loaded", file.text(), plugin->name);
+        plugin = nullptr;
+    }
+    Value commands = plugin == nullptr ? Value() : plugin->describe();
+    if (plugin != nullptr && commands.array() == nullptr) {
+        problem = fmt::format("{} does not describe its commands", file.text());
+        plugin = nullptr;
+    }
+    if (plugin == nullptr) {
+        refused.emplace_back(Dictionary{{"file", file.text()}, {"reason", problem}});
+        return;
+    }
+    _plugins.push_back(plugin);
+    plugins.emplace_back(Dictionary{{"name", plugin->name},
+                                    {"version", plugin->version},
+                                    {"file", file.text()},
+                                    {"commands", std::move(commands)}});
+}
+
+Value Worker::configure(const Dictionary& configuration) {
+    setSystemRoot(textAt(configuration, "root"));
+    if (configuration.contains("languages")) {
+        setUserDefault("BrennLanguages", configuration.get("languages"));
+    }
+    std::map<std::string, std::string> environment;
+    if (const Dictionary* variables = configuration.get("environment").dictionary()) {
+        for (const DictionaryEntry& variable : *variables) {
+            environment.emplace(variable.key, *variable.value.string());
+        }
+    }
+    setTaskEnvironment(std::move(environment));
+
+    Array plugins;
+    Array refused;
+    if (const Array* files = configuration.get("plugins").array()) {
+        for (const Value& file : *files) {
+            load(DiskPath(*file.string()), plugins, refused);
+        }
+    }
+    Dictionary hello{{"plugins", std::move(plugins)}, {"refused", std::move(refused)}};
+    setTaskDeadline(Clock::now() + std::chrono::seconds(5));
+    if (const auto problem = databaseToolProblem()) {
+        hello.set("databaseTool", *problem);
+    }
+    return hello;
+}
+
+Value Worker::performWith(const Plugin& plugin, std::string_view command, const Dictionary& order) {
+    const Dictionary nothing;
+    const Dictionary* given = order.get("request").dictionary();
+    const Dictionary& request = given == nullptr ? nothing : *given;
+
+    if (std::vector<Finding> findings = plugin.check(command, request); !findings.empty()) {
+        Array list;
+        for (Finding& finding : findings) {
+            list.emplace_back(Dictionary{{"keyPath", std::move(finding.keyPath)},
+                                         {"rule", std::move(finding.rule)},
+                                         {"advice", std::move(finding.advice)}});
+        }
+        return Dictionary{{"outcome", outcome::refused}, {"findings", std::move(list)}};
+    }
+    const auto deadline =
+        Clock::now() + std::chrono::milliseconds(order.get("milliseconds").integer().value_or(std::int64_t{0}));
+    setTaskDeadline(deadline);
+    if (const Array* revisions = order.get("ifMatch").array()) {
+        const std::string revision = plugin.revision();
+        if (std::find(revisions->begin(), revisions->end(), Value(revision)) == revisions->end()) {
+            return Dictionary{{"outcome", outcome::changed}, {"revision", revision}};
+        }
+    }
+    Response response = plugin.perform(command, request);
+    Dictionary answer;
+    if (order.get("wantsRevision") == Value(true) && response.kind() != Response::Kind::error) {
+        answer.set("revision", plugin.revision());
+    }
+    // A tool that was killed at the deadline makes an answer that misleads: only the overrun is told.
+    if (Clock::now() >= deadline) {
+        return Dictionary{{"outcome", outcome::overrun}};
+    }
+    switch (response.kind()) {
+        case Response::Kind::nothing:
+            answer.set("outcome", outcome::nothing);
+            break;
+        case Response::Kind::dictionary:
+            answer.set("outcome", outcome::dictionary);
+            break;
+        case Response::Kind::error:
+            answer.set("outcome", outcome::error);
+            break;
+    }
+    answer.set("response", std::move(response.dictionary()));
+    return answer;
+}
+
+Value Worker::perform(const Dictionary& order) {
+    const std::string name = textAt(order, "plugin");
+    const auto found =
+        std::find_if(_plugins.begin(), _plugins.end(), [&](const Plugin* plugin) { return name == plugin->name; });
+    try {
+        if (found != _plugins.end()) {
+            return performWith(**found, textAt(order, "command"), order);
+        }
+        return Dictionary{{"outcome", outcome::broken}, {"message", "The plug-in \"" + name + "\" is not loaded."}};
+    } catch (const std::exception& exception) {
+        return Dictionary{{"outcome", outcome::broken}, {"message", exception.what()}};
+    }
+}
+
+int Worker::run() {
+    // A signal for the whole group or service is the front's to act on: the running operation is to end in peace.
+    for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGPIPE}) {
+        std::signal(signal, SIG_IGN);
+    }
+    prepareForTasks();
+    for (;;) {
+        const auto frame = readFrame(_descriptor, _reader);
+        if (!frame) {
+            return 0;
+        }
+        const Dictionary* payload = frame->payload.dictionary();
+        if (payload == nullptr) {
+            return 1;
+        }
+        bool sent = false;
+        if (frame->type == FrameType::configure) {
+            sent = writeFrame(_descriptor, FrameType::hello, configure(*payload));
+        } else if (frame->type == FrameType::perform) {
+            sent = writeFrame(_descriptor, FrameType::answer, perform(*payload));
+            setTaskDeadline(std::nullopt);
+            if (!sent) {
+                const char* message = "The answer is too large to be sent.";
+                sent = writeFrame(_descriptor, FrameType::answer,
+                                  Dictionary{{"outcome", outcome::broken}, {"message", message}});
+            }
+        }
+        if (!sent) {
+            return 1;
+        }
+    }
+}
+
+}  // namespace
+
+int runWorker(int descriptor) {
+    return Worker(descriptor).run();
+}
+
+}  // namespace adminhost

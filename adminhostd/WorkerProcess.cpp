@@ -1,0 +1,175 @@
+#include "adminhostd/WorkerProcess.h"
+
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <utility>
+#include <vector>
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <spawn.h>
+#include <sys/socket.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace adminhost {
+namespace {
+
+/// The worker finds its end of the conversation here.
+constexpr int workerDescriptor = 3;
+
+class SpawnPlan {
+  public:
+    SpawnPlan() {
+        ::posix_spawn_file_actions_init(&actions);
+        ::posix_spawnattr_init(&attributes);
+        sigset_t none;
+        sigset_t all;
+        ::sigemptyset(&none);
+        ::sigfillset(&all);
+        ::posix_spawnattr_setsigmask(&attributes, &none);
+        ::posix_spawnattr_setsigdefault(&attributes, &all);
+        ::posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
+    }
+    SpawnPlan(const SpawnPlan&) = delete;
+    SpawnPlan& operator=(const SpawnPlan&) = delete;
+    ~SpawnPlan() {
+        ::posix_spawn_file_actions_destroy(&actions);
+        ::posix_spawnattr_destroy(&attributes);
+    }
+
+    posix_spawn_file_actions_t actions;
+    posix_spawnattr_t attributes;
+};
+
+}  // namespace
+
+std::unique_ptr<WorkerProcess> WorkerProcess::start(bool showOutput) {
+    int ends[2];
+    if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
+        return nullptr;
+    }
+    std::unique_ptr<WorkerProcess> worker(new WorkerProcess);
+    worker->_socket = FileDescriptor(ends[0]);
+    const FileDescriptor other(ends[1]);
+    ::fcntl(ends[0], F_SETFL, O_NONBLOCK);
+
+    SpawnPlan plan;
+    ::posix_spawn_file_actions_addopen(&plan.actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    if (showOutput) {
+        ::posix_spawn_file_actions_adddup2(&plan.actions, STDERR_FILENO, STDOUT_FILENO);
+    } else {
+        ::posix_spawn_file_actions_addopen(&plan.actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
+    }
+    ::posix_spawn_file_actions_adddup2(&plan.actions, other.get(), workerDescriptor);
+    char name[] = "adminhostd";
+    char mode[] = "--worker";
+    char* arguments[] = {name, mode, nullptr};
+    const int failure =
+        ::posix_spawn(&worker->_pid, "/proc/self/exe", &plan.actions, &plan.attributes, arguments, environ);
+    if (failure != 0) {
+        worker->_pid = -1;
+        errno = failure;
+        return nullptr;
+    }
+    worker->_process = FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, worker->_pid, 0)));
+    return worker;
+}
+
+WorkerProcess::~WorkerProcess() {
+    if (_pid > 0 && !ending()) {
+        kill();
+        finish(100);
+    }
+}
+
+void WorkerProcess::addTo(std::vector<pollfd>& entries) const {
+    entries.push_back(
+        {_closed ? -1 : _socket.get(), static_cast<short>(_unsent.empty() ? POLLIN : POLLIN | POLLOUT), 0});
+    entries.push_back({_process.get(), POLLIN, 0});
+}
+
+bool WorkerProcess::send(FrameType type, const Value& payload) {
+    auto bytes = encodeFrame(type, payload);
+    if (!bytes) {
+        return false;
+    }
+    if (_unsent.empty()) {
+        _unsent = std::move(*bytes);
+    } else {
+        _unsent += *bytes;
+    }
+    write();
+    return true;
+}
+
+void WorkerProcess::write() {
+    std::size_t done = 0;
+    while (done < _unsent.size()) {
+        const ssize_t written = ::send(_socket.get(), _unsent.data() + done, _unsent.size() - done, MSG_NOSIGNAL);
+        if (written < 0 && errno == EINTR) {
+            continue;
+        }
+        if (written < 0) {
+            // Full, or gone: then the end of the process tells.
+            break;
+        }
+        done += static_cast<std::size_t>(written);
+    }
+    if (done == _unsent.size()) {
+        std::string().swap(_unsent);
+    } else {
+        _unsent.erase(0, done);
+    }
+}
+
+void WorkerProcess::converse() {
+    if (!_unsent.empty()) {
+        write();
+    }
+    char buffer[64 << 10];
+    while (!_closed) {
+        const ssize_t count = ::recv(_socket.get(), buffer, sizeof buffer, 0);
+        if (count > 0) {
+            _reader.append({buffer, static_cast<std::size_t>(count)});
+            if (static_cast<std::size_t>(count) < sizeof buffer) {
+                return;
+            }
+        } else if (count == 0 || (errno != EINTR && errno != EAGAIN)) {
+            _closed = true;
+        } else if (errno == EAGAIN) {
+            return;
+        }
+    }
+}
+
+const std::optional<std::string>& WorkerProcess::ending() {
+    int status = 0;
+    if (!_ending && ::waitpid(_pid, &status, WNOHANG) == _pid) {
+        if (WIFSIGNALED(status)) {
+            _ending = fmt::format("was killed by signal {} ({})", WTERMSIG(status), ::strsignal(WTERMSIG(status)));
+        } else {
+            _ending = fmt::format("ended with status {}", WEXITSTATUS(status));
+        }
+    }
+    return _ending;
+}
+
+void WorkerProcess::kill() noexcept {
+    if (!_ending) {
+        ::kill(_pid, SIGKILL);
+    }
+}
+
+void WorkerProcess::finish(int milliseconds) {
+    _socket.close();
+    _closed = true;
+    pollfd entry{_process.get(), POLLIN, 0};
+    while (::poll(&entry, 1, milliseconds) < 0 && errno == EINTR) {
+    }
+    static_cast<void>(ending());
+}
+
+}  // namespace adminhost

@@ -1,0 +1,61 @@
+#pragma once
+
+// The front's side of a worker: the child process and the buffered, never waiting conversation with it.
+
+#include "adminhostd/Frame.h"
+#include "platform/files/FileDescriptor.h"
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <poll.h>
+#include <sys/types.h>
+
+namespace adminhost {
+
+class WorkerProcess {
+  public:
+    /// Starts this program again as a worker. Its standard output is ours if shown, else dropped. Null, with errno,
+    /// when it cannot be started.
+    [[nodiscard]] static std::unique_ptr<WorkerProcess> start(bool showOutput);
+
+    WorkerProcess(const WorkerProcess&) = delete;
+    WorkerProcess& operator=(const WorkerProcess&) = delete;
+    /// A worker that still runs is killed. One that the kernel cannot end yet (a dead mount) is left to the next
+    /// parent.
+    ~WorkerProcess();
+
+    [[nodiscard]] pid_t pid() const noexcept { return _pid; }
+    /// What to poll for: first the conversation, then the end of the process.
+    void addTo(std::vector<pollfd>& entries) const;
+
+    /// Queues a frame and sends what can be sent. False when it is too large for a frame.
+    [[nodiscard]] bool send(FrameType type, const Value& payload);
+    /// Reads and writes what can be done without waiting.
+    void converse();
+    /// The next frame that has arrived.
+    [[nodiscard]] std::optional<Frame> next() { return _reader.next(); }
+    /// Whether the worker says what is no frame.
+    [[nodiscard]] bool broken() const noexcept { return _reader.broken(); }
+    /// How the process ended ("was killed by signal 11 (Segmentation fault)"); nothing while it runs.
+    [[nodiscard]] const std::optional<std::string>& ending();
+    void kill() noexcept;
+    /// Asks it to end by closing the conversation; waits for that, but not longer than the milliseconds.
+    void finish(int milliseconds);
+
+  private:
+    WorkerProcess() = default;
+    void write();
+
+    pid_t _pid = -1;
+    FileDescriptor _socket;
+    FileDescriptor _process;
+    FrameReader _reader;
+    std::string _unsent;
+    bool _closed = false;
+    std::optional<std::string> _ending;
+};
+
+}  // namespace adminhost
