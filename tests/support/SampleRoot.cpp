@@ -114,6 +114,9 @@ std::string SampleRoot::read(const std::string& hostPath) const {
 void SampleRoot::write(const std::string& hostPath, const std::string& content) const {
     const fs::path file = disk(hostPath);
     fs::create_directories(file.parent_path());
+    if (fs::is_symlink(file)) {
+        fs::remove(file);  // it leads out of the root, to this machine's own tool
+    }
     std::ofstream out(file, std::ios::binary | std::ios::trunc);
     if (!(out << content << std::flush)) {
         throw std::runtime_error("cannot write " + hostPath);

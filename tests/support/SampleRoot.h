@@ -60,7 +60,7 @@ class SampleRoot {
 
     /// A file's whole content; throws when it cannot be read.
     [[nodiscard]] std::string read(const std::string& hostPath) const;
-    /// Writes a file, with its directories.
+    /// Writes a file, with its directories. A link there (the SQL tool's) is replaced, never followed.
     void write(const std::string& hostPath, const std::string& content) const;
     void remove(const std::string& hostPath) const;  ///< a file or a whole directory; nothing if it is not there
 

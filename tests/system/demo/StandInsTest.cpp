@@ -168,4 +168,13 @@ TEST_F(StandIns, TheSqlToolIsTheRealOne) {
     EXPECT_EQ(output, "count(*) = 12\n");
 }
 
+TEST_F(StandIns, WritingOverTheSqlToolReplacesTheLinkNotTheRealTool) {
+    const auto real = std::filesystem::read_symlink(root.disk("/usr/bin/sqlite3"));
+    const auto size = std::filesystem::file_size(real);
+    root.write("/usr/bin/sqlite3", "#!/bin/sh\n");
+    EXPECT_FALSE(std::filesystem::is_symlink(root.disk("/usr/bin/sqlite3")));
+    EXPECT_EQ(root.read("/usr/bin/sqlite3"), "#!/bin/sh\n");
+    EXPECT_EQ(std::filesystem::file_size(real), size);
+}
+
 }  // namespace
