@@ -1,11 +1,13 @@
 #include "handler/LumioRequestHandler.h"
 #include "platform/directory/LocalAccounts.h"
 #include "platform/directory/Uuid.h"
+#include "platform/task/Task.h"
 #include "resources/Camera.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <algorithm>
 #include <cctype>
+#include <chrono>
 #include <filesystem>
 #include <sstream>
 
@@ -359,6 +361,17 @@ TEST_F(AccessLists, FailingOrMissingConfigurationToolIsNotDetected) {
     std::filesystem::remove(root.path(tool));
     change({Value(Dictionary{{"type", "user"}, {"shortName", "a"}, {"_newid_", true}})});
     EXPECT_THAT(log.lines, IsEmpty());
+}
+
+TEST_F(AccessLists, HangingConfigurationToolEndsWithTheRequestsDeadlineAndNoFurtherRun) {
+    root.writeTool(tool, "#!/bin/sh\necho \"$1\" >> " + root.path("/calls").string() + "\nexec sleep 600\n");
+    adminhost::setTaskDeadline(std::chrono::steady_clock::now() + std::chrono::milliseconds(500));
+    change({Value(Dictionary{{"type", "user"}, {"shortName", "a"}, {"_newid_", true}}),
+            Value(Dictionary{{"type", "group"}, {"shortName", "b"}, {"_newid_", true}})});
+    const auto removal = Camera::initWithGUID("C-7")->delete_();
+    adminhost::setTaskDeadline(std::nullopt);
+    EXPECT_THAT(calls(), ElementsAre("--add_access"));
+    EXPECT_EQ(removal, (Error{"adminhost_lumio", -1, std::nullopt}));
 }
 
 TEST_F(AccessLists, AccessSwitchIsWrittenToTheDatabaseAndNotToTheRecord) {
