@@ -35,7 +35,7 @@ CLUSTER_PREFERENCES = {
     "http_auth_type": "basic",
     "camera_status_min_interval_seconds": 5,
     "camera_watcher_check_interval_seconds": 20,
-    "camera_preview_cache_seconds": 2.5,
+    "camera_preview_cache_seconds": 2,
     "agent_timeout_seconds": 60,
     "nimbo_controller": "grid1.example.org",
     "nimbo_job_cleanup_minutes": 1440,
