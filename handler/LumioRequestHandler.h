@@ -8,14 +8,27 @@
 
 #include "handler/SettingsStore.h"
 #include "platform/framework/PluginRequestHandler.h"
+#include "platform/value/Error.h"
 #include "platform/value/Value.h"
 
 #include <cstdint>
 #include <optional>
+#include <string>
 #include <string_view>
 #include <vector>
 
+namespace adminhost {
+class NetService;
+}
+
 namespace lumio {
+
+/// What a failed settings write answers.
+struct SettingsWriteError {
+    std::string domain;  ///< always empty
+    std::int64_t code = 400;
+    adminhost::Error underlying;  ///< what serialising or writing said; its description is the administrator's text
+};
 
 class LumioRequestHandler : public adminhost::PluginRequestHandler, public SettingsStore {
   public:
@@ -29,6 +42,8 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     /// "readStatus", the preferences setup script's status, and "configuration", narrowed by
     /// "optionalArguments.variant".
     [[nodiscard]] Response readSettingsWithRequest(const Dictionary& request);
+    /// Applies "configuration" and answers what a read then answers, with "readStatus" 0, "writeStatus" and, when they
+    /// apply, "errorDescription" and "needsRecycleOrRestart". Resource changes are applied whatever the write status.
     [[nodiscard]] Response writeSettingsWithRequest(const Dictionary& request);
 
     // Service state and control (ServiceState.cpp); the variant may be null
@@ -60,6 +75,8 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     void copyClusterPreferencesToConfig(Dictionary& config) const;
     void copyMemberPreferencesToConfig(Dictionary& config) const;
     void copyLibraryInformationToConfig(Dictionary& config) const;
+    /// The grid client's password in plain text; nothing if it is not set or cannot be deciphered.
+    [[nodiscard]] static std::optional<std::string> nimboClientPasswordFromPrefs(const Dictionary& prefs);
     /// Stores each value that the source has under one of the keys; a key the source lacks leaves the destination as it
     /// is.
     static void copyKeys(const std::vector<std::string_view>& keys, const Dictionary& source, Dictionary& destination);
@@ -71,8 +88,29 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
 
     // Pieces of writing settings
 
-    /// Runs the service's preferences setup script; its output is dropped. Its exit status, 0 on success.
+    // Each runs the service's setup script of that name; its output is dropped. Its exit status, 0 on success.
     [[nodiscard]] std::int32_t setupPreferences() const;
+    [[nodiscard]] std::int32_t setupLibrary() const;
+    // Each writes its file's share of the configuration. 0, or the status of the write; then "errorDescription" stands
+    // in the result. "needsRecycleOrRestart" is set there when the change needs it, also before a write that fails. The
+    // password leaves the configuration, and is stored only in its protected form.
+    [[nodiscard]] std::int32_t setIdentityPreferencesFromConfig(Dictionary& config, Dictionary& result);
+    [[nodiscard]] std::int32_t setClusterPreferencesFromConfig(Dictionary& config, Dictionary& result);
+    [[nodiscard]] std::int32_t setMemberPreferencesFromConfig(Dictionary& config, Dictionary& result);
+    // Each replaces its file atomically (platform/plist). One that stands there and cannot be loaded is kept beside it.
+    [[nodiscard]] std::optional<SettingsWriteError> writeIdentityPreferences(const Dictionary& prefs);
+    [[nodiscard]] std::optional<SettingsWriteError> writeClusterPreferences(const Dictionary& prefs);
+    [[nodiscard]] std::optional<SettingsWriteError> writeMemberPreferences(const Dictionary& prefs);
+    /// Makes the setup-done marker, and its directory, if it is missing. Failures are logged.
+    void markSetupDone();
+    /// Whether the setup-done marker exists.
+    [[nodiscard]] bool checkSetupDone() const;
+    /// Resolves the grid controller's DNS-SD name to the host name of its first address (ControllerName.cpp). Nothing
+    /// when it cannot be resolved, which is logged, within about ten seconds.
+    [[nodiscard]] std::optional<std::string> hostNameOfController(const std::string& name);
+    // The resolver's callbacks, made on the calling thread while hostNameOfController waits.
+    void netService(const adminhost::NetService& service, const Dictionary& didNotResolve);
+    void netServiceDidStop(const adminhost::NetService& service);
 
     /// "updated_at", "created_at", "used_at": the resources' own date keys. No operation calls it.
     [[nodiscard]] static std::vector<std::string_view> listOfResourceDateKeys();

@@ -1,5 +1,7 @@
 #include "handler/LumioRequestHandler.h"
+#include "platform/crypto/Crypt.h"
 #include "platform/value/Text.h"
+#include "resources/Property.h"
 
 #include <algorithm>
 #include <cmath>
@@ -88,7 +90,14 @@ void LumioRequestHandler::copyIdentityPreferencesToConfig(Dictionary& config) co
 void LumioRequestHandler::copyClusterPreferencesToConfig(Dictionary& config) const {
     if (const auto prefs = clusterPreferences()) {
         copyKeys(clusterPreferencesKeysToCopy(), *prefs, config);
+        std::string password = nimboClientPasswordFromPrefs(*prefs).value_or("");
+        config.set("nimbo_client_password_is_set", !password.empty());
+        adminhost::cleanse(password.data(), password.size());
     }
+}
+
+std::optional<std::string> LumioRequestHandler::nimboClientPasswordFromPrefs(const Dictionary& prefs) {
+    return Property::decryptValue(prefs.get("nimbo_client_password"));
 }
 
 void LumioRequestHandler::copyMemberPreferencesToConfig(Dictionary& config) const {

@@ -2,12 +2,14 @@
 #include "platform/log/Log.h"
 #include "platform/value/Text.h"
 #include "resources/Camera.h"
+#include "resources/Property.h"
 
 namespace lumio {
 
 using adminhost::Array;
 using adminhost::Dictionary;
 using adminhost::Error;
+using adminhost::logEvent;
 using adminhost::Response;
 using adminhost::Value;
 
@@ -51,6 +53,21 @@ void changeAccess(Resource& resource, const Dictionary& entry) {
     resource.changeACLsWithRequest(entry.get("allowedUsersAndGroups").array());
 }
 
+/// The languages in which texts are wanted, most preferred first: the request's, else the host's.
+std::vector<std::string> languagesOf(const Dictionary& request) {
+    const Value& requested = request.at("optionalArguments.languages");
+    const Value& value = requested.isNull() ? adminhost::userDefault("BrennLanguages") : requested;
+    std::vector<std::string> languages;
+    if (const Array* array = value.array()) {
+        for (const Value& language : *array) {
+            if (const std::string* text = language.string()) {
+                languages.push_back(*text);
+            }
+        }
+    }
+    return languages;
+}
+
 }  // namespace
 
 Response LumioRequestHandler::getCamerasWithRequest(const Dictionary&) {
@@ -72,8 +89,8 @@ Response LumioRequestHandler::processCameraChangesWithRequest(const Array* chang
         const auto camera = Camera::initWithGUID(identifierOf(entry));
         if (flagOf(entry.get("_obsoleteid_"))) {
             if (const auto error = camera->delete_()) {
-                adminhost::logEvent("adminhost_lumio: could not delete camera with uuid: " + textOf(entry.get("_id_")) +
-                                    ", error: " + textOf(*error));
+                logEvent("adminhost_lumio: could not delete camera with uuid: " + textOf(entry.get("_id_")) +
+                         ", error: " + textOf(*error));
             }
             return;
         }
@@ -85,15 +102,49 @@ Response LumioRequestHandler::processCameraChangesWithRequest(const Array* chang
 Response LumioRequestHandler::getWorkflowsWithRequest(const Dictionary&) {
     return responseForError("NOT_AVAILABLE");
 }
-Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary&) {
-    return responseForError("NOT_AVAILABLE");
+
+Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary& request) {
+    std::optional<Error> error;
+    const auto properties = Property::allPropertiesUsingLocalizations(languagesOf(request), error);
+    if (!properties) {
+        return failedListing(error);
+    }
+    Array list;
+    list.reserve(properties->size());
+    for (const auto& property : *properties) {
+        property->addDataDictionaryToMutableArray(list);
+    }
+    return listing("getProperties", "properties", std::move(list));
 }
 
 Response LumioRequestHandler::setWorkflowACLWithRequest(const Array*) {
     return responseForError("NOT_AVAILABLE");
 }
-Response LumioRequestHandler::processPropertyChangesWithRequest(const Array*) {
-    return responseForError("NOT_AVAILABLE");
+
+Response LumioRequestHandler::processPropertyChangesWithRequest(const Array* changes) {
+    forEachEntry(changes, [](const Dictionary& entry) {
+        const Value& id = entry.get("_id_");
+        // An entry that is both obsolete and new is deleted.
+        if (flagOf(entry.get("_obsoleteid_"))) {
+            if (const auto error = Property::deletePropertyWithID(id)) {
+                logEvent("adminhost_lumio: could not delete property with id: " + textOf(id) +
+                         ", error: " + textOf(*error));
+            }
+        } else if (flagOf(entry.get("_newid_"))) {
+            if (const auto error = Property::initNewPropertyWithDictionary(entry)->write()) {
+                logEvent("adminhost_lumio: could not insert new property: " + textOf(*error));
+            }
+        } else {
+            logEvent("adminhost_lumio: update property");
+            const std::unique_ptr<Property> property = Property::initWithChangeRequest(entry);
+            logEvent("adminhost_lumio: update property -> write");
+            if (const auto error = property->write()) {
+                logEvent("adminhost_lumio: could not update property with id: " + textOf(id) +
+                         ", error: " + textOf(*error));
+            }
+        }
+    });
+    return nullptr;
 }
 
 }  // namespace lumio

@@ -1,6 +1,6 @@
 #pragma once
 
-// The system log of a test: keeps the events while it lives.
+// The system log of a test.
 
 #include "platform/log/Log.h"
 
@@ -11,25 +11,22 @@
 
 namespace adminhost::test {
 
-class CapturedLog : public LogSink {
+/// Keeps every event while it lives.
+class CapturedLog final : public LogSink {
   public:
     CapturedLog() { setLogSink(*this); }
     CapturedLog(const CapturedLog&) = delete;
     CapturedLog& operator=(const CapturedLog&) = delete;
     ~CapturedLog() override { setLogSink(standardErrorSink()); }
+    void write(std::string_view event) noexcept override { lines.emplace_back(event); }
 
-    void write(std::string_view event) noexcept override { _events.emplace_back(event); }
-
-    [[nodiscard]] const std::vector<std::string>& events() const noexcept { return _events; }
     /// Whether any event has the text in it.
     [[nodiscard]] bool contains(std::string_view text) const {
-        return std::any_of(_events.begin(), _events.end(),
-                           [&](const std::string& event) { return event.find(text) != std::string::npos; });
+        return std::any_of(lines.begin(), lines.end(),
+                           [&](const std::string& line) { return line.find(text) != std::string::npos; });
     }
-    void clear() noexcept { _events.clear(); }
 
-  private:
-    std::vector<std::string> _events;
+    std::vector<std::string> lines;
 };
 
 }  // namespace adminhost::test

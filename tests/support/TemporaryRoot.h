@@ -3,7 +3,7 @@
 // A system root of the test's own: an empty directory below the test's temporary directory, set as the process's system
 // root and removed at the end, with the real sqlite3 tool at its place; and the log lines that the test causes.
 
-#include "platform/log/Log.h"
+#include "tests/support/CapturedLog.h"
 
 #include <filesystem>
 #include <string>
@@ -11,18 +11,6 @@
 #include <vector>
 
 namespace adminhost::test {
-
-/// Keeps every event while it lives.
-class CapturedLog final : public LogSink {
-  public:
-    CapturedLog() { setLogSink(*this); }
-    CapturedLog(const CapturedLog&) = delete;
-    CapturedLog& operator=(const CapturedLog&) = delete;
-    ~CapturedLog() override { setLogSink(standardErrorSink()); }
-    void write(std::string_view event) noexcept override { lines.emplace_back(event); }
-
-    std::vector<std::string> lines;
-};
 
 class TemporaryRoot {
   public:

@@ -163,7 +163,7 @@ TEST(ByteBuffer, DropsBytesAndLogsEachWhenItCannotGrow) {
     char expected[96];
     std::snprintf(expected, sizeof expected, "Cannot append any more bytes to buffer at %p.",
                   static_cast<void*>(&buffer));
-    EXPECT_EQ(log.events(), (std::vector<std::string>{expected, expected}));
+    EXPECT_EQ(log.lines, (std::vector<std::string>{expected, expected}));
     EXPECT_EQ(text(std::move(buffer).take()), "ab");
 }
 
@@ -173,7 +173,7 @@ TEST(ByteBuffer, GrowsToTwiceItsLengthUntilTheLimitIsReached) {
     for (int i = 0; i < 10; ++i) {
         buffer.append('x');
     }
-    EXPECT_EQ(log.events().size(), 2U);
+    EXPECT_EQ(log.lines.size(), 2U);
     EXPECT_EQ(std::move(buffer).take().size(), 8U);
 }
 
@@ -189,7 +189,7 @@ TEST(ByteBuffer, SurvivesACapacityThatCannotBeHad) {
     CapturedLog log;
     ByteBuffer buffer(static_cast<std::size_t>(-1));
     buffer.append('x');
-    EXPECT_EQ(log.events().size(), 1U);
+    EXPECT_EQ(log.lines.size(), 1U);
     EXPECT_TRUE(std::move(buffer).take().empty());
 }
 
@@ -199,7 +199,7 @@ TEST(Base64Encoder, GoesOnWithAShortenedTextWhenTheBufferIsFull) {
     const Data data = randomBytes(58);
     const std::string out = text(encodeBase64Data(data, {.growth = {.reserve = growthFails}}));
     EXPECT_EQ(out, encodedByTheRules(data, true, true, '=').substr(0, 77));
-    EXPECT_EQ(log.events().size(), 4U);
+    EXPECT_EQ(log.lines.size(), 4U);
 }
 
 TEST(Base64Encoder, ShortenedTextIsTheBeginningOfTheWholeAtEveryLength) {
@@ -211,7 +211,7 @@ TEST(Base64Encoder, ShortenedTextIsTheBeginningOfTheWholeAtEveryLength) {
             const std::string out =
                 text(encodeBase64Data(data, {.standardAlphabet = standard, .growth = {.reserve = growthFails}}));
             ASSERT_EQ(out, whole.substr(0, std::max<std::size_t>(1, 4 * length / 3)));
-            ASSERT_EQ(log.events().size(), whole.size() - out.size());
+            ASSERT_EQ(log.lines.size(), whole.size() - out.size());
         }
     }
 }
@@ -318,7 +318,7 @@ TEST(Base64Decoder, RemainderOfOneCharacterIsOnlyLogged) {
     CapturedLog log;
     std::uint8_t out[3];
     EXPECT_EQ(decodeRemainder(bytes("/"), 5, out), out);
-    EXPECT_EQ(log.events(), std::vector<std::string>{"*** _decodeBase64Data: i=5, k=3f"});
+    EXPECT_EQ(log.lines, std::vector<std::string>{"*** _decodeBase64Data: i=5, k=3f"});
 }
 
 TEST(Base64Decoder, WhatWasEncodedComesBackAtEveryLength) {

@@ -1,0 +1,279 @@
+#include "resources/Property.h"
+
+#include "codec/LumioCategories.h"
+#include "platform/bundle/Bundle.h"
+#include "platform/log/Log.h"
+#include "platform/value/Text.h"
+#include "resources/WrappedRows.h"
+
+#include <algorithm>
+#include <chrono>
+#include <cstdlib>
+
+namespace lumio {
+
+using adminhost::Array;
+using adminhost::booleanOf;
+using adminhost::Dictionary;
+using adminhost::DictionaryEntry;
+using adminhost::Error;
+using adminhost::logEvent;
+using adminhost::textOf;
+using adminhost::Value;
+
+namespace {
+
+constexpr const char* localizationBundle = "/System/Library/SorvaneProducer/SorvaneProducerServerLocalizations.bundle";
+
+/// The rows of a statement on the properties table, each whole.
+std::optional<std::vector<Dictionary>> propertyRows(const std::string& statement, std::optional<Error>& error) {
+    auto records = Property::querySorvaneDatabase<Dictionary>(statement, error);
+    return records ? std::optional(wholePropertyRows(std::move(*records))) : std::nullopt;
+}
+
+std::string updateStatement(const Dictionary& working, const Value& id) {
+    const std::vector<std::string>& columns = Property::tableColumnNames();
+    std::string statement = "update properties set ";
+    for (const DictionaryEntry& entry : working) {
+        if (entry.key != "id" && std::find(columns.begin(), columns.end(), entry.key) != columns.end()) {
+            statement += entry.key + "=\"" + textOf(entry.value) + "\", ";
+        }
+    }
+    statement.resize(statement.size() - 2);
+    // Without a record the id's text is (null), which no row has.
+    return statement + " where id=" + textOf(id);
+}
+
+std::string insertStatement(const Dictionary& working) {
+    std::string keys;
+    std::string values;
+    for (const DictionaryEntry& entry : working) {
+        keys += (keys.empty() ? "" : ",") + entry.key;
+        values += (&entry == &*working.begin() ? "" : "\",\"") + textOf(entry.value);
+    }
+    return "insert into properties (" + keys + ") values (\"" + values + "\")";
+}
+
+}  // namespace
+
+const std::vector<std::string>& Property::tableColumnNames() {
+    static const std::vector<std::string> names{"id", "name", "value", "protect", "created_at", "updated_at"};
+    return names;
+}
+
+std::vector<std::string_view> Property::listOfResourceDateKeys() const {
+    return {"updated_at", "created_at"};
+}
+
+void Property::readRow(Dictionary row) {
+    Resource::readRow(std::move(row));
+    _changeValues.reset();
+    const bool isProtected = _data->get("protect") == Value("t");
+    _data->set("protect", isProtected);
+    if (isProtected) {
+        _data->remove("value");
+    }
+    if (_data->contains("id")) {
+        _data->set("_id_", _data->get("id"));
+    }
+}
+
+std::unique_ptr<Property> Property::initNewPropertyWithDictionary(const Dictionary& request) {
+    auto property = init();
+    property->_data = objectsWithAndForKeys(request, &tableColumnNames());
+    if (!property->_data->contains("protect")) {
+        property->_data->set("protect", false);
+    }
+    return property;
+}
+
+std::unique_ptr<Property> Property::initWithChangeRequest(const Dictionary& request) {
+    auto property = init();
+    property->_changeValues = request;
+    const Value& id = request.get("_id_");
+    if (!id.isNull()) {
+        property->_changeValues->remove("_id");
+        std::optional<Error> error;
+        auto rows = propertyRows("select * from properties where id = " + textOf(id) + ";", error);
+        if (rows && !rows->empty()) {
+            property->_data = std::move(rows->front());
+        }
+    }
+    return property;
+}
+
+std::optional<std::vector<std::unique_ptr<Property>>> Property::allPropertiesWithError(std::optional<Error>& error) {
+    auto rows = propertyRows("select * from properties;", error);
+    if (!rows) {
+        logEvent("Error getting Sorvane workflow properties: " + textOf(error));
+        return std::nullopt;
+    }
+    std::vector<std::unique_ptr<Property>> properties;
+    properties.reserve(rows->size());
+    for (Dictionary& row : *rows) {
+        properties.push_back(initWithDictionary(std::move(row)));
+    }
+    return properties;
+}
+
+std::optional<std::vector<std::unique_ptr<Property>>> Property::allPropertiesUsingLocalizations(
+    const std::vector<std::string>& languages, std::optional<Error>& error) {
+    auto properties = allPropertiesWithError(error);
+    if (!properties) {
+        return std::nullopt;
+    }
+    if (const std::optional<Dictionary> descriptions = descriptionsForLocalizations(languages)) {
+        for (const auto& property : *properties) {
+            const Value& description = descriptions->get(textOf(property->_data->get("name")));
+            if (!description.isNull()) {
+                property->_data->set("description", description);
+            }
+        }
+    }
+    return properties;
+}
+
+std::optional<Dictionary> Property::descriptionsForLocalizations(const std::vector<std::string>& languages) {
+    const auto bundle = adminhost::Bundle::open(adminhost::HostPath(localizationBundle));
+    return bundle ? adminhost::localizedTable(*bundle, "PropertyDescriptions", languages) : std::nullopt;
+}
+
+std::optional<Error> Property::deletePropertyWithID(const Value& id) {
+    std::optional<Error> error;
+    if (id.isNull()) {
+        return error;
+    }
+    static_cast<void>(querySorvaneDatabase("delete from properties where id=\"" + textOf(id) + "\"", error));
+    if (error) {
+        logEvent("error deleting property with ID:\n" + textOf(id) + "\n  error:: " + textOf(error));
+    }
+    return error;
+}
+
+std::optional<Error> Property::delete_() {
+    std::optional<Error> error;
+    const Value& id = stored("id");
+    if (id.isNull()) {
+        return error;
+    }
+    static_cast<void>(querySorvaneDatabase("delete from properties where id=\"" + textOf(id) + "\"", error));
+    if (error) {
+        logEvent("error deleting property:\n" + recordText(booleanOf(stored("protect"))) +
+                 "\n  error:: " + textOf(error));
+    }
+    return error;
+}
+
+std::optional<Error> Property::write() {
+    const bool isUpdate = _changeValues.has_value();
+    const Value id = stored("id");
+    Dictionary working = isUpdate ? *_changeValues : _data.value_or(Dictionary());
+    // One error for the name check and the write: a name check that failed is reported even when the write succeeds.
+    std::optional<Error> error;
+    if (const Value* name = working.find("name")) {
+        if (std::optional<Error> taken = nameError(*name, error)) {
+            return taken;
+        }
+    }
+    working.remove("_id_");
+
+    const bool wasProtected = booleanOf(stored("protect"));
+    bool isProtected = wasProtected;
+    bool deciphered = false;
+    if (const Value* protect = working.find("protect")) {
+        isProtected = booleanOf(*protect);
+        working.set("protect", isProtected ? "t" : "f");
+        if (isUpdate && !working.contains("value")) {
+            if (isProtected) {
+                // Clients send "protect" only when it changes: a value that is protected already is protected twice.
+                working.set("value", stored("value"));
+            } else if (std::optional<std::string> plain = decryptValue(stored("value"))) {
+                working.set("value", std::move(*plain));
+                deciphered = true;
+            }
+        }
+    }
+    if (isProtected && working.contains("value")) {
+        std::optional<std::string> protectedValue = encryptValue(working.get("value"));
+        if (!protectedValue) {
+            return Error{"LumioPropertyCantEncryptValue", 1, std::nullopt};
+        }
+        working.set("value", std::move(*protectedValue));
+    }
+
+    const std::string now =
+        adminhost::localTextOf(std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now()));
+    working.set("updated_at", now);
+    if (isUpdate) {
+        working.remove("created_at");
+    } else {
+        working.set("created_at", now);
+    }
+    std::optional<Error> failure;
+    static_cast<void>(
+        querySorvaneDatabase(isUpdate ? updateStatement(working, id) : insertStatement(working), failure));
+    if (failure) {
+        if (deciphered) {
+            // The tool quotes the statement, and with it a value that stays protected now.
+            failure->description = "Can't execute sqlite3 query: (secret)";
+        }
+        error = std::move(failure);
+    }
+    if (error) {
+        logEvent("error writing property:\n" + recordText(isProtected || wasProtected) +
+                 "\n   error: " + textOf(error));
+    }
+    return error;
+}
+
+std::optional<Error> Property::nameError(const Value& name, std::optional<Error>& toolError) const {
+    const Value& id = stored("id");
+    const std::string condition = id.isNull() ? ";" : " and not id=" + textOf(id) + ";";
+    const auto rows =
+        propertyRows("select id,name,value from properties where name=\"" + textOf(name) + "\"" + condition, toolError);
+    if (!rows || rows->empty()) {
+        return std::nullopt;
+    }
+    const Dictionary& other = rows->back();
+    return Error{"sqliteQuery", 2,
+                 "Property name '" + textOf(other.get("name")) + "' already exists with value '" +
+                     textOf(other.get("value")) + "'"};
+}
+
+const Value& Property::stored(std::string_view key) const noexcept {
+    static const Value none;
+    return _data ? _data->get(key) : none;
+}
+
+std::string Property::recordText(bool hideValue) const {
+    if (!_data) {
+        return textOf(Value());
+    }
+    Dictionary shown = *_data;
+    if (hideValue && shown.contains("value")) {
+        shown.set("value", "(secret)");
+    }
+    return textOf(Value(std::move(shown)));
+}
+
+void Property::addDataDictionaryToMutableArray(Array& array) const {
+    if (_data) {
+        array.emplace_back(*_data);
+    }
+}
+
+std::optional<std::int64_t> Property::getIDForName(const std::string& name, const std::string& table) const {
+    const std::string statement = "select id from " + table + " where name='" + name + "';";
+    std::optional<Error> error;
+    const auto rows = querySorvaneDatabase<Dictionary>(statement, error);
+    if (!rows || rows->empty()) {
+        logEvent("getIDForName:fromTable: found nothing for this query: " + statement);
+    }
+    logEvent("idForNAme result: " + textOf(rows ? Value(Array(rows->begin(), rows->end())) : Value()));
+    if (!rows || rows->size() != 1) {
+        return std::nullopt;
+    }
+    return std::strtoll(textOf(rows->front().get("id")).c_str(), nullptr, 10);
+}
+
+}  // namespace lumio

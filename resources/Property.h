@@ -1,0 +1,85 @@
+#pragma once
+
+// Workflow properties: named values for the service's workflows, some of them protected.
+//
+// A protected value is stored as docs/protected-values.md describes and is never listed. Values reach statements as
+// they are, between double quotes and unescaped: one with a double quote makes its statement fail.
+//
+// A property lives for one request: made for listing (initWithDictionary), for insertion
+// (initNewPropertyWithDictionary) or for change (initWithChangeRequest). write() inserts one that has no change values
+// and updates one that has.
+
+#include "resources/Resource.h"
+
+namespace lumio {
+
+class Property final : public ResourceClass<Property> {
+  public:
+    /// "id", "name", "value", "protect", "created_at", "updated_at".
+    [[nodiscard]] static const std::vector<std::string>& tableColumnNames();
+
+    /// A property to insert: the request's entries for the table's columns, "id" included; "protect" false if it is not
+    /// given.
+    [[nodiscard]] static std::unique_ptr<Property> initNewPropertyWithDictionary(const adminhost::Dictionary& request);
+    /// A property to change: the record is the row whose id is the request's "_id_", raw. A row that does not exist or
+    /// cannot be read leaves the record null, and write() then changes nothing and reports no error.
+    [[nodiscard]] static std::unique_ptr<Property> initWithChangeRequest(const adminhost::Dictionary& request);
+
+    /// Every property, as administrators see it; nothing, with the error and a log line, on failure. "protect" is a
+    /// boolean, a protected "value" is absent, "_id_" repeats "id".
+    [[nodiscard]] static std::optional<std::vector<std::unique_ptr<Property>>> allPropertiesWithError(
+        std::optional<adminhost::Error>& error);
+    /// The same, each with its "description" where the service has one in the languages (most preferred first).
+    [[nodiscard]] static std::optional<std::vector<std::unique_ptr<Property>>> allPropertiesUsingLocalizations(
+        const std::vector<std::string>& languages, std::optional<adminhost::Error>& error);
+    /// Descriptions by property name; nothing if the service's bundle or a table in it is missing.
+    [[nodiscard]] static std::optional<adminhost::Dictionary> descriptionsForLocalizations(
+        const std::vector<std::string>& languages);
+
+    /// Deletes the row; null does nothing. The error, which is logged too, if the tool fails.
+    static std::optional<adminhost::Error> deletePropertyWithID(const adminhost::Value& id);
+
+    // Between a plain text and its protected form, under the key that is read afresh from the shared file system. Null
+    // gives nothing, and so does, after a log line, a missing key file or secret and any failure of the cipher.
+    [[nodiscard]] static std::optional<std::string> encryptValue(const adminhost::Value& value);
+    [[nodiscard]] static std::optional<std::string> decryptValue(const adminhost::Value& value);
+    [[nodiscard]] static std::optional<std::string> cryptedValue(const adminhost::Value& value, bool encrypt);
+
+    /// Inserts or updates the row. Refused, and nothing written: a name that another property has, and a value that is
+    /// to be protected but cannot be. Protection switched on without a new value protects the stored one, one that is
+    /// protected already too; switched off without a new value it stores the plain text, if the stored one can be
+    /// deciphered. The name check's failure in the tool does not stop the write but is what is reported then.
+    [[nodiscard]] std::optional<adminhost::Error> write();
+    /// Deletes the record's row; without an id nothing.
+    [[nodiscard]] std::optional<adminhost::Error> delete_() override;
+    /// Appends the record, if there is one.
+    void addDataDictionaryToMutableArray(adminhost::Array& array) const;
+
+    /// The id of the only row of the table with that name.
+    [[nodiscard]] std::optional<std::int64_t> getIDForName(const std::string& name, const std::string& table) const;
+
+    /// The requested changes of an existing property; nothing for one that is new or listed.
+    [[nodiscard]] const std::optional<adminhost::Dictionary>& changeValues() const noexcept { return _changeValues; }
+    void setChangeValues(std::optional<adminhost::Dictionary> values) { _changeValues = std::move(values); }
+
+    [[nodiscard]] std::string_view resourceType() const noexcept override { return "property"; }
+    /// The record as it is: properties have no access lists.
+    [[nodiscard]] const adminhost::Dictionary* dictionary() override { return _data ? &*_data : nullptr; }
+
+  protected:
+    [[nodiscard]] std::string_view className() const noexcept override { return "Property"; }
+    [[nodiscard]] std::vector<std::string_view> listOfResourceDateKeys() const override;
+    void readRow(adminhost::Dictionary row) override;
+
+  private:
+    [[nodiscard]] std::optional<adminhost::Error> nameError(const adminhost::Value& name,
+                                                            std::optional<adminhost::Error>& toolError) const;
+    /// The record's value under the key; null without a record.
+    [[nodiscard]] const adminhost::Value& stored(std::string_view key) const noexcept;
+    /// The record's text for the log, its value hidden on demand.
+    [[nodiscard]] std::string recordText(bool hideValue) const;
+
+    std::optional<adminhost::Dictionary> _changeValues;
+};
+
+}  // namespace lumio

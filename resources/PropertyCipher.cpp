@@ -1,0 +1,88 @@
+#include "codec/LumioAESCategories.h"
+#include "handler/SettingsStore.h"
+#include "platform/crypto/Crypt.h"
+#include "platform/log/Log.h"
+#include "platform/plist/PropertyList.h"
+#include "platform/value/Text.h"
+#include "resources/Property.h"
+
+namespace lumio {
+
+using adminhost::Data;
+using adminhost::Dictionary;
+using adminhost::logEvent;
+using adminhost::ScopedCleanse;
+using adminhost::textOf;
+using adminhost::Value;
+
+namespace {
+
+Bytes bytesOf(std::string_view text) noexcept {
+    return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
+}
+
+/// The key file belongs to the service, which makes it when it is set up; here it is only read, on every call.
+std::optional<Data> keyEncryptionKey() {
+    const auto preferences = SettingsStore::identityPreferences();
+    const Value sharedFilesystem = preferences ? preferences->get("shared_filesystem") : Value();
+    const std::string path = textOf(sharedFilesystem) + "/Server/Secrets/kek.plist";
+    std::optional<Value> file;
+    if (!sharedFilesystem.isNull()) {
+        file = adminhost::readPropertyList(adminhost::diskPath(adminhost::HostPath(path)));
+    }
+    if (!file || file->dictionary() == nullptr) {
+        logEvent("failed to load " + path);
+        return std::nullopt;
+    }
+    const std::string* secret = file->dictionary()->get("lumio_secret").string();
+    if (secret == nullptr) {
+        logEvent("kek shared_secret not found");
+        return std::nullopt;
+    }
+    Data key = base64DecodedData(*secret);
+    // The file's values are this function's own, and not to be seen after it.
+    adminhost::cleanse(const_cast<char*>(secret->data()), secret->size());
+    return key;
+}
+
+}  // namespace
+
+std::optional<std::string> Property::encryptValue(const Value& value) {
+    return cryptedValue(value, true);
+}
+
+std::optional<std::string> Property::decryptValue(const Value& value) {
+    return cryptedValue(value, false);
+}
+
+std::optional<std::string> Property::cryptedValue(const Value& value, bool encrypt) {
+    if (value.isNull()) {
+        return std::nullopt;
+    }
+    std::optional<Data> key = keyEncryptionKey();
+    if (!key) {
+        return std::nullopt;
+    }
+    const ScopedCleanse wipeKey(*key);
+    std::string text = textOf(value);
+    const ScopedCleanse wipeText(text);
+    std::optional<Data> converted = encrypt
+                                        ? aes128cbcEncryptDataWithKey(bytesOf(text), *key)
+                                        : aes128cbcDecryptDataWithKey(LumioUtilities_decodeBase64(bytesOf(text)), *key);
+    if (!converted) {
+        logEvent("no convertedValueData from aes128cbc...");
+        return std::nullopt;
+    }
+    if (encrypt) {
+        return base64EncodedString(*converted);
+    }
+    const ScopedCleanse wipePlain(*converted);
+    std::string plain(converted->begin(), converted->end());
+    if (!adminhost::isUtf8(plain)) {
+        adminhost::cleanse(plain.data(), plain.size());
+        return std::nullopt;
+    }
+    return plain;
+}
+
+}  // namespace lumio
