@@ -6,9 +6,6 @@ using adminhost::Response;
 
 // What this release declares but does not offer yet says so, and never pretends to have done anything.
 
-Response LumioRequestHandler::writeSettingsWithRequest(const Dictionary&) {
-    return responseForError("NOT_AVAILABLE");
-}
 Response LumioRequestHandler::getStateWithRequest(const Dictionary&) {
     return responseForError("NOT_AVAILABLE");
 }

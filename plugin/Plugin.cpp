@@ -4,6 +4,7 @@
 
 #include "commands/CommandTable.h"
 #include "handler/LumioRequestHandler.h"
+#include "handler/Revision.h"
 #include "platform/log/Log.h"
 
 #include <algorithm>
@@ -63,7 +64,12 @@ Response perform(std::string_view command, const Dictionary& request) noexcept {
 }
 
 std::string revision() noexcept {
-    return {};
+    try {
+        return lumio::settingsRevision();
+    } catch (const std::exception& exception) {
+        adminhost::logEvent(std::string("adminhost_lumio: no revision: ") + exception.what());
+        return {};
+    }
 }
 
 constexpr adminhost::Plugin plugin{

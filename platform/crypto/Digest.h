@@ -1,0 +1,14 @@
+#pragma once
+
+// Message digests.
+
+#include <string>
+#include <string_view>
+
+namespace adminhost {
+
+/// The SHA-256 digest (FIPS 180-4) of the bytes, as 64 lower-case hexadecimal digits. Throws std::runtime_error if the
+/// cryptography library fails.
+[[nodiscard]] std::string sha256Of(std::string_view bytes);
+
+}  // namespace adminhost

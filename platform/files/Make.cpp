@@ -1,0 +1,95 @@
+#include "platform/files/Make.h"
+
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <memory>
+#include <string>
+#include <system_error>
+
+#include <fcntl.h>
+#include <grp.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace adminhost {
+namespace {
+
+Error failure(const char* step, int number) {
+    return Error{"posix", number, std::string(step) + ": " + std::generic_category().message(number)};
+}
+
+/// Sets the attributes through a descriptor, so that a link put in the directory's place is never followed.
+std::optional<Error> setAttributes(const std::string& path, const DirectoryAttributes& attributes) {
+    const int directory = ::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+    if (directory < 0) {
+        return failure("cannot open the new directory", errno);
+    }
+    std::optional<Error> error;
+    if (::fchmod(directory, attributes.mode) != 0) {
+        error = failure("cannot set the mode", errno);
+    }
+    if (::fchown(directory, attributes.owner, attributes.group) != 0) {
+        error = failure("cannot set the owner", errno);
+    }
+    ::close(directory);
+    return error;
+}
+
+}  // namespace
+
+std::optional<Error> makeDirectories(const DiskPath& path, const DirectoryAttributes& attributes) {
+    std::optional<Error> error;
+    const std::string& whole = path.text();
+    for (std::size_t end = whole.find('/', 1); !whole.empty(); end = whole.find('/', end + 1)) {
+        const std::string part = whole.substr(0, end);
+        if (::mkdir(part.c_str(), 0700) == 0) {
+            if (auto failed = setAttributes(part, attributes)) {
+                error = std::move(failed);
+            }
+        } else if (errno != EEXIST) {
+            return failure("cannot make the directory", errno);
+        }
+        if (end == std::string::npos) {
+            break;
+        }
+    }
+    struct stat status {};
+    if (!error && (::stat(whole.c_str(), &status) != 0 || !S_ISDIR(status.st_mode))) {
+        error = failure("cannot make the directory", ENOTDIR);
+    }
+    return error;
+}
+
+std::optional<Error> makeEmptyFile(const DiskPath& path) {
+    const int file = ::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
+    if (file < 0) {
+        return failure("cannot make the file", errno);
+    }
+    const bool synced = ::fsync(file) == 0;
+    const int number = errno;
+    if (::close(file) != 0 || !synced) {
+        return failure("cannot make the file", synced ? errno : number);
+    }
+    return std::nullopt;
+}
+
+std::optional<gid_t> groupIdOf(const char* name) {
+    const auto close = [](std::FILE* file) { std::fclose(file); };
+    const std::unique_ptr<std::FILE, decltype(close)> file(std::fopen(diskPath(HostPath("/etc/group")).c_str(), "re"),
+                                                           close);
+    if (!file) {
+        return std::nullopt;
+    }
+    std::string buffer(std::size_t{1} << 16U, '\0');
+    group entry{};
+    group* found = nullptr;
+    while (::fgetgrent_r(file.get(), &entry, buffer.data(), buffer.size(), &found) == 0) {
+        if (std::string_view(entry.gr_name) == name) {
+            return entry.gr_gid;
+        }
+    }
+    return std::nullopt;
+}
+
+}  // namespace adminhost
