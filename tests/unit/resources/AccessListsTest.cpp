@@ -107,7 +107,7 @@ class AccessLists : public testing::Test {
         }
         return lines;
     }
-    void change(Array entries) const { Camera::initWithGUID("C-7")->changeACLsWithRequest(&entries); }
+    void change(const Array& entries) const { Camera::initWithGUID("C-7")->changeACLsWithRequest(&entries); }
 
     adminhost::test::TemporaryRoot root;
     adminhost::test::CapturedLog log;
