@@ -135,7 +135,7 @@ std::optional<std::vector<std::unique_ptr<Property>>> Property::allPropertiesUsi
 
 std::optional<Dictionary> Property::descriptionsForLocalizations(const std::vector<std::string>& languages) {
     const auto bundle = adminhost::Bundle::open(adminhost::HostPath(localizationBundle));
-    return bundle ? adminhost::localizedTable(*bundle, "PropertyDescriptions", languages) : std::nullopt;
+    return bundle ? localizationsForResourceNamed("PropertyDescriptions", *bundle, languages) : std::nullopt;
 }
 
 std::optional<Error> Property::deletePropertyWithID(const Value& id) {

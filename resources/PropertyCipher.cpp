@@ -9,7 +9,6 @@
 namespace lumio {
 
 using adminhost::Data;
-using adminhost::Dictionary;
 using adminhost::logEvent;
 using adminhost::ScopedCleanse;
 using adminhost::textOf;

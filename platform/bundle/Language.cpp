@@ -127,6 +127,7 @@ struct Candidate {
 
 std::vector<Candidate> candidatesOf(const std::vector<std::string>& localizations) {
     std::vector<Candidate> candidates;
+    candidates.reserve(localizations.size());
     for (const std::string& localization : localizations) {
         candidates.push_back({localization, tagOf(localization)});
     }
@@ -157,6 +158,7 @@ void appendMatches(std::vector<std::string>& matches, const std::vector<Candidat
                    std::string_view spelling, Rank last) {
     const std::optional<Tag> wanted = tagOf(spelling);
     std::vector<std::pair<Rank, const std::string*>> ranked;
+    ranked.reserve(candidates.size());
     for (const Candidate& candidate : candidates) {
         ranked.emplace_back(rankOf(candidate, spelling, wanted), &candidate.spelling);
     }
