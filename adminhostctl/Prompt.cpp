@@ -9,6 +9,7 @@
 #include <cstring>
 #include <memory>
 
+#include <poll.h>
 #include <termios.h>
 #include <unistd.h>
 
@@ -27,7 +28,8 @@ void remember(int number) noexcept {
     caughtSignal = number;
 }
 
-/// While it lives, signals that would end or stop the program are remembered instead and interrupt reading.
+/// While it lives, signals that would end or stop the program are held back, and waitForInput() remembers them instead.
+/// Held back outside of it, because one that came just before a blocking read would not interrupt that read.
 class SignalGuard {
   public:
     SignalGuard() noexcept {
@@ -35,6 +37,12 @@ class SignalGuard {
         struct sigaction action {};
         action.sa_handler = &remember;
         sigemptyset(&action.sa_mask);
+        sigset_t held;
+        sigemptyset(&held);
+        for (const int number : signals) {
+            sigaddset(&held, number);
+        }
+        sigprocmask(SIG_BLOCK, &held, &_maskBefore);
         for (std::size_t i = 0; i < signals.size(); ++i) {
             sigaction(signals.at(i), &action, &_before.at(i));
         }
@@ -43,13 +51,21 @@ class SignalGuard {
         for (std::size_t i = 0; i < signals.size(); ++i) {
             sigaction(signals.at(i), &_before.at(i), nullptr);
         }
+        sigprocmask(SIG_SETMASK, &_maskBefore, nullptr);
     }
     SignalGuard(const SignalGuard&) = delete;
     SignalGuard& operator=(const SignalGuard&) = delete;
 
+    /// Waits until standard input can be read; false when a signal came instead.
+    [[nodiscard]] bool waitForInput() const noexcept {
+        pollfd input{STDIN_FILENO, POLLIN, 0};
+        return ::ppoll(&input, 1, nullptr, &_maskBefore) > 0 && caughtSignal == 0;
+    }
+
   private:
     static constexpr std::array<int, 5> signals = {SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGTSTP};
     std::array<struct sigaction, 5> _before{};
+    sigset_t _maskBefore{};
 };
 
 /// While it lives, the terminal does not show what is typed.
@@ -120,15 +136,10 @@ std::string askSecret(const std::string& key) {
         const std::string question = key + ": ";
         static_cast<void>(!::write(STDERR_FILENO, question.data(), question.size()));
         char c = 0;
-        while (true) {
-            const ssize_t count = ::read(STDIN_FILENO, &c, 1);
-            if (count == 1 && c != '\n') {
+        while (!ended && c != '\n') {
+            ended = !signals.waitForInput() || ::read(STDIN_FILENO, &c, 1) != 1;
+            if (!ended && c != '\n') {
                 line.push_back(c);
-            } else if (count == 1) {
-                break;
-            } else {
-                ended = true;
-                break;
             }
         }
     }

@@ -32,30 +32,29 @@ bool isSection(const Value& value) {
     return (value.dictionary() != nullptr && !value.dictionary()->empty()) || (isTable(value) && !isPeople(value));
 }
 
-/// The number of an integer, also of one that is stored as text.
-std::optional<std::uint64_t> countOf(const Value& value) {
-    if (const std::string* text = value.string()) {
-        std::uint64_t number = 0;
-        const char* const end = text->data() + text->size();
-        const auto result = std::from_chars(text->data(), end, number);
-        return result.ec == std::errc() && result.ptr == end ? std::optional(number) : std::nullopt;
+/// The number of a number, also of one that is stored as text.
+std::optional<double> numberOf(const Value& value) {
+    if (const auto real = value.real()) {
+        return real;
     }
-    return value.unsignedInteger();
+    const std::string digits = value.isInteger() ? textOf(value) : value.string() != nullptr ? *value.string() : "";
+    double number = 0;
+    const char* const end = digits.data() + digits.size();
+    const auto result = std::from_chars(digits.data(), end, number);
+    return result.ec == std::errc() && result.ptr == end ? std::optional(number) : std::nullopt;
 }
 
 std::string withUnit(const Value& value, const std::string& unit) {
-    const auto count = countOf(value);
-    if (!count) {
+    const auto number = numberOf(value);
+    if (!number || !(*number >= 0)) {
         return {};
     }
-    if (unit == "bytes") {
-        return sizeText(*count);
-    }
-    if (unit == "megabytes" && *count < UINT64_MAX / 1'000'000) {
-        return sizeText(*count * 1'000'000);
-    }
     if (unit == "seconds" || unit == "minutes") {
-        return fmt::format("{} {}", *count, unit == "seconds" ? "s" : "min");
+        return shown(textOf(value)) + (unit == "seconds" ? " s" : " min");
+    }
+    const double bytes = *number * (unit == "megabytes" ? 1e6 : 1);
+    if ((unit == "bytes" || unit == "megabytes") && bytes < 18e18) {
+        return sizeText(static_cast<std::uint64_t>(bytes));
     }
     return {};
 }

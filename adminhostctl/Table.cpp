@@ -19,8 +19,20 @@ std::string capitals(std::string text) {
     return text;
 }
 
+/// Digits, with a sign and one decimal point at most; thousands may be separated.
 bool isNumber(std::string_view text) {
-    return !text.empty() && text.find_first_not_of("0123456789.,-") == std::string_view::npos;
+    return !text.empty() && text.find_first_not_of("0123456789.,-") == std::string_view::npos &&
+           text.find('.') == text.rfind('.') && text.rfind('-') + 1 <= 1;
+}
+
+std::size_t longestWord(std::string_view text) {
+    std::size_t longest = 0;
+    while (!text.empty()) {
+        const std::size_t end = std::min(text.find_first_of(" \n"), text.size());
+        longest = std::max(longest, widthOf(text.substr(0, end)));
+        text.remove_prefix(std::min(end + 1, text.size()));
+    }
+    return longest;
 }
 
 }  // namespace
@@ -41,26 +53,33 @@ bool Table::narrow(std::vector<Column>& columns, std::size_t width, std::size_t 
     const std::size_t gaps = columns.empty() ? 0 : gap * (columns.size() - 1);
     std::size_t total = std::accumulate(columns.begin(), columns.end(), indent + gaps,
                                         [](std::size_t sum, const Column& column) { return sum + column.width; });
-    while (total > width) {
-        const auto widest = std::max_element(columns.begin(), columns.end(),
-                                             [](const Column& a, const Column& b) { return a.width < b.width; });
-        if (widest->width <= leastWidth) {
-            return false;
+    for (const bool withinWords : {false, true}) {
+        const auto room = [&](const Column& column) {
+            const std::size_t least = withinWords ? leastWidth : std::max(leastWidth, column.word);
+            return column.width > least ? column.width : 0;
+        };
+        while (total > width) {
+            const auto widest = std::max_element(columns.begin(), columns.end(),
+                                                 [&](const Column& a, const Column& b) { return room(a) < room(b); });
+            if (widest == columns.end() || room(*widest) == 0) {
+                break;
+            }
+            --widest->width;
+            --total;
         }
-        --widest->width;
-        --total;
     }
-    return true;
+    return total <= width;
 }
 
 std::vector<Table::Column> Table::columns() const {
     std::vector<Column> columns;
     for (std::size_t at = 0; at < _headings.size(); ++at) {
-        Column column{at, widthOf(_headings[at]), true};
+        Column column{at, widthOf(_headings[at]), longestWord(_headings[at]), true};
         bool empty = true;
         for (const auto& row : _rows) {
             empty = empty && row[at].empty();
             column.number = column.number && (row[at].empty() || isNumber(row[at]));
+            column.word = std::max(column.word, longestWord(row[at]));
             for (const std::string& line : wrapped(row[at], SIZE_MAX)) {
                 column.width = std::max(column.width, widthOf(line));
             }

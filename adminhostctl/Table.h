@@ -10,7 +10,8 @@
 namespace adminhost::ctl {
 
 /// Headings in capitals, two blanks between columns, numbers to the right. A table that is too wide has its widest
-/// columns narrowed and their texts wrapped; if that is not enough, its last columns are left out and named below.
+/// columns narrowed and their texts wrapped, between words as long as that is enough; if that is not enough, its last
+/// columns are left out and named below.
 class Table {
   public:
     explicit Table(std::vector<std::string> headings);
@@ -24,6 +25,7 @@ class Table {
     struct Column {
         std::size_t at;
         std::size_t width;
+        std::size_t word;  ///< width of the longest text without blanks
         bool number;
     };
     [[nodiscard]] std::vector<Column> columns() const;

@@ -106,6 +106,7 @@ TEST(Reading, SettingsCarryTheirUnitsAndListsFollowThem) {
                                {"agent_timeout_seconds", "90"},
                                {"agent_max_recording_minutes", 240},
                                {"tunnel_timeout_seconds", "soon"},
+                               {"camera_preview_cache_seconds", 2.5},
                                {"nimbo_client_password_is_set", false},
                                {"properties",
                                 Array{Dictionary{{"id", "3"}, {"name", "mark"}, {"value", "left"}, {"protect", false}},
@@ -119,6 +120,7 @@ TEST(Reading, SettingsCarryTheirUnitsAndListsFollowThem) {
         "  agent_timeout_seconds         90 s\n"
         "  agent_max_recording_minutes   240 min\n"
         "  tunnel_timeout_seconds        soon\n"
+        "  camera_preview_cache_seconds  2.5 s\n"
         "  nimbo_client_password_is_set  no\n"
         "\n"
         "  properties (2)\n"
@@ -221,6 +223,21 @@ TEST(Table, NumbersStandToTheRightAndEmptyColumnsAreLeftOut) {
     table.addRow({"a", "5", ""});
     table.addRow({"bcdef", "12,000", ""});
     EXPECT_EQ(table.text(80, 1), " NAME    COUNT\n a           5\n bcdef  12,000\n");
+}
+
+TEST(Table, VersionsAreNoNumbers) {
+    Table table({"version", "b"});
+    table.addRow({"1.0.0", "2.5"});
+    EXPECT_EQ(table.text(80, 0), "VERSION    B\n1.0.0    2.5\n");
+}
+
+TEST(Table, NarrowsBetweenWordsAsLongAsThatIsEnough) {
+    Table table({"status", "people"});
+    table.addRow({"capturing_audio_only", "Anna Berg Ben Okafor"});
+    EXPECT_EQ(table.text(36, 0),
+              "STATUS                PEOPLE\n"
+              "capturing_audio_only  Anna Berg Ben\n"
+              "                      Okafor\n");
 }
 
 TEST(Table, NarrowsItsWidestColumnsAndWrapsThem) {
