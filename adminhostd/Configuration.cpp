@@ -63,6 +63,8 @@ void apply(const Entry& entry, Options& options) {
     } else if (entry.key == "languages") {
         const std::vector<std::string> texts = entry.texts();
         options.languages = Array(texts.begin(), texts.end());
+    } else if (entry.key == "account_uuids") {
+        options.accountUuids = entry.text();
     } else if (entry.key == "request_deadline_seconds") {
         options.deadline = std::chrono::milliseconds(std::llround(std::ceil(entry.seconds() * 1000)));
     } else if (entry.key == "client_timeout_seconds") {
@@ -82,7 +84,7 @@ void apply(const Entry& entry, Options& options) {
     } else {
         throw std::runtime_error(
             fmt::format("{}, line {}: there is no key \"{}\"; known keys: plugins, plugin_directory, socket, "
-                        "socket_group, languages, "
+                        "socket_group, languages, account_uuids, "
                         "request_deadline_seconds, client_timeout_seconds, queue_limit, log",
                         entry.file, entry.node.source().begin.line, entry.key));
     }

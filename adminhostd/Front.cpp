@@ -3,6 +3,7 @@
 #include "adminhostd/RequestBody.h"
 #include "adminhostd/Worker.h"
 #include "platform/log/Log.h"
+#include "platform/value/Text.h"
 
 #include <fmt/format.h>
 #include <fmt/ranges.h>
@@ -128,6 +129,12 @@ Front::Address Front::addressOf(std::string_view path) {
     if (first == "requests") {
         return {second.empty() ? Address::Kind::unknown : Address::Kind::request, {}, second};
     }
+    if (path == "directory") {
+        return {Address::Kind::directory, {}, path};
+    }
+    if (second == "history") {
+        return {Address::Kind::history, first, second};
+    }
     return {second.empty() ? Address::Kind::plugin : Address::Kind::command, first, second};
 }
 
@@ -147,9 +154,10 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Address
     }
     if (address.kind == Kind::unknown) {
         return errorAnswer(404, "UNKNOWN_ADDRESS",
-                           "Known addresses: /v1/, /v1/PLUGIN, /v1/PLUGIN/COMMAND, /v1/requests/ID.");
+                           "Known addresses: /v1/, /v1/PLUGIN, /v1/PLUGIN/COMMAND, /v1/PLUGIN/history, /v1/directory, "
+                           "/v1/requests/ID.");
     }
-    if (address.kind == Kind::plugin || address.kind == Kind::command) {
+    if (address.kind == Kind::plugin || address.kind == Kind::command || address.kind == Kind::history) {
         const Dictionary* plugin = pluginNamed(address.plugin);
         if (plugin == nullptr && _hello.empty()) {
             return retryLater("WORKER_UNAVAILABLE", "No worker has started yet, so that no plug-in is known.");
@@ -207,6 +215,10 @@ void Front::serve(Exchange& exchange) {
     switch (address.kind) {
         case Address::Kind::command:
             operation(exchange, address);
+            return;
+        case Address::Kind::directory:
+        case Address::Kind::history:
+            query(exchange, address);
             return;
         case Address::Kind::plugin:
             exchange.answer({200, pluginNamed(address.plugin)->get("commands"), {}});
@@ -291,8 +303,35 @@ void Front::operation(Exchange& exchange, const Address& address) {
     operation.order.set("command", address.command);
     operation.order.set("request", std::move(*request));
     operation.order.set("wantsRevision", flag(description, "revision"));
+    if (flag(description, "revisionGuard")) {
+        // Whatever depends on the revision replaces settings, and these are kept first.
+        operation.order.set("keep", Dictionary{{"when", record.received},
+                                               {"who", fmt::format("uid {}", record.peer.uid)},
+                                               {"command", record.command},
+                                               {"request", record.id}});
+    }
     if (revisions && !revisions->empty()) {
         operation.order.set("ifMatch", std::move(*revisions));
+    }
+    _queue.add(std::move(operation));
+}
+
+void Front::query(Exchange& exchange, const Address& address) {
+    Operation operation{&exchange, _history.add(exchange), {}};
+    operation.record->plugin = address.plugin;
+    operation.record->command = address.command;
+    if (_queue.full()) {
+        HttpAnswer answer = retryLater("TOO_MANY_WAITING", fmt::format("{} requests wait already.", _queue.waiting()));
+        close(*operation.record, answer);
+        exchange.answer(std::move(answer));
+        return;
+    }
+    operation.order.set("query", address.command);
+    operation.order.set("plugin", address.plugin);
+    for (const char* argument : {"match", "is"}) {
+        if (const std::string_view text = exchange.argument(argument); isUtf8(text)) {
+            operation.order.set(argument, text);
+        }
     }
     _queue.add(std::move(operation));
 }

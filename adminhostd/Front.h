@@ -29,7 +29,7 @@ class Front {
 
   private:
     struct Address {
-        enum class Kind { unknown, overview, plugin, command, request };
+        enum class Kind { unknown, overview, plugin, command, request, directory, history };
         Kind kind = Kind::unknown;
         std::string_view plugin;
         std::string_view command;
@@ -41,6 +41,8 @@ class Front {
     [[nodiscard]] std::optional<HttpAnswer> refusal(const Exchange& exchange, const Address& address) const;
     [[nodiscard]] HttpAnswer overview() const;
     void operation(Exchange& exchange, const Address& address);
+    /// What the worker answers without an operation of a plug-in.
+    void query(Exchange& exchange, const Address& address);
     void finished(const Operation& operation, const Dictionary& answer);
     void close(RequestRecord& record, const HttpAnswer& answer);
 

@@ -47,6 +47,11 @@ std::string_view Exchange::header(const char* name) const {
     return headerOf(_connection, name);
 }
 
+std::string_view Exchange::argument(const char* name) const {
+    const char* value = ::MHD_lookup_connection_value(_connection, MHD_GET_ARGUMENT_KIND, name);
+    return value == nullptr ? std::string_view() : std::string_view(value);
+}
+
 bool Exchange::clientGone() const noexcept {
     // A client that only closed its sending half still reads; POLLHUP means that both are closed.
     pollfd entry{_socket, 0, 0};

@@ -49,8 +49,9 @@ class Exchange {
     [[nodiscard]] const std::string& method() const noexcept { return _method; }
     [[nodiscard]] const std::string& path() const noexcept { return _path; }  ///< decoded, without the query
     [[nodiscard]] const std::string& body() const noexcept { return _body; }
-    /// Empty when the client did not send it.
+    // Empty when the client did not send it.
     [[nodiscard]] std::string_view header(const char* name) const;
+    [[nodiscard]] std::string_view argument(const char* name) const;  ///< of the address's query, decoded
     /// Gives the body's memory back once it has been read.
     void dropBody() noexcept { std::string().swap(_body); }
     /// Whether the client has closed its connection.

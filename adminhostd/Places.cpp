@@ -122,6 +122,7 @@ Dictionary workerConfiguration(const Options& options, const PluginSelection& pl
     return {{"root", options.root},
             {"plugins", std::move(files)},
             {"languages", options.languages ? *options.languages : languagesOfEnvironment()},
+            {"accountUuids", options.accountUuids},
             {"environment", Dictionary{{"XDG_CONFIG_HOME", toolConfiguration}}}};
 }
 

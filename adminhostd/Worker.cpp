@@ -3,9 +3,13 @@
 #include "adminhostd/DatabaseTool.h"
 #include "adminhostd/Frame.h"
 #include "adminhostd/PluginFile.h"
+#include "adminhostd/SettingsHistory.h"
+#include "platform/directory/Entries.h"
+#include "platform/directory/LocalAccounts.h"
 #include "platform/files/Path.h"
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
+#include "platform/value/Text.h"
 
 #include <algorithm>
 #include <chrono>
@@ -51,6 +55,8 @@ class Worker {
     Value configure(const Dictionary& configuration);
     void load(const DiskPath& file, Array& plugins, Array& refused);
     Value perform(const Dictionary& order);
+    Value query(const Dictionary& order);
+    static Value history(const Plugin& plugin);
     Value performWith(const Plugin& plugin, std::string_view command, const Dictionary& order);
 
     int _descriptor;
@@ -93,6 +99,9 @@ Value Worker::configure(const Dictionary& configuration) {
     setSystemRoot(textAt(configuration, "root"));
     if (configuration.contains("languages")) {
         setUserDefault("BrennLanguages", configuration.get("languages"));
+    }
+    if (const std::string uuids = textAt(configuration, "accountUuids"); !uuids.empty()) {
+        setDirectoryNodes({localAccounts(HostPath(uuids))});
     }
     std::map<std::string, std::string> environment;
     if (const Dictionary* variables = configuration.get("environment").dictionary()) {
@@ -140,6 +149,13 @@ Value Worker::performWith(const Plugin& plugin, std::string_view command, const 
             return Dictionary{{"outcome", outcome::changed}, {"revision", revision}};
         }
     }
+    const Dictionary* about = order.get("keep").dictionary();
+    if (about != nullptr && plugin.settingsFiles != nullptr) {
+        // A full disk must not keep an administrator from settings that may mend it: the write goes on.
+        if (const auto error = keepHistory(historyDirectory(plugin.name), plugin.settingsFiles(), *about)) {
+            logEvent("adminhostd: the settings before this write could not be kept: " + textOf(*error));
+        }
+    }
     Response response = plugin.perform(command, request);
     Dictionary answer;
     if (order.get("wantsRevision") == Value(true) && response.kind() != Response::Kind::error) {
@@ -164,11 +180,64 @@ Value Worker::performWith(const Plugin& plugin, std::string_view command, const 
     return answer;
 }
 
+/// The settings' history, narrowed to the keys that the plug-in describes as written.
+Value Worker::history(const Plugin& plugin) {
+    constexpr std::string_view prefix = "configuration.";
+    std::vector<std::string> keys;
+    std::vector<std::string> secrets;
+    const Value described = plugin.describe();
+    for (const Value& command : *described.array()) {
+        const Array* commandKeys = command.dictionary()->get("keys").array();
+        if (command.dictionary()->get("revisionGuard") != Value(true) || commandKeys == nullptr) {
+            continue;
+        }
+        for (const Value& key : *commandKeys) {
+            const std::string path = textAt(*key.dictionary(), "path");
+            if (path.starts_with(prefix) && path.find_first_of(".[", prefix.size()) == std::string::npos) {
+                keys.push_back(path.substr(prefix.size()));
+                if (key.dictionary()->get("secret") == Value(true)) {
+                    secrets.push_back(keys.back());
+                }
+            }
+        }
+    }
+    Dictionary response;
+    response.set("history", readHistory(historyDirectory(plugin.name), keys, secrets));
+    return Dictionary{{"outcome", outcome::dictionary}, {"response", std::move(response)}};
+}
+
+Value Worker::query(const Dictionary& order) {
+    constexpr std::size_t limit = 50;
+    if (textAt(order, "query") == "history") {
+        const std::string name = textAt(order, "plugin");
+        const auto found =
+            std::find_if(_plugins.begin(), _plugins.end(), [&](const Plugin* plugin) { return name == plugin->name; });
+        if (found == _plugins.end()) {
+            return Dictionary{{"outcome", outcome::broken}, {"message", "The plug-in \"" + name + "\" is not loaded."}};
+        }
+        return history(**found);
+    }
+    Error error;
+    const std::string is = textAt(order, "is");
+    std::optional<Array> entries =
+        is.empty() ? directoryEntries(textAt(order, "match"), limit, &error) : directoryEntriesOf(is, &error);
+    if (!entries) {
+        return Dictionary{{"outcome", outcome::error},
+                          {"response", Dictionary{{"error", "DIRECTORY_UNAVAILABLE"}, {"message", textOf(error)}}}};
+    }
+    Dictionary response;
+    response.set("entries", std::move(*entries));
+    return Dictionary{{"outcome", outcome::dictionary}, {"response", std::move(response)}};
+}
+
 Value Worker::perform(const Dictionary& order) {
     const std::string name = textAt(order, "plugin");
     const auto found =
         std::find_if(_plugins.begin(), _plugins.end(), [&](const Plugin* plugin) { return name == plugin->name; });
     try {
+        if (order.contains("query")) {
+            return query(order);
+        }
         if (found != _plugins.end()) {
             return performWith(**found, textAt(order, "command"), order);
         }

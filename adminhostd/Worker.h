@@ -5,12 +5,13 @@
 // It is started afresh by the front, on the other end of an inherited socket pair, has one thread, and ends when the
 // front closes its end. What the frames carry:
 //
-//   configure  root, plugins (paths of files), languages, environment (of the tools)
+//   configure  root, plugins (paths of files), languages, accountUuids (host path), environment (of the tools)
 //   hello      plugins: [{name, version, file, commands: descriptions}], refused: [{file, reason}], databaseTool: text
 //   of the
 //              problem, absent when it works
 //   perform    plugin, command, request, ifMatch (optional list of revisions), milliseconds (until the deadline),
-//              wantsRevision
+//              wantsRevision, keep (what the settings' history says of this write)
+//              or: query ("directory" with match or is, "history" with plugin)
 //   answer     outcome: one of the words below; response, findings, revision, message as the outcome needs
 
 namespace adminhost {

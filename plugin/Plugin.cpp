@@ -72,6 +72,11 @@ std::string revision() noexcept {
     }
 }
 
+std::vector<adminhost::HostPath> settingsFiles() noexcept {
+    return {LumioRequestHandler::identityPreferencesPath(), LumioRequestHandler::clusterPreferencesPath(),
+            LumioRequestHandler::memberPreferencesPath()};
+}
+
 constexpr adminhost::Plugin plugin{
     .name = "lumio",
     .version = ADMINHOST_RELEASE,
@@ -79,6 +84,7 @@ constexpr adminhost::Plugin plugin{
     .check = lumio::checkRequest,
     .revision = revision,
     .perform = perform,
+    .settingsFiles = settingsFiles,
 };
 
 }  // namespace

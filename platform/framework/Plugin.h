@@ -7,6 +7,7 @@
 // no code of another build ever runs. All calls come from one thread; a plug-in is never unloaded. No function lets an
 // exception out: an operation that fails inside answers the error response "INTERNAL_ERROR" after logging why.
 
+#include "platform/files/Path.h"
 #include "platform/framework/BuildNote.h"
 #include "platform/framework/PluginRequestHandler.h"
 #include "platform/value/Value.h"
@@ -38,6 +39,9 @@ struct Plugin {
     std::string (*revision)() noexcept;
     /// Serves one command of describe().
     Response (*perform)(std::string_view command, const Dictionary& request) noexcept;
+    /// The files that commands with "revisionGuard" replace, whose top-level keys are those of the request's
+    /// "configuration"; the daemon keeps their history. Null when there is none to keep.
+    std::vector<HostPath> (*settingsFiles)() noexcept = nullptr;
 };
 
 }  // namespace adminhost
