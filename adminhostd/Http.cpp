@@ -53,9 +53,9 @@ std::string_view Exchange::argument(const char* name) const {
 }
 
 bool Exchange::clientGone() const noexcept {
-    // A client that only closed its sending half still reads; POLLHUP means that both are closed.
-    pollfd entry{_socket, 0, 0};
-    return ::poll(&entry, 1, 0) == 1 && (entry.revents & (POLLHUP | POLLERR)) != 0;
+    // The library gives up a client that has closed only its sending half, too.
+    pollfd entry{_socket, POLLRDHUP, 0};
+    return ::poll(&entry, 1, 0) == 1 && (entry.revents & (POLLRDHUP | POLLHUP | POLLERR)) != 0;
 }
 
 void Exchange::answer(HttpAnswer answer) {

@@ -55,6 +55,7 @@ void OperationQueue::addTo(std::vector<pollfd>& entries) const {
 }
 
 void OperationQueue::start() {
+    ++_starts;
     _worker = WorkerProcess::start(_settings.showOutput);
     if (!_worker || !_worker->send(FrameType::configure, _settings.configuration)) {
         startFailed(fmt::format("cannot be started: {}", std::strerror(errno)));
@@ -64,7 +65,7 @@ void OperationQueue::start() {
     _due = Clock::now() + startBound;
 }
 
-void OperationQueue::startFailed(const std::string& reason) {
+void OperationQueue::startFailed(std::string reason) {
     _worker.reset();
     _state = State::paused;
     _settled = true;
@@ -86,20 +87,23 @@ void OperationQueue::failWaiting(const char* outcome, const std::string& message
 
 void OperationQueue::run() {
     if (_worker) {
+        // Asked first: what a worker said before its end is read in any case.
+        const auto ending = _worker->ending();
+        const unsigned long asked = _starts;
         _worker->converse();
-        while (_worker) {
+        while (_worker && _starts == asked) {
             const auto frame = _worker->next();
             if (!frame) {
                 break;
             }
             take(*frame);
         }
-    }
-    if (_worker && _worker->broken()) {
-        _worker->kill();
-        workerEnded("sent what cannot be read");
-    } else if (_worker && _worker->ending()) {
-        workerEnded(*_worker->ending());
+        if (_worker && _starts == asked && _worker->broken()) {
+            _worker->kill();
+            workerEnded("sent what cannot be read");
+        } else if (_worker && _starts == asked && ending) {
+            workerEnded(*ending);
+        }
     }
     std::erase_if(_dying, [](const auto& worker) { return worker->ending().has_value(); });
     if (_due && Clock::now() >= *_due) {
@@ -132,7 +136,7 @@ void OperationQueue::take(const Frame& frame) {
     }
 }
 
-void OperationQueue::workerEnded(const std::string& how) {
+void OperationQueue::workerEnded(std::string how) {
     const State state = std::exchange(_state, State::paused);
     _due.reset();
     if (!_worker->ending()) {

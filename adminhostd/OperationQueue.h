@@ -71,9 +71,9 @@ class OperationQueue {
     enum class State { paused, starting, idle, busy };
 
     void start();
-    void startFailed(const std::string& reason);
+    void startFailed(std::string reason);
     void take(const Frame& frame);
-    void workerEnded(const std::string& how);
+    void workerEnded(std::string how);  ///< a copy: the text may be the worker's own
     void timeUp();
     void next();
     void finish(const Dictionary& answer);
@@ -89,6 +89,7 @@ class OperationQueue {
     std::optional<Clock::time_point> _due;  ///< when timeUp() has to act
     std::chrono::milliseconds _pause{0};
     std::string _startProblem;
+    unsigned long _starts = 0;  ///< tells one worker from the next
     bool _settled = false;
     bool _stopping = false;
 };

@@ -1,0 +1,159 @@
+#include "tests/support/DaemonProcess.h"
+
+#include <cerrno>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+#include <thread>
+
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace adminhost::test {
+namespace {
+
+constexpr auto patience = std::chrono::seconds(10);
+constexpr auto step = std::chrono::milliseconds(5);
+
+std::string readWhole(const std::filesystem::path& path) {
+    std::ifstream file(path);
+    return {std::istreambuf_iterator<char>(file), {}};
+}
+
+std::vector<char*> pointersTo(std::vector<std::string>& texts) {
+    std::vector<char*> pointers;
+    pointers.reserve(texts.size() + 1);
+    for (std::string& text : texts) {
+        pointers.push_back(text.data());
+    }
+    pointers.push_back(nullptr);
+    return pointers;
+}
+
+}  // namespace
+
+DaemonProcess::DaemonProcess(const Options& options) {
+    std::string directory = (std::filesystem::temp_directory_path() / "daemon.XXXXXX").string();
+    if (::mkdtemp(directory.data()) == nullptr) {
+        throw std::runtime_error(std::string("cannot make a directory: ") + std::strerror(errno));
+    }
+    _directory = directory;
+    _socket = options.socket.empty() ? (_directory / "socket").string() : options.socket;
+    std::filesystem::create_directory(_directory / "tmp");
+    std::ofstream(_directory / "config") << options.configuration;
+
+    std::vector<std::string> arguments{DAEMON,  "--socket", socket(), "--config", _directory / "config",
+                                       "--log", "stderr"};
+    arguments.insert(arguments.end(), options.arguments.begin(), options.arguments.end());
+    std::vector<std::string> environment = options.environment;
+    environment.push_back("TMPDIR=" + (_directory / "tmp").string());
+    for (char** variable = environ; *variable != nullptr; ++variable) {
+        environment.emplace_back(*variable);  // of two the first counts
+    }
+    posix_spawn_file_actions_t actions;
+    ::posix_spawn_file_actions_init(&actions);
+    ::posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, (_directory / "log").c_str(),
+                                       O_WRONLY | O_CREAT | O_APPEND, 0600);
+    const int failure =
+        ::posix_spawn(&_pid, DAEMON, &actions, nullptr, pointersTo(arguments).data(), pointersTo(environment).data());
+    ::posix_spawn_file_actions_destroy(&actions);
+    if (failure != 0) {
+        _pid = -1;
+        std::filesystem::remove_all(_directory);
+        throw std::runtime_error(std::string("cannot start ") + DAEMON + ": " + std::strerror(failure));
+    }
+    const auto bound = std::chrono::steady_clock::now() + patience;
+    while (options.waitUntilReady) {
+        try {
+            connect().get("/v1/");
+            return;
+        } catch (const std::runtime_error&) {
+            if (wait(std::chrono::milliseconds(0)) || std::chrono::steady_clock::now() > bound) {
+                const std::string text = log();
+                end();
+                throw std::runtime_error("the daemon does not start: " + text);
+            }
+        }
+        std::this_thread::sleep_for(step);
+    }
+}
+
+DaemonProcess::~DaemonProcess() {
+    end();
+}
+
+void DaemonProcess::end() {
+    if (_pid > 0 && !_status) {
+        // Its worker ends by itself when the conversation is closed.
+        ::kill(_pid, SIGKILL);
+        wait();
+    }
+    std::error_code ignored;
+    std::filesystem::remove_all(_directory, ignored);
+}
+
+pid_t DaemonProcess::workerPid() const {
+    const std::string text = connect().get("/v1/").body;
+    const std::string key = "\"workerPid\":";
+    const std::size_t at = text.find(key);
+    return at == std::string::npos ? -1 : std::stoi(text.substr(at + key.size()));
+}
+
+std::string DaemonProcess::log() const {
+    return readWhole(_directory / "log");
+}
+
+bool DaemonProcess::waitForLog(const std::string& text) const {
+    const auto end = std::chrono::steady_clock::now() + patience;
+    while (log().find(text) == std::string::npos) {
+        if (std::chrono::steady_clock::now() > end) {
+            return false;
+        }
+        std::this_thread::sleep_for(step);
+    }
+    return true;
+}
+
+void DaemonProcess::signal(int number) const {
+    ::kill(_pid, number);
+}
+
+std::optional<int> DaemonProcess::wait(std::chrono::milliseconds bound) {
+    const auto end = std::chrono::steady_clock::now() + bound;
+    while (!_status) {
+        int status = 0;
+        if (::waitpid(_pid, &status, WNOHANG) == _pid) {
+            _status = WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status);
+        } else if (std::chrono::steady_clock::now() >= end) {
+            break;
+        } else {
+            std::this_thread::sleep_for(step);
+        }
+    }
+    return _status;
+}
+
+std::size_t descriptorsOf(pid_t pid) {
+    const std::filesystem::directory_iterator entries("/proc/" + std::to_string(pid) + "/fd");
+    return static_cast<std::size_t>(std::distance(begin(entries), end(entries)));
+}
+
+std::size_t residentKilobytesOf(pid_t pid) {
+    std::ifstream file("/proc/" + std::to_string(pid) + "/status");
+    std::string word;
+    while (file >> word) {
+        if (word == "VmRSS:") {
+            std::size_t kilobytes = 0;
+            file >> kilobytes;
+            return kilobytes;
+        }
+    }
+    return 0;
+}
+
+}  // namespace adminhost::test

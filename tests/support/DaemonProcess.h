@@ -1,0 +1,64 @@
+#pragma once
+
+// The daemon of this build, run by a test: started with its socket and its temporary files in a directory of its own,
+// ended and removed with the object. What goes wrong while starting throws std::runtime_error.
+
+#include "tests/support/UnixHttp.h"
+
+#include <chrono>
+#include <filesystem>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <sys/types.h>
+
+namespace adminhost::test {
+
+class DaemonProcess {
+  public:
+    struct Options {
+        std::vector<std::string> arguments = {};    ///< beside --socket, --config and --log stderr
+        std::string configuration = {};             ///< text of the configuration file
+        std::vector<std::string> environment = {};  ///< "NAME=value", beside the test's own
+        bool waitUntilReady = true;                 ///< until it answers its first request
+        std::string socket = {};                    ///< where to listen, instead of in the directory
+    };
+
+    explicit DaemonProcess(const Options& options);
+    DaemonProcess(const DaemonProcess&) = delete;
+    DaemonProcess& operator=(const DaemonProcess&) = delete;
+    /// Ends it by force if it still runs.
+    ~DaemonProcess();
+
+    [[nodiscard]] pid_t pid() const noexcept { return _pid; }
+    [[nodiscard]] const std::filesystem::path& directory() const noexcept { return _directory; }
+    [[nodiscard]] const std::string& socket() const noexcept { return _socket; }
+    [[nodiscard]] UnixHttp connect() const { return UnixHttp(socket()); }
+
+    /// The process id of the worker, as the daemon says.
+    [[nodiscard]] pid_t workerPid() const;
+    /// What it has written to standard error: the log.
+    [[nodiscard]] std::string log() const;
+    /// Waits until the log has the text in it; false after ten seconds.
+    [[nodiscard]] bool waitForLog(const std::string& text) const;
+
+    void signal(int number) const;
+    /// Waits for its end: the exit status, 128 + number after a death by signal, nothing when it does not end in time.
+    std::optional<int> wait(std::chrono::milliseconds bound = std::chrono::seconds(20));
+
+  private:
+    void end();
+
+    std::filesystem::path _directory;
+    std::string _socket;
+    pid_t _pid = -1;
+    std::optional<int> _status;
+};
+
+/// Open descriptors of a process.
+[[nodiscard]] std::size_t descriptorsOf(pid_t pid);
+/// Resident memory of a process in kilobytes.
+[[nodiscard]] std::size_t residentKilobytesOf(pid_t pid);
+
+}  // namespace adminhost::test

@@ -1,0 +1,55 @@
+#pragma once
+
+// A small HTTP/1.1 client on a Unix socket for tests, one connection an object. It also sends what no proper client
+// would. Everything waits ten seconds at most (or the given time) and then throws std::runtime_error.
+
+#include <chrono>
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace adminhost::test {
+
+struct HttpReply {
+    int status = 0;
+    std::map<std::string, std::string> headers;  ///< names in lower case
+    std::string body;
+};
+
+class UnixHttp {
+  public:
+    using Headers = std::vector<std::string>;  ///< "Name: value"
+
+    explicit UnixHttp(const std::string& path, std::chrono::milliseconds timeout = std::chrono::seconds(10));
+    UnixHttp(UnixHttp&& other) noexcept;
+    UnixHttp(const UnixHttp&) = delete;
+    UnixHttp& operator=(const UnixHttp&) = delete;
+    ~UnixHttp();
+
+    /// Sends a request with its Content-Length and reads the reply; the connection can be used again.
+    HttpReply request(std::string_view method, std::string_view target, std::string_view body = "",
+                      const Headers& headers = {});
+    HttpReply get(std::string_view target) { return request("GET", target); }
+    HttpReply post(std::string_view target, std::string_view body = "", const Headers& headers = {}) {
+        return request("POST", target, body, headers);
+    }
+
+    /// The two halves of request(), and raw bytes.
+    void begin(std::string_view method, std::string_view target, std::string_view body = "",
+               const Headers& headers = {});
+    void send(std::string_view bytes);
+    HttpReply reply(bool headOnly = false);
+    /// Whether the server has closed the connection, waiting for it so long.
+    bool closedWithin(std::chrono::milliseconds time);
+    void close();
+
+  private:
+    bool fill();
+
+    int _socket = -1;
+    std::string _unread;
+};
+
+}  // namespace adminhost::test

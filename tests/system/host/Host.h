@@ -1,0 +1,68 @@
+#pragma once
+
+// What the daemon's tests share: a daemon with the fixture plug-in.
+
+#include "platform/json/Json.h"
+#include "tests/support/DaemonProcess.h"
+
+#include <filesystem>
+#include <functional>
+#include <string>
+#include <thread>
+
+#include <gtest/gtest.h>
+
+namespace adminhost::test {
+
+inline std::string pluginFile(const std::string& name) {
+    return std::string(BINARY_DIR) + "/tests/plugins/" + name + ".so";
+}
+
+inline DaemonProcess::Options withFixture(const std::string& configuration = "") {
+    return {{"--plugin", pluginFile("fixture_good")}, configuration, {}, true, {}};
+}
+
+inline Dictionary dictionaryOf(const HttpReply& reply) {
+    const auto value = parseJson(reply.body);
+    EXPECT_TRUE(value && value->dictionary() != nullptr) << reply.status << ": " << reply.body;
+    return value && value->dictionary() != nullptr ? *value->dictionary() : Dictionary();
+}
+
+inline std::string textAt(const Dictionary& dictionary, std::string_view key) {
+    const std::string* text = dictionary.get(key).string();
+    return text == nullptr ? "(no text)" : *text;
+}
+
+/// An error answer: its code and a message, in the two keys.
+inline void expectError(const HttpReply& reply, int status, std::string_view code) {
+    EXPECT_EQ(reply.status, status) << reply.body;
+    const Dictionary body = dictionaryOf(reply);
+    EXPECT_EQ(textAt(body, "error"), code);
+    EXPECT_FALSE(textAt(body, "message").empty());
+    EXPECT_EQ(body.size(), body.contains("findings") ? 3U : 2U);
+    EXPECT_TRUE(reply.headers.contains("request-id"));
+}
+
+/// Whether the condition comes true within ten seconds.
+inline bool eventually(const std::function<bool()>& condition) {
+    for (int i = 0; i < 2000; ++i) {
+        if (condition()) {
+            return true;
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    }
+    return false;
+}
+
+/// A client whose operation is running when this returns.
+inline UnixHttp startSleeping(const DaemonProcess& daemon, int milliseconds) {
+    const std::string mark = (daemon.directory() / "running").string();
+    std::filesystem::remove(mark);
+    UnixHttp client = daemon.connect();
+    client.begin("POST", "/v1/fixture/sleep",
+                 R"({"milliseconds":)" + std::to_string(milliseconds) + R"(,"touch":")" + mark + "\"}");
+    EXPECT_TRUE(eventually([&] { return std::filesystem::exists(mark); }));
+    return client;
+}
+
+}  // namespace adminhost::test

@@ -1,0 +1,352 @@
+// How the daemon starts: its socket, its plug-ins, its configuration, --check and the database tool.
+
+#include "adminhostd/PluginFile.h"
+#include "tests/support/Program.h"
+#include "tests/system/host/Host.h"
+
+#include <fstream>
+
+#include <grp.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+namespace adminhost::test {
+namespace {
+
+namespace fs = std::filesystem;
+
+class Start : public ::testing::Test {
+  protected:
+    Start() {
+        std::string path = (fs::temp_directory_path() / "start.XXXXXX").string();
+        EXPECT_NE(::mkdtemp(path.data()), nullptr);
+        directory = path;
+    }
+    ~Start() override { fs::remove_all(directory); }
+    Start(const Start&) = delete;
+    Start& operator=(const Start&) = delete;
+
+    ProgramResult run(std::vector<std::string> arguments) const {
+        arguments.insert(arguments.begin(), std::string(BINARY_DIR) + "/bin/adminhostd");
+        return runProgram(arguments, Errors::merge);
+    }
+    std::string configuration(const std::string& text) const {
+        const fs::path file = directory / "adminhostd.toml";
+        std::ofstream(file) << text;
+        return file;
+    }
+
+    fs::path directory;
+};
+
+TEST_F(Start, SocketIsForOwnerAndGroupOnly) {
+    DaemonProcess daemon(withFixture());
+    struct stat status {};
+    ASSERT_EQ(::stat(daemon.socket().c_str(), &status), 0);
+    EXPECT_EQ(status.st_mode & 07777U, 0660U);
+    EXPECT_EQ(status.st_uid, ::geteuid());
+    for (const auto& entry : fs::directory_iterator(daemon.directory())) {
+        EXPECT_FALSE(entry.path().filename().string().starts_with(".adminhostd")) << "the private directory is gone";
+    }
+}
+
+TEST_F(Start, SocketGetsTheConfiguredGroup) {
+    gid_t groups[256];
+    const int count = ::getgroups(256, groups);
+    // Root may give it any group, a plain account one of its own.
+    const gid_t wanted = ::geteuid() == 0 ? 65534 : count > 0 ? groups[count - 1] : ::getegid();
+    const group* entry = ::getgrgid(wanted);
+    ASSERT_NE(entry, nullptr);
+    DaemonProcess daemon(withFixture("socket_group = \"" + std::string(entry->gr_name) + "\"\n"));
+    struct stat status {};
+    ASSERT_EQ(::stat(daemon.socket().c_str(), &status), 0);
+    EXPECT_EQ(status.st_gid, wanted);
+    EXPECT_EQ(status.st_mode & 07777U, 0660U);
+}
+
+TEST_F(Start, DefaultSocketLiesBelowTheRoot) {
+    const fs::path etc = directory / "etc";
+    fs::create_directories(etc);
+    std::ofstream(etc / "adminhostd.toml") << "queue_limit = 3\n";
+    const ProgramResult result = run({"--root", directory, "--check", "--plugin", pluginFile("fixture_good")});
+    EXPECT_NE(result.output.find("/usr/bin/sqlite3"), std::string::npos) << result.output;
+    EXPECT_TRUE(fs::is_directory(directory / "run/adminhostd"));
+    std::ofstream(etc / "adminhostd.toml") << "no such\n";
+    EXPECT_NE(run({"--root", directory, "--check"}).output.find("etc/adminhostd.toml, line 1"), std::string::npos);
+}
+
+TEST_F(Start, StaleSocketIsReplacedAndALiveOneIsAnError) {
+    const fs::path path = directory / "socket";
+    const int stale = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    path.string().copy(address.sun_path, sizeof address.sun_path - 1);
+    ASSERT_EQ(::bind(stale, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    ASSERT_EQ(::listen(stale, 1), 0);
+    const ProgramResult live = run({"--socket", path, "--plugin", pluginFile("fixture_good")});
+    EXPECT_EQ(live.status, 1);
+    EXPECT_NE(live.output.find("another daemon serves"), std::string::npos) << live.output;
+    ::close(stale);
+    auto options = withFixture();
+    options.socket = path;
+    DaemonProcess daemon(options);
+    EXPECT_EQ(daemon.connect().get("/v1/").status, 200);
+}
+
+TEST_F(Start, WhatIsNoSocketIsNeverReplaced) {
+    const fs::path path = directory / "socket";
+    std::ofstream(path) << "precious";
+    const ProgramResult result = run({"--socket", path, "--plugin", pluginFile("fixture_good")});
+    EXPECT_EQ(result.status, 1);
+    EXPECT_NE(result.output.find("is no socket"), std::string::npos) << result.output;
+    EXPECT_EQ(fs::file_size(path), 8U);
+}
+
+TEST_F(Start, PathThatNoSocketCanHaveIsAClearError) {
+    const ProgramResult result =
+        run({"--socket", "/tmp/" + std::string(120, 'x'), "--plugin", pluginFile("fixture_good")});
+    EXPECT_EQ(result.status, 1);
+    EXPECT_NE(result.output.find("choose a shorter one"), std::string::npos) << result.output;
+    EXPECT_EQ(run({"--socket", directory / "none" / "socket"}).status, 1);
+}
+
+TEST_F(Start, PluginsThatMustNotRunAreRefusedWithTheReason) {
+    const fs::path mark = directory / "mark";
+    DaemonProcess daemon(
+        {{"--plugin", pluginFile("fixture_good"), "--plugin", pluginFile("fixture_other_build"), "--plugin",
+          pluginFile("fixture_no_note"), "--plugin", std::string(BINARY_DIR) + "/bin/adminhostd", "--plugin",
+          std::string(SOURCE_DIR) + "/README.md", "--plugin", (directory / "missing.so").string()},
+         "",
+         {"ADMINHOST_TEST_MARK=" + mark.string()}});
+    const Dictionary body = dictionaryOf(daemon.connect().get("/v1/"));
+    ASSERT_NE(body.get("refusedPlugins").array(), nullptr);
+    const Array& refused = *body.get("refusedPlugins").array();
+    ASSERT_EQ(refused.size(), 5U);
+    const char* expected[] = {"is of another build", "no build note", "no build note", "no shared object",
+                              "No such file"};
+    for (std::size_t i = 0; i < refused.size(); ++i) {
+        EXPECT_NE(textAt(*refused[i].dictionary(), "reason").find(expected[i]), std::string::npos)
+            << textAt(*refused[i].dictionary(), "reason");
+    }
+    EXPECT_FALSE(fs::exists(mark)) << "no code of a refused plug-in has run";
+    EXPECT_EQ(daemon.connect().post("/v1/fixture/echo", "{}").status, 200);
+}
+
+TEST_F(Start, PluginsWithoutAUsableTableAreRefusedWithTheReason) {
+    DaemonProcess daemon({{"--plugin", pluginFile("fixture_no_entry_point"), "--plugin",
+                           pluginFile("fixture_null_table"), "--plugin", pluginFile("fixture_incomplete_table"),
+                           "--plugin", pluginFile("fixture_no_description"), "--plugin", pluginFile("fixture_bad_name"),
+                           "--plugin", pluginFile("fixture_good"), "--plugin", pluginFile("fixture_good")},
+                          "",
+                          {}});
+    const Dictionary body = dictionaryOf(daemon.connect().get("/v1/"));
+    ASSERT_NE(body.get("refusedPlugins").array(), nullptr);
+    const Array& refused = *body.get("refusedPlugins").array();
+    const char* expected[] = {"no entry point",
+                              "incomplete table",
+                              "incomplete table",
+                              "does not describe its commands",
+                              "cannot stand in an address",
+                              "already loaded"};
+    ASSERT_EQ(refused.size(), 6U);
+    for (std::size_t i = 0; i < refused.size(); ++i) {
+        EXPECT_NE(textAt(*refused[i].dictionary(), "reason").find(expected[i]), std::string::npos)
+            << textAt(*refused[i].dictionary(), "reason");
+    }
+    EXPECT_EQ(daemon.connect().post("/v1/fixture/echo", "{}").status, 200);
+}
+
+TEST_F(Start, DamagedPluginFilesAreRefusedAtEveryLength) {
+    std::ifstream file(pluginFile("fixture_other_build"), std::ios::binary);
+    const std::string whole{std::istreambuf_iterator<char>(file), {}};
+    const fs::path cut = directory / "cut.so";
+    std::string problem;
+    for (const std::size_t length : {0UL, 1UL, 16UL, 63UL, 64UL, 65UL, 120UL, 400UL, 700UL}) {
+        std::ofstream(cut, std::ios::binary) << whole.substr(0, length);
+        EXPECT_FALSE(buildIdentityOf(DiskPath(cut), problem)) << length;
+        EXPECT_FALSE(problem.empty());
+    }
+    for (std::size_t at = 0; at < 1024; ++at) {
+        std::string damaged = whole;
+        damaged[at] = static_cast<char>(damaged[at] ^ 0x41);
+        std::ofstream(cut, std::ios::binary) << damaged;
+        const auto identity = buildIdentityOf(DiskPath(cut), problem);
+        EXPECT_NE(identity, ADMINHOST_BUILD_IDENTITY) << at;
+    }
+    EXPECT_EQ(buildIdentityOf(DiskPath(pluginFile("fixture_good")), problem), ADMINHOST_BUILD_IDENTITY);
+}
+
+TEST_F(Start, PluginDirectoryMustBeTrustworthyAsAWhole) {
+    const fs::path plugins = directory / "plugins";
+    fs::create_directory(plugins);
+    fs::copy_file(pluginFile("fixture_good"), plugins / "good.so");
+    std::ofstream(plugins / "notes.txt") << "no plug-in";
+    ASSERT_EQ(::chmod((plugins / "good.so").c_str(), 0644), 0);
+    ASSERT_EQ(::chmod(plugins.c_str(), 0755), 0);
+    const std::string file = configuration("plugin_directory = \"" + plugins.string() + "\"\n");
+    const std::vector<std::string> command = {"--check", "--config", file, "--socket", directory / "socket"};
+    const ProgramResult good = run(command);
+    EXPECT_EQ(good.status, 0) << good.output;
+    EXPECT_NE(good.output.find("fixture 1.2.3"), std::string::npos) << good.output;
+
+    ASSERT_EQ(::chmod((plugins / "good.so").c_str(), 0664), 0);
+    const ProgramResult writable = run(command);
+    EXPECT_EQ(writable.status, 1);
+    EXPECT_NE(writable.output.find("good.so may be written by group or others; chmod go-w it"), std::string::npos)
+        << writable.output;
+    ASSERT_EQ(::chmod((plugins / "good.so").c_str(), 0644), 0);
+    ASSERT_EQ(::chmod(plugins.c_str(), 0777), 0);
+    EXPECT_NE(run(command).output.find("plugins may be written by group or others"), std::string::npos);
+    ASSERT_EQ(::chmod(plugins.c_str(), 0755), 0);
+    if (::geteuid() == 0) {
+        ASSERT_EQ(::chown((plugins / "good.so").c_str(), 65534, 65534), 0);
+        EXPECT_NE(run(command).output.find("good.so belongs to uid 65534; chown it to root"), std::string::npos);
+    }
+    fs::remove(plugins / "good.so");
+    EXPECT_NE(run(command).output.find("There is no plug-in in"), std::string::npos);
+    fs::remove_all(plugins);
+    EXPECT_NE(run(command).output.find("No such file or directory"), std::string::npos);
+}
+
+TEST_F(Start, PluginThatEverybodyMayWriteIsRefused) {
+    const fs::path file = directory / "open.so";
+    fs::copy_file(pluginFile("fixture_good"), file);
+    ASSERT_EQ(::chmod(file.c_str(), 0646), 0);
+    const ProgramResult result = run({"--check", "--plugin", file, "--socket", directory / "socket"});
+    EXPECT_EQ(result.status, 1);
+    EXPECT_NE(result.output.find("may be written by everybody"), std::string::npos) << result.output;
+}
+
+TEST_F(Start, CheckSaysThatNothingIsWrongAndLeavesNothingBehind) {
+    const ProgramResult result =
+        run({"--check", "--plugin", pluginFile("fixture_good"), "--socket", directory / "socket"});
+    EXPECT_EQ(result.status, 0) << result.output;
+    EXPECT_EQ(result.output,
+              "Nothing is wrong. Plug-ins: fixture 1.2.3. Socket: " + (directory / "socket").string() + "\n");
+    EXPECT_TRUE(fs::is_empty(directory));
+}
+
+TEST_F(Start, CheckNamesEveryProblemWithItsMend) {
+    const std::string file = configuration("socket_group = \"no-such-group\"\n");
+    const ProgramResult result = run({"--check", "--config", file, "--plugin", pluginFile("fixture_good"), "--socket",
+                                      directory / "none" / "socket"});
+    EXPECT_EQ(result.status, 1);
+    EXPECT_NE(result.output.find("there is no group \"no-such-group\""), std::string::npos) << result.output;
+    EXPECT_NE(result.output.find("make its directory, or choose another with --socket"), std::string::npos)
+        << result.output;
+    const ProgramResult crashing =
+        run({"--check", "--plugin", pluginFile("fixture_crashing"), "--socket", directory / "socket"});
+    EXPECT_EQ(crashing.status, 1);
+    EXPECT_NE(crashing.output.find("before it was ready"), std::string::npos) << crashing.output;
+}
+
+TEST_F(Start, MistakesInTheConfigurationAreNamedWithTheirLine) {
+    struct {
+        const char* text;
+        const char* expected;
+    } const cases[] = {
+        {"queue_limit = 1\nqueu_limit = 2\n", "line 2: there is no key \"queu_limit\"; known keys: plugins"},
+        {"\nqueue_limit = \"2\"\n", "line 2: \"queue_limit\" takes a whole number"},
+        {"queue_limit = -1\n", "line 1: \"queue_limit\" takes"},
+        {"request_deadline_seconds = 0\n", "line 1: \"request_deadline_seconds\" takes seconds"},
+        {"request_deadline_seconds = nan\n", "line 1: \"request_deadline_seconds\" takes seconds"},
+        {"client_timeout_seconds = true\n", "line 1: \"client_timeout_seconds\" takes seconds"},
+        {"log = \"file\"\n", "line 1: \"log\" takes"},
+        {"languages = \"de\"\n", "line 1: \"languages\" takes a list of texts"},
+        {"plugins = [1]\n", "line 1: \"plugins\" takes a list of texts"},
+        {"socket = 1\n", "line 1: \"socket\" takes a text"},
+        {"[section]\nlog = \"syslog\"\n", "line 1: there is no key \"section\""},
+        {"queue_limit = = 2\n", "line 1, column"},
+    };
+    for (const auto& entry : cases) {
+        const ProgramResult result = run({"--check", "--config", configuration(entry.text)});
+        EXPECT_EQ(result.status, 1) << entry.text;
+        EXPECT_NE(result.output.find(entry.expected), std::string::npos) << entry.text << result.output;
+    }
+    EXPECT_EQ(run({"--check", "--config", (directory / "missing").string()}).status, 1);
+}
+
+TEST_F(Start, CommandLineMistakesAreUsageErrors) {
+    EXPECT_EQ(run({"--nonsense"}).status, 2);
+    EXPECT_EQ(run({"--log", "file"}).status, 2);
+    EXPECT_EQ(run({"stray"}).status, 2);
+    const ProgramResult help = run({"--help"});
+    EXPECT_EQ(help.status, 0);
+    for (const char* option : {"--root", "--plugin", "--socket", "--config", "--log", "--check"}) {
+        EXPECT_NE(help.output.find(option), std::string::npos) << option;
+    }
+    EXPECT_EQ(run({"--version"}).output, "adminhostd " ADMINHOST_RELEASE "\n");
+}
+
+TEST_F(Start, ServiceManagerIsToldOfReadinessAndOfTheEnd) {
+    const fs::path path = directory / "notify";
+    const int listener = ::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    path.string().copy(address.sun_path, sizeof address.sun_path - 1);
+    ASSERT_EQ(::bind(listener, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    const timeval bound{10, 0};
+    ::setsockopt(listener, SOL_SOCKET, SO_RCVTIMEO, &bound, sizeof bound);
+    auto options = withFixture();
+    options.environment = {"NOTIFY_SOCKET=" + path.string()};
+    DaemonProcess daemon(options);
+    char buffer[64] = {};
+    ASSERT_GT(::recv(listener, buffer, sizeof buffer - 1, 0), 0);
+    EXPECT_STREQ(buffer, "READY=1");
+    daemon.signal(SIGTERM);
+    ASSERT_GT(::recv(listener, buffer, sizeof buffer - 1, 0), 0);
+    EXPECT_TRUE(std::string(buffer).starts_with("STOPPING=1"));
+    EXPECT_EQ(daemon.wait(), 0);
+    ::close(listener);
+}
+
+class DatabaseTool : public Start {
+  protected:
+    DatabaseTool() { fs::create_directories(directory / "usr/bin"); }
+
+    HttpReply databaseReply() const {
+        DaemonProcess daemon({{"--root", directory, "--plugin", pluginFile("fixture_good")}, "", {}});
+        EXPECT_EQ(daemon.connect().post("/v1/fixture/echo", "{}").status, 200) << "other commands are served";
+        return daemon.connect().post("/v1/fixture/database", "{}");
+    }
+    void writeTool(const std::string& text) const {
+        const fs::path tool = directory / "usr/bin/sqlite3";
+        std::ofstream(tool) << text;
+        ASSERT_EQ(::chmod(tool.c_str(), 0755), 0);
+    }
+};
+
+TEST_F(DatabaseTool, RealOneIsUsable) {
+    fs::create_symlink("/usr/bin/sqlite3", directory / "usr/bin/sqlite3");
+    EXPECT_EQ(databaseReply().status, 200);
+}
+
+TEST_F(DatabaseTool, MissingOneRefusesTheCommandsThatNeedIt) {
+    const HttpReply reply = databaseReply();
+    expectError(reply, 500, "SQLITE_TOOL_UNUSABLE");
+    EXPECT_NE(reply.body.find("/usr/bin/sqlite3 failed"), std::string::npos) << reply.body;
+}
+
+TEST_F(DatabaseTool, OneThatPrintsRowsOtherwiseIsRefused) {
+    writeTool("#!/bin/sh\nprintf 'a: x = y\\nlongername: quoted text\\nc: \\n'\n");
+    const HttpReply reply = databaseReply();
+    expectError(reply, 500, "SQLITE_TOOL_UNUSABLE");
+    EXPECT_NE(reply.body.find("does not print rows as this release reads them"), std::string::npos) << reply.body;
+}
+
+TEST_F(DatabaseTool, OneThatRefusesDoubleQuotedTextIsRefused) {
+    writeTool("#!/bin/sh\necho 'Error: no such column: \"quoted text\"' >&2\nexit 1\n");
+    const HttpReply reply = databaseReply();
+    expectError(reply, 500, "SQLITE_TOOL_UNUSABLE");
+    EXPECT_NE(reply.body.find("no such column"), std::string::npos) << reply.body;
+}
+
+TEST_F(DatabaseTool, OneThatHangsDoesNotKeepTheDaemonFromStarting) {
+    writeTool("#!/bin/sh\nexec sleep 60\n");
+    expectError(databaseReply(), 500, "SQLITE_TOOL_UNUSABLE");
+}
+
+}  // namespace
+}  // namespace adminhost::test
