@@ -1,0 +1,1 @@
+list(APPEND FUZZ_LIBS codec)
