@@ -21,9 +21,36 @@ enum class Element { plist, dict, array, key, string, integer, real, date, data,
 constexpr std::array<std::string_view, 11> elementNames = {"plist", "dict", "array", "key",  "string", "integer",
                                                            "real",  "date", "data",  "true", "false"};
 
+/// Called for every element of a list: the first letter leaves one or two names to compare.
 Element elementOf(std::string_view name) noexcept {
-    const auto found = std::find(elementNames.begin(), elementNames.end(), name);
-    return static_cast<Element>(found - elementNames.begin());
+    const auto either = [&](Element element, Element other = Element::unknown) {
+        for (const Element candidate : {element, other}) {
+            if (candidate != Element::unknown && elementNames[static_cast<std::size_t>(candidate)] == name) {
+                return candidate;
+            }
+        }
+        return Element::unknown;
+    };
+    switch (name.empty() ? '\0' : name.front()) {
+        case 'k':
+            return either(Element::key);
+        case 's':
+            return either(Element::string);
+        case 'i':
+            return either(Element::integer);
+        case 'd':
+            return name.size() > 1 && name[1] == 'i' ? either(Element::dict) : either(Element::data, Element::date);
+        case 't':
+            return either(Element::true_);
+        case 'f':
+            return either(Element::false_);
+        case 'a':
+            return either(Element::array);
+        case 'r':
+            return either(Element::real);
+        default:
+            return either(Element::plist);
+    }
 }
 
 std::string_view nameOf(Element element) noexcept {
@@ -44,6 +71,12 @@ std::string shortened(std::string_view text) {
 }
 
 constexpr std::string_view whiteSpace = " \t\r\n";
+
+/// Most character events of an indented list are this; the library's search takes longer.
+bool isWhiteSpace(std::string_view text) noexcept {
+    return std::all_of(text.begin(), text.end(),
+                       [](char c) { return c == '\t' || c == '\n' || c == ' ' || c == '\r'; });
+}
 
 std::string_view trimmed(std::string_view text) noexcept {
     const std::size_t first = text.find_first_not_of(whiteSpace);
@@ -242,7 +275,7 @@ class XmlReader {
     void characters(std::string_view text) {
         if (_leaf) {
             _text.append(text);
-        } else if (text.find_first_not_of(whiteSpace) != std::string_view::npos) {
+        } else if (!isWhiteSpace(text)) {
             fail("text outside the elements that hold text");
         }
     }
@@ -266,7 +299,7 @@ class XmlReader {
         std::optional<Value> value;
         switch (element) {
             case Element::key:
-                _containers.back().key = _text;
+                _containers.back().key.swap(_text);
                 _containers.back().hasKey = true;
                 return;
             case Element::string:
