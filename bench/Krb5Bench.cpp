@@ -118,7 +118,7 @@ void ticketThroughLayerAndLibrary(benchmark::State& state) {
     const auto libraryContext = KRB5Context::context();
     std::vector<double> layer;
     std::vector<double> library;
-    for (auto _ : state) {
+    for ([[maybe_unused]] auto _ : state) {
         layer.push_back(millisecondsOf([&] { layerOnce(path, layerContext); }));
         library.push_back(millisecondsOf([&] { libraryOnce(path, libraryContext->nativeContext()); }));
     }
@@ -133,7 +133,7 @@ void keytabPrincipals(benchmark::State& state) {
     const std::string path = realm().kdc.directory() / ("keytab" + std::to_string(entries));
     std::ofstream(path, std::ios::binary) << support::keytabFile(entries, entries / 2);
     const auto keytab = KRB5Keytab::initWithName(path, KRB5KeytabFileType, KRB5Context::context());
-    for (auto _ : state) {
+    for ([[maybe_unused]] auto _ : state) {
         require(keytab->principals().size() == static_cast<std::size_t>(entries / 2), "principals");
     }
     state.counters["perEntry"] = benchmark::Counter(

@@ -45,13 +45,14 @@ krb5_error_code krb5_get_init_creds_password(krb5_context context, krb5_creds* c
     return real(context, creds, client, password, prompter, data, start_time, in_tkt_service, options);
 }
 
-void explicit_bzero(void* start, std::size_t size) noexcept {
+// By their names in the object file, since the C library's header defines them inline when the compiler fortifies.
+void wipePlain(void* start, std::size_t size) noexcept __asm__("explicit_bzero");
+void wipeChecked(void* start, std::size_t size, std::size_t room) noexcept __asm__("__explicit_bzero_chk");
+
+void wipePlain(void* start, std::size_t size) noexcept {
     wipe(start, size);
 }
-
-// What the former is called when the compiler fortifies.
-void __explicit_bzero_chk(void* start, std::size_t size,
-                          std::size_t /*room*/) noexcept {  // NOLINT(*-reserved-identifier)
+void wipeChecked(void* start, std::size_t size, std::size_t /*room*/) noexcept {
     wipe(start, size);
 }
 }
