@@ -39,8 +39,10 @@ class Service {
     /// a failure inside the service, the log lines of the request.
     [[nodiscard]] std::optional<Value> perform(const CommandRef& command, const Dictionary& request);
 
-  private:
+    /// What an address of the daemon answers. Throws as perform().
     [[nodiscard]] Value get(const std::string& path);
+
+  private:
     [[noreturn]] void fail(const HttpAnswer& answer);
 
     Connection _connection;

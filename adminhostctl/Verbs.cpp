@@ -1,5 +1,6 @@
 #include "adminhostctl/Verbs.h"
 
+#include "adminhostctl/HistoryVerbs.h"
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
@@ -226,6 +227,9 @@ constexpr std::array verbTable = {
     Verb{"help", "[COMMAND]", "The verbs, or a command's keys and answer", 0, 1, &help},
     Verb{"camera list", "[--names]", "The cameras and who may use them", 0, 0, &cameraList},
     Verb{"camera show", "NAME|UUID", "Everything about one camera", 1, 1, &cameraShow},
+    Verb{"whois", "NAME|UUID", "Who has this name or UUID, and which directory knows it", 1, 1, &whois},
+    Verb{"history", "", "The latest writes of settings: when, who and what changed", 0, 0, &history},
+    Verb{"rollback", "NUMBER", "Restores the settings as they were before a write of the history", 1, 1, &rollback},
     Verb{"property list", "[--names]", "The workflow properties", 0, 0, &propertyList},
 };
 

@@ -1,0 +1,162 @@
+#include "adminhostctl/HistoryVerbs.h"
+
+#include "adminhostctl/Connection.h"
+#include "adminhostctl/Reading.h"
+#include "adminhostctl/Table.h"
+#include "adminhostctl/Width.h"
+#include "platform/json/Json.h"
+#include "platform/value/Text.h"
+
+#include <algorithm>
+
+namespace adminhost::ctl {
+namespace {
+
+const Value secretText("(secret)");
+
+/// The settings that a write can set: keys that stand directly in its configuration and hold one value.
+std::vector<std::string> writableKeys(const Description& write) {
+    constexpr std::string_view prefix = "configuration.";
+    std::vector<std::string> keys;
+    for (const KeyDescription& key : write.keys()) {
+        const bool single = key.type != "list" && key.path.find_first_of(".[", prefix.size()) == std::string::npos;
+        if (key.path.starts_with(prefix) && single && !key.secret) {
+            keys.push_back(key.path.substr(prefix.size()));
+        }
+    }
+    return keys;
+}
+
+std::string settingText(const Value& value) {
+    return value.isNull() ? "not set" : shown(textOf(value));
+}
+
+/// The plug-in's history, oldest first.
+Array entriesOf(const Context& context, const CommandRef& write) {
+    const Value answer = context.service.get("/v1/" + Connection::escaped(write.plugin) + "/history");
+    const Array* entries = answer.dictionary() == nullptr ? nullptr : answer.dictionary()->get("history").array();
+    return entries == nullptr ? Array{} : *entries;
+}
+
+const Dictionary& dictionaryAt(const Dictionary& dictionary, std::string_view key) {
+    static const Dictionary none;
+    const Dictionary* found = dictionary.get(key).dictionary();
+    return found == nullptr ? none : *found;
+}
+
+Dictionary currentSettings(const Context& context) {
+    const auto answer = context.service.perform(context.service.command("readSettings"),
+                                                {{"optionalArguments", Dictionary{{"variant", "getConfig"}}}});
+    return answer && answer->dictionary() != nullptr ? dictionaryAt(*answer->dictionary(), "configuration")
+                                                     : Dictionary();
+}
+
+}  // namespace
+
+std::vector<std::string> changesBetween(const Dictionary& before, const Dictionary& after,
+                                        const std::vector<std::string>& keys) {
+    std::vector<std::string> changes;
+    for (const std::string& key : keys) {
+        const Value& old = before.get(key);
+        const Value& now = after.get(key);
+        if (old != now && old != secretText && now != secretText) {
+            changes.push_back(key + ": " + settingText(old) + " -> " + settingText(now));
+        }
+    }
+    return changes;
+}
+
+ExitStatus whois(const Context& context, std::span<const std::string> arguments) {
+    const Value answer = context.service.get("/v1/directory?is=" + Connection::escaped(arguments.front()));
+    const Array* entries = answer.dictionary() == nullptr ? nullptr : answer.dictionary()->get("entries").array();
+    if (entries == nullptr || entries->empty()) {
+        throw Failure(ExitStatus::answeredError,
+                      "the directory knows nobody with the name or UUID " + shown(arguments.front()));
+    }
+    if (context.options.format != Format::text) {
+        context.out << jsonOf(*entries, true) << '\n';
+        return ExitStatus::done;
+    }
+    for (std::size_t i = 0; i < entries->size(); ++i) {
+        context.out << (i == 0 ? "" : "\n") << Reading(Description(), context.options.width).text((*entries)[i]);
+    }
+    return ExitStatus::done;
+}
+
+ExitStatus history(const Context& context, std::span<const std::string>) {
+    const CommandRef write = context.service.command("writeSettings");
+    const Array entries = entriesOf(context, write);
+    if (context.options.format != Format::text) {
+        context.out << jsonOf(entries, true) << '\n';
+        return ExitStatus::done;
+    }
+    if (entries.empty()) {
+        context.out << "No settings have been written yet.\n";
+        return ExitStatus::done;
+    }
+    const std::vector<std::string> keys = writableKeys(write.description);
+    const Dictionary current = currentSettings(context);
+    Table table({"number", "when", "who", "changed"});
+    // The newest first: that is the one that people look for.
+    for (std::size_t i = entries.size(); i-- > 0;) {
+        const Dictionary& entry = *entries[i].dictionary();
+        const Dictionary& after =
+            i + 1 < entries.size() ? dictionaryAt(*entries[i + 1].dictionary(), "settings") : current;
+        std::string changed;
+        for (const std::string& change : changesBetween(dictionaryAt(entry, "settings"), after, keys)) {
+            changed += (changed.empty() ? "" : "; ") + change;
+        }
+        const auto when = entry.get("when").date();
+        table.addRow({textOf(entry.get("number")), when ? dateText(*when) : "", shown(textOf(entry.get("who"))),
+                      changed.empty() ? "no setting" : changed});
+    }
+    context.out << table.text(context.options.width, 0)
+                << "\nadminhostctl rollback NUMBER restores the settings as they were before that write.\n";
+    return ExitStatus::done;
+}
+
+ExitStatus rollback(const Context& context, std::span<const std::string> arguments) {
+    const CommandRef write = context.service.command("writeSettings");
+    const Array entries = entriesOf(context, write);
+    const auto found = std::find_if(entries.begin(), entries.end(), [&](const Value& entry) {
+        return textOf(entry.dictionary()->get("number")) == arguments.front();
+    });
+    if (found == entries.end()) {
+        throw usageError("the history has no entry " + shown(arguments.front()) + "; adminhostctl history lists them");
+    }
+    const Dictionary& wanted = dictionaryAt(*found->dictionary(), "settings");
+    const std::vector<std::string> keys = writableKeys(write.description);
+    const Dictionary before = currentSettings(context);
+    if (changesBetween(before, wanted, keys).empty()) {
+        context.out << "no change\n";
+        return ExitStatus::done;
+    }
+    Dictionary configuration;
+    for (const std::string& key : keys) {
+        configuration.set(key, wanted.get(key));
+    }
+    const auto answer = context.service.perform(
+        write, {{"configuration", configuration}, {"optionalArguments", Dictionary{{"variant", "getConfig"}}}});
+    const Dictionary none;
+    const Dictionary& said = answer && answer->dictionary() != nullptr ? *answer->dictionary() : none;
+    if (const std::string error = errorOf(write.description, said); !error.empty()) {
+        throw Failure(ExitStatus::answeredError, "the service answered an error: " + error);
+    }
+    const Dictionary& after = dictionaryAt(said, "configuration");
+    for (const std::string& change : changesBetween(before, after, keys)) {
+        context.out << change << '\n';
+    }
+    if (said.get("needsRecycleOrRestart") == Value(true)) {
+        context.out << "The service must be restarted for this to take effect.\n";
+    }
+    if (wanted.contains("nimbo_client_password")) {
+        context.out << "The grid password stays as it is: a stored password cannot be written back.\n";
+    }
+    const std::vector<std::string> missing = changesBetween(after, wanted, keys);
+    for (const std::string& difference : missing) {
+        context.err << "adminhostctl: did not take: " << difference << '\n';
+    }
+    return missing.empty() ? ExitStatus::done : ExitStatus::answeredError;
+}
+
+}  // namespace adminhost::ctl

@@ -1,0 +1,19 @@
+#pragma once
+
+// The verbs that look back: who the directory knows, what writes of settings changed, and going back.
+
+#include "adminhostctl/Verbs.h"
+
+namespace adminhost::ctl {
+
+/// The settings that differ, "KEY: BEFORE -> AFTER" each; only the given keys are compared, and secrets never.
+[[nodiscard]] std::vector<std::string> changesBetween(const Dictionary& before, const Dictionary& after,
+                                                      const std::vector<std::string>& keys);
+
+[[nodiscard]] ExitStatus whois(const Context& context, std::span<const std::string> arguments);
+[[nodiscard]] ExitStatus history(const Context& context, std::span<const std::string> arguments);
+/// Writes the settings of an entry through the same write as any other. What is set now and was not set then stays, and
+/// so does a password: neither can be written back, and both are said.
+[[nodiscard]] ExitStatus rollback(const Context& context, std::span<const std::string> arguments);
+
+}  // namespace adminhost::ctl
