@@ -1,0 +1,152 @@
+// Reading and writing settings through the daemon, the plug-in and the command line of this build on the sample
+// service.
+
+#include "platform/json/Json.h"
+#include "tests/support/DaemonProcess.h"
+#include "tests/support/Program.h"
+#include "tests/support/SampleRoot.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace adminhost {
+namespace {
+
+using test::HttpReply;
+using test::ProgramResult;
+using testing::HasSubstr;
+
+class Settings : public testing::Test {
+  protected:
+    [[nodiscard]] test::DaemonProcess::Options options() const {
+        test::DaemonProcess::Options options;
+        options.arguments = {"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"};
+        return options;
+    }
+    [[nodiscard]] HttpReply post(const std::string& command, const std::string& body,
+                                 const test::UnixHttp::Headers& headers = {}) const {
+        return daemon.connect().post("/v1/lumio/" + command, body, headers);
+    }
+    [[nodiscard]] static Value valueOf(const HttpReply& reply) {
+        const auto value = parseJson(reply.body);
+        EXPECT_TRUE(value) << reply.body;
+        return value ? *value : Value();
+    }
+    [[nodiscard]] ProgramResult ctl(std::vector<std::string> words) const {
+        words.insert(words.begin(), {std::string(BINARY_DIR) + "/bin/adminhostctl", "--socket", daemon.socket()});
+        return test::runProgram(words, test::Errors::merge);
+    }
+
+    const test::SampleRoot root;
+    const test::DaemonProcess daemon{options()};
+};
+
+TEST_F(Settings, ReadCarriesTheRevisionThatGuardsAWrite) {
+    const HttpReply read = post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})");
+    ASSERT_EQ(read.status, 200);
+    const std::string revision = read.headers.at("etag");
+    EXPECT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})", {"If-Match: " + revision}).status,
+              200);
+    const std::string before = root.read("/Library/Preferences/com.brenn.lumioserverd.plist");
+    const HttpReply stale =
+        post("writeSettings", R"({"configuration":{"member_uuid":"X"}})", {"If-Match: " + revision});
+    EXPECT_EQ(stale.status, 412);
+    EXPECT_EQ(valueOf(stale).dictionary()->get("error"), Value("REVISION_CHANGED"));
+    EXPECT_EQ(root.read("/Library/Preferences/com.brenn.lumioserverd.plist"), before);
+}
+
+TEST_F(Settings, TwoWritersComeOneAfterTheOtherAndNothingIsMixed) {
+    test::UnixHttp first = daemon.connect();
+    test::UnixHttp second = daemon.connect();
+    first.begin("POST", "/v1/lumio/writeSettings",
+                R"({"configuration":{"server_host":"one","tunnel_server_host":"one"}})");
+    second.begin("POST", "/v1/lumio/writeSettings",
+                 R"({"configuration":{"server_host":"two","tunnel_server_host":"two"}})");
+    EXPECT_EQ(first.reply().status, 200);
+    EXPECT_EQ(second.reply().status, 200);
+    const Value read = valueOf(post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})"));
+    const Dictionary& config = *read.dictionary()->get("configuration").dictionary();
+    EXPECT_EQ(config.get("server_host"), config.get("tunnel_server_host"));
+}
+
+TEST_F(Settings, RequestThatAStatementCannotCarryIsRefusedWholeAndChangesNothing) {
+    const std::string before = root.sql("select * from properties");
+    const HttpReply reply =
+        post("writeSettings",
+             R"({"configuration":{"server_port":1,"properties":[{"_newid_":true,"name":"a\"b","value":"v"},)"
+             R"({"_newid_":true,"name":"good","value":"v"}]}})");
+    EXPECT_EQ(reply.status, 422);
+    const Value body = valueOf(reply);
+    EXPECT_EQ(body.dictionary()->get("findings").array()->front().dictionary()->get("keyPath"),
+              Value("configuration.properties.0.name"));
+    EXPECT_EQ(root.sql("select * from properties"), before);
+    EXPECT_EQ(ctl({"history"}).output, "No settings have been written yet.\n");
+}
+
+TEST_F(Settings, HistoryTellsWhatEachWriteChangedAndRollbackGoesBackThroughTheSameWrite) {
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"nimbo_client_username":"other"}})").status, 200);
+    const ProgramResult history = ctl({"history"});
+    EXPECT_EQ(history.status, 0);
+    EXPECT_THAT(history.output, HasSubstr("server_port: 8170 -> 9001"));
+    EXPECT_THAT(history.output, HasSubstr("nimbo_client_username: lumiogrid -> other"));
+
+    const ProgramResult rollback = ctl({"rollback", "1"});
+    EXPECT_EQ(rollback.status, 0) << rollback.output;
+    EXPECT_THAT(rollback.output, HasSubstr("server_port: 9001 -> 8170"));
+    EXPECT_THAT(rollback.output, HasSubstr("must be restarted"));
+    EXPECT_EQ(ctl({"rollback", "1"}).output, "no change\n");
+    EXPECT_THAT(ctl({"history"}).output, HasSubstr("other -> lumiogrid"));
+}
+
+TEST_F(Settings, RollbackThatDoesNotTakeIsNamed) {
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
+    root.setSwitch("setup_library.exit", "3");
+    const ProgramResult rollback = ctl({"rollback", "1"});
+    EXPECT_EQ(rollback.status, 1);
+    EXPECT_THAT(rollback.output, HasSubstr("writeStatus is 3"));
+    EXPECT_EQ(ctl({"rollback", "77"}).status, 2);
+}
+
+TEST_F(Settings, WhoisFindsPeopleAndGroupsByNameAndUuid) {
+    const std::string uuid = test::SampleRoot::uuidOf("user", "anna");
+    for (const std::string& text : {std::string("anna"), uuid}) {
+        const ProgramResult whois = ctl({"whois", text});
+        EXPECT_EQ(whois.status, 0);
+        EXPECT_THAT(whois.output, HasSubstr("Anna Lindqvist"));
+        EXPECT_THAT(whois.output, HasSubstr(uuid));
+        EXPECT_THAT(whois.output, HasSubstr("/Local"));
+    }
+    const ProgramResult nobody = ctl({"whois", "nobody & nothing"});
+    EXPECT_EQ(nobody.status, 1);
+    EXPECT_THAT(nobody.output, HasSubstr("nobody & nothing"));
+}
+
+TEST_F(Settings, DirectoryCompletesNamesByTheirBeginningInAnyCase) {
+    const Value found = valueOf(daemon.connect().get("/v1/directory?match=ANN"));
+    ASSERT_EQ(found.dictionary()->get("entries").array()->size(), 1U);
+    EXPECT_EQ(found.dictionary()->get("entries").array()->front().dictionary()->get("shortName"), Value("anna"));
+    EXPECT_EQ(*valueOf(daemon.connect().get("/v1/directory?match=zzz")).dictionary()->get("entries").array(), Array{});
+    EXPECT_EQ(daemon.connect().post("/v1/directory").status, 405);
+}
+
+TEST_F(Settings, DirectoryThatCannotAnswerIsAClearError) {
+    root.remove("/etc/passwd");
+    const HttpReply reply = daemon.connect().get("/v1/directory?match=a");
+    EXPECT_EQ(reply.status, 500);
+    EXPECT_EQ(valueOf(reply).dictionary()->get("error"), Value("DIRECTORY_UNAVAILABLE"));
+}
+
+TEST_F(Settings, SetupScriptThatLeavesADaemonHoldingItsPipesDoesNotHoldTheAnswer) {
+    root.setSwitch("setup_preferences.daemon", "30");
+    EXPECT_EQ(post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})").status, 200);
+    EXPECT_TRUE(root.daemonLeftBy("setup_preferences")) << "the process that the script left lives on";
+}
+
+TEST_F(Settings, UnknownPluginHasNoHistory) {
+    EXPECT_EQ(daemon.connect().get("/v1/other/history").status, 404);
+    EXPECT_EQ(*valueOf(daemon.connect().get("/v1/lumio/history")).dictionary()->get("history").array(), Array{});
+}
+
+}  // namespace
+}  // namespace adminhost
