@@ -1,0 +1,302 @@
+// The command line against the daemon of this build: with the service's plug-in on a sample root, and with a plug-in
+// that answers what a test asks for.
+
+#include "platform/json/Json.h"
+#include "platform/task/Task.h"
+#include "tests/support/DaemonProcess.h"
+#include "tests/support/SampleRoot.h"
+
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+namespace {
+
+using adminhost::Array;
+using adminhost::Dictionary;
+using adminhost::Value;
+using adminhost::test::DaemonProcess;
+using testing::AllOf;
+using testing::HasSubstr;
+using testing::Not;
+
+const std::string program = std::string(BINARY_DIR) + "/bin/adminhostctl";
+
+struct Result {
+    int status = 0;
+    std::string out;
+    std::string err;
+
+    [[nodiscard]] Value value() const { return adminhost::parseJson(out).value_or(Value()); }
+};
+
+Result runIn(const std::string& tool, const std::vector<std::string>& words, const std::string& socket,
+             const std::optional<std::string>& input = {}) {
+    Result result;
+    result.status = adminhost::launch_task_with_input_and_environment(
+        adminhost::DiskPath(tool), words, input, &result.out, &result.err,
+        {{"ADMINHOST_SOCKET", socket}, {"COLUMNS", "100"}, {"TZ", "Europe/Berlin"}});
+    return result;
+}
+
+DaemonProcess::Options withPlugins(const std::vector<std::string>& files, const std::vector<std::string>& others = {}) {
+    DaemonProcess::Options options;
+    for (const std::string& file : files) {
+        options.arguments.insert(options.arguments.end(), {"--plugin", std::string(BINARY_DIR) + '/' + file});
+    }
+    options.arguments.insert(options.arguments.end(), others.begin(), others.end());
+    return options;
+}
+
+/// One daemon with the described plug-in for all tests of a suite.
+class Ctl : public testing::Test {
+  protected:
+    static void SetUpTestSuite() {
+        daemon = std::make_unique<DaemonProcess>(withPlugins({"tests/plugins/fixture_described.so"}));
+    }
+    static void TearDownTestSuite() { daemon.reset(); }
+
+    static Result run(const std::vector<std::string>& words, const std::optional<std::string>& input = {}) {
+        return runIn(program, words, daemon->socket(), input);
+    }
+
+    static std::unique_ptr<DaemonProcess> daemon;
+};
+std::unique_ptr<DaemonProcess> Ctl::daemon;
+
+TEST_F(Ctl, TextsArriveAsTheTypesThatTheDaemonDescribes) {
+    const Result result = run({"--format", "json", "echoTyped", "count=7", "on=yes", "when=2026-01-31 09:00", "name=7",
+                               "list.0.name=a", "list.1.name=b"});
+    EXPECT_EQ(result.status, 0) << result.err;
+    EXPECT_EQ(result.value(), Value(Dictionary{{"count", 7},
+                                               {"on", true},
+                                               {"when", adminhost::Date(std::chrono::seconds(1769846400))},
+                                               {"name", "7"},
+                                               {"list", Array{Dictionary{{"name", "a"}}, Dictionary{{"name", "b"}}}}}));
+}
+
+TEST_F(Ctl, OptionsMayStandBehindTheCommand) {
+    EXPECT_EQ(run({"echoTyped", "count=7", "--format", "json"}).value(), Value(Dictionary{{"count", 7}}));
+}
+
+TEST_F(Ctl, ATextThatDoesNotFitIsUsage) {
+    const Result result = run({"echoTyped", "count=seven"});
+    EXPECT_EQ(result.status, 2);
+    EXPECT_EQ(result.out, "");
+    EXPECT_EQ(result.err, "adminhostctl: count: \"seven\" is no whole number\n");
+}
+
+TEST_F(Ctl, ASecretComesFromStandardInputButNotFromTheCommandLine) {
+    EXPECT_EQ(run({"--format", "json", "echoTyped", "password@-"}, "hunter2\n").value(),
+              Value(Dictionary{{"password", "hunter2"}}));
+    const Result result = run({"echoTyped", "password=hunter2"});
+    EXPECT_EQ(result.status, 2);
+    EXPECT_THAT(result.err, AllOf(HasSubstr("password is secret"), Not(HasSubstr("hunter2"))));
+}
+
+TEST_F(Ctl, AWholeRequestComesFromAFileOrStandardInput) {
+    const std::string file = (daemon->directory() / "request").string();
+    std::ofstream(file) << R"({"count": 1, "name": "file"})";
+    EXPECT_EQ(run({"--format", "json", "echoTyped", "count=2", "--file", file}).value(),
+              Value(Dictionary{{"count", 2}, {"name", "file"}}));
+    EXPECT_EQ(run({"--format", "json", "echoTyped", "--file", "-"}, R"({"count": 3})").value(),
+              Value(Dictionary{{"count", 3}}));
+    const Result twice = run({"echoTyped", "--file", "-", "password@-"}, "{}");
+    EXPECT_EQ(twice.status, 2);
+    EXPECT_THAT(twice.err, HasSubstr("only once"));
+}
+
+TEST_F(Ctl, ABrokenFileIsUsageWithLineAndColumn) {
+    const Result result = run({"echoTyped", "--file", "-"}, "{\n  \"a\" 1}");
+    EXPECT_EQ(result.status, 2);
+    EXPECT_THAT(result.err, HasSubstr("line 2, column "));
+}
+
+TEST_F(Ctl, DataComesFromAFileAndIsAnsweredInEachFormat) {
+    EXPECT_EQ(run({"--format", "json", "echoTyped", "blob@-"}, std::string("\0\xFF", 2)).value(),
+              Value(Dictionary{{"blob", adminhost::Data{0, 0xFF}}}));
+    EXPECT_EQ(run({"echoTyped", "blob@-"}, "ab").out, "blob  2 bytes of data\n");
+    EXPECT_THAT(run({"--format", "plist", "echoTyped", "blob@-"}, "ab").out,
+                AllOf(HasSubstr("<plist version=\"1.0\">"), HasSubstr("<key>blob</key>"), HasSubstr("YWI=")));
+}
+
+TEST_F(Ctl, SizesAndDatesAreWrittenAsPeopleWriteThem) {
+    const Result result = run({"measure"});
+    EXPECT_EQ(result.status, 0);
+    EXPECT_EQ(result.out, "room   1.2 TB\nsince  31 Jan 2026, 09:00\n");
+}
+
+TEST_F(Ctl, ARefusedRequestListsEveryFinding) {
+    const Result result = run({"echoTyped", "name=bad"});
+    EXPECT_EQ(result.status, 1);
+    EXPECT_EQ(result.out, "");
+    EXPECT_THAT(result.err, AllOf(HasSubstr("\n  name: is bad (choose a good one)\n"),
+                                  HasSubstr("\n  name: is \\x1b[31mred (choose another)\n")));
+}
+
+TEST_F(Ctl, AnAnswerThatHoldsAnErrorIsWrittenAndIsStatusOne) {
+    const Result result = run({"fail", "status=5"});
+    EXPECT_EQ(result.status, 1);
+    EXPECT_EQ(result.out, "readStatus  5\nproblem     no room\n");
+    EXPECT_EQ(result.err, "adminhostctl: the service answered an error: readStatus is 5, problem is no room\n");
+}
+
+TEST_F(Ctl, AFailureInsideTheServiceShowsTheLogLinesOfItsRequest) {
+    const Result result = run({"breakDown"});
+    EXPECT_EQ(result.status, 1);
+    EXPECT_EQ(result.err,
+              "adminhostctl: It broke down. (BROKEN)\n"
+              "log lines of the request:\n"
+              "  the first step failed\n"
+              "  and so did the second\n");
+}
+
+TEST_F(Ctl, AnAnswerOfNothingIsDone) {
+    EXPECT_EQ(run({"nothing"}).out, "done\n");
+    EXPECT_EQ(run({"nothing"}).status, 0);
+    EXPECT_EQ(run({"--format", "json", "nothing"}).out, "");
+}
+
+TEST_F(Ctl, AnUnknownCommandIsUsageAndTheKnownOnesAreListed) {
+    const Result result = run({"ecoTyped"});
+    EXPECT_EQ(result.status, 2);
+    EXPECT_THAT(result.err, HasSubstr("there is no command ecoTyped; there are echoTyped, measure, "));
+}
+
+TEST_F(Ctl, CommandsAndHelpComeFromTheDaemon) {
+    EXPECT_EQ(run({"commands", "--names"}).out, "echoTyped\nmeasure\nfail\nbreakDown\nnothing\ngetCameras\n");
+    EXPECT_THAT(run({"commands"}).out, HasSubstr("echoTyped   described  Serves echoTyped.\n"));
+    EXPECT_THAT(run({"help", "echoTyped"}).out,
+                AllOf(HasSubstr("echoTyped: Serves echoTyped."), HasSubstr("  count        whole number  A key."),
+                      HasSubstr("Secret: password@FILE or password@-.")));
+    EXPECT_EQ(run({"help", "fail", "--names"}).out, "status=\n");
+}
+
+TEST_F(Ctl, StatusTellsOfPlugInsAndOfWhatWaits) {
+    EXPECT_THAT(run({"status"}).out,
+                AllOf(HasSubstr("waiting"), HasSubstr("plugins (1)\n"), HasSubstr("described  1.0.0")));
+}
+
+TEST_F(Ctl, WrongNumbersOfArgumentsAreUsage) {
+    for (const std::vector<std::string>& words : {std::vector<std::string>{},
+                                                  {"camera"},
+                                                  {"camera", "show"},
+                                                  {"status", "now"},
+                                                  {"--format", "xml", "status"},
+                                                  {"--colour"}}) {
+        EXPECT_EQ(run(words).status, 2) << testing::PrintToString(words);
+    }
+}
+
+TEST(CtlReach, NoDaemonIsStatusThree) {
+    const Result result = runIn(program, {"status"}, "/nowhere/socket");
+    EXPECT_EQ(result.status, 3);
+    EXPECT_THAT(result.err, HasSubstr("cannot be reached at /nowhere/socket: No such file or directory"));
+}
+
+TEST(CtlReach, HelpOfTheVerbsNeedsNoDaemon) {
+    const Result result = runIn(program, {"help"}, "/nowhere/socket");
+    EXPECT_EQ(result.status, 0);
+    EXPECT_THAT(result.out, HasSubstr("camera show"));
+}
+
+TEST(CtlReach, WhoMayNotUseTheDaemonGetsStatusFour) {
+    const DaemonProcess daemon(withPlugins({"tests/plugins/fixture_described.so"}));
+    if (::geteuid() == 0) {
+        // Let another account reach the socket: then it is the daemon that says no.
+        const std::vector<std::string> words = {"--reuid=65534", "--regid=65534", "--clear-groups", program, "status"};
+        std::filesystem::permissions(daemon.directory(), std::filesystem::perms(0755));
+        std::filesystem::permissions(daemon.socket(), std::filesystem::perms(0666));
+        const Result refused = runIn("/usr/bin/setpriv", words, daemon.socket());
+        EXPECT_EQ(refused.status, 4) << refused.err;
+        EXPECT_THAT(refused.err, HasSubstr("NOT_PERMITTED"));
+        std::filesystem::permissions(daemon.socket(), std::filesystem::perms(0600));
+        EXPECT_EQ(runIn("/usr/bin/setpriv", words, daemon.socket()).status, 4);
+    } else {
+        std::filesystem::permissions(daemon.socket(), std::filesystem::perms(0000));
+        const Result closed = runIn(program, {"status"}, daemon.socket());
+        EXPECT_EQ(closed.status, 4) << closed.err;
+    }
+}
+
+TEST(CtlPlugins, ACommandOfTwoPlugInsNeedsThePlugInsName) {
+    const adminhost::test::SampleRoot root;
+    const DaemonProcess daemon(
+        withPlugins({"tests/plugins/fixture_described.so", "lib/adminhost_lumio.so"}, {"--root", root.path()}));
+    const Result both = runIn(program, {"getCameras"}, daemon.socket());
+    EXPECT_EQ(both.status, 2);
+    EXPECT_THAT(both.err, HasSubstr("several plug-ins have a command getCameras; write described/getCameras"));
+    EXPECT_EQ(runIn(program, {"described/getCameras"}, daemon.socket()).out, "done\n");
+    EXPECT_THAT(runIn(program, {"lumio/getCameras"}, daemon.socket()).out, HasSubstr("cameras ("));
+}
+
+/// The service's own plug-in on a sample root.
+class CtlLumio : public testing::Test {
+  protected:
+    static void SetUpTestSuite() {
+        root = std::make_unique<adminhost::test::SampleRoot>();
+        daemon = std::make_unique<DaemonProcess>(withPlugins({"lib/adminhost_lumio.so"}, {"--root", root->path()}));
+    }
+    static void TearDownTestSuite() {
+        daemon.reset();
+        root.reset();
+    }
+    static Result run(const std::vector<std::string>& words) { return runIn(program, words, daemon->socket()); }
+
+    static std::unique_ptr<adminhost::test::SampleRoot> root;
+    static std::unique_ptr<DaemonProcess> daemon;
+};
+std::unique_ptr<adminhost::test::SampleRoot> CtlLumio::root;
+std::unique_ptr<DaemonProcess> CtlLumio::daemon;
+
+TEST_F(CtlLumio, CamerasAreListedWithTheNamesOfThePeople) {
+    const Result result = run({"camera", "list"});
+    EXPECT_EQ(result.status, 0) << result.err;
+    EXPECT_THAT(result.out, AllOf(testing::StartsWith("NAME "), HasSubstr(" (user)"), HasSubstr(" (group)"),
+                                  Not(HasSubstr("UUID"))));
+}
+
+TEST_F(CtlLumio, ACameraIsShownByNameAndByUuidInAnyCase) {
+    const std::string name = root->sql("select name from cameras where disabled != 't' limit 1");
+    const std::string uuid = root->sql("select lower(uuid) from cameras where disabled != 't' limit 1");
+    const auto line = [](const std::string& text) { return text.substr(0, text.find('\n')); };
+    const Result byName = run({"--format", "json", "camera", "show", line(name)});
+    EXPECT_EQ(byName.status, 0) << byName.err;
+    ASSERT_NE(byName.value().dictionary(), nullptr) << byName.out;
+    EXPECT_EQ(*byName.value().dictionary()->get("name").string(), line(name));
+    EXPECT_EQ(run({"--format", "json", "camera", "show", line(uuid)}).out, byName.out);
+    EXPECT_EQ(run({"camera", "show", "nobody's"}).status, 1);
+}
+
+TEST_F(CtlLumio, TheNamesForCompletionAreThoseOfTheList) {
+    const Value cameras = run({"--format", "json", "camera", "list"}).value();
+    std::string names;
+    for (const Value& camera : *cameras.array()) {
+        names += *camera.dictionary()->get("name").string() + '\n';
+    }
+    EXPECT_EQ(run({"camera", "list", "--names"}).out, names);
+}
+
+TEST_F(CtlLumio, AVariantNarrowsWhatIsRead) {
+    const Value cameras = run({"--format", "json", "readSettings", "optionalArguments.variant=getCameras"}).value();
+    EXPECT_NE(cameras.dictionary()->at("configuration.cameras").array(), nullptr);
+    EXPECT_TRUE(cameras.dictionary()->at("configuration.server_port").isNull());
+    EXPECT_THAT(run({"readSettings", "optionalArguments.variant=getConfig"}).out,
+                AllOf(HasSubstr("  server_port "), Not(HasSubstr("cameras ("))));
+}
+
+TEST_F(CtlLumio, ANameWithADoubleQuoteIsRefusedBeforeItReachesTheDatabase) {
+    const Result result =
+        run({"writeSettings", "configuration.properties.0._newid_=yes", "configuration.properties.0.name=a\"b"});
+    EXPECT_EQ(result.status, 1);
+    EXPECT_THAT(result.err, HasSubstr("configuration.properties.0.name: must not hold a double quote"));
+}
+
+}  // namespace

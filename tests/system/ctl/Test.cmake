@@ -1,0 +1,6 @@
+if(NOT TARGET fixture_described)
+    add_library(fixture_described MODULE ${CMAKE_SOURCE_DIR}/tests/support/fixtures/DescribedPlugin.cpp)
+    set_target_properties(fixture_described PROPERTIES PREFIX "" LIBRARY_OUTPUT_DIRECTORY ${CMAKE_BINARY_DIR}/tests/plugins)
+    target_link_libraries(fixture_described PRIVATE adminhost)
+endif()
+set(TEST_DEPENDS adminhostd adminhostctl adminhost_lumio fixture_described)
