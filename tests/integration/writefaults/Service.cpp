@@ -1,0 +1,141 @@
+#include "tests/integration/writefaults/Service.h"
+
+#include "handler/LumioRequestHandler.h"
+#include "platform/task/Task.h"
+#include "platform/value/Text.h"
+
+#include <algorithm>
+#include <csignal>
+#include <iostream>
+
+#include <linux/capability.h>
+#include <sys/resource.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+namespace lumio {
+
+namespace fs = std::filesystem;
+using adminhost::Dictionary;
+using adminhost::Value;
+
+namespace {
+
+constexpr std::string_view marker = "/var/lumio/server/.lumio_setup_done";
+const std::string scripts = "/usr/share/sorvaneproducer/lumioserverd/script/";
+
+/// Several pages, so that no file fits a single block.
+const std::string filling(20'000, 'x');
+
+Value writeNew() {
+    LumioRequestHandler handler;
+    const Dictionary configuration{
+        {"shared_filesystem", "/shared"},       {"member_uuid", "M"},  {"nimbo_client_username", "second"},
+        {"nimbo_controller", "second.example"}, {"server_port", 9000}, {"server_host", "new.example"}};
+    return handler.writeSettingsWithRequest(Dictionary{{"configuration", configuration}}).dictionary();
+}
+
+/// Files of mode 000 are closed to the superuser too from now on.
+void dropAccessPrivileges() {
+    __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+    std::array<__user_cap_data_struct, 2> data{};
+    ::syscall(SYS_capget, &header, data.data());
+    data[0].effective &= ~((1U << CAP_DAC_OVERRIDE) | (1U << CAP_DAC_READ_SEARCH));
+    ::syscall(SYS_capset, &header, data.data());
+}
+
+}  // namespace
+
+Service::Service() {
+    fs::create_directories(root.path(scripts));
+    for (const char* script : {"setup_lumioserverd_preferences", "setup_lumioserverd_library"}) {
+        fs::create_symlink("/bin/true", root.path(scripts + script));
+    }
+    makeOld();
+}
+
+void Service::makeWithoutFiles() const {
+    for (const std::string_view file : settingsFiles) {
+        fs::remove_all(root.path(file).parent_path());
+        fs::create_directories(root.path(file).parent_path());
+    }
+    fs::remove_all(root.path("/var/lumio"));
+    // Its owner can be set by the superuser alone; whoever runs the tests finds it made.
+    fs::create_directories(root.path("/var/lumio/server"));
+}
+
+void Service::makeOld() const {
+    makeWithoutFiles();
+    const std::string kept = "<key>kept</key><string>" + filling + "</string>";
+    root.writePropertyList(identityFile,
+                           "<key>shared_filesystem</key><string>/shared</string><key>member_uuid</key>"
+                           "<string>M</string>" +
+                               kept);
+    root.writePropertyList(clusterFile,
+                           "<key>nimbo_client_username</key><string>grid</string>"
+                           "<key>nimbo_controller</key><string>grid.example</string>" +
+                               kept);
+    root.writePropertyList(memberFile, "<key>server_port</key><integer>8170</integer>" + kept);
+}
+
+std::int32_t Service::writeThrough(std::vector<std::string> command, const std::vector<std::string>& options) {
+    command.insert(command.end(), {fs::read_symlink("/proc/self/exe"), "--write", root.path("").string()});
+    command.insert(command.end(), options.begin(), options.end());
+    const adminhost::DiskPath tool(command.front());
+    command.erase(command.begin());
+    // A traced process cannot look for leaks.
+    return adminhost::launch_task_with_input_and_environment(tool, command, std::nullopt, nullptr, &_said,
+                                                             {{"ASAN_OPTIONS", "detect_leaks=0"}});
+}
+
+bool Service::writeHere() const {
+    return writeNew().dictionary()->get("writeStatus") == Value(0);
+}
+
+Contents Service::contents() const {
+    Contents contents;
+    for (const std::string_view file : settingsFiles) {
+        if (fs::is_regular_file(root.path(file))) {
+            contents[file] = root.read(file);
+        }
+    }
+    return contents;
+}
+
+std::vector<std::string> Service::others() const {
+    std::vector<std::string> names;
+    for (const std::string_view file : {identityFile, clusterFile}) {
+        for (const auto& entry : fs::directory_iterator(root.path(file).parent_path())) {
+            const bool known = std::any_of(settingsFiles.begin(), settingsFiles.end(),
+                                           [&](std::string_view one) { return root.path(one) == entry.path(); });
+            if (!known) {
+                names.push_back(entry.path().filename());
+            }
+        }
+    }
+    return names;
+}
+
+bool Service::marked() const {
+    return fs::exists(root.path(marker));
+}
+
+int writeBetweenMarks(const std::vector<std::string>& arguments) {
+    adminhost::setSystemRoot(arguments.at(0));
+    if (arguments.size() > 1 && arguments[1] == "--without-access-privileges") {
+        dropAccessPrivileges();
+    } else if (arguments.size() > 1) {
+        // Bytes that a file may have: the write that reaches them is cut short, the next one fails.
+        const rlimit limit{std::stoul(arguments[1]), std::stoul(arguments[1])};
+        ::setrlimit(RLIMIT_FSIZE, &limit);
+        ::signal(SIGXFSZ, SIG_IGN);
+    }
+    (void)::access(beginMark, F_OK);
+    const Value answer = writeNew();
+    (void)::access(endMark, F_OK);
+    const Value& status = answer.dictionary()->get("writeStatus");
+    std::cerr << adminhost::textOf(answer.dictionary()->get("errorDescription")) << '\n';
+    return status == Value(0) ? written : status == Value(400) ? refused : otherStatus;
+}
+
+}  // namespace lumio

@@ -1,0 +1,2 @@
+set(TEST_LIBS lumio)
+set(TEST_TIMEOUT 900)
