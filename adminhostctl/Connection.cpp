@@ -57,19 +57,22 @@ Connection::Connection(Connection&&) noexcept = default;
 Connection& Connection::operator=(Connection&&) noexcept = default;
 
 HttpAnswer Connection::get(const std::string& path) {
-    return send(path, nullptr);
+    return send(path, nullptr, {});
 }
-HttpAnswer Connection::post(const std::string& path, const std::string& body) {
-    return send(path, &body);
+HttpAnswer Connection::post(const std::string& path, const std::string& body, const std::string& revision) {
+    return send(path, &body, revision);
 }
 
-HttpAnswer Connection::send(const std::string& path, const std::string* body) {
+HttpAnswer Connection::send(const std::string& path, const std::string* body, const std::string& revision) {
     HttpAnswer answer;
     const std::string address = "http://localhost" + path;
     // Without an empty Expect header, larger bodies would wait for a permission that the daemon need not give.
     HeaderList headers(curl_slist_append(nullptr, "Content-Type: application/json"));
     curl_slist_append(headers.get(), "Expect:");
     curl_slist_append(headers.get(), "Accept: application/json");
+    if (!revision.empty()) {
+        curl_slist_append(headers.get(), ("If-Match: " + revision).c_str());
+    }
 
     curl_easy_reset(_handle->get());
     _handle->set(CURLOPT_UNIX_SOCKET_PATH, _socketPath.c_str());
@@ -101,6 +104,9 @@ HttpAnswer Connection::send(const std::string& path, const std::string* body) {
     curl_header* header = nullptr;
     if (curl_easy_header(_handle->get(), "Request-Id", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
         answer.requestId = header->value;
+    }
+    if (curl_easy_header(_handle->get(), "ETag", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
+        answer.revision = header->value;
     }
     return answer;
 }

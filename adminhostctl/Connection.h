@@ -11,6 +11,7 @@ struct HttpAnswer {
     long status = 0;
     std::string body;
     std::string requestId;  ///< the daemon's name for the request; empty if it gave none
+    std::string revision;   ///< of what was read, as the ETag header gives it; empty if it gave none
 };
 
 /// One connection, kept open between requests. Throws Failure when the daemon cannot be reached (notReachable) or the
@@ -25,15 +26,15 @@ class Connection {
 
     /// The path is the address below "http://host", each of its segments already escaped.
     [[nodiscard]] HttpAnswer get(const std::string& path);
-    /// The body is JSON.
-    [[nodiscard]] HttpAnswer post(const std::string& path, const std::string& body);
+    /// The body is JSON. With a revision, the daemon refuses the request (412) unless it still is the current one.
+    [[nodiscard]] HttpAnswer post(const std::string& path, const std::string& body, const std::string& revision = {});
 
     /// Escapes one segment of a path.
     [[nodiscard]] static std::string escaped(const std::string& segment);
 
   private:
     class Handle;
-    [[nodiscard]] HttpAnswer send(const std::string& path, const std::string* body);
+    [[nodiscard]] HttpAnswer send(const std::string& path, const std::string* body, const std::string& revision);
 
     std::string _socketPath;
     std::unique_ptr<Handle> _handle;

@@ -56,6 +56,11 @@ int runMain(int count, char** words) {
     app.add_option("--file", options.file, "The request, as JSON or property list; - is standard input")
         ->type_name("FILE");
     app.add_flag("--names", options.names, "Only names, one a line");
+    app.add_flag("--group", options.group, "With camera allow and camera deny: the names are groups'");
+    bool protect = false;
+    bool noProtect = false;
+    CLI::Option* const on = app.add_flag("--protect", protect, "With property set: store the value encrypted");
+    app.add_flag("--no-protect", noProtect, "With property set: store the value as it is")->excludes(on);
     app.add_option("words", rest, "A verb or a command, and its arguments: KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-")
         ->required()
         ->type_name("WORD");
@@ -66,6 +71,7 @@ int runMain(int count, char** words) {
     }
     options.format = format == "json" ? Format::json : format == "plist" ? Format::plist : Format::text;
     options.width = outputWidth();
+    options.isProtected = protect ? std::optional(true) : noProtect ? std::optional(false) : std::nullopt;
     try {
         adminhost::ctl::Service service(socket);
         const adminhost::ctl::Sources sources{&adminhost::ctl::readSource, &adminhost::ctl::askSecret,

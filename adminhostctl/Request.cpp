@@ -270,6 +270,19 @@ Value valueOfText(const KeyDescription& key, const std::string& text) {
     return std::move(*value);
 }
 
+Value valueOfWord(const KeyDescription& key, const std::optional<std::string>& word, const Sources& sources) {
+    if (word && word->starts_with('@')) {
+        return valueOfFile(key, word->substr(1), sources);
+    }
+    if (key.secret && word) {
+        throw usageError(key.path + " is secret and others can read command lines: write @FILE, or @- to be asked");
+    }
+    if (!word && !(key.secret && sources.terminal)) {
+        throw usageError(key.path + " needs a value: " + (key.secret ? "@FILE or @-" : "TEXT, @FILE or @-"));
+    }
+    return word ? valueOfText(key, *word) : Value(sources.ask(key.path));
+}
+
 Dictionary parseRequest(std::string_view bytes, const std::string& from) {
     Value value = parseStructure(bytes, from);
     Dictionary* dictionary = value.dictionary();

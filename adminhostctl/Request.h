@@ -6,6 +6,7 @@
 #include "platform/value/Value.h"
 
 #include <functional>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -32,6 +33,11 @@ struct Sources {
 
 /// The dictionary of a whole request: JSON, or an XML property list. Throws Failure(usage) with line and column.
 [[nodiscard]] Dictionary parseRequest(std::string_view bytes, const std::string& from);
+
+/// The value of a word for a key: a text, "@FILE" or "@-". A secret stands on no command line: with no word, or "@-" at
+/// a terminal, it is asked for. Throws Failure(usage) as buildRequest does.
+[[nodiscard]] Value valueOfWord(const KeyDescription& key, const std::optional<std::string>& word,
+                                const Sources& sources);
 
 /// The value of a text for a key; throws Failure(usage) when it does not fit.
 [[nodiscard]] Value valueOfText(const KeyDescription& key, const std::string& text);

@@ -34,15 +34,10 @@ std::string findingsText(const Value& findings) {
     return text;
 }
 
-std::string logText(const std::optional<Value>& record) {
-    const Dictionary* dictionary = record ? record->dictionary() : nullptr;
-    const Array* lines = dictionary != nullptr ? dictionary->get("log").array() : nullptr;
-    std::string text;
-    if (lines != nullptr && !lines->empty()) {
-        text = "\nlog lines of the request:";
-        for (const Value& line : *lines) {
-            text += "\n  " + shown(textOf(line));
-        }
+std::string logText(const std::vector<std::string>& lines) {
+    std::string text = lines.empty() ? "" : "\nlog lines of the request:";
+    for (const std::string& line : lines) {
+        text += "\n  " + shown(line);
     }
     return text;
 }
@@ -92,10 +87,7 @@ void Service::fail(const HttpAnswer& answer) {
     message = message.empty() ? code : message + (code.empty() ? "" : " (" + code + ")");
     message += findingsText(said->get("findings"));
     if (answer.status == statusInternal && !answer.requestId.empty()) {
-        const HttpAnswer record = _connection.get("/v1/requests/" + Connection::escaped(answer.requestId));
-        if (record.status == statusOk) {
-            message += logText(parseJson(record.body));
-        }
+        message += logText(logLines(answer.requestId));
     }
     throw Failure(status, message);
 }
@@ -157,12 +149,12 @@ CommandRef Service::command(const std::string& name) {
     throw usageError("several plug-ins have a command " + wanted + "; write " + found.front().plugin + '/' + wanted);
 }
 
-std::optional<Value> Service::perform(const CommandRef& command, const Dictionary& request) {
+Answer Service::ask(const CommandRef& command, const Dictionary& request, const std::string& revision) {
     const HttpAnswer answer = _connection.post(
         "/v1/" + Connection::escaped(command.plugin) + '/' + Connection::escaped(command.description.name()),
-        jsonOf(request));
+        jsonOf(request), revision);
     if (answer.status == statusNoContent) {
-        return std::nullopt;
+        return {std::nullopt, answer.requestId, answer.revision};
     }
     if (answer.status != statusOk) {
         fail(answer);
@@ -172,7 +164,19 @@ std::optional<Value> Service::perform(const CommandRef& command, const Dictionar
     if (!value) {
         throw Failure(ExitStatus::answeredError, "the answer cannot be read: " + textOf(error));
     }
-    return value;
+    return {std::move(value), answer.requestId, answer.revision};
+}
+
+std::vector<std::string> Service::logLines(const std::string& requestId) {
+    const HttpAnswer answer = _connection.get("/v1/requests/" + Connection::escaped(requestId));
+    const auto record = answer.status == statusOk ? parseJson(answer.body) : std::nullopt;
+    const Dictionary* dictionary = record ? record->dictionary() : nullptr;
+    const Array* log = dictionary != nullptr ? dictionary->get("log").array() : nullptr;
+    std::vector<std::string> lines;
+    for (const Value& line : log != nullptr ? *log : Array{}) {
+        lines.push_back(textOf(line));
+    }
+    return lines;
 }
 
 std::string errorOf(const Description& command, const Dictionary& answer) {

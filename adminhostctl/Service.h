@@ -24,6 +24,13 @@ struct CommandRef {
     Description description;
 };
 
+/// What a command answered, and the request that it answered to.
+struct Answer {
+    std::optional<Value> value;  ///< nothing for an answer of nothing
+    std::string requestId;
+    std::string revision;  ///< of what was read; empty where the command has none
+};
+
 class Service {
   public:
     explicit Service(std::string socketPath) : _connection(std::move(socketPath)) {}
@@ -37,7 +44,14 @@ class Service {
     [[nodiscard]] CommandRef command(const std::string& name);
     /// The answer; nothing for an answer of nothing. Throws Failure with the daemon's message, its findings and, after
     /// a failure inside the service, the log lines of the request.
-    [[nodiscard]] std::optional<Value> perform(const CommandRef& command, const Dictionary& request);
+    [[nodiscard]] std::optional<Value> perform(const CommandRef& command, const Dictionary& request) {
+        return ask(command, request).value;
+    }
+    /// The same, with the request's name and revision. A request that gives a revision fails unless it is still
+    /// current.
+    [[nodiscard]] Answer ask(const CommandRef& command, const Dictionary& request, const std::string& revision = {});
+    /// What was logged while the request was performed; empty when the daemon does not know it any more.
+    [[nodiscard]] std::vector<std::string> logLines(const std::string& requestId);
 
     /// What an address of the daemon answers. Throws as perform().
     [[nodiscard]] Value get(const std::string& path);

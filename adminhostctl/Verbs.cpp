@@ -1,5 +1,6 @@
 #include "adminhostctl/Verbs.h"
 
+#include "adminhostctl/ChangeVerbs.h"
 #include "adminhostctl/HistoryVerbs.h"
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Table.h"
@@ -17,27 +18,6 @@ namespace {
 
 using Words = std::span<const std::string>;
 
-/// Writes a value in the asked format; as text, it stands at the path of the command's answer.
-void write(const Context& context, const Value& value, const Description& description, const std::string& path = {}) {
-    switch (context.options.format) {
-        case Format::text:
-            context.out << Reading(description, context.options.width).text(value, path);
-            break;
-        case Format::json:
-            context.out << jsonOf(value, true) << '\n';
-            break;
-        case Format::plist: {
-            Error error;
-            const auto text = xmlPropertyList(value, &error);
-            if (!text) {
-                throw Failure(ExitStatus::answeredError, "a property list cannot carry the answer: " + textOf(error));
-            }
-            context.out << *text;
-            break;
-        }
-    }
-}
-
 ExitStatus say(const Context& context, const std::string& error) {
     if (error.empty()) {
         return ExitStatus::done;
@@ -49,7 +29,7 @@ ExitStatus say(const Context& context, const std::string& error) {
 // The daemon itself
 
 ExitStatus status(const Context& context, Words) {
-    write(context, context.service.overview(), Description());
+    writeValue(context, context.service.overview(), Description());
     return ExitStatus::done;
 }
 
@@ -65,7 +45,7 @@ ExitStatus commands(const Context& context, Words) {
         }
     }
     if (!context.options.names) {
-        write(context, all, Description());
+        writeValue(context, all, Description());
     }
     return ExitStatus::done;
 }
@@ -162,7 +142,7 @@ ExitStatus list(const Context& context, const std::string& name, const std::stri
         return ExitStatus::answeredError;
     }
     if (!context.options.names) {
-        write(context, all, command.description, key);
+        writeValue(context, all, command.description, key);
         return ExitStatus::done;
     }
     for (const Value& element : *all.array()) {
@@ -207,7 +187,7 @@ ExitStatus show(const Context& context, const std::string& name, const std::stri
         }
         throw usageError("several have the name " + shown(wanted) + "; give one of their UUIDs:" + uuids);
     }
-    write(context, named.front(), command.description, key + "[]");
+    writeValue(context, named.front(), command.description, key + "[]");
     return ExitStatus::done;
 }
 
@@ -227,10 +207,19 @@ constexpr std::array verbTable = {
     Verb{"help", "[COMMAND]", "The verbs, or a command's keys and answer", 0, 1, &help},
     Verb{"camera list", "[--names]", "The cameras and who may use them", 0, 0, &cameraList},
     Verb{"camera show", "NAME|UUID", "Everything about one camera", 1, 1, &cameraShow},
+    Verb{"camera allow", "CAMERA NAME... [--group]", "Let users, or groups, use a camera", 2, 1000, &cameraAllow},
+    Verb{"camera deny", "CAMERA NAME... [--group]", "Take users and groups from a camera's list", 2, 1000, &cameraDeny},
+    Verb{"camera access", "CAMERA on|off", "Whether only those of its list may use a camera", 2, 2, &cameraAccess},
+    Verb{"camera remove", "CAMERA", "Remove a camera from the service", 1, 1, &cameraRemove},
     Verb{"whois", "NAME|UUID", "Who has this name or UUID, and which directory knows it", 1, 1, &whois},
     Verb{"history", "", "The latest writes of settings: when, who and what changed", 0, 0, &history},
     Verb{"rollback", "NUMBER", "Restores the settings as they were before a write of the history", 1, 1, &rollback},
     Verb{"property list", "[--names]", "The workflow properties", 0, 0, &propertyList},
+    Verb{"property set", "NAME [VALUE|@FILE|@-] [--protect|--no-protect]", "Add or change a property", 1, 2,
+         &propertySet},
+    Verb{"property remove", "NAME", "Remove a property", 1, 1, &propertyRemove},
+    Verb{"settings get", "[KEY]", "The settings, or one of them", 0, 1, &settingsGet},
+    Verb{"settings set", "KEY [VALUE|@FILE|@-]", "Change a setting", 1, 2, &settingsSet},
 };
 
 ExitStatus perform(const Context& context, Words words) {
@@ -246,7 +235,7 @@ ExitStatus perform(const Context& context, Words words) {
         context.out << (context.options.format == Format::text ? "done\n" : "");
         return ExitStatus::done;
     }
-    write(context, *answer, command.description);
+    writeValue(context, *answer, command.description);
     return say(context, answer->dictionary() != nullptr ? errorOf(command.description, *answer->dictionary()) : "");
 }
 
@@ -259,6 +248,26 @@ std::vector<std::string> splitWords(std::string_view words) {
 }
 
 }  // namespace
+
+void writeValue(const Context& context, const Value& value, const Description& description, const std::string& path) {
+    switch (context.options.format) {
+        case Format::text:
+            context.out << Reading(description, context.options.width).text(value, path);
+            break;
+        case Format::json:
+            context.out << jsonOf(value, true) << '\n';
+            break;
+        case Format::plist: {
+            Error error;
+            const auto text = xmlPropertyList(value, &error);
+            if (!text) {
+                throw Failure(ExitStatus::answeredError, "a property list cannot carry the answer: " + textOf(error));
+            }
+            context.out << *text;
+            break;
+        }
+    }
+}
 
 std::span<const Verb> verbs() noexcept {
     return verbTable;

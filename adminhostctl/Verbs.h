@@ -7,6 +7,7 @@
 #include "adminhostctl/Service.h"
 
 #include <cstddef>
+#include <optional>
 #include <ostream>
 #include <span>
 #include <string>
@@ -19,9 +20,12 @@ enum class Format { text, json, plist };
 
 struct Options {
     Format format = Format::text;
-    std::string file;        ///< of the whole request; empty for none
-    bool names = false;      ///< only names, one a line, for completion
-    std::size_t width = 80;  ///< columns of the terminal
+    std::string file;                 ///< of the whole request; empty for none
+    std::string passwordFile;         ///< of the grid password; empty for none
+    bool names = false;               ///< only names, one a line, for completion
+    bool group = false;               ///< short names are groups'
+    std::optional<bool> isProtected;  ///< whether a property is to be protected
+    std::size_t width = 80;           ///< columns of the terminal
 };
 
 /// What a verb works with.
@@ -43,6 +47,10 @@ struct Verb {
 };
 
 [[nodiscard]] std::span<const Verb> verbs() noexcept;
+
+/// Writes a value in the asked format; as text, it stands at the path of the command's answer. Throws Failure.
+void writeValue(const Context& context, const Value& value, const Description& description,
+                const std::string& path = {});
 
 /// Runs the verb, or the command, that the words begin with. Throws Failure.
 [[nodiscard]] ExitStatus run(const Context& context, const std::vector<std::string>& words);

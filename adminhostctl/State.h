@@ -1,0 +1,51 @@
+#pragma once
+
+// The configuration as the service answers it, in the form that changes are derived from.
+
+#include "platform/value/Value.h"
+
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace adminhost::ctl {
+
+/// An entry of an access list that the directory knows.
+struct Person {
+    std::string kind;  ///< "user" or "group"
+    std::string shortName;
+    std::string id;  ///< UUID
+};
+
+struct Camera {
+    std::string uuid;
+    std::string name;
+    bool restricted = false;  ///< only the people of the list may use it
+    std::vector<Person> allowed;
+};
+
+struct Property {
+    std::string id;  ///< row number
+    std::string name;
+    std::optional<std::string> value;  ///< nothing for a protected one
+    bool isProtected = false;
+};
+
+struct State {
+    Dictionary settings;  ///< all but the lists, also what is derived and cannot be written
+    /// In the service's order. Nothing when the service answered no list: its database cannot be read.
+    std::optional<std::vector<Property>> properties;
+    std::optional<std::vector<Camera>> cameras;
+};
+
+/// Elements without identity are left out; what has an unexpected type counts as missing.
+[[nodiscard]] State stateOf(const Dictionary& configuration);
+
+/// The camera with the UUID (in any case) or, if there is none, with the name; null if there is none of the name.
+/// Throws Failure: several have the name (usage), cameras are not listed (answeredError).
+[[nodiscard]] const Camera* findCamera(const State& state, const std::string& nameOrUuid);
+
+/// Null if there is none. Throws Failure: several have the name (usage), properties are not listed (answeredError).
+[[nodiscard]] const Property* findProperty(const State& state, const std::string& name);
+
+}  // namespace adminhost::ctl

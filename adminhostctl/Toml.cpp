@@ -1,0 +1,74 @@
+#include "adminhostctl/Toml.h"
+
+#include "adminhostctl/Width.h"
+
+#include <algorithm>
+#include <cmath>
+
+#include <fmt/chrono.h>
+#include <fmt/format.h>
+
+namespace adminhost::ctl {
+
+std::string tomlText(std::string_view text) {
+    std::string quoted = "\"";
+    for (std::size_t at = 0; at < text.size();) {
+        const auto byte = static_cast<unsigned char>(text[at]);
+        if (byte == '"' || byte == '\\') {
+            quoted += {'\\', text[at]};
+        } else if (byte == '\n') {
+            quoted += "\\n";
+        } else if (byte == '\t') {
+            quoted += "\\t";
+        } else if (byte < 0x20 || byte == 0x7F) {
+            quoted += fmt::format("\\u{:04X}", byte);
+        } else if (byte >= 0xC0) {
+            // A whole character: what a terminal would act on (C1 controls, changes of direction) is written by number.
+            const std::size_t length = byte < 0xE0 ? 2 : byte < 0xF0 ? 3 : 4;
+            const std::string_view character = text.substr(at, length);
+            if (shown(character) == character) {
+                quoted += character;
+            } else {
+                std::uint32_t number = byte & (0xFFU >> (length + 1));
+                for (const char next : character.substr(1)) {
+                    number = (number << 6U) | (static_cast<unsigned char>(next) & 0x3FU);
+                }
+                quoted += fmt::format("\\U{:08X}", number);
+            }
+            at += length - 1;
+        } else {
+            quoted += text[at];
+        }
+        ++at;
+    }
+    return quoted + '"';
+}
+
+std::string tomlKey(std::string_view key) {
+    const bool bare = !key.empty() && std::all_of(key.begin(), key.end(), [](char c) {
+        return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '_' || c == '-';
+    });
+    return bare ? std::string(key) : tomlText(key);
+}
+
+std::optional<std::string> tomlValue(const Value& value) {
+    if (const std::string* text = value.string()) {
+        return tomlText(*text);
+    }
+    if (const auto boolean = value.boolean()) {
+        return *boolean ? "true" : "false";
+    }
+    if (const auto integer = value.integer()) {
+        return fmt::format("{}", *integer);
+    }
+    if (const auto real = value.real()) {
+        const std::string text = fmt::format("{}", *real);
+        return std::isfinite(*real) && text.find_first_of(".e") == std::string::npos ? text + ".0" : text;
+    }
+    if (const auto date = value.date()) {
+        return fmt::format("{:%Y-%m-%dT%H:%M:%SZ}", fmt::gmtime(std::chrono::system_clock::to_time_t(*date)));
+    }
+    return std::nullopt;
+}
+
+}  // namespace adminhost::ctl
