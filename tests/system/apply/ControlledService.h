@@ -1,0 +1,47 @@
+#pragma once
+
+// The sample service with this build's daemon and plug-in, asked through this build's command line.
+
+#include "tests/support/DaemonProcess.h"
+#include "tests/support/Program.h"
+#include "tests/support/SampleRoot.h"
+
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace adminhost::test {
+
+class ControlledService : public testing::Test {
+  protected:
+    [[nodiscard]] DaemonProcess::Options options() const {
+        DaemonProcess::Options options;
+        options.arguments = {"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"};
+        return options;
+    }
+    /// Output and messages together.
+    [[nodiscard]] ProgramResult ctl(std::vector<std::string> words) const {
+        words.insert(words.begin(), {std::string(BINARY_DIR) + "/bin/adminhostctl", "--socket", daemon.socket()});
+        return runProgram(words, Errors::merge);
+    }
+    /// A file of the test's own; answers its path.
+    [[nodiscard]] std::string file(const std::string& name, const std::string& content) const {
+        const std::string path = root.directory() + '/' + name;
+        std::ofstream(path) << content;
+        return path;
+    }
+    [[nodiscard]] static std::string read(const std::string& path) {
+        std::ostringstream content;
+        content << std::ifstream(path).rdbuf();
+        return content.str();
+    }
+
+    const SampleRoot root;
+    const DaemonProcess daemon{options()};
+};
+
+}  // namespace adminhost::test
