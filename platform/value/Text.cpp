@@ -87,7 +87,9 @@ void appendText(std::string& text, const Value& value, std::size_t indent) {
     }
 }
 
-bool isBlank(char c) noexcept { return c == ' ' || c == '\t'; }
+bool isBlank(char c) noexcept {
+    return c == ' ' || c == '\t';
+}
 
 bool truthOf(const Value& value, bool skipZeros) noexcept {
     if (const auto boolean = value.boolean()) {
@@ -111,6 +113,23 @@ bool truthOf(const Value& value, bool skipZeros) noexcept {
         ++at;
     }
     return at < text->size() && std::strchr("YyTt123456789", (*text)[at]) != nullptr && (*text)[at] != '\0';
+}
+
+/// A daemon lives on while its machine's zone is changed; once a second is soon enough to notice.
+void refreshZone() {
+    using Clock = std::chrono::steady_clock;
+    static std::optional<Clock::time_point> last;
+    const Clock::time_point now = Clock::now();
+    if (!last || now - *last >= std::chrono::seconds(1)) {
+        ::tzset();
+        last = now;
+    }
+}
+
+/// Seconds east of Greenwich.
+long zoneOffsetAt(std::time_t moment) {
+    std::tm parts{};
+    return ::localtime_r(&moment, &parts) == nullptr ? 0 : parts.tm_gmtoff;
 }
 
 /// Length of the well-formed UTF-8 sequence at the beginning of the text, 0 if there is none (RFC 3629, section 4).
@@ -147,7 +166,9 @@ std::string textOf(const Value& value) {
     return text;
 }
 
-std::string textOf(const std::optional<std::string>& text) { return text ? *text : std::string(nullText); }
+std::string textOf(const std::optional<std::string>& text) {
+    return text ? *text : std::string(nullText);
+}
 
 std::string textOf(const Error& error) {
     std::string text = fmt::format("{} ({})", error.domain, error.code);
@@ -157,10 +178,16 @@ std::string textOf(const Error& error) {
     return text;
 }
 
-std::string textOf(const std::optional<Error>& error) { return error ? textOf(*error) : std::string(nullText); }
+std::string textOf(const std::optional<Error>& error) {
+    return error ? textOf(*error) : std::string(nullText);
+}
 
-bool booleanOf(const Value& value) noexcept { return truthOf(value, false); }
-bool flagOf(const Value& value) noexcept { return truthOf(value, true); }
+bool booleanOf(const Value& value) noexcept {
+    return truthOf(value, false);
+}
+bool flagOf(const Value& value) noexcept {
+    return truthOf(value, true);
+}
 
 std::optional<Date> localDateOf(std::string_view text) {
     const std::string whole(text);
@@ -176,9 +203,17 @@ std::optional<Date> localDateOf(std::string_view text) {
     if (!day.ok() || parts.tm_sec > 59) {
         return std::nullopt;
     }
+    // mktime looks at the zone file on every call, which for a long list of dates costs more than all the rest. Away
+    // from a change of the clocks the offset of the day before is the date's own.
+    refreshZone();
+    std::tm utc = parts;
+    const std::time_t asUtc = ::timegm(&utc);
+    const long offset = zoneOffsetAt(asUtc - 86400);
+    if (offset == zoneOffsetAt(asUtc + 86400)) {
+        return Date(std::chrono::seconds(asUtc - offset));
+    }
     parts.tm_isdst = -1;
-    const std::time_t seconds = ::mktime(&parts);
-    return Date(std::chrono::seconds(seconds));
+    return Date(std::chrono::seconds(::mktime(&parts)));
 }
 
 std::string localTextOf(Date date) {

@@ -87,6 +87,9 @@ void Dictionary::set(std::string_view key, Value value) {
         _entries[index].value = std::move(value);
         return;
     }
+    if (_entries.empty()) {
+        _entries.reserve(8);  // most dictionaries have several entries, and moving them costs more than room for them
+    }
     _entries.push_back({std::string(key), std::move(value)});
     if (_entries.size() == linearLimit + 1) {
         rebuildIndex();
