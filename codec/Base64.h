@@ -7,6 +7,8 @@
 
 #include <array>
 #include <cstddef>
+#include <exception>
+#include <utility>
 
 namespace lumio {
 
@@ -33,19 +35,44 @@ class ByteBuffer {
     };
 
     explicit ByteBuffer(std::size_t capacity) : ByteBuffer(capacity, Growth{}) {}
-    ByteBuffer(std::size_t capacity, Growth growth);
+    ByteBuffer(std::size_t capacity, Growth growth) : _growth(growth) { reserveBytes(_bytes, capacity); }
 
-    void append(std::uint8_t byte) noexcept;
+    void append(std::uint8_t byte) noexcept {
+        if (_bytes.size() == _bytes.capacity() && !grow()) {
+            drop();
+            return;
+        }
+        _bytes.push_back(byte);
+    }
+
     /// Lengthens the bytes, growing just as that many single bytes would; the caller fills them. Null, and nothing
     /// appended, when there is no room for all.
-    [[nodiscard]] std::uint8_t* extend(std::size_t length) noexcept;
+    [[nodiscard]] std::uint8_t* extend(std::size_t length) noexcept {
+        while (_bytes.capacity() - _bytes.size() < length) {
+            if (!grow()) {
+                return nullptr;
+            }
+        }
+        const std::size_t used = _bytes.size();
+        _bytes.resize(used + length);
+        return _bytes.data() + used;
+    }
+
     /// Hands the bytes over, without a copy.
     [[nodiscard]] adminhost::Data take() && noexcept { return std::move(_bytes); }
 
-    static bool reserveBytes(adminhost::Data& bytes, std::size_t capacity) noexcept;
+    static bool reserveBytes(adminhost::Data& bytes, std::size_t capacity) noexcept {
+        try {
+            bytes.reserve(capacity);
+            return true;
+        } catch (const std::exception&) {
+            return false;  // no memory, or more than a vector can hold
+        }
+    }
 
   private:
     [[nodiscard]] bool grow() noexcept;
+    void drop() noexcept;
 
     adminhost::Data _bytes;
     Growth _growth;

@@ -21,7 +21,7 @@ adminhost::Data LumioUtilities_encodeBase64WithoutLineBreaks(Bytes data) {
 
 std::string base64EncodedString(Bytes data) {
     const adminhost::Data text = LumioUtilities_encodeBase64(data);
-    return {text.begin(), text.end()};
+    return {reinterpret_cast<const char*>(text.data()), text.size()};
 }
 
 adminhost::Data base64DecodedData(std::string_view text) {

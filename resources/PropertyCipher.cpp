@@ -76,7 +76,7 @@ std::optional<std::string> Property::cryptedValue(const Value& value, bool encry
         return base64EncodedString(*converted);
     }
     const ScopedCleanse wipePlain(*converted);
-    std::string plain(converted->begin(), converted->end());
+    std::string plain(reinterpret_cast<const char*>(converted->data()), converted->size());
     if (!adminhost::isUtf8(plain)) {
         adminhost::cleanse(plain.data(), plain.size());
         return std::nullopt;

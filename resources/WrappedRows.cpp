@@ -22,6 +22,10 @@ bool isPiece(const std::string& key, const std::string& line) {
     return line == key || line.ends_with(" " + key);
 }
 
+bool hasColumnsOnly(const Dictionary& record) {
+    return std::all_of(record.begin(), record.end(), [](const DictionaryEntry& entry) { return isColumn(entry.key); });
+}
+
 /// One row being put together from its records.
 class Row {
   public:
@@ -84,10 +88,18 @@ std::vector<Dictionary> wholePropertyRows(std::vector<Dictionary> records) {
     }
     std::vector<Dictionary> rows;
     const std::string firstColumn = records.front().begin()->key;
+    const auto beginsRow = [&](std::size_t i) {
+        return i == records.size() || (!records[i].empty() && records[i].begin()->key == firstColumn);
+    };
+    rows.reserve(records.size());
     for (std::size_t i = 0; i < records.size();) {
+        if (beginsRow(i + 1) && hasColumnsOnly(records[i])) {
+            rows.push_back(std::move(records[i++]));
+            continue;
+        }
         Row row;
         row.add(records[i]);
-        for (++i; i < records.size() && (records[i].empty() || records[i].begin()->key != firstColumn); ++i) {
+        for (++i; !beginsRow(i); ++i) {
             // A piece at the beginning of the record goes on with the text behind the empty line.
             row.addEmptyLine();
             row.add(records[i]);
