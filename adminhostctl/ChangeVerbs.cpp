@@ -1,11 +1,13 @@
 #include "adminhostctl/ChangeVerbs.h"
 
+#include "adminhostctl/DesiredFile.h"
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Toml.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/Writing.h"
 
 #include <algorithm>
+#include <fstream>
 
 namespace adminhost::ctl {
 namespace {
@@ -21,6 +23,19 @@ std::optional<std::string> second(Words arguments) {
 std::string textOfWord(const KeyDescription& key, const std::optional<std::string>& word, const Sources& sources) {
     const Value value = valueOfWord(key, word, sources);
     return value.string() != nullptr ? *value.string() : std::string();
+}
+
+/// What the file, and the password file, ask for.
+Wanted wantedOf(const Context& context, const std::string& file, const State& state) {
+    const CommandRef command = context.service.command("writeSettings");
+    Wanted wanted = parseDesired(context.sources.read(file), file, command.description, state);
+    if (!context.options.passwordFile.empty()) {
+        KeyDescription key;
+        key.path = passwordKey;
+        key.secret = true;
+        wanted.password = textOfWord(key, '@' + context.options.passwordFile, context.sources);
+    }
+    return wanted;
 }
 
 ExitStatus changeCamera(const Context& context, WantedCamera camera) {
@@ -127,6 +142,39 @@ ExitStatus cameraAccess(const Context& context, Words arguments) {
 
 ExitStatus cameraRemove(const Context& context, Words arguments) {
     return changeCamera(context, {arguments.front(), {}, {}, {}, {}, true});
+}
+
+ExitStatus exportState(const Context& context, Words arguments) {
+    const CommandRef command = context.service.command("writeSettings");
+    const std::string text = exportOf(readState(context).state, command.description);
+    if (arguments.empty() || arguments.front() == "-") {
+        context.out << text;
+        return ExitStatus::done;
+    }
+    std::ofstream file(arguments.front(), std::ios::binary | std::ios::trunc);
+    file << text;
+    file.close();
+    if (!file) {
+        throw usageError(arguments.front() + " cannot be written");
+    }
+    return ExitStatus::done;
+}
+
+ExitStatus planFile(const Context& context, Words arguments) {
+    const State state = readState(context).state;
+    const Wanted wanted = wantedOf(context, arguments.front(), state);
+    Plan plan = planOf(wanted, state);
+    if (!wanted.password) {
+        plan.notes.emplace_back(
+            "settings.nimbo_client_password: unknown, it is compared with nothing unless --password-file gives it");
+    }
+    showPlan(context, plan);
+    return ExitStatus::done;
+}
+
+ExitStatus applyFile(const Context& context, Words arguments) {
+    const CurrentState current = readState(context);
+    return carryOut(context, wantedOf(context, arguments.front(), current.state), current);
 }
 
 }  // namespace adminhost::ctl

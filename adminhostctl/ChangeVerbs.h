@@ -17,5 +17,8 @@ namespace adminhost::ctl {
 [[nodiscard]] ExitStatus cameraDeny(const Context& context, std::span<const std::string> arguments);
 [[nodiscard]] ExitStatus cameraAccess(const Context& context, std::span<const std::string> arguments);
 [[nodiscard]] ExitStatus cameraRemove(const Context& context, std::span<const std::string> arguments);
+[[nodiscard]] ExitStatus exportState(const Context& context, std::span<const std::string> arguments);
+[[nodiscard]] ExitStatus planFile(const Context& context, std::span<const std::string> arguments);
+[[nodiscard]] ExitStatus applyFile(const Context& context, std::span<const std::string> arguments);
 
 }  // namespace adminhost::ctl

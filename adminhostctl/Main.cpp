@@ -57,6 +57,9 @@ int runMain(int count, char** words) {
         ->type_name("FILE");
     app.add_flag("--names", options.names, "Only names, one a line");
     app.add_flag("--group", options.group, "With camera allow and camera deny: the names are groups'");
+    app.add_option("--password-file", options.passwordFile,
+                   "With plan and apply: the grid account's password; - asks, or reads standard input")
+        ->type_name("FILE");
     bool protect = false;
     bool noProtect = false;
     CLI::Option* const on = app.add_flag("--protect", protect, "With property set: store the value encrypted");
