@@ -1,10 +1,10 @@
 #include "adminhostd/Daemon.h"
 
-#include "adminhostd/DatabaseTool.h"
 #include "adminhostd/Front.h"
 #include "adminhostd/ListeningSocket.h"
 #include "adminhostd/Notify.h"
 #include "adminhostd/Places.h"
+#include "adminhostd/ToolConfiguration.h"
 #include "platform/log/Log.h"
 
 #include <algorithm>
@@ -28,7 +28,7 @@ FileDescriptor stopSignals() {
     ::sigaddset(&signals, SIGTERM);
     ::sigaddset(&signals, SIGINT);
     ::sigprocmask(SIG_BLOCK, &signals, nullptr);
-    std::signal(SIGPIPE, SIG_IGN);
+    static_cast<void>(std::signal(SIGPIPE, SIG_IGN));
     return FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
 }
 

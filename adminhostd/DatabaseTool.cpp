@@ -3,24 +3,10 @@
 #include "platform/files/Path.h"
 #include "platform/task/Task.h"
 
-#include <cerrno>
-#include <cstdlib>
-#include <filesystem>
-#include <fstream>
-#include <system_error>
-
 #include <fmt/format.h>
-#include <sys/stat.h>
 
 namespace adminhost {
 namespace {
-
-// The answers of the settings themselves must not end up among the rows.
-constexpr const char* startFile =
-    ".output /dev/null\n"
-    ".dbconfig dqs_dml on\n"
-    ".dbconfig dqs_ddl on\n"
-    ".output\n";
 
 constexpr const char* statement =
     "select 'x = y' as a, \"quoted text\" as longername, null as c where 'quoted text' = \"quoted text\" "
@@ -35,30 +21,6 @@ constexpr const char* expected =
     "         c = \n";
 
 }  // namespace
-
-ToolConfiguration::ToolConfiguration(const std::string& parent) : _directory(parent + "/adminhostd.XXXXXX") {
-    if (::mkdtemp(_directory.data()) == nullptr) {
-        throw std::system_error(errno, std::generic_category(), "cannot make a private directory in " + parent);
-    }
-    const std::string place = _directory + "/sqlite3";
-    std::ofstream file;
-    if (::mkdir(place.c_str(), 0700) == 0) {
-        file.open(place + "/sqliterc");
-        file << startFile;
-        file.close();
-    }
-    if (!file) {
-        const int failure = errno;
-        std::error_code ignored;
-        std::filesystem::remove_all(_directory, ignored);
-        throw std::system_error(failure, std::generic_category(), "cannot write in " + _directory);
-    }
-}
-
-ToolConfiguration::~ToolConfiguration() {
-    std::error_code ignored;
-    std::filesystem::remove_all(_directory, ignored);
-}
 
 std::optional<std::string> databaseToolProblem() {
     const HostPath tool("/usr/bin/sqlite3");

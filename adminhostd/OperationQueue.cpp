@@ -65,7 +65,7 @@ void OperationQueue::start() {
     _due = Clock::now() + startBound;
 }
 
-void OperationQueue::startFailed(std::string reason) {
+void OperationQueue::startFailed(const std::string& reason) {
     _worker.reset();
     _state = State::paused;
     _settled = true;
@@ -136,7 +136,7 @@ void OperationQueue::take(const Frame& frame) {
     }
 }
 
-void OperationQueue::workerEnded(std::string how) {
+void OperationQueue::workerEnded(const std::string& how) {
     const State state = std::exchange(_state, State::paused);
     _due.reset();
     if (!_worker->ending()) {

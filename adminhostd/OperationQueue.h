@@ -71,9 +71,9 @@ class OperationQueue {
     enum class State { paused, starting, idle, busy };
 
     void start();
-    void startFailed(std::string reason);
+    void startFailed(const std::string& reason);
     void take(const Frame& frame);
-    void workerEnded(std::string how);  ///< a copy: the text may be the worker's own
+    void workerEnded(const std::string& how);
     void timeUp();
     void next();
     void finish(const Dictionary& answer);

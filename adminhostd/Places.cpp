@@ -1,9 +1,10 @@
 #include "adminhostd/Places.h"
 
-#include "adminhostd/DatabaseTool.h"
 #include "adminhostd/ListeningSocket.h"
 #include "adminhostd/PluginFile.h"
+#include "adminhostd/ToolConfiguration.h"
 #include "adminhostd/WorkerProcess.h"
+#include "platform/framework/BuildNote.h"
 
 #include <cerrno>
 #include <cstring>
@@ -119,7 +120,8 @@ Dictionary workerConfiguration(const Options& options, const PluginSelection& pl
     for (const DiskPath& file : plugins.files) {
         files.emplace_back(file.text());
     }
-    return {{"root", options.root},
+    return {{"build", ADMINHOST_BUILD_IDENTITY},
+            {"root", options.root},
             {"plugins", std::move(files)},
             {"languages", options.languages ? *options.languages : languagesOfEnvironment()},
             {"accountUuids", options.accountUuids},

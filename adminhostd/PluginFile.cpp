@@ -78,7 +78,7 @@ std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory) {
         errno = failure.value();
         return std::nullopt;
     }
-    std::sort(files.begin(), files.end());
+    std::ranges::sort(files, {}, &DiskPath::text);
     return files;
 }
 

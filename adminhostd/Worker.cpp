@@ -250,7 +250,7 @@ Value Worker::perform(const Dictionary& order) {
 int Worker::run() {
     // A signal for the whole group or service is the front's to act on: the running operation is to end in peace.
     for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGPIPE}) {
-        std::signal(signal, SIG_IGN);
+        static_cast<void>(std::signal(signal, SIG_IGN));
     }
     prepareForTasks();
     for (;;) {
@@ -264,6 +264,10 @@ int Worker::run() {
         }
         bool sent = false;
         if (frame->type == FrameType::configure) {
+            if (textAt(*payload, "build") != ADMINHOST_BUILD_IDENTITY) {
+                logEvent("adminhostd: the worker is of another release than the daemon; restart the daemon");
+                return 1;
+            }
             sent = writeFrame(_descriptor, FrameType::hello, configure(*payload));
         } else if (frame->type == FrameType::perform) {
             sent = writeFrame(_descriptor, FrameType::answer, perform(*payload));

@@ -5,9 +5,9 @@
 // It is started afresh by the front, on the other end of an inherited socket pair, has one thread, and ends when the
 // front closes its end. What the frames carry:
 //
-//   configure  root, plugins (paths of files), languages, accountUuids (host path), environment (of the tools)
-//   hello      plugins: [{name, version, file, commands: descriptions}], refused: [{file, reason}], databaseTool: text
-//   of the
+//   configure  build (the front's, which must be the worker's), root, plugins (paths of files), languages, accountUuids
+//   (host path), environment (of the tools) hello      plugins: [{name, version, file, commands: descriptions}],
+//   refused: [{file, reason}], databaseTool: text of the
 //              problem, absent when it works
 //   perform    plugin, command, request, ifMatch (optional list of revisions), milliseconds (until the deadline),
 //              wantsRevision, keep (what the settings' history says of this write)

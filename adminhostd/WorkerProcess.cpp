@@ -20,6 +20,16 @@ namespace {
 /// The worker finds its end of the conversation here.
 constexpr int workerDescriptor = 3;
 
+/// The worker's program: beside this one in a build, in the library directory next to ours when installed.
+std::string workerProgram() {
+    char buffer[4096];
+    const ssize_t length = ::readlink("/proc/self/exe", buffer, sizeof buffer);
+    const std::string self(buffer, length < 0 ? 0 : static_cast<std::size_t>(length));
+    const std::string directory = self.substr(0, self.rfind('/') + 1);
+    std::string beside = directory + "adminhostd-worker";
+    return ::access(beside.c_str(), X_OK) == 0 ? beside : directory + "../lib/adminhostd/adminhostd-worker";
+}
+
 class SpawnPlan {
   public:
     SpawnPlan() {
@@ -64,11 +74,11 @@ std::unique_ptr<WorkerProcess> WorkerProcess::start(bool showOutput) {
         ::posix_spawn_file_actions_addopen(&plan.actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
     }
     ::posix_spawn_file_actions_adddup2(&plan.actions, other.get(), workerDescriptor);
-    char name[] = "adminhostd";
-    char mode[] = "--worker";
-    char* arguments[] = {name, mode, nullptr};
+    const std::string program = workerProgram();
+    char name[] = "adminhostd-worker";
+    char* arguments[] = {name, nullptr};
     const int failure =
-        ::posix_spawn(&worker->_pid, "/proc/self/exe", &plan.actions, &plan.attributes, arguments, environ);
+        ::posix_spawn(&worker->_pid, program.c_str(), &plan.actions, &plan.attributes, arguments, environ);
     if (failure != 0) {
         worker->_pid = -1;
         errno = failure;

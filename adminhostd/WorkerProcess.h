@@ -17,7 +17,7 @@ namespace adminhost {
 
 class WorkerProcess {
   public:
-    /// Starts this program again as a worker. Its standard output is ours if shown, else dropped. Null, with errno,
+    /// Starts a worker. Its standard output is ours if shown, else dropped. Null, with errno,
     /// when it cannot be started.
     [[nodiscard]] static std::unique_ptr<WorkerProcess> start(bool showOutput);
 

@@ -20,3 +20,9 @@ endif()
 set(TEST_LIBS host)
 set(TEST_DEPENDS adminhostd fixture_good fixture_other_build fixture_no_note fixture_no_entry_point fixture_null_table
     fixture_incomplete_table fixture_no_description fixture_bad_name fixture_crashing)
+if(NOT TARGET host_fixtures)
+    # For programs that run the daemon with the fixture plug-in.
+    add_library(host_fixtures INTERFACE)
+    target_compile_definitions(host_fixtures INTERFACE FIXTURE_PLUGINS="${CMAKE_BINARY_DIR}/tests/plugins")
+    add_dependencies(host_fixtures ${TEST_DEPENDS})
+endif()

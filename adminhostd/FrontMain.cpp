@@ -1,20 +1,15 @@
-// adminhostd: the front, or with --worker, as the front starts it, a worker.
+// adminhostd: the front of the daemon.
 
 #include "adminhostd/Daemon.h"
 #include "adminhostd/Places.h"
-#include "adminhostd/Worker.h"
 
-#include <cstdlib>
 #include <exception>
 #include <iostream>
-#include <string_view>
 
 #include <fcntl.h>
 #include <unistd.h>
 
 namespace {
-
-constexpr int workerDescriptor = 3;
 
 /// A descriptor that we open must never take the place of a closed standard stream.
 void openStandardStreams() {
@@ -31,11 +26,6 @@ void openStandardStreams() {
 
 int main(int count, char** arguments) {
     try {
-        if (count == 2 && std::string_view(arguments[1]) == "--worker") {
-            ::fcntl(workerDescriptor, F_SETFD, FD_CLOEXEC);
-            ::unsetenv("NOTIFY_SOCKET");
-            return adminhost::runWorker(workerDescriptor);
-        }
         openStandardStreams();
         int status = 0;
         const auto options = adminhost::readOptions(count, arguments, status);

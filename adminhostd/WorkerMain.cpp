@@ -1,0 +1,27 @@
+// adminhostd-worker: started by the front, with the conversation as descriptor 3.
+
+#include "adminhostd/Worker.h"
+
+#include <cstdlib>
+#include <exception>
+#include <iostream>
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+int main() {
+    constexpr int conversation = 3;
+    struct stat status {};
+    if (::fstat(conversation, &status) != 0 || !S_ISSOCK(status.st_mode)) {
+        std::cerr << "adminhostd-worker is started by adminhostd\n";
+        return 2;
+    }
+    ::fcntl(conversation, F_SETFD, FD_CLOEXEC);
+    ::unsetenv("NOTIFY_SOCKET");
+    try {
+        return adminhost::runWorker(conversation);
+    } catch (const std::exception& error) {
+        std::cerr << "adminhostd-worker: " << error.what() << '\n';
+        return 1;
+    }
+}
