@@ -32,18 +32,19 @@ std::int32_t runSetupScript(std::string_view name) {
     return adminhost::launch_task_with_input(adminhost::diskPath(script), {}, std::nullopt, nullptr, nullptr);
 }
 
-std::optional<SettingsWriteError> writeSettingsFile(const Dictionary& prefs, const HostPath& path) {
-    // A file that nobody can load is replaced, but what it held is the administrator's to look at.
-    const adminhost::DiskPath place = adminhost::diskPath(path);
-    if (adminhost::exists(place)) {
-        const std::optional<Value> old = adminhost::readPropertyList(place);
-        if (!old || old->dictionary() == nullptr) {
-            Error error;
-            const auto kept = adminhost::keepUnreadable(path, &error);
-            adminhost::logEvent("adminhost_lumio: " + path.text() + " cannot be loaded" +
-                                (kept ? "; it is kept as " + kept->text() : " or kept: " + textOf(error)));
-        }
+/// What is stored, or nothing to begin with. A file that stands there and was not loaded is going to be replaced; what
+/// it holds is the administrator's to look at, so it is kept beside its place first.
+Dictionary storedOrKept(std::optional<Dictionary> stored, const HostPath& path) {
+    if (!stored && adminhost::exists(adminhost::diskPath(path))) {
+        Error error;
+        const auto kept = adminhost::keepUnreadable(path, &error);
+        adminhost::logEvent("adminhost_lumio: " + path.text() + " cannot be loaded" +
+                            (kept ? "; it is kept as " + kept->text() : " or kept: " + textOf(error)));
     }
+    return stored ? *std::move(stored) : Dictionary();
+}
+
+std::optional<SettingsWriteError> writeSettingsFile(const Dictionary& prefs, const HostPath& path) {
     if (std::optional<Error> error = adminhost::writePropertyList(prefs, path)) {
         return SettingsWriteError{"", 400, *std::move(error)};
     }
@@ -124,7 +125,7 @@ Response LumioRequestHandler::writeSettingsWithRequest(const Dictionary& request
 }
 
 std::int32_t LumioRequestHandler::setIdentityPreferencesFromConfig(Dictionary& config, Dictionary& result) {
-    Dictionary prefs = identityPreferences().value_or(Dictionary());
+    Dictionary prefs = storedOrKept(identityPreferences(), identityPreferencesPath());
     if (changes(config, "shared_filesystem", prefs)) {
         result.set("needsRecycleOrRestart", true);
     }
@@ -133,13 +134,13 @@ std::int32_t LumioRequestHandler::setIdentityPreferencesFromConfig(Dictionary& c
 }
 
 std::int32_t LumioRequestHandler::setMemberPreferencesFromConfig(Dictionary& config, Dictionary& result) {
-    Dictionary prefs = memberPreferences().value_or(Dictionary());
+    Dictionary prefs = storedOrKept(memberPreferences(), memberPreferencesPath());
     copyKeys(memberPreferencesKeysToCopy(), config, prefs);
     return statusOf(writeMemberPreferences(prefs), result);
 }
 
 std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& config, Dictionary& result) {
-    Dictionary prefs = clusterPreferences().value_or(Dictionary());
+    Dictionary prefs = storedOrKept(clusterPreferences(), clusterPreferencesPath());
     if (changes(config, "nimbo_client_username", prefs)) {
         result.set("needsRecycleOrRestart", true);
     }

@@ -321,6 +321,38 @@ TEST_F(WriteSettings, UnreadableSettingsFileIsKeptBesideAndReplaced) {
                 Contains(StartsWith("adminhost_lumio: /shared/Server/member_preferences_M.plist cannot be loaded")));
 }
 
+TEST_F(WriteSettings, SettingsFileThatIsALinkIsReplacedAndWhatItLedToStaysAsItWas) {
+    fs::rename(root.path(memberFile), root.path("/shared/elsewhere.plist"));
+    fs::create_symlink(root.path("/shared/elsewhere.plist"), root.path(memberFile));
+    EXPECT_EQ(write({{"server_port", 1}}).get("writeStatus"), Value(0));
+    EXPECT_FALSE(fs::is_symlink(root.path(memberFile)));
+    EXPECT_EQ(file(memberFile), (Dictionary{{"server_port", 1}, {"kept", "member"}}));
+    EXPECT_EQ(file("/shared/elsewhere.plist").get("server_port"), Value(8170));
+}
+
+TEST_F(WriteSettings, SettingsFileThatIsTooLargeIsKeptBesideAndReplaced) {
+    fs::resize_file(root.path(memberFile), adminhost::plistMaximumSize + 1);
+    EXPECT_EQ(write({{"server_port", 1}}).get("writeStatus"), Value(0));
+    EXPECT_EQ(file(memberFile), (Dictionary{{"server_port", 1}}));
+    EXPECT_THAT(log.lines, Contains(HasSubstr("member_preferences_M.plist cannot be loaded; it is kept as ")));
+}
+
+TEST_F(WriteSettings, SettingsFileThatIsAPipeIsNeitherReadNorReplaced) {
+    fs::remove(root.path(memberFile));
+    ASSERT_EQ(::mkfifo(root.path(memberFile).c_str(), 0600), 0);
+    const Dictionary answer = write({{"server_port", 1}});
+    EXPECT_EQ(answer.get("writeStatus"), Value(400));
+    EXPECT_TRUE(fs::is_fifo(root.path(memberFile)));
+    EXPECT_THAT(log.lines, Contains(HasSubstr("member_preferences_M.plist cannot be loaded or kept: ")));
+}
+
+TEST_F(WriteSettings, SharedFilesystemThatIsNoDirectoryIsAFailedWriteThatNamesIt) {
+    root.write("/flat", "a file");
+    const Dictionary answer = write({{"shared_filesystem", "/flat"}});
+    EXPECT_EQ(answer.get("writeStatus"), Value(400));
+    EXPECT_THAT(*answer.get("errorDescription").string(), HasSubstr("/flat/Server/cluster_preferences.plist"));
+}
+
 TEST_F(WriteSettings, MarkerThatIsPresentIsLeftAloneAndNothingIsLogged) {
     root.write(marker, "old");
     (void)write({});
