@@ -41,9 +41,13 @@ Response PluginRequestHandler::responseForError(std::string_view code) const {
     return Response::error(code, "The plug-in answered an error.");
 }
 
-const Value& userDefault(std::string_view name) noexcept { return defaults().get(name); }
+const Value& userDefault(std::string_view name) noexcept {
+    return defaults().get(name);
+}
 
-void setUserDefault(std::string_view name, Value value) { defaults().set(name, std::move(value)); }
+void setUserDefault(std::string_view name, Value value) {
+    defaults().set(name, std::move(value));
+}
 
 std::string makeUUIDString() {
     std::array<std::uint8_t, 16> bytes{};

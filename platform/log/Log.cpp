@@ -48,9 +48,17 @@ std::atomic<LogSink*> currentSink = &theStandardErrorSink;
 
 }  // namespace
 
-LogSink& syslogSink() noexcept { return theSyslogSink; }
-LogSink& standardErrorSink() noexcept { return theStandardErrorSink; }
-void setLogSink(LogSink& sink) noexcept { currentSink = &sink; }
-void logEvent(std::string_view event) noexcept { currentSink.load()->write(event); }
+LogSink& syslogSink() noexcept {
+    return theSyslogSink;
+}
+LogSink& standardErrorSink() noexcept {
+    return theStandardErrorSink;
+}
+void setLogSink(LogSink& sink) noexcept {
+    currentSink = &sink;
+}
+void logEvent(std::string_view event) noexcept {
+    currentSink.load()->write(event);
+}
 
 }  // namespace adminhost

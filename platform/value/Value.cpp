@@ -28,8 +28,8 @@ Dictionary::Dictionary(std::initializer_list<DictionaryEntry> entries) {
 
 std::size_t Dictionary::indexOf(std::string_view key) const noexcept {
     if (_entries.size() <= linearLimit) {
-        const auto found =
-            std::find_if(_entries.begin(), _entries.end(), [&](const DictionaryEntry& entry) { return entry.key == key; });
+        const auto found = std::find_if(_entries.begin(), _entries.end(),
+                                        [&](const DictionaryEntry& entry) { return entry.key == key; });
         return found == _entries.end() ? notFound : static_cast<std::size_t>(found - _entries.begin());
     }
     const auto found = _index.find(key);
@@ -113,10 +113,18 @@ void Dictionary::clear() noexcept {
     _index.clear();
 }
 
-std::size_t Dictionary::size() const noexcept { return _entries.size(); }
-bool Dictionary::empty() const noexcept { return _entries.empty(); }
-Dictionary::const_iterator Dictionary::begin() const noexcept { return _entries.begin(); }
-Dictionary::const_iterator Dictionary::end() const noexcept { return _entries.end(); }
+std::size_t Dictionary::size() const noexcept {
+    return _entries.size();
+}
+bool Dictionary::empty() const noexcept {
+    return _entries.empty();
+}
+Dictionary::const_iterator Dictionary::begin() const noexcept {
+    return _entries.begin();
+}
+Dictionary::const_iterator Dictionary::end() const noexcept {
+    return _entries.end();
+}
 
 bool operator==(const Dictionary& a, const Dictionary& b) {
     return a.size() == b.size() && std::all_of(a.begin(), a.end(), [&](const DictionaryEntry& entry) {
@@ -140,8 +148,8 @@ Value& Value::operator=(Value&& other) noexcept {
 Value::~Value() = default;
 
 Value::Type Value::type() const noexcept {
-    constexpr Type types[] = {Type::null, Type::boolean, Type::integer, Type::integer, Type::real,
-                              Type::string, Type::date, Type::data, Type::array, Type::dictionary};
+    constexpr Type types[] = {Type::null,   Type::boolean, Type::integer, Type::integer, Type::real,
+                              Type::string, Type::date,    Type::data,    Type::array,   Type::dictionary};
     return types[_value.index()];
 }
 
@@ -173,10 +181,16 @@ std::optional<Date> Value::date() const noexcept {
     return value == nullptr ? std::nullopt : std::optional(*value);
 }
 
-const Array* Value::array() const noexcept { return std::get_if<Array>(&_value); }
-Array* Value::array() noexcept { return std::get_if<Array>(&_value); }
+const Array* Value::array() const noexcept {
+    return std::get_if<Array>(&_value);
+}
+Array* Value::array() noexcept {
+    return std::get_if<Array>(&_value);
+}
 
-bool operator==(const Value& a, const Value& b) { return a._value == b._value; }
+bool operator==(const Value& a, const Value& b) {
+    return a._value == b._value;
+}
 
 std::string_view nameOf(Value::Type type) noexcept {
     switch (type) {

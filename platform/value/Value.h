@@ -2,8 +2,8 @@
 
 // Property-list values: what requests, answers, settings files and tool output are made of.
 //
-// A Value is a regular type: copyable, comparable, cheap to move. It owns everything below it. A moved-from Value is null.
-// Equality is equality of type and content: the integer 1, the real 1.0 and true are three different values. A
+// A Value is a regular type: copyable, comparable, cheap to move. It owns everything below it. A moved-from Value is
+// null. Equality is equality of type and content: the integer 1, the real 1.0 and true are three different values. A
 // non-negative integer is one value whichever of the two integer types it was made from.
 
 #include <chrono>
@@ -87,8 +87,8 @@ class Value {
     template <std::same_as<bool> B>
     Value(B value) noexcept : _value(value) {}
     template <std::integral I>
-        requires(!std::same_as<I, bool> && !std::same_as<I, char>)
-    Value(I value) noexcept {
+    requires(!std::same_as<I, bool> && !std::same_as<I, char>) Value(I value)
+    noexcept {
         if constexpr (std::unsigned_integral<I>) {
             if (value > static_cast<std::uint64_t>(INT64_MAX)) {
                 _value = static_cast<std::uint64_t>(value);
