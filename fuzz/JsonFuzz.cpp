@@ -1,0 +1,27 @@
+// JSON texts: whatever is accepted is written and reads back as the same text, in both layouts; whatever is refused is
+// refused with a place and in valid UTF-8.
+
+#include "platform/json/Json.h"
+#include "platform/value/Text.h"
+
+#include <cstdint>
+#include <cstdlib>
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+    using namespace adminhost;
+    Error error;
+    const auto value = parseJson({reinterpret_cast<const char*>(data), size}, &error);
+    if (!value) {
+        if (!error.description || !error.description->starts_with("line ") || !isUtf8(*error.description)) {
+            std::abort();
+        }
+        return 0;
+    }
+    const std::string text = jsonOf(*value);
+    const auto again = parseJson(text);
+    const auto pretty = parseJson(jsonOf(*value, true));
+    if (!again || !pretty || jsonOf(*again) != text || jsonOf(*pretty) != text) {
+        std::abort();
+    }
+    return 0;
+}
