@@ -210,15 +210,24 @@ TEST(CtlReach, HelpOfTheVerbsNeedsNoDaemon) {
 TEST(CtlReach, WhoMayNotUseTheDaemonGetsStatusFour) {
     const DaemonProcess daemon(withPlugins({"tests/plugins/fixture_described.so"}));
     if (::geteuid() == 0) {
-        // Let another account reach the socket: then it is the daemon that says no.
-        const std::vector<std::string> words = {"--reuid=65534", "--regid=65534", "--clear-groups", program, "status"};
+        // Let another account reach the socket: then it is the daemon that says no. The program runs inside the
+        // directory, from a copy: the directories above that one and above the build may be closed to others.
+        std::filesystem::copy_file(program, daemon.directory() / "adminhostctl");
+        const std::vector<std::string> words = {"-C",
+                                                daemon.directory(),
+                                                "setpriv",
+                                                "--reuid=65534",
+                                                "--regid=65534",
+                                                "--clear-groups",
+                                                "./adminhostctl",
+                                                "status"};
         std::filesystem::permissions(daemon.directory(), std::filesystem::perms(0755));
         std::filesystem::permissions(daemon.socket(), std::filesystem::perms(0666));
-        const Result refused = runIn("/usr/bin/setpriv", words, daemon.socket());
+        const Result refused = runIn("/usr/bin/env", words, "socket");
         EXPECT_EQ(refused.status, 4) << refused.err;
         EXPECT_THAT(refused.err, HasSubstr("NOT_PERMITTED"));
         std::filesystem::permissions(daemon.socket(), std::filesystem::perms(0600));
-        EXPECT_EQ(runIn("/usr/bin/setpriv", words, daemon.socket()).status, 4);
+        EXPECT_EQ(runIn("/usr/bin/env", words, "socket").status, 4);
     } else {
         std::filesystem::permissions(daemon.socket(), std::filesystem::perms(0000));
         const Result closed = runIn(program, {"status"}, daemon.socket());
