@@ -1,6 +1,7 @@
 #include "adminhostd/Options.h"
 
 #include <cstdlib>
+#include <filesystem>
 #include <iostream>
 #include <stdexcept>
 
@@ -10,6 +11,10 @@ namespace adminhost {
 namespace {
 
 constexpr const char* defaultConfiguration = "/etc/adminhostd.toml";
+
+std::string absolute(const std::string& path) {
+    return path.empty() ? path : std::filesystem::absolute(path).string();
+}
 
 }  // namespace
 
@@ -38,9 +43,11 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
         status = app.exit(error, std::cout, std::cerr) == 0 ? 0 : 2;
         return std::nullopt;
     }
-    setSystemRoot(options.root);
-    options.root = systemRoot();
     try {
+        // The worker leaves the directory in which the daemon was started, and tools are named by absolute paths.
+        options.root = absolute(options.root);
+        setSystemRoot(options.root);
+        options.root = systemRoot();
         const DiskPath standard = diskPath(HostPath(defaultConfiguration));
         if (!configuration.empty()) {
             readConfiguration(configuration, options);
@@ -57,6 +64,9 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
         for (const std::string& file : plugins) {
             options.plugins.emplace_back(file);
         }
+    }
+    for (DiskPath& file : options.plugins) {
+        file = DiskPath(absolute(file.text()));
     }
     if (!socket.empty()) {
         options.socket = DiskPath(socket);

@@ -28,8 +28,9 @@ struct Options {
     bool check = false;
 };
 
-/// Reads both; the command line wins. Sets the system root. Nothing when the daemon is to end at once: help was
-/// printed, or what is wrong was; then status is the exit status.
+/// Reads both; the command line wins. Sets the system root. A relative root or plug-in lies below the current
+/// directory. Nothing when the daemon is to end at once: help was printed, or what is wrong was; then status is the
+/// exit status.
 [[nodiscard]] std::optional<Options> readOptions(int count, const char* const* arguments, int& status);
 
 /// Applies a configuration file to the options. Throws std::runtime_error with file, line, what is wrong and the mend.

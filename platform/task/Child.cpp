@@ -48,7 +48,7 @@ class SpawnActions {
     SpawnActions& operator=(const SpawnActions&) = delete;
     ~SpawnActions() { ::posix_spawn_file_actions_destroy(&_actions); }
 
-    /// The three standard streams, no other descriptor, the directory "/". input is -1 for /dev/null.
+    /// The three standard streams and no other descriptor. input is -1 for /dev/null.
     int set(int input, int output, int error) noexcept {
         note(input < 0 ? ::posix_spawn_file_actions_addopen(&_actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0)
                        : ::posix_spawn_file_actions_adddup2(&_actions, input, STDIN_FILENO));
@@ -56,7 +56,6 @@ class SpawnActions {
         note(::posix_spawn_file_actions_adddup2(&_actions, error, STDERR_FILENO));
         // All of ours are close-on-exec; this is for those that a library opened without it.
         note(::posix_spawn_file_actions_addclosefrom_np(&_actions, STDERR_FILENO + 1));
-        note(::posix_spawn_file_actions_addchdir_np(&_actions, "/"));
         return _failure;
     }
     [[nodiscard]] const posix_spawn_file_actions_t* get() const noexcept { return &_actions; }

@@ -258,6 +258,7 @@ std::int32_t launch_task_with_input_and_environment(const DiskPath& tool, const 
 
 void prepareForTasks() noexcept {
     ::umask(022);
+    [[maybe_unused]] const int moved = ::chdir("/");  // should even that fail, tools run where the daemon was started
     struct sigaction standard {};
     standard.sa_handler = SIG_DFL;
     ::sigaction(SIGCHLD, &standard, nullptr);

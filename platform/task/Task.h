@@ -6,9 +6,10 @@
 // number. A tool that cannot be started (missing, not executable, its path not absolute, an argument with a NUL byte or
 // above the kernel's 128 KiB with the NUL that ends it) is -1, with "TOOL: " and the system's text in the captured
 // error, TOOL being the tool's host path. The tool gets exactly the given arguments (argv[0] is the tool's path on
-// disk), standard input /dev/null where no input is given, the directory "/", no signal blocked or ignored, no
-// descriptor of ours, and the daemon's environment extended by the given one. Its umask is the process's, which
-// prepareForTasks() has set to 022. A tool need not read its input: what it leaves is dropped.
+// disk), standard input /dev/null where no input is given, no signal blocked or ignored, no descriptor of ours, and the
+// daemon's environment extended by the given one. Its umask and current directory are the process's, which
+// prepareForTasks() has set to 022 and "/": a relative path names the same file here and there. A tool need not read
+// its input: what it leaves is dropped.
 //
 // Standard output and error are captured whole, up to 256 MiB each; more is a failure: the tool's process group is
 // killed and -1 answered, never a truncation. Bytes that are not UTF-8 arrive as U+FFFD each: captured text must be
@@ -42,8 +43,9 @@ namespace adminhost {
     const DiskPath& tool, const std::vector<std::string>& arguments, const std::optional<std::string>& input,
     std::string* output, std::string* error, const std::map<std::string, std::string>& environment);
 
-/// Makes the process fit to launch tools: umask 022, and SIGCHLD, which the process may have inherited as ignored (exit
-/// statuses would be lost), at its default. Called once at the start of a process that launches tools.
+/// Makes the process fit to launch tools: umask 022, current directory "/", and SIGCHLD, which the process may have
+/// inherited as ignored (exit statuses would be lost), at its default. Called once at the start of a process that
+/// launches tools.
 void prepareForTasks() noexcept;
 
 /// The moment at which a running tool of this process is killed with its process group (status 128 + 9, and no further

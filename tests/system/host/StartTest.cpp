@@ -77,6 +77,22 @@ TEST_F(Start, DefaultSocketLiesBelowTheRoot) {
     EXPECT_NE(run({"--root", directory, "--check"}).output.find("etc/adminhostd.toml, line 1"), std::string::npos);
 }
 
+TEST_F(Start, RelativeRootAndPluginAreBelowTheDirectoryThatItIsStartedIn) {
+    fs::create_directories(directory / "root/usr/bin");
+    fs::create_symlink("/usr/bin/sqlite3", directory / "root/usr/bin/sqlite3");
+    fs::copy_file(pluginFile("fixture_good"), directory / "good.so");
+    const std::string command = "cd '" + directory.string() + "' && exec '" + BINARY_DIR +
+                                "/bin/adminhostd' --check --root root --plugin good.so --socket socket";
+    const ProgramResult result = runProgram({"/bin/sh", "-c", command}, Errors::merge);
+    EXPECT_EQ(result.output, "Nothing is wrong. Plug-ins: fixture 1.2.3. Socket: socket\n");
+    EXPECT_EQ(result.status, 0);
+}
+
+TEST_F(Start, WorkerAndSoItsToolsRunInTheRootDirectory) {
+    const DaemonProcess daemon(withFixture());
+    EXPECT_EQ(fs::read_symlink("/proc/" + std::to_string(daemon.workerPid()) + "/cwd"), "/");
+}
+
 TEST_F(Start, StaleSocketIsReplacedAndALiveOneIsAnError) {
     const fs::path path = directory / "socket";
     const int stale = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);

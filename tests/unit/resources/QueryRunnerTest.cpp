@@ -1,3 +1,4 @@
+#include "handler/SettingsStore.h"
 #include "resources/QueryRunner.h"
 #include "resources/Resource.h"
 #include "tests/support/TemporaryRoot.h"
@@ -138,6 +139,18 @@ TEST_F(QueryRunner, ToolGetsExactlyLineModeDatabaseAndStatement) {
     EXPECT_EQ((*records)[1], (Dictionary{{"argument", "<" + root.path(database).string() + ">"}}));
     EXPECT_EQ((*records)[2], (Dictionary{{"argument", "<select 'it''s; $HOME `x`' -- \"q\">"}}));
     EXPECT_EQ((*records)[3], Dictionary{});
+}
+
+TEST_F(QueryRunner, RelativeDatabaseIsTheOneThatWasFoundBelowTheCurrentDirectory) {
+    root.write("/var/lumio/server/database.yml", "production:\n  database: db/prod.sqlite3\n");
+    root.sql("/here/db/prod.sqlite3", "create table t(id); insert into t values(99)");
+    const std::filesystem::path before = std::filesystem::current_path();
+    std::filesystem::current_path(root.path("/here"));
+    const bool found = SettingsStore::dbPathExists();
+    const auto records = run("select id from t");
+    std::filesystem::current_path(before);
+    EXPECT_TRUE(found);
+    EXPECT_EQ(records, (Records{{{"id", "99"}}}));
 }
 
 TEST_F(QueryRunner, AMegabyteOnEachStreamIsCaptured) {

@@ -278,9 +278,15 @@ TEST_F(Task, TaskEnvironmentReachesEveryToolAndTheCallsOwnWins) {
     EXPECT_EQ(_output, "13\n");
 }
 
-TEST_F(Task, DirectoryIsTheRoot) {
+TEST_F(Task, DirectoryIsTheProcessesWhichIsTheRoot) {
     EXPECT_EQ(run("/bin/pwd", {"-P"}), 0);
     EXPECT_EQ(_output, "/\n");
+    // A relative path that this process has looked at is the same path for the tool.
+    fs::current_path(_dir);
+    EXPECT_EQ(run("/bin/pwd", {"-P"}), 0);
+    EXPECT_EQ(_output, fs::canonical(_dir).string() + "\n");
+    prepareForTasks();
+    EXPECT_EQ(fs::current_path(), "/");
 }
 
 TEST_F(Task, UmaskIs022) {
