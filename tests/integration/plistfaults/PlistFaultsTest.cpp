@@ -2,7 +2,7 @@
 // test program is its own writer: with --write it writes one list between two calls that mark the way in strace's log.
 
 #include "platform/plist/PropertyList.h"
-#include "platform/task/Task.h"
+#include "tests/support/Traced.h"
 
 #include <algorithm>
 #include <csignal>
@@ -12,7 +12,6 @@
 #include <iostream>
 #include <iterator>
 #include <map>
-#include <regex>
 #include <set>
 #include <string>
 #include <vector>
@@ -25,9 +24,7 @@ namespace {
 
 using namespace adminhost;
 namespace fs = std::filesystem;
-
-constexpr const char* beginMark = "/adminhost-mark-begin";
-constexpr const char* endMark = "/adminhost-mark-end";
+using test::TracedCall;
 
 /// A list of several pages, so that the bytes do not fit a single block.
 Value listOf(const std::string& word) {
@@ -40,21 +37,14 @@ Value listOf(const std::string& word) {
 
 int writeBetweenMarks(const char* path, const char* word) {
     const Value list = listOf(word);
-    (void)::access(beginMark, F_OK);
+    test::markBegin();
     const auto error = writePropertyList(list, HostPath(path));
-    (void)::access(endMark, F_OK);
+    test::markEnd();
     if (error) {
         std::cerr << error->description.value_or("no description");
     }
     return error ? 1 : 0;
 }
-
-/// The Nth call of a name in the process's life, as strace counts them.
-struct Call {
-    std::string name;
-    int number;
-    std::string line;
-};
 
 class PlistFaults : public testing::TestWithParam<bool> {
   protected:
@@ -81,38 +71,17 @@ class PlistFaults : public testing::TestWithParam<bool> {
     }
     [[nodiscard]] static bool hasOld() { return GetParam(); }
 
-    std::int32_t write(const std::vector<std::string>& straceOptions, const std::string& word) {
-        std::vector<std::string> arguments = {"-f", "-o", _dir / "log"};
-        arguments.insert(arguments.end(), straceOptions.begin(), straceOptions.end());
-        arguments.insert(arguments.end(), {fs::read_symlink("/proc/self/exe"), "--write", _file, word});
-        // A traced process cannot look for leaks.
-        return launch_task_with_input_and_environment(DiskPath("/usr/bin/strace"), arguments, std::nullopt, nullptr,
-                                                      &_error, {{"ASAN_OPTIONS", "detect_leaks=0"}});
+    std::int32_t write(std::vector<std::string> options, const std::string& word) {
+        options.emplace_back("-f");
+        return test::runTraced(options, _dir / "log", {fs::read_symlink("/proc/self/exe"), "--write", _file, word},
+                               _error);
     }
 
-    /// The calls between the two marks of an undisturbed write.
-    std::vector<Call> callsOfTheWay() {
+    /// The calls of an undisturbed write.
+    std::vector<TracedCall> callsOfTheWay() {
         EXPECT_EQ(write({}, "new"), 0) << _error;
-        std::ifstream log(_dir / "log");
-        const std::regex form("^[0-9]+ +([a-z0-9_]+)\\(.*");
-        std::map<std::string, int> counts;
-        std::vector<Call> calls;
-        bool between = false;
-        for (std::string line; std::getline(log, line);) {
-            std::smatch match;
-            if (!std::regex_match(line, match, form)) {
-                continue;
-            }
-            const int number = ++counts[match[1]];
-            if (line.find(beginMark) != std::string::npos) {
-                between = true;
-            } else if (line.find(endMark) != std::string::npos) {
-                return calls;
-            } else if (between && !isMemory(match[1])) {
-                calls.push_back({match[1], number, line});
-            }
-        }
-        ADD_FAILURE() << "the marks are not in the log";
+        std::vector<TracedCall> calls = test::callsBetweenMarks(_dir / "log");
+        std::erase_if(calls, [](const TracedCall& call) { return isMemory(call.name); });
         return calls;
     }
 
@@ -153,7 +122,7 @@ class PlistFaults : public testing::TestWithParam<bool> {
 TEST_P(PlistFaults, WayHasTheCallsThatMakeAWriteAtomicAndDurable) {
     std::map<std::string, int> counts;
     std::vector<std::string> order;
-    for (const Call& call : callsOfTheWay()) {
+    for (const TracedCall& call : callsOfTheWay()) {
         ++counts[call.name];
         if (call.name == "fsync" || call.name == "renameat") {
             order.push_back(call.name);
@@ -170,7 +139,7 @@ TEST_P(PlistFaults, EachCallThatFailsLeavesTheOldFileOrTheNewOneWhole) {
     int failed = 0;
     int injected = 0;
     bool leftoverMayStay = hasOld();  // until its removal has been done; a failure before that is not the write's
-    for (const Call& call : callsOfTheWay()) {
+    for (const TracedCall& call : callsOfTheWay()) {
         for (const char* code : {"ENOSPC", "EIO", "EROFS", "EACCES"}) {
             for (const char* again : {"", "+"}) {
                 makeOld();
@@ -207,7 +176,7 @@ TEST_P(PlistFaults, ProcessKilledAtEachCallLeavesTheOldFileOrTheNewOneWhole) {
     int old = 0;
     int fresh = 0;
     int leftovers = 0;
-    for (const Call& call : callsOfTheWay()) {
+    for (const TracedCall& call : callsOfTheWay()) {
         makeOld();
         SCOPED_TRACE(call.line);
         EXPECT_EQ(write({"-e", "inject=" + call.name + ":signal=SIGKILL:when=" + std::to_string(call.number)}, "new"),

@@ -3,15 +3,13 @@
 #include "handler/LumioRequestHandler.h"
 #include "platform/task/Task.h"
 #include "platform/value/Text.h"
+#include "tests/support/Traced.h"
 
 #include <algorithm>
 #include <csignal>
 #include <iostream>
 
-#include <linux/capability.h>
 #include <sys/resource.h>
-#include <sys/syscall.h>
-#include <unistd.h>
 
 namespace lumio {
 
@@ -33,15 +31,6 @@ Value writeNew() {
         {"shared_filesystem", "/shared"},       {"member_uuid", "M"},  {"nimbo_client_username", "second"},
         {"nimbo_controller", "second.example"}, {"server_port", 9000}, {"server_host", "new.example"}};
     return handler.writeSettingsWithRequest(Dictionary{{"configuration", configuration}}).dictionary();
-}
-
-/// Files of mode 000 are closed to the superuser too from now on.
-void dropAccessPrivileges() {
-    __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
-    std::array<__user_cap_data_struct, 2> data{};
-    ::syscall(SYS_capget, &header, data.data());
-    data[0].effective &= ~((1U << CAP_DAC_OVERRIDE) | (1U << CAP_DAC_READ_SEARCH));
-    ::syscall(SYS_capset, &header, data.data());
 }
 
 }  // namespace
@@ -78,14 +67,22 @@ void Service::makeOld() const {
     root.writePropertyList(memberFile, "<key>server_port</key><integer>8170</integer>" + kept);
 }
 
-std::int32_t Service::writeThrough(std::vector<std::string> command, const std::vector<std::string>& options) {
-    command.insert(command.end(), {fs::read_symlink("/proc/self/exe"), "--write", root.path("").string()});
-    command.insert(command.end(), options.begin(), options.end());
-    const adminhost::DiskPath tool(command.front());
-    command.erase(command.begin());
-    // A traced process cannot look for leaks.
-    return adminhost::launch_task_with_input_and_environment(tool, command, std::nullopt, nullptr, &_said,
-                                                             {{"ASAN_OPTIONS", "detect_leaks=0"}});
+std::vector<std::string> Service::writer() const {
+    return {fs::read_symlink("/proc/self/exe"), "--write", root.path("").string()};
+}
+
+std::int32_t Service::writeAlone(const std::optional<std::string>& bytes) {
+    std::vector<std::string> arguments = writer();
+    const adminhost::DiskPath program(arguments.front());
+    arguments.erase(arguments.begin());
+    if (bytes) {
+        arguments.push_back(*bytes);
+    }
+    return adminhost::launch_task_with_input(program, arguments, std::nullopt, nullptr, &_said);
+}
+
+std::int32_t Service::writeTraced(const std::vector<std::string>& options, const std::string& logFile) {
+    return adminhost::test::runTraced(options, logFile, writer(), _said);
 }
 
 bool Service::writeHere() const {
@@ -122,17 +119,15 @@ bool Service::marked() const {
 
 int writeBetweenMarks(const std::vector<std::string>& arguments) {
     adminhost::setSystemRoot(arguments.at(0));
-    if (arguments.size() > 1 && arguments[1] == "--without-access-privileges") {
-        dropAccessPrivileges();
-    } else if (arguments.size() > 1) {
+    if (arguments.size() > 1) {
         // Bytes that a file may have: the write that reaches them is cut short, the next one fails.
         const rlimit limit{std::stoul(arguments[1]), std::stoul(arguments[1])};
         ::setrlimit(RLIMIT_FSIZE, &limit);
         ::signal(SIGXFSZ, SIG_IGN);
     }
-    (void)::access(beginMark, F_OK);
+    adminhost::test::markBegin();
     const Value answer = writeNew();
-    (void)::access(endMark, F_OK);
+    adminhost::test::markEnd();
     const Value& status = answer.dictionary()->get("writeStatus");
     std::cerr << adminhost::textOf(answer.dictionary()->get("errorDescription")) << '\n';
     return status == Value(0) ? written : status == Value(400) ? refused : otherStatus;

@@ -1,7 +1,7 @@
 #pragma once
 
 // A small service whose settings are written by this program, run once more as a process of its own: with --write it
-// writes the settings once, between two calls that mark the way in strace's log.
+// writes the settings once, between the two marks of a traced way.
 
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TemporaryRoot.h"
@@ -10,14 +10,12 @@
 #include <cstdint>
 #include <filesystem>
 #include <map>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
 namespace lumio {
-
-constexpr const char* beginMark = "/adminhost-mark-begin";
-constexpr const char* endMark = "/adminhost-mark-end";
 
 constexpr std::string_view identityFile = "/Library/Preferences/com.brenn.lumioserverd.plist";
 constexpr std::string_view clusterFile = "/shared/Server/cluster_preferences.plist";
@@ -38,9 +36,11 @@ class Service {
     /// Puts the settings back as they were, without the marker, and removes whatever else stands beside them.
     void makeOld() const;
     void makeWithoutFiles() const;
-    /// A process that writes the new settings, started through the command (strace, unshare ...). Its status.
-    std::int32_t writeThrough(std::vector<std::string> command, const std::vector<std::string>& options = {});
-    std::int32_t writeAlone(const std::vector<std::string>& options = {}) { return writeThrough({}, options); }
+    /// A process that writes the new settings, each of its files bounded to so many bytes if a number is given. Its
+    /// status.
+    std::int32_t writeAlone(const std::optional<std::string>& bytes = std::nullopt);
+    /// The same below strace, with its options and its log.
+    std::int32_t writeTraced(const std::vector<std::string>& options, const std::string& logFile);
     /// Writes the new settings in this process; whether that succeeded.
     [[nodiscard]] bool writeHere() const;
 
@@ -55,6 +55,8 @@ class Service {
     adminhost::test::CapturedLog log;
 
   private:
+    [[nodiscard]] std::vector<std::string> writer() const;
+
     std::string _said;
 };
 

@@ -3,12 +3,10 @@
 // else stands beside them.
 
 #include "tests/integration/writefaults/Service.h"
+#include "tests/support/Traced.h"
 
 #include <csignal>
 #include <cstdio>
-#include <fstream>
-#include <iostream>
-#include <regex>
 #include <set>
 
 #include <gmock/gmock.h>
@@ -20,11 +18,7 @@ namespace {
 using testing::AnyOf;
 using testing::IsEmpty;
 
-/// The Nth call of a name in the process's life, as strace counts them.
-struct Call {
-    std::string name;
-    int number;
-    std::string line;
+struct Call : adminhost::test::TracedCall {
     bool changes;  ///< something on the disk; others only open, look or close
 };
 
@@ -67,11 +61,7 @@ class WriteFaults : public testing::Test {
         std::fflush(stdout);
     }
 
-    std::int32_t write(const std::vector<std::string>& options) {
-        std::vector<std::string> command{"/usr/bin/strace", "-o", logFile()};
-        command.insert(command.end(), options.begin(), options.end());
-        return service.writeThrough(command);
-    }
+    std::int32_t write(const std::vector<std::string>& options) { return service.writeTraced(options, logFile()); }
     [[nodiscard]] std::string logFile() const { return service.root.path("/strace").string(); }
 
     /// The calls between the two marks of an undisturbed write with which a file is opened, made, changed or closed.
@@ -83,29 +73,15 @@ class WriteFaults : public testing::Test {
             "linkat",    "mkdir",    "mkdirat",   "fremovexattr", "flistxattr", "flock",    "newfstatat"};
         service.makeOld();
         EXPECT_EQ(write({}), written) << service.said();
-        std::ifstream log(logFile());
-        const std::regex form("^([a-z0-9_]+)\\(.*");
-        std::map<std::string, int> numbers;
         std::vector<Call> calls;
-        bool between = false;
-        for (std::string line; std::getline(log, line);) {
-            std::smatch match;
-            if (!std::regex_match(line, match, form)) {
-                continue;
-            }
-            const int number = ++numbers[match[1]];
-            if (line.find(beginMark) != std::string::npos) {
-                between = true;
-            } else if (line.find(endMark) != std::string::npos) {
-                return calls;
-            } else if (between && changing.contains(match[1])) {
+        for (adminhost::test::TracedCall& call : adminhost::test::callsBetweenMarks(logFile())) {
+            if (changing.contains(call.name)) {
                 const bool looks =
-                    std::set<std::string>{"newfstatat", "close", "flock", "flistxattr"}.contains(match[1]) ||
-                    (match[1] == "openat" && line.find("O_CREAT") == std::string::npos);
-                calls.push_back({match[1], number, line, !looks});
+                    std::set<std::string>{"newfstatat", "close", "flock", "flistxattr"}.contains(call.name) ||
+                    (call.name == "openat" && call.line.find("O_CREAT") == std::string::npos);
+                calls.push_back({std::move(call), !looks});
             }
         }
-        ADD_FAILURE() << "the marks are not in the log";
         return calls;
     }
 
@@ -243,7 +219,7 @@ TEST_F(WriteFaults, ShortWriteThatCannotGoOnLeavesTheOldFileWhole) {
     for (const char* bytes : {"0", "1", "4096", "20000"}) {
         service.makeOld();
         SCOPED_TRACE(bytes);
-        EXPECT_EQ(service.writeAlone({bytes}), refused);
+        EXPECT_EQ(service.writeAlone(bytes), refused);
         EXPECT_EQ(service.contents(), before);
         EXPECT_THAT(service.others(), IsEmpty());
         checkFiles(counts["write is cut short"]);

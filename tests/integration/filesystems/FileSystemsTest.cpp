@@ -1,0 +1,270 @@
+// Settings written to file systems that are missing, read-only or full: real ones, mounted by the test in namespaces of
+// its own, in which it is the superuser whoever runs it.
+
+#include "adminhostd/SettingsHistory.h"
+#include "handler/LumioRequestHandler.h"
+#include "platform/plist/PropertyList.h"
+#include "tests/support/TemporaryRoot.h"
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <iostream>
+#include <map>
+#include <stdexcept>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/mount.h>
+#include <unistd.h>
+
+namespace lumio {
+namespace {
+
+namespace fs = std::filesystem;
+using adminhost::Dictionary;
+using adminhost::HostPath;
+using adminhost::Value;
+using testing::AllOf;
+using testing::Contains;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::StartsWith;
+
+constexpr std::string_view identityFile = "/Library/Preferences/com.brenn.lumioserverd.plist";
+constexpr std::string_view clusterFile = "/shared/Server/cluster_preferences.plist";
+constexpr std::string_view memberFile = "/shared/Server/member_preferences_M.plist";
+constexpr const char* small = "size=64k,mode=755";
+
+/// A file system of its own at a host path, for the life of the object. Throws when it cannot be mounted.
+class Mount {
+  public:
+    Mount(const adminhost::test::TemporaryRoot& root, std::string_view place, const char* options = small)
+        : _place(root.path(place)) {
+        fs::create_directories(_place);
+        check(::mount("tmpfs", _place.c_str(), "tmpfs", 0, options), "mount");
+    }
+    Mount(const Mount&) = delete;
+    Mount& operator=(const Mount&) = delete;
+    ~Mount() { ::umount2(_place.c_str(), MNT_DETACH); }
+
+    void makeReadOnly() const {
+        check(::mount("tmpfs", _place.c_str(), "tmpfs", MS_REMOUNT | MS_RDONLY, nullptr), "remount");
+        ASSERT_FALSE(std::ofstream(_place / "probe").is_open()) << "it is not read-only";
+    }
+    /// Leaves not a single free byte.
+    void fill() const {
+        std::ofstream file(_place / "filling");
+        while (file << 'x' << std::flush) {
+        }
+        ASSERT_EQ(fs::space(_place).available, 0U) << "it is not full";
+    }
+    void makeRoom() const { fs::remove(_place / "filling"); }
+
+  private:
+    static void check(int status, const char* what) {
+        if (status != 0) {
+            throw std::runtime_error(std::string(what) + ": " + std::strerror(errno));
+        }
+    }
+
+    fs::path _place;
+};
+
+class FileSystems : public testing::Test {
+  protected:
+    void SetUp() override {
+        for (const char* script : {"setup_lumioserverd_preferences", "setup_lumioserverd_library"}) {
+            root.writeTool(std::string("/usr/share/sorvaneproducer/lumioserverd/script/") + script,
+                           "#!/bin/sh\nexit 0\n");
+        }
+        fs::create_directories(root.path("/var/lumio/server"));
+        makeIdentity();
+    }
+    void makeIdentity() const {
+        root.writePropertyList(identityFile,
+                               "<key>shared_filesystem</key><string>/shared</string>"
+                               "<key>member_uuid</key><string>M</string>");
+    }
+    void makeShared() const {
+        root.writePropertyList(clusterFile, "<key>nimbo_client_username</key><string>grid</string>");
+        root.writePropertyList(memberFile, "<key>server_port</key><integer>8170</integer>");
+    }
+    /// Writes settings to all three files.
+    Dictionary write() {
+        log.lines.clear();
+        const Dictionary configuration{
+            {"member_uuid", "M"}, {"nimbo_client_username", "second"}, {"server_port", 9000}};
+        return handler.writeSettingsWithRequest({{"configuration", configuration}}).dictionary();
+    }
+    /// Every file below the place, with its bytes.
+    [[nodiscard]] std::map<std::string, std::string> below(std::string_view place) const {
+        std::map<std::string, std::string> files;
+        for (const auto& entry : fs::recursive_directory_iterator(root.path(place))) {
+            if (entry.is_regular_file() && entry.path().filename() != "filling") {
+                const std::string host = '/' + fs::relative(entry.path(), root.path("/")).string();
+                files[host] = root.read(host);
+            }
+        }
+        return files;
+    }
+    void expectRefused(const Dictionary& answer, std::string_view file, const char* reason) const {
+        EXPECT_EQ(answer.get("writeStatus"), Value(400));
+        ASSERT_NE(answer.get("errorDescription").string(), nullptr);
+        EXPECT_THAT(*answer.get("errorDescription").string(), AllOf(HasSubstr(std::string(file)), HasSubstr(reason)));
+        EXPECT_FALSE(handler.checkSetupDone());
+    }
+    void expectTaken(const Dictionary& answer) const {
+        EXPECT_EQ(answer.get("writeStatus"), Value(0));
+        EXPECT_EQ(adminhost::readPropertyList(adminhost::diskPath(HostPath(std::string(memberFile)))),
+                  Value(Dictionary{{"server_port", 9000}}));
+    }
+
+    adminhost::test::TemporaryRoot root;
+    adminhost::test::CapturedLog log;
+    LumioRequestHandler handler;
+};
+
+TEST_F(FileSystems, MissingSharedFileSystemIsAFailedWriteAndNothingIsMadeInItsPlace) {
+    {
+        const Mount shared(root, "/shared");
+        makeShared();
+    }
+    expectRefused(write(), clusterFile, "No such file or directory");
+    EXPECT_TRUE(fs::is_empty(root.path("/shared"))) << "a file written there would be hidden by the next mount";
+}
+
+TEST_F(FileSystems, ReadOnlySharedFileSystemIsAFailedWriteAndItsFilesStay) {
+    const Mount shared(root, "/shared");
+    makeShared();
+    const auto before = below("/shared");
+    shared.makeReadOnly();
+    expectRefused(write(), clusterFile, "Read-only file system");
+    EXPECT_EQ(below("/shared"), before);
+}
+
+TEST_F(FileSystems, FullSharedFileSystemIsAFailedWriteAndItsFilesStayUntilThereIsRoom) {
+    const Mount shared(root, "/shared");
+    makeShared();
+    const auto before = below("/shared");
+    shared.fill();
+    expectRefused(write(), clusterFile, "No space left on device");
+    EXPECT_EQ(below("/shared"), before) << "and no temporary file is left";
+    shared.makeRoom();
+    expectTaken(write());
+    EXPECT_EQ(below("/shared").size(), before.size());
+}
+
+TEST_F(FileSystems, SharedFileSystemWithoutRoomForAnotherFileIsAFailedWrite) {
+    // The root and "Server", and the two settings files.
+    const Mount shared(root, "/shared", "nr_inodes=4,mode=755");
+    makeShared();
+    const auto before = below("/shared");
+    expectRefused(write(), clusterFile, "No space left on device");
+    EXPECT_EQ(below("/shared"), before);
+}
+
+TEST_F(FileSystems, ReadOnlyPlaceOfTheIdentityPreferencesEndsTheWriteBeforeTheSharedFileSystem) {
+    const Mount preferences(root, "/Library/Preferences");
+    makeIdentity();
+    makeShared();
+    const auto before = below("/shared");
+    preferences.makeReadOnly();
+    expectRefused(write(), identityFile, "Read-only file system");
+    EXPECT_EQ(below("/shared"), before);
+}
+
+TEST_F(FileSystems, FullPlaceOfTheIdentityPreferencesLeavesThemAsTheyWere) {
+    const Mount preferences(root, "/Library/Preferences");
+    makeIdentity();
+    makeShared();
+    const auto before = below("/Library");
+    preferences.fill();
+    expectRefused(write(), identityFile, "No space left on device");
+    EXPECT_EQ(below("/Library"), before);
+    preferences.makeRoom();
+    expectTaken(write());
+}
+
+TEST_F(FileSystems, UnreadableFileThatCannotBeKeptOnAReadOnlyFileSystemStays) {
+    const Mount shared(root, "/shared");
+    root.write(clusterFile, "precious text that is no property list");
+    const auto before = below("/shared");
+    shared.makeReadOnly();
+    expectRefused(write(), clusterFile, "Read-only file system");
+    EXPECT_EQ(below("/shared"), before);
+    EXPECT_THAT(log.lines, ElementsAre(AllOf(HasSubstr("cluster_preferences.plist cannot be loaded or kept: "),
+                                             HasSubstr("Read-only file system"))));
+}
+
+TEST_F(FileSystems, UnreadableFileIsKeptAlsoWhereTheNewOneFindsNoRoom) {
+    const Mount shared(root, "/shared");
+    root.write(clusterFile, "precious text that is no property list");
+    shared.fill();
+    expectRefused(write(), clusterFile, "No space left on device");
+    for (const auto& [path, text] : below("/shared")) {
+        EXPECT_EQ(text, "precious text that is no property list") << path;
+    }
+    EXPECT_EQ(root.read(clusterFile), "precious text that is no property list");
+}
+
+TEST_F(FileSystems, MarkerOnAReadOnlyFileSystemIsLoggedAndTheSettingsAreWritten) {
+    makeShared();
+    const Mount state(root, "/var/lumio/server");
+    state.makeReadOnly();
+    expectTaken(write());
+    EXPECT_FALSE(handler.checkSetupDone());
+    EXPECT_THAT(log.lines,
+                Contains("adminhost_lumio: failed to create file at path: /var/lumio/server/.lumio_setup_done"));
+}
+
+TEST_F(FileSystems, HistoryWithoutRoomIsAnErrorThatLeavesNoHalfEntry) {
+    const Mount state(root, "/var/lib/adminhostd");
+    root.write(identityFile, std::string(40'000, 'x'));
+    const HostPath directory = adminhost::historyDirectory("lumio");
+    const std::vector<HostPath> files{HostPath(std::string(identityFile))};
+    ASSERT_FALSE(adminhost::keepHistory(directory, files, {}));
+    const auto before = below("/var/lib/adminhostd");
+    const auto error = adminhost::keepHistory(directory, files, {});
+    ASSERT_TRUE(error);
+    EXPECT_THAT(*error->description, HasSubstr("No space left on device"));
+    EXPECT_EQ(below("/var/lib/adminhostd"), before);
+    EXPECT_EQ(adminhost::readHistory(directory, {}, {}).size(), 1U);
+
+    state.makeReadOnly();
+    const auto refused = adminhost::keepHistory(directory, files, {});
+    ASSERT_TRUE(refused);
+    EXPECT_THAT(*refused->description, HasSubstr("Read-only file system"));
+}
+
+/// Runs this program again as the superuser of a user namespace, with mounts of its own; returns when it runs there.
+void enterNamespace(int argc, char** argv) {
+    constexpr const char* inside = "ADMINHOST_TEST_NAMESPACE";
+    if (std::getenv(inside) != nullptr) {
+        return;
+    }
+    ::setenv(inside, "1", 1);
+    std::string program = fs::read_symlink("/proc/self/exe");
+    std::string words[] = {"unshare", "--map-root-user", "--mount", "--"};
+    std::vector<char*> command;
+    for (std::string& word : words) {
+        command.push_back(word.data());
+    }
+    command.push_back(program.data());
+    command.insert(command.end(), argv + 1, argv + argc);
+    command.push_back(nullptr);
+    ::execvp("unshare", command.data());
+    throw std::runtime_error(std::string("unshare: ") + std::strerror(errno));
+}
+
+}  // namespace
+}  // namespace lumio
+
+int main(int argc, char** argv) {
+    lumio::enterNamespace(argc, argv);
+    testing::InitGoogleTest(&argc, argv);
+    return RUN_ALL_TESTS();
+}
