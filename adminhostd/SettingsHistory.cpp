@@ -101,12 +101,7 @@ std::optional<Error> keepHistory(const HostPath& directory, const std::vector<Ho
     if (auto error = makeDirectories(diskPath(directory), mine)) {
         return error;
     }
-    std::error_code error;
-    for (fs::directory_iterator at(diskPath(directory).text(), error), end; !error && at != end; at.increment(error)) {
-        if (at->path().filename().string().starts_with(unfinished)) {
-            removeAll(below(directory, at->path().filename().string()));  // of a process that was killed
-        }
-    }
+    removeUnfinishedHistory(directory);
     std::vector<std::uint64_t> numbers = numbersIn(directory);
     const std::uint64_t number = numbers.empty() ? 1 : numbers.back() + 1;
     const HostPath making = below(directory, std::string(unfinished) + std::to_string(number));
@@ -115,6 +110,7 @@ std::optional<Error> keepHistory(const HostPath& directory, const std::vector<Ho
     }
     std::optional<Error> failed = fill(making, files, about);
     if (!failed) {
+        std::error_code error;
         fs::rename(diskPath(making).text(), diskPath(below(directory, fmt::format("{:08}", number))).text(), error);
         if (error) {
             failed = failure("cannot name the entry", error);
@@ -129,6 +125,16 @@ std::optional<Error> keepHistory(const HostPath& directory, const std::vector<Ho
         removeAll(below(directory, fmt::format("{:08}", numbers[i])));
     }
     return std::nullopt;
+}
+
+void removeUnfinishedHistory(const HostPath& directory) {
+    std::error_code error;
+    for (fs::directory_iterator at(diskPath(directory).text(), error), end; !error && at != end; at.increment(error)) {
+        const std::string name = at->path().filename();
+        if (name.starts_with(unfinished)) {
+            removeAll(below(directory, name));
+        }
+    }
 }
 
 Array readHistory(const HostPath& directory, const std::vector<std::string>& keys,

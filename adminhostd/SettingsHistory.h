@@ -27,6 +27,10 @@ constexpr std::size_t historyMaximum = 50;  ///< entries
 [[nodiscard]] std::optional<Error> keepHistory(const HostPath& directory, const std::vector<HostPath>& files,
                                                const Dictionary& about);
 
+/// Removes what a process that was killed while it added an entry left; keepHistory() does so too. No entry of another
+/// process may be in the making.
+void removeUnfinishedHistory(const HostPath& directory);
+
 /// The entries, oldest first: `about` with "number" (an integer) and "settings", the top-level keys of the entry's
 /// files in one dictionary. Of these only the named ones are answered; a secret's value is the text "(secret)".
 /// What cannot be read of an entry is left out.

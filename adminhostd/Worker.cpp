@@ -7,6 +7,7 @@
 #include "platform/directory/Entries.h"
 #include "platform/directory/LocalAccounts.h"
 #include "platform/files/Path.h"
+#include "platform/files/ReplaceFile.h"
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
 #include "platform/value/Text.h"
@@ -54,6 +55,7 @@ class Worker {
   private:
     Value configure(const Dictionary& configuration);
     void load(const DiskPath& file, Array& plugins, Array& refused);
+    void removeLeftovers() const;
     Value perform(const Dictionary& order);
     Value query(const Dictionary& order);
     static Value history(const Plugin& plugin);
@@ -124,6 +126,19 @@ Value Worker::configure(const Dictionary& configuration) {
         hello.set("databaseTool", *problem);
     }
     return hello;
+}
+
+/// Of workers that were killed in the middle of a write.
+void Worker::removeLeftovers() const {
+    for (const Plugin* plugin : _plugins) {
+        if (plugin->settingsFiles == nullptr) {
+            continue;
+        }
+        for (const HostPath& file : plugin->settingsFiles()) {
+            adminhost::removeLeftovers(file);
+        }
+        removeUnfinishedHistory(historyDirectory(plugin->name));
+    }
 }
 
 Value Worker::performWith(const Plugin& plugin, std::string_view command, const Dictionary& order) {
@@ -269,6 +284,8 @@ int Worker::run() {
                 return 1;
             }
             sent = writeFrame(_descriptor, FrameType::hello, configure(*payload));
+            // Only now: a shared file system that hangs may hold up requests, never the start.
+            removeLeftovers();
         } else if (frame->type == FrameType::perform) {
             sent = writeFrame(_descriptor, FrameType::answer, perform(*payload));
             setTaskDeadline(std::nullopt);

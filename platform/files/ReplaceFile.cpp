@@ -38,9 +38,9 @@ std::string temporaryPrefix(std::string_view name) {
     return fmt::format(".{}.adminhost-", name);
 }
 
-/// Removes what killed writers of the same file left. A living writer holds a lock on its temporary file. Failures are
-/// not the coming write's matter.
-void removeLeftovers(const FilePlace& place) {
+/// Removes what killed writers of the same file left. A living writer, here or on another machine that shares the
+/// directory, holds an exclusive lock on its temporary file. Failures are not the coming write's matter.
+void removeLeftoversIn(const FilePlace& place) {
     const int copy = ::openat(place.directory.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     if (copy < 0) {
         return;
@@ -59,7 +59,8 @@ void removeLeftovers(const FilePlace& place) {
         }
         const FileDescriptor leftover(
             ::openat(place.directory.get(), entry->d_name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
-        if (leftover.isOpen() && ::flock(leftover.get(), LOCK_EX | LOCK_NB) == 0) {
+        // A shared lock shows that as well, and network file systems give it to a file opened for reading.
+        if (leftover.isOpen() && ::flock(leftover.get(), LOCK_SH | LOCK_NB) == 0) {
             ::unlinkat(place.directory.get(), entry->d_name, 0);
         }
     }
@@ -97,9 +98,10 @@ class TemporaryFile {
                 return errno;
             }
             _name = name;
-            // Between creation and lock another writer may have taken the file for a leftover.
+            // Between creation and lock another writer may have taken the file for a leftover: who holds a lock now is
+            // about to remove it.
             struct stat status {};
-            ::flock(_file.get(), LOCK_EX | LOCK_NB);
+            ::flock(_file.get(), LOCK_EX);
             if (::fstat(_file.get(), &status) != 0) {
                 return errno;
             }
@@ -127,7 +129,12 @@ class TemporaryFile {
     int flush() noexcept { return ::fsync(_file.get()) == 0 ? 0 : errno; }
 
     int moveIntoPlace() noexcept {
-        // Closed first: some network file systems report a write's failure only then.
+        // Closed first: some network file systems report a write's failure only then. The second descriptor keeps the
+        // lock until the file has its name.
+        const FileDescriptor lock(::fcntl(_file.get(), F_DUPFD_CLOEXEC, 0));
+        if (!lock.isOpen()) {
+            return errno;
+        }
         if (const int number = _file.close(); number != 0) {
             return number;
         }
@@ -280,7 +287,7 @@ std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path) {
     if (const int number = openPlace(diskPath(path), place); number != 0) {
         return failure("open the directory of", path, number);
     }
-    removeLeftovers(place);
+    removeLeftoversIn(place);
     FileDescriptor old;
     struct stat status {};
     if (auto error = openOld(place, path, old, status)) {
@@ -310,6 +317,13 @@ std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path) {
         return failure("flush the directory after replacing", path, number);
     }
     return std::nullopt;
+}
+
+void removeLeftovers(const HostPath& path) {
+    FilePlace place;
+    if (openPlace(diskPath(path), place) == 0) {
+        removeLeftoversIn(place);
+    }
 }
 
 std::optional<HostPath> keepUnreadable(const HostPath& path, Error* error) {

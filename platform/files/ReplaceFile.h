@@ -23,7 +23,12 @@ namespace adminhost {
 /// directory cannot be flushed the new file is in place, but might not outlast a power cut; the error says so.
 ///
 /// Temporary files that killed processes left for the same file are removed first; those of living writers are not.
+/// Several may write the same file at once, also from machines that share the directory: one of them is the last.
 [[nodiscard]] std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path);
+
+/// Removes the temporary files that killed processes left for the file, as replaceFile() does before it writes. Those
+/// that cannot be removed stay.
+void removeLeftovers(const HostPath& path);
 
 /// Keeps a file that cannot be loaded beside its place before it is replaced: as PATH ".unreadable-" and the moment
 /// ("2026-01-31T080000Z", UTC), with "-2" and so on after it when that is taken. The file stays in its place too, so

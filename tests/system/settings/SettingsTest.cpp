@@ -6,6 +6,9 @@
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 
+#include <csignal>
+#include <filesystem>
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -67,6 +70,29 @@ TEST_F(Settings, TwoWritersComeOneAfterTheOtherAndNothingIsMixed) {
     const Value read = valueOf(post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})"));
     const Dictionary& config = *read.dictionary()->get("configuration").dictionary();
     EXPECT_EQ(config.get("server_host"), config.get("tunnel_server_host"));
+}
+
+TEST_F(Settings, NextStartRemovesWhatKilledWorkersLeftAndNothingElse) {
+    const std::string server = "/Library/SorvaneProducer/Shared/Server/";
+    const std::vector<std::string> leftovers{
+        "/Library/Preferences/.com.brenn.lumioserverd.plist.adminhost-0123456789abcdef",
+        server + ".cluster_preferences.plist.adminhost-0123456789abcdef",
+        server + ".member_preferences_" + test::SampleRoot::uuidOf("member", "media1") +
+            ".plist.adminhost-0123456789abcdef",
+        "/var/lib/adminhostd/history/lumio/unfinished-1/0.plist"};
+    for (const std::string& leftover : leftovers) {
+        root.write(leftover, "half");
+    }
+    root.write(server + ".other.plist.adminhost-0123456789abcdef", "another program's");
+    const pid_t first = daemon.workerPid();
+    ASSERT_EQ(::kill(first, SIGKILL), 0);
+    ASSERT_TRUE(daemon.waitForLog("was killed by signal 9"));
+    EXPECT_EQ(post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})").status, 200);
+    EXPECT_NE(daemon.workerPid(), first);
+    for (const std::string& leftover : leftovers) {
+        EXPECT_FALSE(std::filesystem::exists(root.disk(leftover))) << leftover;
+    }
+    EXPECT_TRUE(std::filesystem::exists(root.disk(server + ".other.plist.adminhost-0123456789abcdef")));
 }
 
 TEST_F(Settings, RequestThatAStatementCannotCarryIsRefusedWholeAndChangesNothing) {

@@ -86,6 +86,14 @@ TEST_F(History, UnfinishedEntryOfAKilledProcessIsRemovedAndNoEntry) {
     EXPECT_FALSE(fs::exists(root.path("/var/lib/adminhostd/history/lumio/unfinished-1")));
 }
 
+TEST_F(History, UnfinishedEntryIsRemovedWithoutANewOneToo) {
+    keep();
+    root.write("/var/lib/adminhostd/history/lumio/unfinished-2/0.plist", "half");
+    removeUnfinishedHistory(directory);
+    EXPECT_FALSE(fs::exists(root.path("/var/lib/adminhostd/history/lumio/unfinished-2")));
+    EXPECT_EQ(read().size(), 1U);
+}
+
 TEST_F(History, DirectoryThatCannotBeMadeIsAnErrorThatSaysWhy) {
     root.write("/var/lib", "a file where the directory belongs");
     const auto error = keepHistory(directory, files, {});

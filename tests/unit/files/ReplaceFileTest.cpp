@@ -1,6 +1,7 @@
 #include "platform/files/Directory.h"
 #include "platform/files/ReplaceFile.h"
 
+#include <atomic>
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
@@ -10,6 +11,8 @@
 #include <regex>
 #include <set>
 #include <string>
+#include <thread>
+#include <vector>
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -238,6 +241,15 @@ TEST_F(ReplaceFile, LeftoversOfKilledWritersAreRemoved) {
     EXPECT_THAT(names(), ElementsAre("file"));
 }
 
+TEST_F(ReplaceFile, LeftoversAreRemovedWithoutAWriteTooAndTheFileStays) {
+    write("file", "old");
+    write(_leftover, "half", 0600);
+    removeLeftovers(HostPath(path()));
+    EXPECT_THAT(names(), ElementsAre("file"));
+    EXPECT_EQ(read(), "old");
+    removeLeftovers(HostPath(path("missing/file")));
+}
+
 TEST_F(ReplaceFile, LeftoversOfOtherFilesAndLikeNamesStay) {
     const std::set<std::string> others = {".other.adminhost-0123456789abcdef", ".file.adminhost-0123456789abcde",
                                           ".file.adminhost-0123456789abcdeg", "file.adminhost-0123456789abcdef",
@@ -260,6 +272,27 @@ TEST_F(ReplaceFile, TemporaryFileOfALivingWriterStays) {
     ::close(writer);
     EXPECT_EQ(replace("newer"), std::nullopt);
     EXPECT_THAT(names(), ElementsAre("file"));
+}
+
+TEST_F(ReplaceFile, WritersAtTheSameTimeNeverTakeEachOthersFilesForLeftovers) {
+    constexpr int writers = 4;
+    constexpr int times = 300;
+    std::atomic<int> failures = 0;
+    std::vector<std::thread> threads;
+    threads.reserve(writers);
+    for (int writer = 0; writer < writers; ++writer) {
+        threads.emplace_back([&, bytes = std::string(5000, static_cast<char>('a' + writer))] {
+            for (int i = 0; i < times; ++i) {
+                failures += replace(bytes) ? 1 : 0;
+            }
+        });
+    }
+    for (std::thread& thread : threads) {
+        thread.join();
+    }
+    EXPECT_EQ(failures, 0);
+    EXPECT_THAT(names(), ElementsAre("file"));
+    EXPECT_EQ(read(), std::string(5000, read().front())) << "one writer's bytes, nothing mixed";
 }
 
 TEST_F(ReplaceFile, LinkNamedLikeALeftoverHarmsNothing) {
