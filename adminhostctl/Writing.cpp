@@ -8,7 +8,7 @@ namespace adminhost::ctl {
 namespace {
 
 constexpr std::string_view restartAdvice =
-    "the service has to be restarted for this to take effect: adminhostctl recycleService";
+    "the service has to be restarted for this to take effect: adminhostctl stopService, then startService";
 
 Array changesValue(std::span<const Change> changes) {
     Array all;

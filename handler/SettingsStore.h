@@ -38,7 +38,7 @@ class SettingsStore {
     [[nodiscard]] static std::optional<adminhost::Dictionary> clusterPreferences();
 
     /// The service's database file: the production entry of the location file, else "Server/db.sqlite3" on the shared
-    /// file system. A relative path is answered as it stands.
+    /// file system. A relative path is answered as it stands. A location file above 1 MiB counts as unreadable.
     [[nodiscard]] static adminhost::HostPath dbPath();
     /// Whether a file system entry exists at dbPath.
     [[nodiscard]] static bool dbPathExists();

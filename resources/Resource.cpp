@@ -8,10 +8,20 @@ namespace lumio {
 using adminhost::Dictionary;
 using adminhost::Value;
 
-std::unique_ptr<Resource> Resource::resourceWithDictionary(Dictionary dictionary) {
-    auto resource = std::make_unique<Resource>();
-    resource->readRow(std::move(dictionary));
+std::unique_ptr<Resource> Resource::initWithGUID(std::optional<std::string> guid) {
+    auto resource = init();
+    resource->setGuid(std::move(guid));
     return resource;
+}
+
+std::unique_ptr<Resource> Resource::initWithDictionary(Dictionary row) {
+    auto resource = init();
+    resource->readRow(std::move(row));
+    return resource;
+}
+
+std::unique_ptr<Resource> Resource::resourceWithDictionary(Dictionary dictionary) {
+    return initWithDictionary(std::move(dictionary));
 }
 
 std::optional<Dictionary> Resource::localizationsForResourceNamed(std::string_view name,

@@ -30,6 +30,10 @@ class Resource {
     Resource& operator=(const Resource&) = delete;
     virtual ~Resource() = default;
 
+    // Objects of the base class itself, whose type word names no table. Each class below has its own.
+    [[nodiscard]] static std::unique_ptr<Resource> init() { return std::make_unique<Resource>(); }
+    [[nodiscard]] static std::unique_ptr<Resource> initWithGUID(std::optional<std::string> guid);
+    [[nodiscard]] static std::unique_ptr<Resource> initWithDictionary(adminhost::Dictionary row);
     /// Always a plain Resource, whichever class it is asked through. That is deliberate.
     [[nodiscard]] static std::unique_ptr<Resource> resourceWithDictionary(adminhost::Dictionary dictionary);
     /// Does nothing.
@@ -57,6 +61,12 @@ class Resource {
             }
             return results;
         }
+    }
+
+    /// As above, the receiving class itself being the result class.
+    [[nodiscard]] static auto querySorvaneDatabase(const std::string& statement,
+                                                   std::optional<adminhost::Error>& error) {
+        return querySorvaneDatabase<Resource>(statement, error);
     }
 
     /// The UUID that the resource was made with, else the record's "uuid".
@@ -148,7 +158,6 @@ class ResourceClass : public Resource {
     }
 
     using Resource::querySorvaneDatabase;
-    /// As above, the receiving class itself being the result class.
     [[nodiscard]] static auto querySorvaneDatabase(const std::string& statement,
                                                    std::optional<adminhost::Error>& error) {
         return Resource::querySorvaneDatabase<Self>(statement, error);

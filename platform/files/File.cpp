@@ -1,5 +1,7 @@
 #include "platform/files/File.h"
 
+#include "platform/files/FileDescriptor.h"
+
 #include <cerrno>
 #include <system_error>
 
@@ -9,22 +11,6 @@
 
 namespace adminhost {
 namespace {
-
-class Descriptor {
-  public:
-    explicit Descriptor(int descriptor) noexcept : _descriptor(descriptor) {}
-    Descriptor(const Descriptor&) = delete;
-    Descriptor& operator=(const Descriptor&) = delete;
-    ~Descriptor() {
-        if (_descriptor >= 0) {
-            ::close(_descriptor);
-        }
-    }
-    [[nodiscard]] int get() const noexcept { return _descriptor; }
-
-  private:
-    int _descriptor;
-};
 
 std::nullopt_t fail(const DiskPath& path, int number, Error* error) {
     if (error != nullptr) {
@@ -36,9 +22,12 @@ std::nullopt_t fail(const DiskPath& path, int number, Error* error) {
 }  // namespace
 
 std::optional<std::string> readFile(const DiskPath& path, std::size_t maximum, Error* error) {
-    const Descriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    if (path.text().find('\0') != std::string::npos) {  // the system would open what stands before it
+        return fail(path, EINVAL, error);
+    }
+    const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
     struct stat status {};
-    if (file.get() < 0 || ::fstat(file.get(), &status) != 0) {
+    if (!file.isOpen() || ::fstat(file.get(), &status) != 0) {
         return fail(path, errno, error);
     }
     if (!S_ISREG(status.st_mode)) {

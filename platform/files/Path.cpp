@@ -37,7 +37,8 @@ HostPath hostPath(const DiskPath& path) {
 
 bool exists(const DiskPath& path) noexcept {
     struct stat status {};
-    return ::stat(path.c_str(), &status) == 0;
+    // The system would look at what stands before a NUL.
+    return path.text().find('\0') == std::string::npos && ::stat(path.c_str(), &status) == 0;
 }
 
 }  // namespace adminhost

@@ -74,7 +74,7 @@ TEST_F(Apply, ChangesAreShownAppliedReadBackAndThenSettled) {
 
     const ProgramResult apply = ctl({"apply", desired});
     EXPECT_EQ(apply.status, 0) << apply.output;
-    EXPECT_THAT(apply.output, HasSubstr("has to be restarted"));
+    EXPECT_THAT(apply.output, HasSubstr("adminhostctl stopService, then startService")) << "recycling does nothing";
     EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8180\n");
     EXPECT_EQ(root.sql("select value from properties where name='default_language'"), "fr\n");
     EXPECT_EQ(ctl({"apply", desired}).output, "no change\n");

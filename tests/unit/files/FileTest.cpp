@@ -48,6 +48,13 @@ TEST_F(ReadFile, MissingFileDirectoryAndPipeAreErrorsThatNameThePath) {
     EXPECT_EQ(error.code, EINVAL);
 }
 
+TEST_F(ReadFile, PathWithANulNamesNoFile) {
+    std::ofstream(_directory / "f") << "text";
+    Error error;
+    EXPECT_EQ(readFile(DiskPath((_directory / "f").string() + std::string("\0x", 2)), 10, &error), std::nullopt);
+    EXPECT_EQ(error.code, EINVAL);
+}
+
 TEST_F(ReadFile, FilesWithoutASizeAreReadToTheirEnd) {
     const auto status = readFile(DiskPath("/proc/self/status"), 1U << 20U);
     ASSERT_TRUE(status);

@@ -72,6 +72,7 @@ TEST_F(Path, ExistsFollowsLinks) {
     EXPECT_FALSE(exists(DiskPath(place + "/missing")));
     EXPECT_FALSE(exists(DiskPath(place + "/link")));
     EXPECT_FALSE(exists(DiskPath("")));
+    EXPECT_FALSE(exists(DiskPath(place + std::string("\0x", 2)))) << "a path with a NUL names nothing";
     std::filesystem::create_directory(place + "/missing");
     EXPECT_TRUE(exists(DiskPath(place + "/link")));
     std::filesystem::remove_all(place);

@@ -181,5 +181,12 @@ TEST_F(SettingsStoreTest, DatabasePathIsLookedForBelowTheSystemRoot) {
     EXPECT_TRUE(SettingsStore::dbPathExists());
 }
 
+TEST_F(SettingsStoreTest, DatabaseValueWithANulNamesNoFile) {
+    root.write("/db/x.sqlite3", "");
+    const std::string value("/db/x.sqlite3\0y", 15);
+    EXPECT_EQ(databaseFor("production: database: " + value), value);
+    EXPECT_FALSE(SettingsStore::dbPathExists());
+}
+
 }  // namespace
 }  // namespace lumio

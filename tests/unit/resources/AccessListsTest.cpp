@@ -133,6 +133,20 @@ TEST_F(AccessLists, DictionaryShowsNamesOfPeopleAndGroupsAndWhoUsesTheCamera) {
                                                                                    {"type", "group"}})}));
 }
 
+TEST_F(AccessLists, OfSeveralPeopleWithTheUuidOfWhoUsesItTheLastIsShown) {
+    auto last = record("dsRecTypeStandard:Users", "last", "A");
+    last.attributes[std::string(adminhost::directory::realName)] = {"Last One", "Other Name"};
+    useDirectory(std::vector{record("dsRecTypeStandard:Users", "first", "A"), last});
+    EXPECT_EQ(camera()->dictionary()->get("useUser"), Value("Last One"));
+    useDirectory(std::vector{last, record("dsRecTypeStandard:Users", "first", "A")});
+    EXPECT_EQ(camera()->dictionary()->get("useUser"), Value("first")) << "no full name: the short one";
+}
+
+TEST_F(AccessLists, GroupDoesNotUseACamera) {
+    root.sql(database, "update cameras set use_user_uuid='" + uuidOf("group:editors") + "'");
+    EXPECT_FALSE(camera()->dictionary()->contains("useUser"));
+}
+
 TEST_F(AccessLists, ListedCamerasAccessSwitchIsTextUntilDictionaryMakesItABoolean) {
     const auto hall = camera(1);
     EXPECT_EQ(hall->data()->get("access_control_enabled"), Value("f"));
@@ -184,6 +198,13 @@ TEST_F(AccessLists, AccessListIsTheRowsOfTypeAndIdInOrderWithDuplicates) {
     allow(7, "B");
     root.sql(database, "insert into access_control_entries values('other type','camera',7)");
     EXPECT_THAT(camera()->getUserAndGroupACLs(), ElementsAre("B", "A", "B"));
+}
+
+TEST_F(AccessLists, RowsOfTheAccessListWithoutAUuidAreSkipped) {
+    // The empty line within the text ends its record, and what follows is a record without the column.
+    root.sql(database, "insert into access_control_entries values('A' || char(10,10) || 'rest','Camera',7)");
+    allow(7, "B");
+    EXPECT_THAT(camera()->getUserAndGroupACLs(), ElementsAre("A", "B"));
 }
 
 TEST_F(AccessLists, FailedAccessListQueryIsLoggedAndEmpty) {
@@ -306,6 +327,14 @@ TEST_F(AccessLists, TwoAdditionsOfUsersRunTheToolOnce) {
     EXPECT_THAT(calls(),
                 ElementsAre("--add_access --resource_type camera --resource_uuid C-7 --record_type user --shortname a "
                             "--shortname b "));
+}
+
+TEST_F(AccessLists, EachWordIsAnArgumentOfItsOwn) {
+    root.writeTool(tool, "#!/bin/sh\nprintf '%s\\n' \"$@\" >> " + root.path("/calls").string() + "\n");
+    change({Value(Dictionary{{"type", "user"}, {"shortName", "a"}, {"_newid_", true}}),
+            Value(Dictionary{{"type", "user"}, {"shortName", "b c"}, {"_newid_", true}})});
+    EXPECT_THAT(calls(), ElementsAre("--add_access", "--resource_type", "camera", "--resource_uuid", "C-7",
+                                     "--record_type", "user", "--shortname", "a", "--shortname", "b c"));
 }
 
 TEST_F(AccessLists, AllFourKindsOfChangeRunInTheirOrder) {

@@ -3,7 +3,10 @@
 #include "resources/Resource.h"
 #include "tests/support/TemporaryRoot.h"
 
+#include <chrono>
+#include <cstdio>
 #include <filesystem>
+#include <thread>
 
 #include <gtest/gtest.h>
 
@@ -175,21 +178,22 @@ TEST_F(QueryRunner, CorruptDatabaseIsAnError) {
 }
 
 TEST_F(QueryRunner, LockedDatabaseIsAnErrorAtOnce) {
-    // A second process holds the exclusive lock for as long as its input stays open.
-    const std::string command = "mkfifo " + root.path("/hold").string() + " && (sqlite3 " +
-                                root.path(database).string() + " < " + root.path("/hold").string() + " &)";
-    ASSERT_EQ(std::system(command.c_str()), 0);  // NOLINT(cert-env33-c): a test's own fixed command
-    std::FILE* hold = std::fopen(root.path("/hold").c_str(), "w");
-    ASSERT_NE(hold, nullptr);
-    const std::string marker = root.path("/locked");
-    std::fprintf(hold, "begin exclusive;\n.once %s\nselect 1;\n", marker.c_str());
-    std::fflush(hold);
-    while (!std::filesystem::exists(marker) || std::filesystem::file_size(marker) == 0) {
+    // A second process holds the exclusive lock until it has read its input to the end.
+    const std::string command = "exec /usr/bin/sqlite3 '" + root.path(database).string() + "'";
+    std::FILE* holder = ::popen(command.c_str(), "we");  // NOLINT(cert-env33-c): a test's own fixed command
+    ASSERT_NE(holder, nullptr);
+    std::fprintf(holder, "begin exclusive;\n.once '%s'\nselect 1;\n", root.path("/locked").c_str());
+    std::fflush(holder);
+    const auto bound = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+    while (root.read("/locked").empty() && std::chrono::steady_clock::now() < bound) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(1));
     }
+    EXPECT_EQ(root.read("/locked"), "1\n");
     EXPECT_EQ(run("select * from t"), std::nullopt);
+    EXPECT_EQ(::pclose(holder), 0);
     ASSERT_TRUE(error);
     EXPECT_NE(error->description->find("locked"), std::string::npos) << *error->description;
-    std::fclose(hold);
+    EXPECT_TRUE(run("select * from t"));
 }
 
 TEST_F(QueryRunner, DoubleQuotedTextThatNamesAColumnIsReadAsTheColumn) {

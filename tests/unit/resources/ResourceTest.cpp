@@ -65,6 +65,29 @@ TEST_F(ResourceTest, DescriptionOfAResourceMadeByUuidShowsANullRecordAndLoadsNot
     EXPECT_EQ(camera->description(), "Camera - guid: U-A, \n(null)");
 }
 
+TEST_F(ResourceTest, BaseClassMakesItsOwnObjects) {
+    EXPECT_EQ(Resource::init()->description(), "Resource - guid: (null), \n(null)");
+    EXPECT_EQ(Resource::initWithGUID("U-A")->description(), "Resource - guid: U-A, \n(null)");
+    const auto rows = Resource::querySorvaneDatabase("select uuid,created_at from cameras where uuid='U-A'", error);
+    ASSERT_TRUE(rows);
+    ASSERT_EQ(rows->size(), 1U);
+    EXPECT_EQ(rows->front()->resourceType(), "");
+    EXPECT_EQ(rows->front()->guid(), "U-A");
+    EXPECT_TRUE(rows->front()->data()->get("created_at").date());
+}
+
+TEST_F(ResourceTest, ReceivingClassIsTheResultClass) {
+    const auto rows = Camera::querySorvaneDatabase("select uuid from cameras where uuid='U-A'", error);
+    ASSERT_TRUE(rows);
+    EXPECT_EQ(rows->front()->resourceType(), "camera");
+    const auto none = Camera::querySorvaneDatabase("select uuid from cameras where uuid='none'", error);
+    ASSERT_TRUE(none);
+    EXPECT_TRUE(none->empty());
+    EXPECT_EQ(error, std::nullopt);
+    EXPECT_FALSE(Camera::querySorvaneDatabase("select uuid from missing", error));
+    EXPECT_EQ(error->domain, "sqliteQuery");
+}
+
 TEST_F(ResourceTest, DescriptionPrintsTheGuidFieldAsItStands) {
     const auto camera = Camera::initWithDictionary(Dictionary{{"uuid", "U"}});
     EXPECT_TRUE(camera->description().starts_with("Camera - guid: (null), \n{\n    uuid = U;\n"));

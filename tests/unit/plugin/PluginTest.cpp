@@ -1,0 +1,114 @@
+// The plug-in as the worker sees it: its table of operations, through the entry point of the built file.
+
+#include "adminhostd/PluginFile.h"
+#include "platform/directory/LocalAccounts.h"
+#include "tests/support/TemporaryRoot.h"
+
+#include <filesystem>
+#include <map>
+#include <stdexcept>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace adminhost {
+namespace {
+
+using testing::ElementsAre;
+
+class PluginTable : public testing::Test {
+  protected:
+    void SetUp() override {
+        std::string problem;
+        plugin = loadPlugin(DiskPath(PLUGIN), problem);
+        ASSERT_NE(plugin, nullptr) << problem;
+    }
+    void TearDown() override { setDirectoryNodes({localAccounts()}); }
+
+    /// The code of an error response; empty for every other answer.
+    [[nodiscard]] std::string errorOf(std::string_view command) const {
+        const Response response = plugin->perform(command, {});
+        const std::string* code = response.dictionary().get("error").string();
+        return response.kind() == Response::Kind::error && code != nullptr ? *code : "";
+    }
+    /// Every file below the root with its content.
+    [[nodiscard]] std::map<std::string, std::string> files() const {
+        std::map<std::string, std::string> all;
+        for (const auto& entry : std::filesystem::recursive_directory_iterator(root.path(""))) {
+            const std::string place = entry.path().string().substr(root.path("").string().size());
+            all.emplace(place, entry.is_regular_file() && !entry.is_symlink() ? root.read(place) : "");
+        }
+        return all;
+    }
+
+    test::TemporaryRoot root;
+    test::CapturedLog log;
+    const Plugin* plugin = nullptr;
+};
+
+TEST_F(PluginTable, EveryDescribedCommandIsServed) {
+    const Value described = plugin->describe();
+    ASSERT_EQ(described.array()->size(), 12U);
+    for (const Value& command : *described.array()) {
+        const std::string& name = *command.dictionary()->get("name").string();
+        EXPECT_NE(errorOf(name), "UNKNOWN_COMMAND") << name;
+        EXPECT_NE(errorOf(name), "INTERNAL_ERROR") << name;
+    }
+}
+
+TEST_F(PluginTable, CommandThatIsNotDescribedIsAnError) {
+    EXPECT_EQ(errorOf("getCamera"), "UNKNOWN_COMMAND");
+    EXPECT_EQ(errorOf("getCamerasWithRequest"), "UNKNOWN_COMMAND");
+    EXPECT_EQ(errorOf(""), "UNKNOWN_COMMAND");
+}
+
+TEST_F(PluginTable, CommandsThatThisReleaseDoesNotOfferSaySo) {
+    std::vector<std::string> commands;
+    const Value described = plugin->describe();
+    for (const Value& command : *described.array()) {
+        const std::string& name = *command.dictionary()->get("name").string();
+        if (errorOf(name) == "NOT_AVAILABLE") {
+            commands.push_back(name);
+        }
+    }
+    EXPECT_THAT(commands, ElementsAre("getState", "getLogPaths", "startService", "stopService", "validateSettings",
+                                      "createNimboAccount", "getWorkflows"));
+}
+
+TEST_F(PluginTable, RecycleServiceAnswersNothingAndChangesNothingWhateverTheVariant) {
+    for (const char* const tool : {"/usr/sbin/lumioctl", "/usr/bin/lumioconfig",
+                                   "/usr/share/sorvaneproducer/lumioserverd/script/setup_lumioserverd_preferences"}) {
+        root.writeTool(tool, "#!/bin/sh\necho called >> " + root.path("/calls").string() + "\n");
+    }
+    root.sql("/Library/SorvaneProducer/Shared/Server/db.sqlite3", "create table cameras(id)");
+    const auto before = files();
+    for (const Value& variant : {Value(), Value("withDetails"), Value(""), Value(Dictionary{{"a", 1}})}) {
+        Dictionary request;
+        request.set("variant", variant);
+        EXPECT_EQ(plugin->perform("recycleService", request).kind(), Response::Kind::nothing);
+    }
+    EXPECT_EQ(files(), before);
+    EXPECT_THAT(log.lines, testing::IsEmpty());
+}
+
+TEST_F(PluginTable, ExceptionInsideAnOperationIsLoggedAndAnsweredAsAnError) {
+    root.sql("/Library/SorvaneProducer/Shared/Server/db.sqlite3",
+             "create table cameras(id integer primary key,name,uuid,create_user_uuid,created_at,update_user_uuid,"
+             "updated_at,last_recording_uuid,use_user_uuid,used_at,recording_status,access_control_enabled,disabled);"
+             "insert into cameras(use_user_uuid) values('A');");
+    setDirectoryNodes(
+        {{"/Broken", [](Error*) -> std::unique_ptr<DirectoryNode> { throw std::runtime_error("no memory"); }}});
+    EXPECT_EQ(errorOf("getCameras"), "INTERNAL_ERROR");
+    EXPECT_THAT(log.lines, ElementsAre("adminhost_lumio: getCameras failed: no memory"));
+}
+
+TEST_F(PluginTable, SettingsFilesAreThoseThatAWriteReplaces) {
+    root.writePropertyList("/Library/Preferences/com.brenn.lumioserverd.plist",
+                           "<key>shared_filesystem</key><string>/s</string><key>member_uuid</key><string>M</string>");
+    EXPECT_THAT(plugin->settingsFiles(), ElementsAre(HostPath("/Library/Preferences/com.brenn.lumioserverd.plist"),
+                                                     HostPath("/s/Server/cluster_preferences.plist"),
+                                                     HostPath("/s/Server/member_preferences_M.plist")));
+}
+
+}  // namespace
+}  // namespace adminhost
