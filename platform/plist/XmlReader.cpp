@@ -325,7 +325,8 @@ class XmlReader {
                 }
         }
         if (!value) {
-            return fail(fmt::format("\"{}\" is no <{}>", shortened(_text), nameOf(element)));
+            // Without the text itself: a list may hold what nobody should meet in an error message.
+            return fail(fmt::format("this text is no <{}>", nameOf(element)));
         }
         store(std::move(*value));
     }

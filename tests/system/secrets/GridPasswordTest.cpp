@@ -1,11 +1,19 @@
-// The grid password on its way through the real daemon and its worker: its plain text is kept or passed on nowhere.
+// The grid password on its way through the real command line, daemon, worker and tools: its plain text is kept in no
+// file, and shown in no log line, reply, argument list or environment, whatever becomes of the request that brings it.
 
+#include "platform/json/Json.h"
+#include "platform/value/Value.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
+#include "tests/system/secrets/Searches.h"
 
+#include <array>
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <thread>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -14,68 +22,249 @@ namespace adminhost::test {
 namespace {
 
 namespace fs = std::filesystem;
+using testing::AllOf;
+using testing::Contains;
 using testing::HasSubstr;
+using testing::IsEmpty;
 using testing::Not;
 
-constexpr const char* planted = "planted-grid-secret-7261";
+constexpr const char* writeSettings = "/v1/lumio/writeSettings";
+const std::string scripts = "/usr/share/sorvaneproducer/lumioserverd/script/";
+
+/// The tools that a write of settings runs.
+const std::array<std::string, 4> tools{scripts + "setup_lumioserverd_preferences",
+                                       scripts + "setup_lumioserverd_library", "/usr/bin/lumioconfig",
+                                       "/usr/bin/sqlite3"};
 
 std::string bytesOf(const fs::path& file) {
     std::ifstream in(file, std::ios::binary);
     return {std::istreambuf_iterator<char>(in), {}};
 }
 
-/// How many regular files below the directory were read; each must not hold the password.
-int searchBelow(const fs::path& directory) {
-    int files = 0;
-    for (const auto& entry : fs::recursive_directory_iterator(directory)) {
-        if (entry.is_regular_file() && !entry.is_symlink()) {
-            ++files;
-            EXPECT_EQ(bytesOf(entry.path()).find(planted), std::string::npos) << entry.path();
+/// A directory for the file that gives the password to the command line: the one place where it may stand.
+class PasswordFile {
+  public:
+    PasswordFile() {
+        std::string pattern = fs::temp_directory_path() / "given-XXXXXX";
+        if (::mkdtemp(pattern.data()) == nullptr) {
+            throw std::runtime_error("no directory");
+        }
+        _directory = pattern;
+        std::ofstream(path()) << planted << '\n';
+    }
+    PasswordFile(const PasswordFile&) = delete;
+    PasswordFile& operator=(const PasswordFile&) = delete;
+    ~PasswordFile() { fs::remove_all(_directory); }
+
+    [[nodiscard]] std::string path() const { return _directory / "password"; }
+
+  private:
+    fs::path _directory;
+};
+
+class GridPassword : public testing::Test {
+  protected:
+    void SetUp() override {
+        // Each run of a tool records its arguments and environment before it does its work.
+        for (std::size_t i = 0; i < tools.size(); ++i) {
+            const std::string record =
+                "{ /usr/bin/tr '\\0' '\\n' </proc/$$/cmdline; /usr/bin/tr '\\0' '\\n' "
+                "</proc/$$/environ; } >>'" +
+                recordOf(i) + "'\n";
+            const bool isScript = tools[i] != "/usr/bin/sqlite3";
+            std::string text = isScript ? root.read(tools[i]) : "#!/bin/sh\nexec /usr/bin/sqlite3 \"$@\"\n";
+            text.insert(text.find('\n') + 1, record);
+            root.write(tools[i], text);
+            fs::permissions(root.disk(tools[i]), fs::perms(0755));
+        }
+        root.recordToolCalls();
+        daemon.emplace(DaemonProcess::Options{
+            {"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"},
+            "",
+            {},
+            true,
+            {}});
+    }
+    /// Whatever the test did, nothing holds the password afterwards.
+    void TearDown() override {
+        checkProcesses();
+        for (const fs::path& directory : {fs::path(root.directory()), daemon->directory()}) {
+            const FileSearch search = searchBelow(directory);
+            EXPECT_GT(search.files, 0U) << directory;
+            EXPECT_THAT(search.holding, IsEmpty());
+        }
+        EXPECT_FALSE(daemon->log().empty());
+        for (std::size_t i : {0U, 3U}) {
+            EXPECT_THAT(bytesOf(recordOf(i)), AllOf(HasSubstr(tools[i]), HasSubstr("PATH="))) << "it was recorded";
         }
     }
-    return files;
+    void checkProcesses() const {
+        for (const pid_t pid : processesFrom(daemon->pid())) {
+            EXPECT_FALSE(holdsPlanted(argumentsAndEnvironmentOf(pid))) << pid;
+        }
+        EXPECT_THAT(argumentsAndEnvironmentOf(daemon->pid()), AllOf(HasSubstr("--root"), HasSubstr("TMPDIR=")));
+        EXPECT_THAT(argumentsAndEnvironmentOf(daemon->workerPid()), AllOf(HasSubstr("worker"), HasSubstr("TMPDIR=")));
+    }
+
+    [[nodiscard]] std::string recordOf(std::size_t tool) const {
+        return root.directory() + "/recorded." + std::to_string(tool);
+    }
+    /// A reply, what the daemon remembers of the request and everything that it can be asked for.
+    HttpReply checked(HttpReply reply) const {
+        EXPECT_FALSE(holdsPlanted(reply.body)) << reply.body;
+        for (const auto& [name, value] : reply.headers) {
+            EXPECT_FALSE(holdsPlanted(value)) << name;
+        }
+        UnixHttp client = daemon->connect();
+        for (const std::string& target : {"/v1/requests/" + reply.headers.at("request-id"), std::string("/v1/"),
+                                          std::string("/v1/lumio"), std::string("/v1/lumio/history")}) {
+            const HttpReply other = client.get(target);
+            EXPECT_EQ(other.status, 200) << target;
+            EXPECT_FALSE(holdsPlanted(other.body)) << target;
+        }
+        const HttpReply read = client.post("/v1/lumio/readSettings");
+        EXPECT_FALSE(holdsPlanted(read.body));
+        return reply;
+    }
+    [[nodiscard]] HttpReply post(const std::string& body, const UnixHttp::Headers& headers = {},
+                                 const std::string& target = writeSettings) const {
+        return checked(UnixHttp(daemon->socket(), std::chrono::seconds(60)).post(target, body, headers));
+    }
+    [[nodiscard]] static std::string bodyWith(const std::string& more = "") {
+        return std::string(R"({"configuration":{"nimbo_client_password":")") + planted + '"' + more +
+               R"(},"optionalArguments":{"variant":"getConfig"}})";
+    }
+    [[nodiscard]] ProgramResult ctl(std::vector<std::string> words) const {
+        words.insert(words.begin(), {std::string(BINARY_DIR) + "/bin/adminhostctl", "--socket", daemon->socket()});
+        ProgramResult result = runProgram(words, Errors::merge);
+        EXPECT_FALSE(holdsPlanted(result.output)) << result.output;
+        return result;
+    }
+
+    const SampleRoot root;
+    const PasswordFile password;
+    std::optional<DaemonProcess> daemon;
+};
+
+TEST(Searches, PlantedValueIsFoundInFilesNamesArgumentsAndEnvironments) {
+    const SampleRoot root;
+    EXPECT_THAT(searchBelow(root.directory()).holding, IsEmpty());
+    root.write("/a/deep/file", std::string("\0before ", 8) + planted);
+    root.write("/a/base64", "xx cGxhbnRlZC1ncmlkLXNlY3JldC03MjYx");
+    root.write("/a/" + std::string(planted), "");
+    EXPECT_EQ(searchBelow(root.directory()).holding.size(), 3U);
+
+    const DaemonProcess inEnvironment({{}, "", {std::string("CONTROL=") + planted}, true, {}});
+    EXPECT_TRUE(holdsPlanted(argumentsAndEnvironmentOf(inEnvironment.pid())));
+    EXPECT_THAT(processesFrom(inEnvironment.pid()), Contains(inEnvironment.workerPid()));
+    const DaemonProcess inArguments({{"--plugin", std::string("/nowhere/") + planted}, "", {}, true, {}});
+    EXPECT_TRUE(holdsPlanted(argumentsAndEnvironmentOf(inArguments.pid())));
 }
 
-TEST(GridPassword, PlantedValueIsInNoFileLogLineArgumentListEnvironmentOrRecord) {
-    const SampleRoot root;
-    // Between the daemon and the real tool, each run's arguments and environment are recorded.
-    const std::string record = root.directory() + "/recorded";
-    root.write("/usr/bin/sqlite3",
-               "#!/bin/sh\n{ /usr/bin/tr '\\0' '\\n' </proc/$$/cmdline; /usr/bin/tr '\\0' '\\n' "
-               "</proc/$$/environ; } >>" +
-                   record + "\nexec /usr/bin/sqlite3 \"$@\"\n");
-    fs::permissions(root.disk("/usr/bin/sqlite3"), fs::perms(0755));
-    root.recordToolCalls();
-    const DaemonProcess daemon(
-        {{"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"}, "", {}, true, {}});
+TEST_F(GridPassword, AcceptedOneIsStoredOnlyInItsProtectedFormAndHistoryHoldsNoOther) {
     const std::string before = bytesOf(root.clusterPreferencesPath());
-    const std::string body = std::string(R"({"configuration":{"nimbo_client_password":")") + planted +
-                             R"(","server_port":8171},"optionalArguments":{"variant":"getConfig"}})";
-    UnixHttp client(daemon.socket(), std::chrono::seconds(60));
-    const HttpReply reply = client.post("/v1/lumio/writeSettings", body);
+    const std::string changes =
+        R"(,"server_port":8171,"nimbo_controller":"unknown-controller",)"
+        R"("properties":[{"_newid_":true,"name":"n","value":"v","protect":true}],)"
+        R"("cameras":[{"_id_":")" +
+        SampleRoot::uuidOf("camera", "Main hall") +
+        R"(","access_control_enabled":true,"allowedUsersAndGroups":[{"_newid_":true,"type":"user","shortName":"ben"}]}])";
+    const HttpReply reply = post(bodyWith(changes));
     ASSERT_EQ(reply.status, 200) << reply.body;
     EXPECT_THAT(reply.body, HasSubstr("\"writeStatus\":0"));
-    EXPECT_THAT(reply.body, Not(HasSubstr(planted)));
     const std::string after = bytesOf(root.clusterPreferencesPath());
     EXPECT_NE(after, before);
     EXPECT_THAT(after, HasSubstr("nimbo_client_password"));
 
-    ASSERT_TRUE(reply.headers.contains("request-id"));
-    const HttpReply remembered = client.get("/v1/requests/" + reply.headers.at("request-id"));
-    EXPECT_EQ(remembered.status, 200);
-    EXPECT_THAT(remembered.body, Not(HasSubstr(planted)));
-    for (const char* target : {"/v1/", "/v1/lumio", "/v1/lumio/history"}) {
-        const HttpReply other = client.get(target);
-        EXPECT_EQ(other.status, 200) << target;
-        EXPECT_THAT(other.body, Not(HasSubstr(planted))) << target;
+    // Again, as the same, so that the history's newest entry was made with the password stored; and as a property list.
+    EXPECT_EQ(post(bodyWith()).status, 200);
+    EXPECT_EQ(bytesOf(root.clusterPreferencesPath()), after);
+    const HttpReply list = post(std::string("<plist><dict><key>configuration</key><dict><key>nimbo_client_password"
+                                            "</key><string>") +
+                                    planted + "</string></dict></dict></plist>",
+                                {"Content-Type: application/x-plist", "Accept: application/x-plist"});
+    EXPECT_EQ(list.status, 200);
+    std::size_t entries = 0;
+    for (const auto& entry : fs::directory_iterator(root.disk("/var/lib/adminhostd/history/lumio"))) {
+        entries += fs::exists(entry.path() / "about.plist") ? 1U : 0U;
     }
+    EXPECT_EQ(entries, 3U);
+    for (std::size_t i = 0; i < tools.size(); ++i) {
+        EXPECT_THAT(bytesOf(recordOf(i)), HasSubstr(tools[i])) << "every tool has run";
+    }
+}
 
-    EXPECT_THAT(bytesOf(record), HasSubstr("PATH=")) << "environments were recorded";
-    EXPECT_THAT(bytesOf(record), HasSubstr("sqlite3")) << "so were arguments";
-    EXPECT_GE(root.toolCalls().size(), 3U) << "the scripts' runs were recorded";
-    EXPECT_FALSE(daemon.log().empty());
-    EXPECT_GT(searchBelow(root.directory()), 20) << "the root and the records";
-    EXPECT_GE(searchBelow(daemon.directory()), 1) << "the log among them";
+TEST_F(GridPassword, OneThatCannotBeProtectedIsLost) {
+    root.write("/Library/SorvaneProducer/Shared/Server/Secrets/kek.plist", "no property list");
+    EXPECT_EQ(post(bodyWith()).status, 200);
+    EXPECT_THAT(daemon->log(), HasSubstr("nimbo_client_password encryption failed"));
+}
+
+TEST_F(GridPassword, WritesThatFailShowNothingOfIt) {
+    root.setSwitch("setup_library.exit", "7");
+    EXPECT_EQ(post(bodyWith()).status, 200);
+    root.clearSwitches();
+    fs::remove(root.clusterPreferencesPath());
+    fs::create_directory(root.clusterPreferencesPath());
+    EXPECT_THAT(post(bodyWith()).body, HasSubstr("\"writeStatus\":400"));
+    root.setSwitch("setup_preferences.exit", "7");
+    EXPECT_EQ(post(bodyWith()).status, 200);
+}
+
+TEST_F(GridPassword, RefusedRequestsShowNothingOfIt) {
+    const std::string text = planted;
+    EXPECT_EQ(post(bodyWith(R"(,"properties":[{"_newid_":true,"name":"a\"b"}])")).status, 422);
+    EXPECT_EQ(post(bodyWith(), {"If-Match: \"stale\""}).status, 412);
+    EXPECT_EQ(post(bodyWith(), {"If-Match: stale"}).status, 400);
+    EXPECT_EQ(post(bodyWith(), {"Content-Type: text/plain"}).status, 415);
+    EXPECT_EQ(post(bodyWith(), {}, "/v1/lumio/writeSetting").status, 404);
+    for (const std::string& broken :
+         {text, '"' + text + '"', '"' + text, "{\"configuration\":" + text, bodyWith() + text,
+          R"({"configuration":{"nimbo_client_password":')" + text + "'}}",
+          R"({"configuration":{"nimbo_client_password":")" + text + "\xFF\"}}",
+          R"({"configuration":{"nimbo_client_password":")" + text + "\n\"}}",
+          R"({"configuration":{"nimbo_client_password":")" + text + R"(","nimbo_client_password":")" + text + "\"}}",
+          R"({"configuration":{"nimbo_client_password":{"$data":")" + text + "\"}}}",
+          R"({"configuration":{"nimbo_client_password":{"$date":")" + text + "\"}}}"}) {
+        EXPECT_EQ(post(broken).status, 400) << broken;
+    }
+    EXPECT_EQ(post(R"({"configuration":{"nimbo_client_password":[")" + text + "\"]}}").status, 422);
+    for (const std::string element : {"integer", "real", "date", "data", "true", "dict", "array", "string"}) {
+        const std::string list = "<plist><dict><key>configuration</key><dict><key>nimbo_client_password</key><" +
+                                 element + ">" + text + (element == "string" ? "" : "</" + element + ">") +
+                                 "</dict></dict></plist>";
+        EXPECT_EQ(post(list, {"Content-Type: application/x-plist"}).status, 400) << element;
+    }
+}
+
+TEST_F(GridPassword, CommandLineTakesItFromFilesAndShowsItNowhere) {
+    const std::string desired = root.directory() + "/desired.toml";
+    EXPECT_EQ(ctl({"export", desired}).status, 0);
+    EXPECT_EQ(ctl({"plan", desired, "--password-file", password.path()}).status, 0);
+    EXPECT_EQ(ctl({"apply", desired, "--password-file", password.path()}).status, 0);
+    EXPECT_EQ(ctl({"settings", "set", "nimbo_client_password", '@' + password.path()}).status, 0);
+    EXPECT_EQ(ctl({"writeSettings", "configuration.nimbo_client_password@" + password.path()}).status, 0);
+    EXPECT_EQ(ctl({"export", desired}).status, 0);
+    EXPECT_EQ(ctl({"history"}).status, 0);
+    EXPECT_EQ(ctl({"rollback", "1"}).status, 0);
+    EXPECT_EQ(ctl({"settings", "get"}).status, 0);
+    root.write("/Library/SorvaneProducer/Shared/Server/Secrets/kek.plist", "no property list");
+    EXPECT_EQ(ctl({"apply", desired, "--password-file", password.path()}).status, 1);
+}
+
+TEST_F(GridPassword, NothingShowsItWhileTheRequestRuns) {
+    root.setSwitch("setup_library.sleep", "2");
+    UnixHttp client(daemon->socket(), std::chrono::seconds(60));
+    client.begin("POST", writeSettings, bodyWith());
+    for (int i = 0; i < 1000 && !fs::exists(recordOf(1)); ++i) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    }
+    EXPECT_GE(processesFrom(daemon->pid()).size(), 3U) << "the front, the worker and the script";
+    checkProcesses();
+    const HttpReply overview = daemon->connect().get("/v1/");
+    EXPECT_THAT(overview.body, HasSubstr("\"running\""));
+    EXPECT_FALSE(holdsPlanted(overview.body));
+    EXPECT_EQ(checked(client.reply()).status, 200);
 }
 
 }  // namespace

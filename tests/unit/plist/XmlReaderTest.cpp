@@ -206,8 +206,17 @@ TEST(XmlReader, LongNamesAreShortenedInMessages) {
     for (int i = 0; i < 1000; ++i) {
         accents += "€";
     }
-    EXPECT_THAT(errorOf(plist("<integer>" + accents + "</integer>")),
+    EXPECT_THAT(errorOf(plist("<dict><key>" + accents + "</key></dict>")),
                 testing::HasSubstr("\"€€€€€€€€€€€€€€€€€€€€...\""));
+}
+
+TEST(XmlReader, TextOfAValueStandsInNoMessage) {
+    for (const std::string name : {"integer", "real", "date", "data", "true", "false", "dict", "array", "string"}) {
+        const std::string message =
+            errorOf("<plist><" + name + ">planted" + (name == "string" ? "" : "</" + name + ">") + "</plist>");
+        EXPECT_THAT(message, testing::StartsWith("line 1, column")) << name;
+        EXPECT_THAT(message, testing::Not(testing::HasSubstr("planted")));
+    }
 }
 
 TEST(XmlReader, DictionaryIsKeysWithValuesInTurn) {
@@ -249,8 +258,8 @@ TEST(XmlReader, TextBetweenElementsIsRefused) {
 }
 
 TEST(XmlReader, BooleansAreEmpty) {
-    EXPECT_EQ(errorOf("<plist><true>1</true></plist>"), "line 1, column 15: \"1\" is no <true>");
-    EXPECT_EQ(errorOf("<plist><false> </false></plist>"), "line 1, column 16: \" \" is no <false>");
+    EXPECT_EQ(errorOf("<plist><true>1</true></plist>"), "line 1, column 15: this text is no <true>");
+    EXPECT_EQ(errorOf("<plist><false> </false></plist>"), "line 1, column 16: this text is no <false>");
 }
 
 TEST(XmlReader, IntegersSpanTheSignedAndTheUnsignedRange) {
@@ -259,9 +268,9 @@ TEST(XmlReader, IntegersSpanTheSignedAndTheUnsignedRange) {
     EXPECT_EQ(valueOf(plist("<integer>9223372036854775807</integer>")), Value(INT64_MAX));
     EXPECT_EQ(valueOf(plist("<integer>9223372036854775808</integer>")), Value(9223372036854775808U));
     EXPECT_EQ(errorOf(plist("<integer>-9223372036854775809</integer>")),
-              "line 1, column 51: \"-9223372036854775809\" is no <integer>");
+              "line 1, column 51: this text is no <integer>");
     EXPECT_EQ(errorOf(plist("<integer>18446744073709551616</integer>")),
-              "line 1, column 51: \"18446744073709551616\" is no <integer>");
+              "line 1, column 51: this text is no <integer>");
 }
 
 TEST(XmlReader, IntegersAreDecimalWithASignAndWhiteSpaceAround) {
