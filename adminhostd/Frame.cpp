@@ -4,6 +4,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <utility>
 
 #include <sys/socket.h>
 #include <unistd.h>
@@ -35,28 +36,39 @@ std::optional<std::string> encodeFrame(FrameType type, const Value& payload) {
     return bytes;
 }
 
+void FrameReader::append(std::string_view bytes) {
+    // Done here and not frame by frame, which for many small ones would move what follows again and again.
+    _bytes.erase(0, std::exchange(_read, 0));
+    if (_bytes.empty() && _bytes.capacity() > keptCapacity) {
+        _bytes.shrink_to_fit();
+    }
+    _bytes.append(bytes);
+}
+
 std::optional<Frame> FrameReader::next() {
     Header header{};
-    if (_broken || _bytes.size() < sizeof header) {
+    const std::string_view bytes = std::string_view(_bytes).substr(_read);
+    if (_broken || bytes.size() < sizeof header) {
         return std::nullopt;
     }
-    std::memcpy(&header, _bytes.data(), sizeof header);
+    std::memcpy(&header, bytes.data(), sizeof header);
     if (header.magic != magic || header.type < static_cast<std::uint32_t>(FrameType::configure) ||
         header.type > static_cast<std::uint32_t>(FrameType::answer) || header.length > frameMaximum) {
         _broken = true;
         return std::nullopt;
     }
-    if (_bytes.size() < sizeof header + header.length) {
+    if (bytes.size() < sizeof header + header.length) {
         return std::nullopt;
     }
-    auto payload = decodeValue(std::string_view(_bytes).substr(sizeof header, header.length));
+    auto payload = decodeValue(bytes.substr(sizeof header, header.length));
     if (!payload) {
         _broken = true;
         return std::nullopt;
     }
-    _bytes.erase(0, sizeof header + header.length);
-    if (_bytes.empty() && _bytes.capacity() > keptCapacity) {
-        _bytes.shrink_to_fit();
+    _read += sizeof header + header.length;
+    if (_read == _bytes.size() && _bytes.capacity() > keptCapacity) {
+        std::string().swap(_bytes);
+        _read = 0;
     }
     return Frame{static_cast<FrameType>(header.type), std::move(*payload)};
 }

@@ -36,7 +36,7 @@ struct Frame {
 /// Puts frames together from the bytes as they arrive.
 class FrameReader {
   public:
-    void append(std::string_view bytes) { _bytes.append(bytes); }
+    void append(std::string_view bytes);
     /// The next whole frame; nothing while bytes are missing, or when the stream is broken.
     [[nodiscard]] std::optional<Frame> next();
     /// Whether what arrived is no frame; nothing that comes later can be read.
@@ -44,6 +44,7 @@ class FrameReader {
 
   private:
     std::string _bytes;
+    std::size_t _read = 0;  ///< how many of them belong to frames that were taken
     bool _broken = false;
 };
 

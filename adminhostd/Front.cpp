@@ -5,6 +5,8 @@
 #include "platform/log/Log.h"
 #include "platform/value/Text.h"
 
+#include <algorithm>
+
 #include <fmt/format.h>
 #include <fmt/ranges.h>
 #include <unistd.h>
@@ -56,16 +58,31 @@ const Dictionary* elementNamed(const Value& list, std::string_view name) {
     return nullptr;
 }
 
+/// A list of dictionaries, each with a name.
+bool isNamedList(const Value& list) {
+    return list.array() != nullptr && std::all_of(list.array()->begin(), list.array()->end(), [](const Value& element) {
+               return element.dictionary() != nullptr && element.dictionary()->get("name").string() != nullptr;
+           });
+}
+
+/// What a worker says first is looked at as a whole: everything else here relies on its form.
+bool isHello(const Dictionary& hello) {
+    const Value& plugins = hello.get("plugins");
+    return isNamedList(plugins) &&
+           std::all_of(plugins.array()->begin(), plugins.array()->end(),
+                       [](const Value& plugin) { return isNamedList(plugin.dictionary()->get("commands")); });
+}
+
 bool flag(const Dictionary& description, std::string_view key) {
     return description.get(key) == Value(true);
 }
 
-HttpAnswer findingsAnswer(const Value& findings) {
-    const Dictionary& first = *findings.array()->front().dictionary();
-    HttpAnswer answer =
-        errorAnswer(422, "REQUEST_REFUSED",
-                    fmt::format("The request cannot be carried out ({} findings). The first: {}: {}.",
-                                findings.array()->size(), textAt(first, "keyPath"), textAt(first, "rule")));
+HttpAnswer findingsAnswer(const Value& findings, const Dictionary& first) {
+    const std::size_t count = findings.array()->size();
+    HttpAnswer answer = errorAnswer(422, "REQUEST_REFUSED",
+                                    fmt::format("The request cannot be carried out. {}{}: {}.",
+                                                count == 1 ? "" : fmt::format("The first of {} findings: ", count),
+                                                textAt(first, "keyPath"), textAt(first, "rule")));
     answer.body->dictionary()->set("findings", findings);
     return answer;
 }
@@ -82,8 +99,10 @@ HttpAnswer answerFor(const Dictionary& worker) {
     if (word == outcome::error) {
         return {500, worker.get("response"), {}};
     }
-    if (word == outcome::refused && worker.get("findings").array() != nullptr) {
-        return findingsAnswer(worker.get("findings"));
+    const Array* findings = worker.get("findings").array();
+    if (word == outcome::refused && findings != nullptr && !findings->empty() &&
+        findings->front().dictionary() != nullptr) {
+        return findingsAnswer(worker.get("findings"), *findings->front().dictionary());
     }
     if (word == outcome::changed) {
         return errorAnswer(412, "REVISION_CHANGED", "The settings have changed since they were read. Read them again.");
@@ -108,7 +127,11 @@ HttpAnswer answerFor(const Dictionary& worker) {
 Front::Front(OperationQueue::Settings settings, Array refused)
     : _refused(std::move(refused)),
       _queue(std::move(settings),
-             {[this](const Dictionary& hello) { _hello = hello; }, [](const std::string& event) { logEvent(event); },
+             {[this](const Dictionary& hello) {
+                  _hello = isHello(hello) ? hello : std::move(_hello);
+                  return isHello(hello);
+              },
+              [](const std::string& event) { logEvent(event); },
               [this](const Operation& operation, const Dictionary& answer) { finished(operation, answer); }}) {}
 
 Front::Address Front::addressOf(std::string_view path) {
@@ -196,8 +219,10 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Address
 std::optional<HttpAnswer> Front::head(const Exchange& exchange) {
     const Address address = addressOf(exchange.path());
     auto answer = refusal(exchange, address);
-    if (answer && exchange.method() == "POST") {
-        RequestRecord& record = *_history.add(exchange);
+    const bool stranger = !permitted(exchange.peer());
+    if (answer && (stranger || exchange.method() == "POST")) {
+        // Who may not ask is logged, but must not push what others asked for out of the daemon's memory.
+        RequestRecord& record = *(stranger ? History::begin(exchange) : _history.add(exchange));
         record.plugin = address.plugin.substr(0, keptName);
         record.command = address.command.substr(0, keptName);
         close(record, *answer);
@@ -277,11 +302,12 @@ void Front::operation(Exchange& exchange, const Address& address) {
         exchange.answer(std::move(answer));
     };
 
-    std::string problem;
+    BodyProblem problem;
     auto request = requestOf(exchange.body(), *bodyFormOf(exchange.header("Content-Type")), problem);
     exchange.dropBody();
     if (!request) {
-        return refuse(errorAnswer(400, "MALFORMED_BODY", problem));
+        return refuse(problem.tooManyValues ? errorAnswer(413, "BODY_TOO_LARGE", problem.text)
+                                            : errorAnswer(400, "MALFORMED_BODY", problem.text));
     }
     const std::string_view ifMatch = exchange.header("If-Match");
     auto revisions = revisionsOf(ifMatch);
@@ -329,9 +355,15 @@ void Front::query(Exchange& exchange, const Address& address) {
     operation.order.set("query", address.command);
     operation.order.set("plugin", address.plugin);
     for (const char* argument : {"match", "is"}) {
-        if (const std::string_view text = exchange.argument(argument); isUtf8(text)) {
-            operation.order.set(argument, text);
+        const std::string_view text = exchange.argument(argument);
+        if (!isUtf8(text)) {
+            HttpAnswer answer =
+                errorAnswer(400, "MALFORMED_ADDRESS", fmt::format("The text of \"{}\" is not UTF-8.", argument));
+            close(*operation.record, answer);
+            exchange.answer(std::move(answer));
+            return;
         }
+        operation.order.set(argument, text);
     }
     _queue.add(std::move(operation));
 }

@@ -11,8 +11,9 @@
 
 namespace {
 
-/// A descriptor that we open must never take the place of a closed standard stream.
-void openStandardStreams() {
+/// A descriptor that we open must never take the place of a closed standard stream, and what our parent left open is
+/// nothing for the tools that we run: a service that they start would hold it for ever.
+void tidyDescriptors() {
     int descriptor = 0;
     do {
         descriptor = ::open("/dev/null", O_RDWR);
@@ -20,13 +21,14 @@ void openStandardStreams() {
     if (descriptor >= 0) {
         ::close(descriptor);
     }
+    ::close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC);
 }
 
 }  // namespace
 
 int main(int count, char** arguments) {
     try {
-        openStandardStreams();
+        tidyDescriptors();
         int status = 0;
         const auto options = adminhost::readOptions(count, arguments, status);
         if (!options) {

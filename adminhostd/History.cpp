@@ -40,12 +40,17 @@ Dictionary RequestRecord::describe() const {
     return text;
 }
 
-std::shared_ptr<RequestRecord> History::add(const Exchange& exchange) {
+std::shared_ptr<RequestRecord> History::begin(const Exchange& exchange) {
     auto record = std::make_shared<RequestRecord>();
     record->id = exchange.id();
     record->peer = exchange.peer();
     record->received = std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now());
     record->arrival = std::chrono::steady_clock::now();
+    return record;
+}
+
+std::shared_ptr<RequestRecord> History::add(const Exchange& exchange) {
+    auto record = begin(exchange);
     _records.push_back(record);
     if (_records.size() > length) {
         _records.pop_front();

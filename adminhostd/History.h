@@ -46,6 +46,8 @@ class History {
   public:
     static constexpr std::size_t length = 200;
 
+    /// A record that is not remembered.
+    [[nodiscard]] static std::shared_ptr<RequestRecord> begin(const Exchange& exchange);
     /// Begins a record; the oldest one is forgotten.
     std::shared_ptr<RequestRecord> add(const Exchange& exchange);
     [[nodiscard]] const RequestRecord* find(std::string_view id) const;

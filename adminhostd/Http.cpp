@@ -1,16 +1,19 @@
 #include "adminhostd/Http.h"
 
+#include "adminhostd/RequestBody.h"
 #include "platform/framework/PluginRequestHandler.h"
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
 
 #include <algorithm>
+#include <cctype>
 #include <charconv>
 #include <stdexcept>
 
 #include <fmt/format.h>
 #include <microhttpd.h>
 #include <poll.h>
+#include <strings.h>
 #include <sys/socket.h>
 
 namespace adminhost {
@@ -32,6 +35,49 @@ std::uint64_t announcedLength(MHD_Connection* connection) {
     std::uint64_t length = 0;
     const auto parsed = std::from_chars(text.data(), text.data() + text.size(), length);
     return parsed.ec == std::errc::result_out_of_range ? UINT64_MAX : length;
+}
+
+/// The path of a request's target, which may be a whole address.
+std::string pathOf(std::string_view target) {
+    constexpr std::string_view scheme = "http://";
+    if (target.starts_with(scheme)) {
+        target.remove_prefix(std::min(target.find('/', scheme.size()), target.size()));
+    }
+    return target.empty() ? "/" : std::string(target);
+}
+
+HttpAnswer malformed(const char* message) {
+    return {400, Dictionary{{"error", "MALFORMED_HEAD"}, {"message", message}}, {}};
+}
+
+/// What is wrong with the head of a request that the library lets pass.
+std::optional<HttpAnswer> headRefusal(MHD_Connection* connection, std::string_view version) {
+    if (version == MHD_HTTP_VERSION_1_1 && headerOf(connection, MHD_HTTP_HEADER_HOST).data() == nullptr) {
+        return malformed("A request has a Host header, whatever it says.");
+    }
+    const std::string_view coding = headerOf(connection, MHD_HTTP_HEADER_TRANSFER_ENCODING);
+    if (!coding.empty() && (coding.size() != 7 || ::strncasecmp(coding.data(), "chunked", 7) != 0)) {
+        return malformed("The only Transfer-Encoding is chunked.");
+    }
+    return std::nullopt;
+}
+
+/// Decodes %XX in place. A zero byte would end the text for whoever reads it, so that another address were served than
+/// was asked for: it stays as it was sent, as does what is no code.
+std::size_t decodeEscapes(void*, MHD_Connection*, char* text) {
+    char* to = text;
+    for (const char* from = text; *from != '\0'; ++to) {
+        unsigned code = 0;
+        if (*from == '%' && std::isxdigit(static_cast<unsigned char>(from[1])) != 0 &&
+            std::from_chars(from + 1, from + 3, code, 16).ptr == from + 3 && code != 0) {
+            *to = static_cast<char>(code);
+            from += 3;
+        } else {
+            *to = *from++;
+        }
+    }
+    *to = '\0';
+    return static_cast<std::size_t>(to - text);
 }
 
 HttpAnswer bodyTooLarge() {
@@ -69,10 +115,10 @@ void Exchange::answer(HttpAnswer answer) {
 /// What the library calls: no exception may reach it.
 struct HttpServer::Callbacks {
     static MHD_Result access(void* context, MHD_Connection* connection, const char* url, const char* method,
-                             const char*, const char* data, std::size_t* size, void** place) {
+                             const char* version, const char* data, std::size_t* size, void** place) {
         try {
             return static_cast<MHD_Result>(static_cast<HttpServer*>(context)->access(
-                connection, url, method, data, size, reinterpret_cast<Exchange**>(place)));
+                connection, url, method, version, data, size, reinterpret_cast<Exchange**>(place)));
         } catch (...) {
             return MHD_NO;  // closes the connection
         }
@@ -131,7 +177,7 @@ HttpServer::HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeo
                            MHD_OPTION_CONNECTION_TIMEOUT, static_cast<unsigned>(_clientTimeout.count()),             //
                            MHD_OPTION_NOTIFY_COMPLETED, &Callbacks::completed, this,                                 //
                            MHD_OPTION_NOTIFY_CONNECTION, &Callbacks::connection, this,                               //
-                           MHD_OPTION_STRICT_FOR_CLIENT, 1,                                                          //
+                           MHD_OPTION_UNESCAPE_CALLBACK, &decodeEscapes, nullptr,                                    //
                            MHD_OPTION_SIGPIPE_HANDLED_BY_APP, 1,                                                     //
                            MHD_OPTION_END);
     if (_daemon == nullptr) {
@@ -182,12 +228,13 @@ void HttpServer::dropSlowClients() {
     }
 }
 
-int HttpServer::begin(MHD_Connection* connection, const char* url, const char* method, Exchange** place) {
+int HttpServer::begin(MHD_Connection* connection, const char* url, const char* method, const char* version,
+                      Exchange** place) {
     auto exchange = std::unique_ptr<Exchange>(new Exchange);
     exchange->_connection = connection;
     exchange->_id = fmt::format("{}-{}", _idPrefix, ++_idCount);
     exchange->_method = method;
-    exchange->_path = url;
+    exchange->_path = pathOf(url);
     if (const Client* client = clientOf(connection)) {
         exchange->_peer = client->peer;
         exchange->_socket = client->socket;
@@ -196,21 +243,26 @@ int HttpServer::begin(MHD_Connection* connection, const char* url, const char* m
     ++_open;
     Exchange& begun = **place;
     begun._refusal = _head(begun);
+    if (auto refusal = begun._refusal ? std::nullopt : headRefusal(connection, version)) {
+        begun._answer = std::move(refusal);
+        return send(begun);
+    }
     const bool tooLarge = announcedLength(connection) > bodyMaximum;
     if (!begun._refusal && tooLarge) {
         begun._refusal = bodyTooLarge();
     }
-    if (begun._refusal && (tooLarge || begun._refusal->status == 403)) {
+    const bool waits = !headerOf(connection, MHD_HTTP_HEADER_EXPECT).empty();
+    if (begun._refusal && (tooLarge || waits || begun._refusal->status == 403)) {
         begun._answer = std::move(begun._refusal);  // at once, without taking the body
         return send(begun);
     }
     return MHD_YES;
 }
 
-int HttpServer::access(MHD_Connection* connection, const char* url, const char* method, const char* data,
-                       std::size_t* size, Exchange** place) {
+int HttpServer::access(MHD_Connection* connection, const char* url, const char* method, const char* version,
+                       const char* data, std::size_t* size, Exchange** place) {
     if (*place == nullptr) {
-        return begin(connection, url, method, place);
+        return begin(connection, url, method, version, place);
     }
     Exchange& exchange = **place;
     if (*size > 0) {
@@ -248,7 +300,7 @@ int HttpServer::send(Exchange& exchange) {
     if (answer.body) {
         std::optional<std::string> text;
         // A value that a property list cannot carry is sent as JSON all the same: the type says what it is.
-        if (exchange.header(MHD_HTTP_HEADER_ACCEPT).find("application/x-plist") != std::string_view::npos) {
+        if (prefersPropertyList(exchange.header(MHD_HTTP_HEADER_ACCEPT))) {
             text = xmlPropertyList(*answer.body);
             type = "application/x-plist";
         }

@@ -112,9 +112,9 @@ class HttpServer {
     };
     struct Callbacks;
 
-    int access(MHD_Connection* connection, const char* url, const char* method, const char* data, std::size_t* size,
-               Exchange** place);
-    int begin(MHD_Connection* connection, const char* url, const char* method, Exchange** place);
+    int access(MHD_Connection* connection, const char* url, const char* method, const char* version, const char* data,
+               std::size_t* size, Exchange** place);
+    int begin(MHD_Connection* connection, const char* url, const char* method, const char* version, Exchange** place);
     int send(Exchange& exchange);
     static Client* clientOf(MHD_Connection* connection);
     void dropSlowClients();

@@ -1,10 +1,12 @@
 #include "adminhostd/ListeningSocket.h"
 
 #include <cerrno>
+#include <chrono>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <stdexcept>
+#include <thread>
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -48,8 +50,8 @@ void refuseWhatIsInTheWay(const std::string& path, const sockaddr_un& address) {
     if (::lstat(path.c_str(), &status) != 0) {
         return;
     }
-    if (!S_ISSOCK(status.st_mode)) {
-        fail(path + " is there already and is no socket; remove it or choose another path");
+    if (const auto problem = inTheWay(path)) {
+        fail(*problem);
     }
     const FileDescriptor probe = newSocket();
     const int connected = ::connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
@@ -59,6 +61,20 @@ void refuseWhatIsInTheWay(const std::string& path, const sockaddr_un& address) {
     }
     if (errno != ECONNREFUSED && errno != ENOENT) {
         failWithErrno("cannot find out whether a daemon serves " + path);
+    }
+}
+
+/// Whoever may read the directory may lock it: nobody is waited for without end.
+void waitForLock(int directory, const std::string& path) {
+    for (int tries = 0; ::flock(directory, LOCK_EX | LOCK_NB) != 0; ++tries) {
+        if (errno != EWOULDBLOCK && errno != EINTR) {
+            failWithErrno("cannot lock the directory of the socket " + path);
+        }
+        if (tries == 100) {
+            fail("another process holds a lock on the directory of the socket " + path +
+                 "; end it (fuser names it) or choose another path");
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
     }
 }
 
@@ -89,15 +105,24 @@ class Cradle {
 
 }  // namespace
 
+std::optional<std::string> inTheWay(const std::string& path) {
+    struct stat status {};
+    if (::lstat(path.c_str(), &status) != 0 || S_ISSOCK(status.st_mode)) {
+        return std::nullopt;
+    }
+    return path + " is there already and is no socket; remove it or choose another path";
+}
+
 ListeningSocket::ListeningSocket(std::string path, gid_t group) : _path(std::move(path)) {
     const sockaddr_un address = addressOf(_path);
     const std::size_t slash = _path.rfind('/');
     const std::string parent = slash == std::string::npos ? "." : slash == 0 ? "/" : _path.substr(0, slash);
     // Two daemons that start at once take their turn here.
     const FileDescriptor lock(::open(parent.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (!lock.isOpen() || ::flock(lock.get(), LOCK_EX) != 0) {
+    if (!lock.isOpen()) {
         failWithErrno("cannot use the directory of the socket " + _path);
     }
+    waitForLock(lock.get(), _path);
     refuseWhatIsInTheWay(_path, address);
 
     const Cradle cradle(parent);

@@ -4,11 +4,16 @@
 
 #include "platform/files/FileDescriptor.h"
 
+#include <optional>
 #include <string>
 
 #include <sys/types.h>
 
 namespace adminhost {
+
+/// What stands in the way of a socket at the path, with the mend: a file that is no socket. Nothing for a free path and
+/// for a socket, living or dead.
+[[nodiscard]] std::optional<std::string> inTheWay(const std::string& path);
 
 /// Listens at the path with mode 0660. The socket gets its group and mode in a private directory and is then moved to
 /// its place, so that nobody ever meets it with other rights. A socket that a dead daemon left is replaced; one that a

@@ -90,7 +90,7 @@ void OperationQueue::run() {
         // Asked first: what a worker said before its end is read in any case.
         const auto ending = _worker->ending();
         const unsigned long asked = _starts;
-        _worker->converse();
+        const bool more = _worker->converse();
         while (_worker && _starts == asked) {
             const auto frame = _worker->next();
             if (!frame) {
@@ -101,7 +101,7 @@ void OperationQueue::run() {
         if (_worker && _starts == asked && _worker->broken()) {
             _worker->kill();
             workerEnded("sent what cannot be read");
-        } else if (_worker && _starts == asked && ending) {
+        } else if (_worker && _starts == asked && ending && !more) {
             workerEnded(*ending);
         }
     }
@@ -118,12 +118,12 @@ void OperationQueue::take(const Frame& frame) {
             _running->record->addLog(*frame.payload.string());
         }
         _events.log(*frame.payload.string());
-    } else if (frame.type == FrameType::hello && _state == State::starting && payload != nullptr) {
+    } else if (frame.type == FrameType::hello && _state == State::starting && payload != nullptr &&
+               _events.hello(*payload)) {
         _state = State::idle;
         _settled = true;
         _due.reset();
         _pause = 0ms;
-        _events.hello(*payload);
         next();
     } else if (frame.type == FrameType::answer && _state == State::busy && payload != nullptr) {
         _state = State::idle;

@@ -41,15 +41,18 @@ class OperationQueue {
         std::chrono::milliseconds deadline{300'000};
     };
     struct Events {
-        std::function<void(const Dictionary&)> hello;
-        std::function<void(const std::string&)> log;  ///< an event of the plug-ins or of the queue, for the system log
+        std::function<bool(const Dictionary&)> hello;  ///< whether it is of the form that Worker.h describes
+        std::function<void(const std::string&)> log;   ///< an event of the plug-ins or of the queue, for the system log
         std::function<void(const Operation&, const Dictionary&)> finished;
     };
 
     OperationQueue(Settings settings, Events events);
 
     /// Whether another operation may wait.
-    [[nodiscard]] bool full() const noexcept { return _waiting.size() >= _settings.limit; }
+    [[nodiscard]] bool full() const noexcept {
+        const bool runsAtOnce = _state == State::idle && _waiting.empty();
+        return !runsAtOnce && _waiting.size() >= _settings.limit;
+    }
     void add(Operation operation);
     [[nodiscard]] const Operation* running() const noexcept { return _running ? &*_running : nullptr; }
     [[nodiscard]] std::size_t waiting() const noexcept { return _waiting.size(); }

@@ -1,5 +1,7 @@
 #include "adminhostd/Options.h"
 
+#include "adminhostd/PluginFile.h"
+
 #include <cstdlib>
 #include <filesystem>
 #include <iostream>
@@ -49,6 +51,13 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
         setSystemRoot(options.root);
         options.root = systemRoot();
         const DiskPath standard = diskPath(HostPath(defaultConfiguration));
+        // It names what is loaded into the daemon, so the same rules hold for it as for plug-ins.
+        const auto problem = !configuration.empty() ? openToEverybody(DiskPath(configuration))
+                             : exists(standard)     ? distrust(standard)
+                                                    : std::nullopt;
+        if (problem) {
+            throw std::runtime_error(*problem);
+        }
         if (!configuration.empty()) {
             readConfiguration(configuration, options);
         } else if (exists(standard)) {

@@ -35,7 +35,7 @@ Dictionary helloOf(const Dictionary& configuration, std::string& problem) {
         std::vector<pollfd> entries;
         worker->addTo(entries);
         ::poll(entries.data(), entries.size(), 100);
-        worker->converse();
+        static_cast<void>(worker->converse());
         while (const auto frame = worker->next()) {
             if (frame->type == FrameType::hello && frame->payload.dictionary() != nullptr) {
                 worker->finish(1000);
@@ -57,10 +57,8 @@ PluginSelection selectPlugins(const Options& options) {
     PluginSelection selection;
     if (!options.plugins.empty()) {
         for (const DiskPath& file : options.plugins) {
-            struct stat status {};
-            if (::stat(file.c_str(), &status) == 0 && (status.st_mode & S_IWOTH) != 0) {
-                selection.refused.push_back(
-                    refusedFile(file, file.text() + " may be written by everybody; chmod o-w it"));
+            if (const auto reason = openToEverybody(file)) {
+                selection.refused.push_back(refusedFile(file, *reason));
             } else {
                 selection.files.push_back(file);
             }
@@ -138,8 +136,15 @@ int check(const Options& options) {
             fmt::format("The socket {} cannot be made: {}; make its directory, or choose another with --socket", socket,
                         std::strerror(errno)));
     }
+    if (const auto problem = inTheWay(socket)) {
+        problems.push_back(*problem);
+    }
     try {
         static_cast<void>(groupOf(options.socketGroup));
+    } catch (const std::exception& error) {
+        problems.emplace_back(error.what());
+    }
+    try {
         const PluginSelection plugins = selectPlugins(options);
         const ToolConfiguration tools(std::filesystem::temp_directory_path().string());
         std::string problem;

@@ -65,6 +65,14 @@ std::optional<std::string> distrust(const DiskPath& path) {
     return std::nullopt;
 }
 
+std::optional<std::string> openToEverybody(const DiskPath& path) {
+    struct stat status {};
+    if (::stat(path.c_str(), &status) != 0 || (status.st_mode & S_IWOTH) == 0) {
+        return std::nullopt;
+    }
+    return fmt::format("{} may be written by everybody; chmod o-w it", path.text());
+}
+
 std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory) {
     std::error_code failure;
     std::vector<DiskPath> files;
@@ -146,7 +154,7 @@ const Plugin* loadPlugin(const DiskPath& file, std::string& problem) {
     }
     const std::string_view word = plugin->name;
     if (word.empty() || word.find_first_not_of("abcdefghijklmnopqrstuvwxyz0123456789_-") != std::string_view::npos ||
-        word == "requests") {
+        word == "requests" || word == "directory") {
         problem = fmt::format("{} has the name \"{}\", which cannot stand in an address", file.text(), word);
         return nullptr;
     }

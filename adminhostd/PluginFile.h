@@ -15,6 +15,9 @@ namespace adminhost {
 /// daemon's own account) and must not be writable by group or others. With the mend; nothing when all is well.
 [[nodiscard]] std::optional<std::string> distrust(const DiskPath& path);
 
+/// Why everybody could change the file, with the mend; nothing when not, or when there is no such file.
+[[nodiscard]] std::optional<std::string> openToEverybody(const DiskPath& path);
+
 /// The plug-ins (*.so) of a directory in the order of their names. Nothing if it cannot be read; errno says why.
 [[nodiscard]] std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory);
 

@@ -4,6 +4,7 @@
 #include "platform/plist/PropertyList.h"
 
 #include <algorithm>
+#include <charconv>
 
 #include <fmt/format.h>
 #include <strings.h>
@@ -49,22 +50,55 @@ std::optional<BodyForm> bodyFormOf(std::string_view contentType) {
     return same(type, "application/x-plist") ? std::optional(BodyForm::propertyList) : std::nullopt;
 }
 
-std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, std::string& problem) {
+std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem) {
     if (body.empty()) {
         return Dictionary();
     }
     Error error;
-    auto value = form == BodyForm::json ? parseJson(body, &error) : parsePropertyList(body, &error);
+    auto value = form == BodyForm::json ? parseJson(body, &error, bodyValuesMaximum)
+                                        : parsePropertyList(body, &error, bodyValuesMaximum);
     if (!value) {
-        problem = error.description.value_or("The body cannot be read.");
+        problem.tooManyValues = error.code == (form == BodyForm::json ? jsonTooManyValues : plistTooManyValues);
+        problem.text = error.description.value_or("The body cannot be read.");
         return std::nullopt;
     }
     if (value->dictionary() == nullptr) {
-        problem =
+        problem.text =
             fmt::format("line 1, column 1: a request is a dictionary, not a value of type {}", nameOf(value->type()));
         return std::nullopt;
     }
     return std::move(*value->dictionary());
+}
+
+bool prefersPropertyList(std::string_view accept) {
+    double list = 0;
+    double json = 0;
+    double other = 0;  // of a range, which stands for what is not named itself
+    bool jsonIsNamed = false;
+    while (!accept.empty()) {
+        const std::size_t end = std::min(accept.find(','), accept.size());
+        std::string_view parameters = accept.substr(0, end);
+        accept.remove_prefix(std::min(end + 1, accept.size()));
+        const std::string_view type = trimmed(parameters.substr(0, parameters.find(';')));
+        double weight = 1;
+        while (parameters.find(';') != std::string_view::npos) {
+            parameters.remove_prefix(parameters.find(';') + 1);
+            const std::string_view parameter = trimmed(parameters.substr(0, parameters.find(';')));
+            if (parameter.size() > 2 && same(parameter.substr(0, 2), "q=")) {
+                std::from_chars(parameter.data() + 2, parameter.data() + parameter.size(), weight);
+            }
+        }
+        if (same(type, "application/x-plist")) {
+            // Named second with the same weight, it is the second wish.
+            list = jsonIsNamed && weight <= json ? 0 : weight;
+        } else if (same(type, "application/json")) {
+            json = weight;
+            jsonIsNamed = true;
+        } else if (same(type, "*/*") || same(type, "application/*")) {
+            other = std::max(other, weight);
+        }
+    }
+    return list > 0 && list >= (jsonIsNamed ? json : other);
 }
 
 std::optional<Array> revisionsOf(std::string_view ifMatch) {

@@ -1,23 +1,36 @@
 #pragma once
 
-// What a client sends with a request: its body and its conditions.
+// What a client sends with a request: its body, its wishes and its conditions.
 
 #include "platform/value/Value.h"
 
+#include <cstddef>
 #include <optional>
 #include <string>
 #include <string_view>
 
 namespace adminhost {
 
+/// Values in one body: a small dictionary takes ten bytes of it and a kilobyte of memory, so its bytes alone bound
+/// nothing.
+constexpr std::size_t bodyValuesMaximum = 100'000;
+
 enum class BodyForm { json, propertyList };
 
 /// The form that a Content-Type names; JSON for none. Nothing for a type or a character set that is not understood.
 [[nodiscard]] std::optional<BodyForm> bodyFormOf(std::string_view contentType);
 
-/// The request dictionary of a body; an empty one for an empty body. Nothing, with the problem and its line and column,
-/// when the body is malformed or no dictionary.
-[[nodiscard]] std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, std::string& problem);
+struct BodyProblem {
+    bool tooManyValues = false;  ///< else malformed, or no dictionary
+    std::string text;            ///< with line and column
+};
+
+/// The request dictionary of a body; an empty one for an empty body. Nothing, with the problem, when there is none.
+[[nodiscard]] std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem);
+
+/// Whether an Accept header asks for a property list rather than for JSON: by its higher weight, or by being named
+/// first.
+[[nodiscard]] bool prefersPropertyList(std::string_view accept);
 
 /// The revisions that an If-Match header names; empty for none and for "*". Nothing when it is malformed.
 [[nodiscard]] std::optional<Array> revisionsOf(std::string_view ifMatch);

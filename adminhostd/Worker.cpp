@@ -17,6 +17,7 @@
 #include <csignal>
 #include <exception>
 #include <map>
+#include <set>
 #include <vector>
 
 #include <fmt/format.h>
@@ -72,6 +73,16 @@ std::string textAt(const Dictionary& dictionary, std::string_view key) {
     return text == nullptr ? std::string() : *text;
 }
 
+/// Whether the front can serve commands that are described like this. "history" is an address of the front's own.
+bool namesCommands(const Value& commands) {
+    std::set<std::string> names;
+    const auto named = [&](const Value& command) {
+        const std::string name = command.dictionary() == nullptr ? "" : textAt(*command.dictionary(), "name");
+        return !name.empty() && name != "history" && names.insert(name).second;
+    };
+    return commands.array() != nullptr && std::all_of(commands.array()->begin(), commands.array()->end(), named);
+}
+
 void Worker::load(const DiskPath& file, Array& plugins, Array& refused) {
     std::string problem;
     const Plugin* plugin = loadPlugin(file, problem);
@@ -82,8 +93,8 @@ void Worker::load(const DiskPath& file, Array& plugins, Array& refused) {
         plugin = nullptr;
     }
     Value commands = plugin == nullptr ? Value() : plugin->describe();
-    if (plugin != nullptr && commands.array() == nullptr) {
-        problem = fmt::format("{} does not describe its commands", file.text());
+    if (plugin != nullptr && !namesCommands(commands)) {
+        problem = fmt::format("{} does not describe its commands, each with a name of its own", file.text());
         plugin = nullptr;
     }
     if (plugin == nullptr) {

@@ -19,6 +19,8 @@ namespace {
 
 /// The worker finds its end of the conversation here.
 constexpr int workerDescriptor = 3;
+/// Bytes that are read in one go. A worker that never stops talking must not keep the front from its clients.
+constexpr std::size_t readMaximum = std::size_t{1} << 20U;
 
 /// The worker's program: beside this one in a build, in the library directory next to ours when installed.
 std::string workerProgram() {
@@ -116,9 +118,8 @@ bool WorkerProcess::send(FrameType type, const Value& payload) {
 }
 
 void WorkerProcess::write() {
-    std::size_t done = 0;
-    while (done < _unsent.size()) {
-        const ssize_t written = ::send(_socket.get(), _unsent.data() + done, _unsent.size() - done, MSG_NOSIGNAL);
+    while (_sent < _unsent.size()) {
+        const ssize_t written = ::send(_socket.get(), _unsent.data() + _sent, _unsent.size() - _sent, MSG_NOSIGNAL);
         if (written < 0 && errno == EINTR) {
             continue;
         }
@@ -126,33 +127,35 @@ void WorkerProcess::write() {
             // Full, or gone: then the end of the process tells.
             break;
         }
-        done += static_cast<std::size_t>(written);
+        _sent += static_cast<std::size_t>(written);
     }
-    if (done == _unsent.size()) {
+    if (_sent == _unsent.size()) {
         std::string().swap(_unsent);
-    } else {
-        _unsent.erase(0, done);
+        _sent = 0;
     }
 }
 
-void WorkerProcess::converse() {
+bool WorkerProcess::converse() {
     if (!_unsent.empty()) {
         write();
     }
     char buffer[64 << 10];
-    while (!_closed) {
+    std::size_t taken = 0;
+    while (!_closed && taken < readMaximum) {
         const ssize_t count = ::recv(_socket.get(), buffer, sizeof buffer, 0);
         if (count > 0) {
             _reader.append({buffer, static_cast<std::size_t>(count)});
+            taken += static_cast<std::size_t>(count);
             if (static_cast<std::size_t>(count) < sizeof buffer) {
-                return;
+                return false;
             }
         } else if (count == 0 || (errno != EINTR && errno != EAGAIN)) {
             _closed = true;
         } else if (errno == EAGAIN) {
-            return;
+            return false;
         }
     }
+    return !_closed;
 }
 
 const std::optional<std::string>& WorkerProcess::ending() {

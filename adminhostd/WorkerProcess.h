@@ -33,8 +33,9 @@ class WorkerProcess {
 
     /// Queues a frame and sends what can be sent. False when it is too large for a frame.
     [[nodiscard]] bool send(FrameType type, const Value& payload);
-    /// Reads and writes what can be done without waiting.
-    void converse();
+    /// Reads and writes what can be done without waiting, but not without end: answers whether there may be more to
+    /// read at once.
+    bool converse();
     /// The next frame that has arrived.
     [[nodiscard]] std::optional<Frame> next() { return _reader.next(); }
     /// Whether the worker says what is no frame.
@@ -54,6 +55,7 @@ class WorkerProcess {
     FileDescriptor _process;
     FrameReader _reader;
     std::string _unsent;
+    std::size_t _sent = 0;  ///< how much of it is on its way
     bool _closed = false;
     std::optional<std::string> _ending;
 };

@@ -11,6 +11,8 @@
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
 
+#include <cstddef>
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -18,12 +20,15 @@
 namespace adminhost {
 
 constexpr std::size_t jsonMaximumDepth = 512;  ///< nested lists and dictionaries
+constexpr std::int64_t jsonTooManyValues = 2;  ///< code of the error for more values than the caller allows
 
-/// Parses one JSON text. Nothing on failure; then, if error is given, it is of domain "json" and its description begins
-/// with "line L, column C: " (from 1; columns count characters). Refused besides broken syntax: invalid UTF-8, a key
-/// that stands twice, nesting beyond the maximum, an integer outside the 64-bit range, null in a list, a key with a
-/// single "$" that is none of the forms above.
-[[nodiscard]] std::optional<Value> parseJson(std::string_view text, Error* error = nullptr);
+/// Parses one JSON text of at most so many values, nulls included. Nothing on failure; then, if error is given, it is
+/// of domain "json", code 1 (or jsonTooManyValues), and its description begins with "line L, column C: " (from 1;
+/// columns count characters). Refused besides broken syntax: invalid UTF-8, a key that stands twice, nesting beyond the
+/// maximum, an integer outside the 64-bit range, null in a list, a key with a single "$" that is none of the forms
+/// above.
+[[nodiscard]] std::optional<Value> parseJson(std::string_view text, Error* error = nullptr,
+                                             std::size_t valuesMaximum = SIZE_MAX);
 
 /// The JSON text of a value; no line feed at its end. Pretty: one entry a line, two blanks of indentation a level.
 /// Bytes of a string that are not UTF-8 are written as U+FFFD.

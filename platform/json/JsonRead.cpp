@@ -40,6 +40,8 @@ class Builder {
   public:
     using Json = nlohmann::json;
 
+    explicit Builder(std::size_t valuesMaximum) : _valuesMaximum(valuesMaximum) {}
+
     bool null();
     bool boolean(bool value) { return add(Value(value)); }
     bool number_integer(std::int64_t value) { return add(Value(value)); }
@@ -56,6 +58,7 @@ class Builder {
 
     [[nodiscard]] Value take() { return std::move(_root); }
     [[nodiscard]] const std::string& problem() const { return _problem; }
+    [[nodiscard]] bool tooMany() const { return _values > _valuesMaximum; }
     [[nodiscard]] std::optional<std::size_t> position() const { return _position; }
 
   private:
@@ -74,7 +77,10 @@ class Builder {
     bool open(Value container);
     bool close();
     bool add(Value value);
+    bool count();
 
+    std::size_t _valuesMaximum;
+    std::size_t _values = 0;
     std::vector<Level> _levels;
     Value _root;
     std::string _problem;
@@ -98,7 +104,14 @@ bool Builder::close() {
     return add(level.form.empty() ? std::move(level.container) : std::move(level.formed));
 }
 
+bool Builder::count() {
+    return ++_values <= _valuesMaximum || fail(fmt::format("there are more than {} values", _valuesMaximum));
+}
+
 bool Builder::add(Value value) {
+    if (!count()) {
+        return false;
+    }
     if (_levels.empty()) {
         _root = std::move(value);
         return true;
@@ -127,7 +140,7 @@ bool Builder::null() {
         return fail(fmt::format("\"{}\" takes a text", level.form));
     }
     level.nullKeys.insert(level.key);
-    return true;
+    return count();
 }
 
 bool Builder::number_float(double value, const std::string& text) {
@@ -214,16 +227,17 @@ std::string place(std::string_view text, std::size_t consumed) {
 
 }  // namespace
 
-std::optional<Value> parseJson(std::string_view text, Error* error) {
+std::optional<Value> parseJson(std::string_view text, Error* error, std::size_t valuesMaximum) {
     const char* reached = text.data();
-    Builder builder;
+    Builder builder(valuesMaximum);
     if (Builder::Json::sax_parse(CountingIterator(text.data(), &reached),
                                  CountingIterator(text.data() + text.size(), &reached), &builder)) {
         return builder.take();
     }
     if (error != nullptr) {
         const std::size_t consumed = builder.position().value_or(static_cast<std::size_t>(reached - text.data()));
-        *error = Error{"json", 1, place(text, std::min(consumed, text.size() + 1)) + builder.problem()};
+        *error = Error{"json", builder.tooMany() ? jsonTooManyValues : 1,
+                       place(text, std::min(consumed, text.size() + 1)) + builder.problem()};
     }
     return std::nullopt;
 }

@@ -22,13 +22,14 @@ constexpr std::size_t costOfValue = 8;
 /// failure stops everything.
 class BinaryReader {
   public:
-    BinaryReader(std::string_view bytes, Error& error) noexcept : _bytes(bytes), _error(error) {}
+    BinaryReader(std::string_view bytes, Error& error, std::size_t valuesMaximum) noexcept
+        : _bytes(bytes), _error(error), _valuesMaximum(valuesMaximum) {}
 
     std::optional<Value> parse() {
         if (!readTrailer()) {
             return std::nullopt;
         }
-        return object(_top, 0);
+        return countedObject(_top, 0);
     }
 
   private:
@@ -85,6 +86,16 @@ class BinaryReader {
             return false;
         }
         return true;
+    }
+
+    /// An object that becomes a value, as all but keys do.
+    std::optional<Value> countedObject(std::uint64_t number, int depth) {
+        if (++_values > _valuesMaximum) {
+            fail(_table + number * _offsetSize, tooManyValues(_valuesMaximum));
+            _error.code = plistTooManyValues;
+            return std::nullopt;
+        }
+        return object(number, depth);
     }
 
     std::optional<Value> object(std::uint64_t number, int depth) {
@@ -265,7 +276,7 @@ class BinaryReader {
         Array array;
         for (std::size_t i = 0; i < place.count; ++i) {
             const auto target = reference(place.begin + i * _referenceSize);
-            auto value = target ? object(*target, depth + 1) : std::nullopt;
+            auto value = target ? countedObject(*target, depth + 1) : std::nullopt;
             if (!value) {
                 return std::nullopt;
             }
@@ -287,7 +298,7 @@ class BinaryReader {
                 return fail(at, "a key that is no text");
             }
             const auto target = reference(values + i * _referenceSize);
-            auto value = target ? object(*target, depth + 1) : std::nullopt;
+            auto value = target ? countedObject(*target, depth + 1) : std::nullopt;
             if (!value) {
                 return std::nullopt;
             }
@@ -308,12 +319,14 @@ class BinaryReader {
     std::uint64_t _table = 0;  ///< where the offset table begins and the objects end
     std::vector<bool> _open;   ///< the containers that are being read
     std::size_t _spent = 0;
+    std::size_t _valuesMaximum;
+    std::size_t _values = 0;
 };
 
 }  // namespace
 
-std::optional<Value> parseBinary(std::string_view bytes, Error& error) {
-    return BinaryReader(bytes, error).parse();
+std::optional<Value> parseBinary(std::string_view bytes, Error& error, std::size_t valuesMaximum) {
+    return BinaryReader(bytes, error, valuesMaximum).parse();
 }
 
 }  // namespace adminhost::plist

@@ -4,6 +4,8 @@
 #include <cstdint>
 #include <utility>
 
+#include <fmt/format.h>
+
 namespace adminhost::plist {
 namespace {
 
@@ -46,6 +48,10 @@ void appendUtf8(std::string& text, std::uint32_t point) {
 
 Error contentError(std::string description) {
     return Error{"propertyList", 1, std::move(description)};
+}
+
+std::string tooManyValues(std::size_t valuesMaximum) {
+    return fmt::format("there are more than {} values", valuesMaximum);
 }
 
 FromUtf16 utf8OfUtf16(std::string_view bytes, bool bigEndian) {

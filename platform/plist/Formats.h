@@ -12,9 +12,12 @@
 
 namespace adminhost::plist {
 
-/// Each parses a whole list of its form; nothing, with the error, if it is none.
-[[nodiscard]] std::optional<Value> parseXml(std::string_view bytes, Error& error);
-[[nodiscard]] std::optional<Value> parseBinary(std::string_view bytes, Error& error);
+/// Each parses a whole list of its form; nothing, with the error, if it is none or has more values.
+[[nodiscard]] std::optional<Value> parseXml(std::string_view bytes, Error& error, std::size_t valuesMaximum);
+[[nodiscard]] std::optional<Value> parseBinary(std::string_view bytes, Error& error, std::size_t valuesMaximum);
+
+/// The text of the error for more values; its code is set by whoever knows that it is this one.
+[[nodiscard]] std::string tooManyValues(std::size_t valuesMaximum);
 
 /// The record of everything that is wrong with a list's content: domain "propertyList", code 1.
 [[nodiscard]] Error contentError(std::string description);

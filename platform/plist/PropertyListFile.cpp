@@ -9,14 +9,15 @@
 
 namespace adminhost {
 
-std::optional<Value> parsePropertyList(std::string_view bytes, Error* error) {
+std::optional<Value> parsePropertyList(std::string_view bytes, Error* error, std::size_t valuesMaximum) {
     Error ignored;
     Error& place = error != nullptr ? *error : ignored;
     if (bytes.size() > plistMaximumSize) {
         place = plist::contentError(fmt::format("larger than {} bytes", plistMaximumSize));
         return std::nullopt;
     }
-    return bytes.starts_with("bplist") ? plist::parseBinary(bytes, place) : plist::parseXml(bytes, place);
+    return bytes.starts_with("bplist") ? plist::parseBinary(bytes, place, valuesMaximum)
+                                       : plist::parseXml(bytes, place, valuesMaximum);
 }
 
 std::optional<Value> readPropertyList(const DiskPath& path, Error* error) {

@@ -143,7 +143,8 @@ std::optional<Value> dateOf(std::string_view text) {
 
 class XmlReader {
   public:
-    explicit XmlReader(const char* encoding) : _parser(::XML_ParserCreate(encoding), &::XML_ParserFree) {
+    XmlReader(const char* encoding, std::size_t valuesMaximum)
+        : _parser(::XML_ParserCreate(encoding), &::XML_ParserFree), _valuesMaximum(valuesMaximum) {
         if (!_parser) {
             throw std::bad_alloc();
         }
@@ -179,6 +180,7 @@ class XmlReader {
         }
         if (!_message.empty()) {
             error = contentError(std::move(_message));
+            error.code = _values > _valuesMaximum ? plistTooManyValues : error.code;
             return std::nullopt;
         }
         return std::move(_root);
@@ -332,6 +334,9 @@ class XmlReader {
     }
 
     void store(Value value) {
+        if (++_values > _valuesMaximum) {
+            return fail(tooManyValues(_valuesMaximum));
+        }
         if (_containers.empty()) {
             _root = std::move(value);
             return;
@@ -356,6 +361,8 @@ class XmlReader {
     std::string _text;             ///< of that element
     std::optional<Value> _root;
     bool _inPlist = false;
+    std::size_t _valuesMaximum;
+    std::size_t _values = 0;
 };
 
 /// Line and column after the text, both from 1.
@@ -369,11 +376,11 @@ std::string placeAfter(std::string_view text) {
 
 }  // namespace
 
-std::optional<Value> parseXml(std::string_view bytes, Error& error) {
+std::optional<Value> parseXml(std::string_view bytes, Error& error, std::size_t valuesMaximum) {
     using namespace std::string_view_literals;
     const bool bigEndian = bytes.starts_with("\xFE\xFF"sv) || bytes.starts_with("\0<"sv);
     if (!bigEndian && !bytes.starts_with("\xFF\xFE"sv) && !bytes.starts_with("<\0"sv)) {
-        return XmlReader(nullptr).parse(bytes, error);
+        return XmlReader(nullptr, valuesMaximum).parse(bytes, error);
     }
     // expat does not notice unpaired surrogates in UTF-16, so it gets the text in UTF-8.
     if (bytes.front() != '<' && bytes.front() != '\0') {
@@ -384,7 +391,7 @@ std::optional<Value> parseXml(std::string_view bytes, Error& error) {
         error = contentError(placeAfter(converted.text) + ": invalid UTF-16");
         return std::nullopt;
     }
-    return XmlReader("UTF-8").parse(converted.text, error);
+    return XmlReader("UTF-8", valuesMaximum).parse(converted.text, error);
 }
 
 }  // namespace adminhost::plist

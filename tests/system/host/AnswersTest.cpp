@@ -191,6 +191,66 @@ TEST_F(Answers, PropertyListsAreTheSecondForm) {
     EXPECT_EQ(error.headers.at("content-type"), "application/json");
 }
 
+TEST_F(Answers, FormOfTheAnswerIsTheOneThatAcceptPrefers) {
+    const auto type = [&](const char* accept) {
+        return client.post("/v1/fixture/echo", "{}", {std::string("Accept: ") + accept}).headers.at("content-type");
+    };
+    EXPECT_EQ(type("Application/X-Plist"), "application/x-plist");
+    EXPECT_EQ(type("application/json, application/x-plist;q=0"), "application/json");
+    EXPECT_EQ(type("*/*"), "application/json");
+    EXPECT_EQ(type("text/html"), "application/json") << "an answer in another form is better than none";
+}
+
+TEST_F(Answers, BodyOfTooManyValuesIs413InBothForms) {
+    std::string json = "{\"a\":[0";
+    std::string list = "<plist><dict><key>a</key><array>";
+    for (int i = 0; i < 100'000; ++i) {
+        json += ",0";
+        list += "<true/>";
+    }
+    const HttpReply reply = client.post("/v1/fixture/echo", json + "]}");
+    expectError(reply, 413, "BODY_TOO_LARGE");
+    EXPECT_NE(reply.body.find("more than 100000 values"), std::string::npos) << reply.body;
+    expectError(
+        client.post("/v1/fixture/echo", list + "</array></dict></plist>", {"Content-Type: application/x-plist"}), 413,
+        "BODY_TOO_LARGE");
+    EXPECT_EQ(client.post("/v1/fixture/echo", "{}").status, 200);
+}
+
+TEST_F(Answers, ZeroByteInAnAddressDoesNotEndIt) {
+    expectError(client.post("/v1/fixture/echo%00more", "{}"), 404, "UNKNOWN_COMMAND");
+    EXPECT_EQ(client.post("/v1/f%69xture/ec%68o", "{}").status, 200);
+    expectError(client.get("/v1/%zz%"), 404, "UNKNOWN_PLUGIN");
+}
+
+TEST_F(Answers, WholeAddressIsServedAsItsPath) {
+    EXPECT_EQ(client.get("http://localhost/v1/").status, 200);
+    EXPECT_EQ(client.post("http://localhost/v1/fixture/echo", "{}").status, 200);
+    expectError(client.get("http://localhost"), 404, "UNKNOWN_ADDRESS");
+}
+
+TEST_F(Answers, QueryThatIsNoUtf8Is400) {
+    expectError(client.get("/v1/directory?match=%ff"), 400, "MALFORMED_ADDRESS");
+    EXPECT_EQ(client.get("/v1/directory?match=%c3%a4").status, 200);
+}
+
+TEST_F(Answers, MissingHostAndUnknownCodingAreErrorsOfTheUsualForm) {
+    UnixHttp nameless = daemon.connect();
+    nameless.send("GET /v1/ HTTP/1.1\r\n\r\n");
+    expectError(nameless.reply(), 400, "MALFORMED_HEAD");
+    UnixHttp old = daemon.connect();
+    old.send("GET /v1/ HTTP/1.0\r\n\r\n");
+    EXPECT_EQ(old.reply().status, 200);
+    UnixHttp packed = daemon.connect();
+    packed.send("POST /v1/fixture/echo HTTP/1.1\r\nHost: x\r\nTransfer-Encoding: gzip\r\n\r\n{}");
+    expectError(packed.reply(), 400, "MALFORMED_HEAD");
+}
+
+TEST_F(Answers, ClientThatAsksFirstIsRefusedBeforeItSendsABody) {
+    client.send("POST /v1/fixture/fly HTTP/1.1\r\nHost: x\r\nExpect: 100-continue\r\nContent-Length: 2\r\n\r\n");
+    expectError(client.reply(), 404, "UNKNOWN_COMMAND");
+}
+
 TEST_F(Answers, RevisionTravelsAsETagAndGuardsAChange) {
     const HttpReply look = client.post("/v1/fixture/look");
     ASSERT_TRUE(look.headers.contains("etag"));

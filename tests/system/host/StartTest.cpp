@@ -6,7 +6,9 @@
 
 #include <fstream>
 
+#include <fcntl.h>
 #include <grp.h>
+#include <sys/file.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
@@ -151,10 +153,16 @@ TEST_F(Start, PluginsThatMustNotRunAreRefusedWithTheReason) {
 }
 
 TEST_F(Start, PluginsWithoutAUsableTableAreRefusedWithTheReason) {
-    DaemonProcess daemon({{"--plugin", pluginFile("fixture_no_entry_point"), "--plugin",
-                           pluginFile("fixture_null_table"), "--plugin", pluginFile("fixture_incomplete_table"),
-                           "--plugin", pluginFile("fixture_no_description"), "--plugin", pluginFile("fixture_bad_name"),
-                           "--plugin", pluginFile("fixture_good"), "--plugin", pluginFile("fixture_good")},
+    DaemonProcess daemon({{"--plugin", pluginFile("fixture_no_entry_point"),
+                           "--plugin", pluginFile("fixture_null_table"),
+                           "--plugin", pluginFile("fixture_incomplete_table"),
+                           "--plugin", pluginFile("fixture_no_description"),
+                           "--plugin", pluginFile("fixture_bad_name"),
+                           "--plugin", pluginFile("fixture_reserved_name"),
+                           "--plugin", pluginFile("fixture_bad_command"),
+                           "--plugin", pluginFile("fixture_reserved_command"),
+                           "--plugin", pluginFile("fixture_good"),
+                           "--plugin", pluginFile("fixture_good")},
                           "",
                           {}});
     const Dictionary body = dictionaryOf(daemon.connect().get("/v1/"));
@@ -165,8 +173,11 @@ TEST_F(Start, PluginsWithoutAUsableTableAreRefusedWithTheReason) {
                               "incomplete table",
                               "does not describe its commands",
                               "cannot stand in an address",
+                              "cannot stand in an address",
+                              "does not describe its commands",
+                              "does not describe its commands",
                               "already loaded"};
-    ASSERT_EQ(refused.size(), 6U);
+    ASSERT_EQ(refused.size(), 9U);
     for (std::size_t i = 0; i < refused.size(); ++i) {
         EXPECT_NE(textAt(*refused[i].dictionary(), "reason").find(expected[i]), std::string::npos)
             << textAt(*refused[i].dictionary(), "reason");
@@ -252,6 +263,14 @@ TEST_F(Start, CheckNamesEveryProblemWithItsMend) {
     EXPECT_NE(result.output.find("there is no group \"no-such-group\""), std::string::npos) << result.output;
     EXPECT_NE(result.output.find("make its directory, or choose another with --socket"), std::string::npos)
         << result.output;
+    EXPECT_NE(run({"--check", "--config", file, "--plugin", pluginFile("fixture_no_note"), "--socket", directory / "s"})
+                  .output.find("carries no build note"),
+              std::string::npos)
+        << "one problem does not hide the others";
+    std::ofstream(directory / "file") << "precious";
+    EXPECT_NE(run({"--check", "--plugin", pluginFile("fixture_good"), "--socket", directory / "file"})
+                  .output.find("file is there already and is no socket"),
+              std::string::npos);
     const ProgramResult crashing =
         run({"--check", "--plugin", pluginFile("fixture_crashing"), "--socket", directory / "socket"});
     EXPECT_EQ(crashing.status, 1);
@@ -282,6 +301,44 @@ TEST_F(Start, MistakesInTheConfigurationAreNamedWithTheirLine) {
         EXPECT_NE(result.output.find(entry.expected), std::string::npos) << entry.text << result.output;
     }
     EXPECT_EQ(run({"--check", "--config", (directory / "missing").string()}).status, 1);
+}
+
+TEST_F(Start, ConfigurationThatOthersMayWriteIsRefused) {
+    const fs::path etc = directory / "etc";
+    fs::create_directories(etc);
+    std::ofstream(etc / "adminhostd.toml") << "queue_limit = 3\n";
+    ASSERT_EQ(::chmod((etc / "adminhostd.toml").c_str(), 0664), 0);
+    const ProgramResult ours = run({"--root", directory, "--check"});
+    EXPECT_EQ(ours.status, 1);
+    EXPECT_NE(ours.output.find("adminhostd.toml may be written by group or others; chmod go-w it"), std::string::npos)
+        << ours.output;
+
+    const std::string named = configuration("queue_limit = 3\n");
+    ASSERT_EQ(::chmod(named.c_str(), 0646), 0);
+    const ProgramResult open = run({"--config", named, "--check"});
+    EXPECT_EQ(open.status, 1);
+    EXPECT_NE(open.output.find("may be written by everybody; chmod o-w it"), std::string::npos) << open.output;
+}
+
+TEST_F(Start, LockOfAStrangerOnTheSocketsDirectoryIsAnErrorAndNoHang) {
+    const int stranger = ::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    ASSERT_EQ(::flock(stranger, LOCK_EX), 0);
+    const ProgramResult result = run({"--socket", directory / "socket", "--plugin", pluginFile("fixture_good")});
+    ::close(stranger);
+    EXPECT_EQ(result.status, 1);
+    EXPECT_NE(result.output.find("holds a lock on the directory of the socket"), std::string::npos) << result.output;
+}
+
+TEST_F(Start, WhatTheParentLeftOpenReachesNoTool) {
+    int ends[2];
+    ASSERT_EQ(::pipe(ends), 0);  // inherited by whatever this test starts
+    DaemonProcess daemon(withFixture());
+    ::close(ends[1]);
+    const fs::path pipe = fs::read_symlink("/proc/self/fd/" + std::to_string(ends[0]));
+    for (const auto& entry : fs::directory_iterator("/proc/" + std::to_string(daemon.workerPid()) + "/fd")) {
+        EXPECT_NE(fs::read_symlink(entry.path()), pipe) << entry.path();
+    }
+    ::close(ends[0]);
 }
 
 TEST_F(Start, CommandLineMistakesAreUsageErrors) {

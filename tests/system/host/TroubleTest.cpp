@@ -86,6 +86,31 @@ TEST(WorkerTrouble, TooManyWaitingIs503WithRetryAfter) {
     EXPECT_EQ(waiting.reply().status, 200);
 }
 
+TEST(WorkerTrouble, WithoutAQueueTheIdleDaemonStillServes) {
+    DaemonProcess daemon(withFixture("queue_limit = 0\n"));
+    EXPECT_EQ(daemon.connect().post("/v1/fixture/echo", "{}").status, 200);
+    UnixHttp sleeper = startSleeping(daemon, 500);
+    expectError(daemon.connect().post("/v1/fixture/echo", "{}"), 503, "TOO_MANY_WAITING");
+    EXPECT_EQ(sleeper.reply().status, 200);
+}
+
+TEST(WorkerTrouble, WorkerThatNeverStopsTalkingFillsNoMemoryAndKeepsNobodyWaiting) {
+    auto options = withFixture();
+    options.environment = {"ASAN_OPTIONS=quarantine_size_mb=1"};  // else a sanitizer keeps what was given back
+    DaemonProcess daemon(options);
+    const std::size_t before = residentKilobytesOf(daemon.pid());
+    UnixHttp talker = daemon.connect();
+    talker.begin("POST", "/v1/fixture/flood", R"({"lines": 60, "bytes": 1000000})");
+    std::size_t most = 0;
+    ASSERT_TRUE(eventually([&] {
+        EXPECT_EQ(daemon.connect().get("/v1/").status, 200);
+        most = std::max(most, residentKilobytesOf(daemon.pid()));
+        return std::filesystem::file_size(daemon.directory() / "log") >= 60'000'000;
+    }));
+    EXPECT_EQ(talker.reply().status, 204);
+    EXPECT_LT(most, before + 24'000) << "kilobytes";
+}
+
 TEST(WorkerTrouble, RequestWhoseClientWentAwayBeforeItsTurnIsNotRun) {
     DaemonProcess daemon(withFixture());
     UnixHttp sleeper = startSleeping(daemon, 400);
@@ -234,7 +259,13 @@ TEST(Clients, AccountThatIsNeitherRootNorTheDaemonsIsNotPermitted) {
     int status = -1;
     ASSERT_EQ(::waitpid(child, &status, 0), child);
     EXPECT_EQ(status, 0);
-    EXPECT_TRUE(daemon.waitForLog("by uid 65534"));
+    EXPECT_TRUE(daemon.waitForLog("fixture/echo by uid 65534"));
+    EXPECT_TRUE(daemon.waitForLog(" / by uid 65534")) << "whatever the method";
+    const std::string log = daemon.log();
+    const std::string before = "adminhostd: request ";
+    const std::size_t at = log.rfind(before, log.find(" fixture/echo by uid 65534")) + before.size();
+    const std::string id = log.substr(at, log.find(' ', at) - at);
+    expectError(daemon.connect().get("/v1/requests/" + id), 404, "UNKNOWN_REQUEST");
 }
 
 TEST(End, FinishesTheRunningRequestAnswersTheWaitingAndExitsWithZero) {

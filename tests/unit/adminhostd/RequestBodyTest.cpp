@@ -20,15 +20,59 @@ TEST(BodyFormOf, ReadsTypeAndCharacterSetInAnyCase) {
 }
 
 TEST(RequestOf, TakesDictionariesOnly) {
-    std::string problem;
+    BodyProblem problem;
     EXPECT_EQ(requestOf("", BodyForm::json, problem), Dictionary());
     EXPECT_EQ(requestOf("", BodyForm::propertyList, problem), Dictionary());
     EXPECT_EQ(requestOf("{\"a\":1}", BodyForm::json, problem), (Dictionary{{"a", 1}}));
     EXPECT_FALSE(requestOf("null", BodyForm::json, problem));
     EXPECT_FALSE(requestOf("\"text\"", BodyForm::json, problem));
-    EXPECT_EQ(problem, "line 1, column 1: a request is a dictionary, not a value of type text");
+    EXPECT_EQ(problem.text, "line 1, column 1: a request is a dictionary, not a value of type text");
     EXPECT_FALSE(requestOf("{", BodyForm::propertyList, problem));
-    EXPECT_NE(problem.find("line"), std::string::npos) << problem;
+    EXPECT_NE(problem.text.find("line"), std::string::npos) << problem.text;
+    EXPECT_FALSE(problem.tooManyValues);
+}
+
+TEST(RequestOf, BoundsTheNumberOfValuesInBothForms) {
+    // The list, its elements and the dictionary around it.
+    const auto json = [](std::size_t values) {
+        std::string text = "{\"a\":[0";
+        for (std::size_t i = 3; i < values; ++i) {
+            text += ",0";
+        }
+        return text + "]}";
+    };
+    const auto list = [](std::size_t values) {
+        std::string text = "<plist><dict><key>a</key><array>";
+        for (std::size_t i = 2; i < values; ++i) {
+            text += "<true/>";
+        }
+        return text + "</array></dict></plist>";
+    };
+    BodyProblem problem;
+    EXPECT_TRUE(requestOf(json(bodyValuesMaximum), BodyForm::json, problem)) << problem.text;
+    EXPECT_TRUE(requestOf(list(bodyValuesMaximum), BodyForm::propertyList, problem)) << problem.text;
+    EXPECT_FALSE(requestOf(json(bodyValuesMaximum + 1), BodyForm::json, problem));
+    EXPECT_TRUE(problem.tooManyValues);
+    EXPECT_EQ(problem.text, "line 1, column 200005: there are more than 100000 values");
+    problem = {};
+    EXPECT_FALSE(requestOf(list(bodyValuesMaximum + 1), BodyForm::propertyList, problem));
+    EXPECT_TRUE(problem.tooManyValues);
+    EXPECT_TRUE(problem.text.starts_with("line 1, column ")) << problem.text;
+}
+
+TEST(PrefersPropertyList, WeighsWhatIsAcceptedAndTakesTheFirstOfEquals) {
+    for (const char* accept :
+         {"application/x-plist", "Application/X-PList", "text/html, application/x-plist", "application/x-plist, */*",
+          "application/x-plist, application/json", "application/json;q=0.5, application/x-plist;q=0.9",
+          "application/json; q=0, application/x-plist; q=0.1"}) {
+        EXPECT_TRUE(prefersPropertyList(accept)) << accept;
+    }
+    for (const char* accept : {"", "*/*", "application/json", "text/html", "application/x-plist;q=0",
+                               "application/json, application/x-plist", "application/x-plist;q=0.1, application/json",
+                               "application/x-plist;q=0.1, */*", "application/x-plistx", ",;",
+                               "application/x-plist;q=x, application/x-plist;q=0"}) {
+        EXPECT_FALSE(prefersPropertyList(accept)) << accept;
+    }
 }
 
 TEST(RevisionsOf, ReadsAListOfQuotedTexts) {

@@ -152,6 +152,20 @@ TEST(ParseJson, NestingIsBoundedAt512) {
     EXPECT_FALSE(parseJson(std::string(5'000'000, '[')));
 }
 
+TEST(ParseJson, NumberOfValuesIsBoundedByTheCaller) {
+    // Every list, dictionary, form, null and single value counts once.
+    const std::string text = R"({"a":[1,true],"b":null,"c":{"$date":"2026-01-31T08:00:00Z"}})";
+    EXPECT_TRUE(parseJson(text, nullptr, 6));
+    Error error;
+    EXPECT_FALSE(parseJson(text, &error, 5));
+    EXPECT_EQ(error.code, jsonTooManyValues);
+    EXPECT_EQ(error.description, "line 1, column 60: there are more than 5 values");
+    EXPECT_FALSE(parseJson(R"({"a":null,"b":null})", &error, 1));
+    EXPECT_EQ(error.code, jsonTooManyValues);
+    EXPECT_FALSE(parseJson("[1,]", &error, 5));
+    EXPECT_EQ(error.code, 1);
+}
+
 TEST(ParseJson, InvalidUtf8IsRefusedWithItsPlaceAndNotQuoted) {
     const std::string problem = problemOf("{\"a\":\n\"x\xff\"}");
     EXPECT_TRUE(problem.starts_with("line 2, column 3: ")) << problem;

@@ -242,6 +242,16 @@ TEST(BinaryReader, ObjectsThatMultiplyThemselvesAreRefused) {
                 testing::EndsWith("more content than a property list may have"));
 }
 
+TEST(BinaryReader, NumberOfValuesIsBoundedByTheCallerHoweverOftenOneObjectStands) {
+    // A dictionary of one list of three texts: its key is none.
+    const std::string bytes = binary({"\xD1\x01\x02"s, "\x51k"s, "\xA3\x01\x01\x01"s});
+    EXPECT_TRUE(parsePropertyList(bytes, nullptr, 5));
+    Error error;
+    EXPECT_FALSE(parsePropertyList(bytes, &error, 4));
+    EXPECT_EQ(error.code, plistTooManyValues);
+    EXPECT_THAT(error.description.value_or(""), testing::EndsWith(": there are more than 4 values"));
+}
+
 TEST(BinaryReader, ReferencesAndOffsetsToNothingAreRefused) {
     EXPECT_EQ(errorOf(binary({"\xA1\x05"s})), "byte 9: a reference to an object that does not exist");
     EXPECT_EQ(errorOf(binary({"\xD1\x05\x00"s})), "byte 9: a reference to an object that does not exist");

@@ -35,6 +35,17 @@ Value valueOf(std::string_view bytes) {
     return value.value_or(nullptr);
 }
 
+TEST(XmlReader, NumberOfValuesIsBoundedByTheCaller) {
+    const std::string text = "<plist><dict><key>a</key><array><true/><true/></array></dict></plist>";
+    EXPECT_TRUE(parsePropertyList(text, nullptr, 4));
+    Error error;
+    EXPECT_FALSE(parsePropertyList(text, &error, 3));
+    EXPECT_EQ(error.code, plistTooManyValues);
+    EXPECT_EQ(error.description, "line 1, column 55: there are more than 3 values");
+    EXPECT_FALSE(parsePropertyList("<plist>", &error, 3));
+    EXPECT_EQ(error.code, 1);
+}
+
 TEST(XmlReader, ReadsEveryType) {
     const Value expected = Dictionary{{"b", true},
                                       {"f", false},
