@@ -1,13 +1,13 @@
 #include "adminhostctl/ChangeVerbs.h"
 
 #include "adminhostctl/DesiredFile.h"
+#include "adminhostctl/OutputFile.h"
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Toml.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/Writing.h"
 
 #include <algorithm>
-#include <fstream>
 
 namespace adminhost::ctl {
 namespace {
@@ -151,12 +151,7 @@ ExitStatus exportState(const Context& context, Words arguments) {
         context.out << text;
         return ExitStatus::done;
     }
-    std::ofstream file(arguments.front(), std::ios::binary | std::ios::trunc);
-    file << text;
-    file.close();
-    if (!file) {
-        throw usageError(arguments.front() + " cannot be written");
-    }
+    writeOutput(arguments.front(), text);
     return ExitStatus::done;
 }
 

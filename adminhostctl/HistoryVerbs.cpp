@@ -4,6 +4,7 @@
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
+#include "adminhostctl/Writing.h"
 #include "platform/json/Json.h"
 #include "platform/value/Text.h"
 
@@ -124,39 +125,27 @@ ExitStatus rollback(const Context& context, std::span<const std::string> argumen
     if (found == entries.end()) {
         throw usageError("the history has no entry " + shown(arguments.front()) + "; adminhostctl history lists them");
     }
-    const Dictionary& wanted = dictionaryAt(*found->dictionary(), "settings");
-    const std::vector<std::string> keys = writableKeys(write.description);
-    const Dictionary before = currentSettings(context);
-    if (changesBetween(before, wanted, keys).empty()) {
-        context.out << "no change\n";
-        return ExitStatus::done;
+    const Dictionary& settings = dictionaryAt(*found->dictionary(), "settings");
+    const CurrentState current = readState(context);
+    Wanted wanted;
+    std::vector<std::string> staying;
+    for (const std::string& key : writableKeys(write.description)) {
+        if (settings.contains(key)) {
+            wanted.settings.set(key, settings.get(key));
+        } else if (current.state.settings.contains(key)) {
+            staying.push_back(key);
+        }
     }
-    Dictionary configuration;
-    for (const std::string& key : keys) {
-        configuration.set(key, wanted.get(key));
+    wanted.lookUpController = true;
+    const ExitStatus status = carryOut(context, wanted, current);
+    if (settings.contains("nimbo_client_password")) {
+        context.err << "The grid password stays as it is: a stored password cannot be written back.\n";
     }
-    const auto answer = context.service.perform(
-        write, {{"configuration", configuration}, {"optionalArguments", Dictionary{{"variant", "getConfig"}}}});
-    const Dictionary none;
-    const Dictionary& said = answer && answer->dictionary() != nullptr ? *answer->dictionary() : none;
-    if (const std::string error = errorOf(write.description, said); !error.empty()) {
-        throw Failure(ExitStatus::answeredError, "the service answered an error: " + error);
+    for (const std::string& key : staying) {
+        context.err << "adminhostctl: settings." << key << " was not set then; it cannot be taken out and stays "
+                    << settingText(current.state.settings.get(key)) << '\n';
     }
-    const Dictionary& after = dictionaryAt(said, "configuration");
-    for (const std::string& change : changesBetween(before, after, keys)) {
-        context.out << change << '\n';
-    }
-    if (said.get("needsRecycleOrRestart") == Value(true)) {
-        context.out << "The service must be restarted for this to take effect.\n";
-    }
-    if (wanted.contains("nimbo_client_password")) {
-        context.out << "The grid password stays as it is: a stored password cannot be written back.\n";
-    }
-    const std::vector<std::string> missing = changesBetween(after, wanted, keys);
-    for (const std::string& difference : missing) {
-        context.err << "adminhostctl: did not take: " << difference << '\n';
-    }
-    return missing.empty() ? ExitStatus::done : ExitStatus::answeredError;
+    return staying.empty() ? status : ExitStatus::answeredError;
 }
 
 }  // namespace adminhost::ctl

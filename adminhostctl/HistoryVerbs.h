@@ -12,8 +12,8 @@ namespace adminhost::ctl {
 
 [[nodiscard]] ExitStatus whois(const Context& context, std::span<const std::string> arguments);
 [[nodiscard]] ExitStatus history(const Context& context, std::span<const std::string> arguments);
-/// Writes the settings of an entry through the same write as any other. What is set now and was not set then stays, and
-/// so does a password: neither can be written back, and both are said.
+/// Writes the settings of an entry as every verb that changes something does it (Writing.h). What is set now and was
+/// not set then stays, and is named with answeredError; a password stays too, and is said.
 [[nodiscard]] ExitStatus rollback(const Context& context, std::span<const std::string> arguments);
 
 }  // namespace adminhost::ctl

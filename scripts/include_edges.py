@@ -30,7 +30,7 @@ MAY_INCLUDE = {
     "adminhostd": BASE,
     "adminhostctl": BASE,
 }
-CONTROL_MAY_INCLUDE = ("platform/value/", "platform/plist/", "platform/json/")
+CONTROL_MAY_INCLUDE = ("platform/value/", "platform/plist/", "platform/json/", "platform/files/")
 FREE = {"tests", "bench", "fuzz"}
 
 

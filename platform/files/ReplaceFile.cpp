@@ -282,7 +282,7 @@ int giveName(const FilePlace& place, const std::string& name) noexcept {
 
 }  // namespace
 
-std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path) {
+std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path, mode_t newMode) {
     FilePlace place;
     if (const int number = openPlace(diskPath(path), place); number != 0) {
         return failure("open the directory of", path, number);
@@ -304,7 +304,7 @@ std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path) {
         if (auto error = keepProperties(old, status, temporary.descriptor(), path)) {
             return error;
         }
-    } else if (::fchmod(temporary.descriptor(), 0644) != 0) {
+    } else if (::fchmod(temporary.descriptor(), newMode) != 0) {
         return failure("set the mode of", path, errno);
     }
     if (const int number = temporary.flush(); number != 0) {

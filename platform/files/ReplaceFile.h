@@ -8,12 +8,14 @@
 #include <optional>
 #include <string_view>
 
+#include <sys/types.h>
+
 namespace adminhost {
 
 /// Writes a temporary file ".NAME.adminhost-" + 16 hexadecimal digits beside the file, flushes it, renames it over the
 /// file and flushes the directory. Owner, mode, access control list and extended attributes of the old file are kept;
-/// a new file is 0644 and belongs to the process's user. Labels and attributes that only the system may set, and
-/// attributes that the file system does not know, are left to the system.
+/// a new file has the given mode and belongs to the process's user. Labels and attributes that only the system may set,
+/// and attributes that the file system does not know, are left to the system.
 ///
 /// No link is followed: one in the file's place is itself replaced by a new file, one on the way only where
 /// openPlace() allows it. Anything else in its place (a directory, a pipe) is an error.
@@ -24,7 +26,7 @@ namespace adminhost {
 ///
 /// Temporary files that killed processes left for the same file are removed first; those of living writers are not.
 /// Several may write the same file at once, also from machines that share the directory: one of them is the last.
-[[nodiscard]] std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path);
+[[nodiscard]] std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path, mode_t newMode = 0644);
 
 /// Removes the temporary files that killed processes left for the file, as replaceFile() does before it writes. Those
 /// that cannot be removed stay.

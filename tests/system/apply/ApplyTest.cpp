@@ -2,9 +2,16 @@
 
 #include "tests/system/apply/ControlledService.h"
 
+#include <filesystem>
+#include <iterator>
+#include <thread>
+
+#include <sys/stat.h>
+
 namespace adminhost::test {
 namespace {
 
+namespace fs = std::filesystem;
 using testing::HasSubstr;
 using testing::Not;
 
@@ -79,6 +86,65 @@ TEST_F(Apply, ChangesAreShownAppliedReadBackAndThenSettled) {
     EXPECT_EQ(root.sql("select value from properties where name='default_language'"), "fr\n");
     EXPECT_EQ(ctl({"apply", desired}).output, "no change\n");
     EXPECT_EQ(ctl({"export"}).output, read(desired)) << "what was applied is what is exported";
+}
+
+TEST_F(Apply, FileOfAStateThatAnotherClientChangedMeanwhileIsRefusedAndNothingIsWritten) {
+    const std::string text = ctl({"export"}).output;
+    const std::string desired = root.directory() + "/desired.pipe";
+    ASSERT_EQ(::mkfifo(desired.c_str(), 0600), 0);
+    ProgramResult apply;
+    std::thread applying([&] { apply = ctl({"apply", desired}); });
+    {
+        // Opening waits until the command line reads the file, which it does after it has read the service's state.
+        std::ofstream file(desired);
+        EXPECT_EQ(ctl({"settings", "set", "tunnel_server_port", "9999"}).status, 0) << "the other client";
+        std::string other = text;
+        other.replace(other.find("server_port = 8170"), 18, "server_port = 8180");
+        file << other;
+    }
+    applying.join();
+    EXPECT_EQ(apply.status, 1);
+    EXPECT_THAT(apply.output, HasSubstr("have changed since they were read"));
+    EXPECT_THAT(apply.output, HasSubstr("REVISION_CHANGED"));
+    EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8170\n");
+    EXPECT_EQ(ctl({"settings", "get", "tunnel_server_port"}).output, "9999\n");
+    EXPECT_THAT(ctl({"history"}).output, Not(HasSubstr("8180"))) << "a refused write has no entry";
+}
+
+TEST_F(Apply, ExportedFileIsTheOwnersAloneAndReplacesTheOldOneAsAWhole) {
+    const std::string place = root.directory() + "/exported";
+    fs::create_directory(place);
+    const std::string path = place + "/state.toml";
+    EXPECT_EQ(ctl({"export", path}).status, 0);
+    EXPECT_EQ(fs::status(path).permissions(), fs::perms(0600));
+    EXPECT_EQ(read(path), ctl({"export"}).output);
+
+    std::ofstream(path) << "old";
+    fs::permissions(path, fs::perms(0640));
+    fs::create_hard_link(path, place + "/same");
+    fs::create_symlink(path, place + "/link");
+    EXPECT_EQ(ctl({"export", place + "/link"}).status, 0);
+    EXPECT_EQ(read(place + "/same"), "old") << "the old file was not written to";
+    EXPECT_EQ(read(path), ctl({"export"}).output);
+    EXPECT_TRUE(fs::is_symlink(place + "/link"));
+    EXPECT_EQ(fs::status(path).permissions(), fs::perms(0640)) << "as its owner wants it";
+    EXPECT_EQ(std::distance(fs::directory_iterator(place), fs::directory_iterator()), 3) << "nothing else is left";
+}
+
+TEST_F(Apply, ExportIntoAPipeIsWrittenToItAndOneThatCannotBeWrittenIsSaid) {
+    const std::string pipe = root.directory() + "/export.pipe";
+    ASSERT_EQ(::mkfifo(pipe.c_str(), 0600), 0);
+    std::string piped;
+    std::thread reader([&] { piped = read(pipe); });
+    EXPECT_EQ(ctl({"export", pipe}).status, 0);
+    reader.join();
+    EXPECT_EQ(piped, ctl({"export"}).output);
+    EXPECT_TRUE(fs::is_fifo(pipe));
+
+    const ProgramResult nowhere = ctl({"export", root.directory() + "/missing/state.toml"});
+    EXPECT_EQ(nowhere.status, 2);
+    EXPECT_THAT(nowhere.output, HasSubstr("missing/state.toml: No such file or directory"));
+    EXPECT_EQ(ctl({"export", root.directory()}).status, 2);
 }
 
 TEST_F(Apply, UnlistedOnesGoOnlyWhenTheSwitchSaysSo) {
