@@ -5,7 +5,6 @@
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/Writing.h"
-#include "platform/json/Json.h"
 #include "platform/value/Text.h"
 
 #include <algorithm>
@@ -75,7 +74,7 @@ ExitStatus whois(const Context& context, std::span<const std::string> arguments)
                       "the directory knows nobody with the name or UUID " + shown(arguments.front()));
     }
     if (context.options.format != Format::text) {
-        context.out << jsonOf(*entries, true) << '\n';
+        writeValue(context, *entries, Description());
         return ExitStatus::done;
     }
     for (std::size_t i = 0; i < entries->size(); ++i) {
@@ -88,7 +87,7 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
     const CommandRef write = context.service.command("writeSettings");
     const Array entries = entriesOf(context, write);
     if (context.options.format != Format::text) {
-        context.out << jsonOf(entries, true) << '\n';
+        writeValue(context, entries, Description());
         return ExitStatus::done;
     }
     if (entries.empty()) {
@@ -137,8 +136,9 @@ ExitStatus rollback(const Context& context, std::span<const std::string> argumen
         }
     }
     wanted.lookUpController = true;
+    const bool changes = !planOf(wanted, current.state).changes.empty();
     const ExitStatus status = carryOut(context, wanted, current);
-    if (settings.contains("nimbo_client_password")) {
+    if (changes && settings.contains("nimbo_client_password")) {
         context.err << "The grid password stays as it is: a stored password cannot be written back.\n";
     }
     for (const std::string& key : staying) {

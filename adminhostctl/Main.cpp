@@ -45,9 +45,8 @@ int runMain(int count, char** words) {
     std::string format = "text";
     std::vector<std::string> rest;
     CLI::App app(
-        "Administrates the service through its daemon. \"adminhostctl help\" lists the verbs, \"adminhostctl "
-        "commands\" the "
-        "service's commands.",
+        "Administrates the service through its daemon.\n\"adminhostctl help\" lists the verbs, \"adminhostctl "
+        "commands\" the service's commands.",
         "adminhostctl");
     app.add_option("--socket", socket, "The daemon's socket")->envname("ADMINHOST_SOCKET")->type_name("PATH");
     app.add_option("--format", format, "How to write the answer: text (for reading), json or plist")
@@ -65,12 +64,16 @@ int runMain(int count, char** words) {
     CLI::Option* const on = app.add_flag("--protect", protect, "With property set: store the value encrypted");
     app.add_flag("--no-protect", noProtect, "With property set: store the value as it is")->excludes(on);
     app.add_option("words", rest, "A verb or a command, and its arguments: KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-")
-        ->required()
         ->type_name("WORD");
+    app.set_version_flag("--version", std::string("adminhostctl ") + ADMINHOST_RELEASE);
     try {
         app.parse(count, words);
     } catch (const CLI::ParseError& error) {
         return app.exit(error) == 0 ? statusOf(ExitStatus::done) : statusOf(ExitStatus::usage);
+    }
+    if (rest.empty()) {
+        std::cerr << "adminhostctl: a verb or a command is missing; adminhostctl help lists them\n";
+        return statusOf(ExitStatus::usage);
     }
     options.format = format == "json" ? Format::json : format == "plist" ? Format::plist : Format::text;
     options.width = outputWidth();

@@ -287,7 +287,8 @@ Dictionary parseRequest(std::string_view bytes, const std::string& from) {
     Value value = parseStructure(bytes, from);
     Dictionary* dictionary = value.dictionary();
     if (dictionary == nullptr) {
-        throw usageError(from + ": a request is a dictionary, not " + std::string(nameOf(value.type())));
+        throw usageError(from + ": a request is a dictionary, not a value of type " +
+                         std::string(nameOf(value.type())));
     }
     return std::move(*dictionary);
 }

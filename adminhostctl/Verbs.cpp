@@ -61,8 +61,10 @@ std::string typeText(const KeyDescription& key) {
                                                : type;
 }
 
-std::string keyTable(const std::vector<KeyDescription>& keys, std::size_t width) {
-    Table table({"key", "type", "meaning"});
+/// Key paths are long and cannot be broken: each has a line of its own, and its meaning stands below.
+std::string keyList(const std::vector<KeyDescription>& keys, std::size_t width) {
+    constexpr std::size_t indent = 6;
+    std::string text;
     for (const KeyDescription& key : keys) {
         std::string help = key.help;
         for (std::size_t i = 0; i < key.allowed.size(); ++i) {
@@ -70,9 +72,12 @@ std::string keyTable(const std::vector<KeyDescription>& keys, std::size_t width)
         }
         help += key.required ? " Needed." : "";
         help += key.secret ? " Secret: " + key.path + "@FILE or " + key.path + "@-." : "";
-        table.addRow({shown(key.path), typeText(key), shown(help)});
+        text += "  " + shown(key.path) + " (" + shown(typeText(key)) + ")\n";
+        for (const std::string& line : wrapped(shown(help), width - indent)) {
+            text.append(indent, ' ').append(line + '\n');
+        }
     }
-    return table.text(width, 2);
+    return text;
 }
 
 void helpOfCommand(const Context& context, const std::string& name) {
@@ -91,10 +96,10 @@ void helpOfCommand(const Context& context, const std::string& name) {
     context.out << "\nadminhostctl " << shown(description.name())
                 << " [KEY=TEXT | KEY:=JSON | KEY@FILE | KEY@-]... [--file FILE|-]\n";
     if (!description.keys().empty()) {
-        context.out << "\nKeys:\n" << keyTable(description.keys(), context.options.width);
+        context.out << "\nKeys:\n" << keyList(description.keys(), context.options.width);
     }
     if (!description.answerKeys().empty()) {
-        context.out << "\nAnswer:\n" << keyTable(description.answerKeys(), context.options.width);
+        context.out << "\nAnswer:\n" << keyList(description.answerKeys(), context.options.width);
     }
     if (!description.errors().empty()) {
         context.out << "\nErrors:\n" << Reading(Description(), context.options.width).text(description.errors());

@@ -174,7 +174,7 @@ TEST_F(Ctl, CommandsAndHelpComeFromTheDaemon) {
     EXPECT_EQ(run({"commands", "--names"}).out, "echoTyped\nmeasure\nfail\nbreakDown\nnothing\ngetCameras\n");
     EXPECT_THAT(run({"commands"}).out, HasSubstr("echoTyped   described  Serves echoTyped.\n"));
     EXPECT_THAT(run({"help", "echoTyped"}).out,
-                AllOf(HasSubstr("echoTyped: Serves echoTyped."), HasSubstr("  count        whole number  A key."),
+                AllOf(HasSubstr("echoTyped: Serves echoTyped."), HasSubstr("\n  count (whole number)\n      A key.\n"),
                       HasSubstr("Secret: password@FILE or password@-.")));
     EXPECT_EQ(run({"help", "fail", "--names"}).out, "status=\n");
 }
@@ -185,6 +185,7 @@ TEST_F(Ctl, StatusTellsOfPlugInsAndOfWhatWaits) {
 }
 
 TEST_F(Ctl, WrongNumbersOfArgumentsAreUsage) {
+    EXPECT_THAT(run({}).err, HasSubstr("adminhostctl help lists"));
     for (const std::vector<std::string>& words : {std::vector<std::string>{},
                                                   {"camera"},
                                                   {"camera", "show"},
@@ -199,6 +200,16 @@ TEST(CtlReach, NoDaemonIsStatusThree) {
     const Result result = runIn(program, {"status"}, "/nowhere/socket");
     EXPECT_EQ(result.status, 3);
     EXPECT_THAT(result.err, HasSubstr("cannot be reached at /nowhere/socket: No such file or directory"));
+}
+
+TEST(CtlReach, VersionAndOptionsNeedNoDaemon) {
+    EXPECT_EQ(runIn(program, {"--version"}, "/nowhere/socket").out, "adminhostctl " ADMINHOST_RELEASE "\n");
+    const Result options = runIn(program, {"--help"}, "/nowhere/socket");
+    EXPECT_EQ(options.status, 0);
+    for (const char* option : {"--socket", "--format", "--file", "--names", "--group", "--password-file", "--protect",
+                               "--no-protect", "--version"}) {
+        EXPECT_THAT(options.out, HasSubstr(option));
+    }
 }
 
 TEST(CtlReach, HelpOfTheVerbsNeedsNoDaemon) {

@@ -2,6 +2,7 @@
 // service.
 
 #include "platform/json/Json.h"
+#include "platform/plist/PropertyList.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
@@ -122,7 +123,7 @@ TEST_F(Settings, HistoryTellsWhatEachWriteChangedAndRollbackGoesBackThroughTheSa
     EXPECT_EQ(rollback.status, 0) << rollback.output;
     EXPECT_THAT(rollback.output, HasSubstr("server_port: 9001 -> 8170"));
     EXPECT_THAT(rollback.output, HasSubstr("has to be restarted"));
-    EXPECT_THAT(ctl({"rollback", "1"}).output, testing::StartsWith("no change\n"));
+    EXPECT_EQ(ctl({"rollback", "1"}).output, "no change\n");
     EXPECT_THAT(ctl({"history"}).output, HasSubstr("other -> lumiogrid"));
 }
 
@@ -167,6 +168,21 @@ TEST_F(Settings, RollbackOfSettingsThatAnotherClientChangesMeanwhileIsRefused) {
     root.clearSwitches();
     EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "9001\n");
     EXPECT_EQ(ctl({"settings", "get", "server_host"}).output, "other\n");
+}
+
+TEST_F(Settings, LookingBackHasEveryFormat) {
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
+    for (const std::string& verb : {std::string("history"), std::string("whois")}) {
+        std::vector<std::string> words{"--format", "plist", verb};
+        if (verb == "whois") {
+            words.emplace_back("anna");
+        }
+        const auto list = parsePropertyList(ctl(words).output);
+        ASSERT_TRUE(list && list->array() != nullptr) << verb;
+        EXPECT_EQ(list->array()->size(), 1U);
+        words[1] = "json";
+        EXPECT_EQ(parseJson(ctl(words).output), list);
+    }
 }
 
 TEST_F(Settings, WhoisFindsPeopleAndGroupsByNameAndUuid) {

@@ -222,7 +222,7 @@ TEST(ParseRequest, ReadsJsonAndPropertyLists) {
 TEST(ParseRequest, NamesFileLineAndColumn) {
     for (const auto& [bytes, message] :
          std::map<std::string, std::string>{{"{\n  \"a\" 1}", "f: line 2, column "},
-                                            {"[1]", "f: a request is a dictionary, not list"},
+                                            {"[1]", "f: a request is a dictionary, not a value of type list"},
                                             {"", "f: line 1, column "}}) {
         try {
             static_cast<void>(adminhost::ctl::parseRequest(bytes, "f"));
