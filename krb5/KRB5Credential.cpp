@@ -26,6 +26,10 @@ KRB5Credential::KRB5Credential(const krb5_creds* nativeCredential, std::shared_p
     if (nativeCredential == nullptr || _context == nullptr || _context->nativeContext() == nullptr) {
         return;
     }
+    // The library crashes copying a record without them.
+    if (nativeCredential->client == nullptr || nativeCredential->server == nullptr) {
+        return;
+    }
     krb5_creds* copy = nullptr;
     if (krb5_copy_creds(_context->nativeContext(), nativeCredential, &copy) == 0) {
         *_nativeCredential.receive() = copy;

@@ -17,7 +17,8 @@ namespace lumio {
 /// 32-bit times are read as signed.
 class KRB5Credential {
   public:
-    /// Always an object. A null record, or one that cannot be copied, gives one without a record.
+    /// Always an object. A null record, or one that cannot be copied (one without client or server), gives one without
+    /// a record.
     [[nodiscard]] static std::unique_ptr<KRB5Credential> initWithNativeCredential(const krb5_creds* nativeCredential,
                                                                                   std::shared_ptr<KRB5Context> context);
 

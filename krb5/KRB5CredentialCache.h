@@ -63,9 +63,9 @@ class KRB5CredentialCache : public KRB5Object {
     [[nodiscard]] bool initialCredentialAcquisitionIsNecessaryForPrincipal(const KRB5Principal* principal) const;
 
     /// Empties the cache, binds it to the principal (null: the cache's) and asks the KDC for a forwardable, proxiable
-    /// ticket-granting ticket: with the password if there is one, else with the key of the keytab (null: the library's
-    /// default keytab). Read errorCode for the outcome; a failed request leaves an empty cache. Blocks as long as the
-    /// library waits for the KDC.
+    /// ticket-granting ticket: with the password if there is one, else with the key of the keytab (null, or one that
+    /// could not be opened: the library's default keytab). Read errorCode for the outcome; a failed request leaves an
+    /// empty cache. Blocks as long as the library waits for the KDC.
     void acquireInitialCredentialWithPrincipal(const KRB5Principal* principal, const KRB5Keytab* keytab,
                                                std::optional<std::string_view> password);
     void acquireInitialCredentialWithPassword(std::string_view password);

@@ -1,5 +1,7 @@
 #include "tests/support/Kdc.h"
 
+#include "tests/support/Program.h"
+
 #include <cerrno>
 #include <chrono>
 #include <csignal>
@@ -7,6 +9,7 @@
 #include <fstream>
 #include <stdexcept>
 #include <thread>
+#include <vector>
 
 #include <fcntl.h>
 #include <netinet/in.h>
@@ -18,6 +21,10 @@
 extern char** environ;
 
 namespace support {
+
+using adminhost::test::Errors;
+using adminhost::test::runProgram;
+
 namespace {
 
 /// A descriptor, closed when it goes away.
@@ -37,9 +44,8 @@ class Descriptor {
     int _number;
 };
 
-/// Starts the program with these files as its input and output.
-pid_t spawn(const std::vector<std::string>& arguments, const std::filesystem::path& input,
-            const std::filesystem::path& output) {
+/// Starts the program with nothing to read and its output in the file.
+pid_t spawn(const std::vector<std::string>& arguments, const std::filesystem::path& output) {
     std::vector<char*> argv;
     argv.reserve(arguments.size() + 1);
     for (const std::string& argument : arguments) {
@@ -48,7 +54,7 @@ pid_t spawn(const std::vector<std::string>& arguments, const std::filesystem::pa
     argv.push_back(nullptr);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, 0, input.c_str(), O_RDONLY, 0);
+    posix_spawn_file_actions_addopen(&actions, 0, "/dev/null", O_RDONLY, 0);
     posix_spawn_file_actions_addopen(&actions, 1, output.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
     posix_spawn_file_actions_adddup2(&actions, 1, 2);
     pid_t pid = 0;
@@ -73,8 +79,8 @@ void write(const std::filesystem::path& path, std::string_view text) {
     }
 }
 
-std::filesystem::path makeTemporaryDirectory(const std::string& name) {
-    std::string pattern = std::filesystem::temp_directory_path() / (name + ".XXXXXX");
+std::filesystem::path makeTemporaryDirectory() {
+    std::string pattern = std::filesystem::temp_directory_path() / "kdc.XXXXXX";
     if (mkdtemp(pattern.data()) == nullptr) {
         throw std::runtime_error("mkdtemp: " + std::string(std::strerror(errno)));
     }
@@ -118,20 +124,7 @@ bool accepts(int port) {
 
 }  // namespace
 
-Finished run(const std::vector<std::string>& arguments, std::string_view input) {
-    const std::filesystem::path directory = makeTemporaryDirectory("run");
-    write(directory / "in", input);
-    int status = 0;
-    const pid_t pid = spawn(arguments, directory / "in", directory / "out");
-    while (waitpid(pid, &status, 0) < 0 && errno == EINTR) {
-    }
-    Finished finished{WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status),
-                      contentsOf(directory / "out")};
-    std::filesystem::remove_all(directory);
-    return finished;
-}
-
-Kdc::Kdc(std::string realm) : _realm(std::move(realm)), _directory(makeTemporaryDirectory("kdc")) {
+Kdc::Kdc(std::string realm) : _realm(std::move(realm)), _directory(makeTemporaryDirectory()) {
     try {
         createDatabase();
         for (int attempt = 0; _pid == 0; ++attempt) {
@@ -183,7 +176,8 @@ void Kdc::createDatabase() const {
                                        directory + "/kdc.log\n admin_server = FILE:" + directory + "/kadmin.log\n");
     write(_directory / "kadm5.acl", "");
     const ScopedEnvironment scoped(environment());
-    const Finished created = run({"/usr/sbin/kdb5_util", "create", "-s", "-r", _realm, "-P", "master"});
+    const auto created =
+        runProgram({"/usr/sbin/kdb5_util", "create", "-s", "-r", _realm, "-P", "master"}, Errors::merge);
     if (created.status != 0) {
         throw std::runtime_error("kdb5_util: " + created.output);
     }
@@ -198,8 +192,7 @@ bool Kdc::start(int port) {
     write(_directory / "kdc.conf",
           "[kdcdefaults]\n kdc_listen = " + address + "\n kdc_tcp_listen = " + address + "\n" + kdcConfiguration);
     // A test program that crashes takes its KDC along.
-    _pid = spawn({"/usr/bin/setpriv", "--pdeathsig", "KILL", "/usr/sbin/krb5kdc", "-n"}, "/dev/null",
-                 _directory / "kdc.out");
+    _pid = spawn({"/usr/bin/setpriv", "--pdeathsig", "KILL", "/usr/sbin/krb5kdc", "-n"}, _directory / "kdc.out");
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
     while (std::chrono::steady_clock::now() < deadline) {
         if (waitpid(_pid, nullptr, WNOHANG) == _pid) {
@@ -226,7 +219,7 @@ void Kdc::stop() noexcept {
 
 void Kdc::admin(std::string_view commands) const {
     const ScopedEnvironment scoped(environment());
-    const Finished done = run({"/usr/sbin/kadmin.local"}, commands);
+    const auto done = runProgram({"/usr/sbin/kadmin.local"}, Errors::merge, commands);
     // The tool's exit status does not tell: failures are lines such as "add_principal: Principal or policy already
     // exists while creating "alice@R"."
     if (done.status != 0 || done.output.find(" while ") != std::string::npos ||

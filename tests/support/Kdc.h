@@ -8,21 +8,10 @@
 #include <filesystem>
 #include <string>
 #include <string_view>
-#include <vector>
 
 #include <sys/types.h>
 
 namespace support {
-
-/// Output and exit status (128 + signal for a killed one) of a program that ran to its end.
-struct Finished {
-    int status;
-    std::string output;  ///< standard output and standard error together
-};
-
-/// Runs a program (absolute path first) with the present environment and the input.
-/// Throws std::runtime_error if it cannot be started.
-Finished run(const std::vector<std::string>& arguments, std::string_view input = {});
 
 class Kdc {
   public:

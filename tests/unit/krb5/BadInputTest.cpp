@@ -1,14 +1,18 @@
 // Kerberos when the world is broken: KDCs, clocks, disks and files.
 
 #include "krb5/KRB5CredentialCache.h"
+#include "tests/support/KeytabFile.h"
 #include "tests/unit/krb5/Realm.h"
 
+#include <array>
 #include <csignal>
 #include <ctime>
 
+#include <linux/capability.h>
 #include <netinet/in.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
+#include <sys/syscall.h>
 #include <sys/time.h>
 #include <unistd.h>
 
@@ -79,6 +83,24 @@ class FullDisk {
   private:
     rlimit _former{};
     void (*_formerHandler)(int);
+};
+
+/// For a while, root has to obey the permissions of files like everybody else.
+class ObeyedPermissions {
+  public:
+    ObeyedPermissions() {
+        EXPECT_EQ(syscall(SYS_capget, &_header, _former.data()), 0);
+        auto lesser = _former;
+        lesser[0].effective &= ~((1U << CAP_DAC_OVERRIDE) | (1U << CAP_DAC_READ_SEARCH));
+        EXPECT_EQ(syscall(SYS_capset, &_header, lesser.data()), 0);
+    }
+    ObeyedPermissions(const ObeyedPermissions&) = delete;
+    ObeyedPermissions& operator=(const ObeyedPermissions&) = delete;
+    ~ObeyedPermissions() { syscall(SYS_capset, &_header, _former.data()); }
+
+  private:
+    __user_cap_header_struct _header{_LINUX_CAPABILITY_VERSION_3, 0};
+    std::array<__user_cap_data_struct, _LINUX_CAPABILITY_U32S_3> _former{};
 };
 
 class BadInput : public RealmTest {
@@ -165,6 +187,49 @@ TEST_F(BadInput, CacheBelowAFileOrWhereADirectoryIs) {
     EXPECT_NE(statusOfAcquiringInto("directory"), 0);
 }
 
+TEST_F(BadInput, CacheInADirectoryThatIsNotWritableIsRefusedAndNoneIsMade) {
+    std::filesystem::create_directory(path("closed"));
+    std::filesystem::permissions(path("closed"), std::filesystem::perms(0555));
+    const ObeyedPermissions obeyed;
+    EXPECT_EQ(statusOfAcquiringInto("closed/cc"), KRB5_FCC_PERM);
+    EXPECT_TRUE(std::filesystem::is_empty(path("closed")));
+}
+
+TEST_F(BadInput, CacheThatMayNotBeReadTellsAndIsReplacedByOpeningItForAPrincipal) {
+    static_cast<void>(cacheOf(*principal("paul")));
+    std::filesystem::permissions(path("cc"), std::filesystem::perms::none);
+    const ObeyedPermissions obeyed;
+    const auto cache = unbound("cc");
+    EXPECT_TRUE(cache->credentials().empty());
+    EXPECT_EQ(cache->errorCode(), KRB5_FCC_PERM);
+    EXPECT_FALSE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(principal("alice").get()));
+    EXPECT_EQ(cache->errorCode(), KRB5_FCC_PERM);
+    EXPECT_EQ(*cacheOf(*principal("alice"))->principal(), *principal("alice"));
+}
+
+TEST_F(BadInput, KeytabThatMayNeitherBeMadeNorReadTellsSo) {
+    std::filesystem::create_directory(path("closed"));
+    std::filesystem::permissions(path("closed"), std::filesystem::perms(0555));
+    write(path("kt"), support::keytabFile(1, 1));
+    std::filesystem::permissions(path("kt"), std::filesystem::perms(0400));
+    const ObeyedPermissions obeyed;
+    const auto readOnly = KRB5Keytab::initWithName(path("kt"), KRB5KeytabFileType, _context);
+    const auto entries = readOnly->entries();
+    ASSERT_EQ(entries.size(), 1U);
+    readOnly->removeEntry(entries[0]);
+    EXPECT_EQ(readOnly->errorCode(), EACCES);
+    EXPECT_TRUE(readOnly->containsEntry(entries[0]));
+
+    const auto unwritable = KRB5Keytab::initWithName(path("closed/kt"), KRB5KeytabFileType, _context);
+    unwritable->addEntry(entries[0]);
+    EXPECT_EQ(unwritable->errorCode(), ENOENT) << "the library tells of its look for a file to extend";
+    EXPECT_TRUE(std::filesystem::is_empty(path("closed")));
+
+    std::filesystem::permissions(path("kt"), std::filesystem::perms::none);
+    EXPECT_TRUE(readOnly->entries().empty());
+    EXPECT_EQ(readOnly->errorCode(), EACCES);
+}
+
 TEST_F(BadInput, CacheOnAFullDiskCannotBeBound) {
     const FullDisk full(4);
     EXPECT_NE(statusOfAcquiringInto("cc"), 0);
@@ -185,7 +250,7 @@ TEST_F(BadInput, CacheCutAtAnyByteIsListedAsFarAsItGoesAndInitialisedByOpeningIt
     {
         const auto cache = cacheOf(*alice);
         cache->acquireInitialCredentialWithPassword(alicePassword);
-        ASSERT_EQ(support::run({"/usr/bin/kvno", "-c", path("cc"), "host/localhost"}).status, 0);
+        ASSERT_EQ(runTool({"/usr/bin/kvno", "-c", path("cc"), "host/localhost"}).status, 0);
         ASSERT_EQ(cache->credentials().size(), 2U);
     }
     const std::string bytes = contentsOf(path("cc"));

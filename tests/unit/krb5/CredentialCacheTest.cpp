@@ -4,11 +4,36 @@
 
 #include <stdexcept>
 
+#include <dlfcn.h>
+
 // Exported by the library for programs that need a clock that stands still, but declared in no public header.
 extern "C" krb5_error_code krb5_set_debugging_time(krb5_context, krb5_timestamp, krb5_int32);
 
+namespace {
+
+bool resolvesToNothing = false;
+
+}  // namespace
+
+/// In front of the library's function of that name, to answer what the real one never does: success and no handle.
+extern "C" krb5_error_code krb5_cc_resolve(krb5_context context, const char* name, krb5_ccache* cache) {
+    if (resolvesToNothing) {
+        *cache = nullptr;
+        return 0;
+    }
+    return reinterpret_cast<decltype(&krb5_cc_resolve)>(dlsym(RTLD_NEXT, "krb5_cc_resolve"))(context, name, cache);
+}
+
 namespace lumio {
 namespace {
+
+class ResolvingToNothing {
+  public:
+    ResolvingToNothing() { resolvesToNothing = true; }
+    ResolvingToNothing(const ResolvingToNothing&) = delete;
+    ResolvingToNothing& operator=(const ResolvingToNothing&) = delete;
+    ~ResolvingToNothing() { resolvesToNothing = false; }
+};
 
 class CredentialCache : public RealmTest {
   protected:
@@ -16,6 +41,17 @@ class CredentialCache : public RealmTest {
         auto cache = cacheOf(*principal("alice"));
         cache->acquireInitialCredentialWithPassword(alicePassword);
         EXPECT_EQ(cache->errorCode(), 0) << cache->errorMessage();
+        return cache;
+    }
+    /// The cache with a ticket whose record was changed, and nothing else.
+    template <class Change>
+    [[nodiscard]] std::unique_ptr<KRB5CredentialCache> aliceWithChangedTicket(Change change) const {
+        auto cache = aliceWithTicket();
+        const auto ticket = cache->initialCredential();
+        krb5_creds changed = *ticket->nativeCredential();
+        change(changed);
+        EXPECT_EQ(krb5_cc_initialize(_context->nativeContext(), cache->nativeCredentialCache(), changed.client), 0);
+        EXPECT_EQ(krb5_cc_store_cred(_context->nativeContext(), cache->nativeCredentialCache(), &changed), 0);
         return cache;
     }
     /// A cache whose ticket ends that many seconds from the context's now, which stands still.
@@ -67,6 +103,15 @@ TEST_F(CredentialCache, SetPrincipalEmptiesOnlyForAnother) {
     EXPECT_EQ(cache->principal()->name(), "paul");
 }
 
+TEST_F(CredentialCache, SetPrincipalMakesACacheThatIsMissing) {
+    const auto cache = KRB5CredentialCache::initWithName(path("none"), "FILE", nullptr, _context);
+    cache->setPrincipal(*principal("alice"));
+    EXPECT_EQ(cache->errorCode(), 0) << cache->errorMessage();
+    EXPECT_EQ(*cache->principal(), *principal("alice"));
+    EXPECT_TRUE(cache->credentials().empty());
+    EXPECT_EQ(cache->errorCode(), 0);
+}
+
 TEST_F(CredentialCache, TicketEndingIn600SecondsIsGoodEnough) {
     const auto cache = aliceWithTicketEndingIn(600);
     EXPECT_FALSE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(nullptr));
@@ -116,15 +161,34 @@ TEST_F(CredentialCache, NoFileAndNoPrincipalIsNotNecessary) {
 }
 
 TEST_F(CredentialCache, TicketOfUnsupportedKeyTypeIsNeitherGoodNorReplaced) {
-    const auto cache = aliceWithTicket();
-    const auto ticket = cache->initialCredential();
-    krb5_creds changed = *ticket->nativeCredential();
-    changed.keyblock.enctype = 9999;
-    ASSERT_EQ(krb5_cc_initialize(_context->nativeContext(), cache->nativeCredentialCache(), changed.client), 0);
-    ASSERT_EQ(krb5_cc_store_cred(_context->nativeContext(), cache->nativeCredentialCache(), &changed), 0);
+    const auto cache = aliceWithChangedTicket([](krb5_creds& ticket) { ticket.keyblock.enctype = 9999; });
     EXPECT_FALSE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(nullptr));
     EXPECT_EQ(cache->errorCode(), KRB5_CC_NOT_KTYPE);
     EXPECT_EQ(cache->initialCredential(), nullptr);
+}
+
+TEST_F(CredentialCache, OnlyTheTicketGrantingTicketOfTheClientsRealmCounts) {
+    for (const char* server : {"host/localhost", "krbtgt/OTHER.TEST@NIMBO.TEST", "krbtgt/NIMBO.TEST@OTHER.TEST",
+                               "krbtgt/NIMBO.TEST/more", "krbtgt"}) {
+        const auto other = principal(server);
+        const auto cache =
+            aliceWithChangedTicket([&](krb5_creds& ticket) { ticket.server = other->nativePrincipal(); });
+        ASSERT_EQ(cache->credentials().size(), 1U) << server;
+        EXPECT_TRUE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(nullptr)) << server;
+        EXPECT_EQ(cache->errorCode(), 0);
+        EXPECT_EQ(cache->initialCredential(), nullptr) << server;
+        EXPECT_EQ(cache->errorCode(), KRB5_CC_NOTFOUND);
+    }
+}
+
+TEST_F(CredentialCache, StartAndRenewalOfATicketPlayNoPart) {
+    const auto cache = aliceWithChangedTicket([](krb5_creds& ticket) {
+        ticket.times.starttime = ticket.times.endtime - 1;
+        ticket.times.renew_till = ticket.times.authtime - 1;
+    });
+    EXPECT_FALSE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(nullptr));
+    EXPECT_EQ(cache->errorCode(), 0);
+    EXPECT_NE(cache->initialCredential(), nullptr);
 }
 
 TEST_F(CredentialCache, GoodTicketMeansFalseAndNoRequest) {
@@ -241,6 +305,15 @@ TEST_F(CredentialCache, NeitherKeytabNorPasswordMeansTheDefaultKeytab) {
     EXPECT_EQ(cache->credentials().size(), 1U);
 }
 
+TEST_F(CredentialCache, KeytabThatCouldNotBeOpenedMeansTheDefaultKeytab) {
+    const auto broken = KRB5Keytab::initWithName(path("kt"), "NOSUCHTYPE", _context);
+    ASSERT_EQ(broken->nativeKeytab(), nullptr);
+    const auto cache = cacheOf(*principal("host/localhost"));
+    cache->acquireInitialCredentialWithKeytab(broken.get());
+    EXPECT_EQ(cache->errorCode(), 0) << cache->errorMessage();
+    EXPECT_EQ(cache->credentials().size(), 1U);
+}
+
 TEST_F(CredentialCache, PasswordWinsOverKeytab) {
     const auto keytab =
         KRB5Keytab::initWithName((realm().directory() / "client.keytab").string(), std::nullopt, _context);
@@ -293,6 +366,16 @@ TEST_F(CredentialCache, MissingFileIsReportedUnlessDestroyed) {
     EXPECT_EQ(cache->errorCode(), KRB5_FCC_NOFILE);
 }
 
+TEST_F(CredentialCache, ReopeningThatGivesNeitherCacheNorErrorIsAGenericError) {
+    const auto cache = aliceWithTicket();
+    const ResolvingToNothing nothing;
+    cache->destroy();
+    EXPECT_EQ(cache->errorCode(), KRB5KRB_ERR_GENERIC);
+    EXPECT_EQ(cache->errorCode(), -1765328324);
+    EXPECT_EQ(cache->nativeCredentialCache(), nullptr);
+    EXPECT_TRUE(cache->credentials().empty());
+}
+
 TEST_F(CredentialCache, FailedDestroyLeavesAnObjectThatEveryOperationSurvives) {
     const auto cache = KRB5CredentialCache::initWithName(path("none"), "FILE", nullptr, _context);
     cache->destroy();
@@ -321,7 +404,7 @@ TEST_F(CredentialCache, FailedDestroyLeavesAnObjectThatEveryOperationSurvives) {
 
 TEST_F(CredentialCache, TwoCredentialsAreBothListedWithoutError) {
     const auto cache = aliceWithTicket();
-    const auto done = support::run({"/usr/bin/kvno", "-c", path("cc"), "host/localhost"});
+    const auto done = runTool({"/usr/bin/kvno", "-c", path("cc"), "host/localhost"});
     ASSERT_EQ(done.status, 0) << done.output;
     EXPECT_EQ(done.output, "host/localhost@NIMBO.TEST: kvno = 2\n");
     const auto credentials = cache->credentials();
@@ -333,10 +416,10 @@ TEST_F(CredentialCache, TwoCredentialsAreBothListedWithoutError) {
 
 TEST_F(CredentialCache, ListingAgreesWithTheLibrarysTool) {
     const auto cache = aliceWithTicket();
-    ASSERT_EQ(support::run({"/usr/bin/kvno", "-c", path("cc"), "host/localhost", "nimbo/admin"}).status, 0);
+    ASSERT_EQ(runTool({"/usr/bin/kvno", "-c", path("cc"), "host/localhost", "nimbo/admin"}).status, 0);
     const support::ScopedEnvironment scoped({{"LC_ALL", "C"}, {"TZ", "Europe/Paris"}});
-    const auto theirs = support::run({"/usr/bin/klist", "-c", "FILE:" + path("cc")});
-    const auto ours = support::run({KRB5_LIST, "cache", "FILE", path("cc")});
+    const auto theirs = runTool({"/usr/bin/klist", "-c", "FILE:" + path("cc")});
+    const auto ours = runTool({KRB5_LIST, "cache", "FILE", path("cc")});
     ASSERT_EQ(theirs.status, 0) << theirs.output;
     EXPECT_EQ(ours.status, 0);
     EXPECT_EQ(ours.output, theirs.output);
@@ -345,11 +428,11 @@ TEST_F(CredentialCache, ListingAgreesWithTheLibrarysTool) {
 
 TEST_F(CredentialCache, ListingOfTicketWithoutRenewalAgreesWithTheLibrarysTool) {
     const auto done =
-        support::run({"/usr/bin/kinit", "-l", "1h", "-c", path("cc"), "alice"}, alicePassword + std::string("\n"));
+        runTool({"/usr/bin/kinit", "-l", "1h", "-c", path("cc"), "alice"}, alicePassword + std::string("\n"));
     ASSERT_EQ(done.status, 0) << done.output;
     const support::ScopedEnvironment scoped({{"LC_ALL", "C"}, {"TZ", "UTC"}});
-    const auto ours = support::run({KRB5_LIST, "cache", "FILE", path("cc")});
-    EXPECT_EQ(ours.output, support::run({"/usr/bin/klist", "-c", "FILE:" + path("cc")}).output);
+    const auto ours = runTool({KRB5_LIST, "cache", "FILE", path("cc")});
+    EXPECT_EQ(ours.output, runTool({"/usr/bin/klist", "-c", "FILE:" + path("cc")}).output);
     EXPECT_EQ(ours.output.find("renew until"), std::string::npos) << ours.output;
     EXPECT_NE(ours.output.find("krbtgt/NIMBO.TEST"), std::string::npos) << ours.output;
 }
@@ -459,14 +542,34 @@ TEST_F(CredentialCache, CredentialDescribesItself) {
 }
 
 TEST_F(CredentialCache, CredentialWithoutRecordAnswersNull) {
-    const auto empty = KRB5Credential::initWithNativeCredential(nullptr, _context);
-    ASSERT_NE(empty, nullptr);
-    EXPECT_EQ(empty->clientPrincipal(), nullptr);
-    EXPECT_EQ(empty->serverPrincipal(), nullptr);
-    EXPECT_EQ(empty->startTime(), std::nullopt);
-    EXPECT_EQ(empty->endTime(), std::nullopt);
-    EXPECT_EQ(empty->renewUntil(), std::nullopt);
-    EXPECT_EQ(empty->description(), "client='(null)' server='(null)' start='(null)' end='(null)' renew='(null)'");
+    const krb5_creds nobodys{};
+    for (const krb5_creds* native : {static_cast<const krb5_creds*>(nullptr), &nobodys}) {
+        const auto empty = KRB5Credential::initWithNativeCredential(native, _context);
+        ASSERT_NE(empty, nullptr);
+        EXPECT_EQ(empty->nativeCredential(), nullptr);
+        EXPECT_EQ(empty->clientPrincipal(), nullptr);
+        EXPECT_EQ(empty->serverPrincipal(), nullptr);
+        EXPECT_EQ(empty->startTime(), std::nullopt);
+        EXPECT_EQ(empty->endTime(), std::nullopt);
+        EXPECT_EQ(empty->renewUntil(), std::nullopt);
+        EXPECT_EQ(empty->description(), "client='(null)' server='(null)' start='(null)' end='(null)' renew='(null)'");
+    }
+}
+
+TEST_F(CredentialCache, CredentialWithoutOneOfItsPrincipalsIsNotCopied) {
+    const auto ticket = aliceWithTicket()->initialCredential();
+    krb5_creds changed = *ticket->nativeCredential();
+    changed.client = nullptr;
+    EXPECT_EQ(KRB5Credential::initWithNativeCredential(&changed, _context)->nativeCredential(), nullptr);
+    changed = *ticket->nativeCredential();
+    changed.server = nullptr;
+    EXPECT_EQ(KRB5Credential::initWithNativeCredential(&changed, _context)->nativeCredential(), nullptr);
+}
+
+TEST_F(CredentialCache, TypesHaveTheLibrarysNames) {
+    EXPECT_STREQ(KRB5CredentialCacheAPIType, "API");
+    EXPECT_STREQ(KRB5CredentialCacheMemoryType, "MEMORY");
+    EXPECT_STREQ(KRB5CredentialCacheFileType, "FILE");
 }
 
 }  // namespace

@@ -170,6 +170,11 @@ TEST_F(Keytab, NameIsThePathAndDescriptionHasTheType) {
               "FILE:" + path("kt"));
 }
 
+TEST_F(Keytab, TypesHaveTheLibrarysNames) {
+    EXPECT_STREQ(KRB5KeytabFileType, "FILE");
+    EXPECT_STREQ(KRB5KeytabWritableFileType, "WRFILE");
+}
+
 TEST_F(Keytab, PathOfAnyBytesIsKept) {
     const auto table = keytab("ren\xe9");
     EXPECT_EQ(table->name(), path("ren\xe9"));
@@ -314,8 +319,8 @@ TEST_F(Keytab, MemoryKeytabWorksAlike) {
 TEST_F(Keytab, ListingAgreesWithTheLibrarysTool) {
     const support::ScopedEnvironment scoped({{"LC_ALL", "C"}, {"TZ", "Europe/Paris"}});
     const std::string file = realm().directory() / "krb5.keytab";
-    const auto theirs = support::run({"/usr/bin/klist", "-kte", "FILE:" + file});
-    const auto ours = support::run({KRB5_LIST, "keytab", "FILE", file});
+    const auto theirs = runTool({"/usr/bin/klist", "-kte", "FILE:" + file});
+    const auto ours = runTool({KRB5_LIST, "keytab", "FILE", file});
     ASSERT_EQ(theirs.status, 0) << theirs.output;
     EXPECT_EQ(ours.status, 0);
     EXPECT_EQ(ours.output, theirs.output);

@@ -1,7 +1,7 @@
 #include "krb5/KRB5Principal.h"
 #include "tests/unit/krb5/Realm.h"
 
-#include <concepts>
+#include <optional>
 #include <string>
 #include <type_traits>
 #include <unordered_set>
@@ -12,15 +12,23 @@ namespace {
 
 class Principal : public RealmTest {};
 
-// Not comparable at all is the strongest form of "never equal to a text".
 template <class T>
 concept ComparableWithPrincipal = requires(const KRB5Principal& principal, const T& other) {
     principal == other;
 };
-static_assert(ComparableWithPrincipal<KRB5Principal>);
-static_assert(!ComparableWithPrincipal<std::string>);
-static_assert(!ComparableWithPrincipal<const char*>);
-static_assert(!std::is_copy_constructible_v<KRB5Principal> && std::is_move_constructible_v<KRB5Principal>);
+
+TEST_F(Principal, NeverEqualsATextBecauseTheTwoCannotBeCompared) {
+    EXPECT_TRUE(ComparableWithPrincipal<KRB5Principal>);
+    EXPECT_FALSE(ComparableWithPrincipal<std::string>);
+    EXPECT_FALSE(ComparableWithPrincipal<std::optional<std::string>>);
+    EXPECT_FALSE(ComparableWithPrincipal<const char*>);
+}
+
+TEST_F(Principal, IsMovedAndNeverCopied) {
+    EXPECT_FALSE(std::is_copy_constructible_v<KRB5Principal>);
+    EXPECT_FALSE(std::is_copy_assignable_v<KRB5Principal>);
+    EXPECT_TRUE(std::is_nothrow_move_constructible_v<KRB5Principal>);
+}
 
 TEST_F(Principal, TwoComponentsAreNameAndInstance) {
     const auto host = principal("host/server.example@OTHER.TEST");

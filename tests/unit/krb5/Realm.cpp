@@ -66,6 +66,10 @@ void RealmTest::storeWithEnd(KRB5CredentialCache& cache, const KRB5Credential& c
     ASSERT_EQ(krb5_cc_store_cred(native, cache.nativeCredentialCache(), &changed), 0);
 }
 
+adminhost::test::ProgramResult runTool(const std::vector<std::string>& command, std::string_view input) {
+    return adminhost::test::runProgram(command, adminhost::test::Errors::merge, input);
+}
+
 std::string contentsOf(const std::string& path) {
     std::ifstream file(path, std::ios::binary);
     return {std::istreambuf_iterator<char>(file), {}};

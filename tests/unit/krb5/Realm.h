@@ -4,9 +4,12 @@
 
 #include "krb5/KRB5CredentialCache.h"
 #include "tests/support/Kdc.h"
+#include "tests/support/Program.h"
 
 #include <memory>
 #include <string>
+#include <string_view>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -37,6 +40,8 @@ class RealmTest : public testing::Test {
     std::shared_ptr<KRB5Context> _context;
 };
 
+/// Runs a program with the present environment; its standard error goes into the output.
+adminhost::test::ProgramResult runTool(const std::vector<std::string>& command, std::string_view input = {});
 std::string contentsOf(const std::string& path);
 void write(const std::string& path, const std::string& bytes);
 
