@@ -46,7 +46,7 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     /// apply, "errorDescription" and "needsRecycleOrRestart". Resource changes are applied whatever the write status.
     [[nodiscard]] Response writeSettingsWithRequest(const Dictionary& request);
 
-    // Service state and control (ServiceState.cpp); the variant may be null
+    // Service state and control; the variant may be null
 
     [[nodiscard]] Response getStateWithRequest(const Dictionary& request);
     [[nodiscard]] Response getLogPathsWithRequest(const Dictionary& request);

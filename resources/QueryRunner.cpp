@@ -11,7 +11,7 @@ using adminhost::Error;
 std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
     constexpr std::string_view separator = " = ";
     std::vector<Dictionary> records;
-    if (output.find('\n') == std::string_view::npos) {
+    if (output.empty()) {
         return records;
     }
     // Every row is closed by an empty line; the last row's is the empty element behind the final line feed. An output

@@ -141,7 +141,12 @@ TEST_F(SettingsStoreTest, OnlyTheDatabaseOfTheProductionSectionCounts) {
     EXPECT_EQ(databaseFor("development:\n  database: /dev\nproduction:\n  database: /prod\n"), "/prod");
     EXPECT_EQ(databaseFor("production:\n  adapter: x\ndevelopment:\n  database: /dev\n"), fallback);
     EXPECT_EQ(databaseFor("database: /early\nproduction:\n  adapter: x\n"), fallback);
+    EXPECT_EQ(databaseFor("production:\ndevelopment:\nproduction:\n  database: /late\n"), fallback);
+    EXPECT_EQ(databaseFor("production: database: development:"), "development:");
     EXPECT_EQ(databaseFor("Production:\n  database: /x\n"), fallback);
+    EXPECT_EQ(databaseFor("production:x\n  database: /x\n"), fallback);
+    EXPECT_EQ(databaseFor("production:\n  database:/x\n"), fallback);
+    EXPECT_EQ(databaseFor("production:\n  Database: /x\n"), fallback);
     EXPECT_EQ(databaseFor("production:\n  database:"), fallback);
     EXPECT_EQ(databaseFor(""), fallback);
 }
@@ -163,6 +168,43 @@ TEST_F(SettingsStoreTest, SeparatorsAreUnicodeCharactersAndNotBytes) {
                           "b"),
               "/a\xE2\x80\x8B"
               "b");  // U+200B joins
+}
+
+TEST_F(SettingsStoreTest, EachSeparatorEndsATokenAndNothingElseDoes) {
+    for (const std::string_view separator : {" ",
+                                             "\t",
+                                             "\n",
+                                             "\v",
+                                             "\f",
+                                             "\r",
+                                             "\xC2\x85",
+                                             "\xC2\xA0",
+                                             "\xE1\x9A\x80",
+                                             "\xE2\x80\x80",
+                                             "\xE2\x80\x81",
+                                             "\xE2\x80\x82",
+                                             "\xE2\x80\x83",
+                                             "\xE2\x80\x84",
+                                             "\xE2\x80\x85",
+                                             "\xE2\x80\x86",
+                                             "\xE2\x80\x87",
+                                             "\xE2\x80\x88",
+                                             "\xE2\x80\x89",
+                                             "\xE2\x80\x8A",
+                                             "\xE2\x80\xA8",
+                                             "\xE2\x80\xA9",
+                                             "\xE2\x80\xAF",
+                                             "\xE2\x81\x9F",
+                                             "\xE3\x80\x80"}) {
+        EXPECT_EQ(databaseFor("production: database: /a" + std::string(separator) + "b"), "/a")
+            << testing::PrintToString(separator);
+    }
+    // The information separators, the zero-width ones, the byte order mark and the Mongolian vowel separator.
+    for (const std::string_view other : {"\x1C", "\x1D", "\x1E", "\x1F", "\xE2\x80\x8B", "\xE2\x80\x8D", "\xE2\x81\xA0",
+                                         "\xEF\xBB\xBF", "\xE1\xA0\x8E"}) {
+        const std::string value = "/a" + std::string(other) + "b";
+        EXPECT_EQ(databaseFor("production: database: " + value), value) << testing::PrintToString(other);
+    }
 }
 
 TEST_F(SettingsStoreTest, LocationFileThatIsNotUtf8GivesTheFallbackBelowTheSharedFilesystem) {

@@ -142,6 +142,11 @@ TEST_F(AccessLists, OfSeveralPeopleWithTheUuidOfWhoUsesItTheLastIsShown) {
     EXPECT_EQ(camera()->dictionary()->get("useUser"), Value("first")) << "no full name: the short one";
 }
 
+TEST_F(AccessLists, CameraThatNobodyUsesAsksForNoName) {
+    useDirectory(std::vector{record("dsRecTypeStandard:Users", "anybody", "A")});
+    EXPECT_FALSE(camera(1)->dictionary()->contains("useUser"));
+}
+
 TEST_F(AccessLists, GroupDoesNotUseACamera) {
     root.sql(database, "update cameras set use_user_uuid='" + uuidOf("group:editors") + "'");
     EXPECT_FALSE(camera()->dictionary()->contains("useUser"));
@@ -208,11 +213,11 @@ TEST_F(AccessLists, RowsOfTheAccessListWithoutAUuidAreSkipped) {
 }
 
 TEST_F(AccessLists, FailedAccessListQueryIsLoggedAndEmpty) {
-    root.sql(database, "drop table access_control_entries");
-    EXPECT_THAT(camera()->getUserAndGroupACLs(), IsEmpty());
-    ASSERT_EQ(log.lines.size(), 1U);
-    EXPECT_THAT(log.lines[0],
-                StartsWith("getUserAndGroupACLs SQL query returned error: sqliteQuery (1): Can't execute"));
+    const auto aula = camera();
+    root.writeTool("/usr/bin/sqlite3", "#!/bin/sh\nprintf 'no table' >&2\nexit 3\n");
+    EXPECT_THAT(aula->getUserAndGroupACLs(), IsEmpty());
+    EXPECT_THAT(log.lines, ElementsAre("getUserAndGroupACLs SQL query returned error: sqliteQuery (3): Can't execute "
+                                       "sqlite3 query: no table"));
 }
 
 TEST_F(AccessLists, UuidsThatNoLongerExistInTheDirectoryAreNotShown) {
@@ -244,6 +249,15 @@ TEST_F(AccessLists, ThreeRecordsForTwoUuidsShowOneEntryForEachTheFirstOneKept) {
     ASSERT_EQ(allowed(*aula).size(), 2U);
     EXPECT_EQ(allowed(*aula)[0].dictionary()->get("shortName"), Value("first"));
     EXPECT_EQ(allowed(*aula)[1].dictionary()->get("shortName"), Value("b"));
+}
+
+TEST_F(AccessLists, DuplicatesAreFoundWhateverTheCaseOfTheirUuids) {
+    allow(7, "AB");
+    useDirectory(std::vector{record("dsRecTypeStandard:Users", "first", "ab"),
+                             record("dsRecTypeStandard:Groups", "twin", "AB")});
+    const auto aula = camera();
+    ASSERT_EQ(allowed(*aula).size(), 1U);
+    EXPECT_EQ(allowed(*aula)[0].dictionary()->get("guid"), Value("ab"));
 }
 
 TEST_F(AccessLists, DuplicatesStayWhenTheDirectoryReturnsNoMoreEntriesThanUuids) {
@@ -358,9 +372,22 @@ TEST_F(AccessLists, RemovalsWhoseUuidsMapToNoLocalIdRunNoTool) {
     EXPECT_THAT(calls(), IsEmpty());
 }
 
+TEST_F(AccessLists, RemovalOfAnAccountWithoutANameIsSkipped) {
+    for (const bool isUser : {true, false}) {
+        const std::string uuid = uuidOf("user:bo");
+        auto nameless = record(isUser ? "dsRecTypeStandard:Users" : "dsRecTypeStandard:Groups", "", uuid);
+        nameless.attributes[std::string(isUser ? adminhost::directory::uniqueID
+                                               : adminhost::directory::primaryGroupID)] = {"7"};
+        useDirectory(std::vector{nameless});
+        change({Value(Dictionary{{"_obsoleteid_", true}, {"_id_", uuid}})});
+        EXPECT_THAT(calls(), IsEmpty());
+    }
+}
+
 TEST_F(AccessLists, EntryWithNeitherFlagAndEntryThatIsNoDictionaryAreIgnored) {
     change({Value(Dictionary{{"type", "user"}, {"shortName", "a"}}), Value("text"), Value(Array{}),
-            Value(Dictionary{{"type", "user"}, {"shortName", "a"}, {"_newid_", "01"}})});
+            Value(Dictionary{{"type", "user"}, {"shortName", "a"}, {"_newid_", "01"}}),
+            Value(Dictionary{{"_id_", uuidOf("user:bo")}, {"_obsoleteid_", "01"}})});
     EXPECT_THAT(calls(), IsEmpty()) << "\"01\" is no true flag of an access-list entry";
 }
 

@@ -99,6 +99,12 @@ TEST_F(QueryRunner, FailingStatementIsNothingWithTheToolsStatusAndText) {
     EXPECT_NE(error->description->find("no such table: missing"), std::string::npos) << *error->description;
 }
 
+TEST_F(QueryRunner, ErrorCarriesTheToolsWholeTextAndExitStatus) {
+    root.writeTool("/usr/bin/sqlite3", "#!/bin/sh\necho 'id = 1'\nprintf 'Error: %%s\\n  here ^\\n' >&2\nexit 255\n");
+    EXPECT_EQ(run("select 1"), std::nullopt);
+    EXPECT_EQ(error, (Error{"sqliteQuery", 255, "Can't execute sqlite3 query: Error: %s\n  here ^\n"}));
+}
+
 TEST_F(QueryRunner, ConstraintViolationIsAnErrorAndChangesNothing) {
     EXPECT_EQ(run("insert into t values(7,'c',NULL)"), std::nullopt);
     ASSERT_TRUE(error);
@@ -125,7 +131,6 @@ TEST_F(QueryRunner, ToolThatCannotBeStartedIsMinusOne) {
 }
 
 TEST_F(QueryRunner, ToolKilledByASignalIs128PlusItsNumber) {
-    std::filesystem::remove(root.path("/usr/bin/sqlite3"));
     root.writeTool("/usr/bin/sqlite3", "#!/bin/sh\nkill -9 $$\n");
     EXPECT_EQ(run("select 1"), std::nullopt);
     ASSERT_TRUE(error);
@@ -133,7 +138,6 @@ TEST_F(QueryRunner, ToolKilledByASignalIs128PlusItsNumber) {
 }
 
 TEST_F(QueryRunner, ToolGetsExactlyLineModeDatabaseAndStatement) {
-    std::filesystem::remove(root.path("/usr/bin/sqlite3"));
     root.writeTool("/usr/bin/sqlite3", "#!/bin/sh\nprintf 'n = %s\\n' $#\nprintf 'argument = <%s>\\n\\n' \"$@\"\n");
     const auto records = run("select 'it''s; $HOME `x`' -- \"q\"");
     ASSERT_TRUE(records);
@@ -157,7 +161,6 @@ TEST_F(QueryRunner, RelativeDatabaseIsTheOneThatWasFoundBelowTheCurrentDirectory
 }
 
 TEST_F(QueryRunner, AMegabyteOnEachStreamIsCaptured) {
-    std::filesystem::remove(root.path("/usr/bin/sqlite3"));
     root.writeTool(
         "/usr/bin/sqlite3",
         "#!/bin/sh\nhead -c 1000000 /dev/zero | tr '\\0' e >&2 &\nprintf 'v = '\nhead -c 1000000 /dev/zero | tr "

@@ -95,6 +95,16 @@ TEST_F(ResourceTest, DescriptionPrintsTheGuidFieldAsItStands) {
     EXPECT_TRUE(camera->description().starts_with("Camera - guid: U, \n"));
 }
 
+TEST_F(ResourceTest, GuidThatWasGivenCountsBeforeTheRecords) {
+    const auto camera = Camera::initWithGUID("U-A");
+    camera->setData(Dictionary{{"uuid", "U-B"}});
+    EXPECT_EQ(camera->guid(), "U-A");
+    camera->setGuid(std::nullopt);
+    EXPECT_EQ(camera->guid(), "U-B");
+    camera->setData(std::nullopt);
+    EXPECT_EQ(camera->guid(), "U-B") << "once asked for, it is kept";
+}
+
 TEST_F(ResourceTest, DataLoadsTheRawRowOnFirstUse) {
     const auto camera = Camera::initWithGUID("U-A");
     const Dictionary* record = camera->data();
