@@ -26,7 +26,7 @@ std::optional<std::string> LumioRequestHandler::hostNameOfController(const std::
         loop.runOnce(std::chrono::seconds(1));
     }
     std::optional<std::string> host;
-    if (!mBJError && !service.addresses().empty()) {
+    if (!service.addresses().empty()) {
         adminhost::HostName found = adminhost::hostNameOf(service.addresses().front());
         if (found.error != 0) {
             adminhost::logEvent("adminhost_lumio: unable to resolve host: error = " + std::to_string(found.error));

@@ -6,18 +6,20 @@
 #include "platform/plist/PropertyList.h"
 #include "tests/support/TemporaryRoot.h"
 
+#include <array>
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <iostream>
 #include <map>
 #include <stdexcept>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <linux/capability.h>
 #include <sys/mount.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 namespace lumio {
@@ -32,7 +34,6 @@ using testing::Contains;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
-using testing::StartsWith;
 
 constexpr std::string_view identityFile = "/Library/Preferences/com.brenn.lumioserverd.plist";
 constexpr std::string_view clusterFile = "/shared/Server/cluster_preferences.plist";
@@ -72,6 +73,32 @@ class Mount {
     }
 
     fs::path _place;
+};
+
+/// Files of mode 000 are closed to the superuser too, for the life of the object.
+class WithoutAccessPrivileges {
+  public:
+    WithoutAccessPrivileges() {
+        __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+        check(::syscall(SYS_capget, &header, _former.data()));
+        auto data = _former;
+        data[0].effective &= ~((1U << CAP_DAC_OVERRIDE) | (1U << CAP_DAC_READ_SEARCH));
+        check(::syscall(SYS_capset, &header, data.data()));
+    }
+    WithoutAccessPrivileges(const WithoutAccessPrivileges&) = delete;
+    WithoutAccessPrivileges& operator=(const WithoutAccessPrivileges&) = delete;
+    ~WithoutAccessPrivileges() {
+        __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+        ::syscall(SYS_capset, &header, _former.data());
+    }
+
+  private:
+    static void check(long status) {
+        if (status != 0) {
+            throw std::runtime_error(std::string("capabilities: ") + std::strerror(errno));
+        }
+    }
+    std::array<__user_cap_data_struct, 2> _former{};
 };
 
 class FileSystems : public testing::Test {
@@ -209,6 +236,23 @@ TEST_F(FileSystems, UnreadableFileIsKeptAlsoWhereTheNewOneFindsNoRoom) {
         EXPECT_EQ(text, "precious text that is no property list") << path;
     }
     EXPECT_EQ(root.read(clusterFile), "precious text that is no property list");
+}
+
+TEST_F(FileSystems, FileThatThisProcessMayNotReadIsMovedAsideAndReplaced) {
+    makeShared();
+    const std::string before = root.read(memberFile);
+    fs::permissions(root.path(memberFile), fs::perms::none);
+    {
+        const WithoutAccessPrivileges closed;
+        ASSERT_FALSE(std::ifstream(root.path(memberFile)).is_open()) << "it can be read";
+        expectTaken(write());
+    }
+    EXPECT_THAT(log.lines, ElementsAre(HasSubstr("member_preferences_M.plist cannot be loaded; it is kept as ")));
+    int kept = 0;
+    for (const auto& [path, text] : below("/shared")) {
+        kept += path.starts_with(std::string(memberFile) + ".unreadable-") && text == before ? 1 : 0;
+    }
+    EXPECT_EQ(kept, 1);
 }
 
 TEST_F(FileSystems, MarkerOnAReadOnlyFileSystemIsLoggedAndTheSettingsAreWritten) {

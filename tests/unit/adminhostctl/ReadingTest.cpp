@@ -2,7 +2,7 @@
 #include "adminhostctl/Service.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
-#include "commands/CommandTable.h"
+#include "tests/unit/adminhostctl/Describe.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -14,20 +14,11 @@ using adminhost::Data;
 using adminhost::Date;
 using adminhost::Dictionary;
 using adminhost::Value;
+using adminhost::ctl::describe;
 using adminhost::ctl::Description;
 using adminhost::ctl::Reading;
 using adminhost::ctl::Table;
 using testing::ElementsAre;
-
-Description describe(std::string_view name) {
-    const Value all = lumio::describeCommands();
-    for (const Value& command : *all.array()) {
-        if (command.dictionary()->get("name") == Value(name)) {
-            return Description(*command.dictionary());
-        }
-    }
-    return {};
-}
 
 std::string read(const Value& value, std::size_t width = 100) {
     const Description none;

@@ -1,6 +1,6 @@
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/Request.h"
-#include "commands/CommandTable.h"
+#include "tests/unit/adminhostctl/Describe.h"
 
 #include <map>
 
@@ -14,22 +14,13 @@ using adminhost::Data;
 using adminhost::Date;
 using adminhost::Dictionary;
 using adminhost::Value;
+using adminhost::ctl::describe;
 using adminhost::ctl::Description;
 using adminhost::ctl::ExitStatus;
 using adminhost::ctl::Failure;
 using adminhost::ctl::KeyDescription;
 using adminhost::ctl::Sources;
 using testing::HasSubstr;
-
-Description describe(std::string_view name) {
-    const Value all = lumio::describeCommands();
-    for (const Value& command : *all.array()) {
-        if (command.dictionary()->get("name") == Value(name)) {
-            return Description(*command.dictionary());
-        }
-    }
-    return {};
-}
 
 /// Files that a test gives, and a person who types.
 struct Given {
@@ -273,6 +264,58 @@ TEST(ValueOfText, DataComesFromAFile) {
     const Given given{{{"f", std::string("\0\xFF\n", 3)}}, "", false};
     EXPECT_EQ(adminhost::ctl::buildRequest(Description(command), {}, {"blob@f"}, given.sources()),
               (Dictionary{{"blob", Data{0, 0xFF, '\n'}}}));
+}
+
+/// What a verb takes its word for: the value of a key.
+Value word(const KeyDescription& key, const std::optional<std::string>& text, const Given& given = {}) {
+    return adminhost::ctl::valueOfWord(key, text, given.sources());
+}
+std::string wordRefused(const KeyDescription& key, const std::optional<std::string>& text, const Given& given = {}) {
+    try {
+        (void)word(key, text, given);
+    } catch (const Failure& failure) {
+        EXPECT_EQ(failure.status(), ExitStatus::usage);
+        return failure.what();
+    }
+    ADD_FAILURE() << "the word was taken";
+    return {};
+}
+KeyDescription secretKey() {
+    KeyDescription key = keyOf("text");
+    key.secret = true;
+    return key;
+}
+
+TEST(ValueOfWord, WordIsConvertedToTheTypeOfTheKey) {
+    EXPECT_EQ(word(keyOf("integer"), "8170"), Value(8170));
+    EXPECT_EQ(word(keyOf("text"), "8170"), Value("8170"));
+    EXPECT_EQ(word(keyOf("text"), ""), Value(""));
+    EXPECT_THAT(wordRefused(keyOf("integer"), "x"), HasSubstr("is no whole number"));
+}
+
+TEST(ValueOfWord, WordBehindAnAtSignIsAFileOrStandardInput) {
+    const Given given{{{"port", "8170\n"}, {"-", "typed\n"}, {"bytes", "\xFF"}}, "", false};
+    EXPECT_EQ(word(keyOf("integer"), "@port", given), Value(8170));
+    EXPECT_EQ(word(keyOf("text"), "@-", given), Value("typed"));
+    EXPECT_THAT(wordRefused(keyOf("text"), "@bytes", given), HasSubstr("no UTF-8"));
+    EXPECT_THAT(wordRefused(keyOf("text"), "@missing", given), HasSubstr("No such file"));
+    EXPECT_THAT(wordRefused(keyOf("text"), "@", given), HasSubstr("needs the name of a file"));
+}
+
+TEST(ValueOfWord, MissingWordIsAskedForOnlyAtATerminalAndOnlyForASecret) {
+    const Given terminal{{}, "typed", true};
+    EXPECT_EQ(word(secretKey(), std::nullopt, terminal), Value("typed"));
+    EXPECT_EQ(word(secretKey(), "@-", terminal), Value("typed"));
+    EXPECT_THAT(wordRefused(secretKey(), std::nullopt), HasSubstr("@FILE or @-"));
+    EXPECT_THAT(wordRefused(keyOf("text"), std::nullopt, terminal), HasSubstr("TEXT, @FILE or @-"));
+}
+
+TEST(ValueOfWord, SecretOnTheCommandLineIsRefusedAndNotRepeated) {
+    const std::string message = wordRefused(secretKey(), "planted-password", {{}, "typed", true});
+    EXPECT_THAT(message, HasSubstr("write @FILE, or @- to be asked"));
+    EXPECT_THAT(message, testing::Not(HasSubstr("planted-password")));
+    EXPECT_THAT(wordRefused(secretKey(), ""), HasSubstr("is secret"));
+    EXPECT_EQ(word(secretKey(), "@file", {{{"file", "from the file\n"}}, "typed", true}), Value("from the file"));
 }
 
 }  // namespace

@@ -238,12 +238,19 @@ TEST_F(ReadSettings, SettingsFileThatCannotBeLoadedAddsNothing) {
 }
 
 TEST_F(ReadSettings, KeyTablesAreAsTheFilesKnowThem) {
-    EXPECT_EQ(LumioRequestHandler::identityPreferencesKeysToCopy().size(), 2U);
-    EXPECT_EQ(LumioRequestHandler::libraryInformationKeysToCopy().size(), 2U);
-    EXPECT_EQ(LumioRequestHandler::memberPreferencesKeysToCopy().size(), 12U);
-    EXPECT_EQ(LumioRequestHandler::clusterPreferencesKeysToCopy().size(), 13U);
-    EXPECT_EQ(LumioRequestHandler::memberPreferencesKeysToCopy().back(), "tunnel_timeout_seconds");
-    EXPECT_EQ(LumioRequestHandler::clusterPreferencesKeysToCopy().back(), "nimbo_grid_id");
+    using Keys = std::vector<std::string_view>;
+    EXPECT_EQ(LumioRequestHandler::identityPreferencesKeysToCopy(), (Keys{"member_uuid", "shared_filesystem"}));
+    EXPECT_EQ(LumioRequestHandler::libraryInformationKeysToCopy(), (Keys{"library_version", "server_uuid"}));
+    EXPECT_EQ(LumioRequestHandler::memberPreferencesKeysToCopy(),
+              (Keys{"server_host", "server_port", "sorvane_capture_web_enabled", "max_file_size_in_mb",
+                    "upload_chunk_size_in_mb", "ssl_certificate_file", "ssl_certificate_key_file", "tunnel_agent_host",
+                    "tunnel_agent_port", "tunnel_server_host", "tunnel_server_port", "tunnel_timeout_seconds"}));
+    EXPECT_EQ(
+        LumioRequestHandler::clusterPreferencesKeysToCopy(),
+        (Keys{"agent_max_recording_minutes", "agent_unattended_recording_minutes", "http_auth_type",
+              "camera_status_min_interval_seconds", "camera_watcher_check_interval_seconds",
+              "camera_preview_cache_seconds", "agent_timeout_seconds", "nimbo_controller", "nimbo_job_cleanup_minutes",
+              "submissions_groupname", "external_command_timeout_seconds", "nimbo_client_username", "nimbo_grid_id"}));
 }
 
 TEST_F(ReadSettings, CopyKeysReplacesWhatTheSourceHasAndLeavesTheRest) {

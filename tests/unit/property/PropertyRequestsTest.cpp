@@ -67,6 +67,11 @@ TEST_F(PropertyRequests, LanguagesComeFromTheRequestAndElseFromTheHost) {
     EXPECT_EQ(description({{"optionalArguments", Dictionary{{"languages", Array{"French", "de"}}}}}), "nombre");
     EXPECT_EQ(description({{"optionalArguments", Dictionary{{"languages", Array{}}}}}), "number");
     adminhost::setUserDefault("BrennLanguages", {});
+    // Reading the settings passes its whole request on.
+    const Response read = handler.readSettingsWithRequest(
+        {{"optionalArguments", Dictionary{{"variant", "getProperties"}, {"languages", Array{"fr"}}}}});
+    const Array& list = *read.dictionary().at("configuration.properties").array();
+    EXPECT_EQ(list[0].dictionary()->get("description"), Value("nombre"));
 }
 
 TEST_F(PropertyRequests, ObsoleteEntryIsDeletedAlsoWhenItIsMarkedNew) {
