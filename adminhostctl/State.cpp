@@ -52,11 +52,6 @@ Failure notListed(const std::string& what) {
     return {ExitStatus::answeredError, "the service answered no " + what + ": its database cannot be read"};
 }
 
-bool sameUuid(const std::string& a, const std::string& b) {
-    return std::equal(a.begin(), a.end(), b.begin(), b.end(),
-                      [](unsigned char x, unsigned char y) { return std::tolower(x) == std::tolower(y); });
-}
-
 }  // namespace
 
 State stateOf(const Dictionary& configuration) {
@@ -69,6 +64,11 @@ State stateOf(const Dictionary& configuration) {
     state.properties = listOf<Property>(configuration.get("properties"), &propertyOf);
     state.cameras = listOf<Camera>(configuration.get("cameras"), &cameraOf);
     return state;
+}
+
+bool sameUuid(const std::string& a, const std::string& b) {
+    return std::equal(a.begin(), a.end(), b.begin(), b.end(),
+                      [](unsigned char x, unsigned char y) { return std::tolower(x) == std::tolower(y); });
 }
 
 const Camera* findCamera(const State& state, const std::string& nameOrUuid) {

@@ -41,6 +41,9 @@ struct State {
 /// Elements without identity are left out; what has an unexpected type counts as missing.
 [[nodiscard]] State stateOf(const Dictionary& configuration);
 
+/// Whether two texts are the same UUID, in whatever case.
+[[nodiscard]] bool sameUuid(const std::string& a, const std::string& b);
+
 /// The camera with the UUID (in any case) or, if there is none, with the name; null if there is none of the name.
 /// Throws Failure: several have the name (usage), cameras are not listed (answeredError).
 [[nodiscard]] const Camera* findCamera(const State& state, const std::string& nameOrUuid);

@@ -3,6 +3,7 @@
 #include "adminhostctl/ChangeVerbs.h"
 #include "adminhostctl/HistoryVerbs.h"
 #include "adminhostctl/Reading.h"
+#include "adminhostctl/State.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "platform/json/Json.h"
@@ -11,7 +12,6 @@
 
 #include <algorithm>
 #include <array>
-#include <cctype>
 
 namespace adminhost::ctl {
 namespace {
@@ -156,11 +156,6 @@ ExitStatus list(const Context& context, const std::string& name, const std::stri
         context.out << (text != nullptr ? shown(*text) + '\n' : "");
     }
     return ExitStatus::done;
-}
-
-bool sameUuid(const std::string& a, const std::string& b) {
-    return std::equal(a.begin(), a.end(), b.begin(), b.end(),
-                      [](unsigned char x, unsigned char y) { return std::tolower(x) == std::tolower(y); });
 }
 
 /// Shows the one element of a list that has the name or, in any case, the UUID.

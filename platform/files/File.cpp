@@ -14,7 +14,8 @@ namespace {
 
 std::nullopt_t fail(const DiskPath& path, int number, Error* error) {
     if (error != nullptr) {
-        *error = Error{"posix", number, "cannot read " + path.text() + ": " + std::generic_category().message(number)};
+        *error = Error{"posix", number,
+                       "cannot read " + hostPath(path).text() + ": " + std::generic_category().message(number)};
     }
     return std::nullopt;
 }

@@ -1,5 +1,7 @@
 #include "platform/files/Make.h"
 
+#include "platform/files/FileDescriptor.h"
+
 #include <array>
 #include <cerrno>
 #include <cstdio>
@@ -21,18 +23,17 @@ Error failure(const char* step, int number) {
 
 /// Sets the attributes through a descriptor, so that a link put in the directory's place is never followed.
 std::optional<Error> setAttributes(const std::string& path, const DirectoryAttributes& attributes) {
-    const int directory = ::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
-    if (directory < 0) {
+    const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    if (!directory.isOpen()) {
         return failure("cannot open the new directory", errno);
     }
     std::optional<Error> error;
-    if (::fchmod(directory, attributes.mode) != 0) {
+    if (::fchmod(directory.get(), attributes.mode) != 0) {
         error = failure("cannot set the mode", errno);
     }
-    if (::fchown(directory, attributes.owner, attributes.group) != 0) {
+    if (::fchown(directory.get(), attributes.owner, attributes.group) != 0) {
         error = failure("cannot set the owner", errno);
     }
-    ::close(directory);
     return error;
 }
 
@@ -62,16 +63,12 @@ std::optional<Error> makeDirectories(const DiskPath& path, const DirectoryAttrib
 }
 
 std::optional<Error> makeEmptyFile(const DiskPath& path) {
-    const int file = ::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
-    if (file < 0) {
+    FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644));
+    if (!file.isOpen() || ::fsync(file.get()) != 0) {
         return failure("cannot make the file", errno);
     }
-    const bool synced = ::fsync(file) == 0;
-    const int number = errno;
-    if (::close(file) != 0 || !synced) {
-        return failure("cannot make the file", synced ? errno : number);
-    }
-    return std::nullopt;
+    const int number = file.close();
+    return number == 0 ? std::nullopt : std::optional(failure("cannot make the file", number));
 }
 
 std::optional<gid_t> groupIdOf(const char* name) {

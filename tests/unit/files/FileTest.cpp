@@ -48,6 +48,14 @@ TEST_F(ReadFile, MissingFileDirectoryAndPipeAreErrorsThatNameThePath) {
     EXPECT_EQ(error.code, EINVAL);
 }
 
+TEST_F(ReadFile, ErrorNamesThePathAsTheAdministratorKnowsIt) {
+    setSystemRoot(_directory);
+    Error error;
+    EXPECT_EQ(readFile(diskPath(HostPath("/etc/none")), 10, &error), std::nullopt);
+    setSystemRoot("/");
+    EXPECT_EQ(error.description, "cannot read /etc/none: No such file or directory");
+}
+
 TEST_F(ReadFile, PathWithANulNamesNoFile) {
     std::ofstream(_directory / "f") << "text";
     Error error;
