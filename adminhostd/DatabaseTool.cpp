@@ -27,6 +27,9 @@ std::optional<std::string> databaseToolProblem() {
     std::string output;
     std::string error;
     const std::int32_t status = launch_task(diskPath(tool), {"-line", ":memory:", statement}, &output, &error);
+    if (status == -1) {
+        return fmt::format("{} cannot be run ({}); install Debian's package sqlite3", tool.text(), error);
+    }
     if (status != 0) {
         return fmt::format("{} failed with status {}: {}", tool.text(), status, error.substr(0, error.find('\n')));
     }

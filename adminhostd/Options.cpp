@@ -50,6 +50,10 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
         options.root = absolute(options.root);
         setSystemRoot(options.root);
         options.root = systemRoot();
+        // Places below it are made where they are missing, but a slip of the pen is no new root.
+        if (!std::filesystem::is_directory(options.root)) {
+            throw std::runtime_error(options.root + " is no directory; make it or correct --root");
+        }
         const DiskPath standard = diskPath(HostPath(defaultConfiguration));
         // It names what is loaded into the daemon, so the same rules hold for it as for plug-ins.
         const auto problem = !configuration.empty() ? openToEverybody(DiskPath(configuration))

@@ -139,6 +139,11 @@ int check(const Options& options) {
     if (const auto problem = inTheWay(socket)) {
         problems.push_back(*problem);
     }
+    if (const DiskPath uuids = diskPath(HostPath(options.accountUuids));
+        !options.accountUuids.empty() && ::access(uuids.c_str(), R_OK) != 0) {
+        problems.push_back(fmt::format("No access list can be read: {}: {}; make the file or correct account_uuids",
+                                       uuids.text(), std::strerror(errno)));
+    }
     try {
         static_cast<void>(groupOf(options.socketGroup));
     } catch (const std::exception& error) {

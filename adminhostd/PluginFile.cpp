@@ -54,7 +54,7 @@ std::optional<std::string> identityIn(std::string_view notes) {
 std::optional<std::string> distrust(const DiskPath& path) {
     struct stat status {};
     if (::stat(path.c_str(), &status) != 0) {
-        return fmt::format("{}: {}", path.text(), std::strerror(errno));
+        return fmt::format("{}: {}; make it or choose another place", path.text(), std::strerror(errno));
     }
     if (status.st_uid != 0 && status.st_uid != ::geteuid()) {
         return fmt::format("{} belongs to uid {}; chown it to root", path.text(), status.st_uid);
@@ -93,7 +93,7 @@ std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory) {
 std::optional<std::string> buildIdentityOf(const DiskPath& path, std::string& problem) {
     const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
     if (!file.isOpen()) {
-        problem = fmt::format("{}: {}", path.text(), std::strerror(errno));
+        problem = fmt::format("{}: {}; install it or correct its name", path.text(), std::strerror(errno));
         return std::nullopt;
     }
     constexpr int ownOrder = std::endian::native == std::endian::little ? ELFDATA2LSB : ELFDATA2MSB;

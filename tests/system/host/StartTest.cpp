@@ -263,6 +263,12 @@ TEST_F(Start, CheckNamesEveryProblemWithItsMend) {
     EXPECT_NE(result.output.find("there is no group \"no-such-group\""), std::string::npos) << result.output;
     EXPECT_NE(result.output.find("make its directory, or choose another with --socket"), std::string::npos)
         << result.output;
+    const std::string accounts = configuration("account_uuids = \"" + (directory / "uuids").string() + "\"\n");
+    EXPECT_NE(
+        run({"--check", "--config", accounts, "--plugin", pluginFile("fixture_good"), "--socket", directory / "s"})
+            .output.find("uuids: No such file or directory; make the file or correct account_uuids"),
+        std::string::npos);
+    configuration("socket_group = \"no-such-group\"\n");
     EXPECT_NE(run({"--check", "--config", file, "--plugin", pluginFile("fixture_no_note"), "--socket", directory / "s"})
                   .output.find("carries no build note"),
               std::string::npos)
@@ -301,6 +307,18 @@ TEST_F(Start, MistakesInTheConfigurationAreNamedWithTheirLine) {
         EXPECT_NE(result.output.find(entry.expected), std::string::npos) << entry.text << result.output;
     }
     EXPECT_EQ(run({"--check", "--config", (directory / "missing").string()}).status, 1);
+}
+
+TEST_F(Start, RootThatDoesNotExistIsNeitherMadeNorServed) {
+    const fs::path missing = directory / "missing";
+    for (const std::vector<std::string>& arguments : {std::vector<std::string>{"--root", missing, "--check"},
+                                                      {"--root", missing, "--socket", directory / "socket"}}) {
+        const ProgramResult result = run(arguments);
+        EXPECT_EQ(result.status, 1);
+        EXPECT_NE(result.output.find("missing is no directory; make it or correct --root"), std::string::npos)
+            << result.output;
+    }
+    EXPECT_FALSE(fs::exists(missing));
 }
 
 TEST_F(Start, ConfigurationThatOthersMayWriteIsRefused) {
@@ -399,7 +417,8 @@ TEST_F(DatabaseTool, RealOneIsUsable) {
 TEST_F(DatabaseTool, MissingOneRefusesTheCommandsThatNeedIt) {
     const HttpReply reply = databaseReply();
     expectError(reply, 500, "SQLITE_TOOL_UNUSABLE");
-    EXPECT_NE(reply.body.find("/usr/bin/sqlite3 failed"), std::string::npos) << reply.body;
+    EXPECT_NE(reply.body.find("/usr/bin/sqlite3 cannot be run ("), std::string::npos) << reply.body;
+    EXPECT_NE(reply.body.find("install Debian's package sqlite3"), std::string::npos) << reply.body;
 }
 
 TEST_F(DatabaseTool, OneThatPrintsRowsOtherwiseIsRefused) {
