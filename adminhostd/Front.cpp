@@ -6,6 +6,7 @@
 #include "platform/value/Text.h"
 
 #include <algorithm>
+#include <functional>
 
 #include <fmt/format.h>
 #include <fmt/ranges.h>
@@ -127,12 +128,32 @@ HttpAnswer answerFor(const Dictionary& worker) {
 Front::Front(OperationQueue::Settings settings, Array refused)
     : _refused(std::move(refused)),
       _queue(std::move(settings),
-             {[this](const Dictionary& hello) {
-                  _hello = isHello(hello) ? hello : std::move(_hello);
-                  return isHello(hello);
-              },
+             {[this](const Dictionary& hello) { return welcome(hello); },
               [](const std::string& event) { logEvent(event); },
               [this](const Operation& operation, const Dictionary& answer) { finished(operation, answer); }}) {}
+
+bool Front::welcome(const Dictionary& hello) {
+    if (!isHello(hello)) {
+        return false;
+    }
+    _hello = hello;
+    const Array none;
+    const Array* others = hello.get("refused").array();
+    for (const Array& refused : {std::cref(_refused), std::cref(others == nullptr ? none : *others)}) {
+        for (const Value& plugin : refused) {
+            const Dictionary* described = plugin.dictionary();
+            logEvent(fmt::format("adminhostd: a plug-in is refused: {}",
+                                 described == nullptr ? "" : textAt(*described, "reason")));
+        }
+    }
+    if (hello.contains("databaseTool")) {
+        logEvent(
+            fmt::format("adminhostd: commands that need the database are refused: {}", textAt(hello, "databaseTool")));
+    }
+    logEvent(fmt::format("adminhostd: release " ADMINHOST_RELEASE " serves with the plug-ins {}",
+                         namesIn(hello.get("plugins"))));
+    return true;
+}
 
 Front::Address Front::addressOf(std::string_view path) {
     constexpr std::string_view root = "/v1";

@@ -35,6 +35,8 @@ class Front {
         std::string_view command;
     };
 
+    /// Takes over what a worker says of itself; false when it is not of the form that everything else relies on.
+    bool welcome(const Dictionary& hello);
     [[nodiscard]] static Address addressOf(std::string_view path);
     [[nodiscard]] const Dictionary* pluginNamed(std::string_view name) const;
     [[nodiscard]] static const Dictionary* commandNamed(const Dictionary& plugin, std::string_view name);

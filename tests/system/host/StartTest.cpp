@@ -148,6 +148,8 @@ TEST_F(Start, PluginsThatMustNotRunAreRefusedWithTheReason) {
         EXPECT_NE(textAt(*refused[i].dictionary(), "reason").find(expected[i]), std::string::npos)
             << textAt(*refused[i].dictionary(), "reason");
     }
+    EXPECT_TRUE(daemon.waitForLog("adminhostd: a plug-in is refused: " + pluginFile("fixture_other_build")));
+    EXPECT_TRUE(daemon.waitForLog("serves with the plug-ins fixture\n"));
     EXPECT_FALSE(fs::exists(mark)) << "no code of a refused plug-in has run";
     EXPECT_EQ(daemon.connect().post("/v1/fixture/echo", "{}").status, 200);
 }
