@@ -88,17 +88,22 @@ HttpAnswer findingsAnswer(const Value& findings, const Dictionary& first) {
     return answer;
 }
 
-HttpAnswer answerFor(const Dictionary& worker) {
+/// Takes the worker's response out of its answer: a listing is large.
+HttpAnswer answerFor(Dictionary& worker) {
+    const auto response = [&] {
+        Value* found = worker.find("response");
+        return found == nullptr ? Value() : std::move(*found);
+    };
     const std::string_view word = textAt(worker, "outcome");
     const std::string_view message = textAt(worker, "message");
     if (word == outcome::nothing) {
         return {204, std::nullopt, {}};
     }
     if (word == outcome::dictionary) {
-        return {200, worker.get("response"), {}};
+        return {200, response(), {}};
     }
     if (word == outcome::error) {
-        return {500, worker.get("response"), {}};
+        return {500, response(), {}};
     }
     const Array* findings = worker.get("findings").array();
     if (word == outcome::refused && findings != nullptr && !findings->empty() &&
@@ -130,7 +135,7 @@ Front::Front(OperationQueue::Settings settings, Array refused)
       _queue(std::move(settings),
              {[this](const Dictionary& hello) { return welcome(hello); },
               [](const std::string& event) { logEvent(event); },
-              [this](const Operation& operation, const Dictionary& answer) { finished(operation, answer); }}) {}
+              [this](const Operation& operation, Dictionary answer) { finished(operation, std::move(answer)); }}) {}
 
 bool Front::welcome(const Dictionary& hello) {
     if (!isHello(hello)) {
@@ -389,7 +394,7 @@ void Front::query(Exchange& exchange, const Address& address) {
     _queue.add(std::move(operation));
 }
 
-void Front::finished(const Operation& operation, const Dictionary& answer) {
+void Front::finished(const Operation& operation, Dictionary answer) {
     HttpAnswer http = answerFor(answer);
     const std::string_view revision = textAt(answer, "revision");
     if (http.status < 300 && !revision.empty()) {

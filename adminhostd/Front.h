@@ -45,7 +45,7 @@ class Front {
     void operation(Exchange& exchange, const Address& address);
     /// What the worker answers without an operation of a plug-in.
     void query(Exchange& exchange, const Address& address);
-    void finished(const Operation& operation, const Dictionary& answer);
+    void finished(const Operation& operation, Dictionary answer);
     void close(RequestRecord& record, const HttpAnswer& answer);
 
     History _history;

@@ -92,11 +92,11 @@ void OperationQueue::run() {
         const unsigned long asked = _starts;
         const bool more = _worker->converse();
         while (_worker && _starts == asked) {
-            const auto frame = _worker->next();
+            auto frame = _worker->next();
             if (!frame) {
                 break;
             }
-            take(*frame);
+            take(std::move(*frame));
         }
         if (_worker && _starts == asked && _worker->broken()) {
             _worker->kill();
@@ -111,8 +111,8 @@ void OperationQueue::run() {
     }
 }
 
-void OperationQueue::take(const Frame& frame) {
-    const Dictionary* payload = frame.payload.dictionary();
+void OperationQueue::take(Frame frame) {
+    Dictionary* payload = frame.payload.dictionary();
     if (frame.type == FrameType::log && frame.payload.string() != nullptr) {
         if (_running) {
             _running->record->addLog(*frame.payload.string());
@@ -128,7 +128,7 @@ void OperationQueue::take(const Frame& frame) {
     } else if (frame.type == FrameType::answer && _state == State::busy && payload != nullptr) {
         _state = State::idle;
         _due.reset();
-        finish(*payload);
+        finish(std::move(*payload));
         next();
     } else {
         _worker->kill();
@@ -174,7 +174,7 @@ void OperationQueue::timeUp() {
             Dictionary answer = stopping
                                     ? answerOf(outcome::stopping, "The daemon was stopped before the command ended.")
                                     : Dictionary{{"outcome", outcome::overrun}};
-            finish(answer);
+            finish(std::move(answer));
             _worker->kill();
             workerEnded("did not stop in time and was killed");
             break;
@@ -207,10 +207,10 @@ void OperationQueue::next() {
     }
 }
 
-void OperationQueue::finish(const Dictionary& answer) {
+void OperationQueue::finish(Dictionary answer) {
     const Operation operation = std::move(*_running);
     _running.reset();
-    _events.finished(operation, answer);
+    _events.finished(operation, std::move(answer));
 }
 
 void OperationQueue::stop(std::chrono::milliseconds bound) {

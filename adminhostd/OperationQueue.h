@@ -43,7 +43,7 @@ class OperationQueue {
     struct Events {
         std::function<bool(const Dictionary&)> hello;  ///< whether it is of the form that Worker.h describes
         std::function<void(const std::string&)> log;   ///< an event of the plug-ins or of the queue, for the system log
-        std::function<void(const Operation&, const Dictionary&)> finished;
+        std::function<void(const Operation&, Dictionary)> finished;
     };
 
     OperationQueue(Settings settings, Events events);
@@ -75,11 +75,11 @@ class OperationQueue {
 
     void start();
     void startFailed(const std::string& reason);
-    void take(const Frame& frame);
+    void take(Frame frame);
     void workerEnded(const std::string& how);
     void timeUp();
     void next();
-    void finish(const Dictionary& answer);
+    void finish(Dictionary answer);
     void failWaiting(const char* outcome, const std::string& message);
 
     Settings _settings;

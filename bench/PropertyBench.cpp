@@ -1,59 +1,60 @@
-// Listing 1000 properties, every fifth protected, against one bare run of the SQL tool with the same statement.
+// Listing 1000 properties, every fifth protected, against one bare run of the SQL tool with the same statement: by the
+// handler alone, and through the whole road.
 
+#include "bench/Road.h"
 #include "handler/LumioRequestHandler.h"
-#include "tests/support/Program.h"
-#include "tests/support/SampleRoot.h"
-
-#include <benchmark/benchmark.h>
 
 namespace {
 
-constexpr const char* statement = "select * from properties;";
+using namespace bench;
+
 constexpr int propertyCount = 1000;
 
 /// The sample service, its properties replaced by the benchmark's: protected ones have two full lines and a part.
-adminhost::test::SampleRoot& service() {
-    static adminhost::test::SampleRoot root({0, 0, 0, 0, 0, 0});
+const SampleRoot& service() {
+    static const SampleRoot root({0, 0, 0, 0, 0, 0});
     static const bool filled = [] {
-        root.sql("with recursive n(i) as (select 1 union all select i+1 from n where i<" +
+        root.sql("delete from properties; with recursive n(i) as (select 1 union all select i+1 from n where i<" +
                  std::to_string(propertyCount) +
                  ") insert into properties(name,value,protect,created_at,updated_at) select 'property_'||i, "
                  "case i%5 when 0 then replace(hex(zeroblob(38)),'0','A')||char(10)||replace(hex(zeroblob(38)),'0','B')"
                  "||char(10)||'QUJD' else 'value number '||i end, case i%5 when 0 then 't' else 'f' end, "
                  "'2026-01-30 16:45:00','2026-01-30 16:45:00' from n");
-        adminhost::setSystemRoot(root.path());
         return true;
     }();
     static_cast<void>(filled);
     return root;
 }
 
+Command bareTool() {
+    return query(service(), "select * from properties;");
+}
+
 void ListProperties(benchmark::State& state) {
-    service();
+    adminhost::setSystemRoot(service().path());
+    const Command tool = bareTool();
     lumio::LumioRequestHandler handler;
-    for (auto _ : state) {
-        const adminhost::Response response = handler.getPropertiesWithRequest({});
-        const adminhost::Array* list = response.dictionary().get("properties").array();
-        if (list == nullptr || list->size() != propertyCount) {
-            state.SkipWithError("the list is not whole");
-            return;
-        }
-    }
+    adminhost::Response response = nullptr;
+    alternate(
+        state, bench::Clock::wall, [&] { response = handler.getPropertiesWithRequest({}); },
+        [&] { benchmark::DoNotOptimize(run(tool)); },
+        [&] {
+            const adminhost::Array* list = response.dictionary().get("properties").array();
+            if (list == nullptr || list->size() != propertyCount) {
+                state.SkipWithError("the list is not whole");
+            }
+            response = nullptr;
+        });
 }
 
-void BareTool(benchmark::State& state) {
-    const std::string database = service().databasePath();
-    for (auto _ : state) {
-        const auto result = adminhost::test::runProgram({"/usr/bin/sqlite3", "-line", database, statement});
-        if (result.status != 0 || result.output.empty()) {
-            state.SkipWithError("the tool failed");
-            return;
-        }
-    }
+void RequestProperties(benchmark::State& state) {
+    const Daemon daemon(service());
+    const Command tool = bareTool();
+    compare(state, "getProperties", "{}", daemon, [&] { benchmark::DoNotOptimize(run(tool)); });
 }
 
-BENCHMARK(ListProperties)->UseRealTime()->Unit(benchmark::kMicrosecond);
-BENCHMARK(BareTool)->UseRealTime()->Unit(benchmark::kMicrosecond);
+BENCHMARK(ListProperties)->UseManualTime()->Unit(benchmark::kMillisecond)->MinTime(2);
+BENCHMARK(RequestProperties)->UseManualTime()->Unit(benchmark::kMillisecond)->MinTime(2);
 
 }  // namespace
 

@@ -4,11 +4,10 @@
 // runs of the same tools by posix_spawn and nothing else. Both are timed in turn in one run; "ratio" is the median of
 // the requests divided by the median of the floors.
 
+#include "bench/Alternating.h"
 #include "tests/support/SampleRoot.h"
 
-#include <algorithm>
 #include <array>
-#include <chrono>
 #include <csignal>
 #include <cstring>
 #include <filesystem>
@@ -30,7 +29,6 @@ namespace bench {
 
 using adminhost::test::SampleRoot;
 using adminhost::test::SampleSizes;
-using Clock = std::chrono::steady_clock;
 using Command = std::vector<std::string>;
 
 inline pid_t start(const Command& command, const posix_spawn_file_actions_t* actions) {
@@ -144,33 +142,13 @@ class Daemon {
     pid_t _process = 0;
 };
 
-inline double median(std::vector<double>& times) {
-    std::nth_element(times.begin(), times.begin() + static_cast<std::ptrdiff_t>(times.size() / 2), times.end());
-    return times[times.size() / 2];
-}
-
 /// Times request and floor in turn.
 template <class Floor>
 void compare(benchmark::State& state, const std::string& command, const std::string& body, const Daemon& daemon,
              Floor floor) {
-    std::vector<double> requests;
-    std::vector<double> floors;
-    benchmark::DoNotOptimize(daemon.request(command, body));
-    for (auto _ : state) {
-        const auto begin = Clock::now();
-        floor();
-        const auto between = Clock::now();
-        benchmark::DoNotOptimize(daemon.request(command, body));
-        const auto end = Clock::now();
-        floors.push_back(std::chrono::duration<double, std::milli>(between - begin).count());
-        requests.push_back(std::chrono::duration<double, std::milli>(end - between).count());
-        state.SetIterationTime(std::chrono::duration<double>(end - between).count());
-    }
-    const double request = median(requests);
-    const double bare = median(floors);
-    state.counters["floor_ms"] = bare;
-    state.counters["request_ms"] = request;
-    state.counters["ratio"] = request / bare;
+    const auto request = [&] { benchmark::DoNotOptimize(daemon.request(command, body)); };
+    request();
+    alternate(state, Clock::wall, request, floor, [] {});
 }
 
 /// The floor's tool runs, one after the other.

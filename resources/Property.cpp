@@ -256,9 +256,15 @@ std::string Property::recordText(bool hideValue) const {
     return textOf(Value(std::move(shown)));
 }
 
-void Property::addDataDictionaryToMutableArray(Array& array) const {
+void Property::addDataDictionaryToMutableArray(Array& array) const& {
     if (_data) {
         array.emplace_back(*_data);
+    }
+}
+
+void Property::addDataDictionaryToMutableArray(Array& array) && {
+    if (_data) {
+        array.emplace_back(std::move(*_data));
     }
 }
 

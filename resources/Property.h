@@ -53,7 +53,9 @@ class Property final : public ResourceClass<Property> {
     /// Deletes the record's row; without an id nothing.
     [[nodiscard]] std::optional<adminhost::Error> delete_() override;
     /// Appends the record, if there is one.
-    void addDataDictionaryToMutableArray(adminhost::Array& array) const;
+    void addDataDictionaryToMutableArray(adminhost::Array& array) const&;
+    /// The same without a copy, for a property that is not needed any more.
+    void addDataDictionaryToMutableArray(adminhost::Array& array) &&;
 
     /// The id of the only row of the table with that name.
     [[nodiscard]] std::optional<std::int64_t> getIDForName(const std::string& name, const std::string& table) const;

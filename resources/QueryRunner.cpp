@@ -8,8 +8,23 @@ namespace lumio {
 using adminhost::Dictionary;
 using adminhost::Error;
 
+namespace {
+
+constexpr std::string_view separator = " = ";
+
+/// Where the first separator begins. Searched by its middle: lines begin with blanks.
+std::size_t separatorIn(std::string_view line) noexcept {
+    for (std::size_t at = line.find('=', 1); at < line.size(); at = line.find('=', at + 1)) {
+        if (line.substr(at - 1, separator.size()) == separator) {
+            return at - 1;
+        }
+    }
+    return std::string_view::npos;
+}
+
+}  // namespace
+
 std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
-    constexpr std::string_view separator = " = ";
     std::vector<Dictionary> records;
     if (output.empty()) {
         return records;
@@ -26,7 +41,7 @@ std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
             pending = Dictionary();
             continue;
         }
-        const std::size_t split = line.find(separator);
+        const std::size_t split = separatorIn(line);
         // A line without separator, such as the second line of a value, is its own value.
         const bool splits = split != std::string_view::npos;
         std::string_view key = splits ? line.substr(0, split) : line;

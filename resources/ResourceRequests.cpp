@@ -112,7 +112,7 @@ Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary& request
     Array list;
     list.reserve(properties->size());
     for (const auto& property : *properties) {
-        property->addDataDictionaryToMutableArray(list);
+        std::move(*property).addDataDictionaryToMutableArray(list);
     }
     return listing("getProperties", "properties", std::move(list));
 }

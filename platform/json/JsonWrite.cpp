@@ -2,6 +2,7 @@
 #include "platform/json/JsonForms.h"
 #include "platform/value/Text.h"
 
+#include <algorithm>
 #include <charconv>
 #include <cmath>
 #include <utility>
@@ -62,7 +63,17 @@ void Writer::writeString(std::string_view bytes) {
     }
     constexpr std::string_view digits = "0123456789abcdef";
     _text += '"';
-    for (const char c : bytes) {
+    const auto isPlain = [](char c) {
+        return static_cast<unsigned char>(c) >= 0x20 && c != '"' && c != '\\' && c != 0x7f;
+    };
+    for (auto at = bytes.begin(); at != bytes.end(); ++at) {
+        const auto plain = at;
+        at = std::find_if_not(plain, bytes.end(), isPlain);
+        _text.append(plain, at);
+        if (at == bytes.end()) {
+            break;
+        }
+        const char c = *at;
         switch (c) {
             case '"':
             case '\\':
@@ -79,13 +90,9 @@ void Writer::writeString(std::string_view bytes) {
                 _text += "\\t";
                 break;
             default:
-                if (static_cast<unsigned char>(c) < 0x20 || c == 0x7f) {
-                    _text += "\\u00";
-                    _text += digits[static_cast<unsigned char>(c) >> 4U];
-                    _text += digits[static_cast<unsigned char>(c) & 0x0fU];
-                } else {
-                    _text += c;
-                }
+                _text += "\\u00";
+                _text += digits[static_cast<unsigned char>(c) >> 4U];
+                _text += digits[static_cast<unsigned char>(c) & 0x0fU];
         }
     }
     _text += '"';

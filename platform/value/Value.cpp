@@ -1,6 +1,7 @@
 #include "platform/value/Value.h"
 
 #include <algorithm>
+#include <unordered_map>
 #include <utility>
 
 namespace adminhost {
@@ -13,10 +14,23 @@ const Value nullValue;
 
 }  // namespace
 
+/// Where each key's entry stands.
+struct Dictionary::Index {
+    struct Hash {
+        using is_transparent = void;
+        std::size_t operator()(std::string_view text) const noexcept { return std::hash<std::string_view>{}(text); }
+    };
+    std::unordered_map<std::string, std::size_t, Hash, std::equal_to<>> places;
+};
+
 Dictionary::Dictionary() noexcept = default;
-Dictionary::Dictionary(const Dictionary&) = default;
+Dictionary::Dictionary(const Dictionary& other) : _entries(other._entries) {
+    rebuildIndex();
+}
 Dictionary::Dictionary(Dictionary&&) noexcept = default;
-Dictionary& Dictionary::operator=(const Dictionary&) = default;
+Dictionary& Dictionary::operator=(const Dictionary& other) {
+    return *this = Dictionary(other);
+}
 Dictionary& Dictionary::operator=(Dictionary&&) noexcept = default;
 Dictionary::~Dictionary() = default;
 
@@ -32,17 +46,18 @@ std::size_t Dictionary::indexOf(std::string_view key) const noexcept {
                                         [&](const DictionaryEntry& entry) { return entry.key == key; });
         return found == _entries.end() ? notFound : static_cast<std::size_t>(found - _entries.begin());
     }
-    const auto found = _index.find(key);
-    return found == _index.end() ? notFound : found->second;
+    const auto found = _index->places.find(key);
+    return found == _index->places.end() ? notFound : found->second;
 }
 
 void Dictionary::rebuildIndex() {
-    _index.clear();
+    _index.reset();
     if (_entries.size() <= linearLimit) {
         return;
     }
+    _index = std::make_unique<Index>();
     for (std::size_t i = 0; i < _entries.size(); ++i) {
-        _index.emplace(_entries[i].key, i);
+        _index->places.emplace(_entries[i].key, i);
     }
 }
 
@@ -90,11 +105,11 @@ void Dictionary::set(std::string_view key, Value value) {
     if (_entries.empty()) {
         _entries.reserve(8);  // most dictionaries have several entries, and moving them costs more than room for them
     }
-    _entries.push_back({std::string(key), std::move(value)});
+    _entries.emplace_back(std::string(key), std::move(value));
     if (_entries.size() == linearLimit + 1) {
         rebuildIndex();
     } else if (_entries.size() > linearLimit) {
-        _index.emplace(key, _entries.size() - 1);
+        _index->places.emplace(key, _entries.size() - 1);
     }
 }
 
@@ -110,7 +125,7 @@ bool Dictionary::remove(std::string_view key) {
 
 void Dictionary::clear() noexcept {
     _entries.clear();
-    _index.clear();
+    _index.reset();
 }
 
 std::size_t Dictionary::size() const noexcept {
@@ -135,7 +150,9 @@ bool operator==(const Dictionary& a, const Dictionary& b) {
 
 Value::Value(Array value) noexcept : _value(std::move(value)) {}
 Value::Value(const Value&) = default;
-Value::Value(Value&& other) noexcept : _value(std::exchange(other._value, std::monostate{})) {}
+Value::Value(Value&& other) noexcept : _value(std::move(other._value)) {
+    other._value.emplace<std::monostate>();
+}
 Value& Value::operator=(const Value&) = default;
 Value& Value::operator=(Value&& other) noexcept {
     if (this != &other) {

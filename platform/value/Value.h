@@ -10,10 +10,10 @@
 #include <concepts>
 #include <cstdint>
 #include <initializer_list>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
-#include <unordered_map>
 #include <variant>
 #include <vector>
 
@@ -68,14 +68,11 @@ class Dictionary {
     [[nodiscard]] std::size_t indexOf(std::string_view key) const noexcept;
     void rebuildIndex();
 
-    struct Hash {
-        using is_transparent = void;
-        std::size_t operator()(std::string_view text) const noexcept { return std::hash<std::string_view>{}(text); }
-    };
+    struct Index;
 
     std::vector<DictionaryEntry> _entries;
-    /// Only kept once there are more than a few keys.
-    std::unordered_map<std::string, std::size_t, Hash, std::equal_to<>> _index;
+    /// Only there once there are more than a few keys: every Value is as large as a Dictionary.
+    std::unique_ptr<Index> _index;
 };
 
 class Value {

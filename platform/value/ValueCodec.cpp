@@ -1,5 +1,6 @@
 #include "platform/value/ValueCodec.h"
 
+#include <algorithm>
 #include <bit>
 #include <cstring>
 
@@ -100,6 +101,7 @@ bool Decoder::array(Value& value, std::size_t depth) {
         return false;
     }
     Array array;
+    array.reserve(std::min<std::size_t>(count, 4096));
     for (std::size_t i = 0; i < count; ++i) {
         if (!this->value(array.emplace_back(), depth + 1)) {
             return false;

@@ -243,7 +243,14 @@ TEST_F(PropertyTest, RecordIsAppendedToTheArray) {
     Array array;
     Property::initWithDictionary({{"id", "5"}})->addDataDictionaryToMutableArray(array);
     Property::init()->addDataDictionaryToMutableArray(array);
-    EXPECT_EQ(array, (Array{Dictionary{{"id", "5"}, {"protect", false}, {"_id_", "5"}}}));
+    const Value record = Dictionary{{"id", "5"}, {"protect", false}, {"_id_", "5"}};
+    EXPECT_EQ(array, Array{record});
+    const auto property = Property::initWithDictionary({{"id", "5"}});
+    property->addDataDictionaryToMutableArray(array);
+    EXPECT_NE(property->dictionary()->size(), 0U);
+    std::move(*property).addDataDictionaryToMutableArray(array);
+    std::move(*Property::init()).addDataDictionaryToMutableArray(array);
+    EXPECT_EQ(array, (Array{record, record, record}));
 }
 
 TEST_F(PropertyTest, IdForANameIsTheOnlyRowsOne) {

@@ -44,6 +44,12 @@ TEST(LineOutput, LineWithoutSeparatorIsItsOwnValueUnderItsLastWord) {
     EXPECT_EQ(recordsOfLineOutput("value = first\nsecond\n"), (Records{{{"value", "first"}, {"second", "second"}}}));
 }
 
+TEST(LineOutput, OnlyAnEqualsSignBetweenBlanksSeparates) {
+    EXPECT_EQ(recordsOfLineOutput("a=b = c=d\na= = e= = f\n"), (Records{{{"a=b", "c=d"}, {"a=", "e= = f"}}}));
+    EXPECT_EQ(recordsOfLineOutput("x =\n= y\n=\n"), (Records{{{"=", "="}, {"y", "= y"}}}));
+    EXPECT_EQ(recordsOfLineOutput(" = z\n"), (Records{{{"", "z"}}}));
+}
+
 TEST(LineOutput, ValueWithAnEmptyLineEndsTheRecordEarly) {
     EXPECT_EQ(recordsOfLineOutput("   id = 1\nvalue = a\n\nb\n"),
               (Records{{{"id", "1"}, {"value", "a"}}, {{"b", "b"}}}));

@@ -82,6 +82,23 @@ TEST_F(LocalDate, RefusesWhatIsNotAWholeRealDate) {
     EXPECT_TRUE(localDateOf("2024-02-29 00:00:00"));
 }
 
+TEST_F(LocalDate, FieldsMayHaveFewerDigitsButNoMoreThanTheirRange) {
+    EXPECT_EQ(localDateOf("2026-1-31 9:00:00"), localDateOf("2026-01-31 09:00:00"));
+    for (const char* text : {"2026-13-01 00:00:00", "2026-00-01 00:00:00", "2026-01-00 00:00:00", "2026-01-32 00:00:00",
+                             "2026-01-31 09:60:00", "2026-01-31T09:00:00", "2026-01-31 09:00:0x"}) {
+        EXPECT_FALSE(localDateOf(text)) << text;
+    }
+}
+
+TEST_F(LocalDate, AnotherZoneCountsForADayThatWasReadBefore) {
+    const auto before = localDateOf("2026-01-31 09:00:00");
+    ::setenv("TZ", "Asia/Kathmandu", 1);
+    ::tzset();
+    const auto after = localDateOf("2026-01-31 09:00:00");
+    ASSERT_TRUE(before && after);
+    EXPECT_EQ(*before - *after, std::chrono::minutes(285));
+}
+
 TEST_F(LocalDate, InsideADaylightSavingGapIsStillADate) {
     EXPECT_TRUE(localDateOf("2026-03-29 02:30:00"));
 }

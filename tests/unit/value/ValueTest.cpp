@@ -71,6 +71,28 @@ TEST(Dictionary, FollowsKeyPathsAndAnswersNullWhereTheyEndEarly) {
     EXPECT_TRUE(d.at("").isNull());
 }
 
+TEST(Dictionary, CopyOfALargeOneChangesAlone) {
+    Dictionary original;
+    for (int i = 0; i < 50; ++i) {
+        original.set("key" + std::to_string(i), i);
+    }
+    Dictionary copy = original;
+    copy.remove("key0");
+    copy.set("key50", 50);
+    EXPECT_FALSE(copy.contains("key0"));
+    EXPECT_EQ(copy.get("key49"), Value(49));
+    EXPECT_EQ(copy.get("key50"), Value(50));
+    EXPECT_EQ(original.get("key0"), Value(0));
+    EXPECT_FALSE(original.contains("key50"));
+    Dictionary assigned{{"other", 1}};
+    assigned = original;
+    EXPECT_EQ(assigned, original);
+    EXPECT_EQ(assigned.get("key49"), Value(49));
+    Dictionary taken = std::move(original);
+    EXPECT_EQ(taken, assigned);
+    EXPECT_EQ(taken.get("key49"), Value(49));
+}
+
 TEST(Dictionary, EqualityIgnoresOrder) {
     EXPECT_EQ((Dictionary{{"a", 1}, {"b", 2}}), (Dictionary{{"b", 2}, {"a", 1}}));
     EXPECT_NE((Dictionary{{"a", 1}}), (Dictionary{{"a", 1}, {"b", 2}}));
