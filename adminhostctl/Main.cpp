@@ -84,7 +84,11 @@ int runMain(int count, char** words) {
                                               adminhost::ctl::inputIsTerminal()};
         const ExitStatus status = adminhost::ctl::run({service, options, sources, std::cout, std::cerr}, rest);
         std::cout.flush();
-        return statusOf(std::cout ? status : ExitStatus::usage);
+        if (!std::cout) {
+            std::cerr << "adminhostctl: the answer could not be written\n";
+            return statusOf(ExitStatus::usage);
+        }
+        return statusOf(status);
     } catch (const adminhost::ctl::Failure& failure) {
         std::cout.flush();
         std::cerr << "adminhostctl: " << failure.what() << '\n';

@@ -4,6 +4,7 @@
 #include "platform/json/Json.h"
 #include "platform/task/Task.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 
 #include <filesystem>
@@ -210,6 +211,13 @@ TEST(CtlReach, VersionAndOptionsNeedNoDaemon) {
                                "--no-protect", "--version"}) {
         EXPECT_THAT(options.out, HasSubstr(option));
     }
+}
+
+TEST(CtlReach, AnswerThatCannotBeWrittenIsSaid) {
+    const adminhost::test::ProgramResult result = adminhost::test::runProgram(
+        {"/bin/sh", "-c", std::string(program) + " help >/dev/full"}, adminhost::test::Errors::merge);
+    EXPECT_EQ(result.status, 2);
+    EXPECT_EQ(result.output, "adminhostctl: the answer could not be written\n");
 }
 
 TEST(CtlReach, HelpOfTheVerbsNeedsNoDaemon) {
