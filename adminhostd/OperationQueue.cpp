@@ -56,7 +56,7 @@ void OperationQueue::addTo(std::vector<pollfd>& entries) const {
 
 void OperationQueue::start() {
     ++_starts;
-    _worker = WorkerProcess::start(_settings.showOutput);
+    _worker = WorkerProcess::start(_settings.outputToStandardError);
     if (!_worker || !_worker->send(FrameType::configure, _settings.configuration)) {
         startFailed(fmt::format("cannot be started: {}", std::strerror(errno)));
         return;

@@ -35,8 +35,8 @@ constexpr const char* abandoned = "abandoned";      ///< the client went away be
 class OperationQueue {
   public:
     struct Settings {
-        Dictionary configuration;  ///< what every worker is told first
-        bool showOutput = false;
+        Dictionary configuration;            ///< what every worker is told first
+        bool outputToStandardError = false;  ///< of the worker
         std::size_t limit = 64;
         std::chrono::milliseconds deadline{300'000};
     };

@@ -58,7 +58,7 @@ class SpawnPlan {
 
 }  // namespace
 
-std::unique_ptr<WorkerProcess> WorkerProcess::start(bool showOutput) {
+std::unique_ptr<WorkerProcess> WorkerProcess::start(bool outputToStandardError) {
     int ends[2];
     if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
         return nullptr;
@@ -70,10 +70,8 @@ std::unique_ptr<WorkerProcess> WorkerProcess::start(bool showOutput) {
 
     SpawnPlan plan;
     ::posix_spawn_file_actions_addopen(&plan.actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-    if (showOutput) {
+    if (outputToStandardError) {
         ::posix_spawn_file_actions_adddup2(&plan.actions, STDERR_FILENO, STDOUT_FILENO);
-    } else {
-        ::posix_spawn_file_actions_addopen(&plan.actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
     }
     ::posix_spawn_file_actions_adddup2(&plan.actions, other.get(), workerDescriptor);
     const std::string program = workerProgram();

@@ -17,9 +17,9 @@ namespace adminhost {
 
 class WorkerProcess {
   public:
-    /// Starts a worker. Its standard output is ours if shown, else dropped. Null, with errno,
-    /// when it cannot be started.
-    [[nodiscard]] static std::unique_ptr<WorkerProcess> start(bool showOutput);
+    /// Starts a worker. Operations print to its standard output, which is ours (a service manager keeps it), or our
+    /// standard error where the log goes there. Null, with errno, when it cannot be started.
+    [[nodiscard]] static std::unique_ptr<WorkerProcess> start(bool outputToStandardError);
 
     WorkerProcess(const WorkerProcess&) = delete;
     WorkerProcess& operator=(const WorkerProcess&) = delete;

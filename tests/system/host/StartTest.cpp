@@ -4,7 +4,9 @@
 #include "tests/support/Program.h"
 #include "tests/system/host/Host.h"
 
+#include <csignal>
 #include <fstream>
+#include <iterator>
 
 #include <fcntl.h>
 #include <grp.h>
@@ -12,6 +14,7 @@
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 namespace adminhost::test {
@@ -93,6 +96,31 @@ TEST_F(Start, RelativeRootAndPluginAreBelowTheDirectoryThatItIsStartedIn) {
 TEST_F(Start, WorkerAndSoItsToolsRunInTheRootDirectory) {
     const DaemonProcess daemon(withFixture());
     EXPECT_EQ(fs::read_symlink("/proc/" + std::to_string(daemon.workerPid()) + "/cwd"), "/");
+}
+
+TEST_F(Start, WhatOperationsPrintGoesToStandardOutputWhenTheLogDoesNot) {
+    const std::string socket = directory / "socket";
+    const std::string output = directory / "output";
+    const std::string plugin = pluginFile("fixture_good");
+    const std::string program = std::string(BINARY_DIR) + "/bin/adminhostd";
+    const pid_t pid = ::fork();
+    if (pid == 0) {
+        ::dup2(::open(output.c_str(), O_WRONLY | O_CREAT, 0600), STDOUT_FILENO);
+        ::execl(program.c_str(), program.c_str(), "--root", directory.c_str(), "--socket", socket.c_str(), "--plugin",
+                plugin.c_str(), "--log", "syslog", nullptr);
+        ::_exit(127);
+    }
+    ASSERT_GT(pid, 0);
+    for (int tries = 0; tries < 1000 && !fs::exists(socket); ++tries) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    EXPECT_EQ(UnixHttp(socket).post("/v1/fixture/stdout").status, 204);
+    ::kill(pid, SIGTERM);
+    int status = -1;
+    EXPECT_EQ(::waitpid(pid, &status, 0), pid);
+    EXPECT_EQ(status, 0);
+    std::ifstream file(output);
+    EXPECT_EQ(std::string(std::istreambuf_iterator<char>(file), {}), "a line on standard output\n");
 }
 
 TEST_F(Start, StaleSocketIsReplacedAndALiveOneIsAnError) {
