@@ -17,6 +17,8 @@
 namespace adminhost {
 namespace {
 
+constexpr std::size_t maximumLine = std::size_t{64} << 20U;  ///< bytes of a group with its members
+
 Error failure(const char* step, int number) {
     return Error{"posix", number, std::string(step) + ": " + std::generic_category().message(number)};
 }
@@ -78,15 +80,19 @@ std::optional<gid_t> groupIdOf(const char* name) {
     if (!file) {
         return std::nullopt;
     }
-    std::string buffer(std::size_t{1} << 16U, '\0');
+    std::string buffer(4096, '\0');
     group entry{};
     group* found = nullptr;
-    while (::fgetgrent_r(file.get(), &entry, buffer.data(), buffer.size(), &found) == 0) {
-        if (std::string_view(entry.gr_name) == name) {
+    for (;;) {
+        const int status = ::fgetgrent_r(file.get(), &entry, buffer.data(), buffer.size(), &found);
+        if (status == ERANGE && buffer.size() < maximumLine) {
+            buffer.resize(buffer.size() * 2);  // the reader stands at the line's beginning again
+        } else if (status != 0) {
+            return std::nullopt;
+        } else if (std::string_view(entry.gr_name) == name) {
             return entry.gr_gid;
         }
     }
-    return std::nullopt;
 }
 
 }  // namespace adminhost
