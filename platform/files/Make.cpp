@@ -74,7 +74,7 @@ std::optional<Error> makeEmptyFile(const DiskPath& path) {
 }
 
 std::optional<gid_t> groupIdOf(const char* name) {
-    const auto close = [](std::FILE* file) { std::fclose(file); };
+    const auto close = [](std::FILE* file) { static_cast<void>(std::fclose(file)); };
     const std::unique_ptr<std::FILE, decltype(close)> file(std::fopen(diskPath(HostPath("/etc/group")).c_str(), "re"),
                                                            close);
     if (!file) {

@@ -33,7 +33,6 @@ using testing::AllOf;
 using testing::Contains;
 using testing::ElementsAre;
 using testing::HasSubstr;
-using testing::IsEmpty;
 
 constexpr std::string_view identityFile = "/Library/Preferences/com.brenn.lumioserverd.plist";
 constexpr std::string_view clusterFile = "/shared/Server/cluster_preferences.plist";

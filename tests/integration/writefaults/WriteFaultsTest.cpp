@@ -58,7 +58,7 @@ class WriteFaults : public testing::Test {
         for (const auto& [name, count] : counts) {
             count.print(name.c_str());
         }
-        std::fflush(stdout);
+        static_cast<void>(std::fflush(stdout));
     }
 
     std::int32_t write(const std::vector<std::string>& options) { return service.writeTraced(options, logFile()); }

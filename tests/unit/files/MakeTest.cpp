@@ -61,7 +61,7 @@ TEST_F(Make, DirectoryThatExistsKeepsItsOwn) {
 }
 
 TEST_F(Make, FileInTheWayIsAnErrorWithTheSystemsText) {
-    std::ofstream(_directory / "file");
+    ASSERT_EQ(makeEmptyFile(path("file")), std::nullopt);
     for (const char* name : {"file", "file/below"}) {
         const auto error = makeDirectories(path(name), _mine);
         ASSERT_TRUE(error) << name;
