@@ -6,7 +6,9 @@
 #include <cstdio>
 #include <cstring>
 
-#include <endian.h>
+#ifdef __x86_64__
+#include <tmmintrin.h>
+#endif
 
 namespace lumio {
 namespace {
@@ -24,41 +26,143 @@ constexpr std::array<Pair, 4096> makePairs() {
 }
 constexpr std::array<Pair, 4096> pairs = makePairs();
 
-std::uint64_t bigEndianAt(const std::uint8_t* in) noexcept {
-    std::uint64_t bits = 0;
-    std::memcpy(&bits, in, sizeof bits);
-    return be64toh(bits);
+#ifdef __x86_64__
+const bool hasWideGroups = __builtin_cpu_supports("ssse3") != 0;
+
+/// Sixteen characters of twelve of the sixteen bytes: of the first twelve, or the last. Every step works on all at
+/// once.
+template <int first>
+__attribute__((target("ssse3"))) inline void encodeTwelve(const std::uint8_t* in, std::uint8_t* out) noexcept {
+    constexpr int o = first;
+    const __m128i bytes = _mm_loadu_si128(reinterpret_cast<const __m128i*>(in));
+    // Each group's bytes a, b, c become the two words ab and bc, which hold two characters' bits each.
+    const __m128i words =
+        _mm_shuffle_epi8(bytes, _mm_setr_epi8(o + 1, o, o + 2, o + 1, o + 4, o + 3, o + 5, o + 4, o + 7, o + 6, o + 8,
+                                              o + 7, o + 10, o + 9, o + 11, o + 10));
+    // Multiplying shifts each word by its own count.
+    const __m128i even = _mm_mulhi_epu16(_mm_and_si128(words, _mm_set1_epi32(0x0FC0FC00)), _mm_set1_epi32(0x04000040));
+    const __m128i odd = _mm_mullo_epi16(_mm_and_si128(words, _mm_set1_epi32(0x003F03F0)), _mm_set1_epi32(0x01000010));
+    const __m128i sextets = _mm_or_si128(even, odd);
+    // The alphabet's runs have a constant distance from value to character: 0 for a-z, 1 to 10 for the digits, 11 and
+    // 12 for + and /, 13 for A-Z.
+    const __m128i distances = _mm_setr_epi8('a' - 26, '0' - 52, '0' - 52, '0' - 52, '0' - 52, '0' - 52, '0' - 52,
+                                            '0' - 52, '0' - 52, '0' - 52, '0' - 52, '+' - 62, '/' - 63, 'A', 0, 0);
+    const __m128i capital = _mm_and_si128(_mm_cmpgt_epi8(_mm_set1_epi8(26), sextets), _mm_set1_epi8(13));
+    const __m128i run = _mm_or_si128(_mm_subs_epu8(sextets, _mm_set1_epi8(51)), capital);
+    const __m128i text = _mm_add_epi8(sextets, _mm_shuffle_epi8(distances, run));
+    _mm_storeu_si128(reinterpret_cast<__m128i*>(out), text);
 }
 
-/// Encodes a multiple of three bytes: two groups at a time out of eight bytes, of which the first six count.
-void encodeGroups(const std::uint8_t* in, std::size_t length, std::uint8_t* out) noexcept {
-    const std::uint8_t* const begin = in;
+/// The place in a text that is being made, with what may be read and written behind it.
+struct Place {
+    const std::uint8_t* in;
+    const std::uint8_t* inEnd;
+    std::uint8_t* out;
+    std::uint8_t* outEnd;
+};
+
+/// Encodes of so many bytes what can be encoded twelve at a time. Up to nine bytes more than asked for may be encoded:
+/// what follows is written over their characters. Answers how many of the bytes are left.
+__attribute__((target("ssse3"))) std::size_t encodeWideGroups(Place& at, std::size_t length) noexcept {
+    const std::uint8_t* in = at.in;
     const std::uint8_t* const end = in + length;
-    while (end - in >= 6) {
-        std::uint64_t bits = 0;
-        if (end - in >= 8) {
-            bits = bigEndianAt(in);
-        } else if (in != begin) {
-            bits = bigEndianAt(in - 2) << 16U;  // nothing behind the input is looked at
-        } else {
-            break;
-        }
-        std::memcpy(out, pairs[bits >> 52U].data(), 2);
-        std::memcpy(out + 2, pairs[(bits >> 40U) & 0xFFFU].data(), 2);
-        std::memcpy(out + 4, pairs[(bits >> 28U) & 0xFFFU].data(), 2);
-        std::memcpy(out + 6, pairs[(bits >> 16U) & 0xFFFU].data(), 2);
-        in += 6;
-        out += 8;
+    std::uint8_t* out = at.out;
+    for (; in < end && at.inEnd - in >= 16 && at.outEnd - out >= 16; in += 12, out += 16) {
+        encodeTwelve<0>(in, out);
     }
-    for (; in != end; in += 3, out += 4) {
-        const std::uint32_t group = (std::uint32_t{in[0]} << 16U) | (std::uint32_t{in[1]} << 8U) | in[2];
-        std::memcpy(out, pairs[group >> 12U].data(), 2);
-        std::memcpy(out + 2, pairs[group & 0xFFFU].data(), 2);
+    if (end - in >= 12 && in - at.in >= 4) {
+        encodeTwelve<4>(in - 4, out);
+        in += 12;
+        out += 16;
+    }
+    if (in > end) {
+        out -= (in - end) / 3 * 4;
+        in = end;
+    }
+    at.in = in;
+    at.out = out;
+    return static_cast<std::size_t>(end - in);
+}
+#endif
+
+/// Encodes that many bytes, a multiple of three, and moves behind them.
+void encodeGroups(Place& at, std::size_t length) noexcept {
+    std::size_t left = length;
+#ifdef __x86_64__
+    if (hasWideGroups) {
+        left = encodeWideGroups(at, length);
+    }
+#endif
+    for (; left > 0; left -= 3, at.in += 3, at.out += 4) {
+        const std::uint32_t group = (std::uint32_t{at.in[0]} << 16U) | (std::uint32_t{at.in[1]} << 8U) | at.in[2];
+        std::memcpy(at.out, pairs[group >> 12U].data(), 2);
+        std::memcpy(at.out + 2, pairs[group & 0xFFFU].data(), 2);
     }
 }
 
-void useComma(std::uint8_t* text, std::size_t length) noexcept {
-    std::replace(text, text + length, '/', ',');
+/// A text of so many characters that fits the buffer's first capacity is made without the buffer: most values are
+/// short, and it would take as long as their encoding.
+constexpr std::size_t shortText = 256;
+
+struct Layout {
+    std::size_t lineInput;   ///< bytes of a full line
+    std::size_t textLength;  ///< of the whole text
+};
+
+/// A line ends behind the first group that brings it to its limit of characters.
+constexpr std::size_t lineInputOf(std::size_t lineLimit) noexcept {
+    return (lineLimit + 3) / 4 * 3;
+}
+constexpr std::size_t brokenLineInput = lineInputOf(76);
+constexpr std::size_t unbrokenLineInput = lineInputOf(0x7FFFFFFF);
+
+Layout layoutOf(std::size_t length, const EncoderOptions& options) noexcept {
+    const std::size_t lineFeeds = options.lineBreaks ? length / brokenLineInput : length / unbrokenLineInput;
+    const std::size_t tail = length % 3;
+    const std::size_t tailLength = tail == 0 ? 0 : options.pad != 0 ? 4 : tail + 1;
+    return {options.lineBreaks ? brokenLineInput : unbrokenLineInput, length / 3 * 4 + lineFeeds + tailLength};
+}
+
+/// Writes the text, which is as long as its layout says.
+void encodeText(Bytes data, const EncoderOptions& options, const Layout& layout, std::uint8_t* out) noexcept {
+    Place at{data.data(), data.data() + data.size(), out, out + layout.textLength};
+    std::size_t left = data.size();
+    while (left >= 3) {
+        const std::size_t length = std::min(left - left % 3, layout.lineInput);
+        encodeGroups(at, length);
+        left -= length;
+        if (length == layout.lineInput) {
+            *at.out++ = '\n';
+        }
+    }
+    if (left > 0) {
+        const std::array<std::uint8_t, 3> last{at.in[0], left == 2 ? at.in[1] : std::uint8_t{0}, 0};
+        std::array<std::uint8_t, 4> group{};
+        Place tail{last.data(), last.data() + last.size(), group.data(), group.data() + group.size()};
+        encodeGroups(tail, last.size());
+        at.out = std::copy_n(group.begin(), left + 1, at.out);
+    }
+    if (!options.standardAlphabet) {
+        std::replace(out, at.out, '/', ',');
+    }
+    std::fill(at.out, at.outEnd, options.pad);
+}
+
+/// Encodes into a buffer that has no room for the whole text: it takes what it can, piece after piece.
+[[gnu::noinline]] void appendPieces(Bytes data, EncoderOptions options, std::size_t lineInput, ByteBuffer& buffer) {
+    options.lineBreaks = false;  // a piece never goes beyond its line
+    const std::size_t pieceInput = std::min<std::size_t>(lineInput, 3072);
+    for (std::size_t at = 0; at < data.size();) {
+        const Bytes piece = data.subspan(at, std::min({pieceInput, lineInput - at % lineInput, data.size() - at}));
+        const Layout layout = layoutOf(piece.size(), options);
+        std::array<std::uint8_t, 4096> text;
+        encodeText(piece, options, layout, text.data());
+        std::for_each_n(text.begin(), layout.textLength, [&](std::uint8_t c) { buffer.append(c); });
+        at += piece.size();
+        if (at % lineInput == 0) {
+            buffer.append('\n');
+        }
+    }
 }
 
 }  // namespace
@@ -77,52 +181,32 @@ void ByteBuffer::drop() noexcept {
 }
 
 adminhost::Data encodeBase64Data(Bytes data, const EncoderOptions& options) {
-    const std::size_t lineLimit = options.lineBreaks ? 76 : 0x7FFFFFFF;
-    // A line ends behind the first group that brings it to the limit.
-    const std::size_t lineInput = (lineLimit + 3) / 4 * 3;
-    ByteBuffer buffer(std::max<std::size_t>(4 * data.size() / 3, 1), options.growth);
-
-    const std::uint8_t* in = data.data();
-    std::size_t left = data.size();
-    while (left >= 3) {
-        const std::size_t length = std::min(left / 3 * 3, lineInput);
-        const std::size_t textLength = length / 3 * 4;
-        if (std::uint8_t* out = buffer.extend(textLength)) {
-            encodeGroups(in, length, out);
-            if (!options.standardAlphabet) {
-                useComma(out, textLength);
-            }
-        } else {
-            for (std::size_t i = 0; i < length; i += 3) {
-                std::uint8_t group[4];
-                encodeGroups(in + i, 3, group);
-                if (!options.standardAlphabet) {
-                    useComma(group, sizeof group);
-                }
-                std::for_each(std::begin(group), std::end(group), [&](std::uint8_t c) { buffer.append(c); });
-            }
-        }
-        in += length;
-        left -= length;
-        if (length == lineInput) {
-            buffer.append('\n');
-        }
+    const Layout layout = layoutOf(data.size(), options);
+    const std::size_t capacity = std::max<std::size_t>(4 * data.size() / 3, 1);
+    if (layout.textLength <= capacity && capacity <= shortText) {
+        adminhost::Data text(layout.textLength);
+        encodeText(data, options, layout, text.data());
+        return text;
     }
-    if (left > 0) {
-        const std::uint8_t last[3] = {in[0], left == 2 ? in[1] : std::uint8_t{0}, 0};
-        std::uint8_t group[4];
-        encodeGroups(last, 3, group);
-        if (!options.standardAlphabet) {
-            useComma(group, sizeof group);
-        }
-        for (std::size_t i = 0; i <= left; ++i) {
-            buffer.append(group[i]);
-        }
-        for (std::size_t i = left; i < 3 && options.pad != 0; ++i) {
-            buffer.append(options.pad);
-        }
+    ByteBuffer buffer(capacity, options.growth);
+    if (std::uint8_t* out = buffer.extend(layout.textLength)) {
+        encodeText(data, options, layout, out);
+        return std::move(buffer).take();
     }
+    appendPieces(data, options, layout.lineInput, buffer);
     return std::move(buffer).take();
+}
+
+std::string base64EncodedString(Bytes data) {
+    const EncoderOptions options;
+    const Layout layout = layoutOf(data.size(), options);
+    if (layout.textLength > options.growth.limit) {
+        const adminhost::Data text = LumioUtilities_encodeBase64(data);  // shortened
+        return {reinterpret_cast<const char*>(text.data()), text.size()};
+    }
+    std::string text(layout.textLength, '\0');
+    encodeText(data, options, layout, reinterpret_cast<std::uint8_t*>(text.data()));
+    return text;
 }
 
 }  // namespace lumio

@@ -19,11 +19,6 @@ adminhost::Data LumioUtilities_encodeBase64WithoutLineBreaks(Bytes data) {
     return encodeBase64Data(data, {.lineBreaks = false});
 }
 
-std::string base64EncodedString(Bytes data) {
-    const adminhost::Data text = LumioUtilities_encodeBase64(data);
-    return {reinterpret_cast<const char*>(text.data()), text.size()};
-}
-
 adminhost::Data base64DecodedData(std::string_view text) {
     return LumioUtilities_decodeBase64(bytesOf(text));
 }

@@ -105,7 +105,7 @@ void Dictionary::set(std::string_view key, Value value) {
     if (_entries.empty()) {
         _entries.reserve(8);  // most dictionaries have several entries, and moving them costs more than room for them
     }
-    _entries.emplace_back(std::string(key), std::move(value));
+    _entries.push_back({std::string(key), std::move(value)});
     if (_entries.size() == linearLimit + 1) {
         rebuildIndex();
     } else if (_entries.size() > linearLimit) {

@@ -139,14 +139,22 @@ TEST(Base64Encoder, OtherAlphabetWritesACommaForEverySlash) {
     EXPECT_EQ(text(encodeBase64Data(Data{0xFF, 0xFF}, {.standardAlphabet = false})), ",,8=");
 }
 
+TEST(Base64Encoder, OtherAlphabetLeavesThePadAsItIs) {
+    EXPECT_EQ(text(encodeBase64Data(Data{0xFF}, {.standardAlphabet = false, .pad = '/'})), ",w//");
+}
+
 TEST(Base64Encoder, PadZeroWritesNoPads) {
     EXPECT_EQ(text(encodeBase64Data(bytes("A"), {.pad = 0})), "QQ");
     EXPECT_EQ(text(encodeBase64Data(bytes("AB"), {.pad = 0})), "QUI");
 }
 
 TEST(Base64Encoder, StringIsTheWrappedText) {
-    const Data data = randomBytes(200);
-    EXPECT_EQ(base64EncodedString(data), text(LumioUtilities_encodeBase64(data)));
+    for (std::size_t length = 0; length < 400; ++length) {
+        const Data data = randomBytes(length, static_cast<unsigned>(length));
+        ASSERT_EQ(base64EncodedString(data), encodedByTheRules(data, true, true, '='));
+    }
+    const Data large = randomBytes(100000);
+    EXPECT_EQ(base64EncodedString(large), text(LumioUtilities_encodeBase64(large)));
     EXPECT_EQ(base64EncodedString({}), "");
 }
 
@@ -211,6 +219,20 @@ TEST(Base64Encoder, ShortenedTextIsTheBeginningOfTheWholeAtEveryLength) {
             const std::string out =
                 text(encodeBase64Data(data, {.standardAlphabet = standard, .growth = {.reserve = growthFails}}));
             ASSERT_EQ(out, whole.substr(0, std::max<std::size_t>(1, 4 * length / 3)));
+            ASSERT_EQ(log.lines.size(), whole.size() - out.size());
+        }
+    }
+}
+
+TEST(Base64Encoder, LongTextIsShortenedOnlyAtItsEndToo) {
+    for (const bool lineBreaks : {true, false}) {
+        for (const std::size_t length : {3071U, 3073U, 6144U, 6145U, 20000U}) {
+            CapturedLog log;
+            const Data data = randomBytes(length);
+            const std::string whole = encodedByTheRules(data, lineBreaks, true, '=');
+            const std::string out =
+                text(encodeBase64Data(data, {.lineBreaks = lineBreaks, .growth = {.reserve = growthFails}}));
+            ASSERT_EQ(out, whole.substr(0, 4 * length / 3)) << length;
             ASSERT_EQ(log.lines.size(), whole.size() - out.size());
         }
     }
