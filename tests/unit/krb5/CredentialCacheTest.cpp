@@ -414,6 +414,15 @@ TEST_F(CredentialCache, TwoCredentialsAreBothListedWithoutError) {
     EXPECT_EQ(credentials[1].serverPrincipal()->stringValue(), "host/localhost@NIMBO.TEST");
 }
 
+TEST_F(CredentialCache, ListingClosesTheFile) {
+    const auto cache = aliceWithTicket();
+    const int before = openDescriptors();
+    EXPECT_EQ(cache->credentials().size(), 1U);
+    std::filesystem::resize_file(path("cc"), std::filesystem::file_size(path("cc")) - 20);
+    EXPECT_TRUE(cache->credentials().empty());
+    EXPECT_EQ(openDescriptors(), before);
+}
+
 TEST_F(CredentialCache, ListingAgreesWithTheLibrarysTool) {
     const auto cache = aliceWithTicket();
     ASSERT_EQ(runTool({"/usr/bin/kvno", "-c", path("cc"), "host/localhost", "nimbo/admin"}).status, 0);

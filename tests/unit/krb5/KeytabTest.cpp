@@ -116,6 +116,36 @@ TEST_F(Keytab, AddedEntryKeepsKeyTypeAndVersion) {
     EXPECT_EQ(entries[0].nativeKeytabEntry().key.contents[31], 7);
 }
 
+TEST_F(Keytab, EntryIsACopyOfItsOwnWithTheMagicWord) {
+    std::array<krb5_octet, 4> key{1, 2, 3, 4};
+    const auto owner = principal("a/b@R");
+    krb5_keytab_entry native{};
+    native.magic = KV5M_KEYTAB_ENTRY;
+    native.principal = owner->nativePrincipal();
+    native.key.length = key.size();
+    native.key.contents = key.data();
+    const auto copy = KRB5KeytabEntry::initWithNativeKeytabEntry(native, _context);
+    ASSERT_NE(copy, nullptr);
+    EXPECT_EQ(copy->nativeKeytabEntry().magic, KV5M_KEYTAB_ENTRY);
+    EXPECT_NE(copy->nativeKeytabEntry().principal, native.principal);
+    EXPECT_NE(copy->nativeKeytabEntry().key.contents, native.key.contents);
+    key.fill(0);
+    EXPECT_EQ(copy->nativeKeytabEntry().key.contents[3], 4);
+    EXPECT_EQ(*copy->principal(), *owner);
+    EXPECT_NE(copy->principal()->nativePrincipal(), owner->nativePrincipal());
+    const auto* record = &copy->nativeKeytabEntry();
+    EXPECT_EQ(record, &copy->nativeKeytabEntry()) << "the record inside, not another copy";
+}
+
+TEST_F(Keytab, ListingClosesTheFile) {
+    write(path("kt"), support::keytabFile(3, 2));
+    const auto table = keytab();
+    const int before = openDescriptors();
+    EXPECT_EQ(table->entries().size(), 3U);
+    EXPECT_EQ(table->principals().size(), 2U);
+    EXPECT_EQ(openDescriptors(), before);
+}
+
 TEST_F(Keytab, UnknownEncryptionTypeIsNamedByItsNumber) {
     EXPECT_EQ(entry("a@R", 1, 9999)->enctypeString(), "enctype 9999");
     EXPECT_EQ(entry("a@R", 1, -135000)->enctypeString(), "enctype -135000");

@@ -2,6 +2,7 @@
 
 #include <cstdlib>
 #include <fstream>
+#include <iterator>
 
 namespace lumio {
 namespace {
@@ -68,6 +69,11 @@ void RealmTest::storeWithEnd(KRB5CredentialCache& cache, const KRB5Credential& c
 
 adminhost::test::ProgramResult runTool(const std::vector<std::string>& command, std::string_view input) {
     return adminhost::test::runProgram(command, adminhost::test::Errors::merge, input);
+}
+
+int openDescriptors() {
+    const std::filesystem::directory_iterator all("/proc/self/fd");
+    return static_cast<int>(std::distance(begin(all), end(all)));
 }
 
 std::string contentsOf(const std::string& path) {

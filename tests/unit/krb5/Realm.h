@@ -42,6 +42,8 @@ class RealmTest : public testing::Test {
 
 /// Runs a program with the present environment; its standard error goes into the output.
 adminhost::test::ProgramResult runTool(const std::vector<std::string>& command, std::string_view input = {});
+/// How many descriptors this process has open.
+int openDescriptors();
 std::string contentsOf(const std::string& path);
 void write(const std::string& path, const std::string& bytes);
 
