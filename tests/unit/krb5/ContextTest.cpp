@@ -133,6 +133,8 @@ TEST_F(Context, DefaultCacheIsNullUntilItHoldsAPrincipal) {
 
 TEST_F(Context, SetDefaultCredentialCacheTakesTheBareName) {
     const auto cache = cacheOf(*principal("alice"));
+    _context->setDefaultRealm(std::string(1, '\0'));
+    ASSERT_NE(_context->errorCode(), 0);
     _context->setDefaultCredentialCache(cache.get());
     EXPECT_EQ(_context->errorCode(), 0);
     EXPECT_EQ(std::string(krb5_cc_default_name(_context->nativeContext())), path("cc"));

@@ -366,6 +366,17 @@ TEST_F(CredentialCache, MissingFileIsReportedUnlessDestroyed) {
     EXPECT_EQ(cache->errorCode(), KRB5_FCC_NOFILE);
 }
 
+TEST_F(CredentialCache, DestroyedFileCacheWithAColonInItsPathIsNotReopened) {
+    // Without the type in front, the library takes what stands before the colon for one.
+    const auto alice = principal("alice");
+    const auto cache = cacheOf(*alice, "with:colon");
+    cache->destroy();
+    EXPECT_FALSE(std::filesystem::exists(path("with:colon")));
+    EXPECT_EQ(cache->errorCode(), KRB5_CC_UNKNOWN_TYPE);
+    EXPECT_EQ(cache->nativeCredentialCache(), nullptr);
+    EXPECT_TRUE(cache->credentials().empty());
+}
+
 TEST_F(CredentialCache, ReopeningThatGivesNeitherCacheNorErrorIsAGenericError) {
     const auto cache = aliceWithTicket();
     const ResolvingToNothing nothing;
