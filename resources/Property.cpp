@@ -2,6 +2,7 @@
 
 #include "codec/LumioCategories.h"
 #include "platform/bundle/Bundle.h"
+#include "platform/crypto/Crypt.h"
 #include "platform/log/Log.h"
 #include "platform/value/Text.h"
 #include "resources/WrappedRows.h"
@@ -24,6 +25,14 @@ using adminhost::Value;
 namespace {
 
 constexpr const char* localizationBundle = "/System/Library/SorvaneProducer/SorvaneProducerServerLocalizations.bundle";
+
+/// Wipes the text under "value".
+void cleanseValue(Dictionary& values) noexcept {
+    const Value* value = values.find("value");
+    if (value != nullptr && value->string() != nullptr) {
+        adminhost::cleanse(const_cast<char*>(value->string()->data()), value->string()->size());
+    }
+}
 
 /// The rows of a statement on the properties table, each whole.
 std::optional<std::vector<Dictionary>> propertyRows(const std::string& statement, std::optional<Error>& error) {
@@ -75,6 +84,14 @@ void Property::readRow(Dictionary row) {
     }
     if (_data->contains("id")) {
         _data->set("_id_", _data->get("id"));
+    }
+}
+
+Property::~Property() {
+    for (std::optional<Dictionary>* values : {&_data, &_changeValues}) {
+        if (*values) {
+            cleanseValue(**values);
+        }
     }
 }
 
@@ -198,6 +215,7 @@ std::optional<Error> Property::write() {
         if (!protectedValue) {
             return Error{"LumioPropertyCantEncryptValue", 1, std::nullopt};
         }
+        cleanseValue(working);
         working.set("value", std::move(*protectedValue));
     }
 

@@ -64,6 +64,12 @@ class Property final : public ResourceClass<Property> {
     [[nodiscard]] const std::optional<adminhost::Dictionary>& changeValues() const noexcept { return _changeValues; }
     void setChangeValues(std::optional<adminhost::Dictionary> values) { _changeValues = std::move(values); }
 
+    Property() = default;
+    Property(const Property&) = delete;
+    Property& operator=(const Property&) = delete;
+    /// Wipes the values: one may be the plain text of a protected one.
+    ~Property() override;
+
     [[nodiscard]] std::string_view resourceType() const noexcept override { return "property"; }
     /// The record as it is: properties have no access lists.
     [[nodiscard]] const adminhost::Dictionary* dictionary() override { return _data ? &*_data : nullptr; }

@@ -1,6 +1,7 @@
 #include "codec/LumioAESCategories.h"
 #include "handler/SettingsStore.h"
 #include "platform/crypto/Crypt.h"
+#include "platform/files/File.h"
 #include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/value/Text.h"
@@ -27,7 +28,11 @@ std::optional<Data> keyEncryptionKey() {
     const std::string path = textOf(sharedFilesystem) + "/Server/Secrets/kek.plist";
     std::optional<Value> file;
     if (!sharedFilesystem.isNull()) {
-        file = adminhost::readPropertyList(adminhost::diskPath(adminhost::HostPath(path)));
+        auto bytes = adminhost::readFile(adminhost::diskPath(adminhost::HostPath(path)), adminhost::plistMaximumSize);
+        if (bytes) {
+            const ScopedCleanse wipeFile(*bytes);
+            file = adminhost::parsePropertyList(*bytes);
+        }
     }
     if (!file || file->dictionary() == nullptr) {
         logEvent("failed to load " + path);

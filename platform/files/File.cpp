@@ -43,14 +43,16 @@ std::optional<std::string> readFile(const DiskPath& path, std::size_t maximum, E
         const std::size_t used = bytes.size();
         bytes.resize(used + room);
         const ssize_t count = ::read(file.get(), bytes.data() + used, room);
-        bytes.resize(used + (count > 0 ? static_cast<std::size_t>(count) : 0));
+        const std::size_t arrived = count > 0 ? static_cast<std::size_t>(count) : 0;
+        bytes.resize(used + arrived);
         if (count == 0) {
             return bytes;
         }
         if (count < 0 && errno != EINTR) {
             return fail(path, errno, error);
         }
-        room = 64UL << 10U;
+        // What room is left shows the end; only a file that grows meanwhile needs more, and with it another place.
+        room = room > arrived ? room - arrived : 64UL << 10U;
     }
 }
 

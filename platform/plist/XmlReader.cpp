@@ -173,6 +173,14 @@ class XmlReader {
         });
     }
 
+    XmlReader(const XmlReader&) = delete;
+    XmlReader& operator=(const XmlReader&) = delete;
+    /// The list may be a file of secrets.
+    ~XmlReader() {
+        _text.resize(_text.capacity());
+        ::explicit_bzero(_text.data(), _text.size());
+    }
+
     std::optional<Value> parse(std::string_view bytes, Error& error) {
         const auto status = ::XML_Parse(_parser.get(), bytes.data(), static_cast<int>(bytes.size()), XML_TRUE);
         if (_message.empty() && status != XML_STATUS_OK) {

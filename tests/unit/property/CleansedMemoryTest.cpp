@@ -1,0 +1,94 @@
+#include "tests/unit/property/PropertyFixture.h"
+
+#include <algorithm>
+#include <atomic>
+#include <cstdlib>
+#include <new>
+#include <string_view>
+
+#include <malloc.h>
+
+namespace {
+
+constexpr std::string_view plainText = "a plain text that nobody else is to see, longer than a string's own room";
+constexpr std::string_view secretBytes = "lumio-sample-key";
+constexpr std::string_view secretText = "bHVtaW8tc2FtcGxlLWtleQ==";
+
+std::atomic<bool> watching = false;
+std::atomic<int> seenInFreedMemory = 0;
+
+void lookThrough(const void* block) noexcept {
+    const std::string_view bytes(static_cast<const char*>(block), ::malloc_usable_size(const_cast<void*>(block)));
+    for (const std::string_view secret : {plainText, secretBytes, secretText}) {
+        seenInFreedMemory += bytes.find(secret) != std::string_view::npos ? 1 : 0;
+    }
+}
+
+void release(void* block) noexcept {
+    if (watching && block != nullptr) {
+        lookThrough(block);
+    }
+    std::free(block);
+}
+
+}  // namespace
+
+// This program's memory: what is given back is looked through first.
+void* operator new(std::size_t size) {
+    void* block = std::malloc(std::max<std::size_t>(size, 1));
+    return block != nullptr ? block : throw std::bad_alloc();
+}
+void operator delete(void* block) noexcept {
+    release(block);
+}
+void operator delete(void* block, std::size_t) noexcept {
+    release(block);
+}
+
+namespace lumio {
+namespace {
+
+class CleansedMemory : public PropertyFixture {
+  protected:
+    void TearDown() override { watching = false; }
+
+    template <class Work>
+    static int seenWhile(Work work) {
+        seenInFreedMemory = 0;
+        watching = true;
+        work();
+        watching = false;
+        return seenInFreedMemory;
+    }
+};
+
+TEST_F(CleansedMemory, WhatIsFreedUncleansedIsSeen) {
+    EXPECT_EQ(seenWhile([] { const std::string freed(plainText); }), 1);
+}
+
+TEST_F(CleansedMemory, ProtectingLeavesNeitherKeyNorPlainTextBehind) {
+    const Value plain(plainText);
+    std::optional<std::string> stored;
+    EXPECT_EQ(seenWhile([&] { stored = Property::encryptValue(plain); }), 0);
+    EXPECT_TRUE(stored);
+}
+
+TEST_F(CleansedMemory, ReadingLeavesNeitherKeyNorPlainTextBehind) {
+    const Value stored = *Property::encryptValue(plainText);
+    std::optional<std::string> plain;
+    EXPECT_EQ(seenWhile([&] { plain = Property::decryptValue(stored); }), 0);
+    EXPECT_EQ(plain, plainText);
+}
+
+TEST_F(CleansedMemory, WritingAProtectedPropertyLeavesNeitherBehind) {
+    Dictionary request{{"name", "n"}, {"value", plainText}, {"protect", true}};
+    EXPECT_EQ(seenWhile([&] { EXPECT_EQ(insert(request), std::nullopt); }), 0);
+    EXPECT_EQ(row("protect"), "t");
+    request.set("_id_", "1");
+    request.remove("protect");
+    EXPECT_EQ(seenWhile([&] { EXPECT_EQ(change(request), std::nullopt); }), 0);
+    EXPECT_EQ(Property::decryptValue(storedValue()), plainText);
+}
+
+}  // namespace
+}  // namespace lumio
