@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <functional>
+#include <memory>
 
 #include <fmt/format.h>
 #include <fmt/ranges.h>
@@ -248,10 +249,10 @@ std::optional<HttpAnswer> Front::head(const Exchange& exchange) {
     const bool stranger = !permitted(exchange.peer());
     if (answer && (stranger || exchange.method() == "POST")) {
         // Who may not ask is logged, but must not push what others asked for out of the daemon's memory.
-        RequestRecord& record = *(stranger ? History::begin(exchange) : _history.add(exchange));
-        record.plugin = address.plugin.substr(0, keptName);
-        record.command = address.command.substr(0, keptName);
-        close(record, *answer);
+        const std::shared_ptr<RequestRecord> record = stranger ? History::begin(exchange) : _history.add(exchange);
+        record->plugin = address.plugin.substr(0, keptName);
+        record->command = address.command.substr(0, keptName);
+        close(*record, *answer);
     }
     return answer;
 }
