@@ -34,8 +34,11 @@ void release(void* block) noexcept {
 }  // namespace
 
 // This program's memory: what is given back is looked through first.
+void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
+    return std::malloc(std::max<std::size_t>(size, 1));
+}
 void* operator new(std::size_t size) {
-    void* block = std::malloc(std::max<std::size_t>(size, 1));
+    void* block = ::operator new(size, std::nothrow);
     return block != nullptr ? block : throw std::bad_alloc();
 }
 void operator delete(void* block) noexcept {
