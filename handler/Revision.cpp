@@ -6,22 +6,50 @@
 #include "platform/value/Text.h"
 #include "resources/QueryRunner.h"
 
+#include <array>
+
 namespace lumio {
 
 namespace {
 
-/// One statement for all resources, so that a revision costs one start of the tool. Texts that may hold line feeds or
-/// separators travel as hexadecimal digits.
-constexpr const char* resourcesStatement =
-    "select 'camera' as kind, hex(uuid) as a, hex(name) as b, access_control_enabled as c, disabled as d from cameras "
-    "union all select 'workflow', hex(uuid), hex(bundle_path), access_control_enabled, disabled from workflows "
-    "union all select 'access', hex(record_uuid), hex(resource_type), resource_id, '' from access_control_entries "
-    "union all select 'property', hex(name), hex(value), protect, id from properties order by 1,2,3,4,5";
+/// What there is of each kind. Texts that may hold line feeds or separators travel as hexadecimal digits.
+constexpr std::array<std::string_view, 4> selections = {
+    "select 'camera' as kind, hex(uuid) as a, hex(name) as b, access_control_enabled as c, disabled as d from cameras",
+    "select 'workflow' as kind, hex(uuid) as a, hex(bundle_path) as b, access_control_enabled as c, disabled as d "
+    "from workflows",
+    "select 'access' as kind, hex(record_uuid) as a, hex(resource_type) as b, resource_id as c, '' as d "
+    "from access_control_entries",
+    "select 'property' as kind, hex(name) as a, hex(value) as b, protect as c, id as d from properties"};
 
 void append(std::string& text, std::string_view part) {
     text += std::to_string(part.size());
     text += ':';
     text += part;
+}
+
+bool appendRows(std::string& text, std::string_view selection) {
+    std::optional<adminhost::Error> error;
+    const auto rows = runStatement(std::string(selection) + " order by 1,2,3,4,5", error);
+    if (!rows) {
+        return false;
+    }
+    for (const adminhost::Dictionary& row : *rows) {
+        append(text, textOf(row));
+    }
+    return true;
+}
+
+/// All resources in one start of the tool. Where one table is missing, the others still count, each by itself.
+void appendResources(std::string& text) {
+    std::string all;
+    for (const std::string_view selection : selections) {
+        all.append(all.empty() ? "" : " union all ").append(selection);
+    }
+    if (!appendRows(text, all)) {
+        for (const std::string_view selection : selections) {
+            append(text, appendRows(text, selection) ? "" : "unreadable");
+        }
+    }
 }
 
 }  // namespace
@@ -33,14 +61,7 @@ std::string settingsRevision() {
         append(everything, prefs ? adminhost::xmlPropertyList(*prefs).value_or("") : "");
     }
     if (SettingsStore::dbPathExists()) {
-        std::optional<adminhost::Error> error;
-        if (const auto rows = runStatement(resourcesStatement, error)) {
-            for (const adminhost::Dictionary& row : *rows) {
-                append(everything, textOf(row));
-            }
-        } else {
-            append(everything, textOf(error));
-        }
+        appendResources(everything);
     }
     return adminhost::sha256Of(everything).substr(0, 32);
 }
