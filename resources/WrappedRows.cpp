@@ -23,7 +23,11 @@ bool isPiece(const std::string& key, const std::string& line) {
 }
 
 bool hasColumnsOnly(const Dictionary& record) {
-    return std::all_of(record.begin(), record.end(), [](const DictionaryEntry& entry) { return isColumn(entry.key); });
+    const std::vector<std::string>& columns = Property::tableColumnNames();
+    // Nearly every record is a whole row, with its columns in the table's order.
+    const auto sameKey = [](const DictionaryEntry& entry, const std::string& column) { return entry.key == column; };
+    return std::equal(record.begin(), record.end(), columns.begin(), columns.end(), sameKey) ||
+           std::all_of(record.begin(), record.end(), [](const DictionaryEntry& entry) { return isColumn(entry.key); });
 }
 
 /// One row being put together from its records.
