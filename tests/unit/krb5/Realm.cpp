@@ -55,6 +55,13 @@ std::unique_ptr<KRB5CredentialCache> RealmTest::cacheOf(const KRB5Principal& pri
     return cache;
 }
 
+std::unique_ptr<KRB5CredentialCache> RealmTest::aliceWithTicket() const {
+    auto cache = cacheOf(*principal("alice"));
+    cache->acquireInitialCredentialWithPassword(alicePassword);
+    EXPECT_EQ(cache->errorCode(), 0) << cache->errorMessage();
+    return cache;
+}
+
 std::unique_ptr<KRB5Principal> RealmTest::principal(const std::string& text) const {
     return KRB5Principal::initWithString(text, _context);
 }

@@ -31,6 +31,8 @@ class RealmTest : public testing::Test {
     /// A new file cache bound to the principal.
     [[nodiscard]] std::unique_ptr<KRB5CredentialCache> cacheOf(const KRB5Principal& principal,
                                                                const std::string& name = "cc") const;
+    /// The same for alice, with her ticket in it.
+    [[nodiscard]] std::unique_ptr<KRB5CredentialCache> aliceWithTicket() const;
     [[nodiscard]] std::unique_ptr<KRB5Principal> principal(const std::string& text) const;
     /// A copy of the credential, with another end time, stored as the only one of the cache.
     void storeWithEnd(KRB5CredentialCache& cache, const KRB5Credential& credential, krb5_timestamp end) const;
