@@ -14,8 +14,6 @@ namespace {
 
 using Words = std::span<const std::string>;
 
-constexpr std::string_view passwordKey = "nimbo_client_password";
-
 std::optional<std::string> second(Words arguments) {
     return arguments.size() > 1 ? std::optional(arguments[1]) : std::nullopt;
 }

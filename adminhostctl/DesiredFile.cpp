@@ -14,8 +14,6 @@
 namespace adminhost::ctl {
 namespace {
 
-constexpr std::string_view passwordKey = "nimbo_client_password";
-
 constexpr std::string_view introduction =
     "# The desired state: \"adminhostctl plan FILE\" shows what would change, \"adminhostctl apply FILE\" changes it.\n"
     "# What is not listed stays as it is, unless a switch here says otherwise.\n"

@@ -138,7 +138,7 @@ ExitStatus rollback(const Context& context, std::span<const std::string> argumen
     wanted.lookUpController = true;
     const bool changes = !planOf(wanted, current.state).changes.empty();
     const ExitStatus status = carryOut(context, wanted, current);
-    if (changes && settings.contains("nimbo_client_password")) {
+    if (changes && settings.contains(passwordKey)) {
         context.err << "The grid password stays as it is: a stored password cannot be written back.\n";
     }
     for (const std::string& key : staying) {

@@ -12,8 +12,6 @@ namespace adminhost::ctl {
 namespace {
 
 constexpr std::string_view secret = "(secret)";
-constexpr std::string_view passwordKey = "nimbo_client_password";
-constexpr std::string_view controllerKey = "nimbo_controller";
 /// Where the other settings files lie: with one of these changed, they are other files.
 constexpr std::array<std::string_view, 2> placeKeys = {"shared_filesystem", "member_uuid"};
 constexpr std::array<std::string_view, 2> restartKeys = {"shared_filesystem", "nimbo_client_username"};

@@ -6,9 +6,14 @@
 
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace adminhost::ctl {
+
+// Settings that are no plain values: one is written and never answered, one may be looked up.
+inline constexpr std::string_view passwordKey = "nimbo_client_password";
+inline constexpr std::string_view controllerKey = "nimbo_controller";
 
 /// An entry of an access list that the directory knows.
 struct Person {

@@ -39,11 +39,11 @@ void showLine(std::ostream& out, const Change& change) {
 }
 
 void sayResolved(const Context& context, const Wanted& wanted, const State& after) {
-    const Value& name = wanted.settings.get("nimbo_controller");
+    const Value& name = wanted.settings.get(controllerKey);
     if (!wanted.lookUpController || name.string() == nullptr || !isLookedUp(*name.string())) {
         return;
     }
-    const Value& stored = after.settings.get("nimbo_controller");
+    const Value& stored = after.settings.get(controllerKey);
     context.err << (stored == name ? "the name was not found on the local network and is stored as it stands"
                                    : "the name was resolved to " + tomlValue(stored).value_or("nothing"))
                 << '\n';
