@@ -1,1 +1,1 @@
-set(FUZZ_LIBS lumio)
+set(FUZZ_LIBS handler)

@@ -1,8 +1,8 @@
 // What the database tool might print: its rows are those of a second, plainer reading, and putting property rows
 // together again neither makes rows up nor loses a record's columns.
 
-#include "resources/QueryRunner.h"
 #include "resources/WrappedRows.h"
+#include "settings/QueryRunner.h"
 
 #include <cstdint>
 #include <cstdlib>

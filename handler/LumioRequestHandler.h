@@ -6,10 +6,10 @@
 // built and reports failure inside the answer. Nothing is kept between requests. Every diagnostic
 // line starts with "adminhost_lumio: ". Each operation is written in the source file of its group.
 
-#include "handler/SettingsStore.h"
 #include "platform/framework/PluginRequestHandler.h"
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
+#include "settings/SettingsStore.h"
 
 #include <cstdint>
 #include <optional>
@@ -57,7 +57,7 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     [[nodiscard]] Response validateSettingsWithRequest(const Dictionary& request);
     [[nodiscard]] Response createNimboAccountWithRequest(const Dictionary& request);
 
-    // Resources (resources/ResourceRequests.cpp)
+    // Resources (ResourceRequests.cpp)
 
     /// "command", the list and "readStatus" 0; on failure only "readStatus", the error's code.
     [[nodiscard]] Response getWorkflowsWithRequest(const Dictionary& request);

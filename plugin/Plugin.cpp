@@ -4,8 +4,8 @@
 
 #include "commands/CommandTable.h"
 #include "handler/LumioRequestHandler.h"
-#include "handler/Revision.h"
 #include "platform/log/Log.h"
+#include "settings/Revision.h"
 
 #include <algorithm>
 #include <exception>

@@ -1,11 +1,11 @@
 #include "codec/LumioAESCategories.h"
-#include "handler/SettingsStore.h"
 #include "platform/crypto/Crypt.h"
 #include "platform/files/File.h"
 #include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/value/Text.h"
 #include "resources/Property.h"
+#include "settings/SettingsStore.h"
 
 namespace lumio {
 

@@ -8,7 +8,7 @@
 
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
-#include "resources/QueryRunner.h"
+#include "settings/QueryRunner.h"
 
 #include <concepts>
 #include <memory>

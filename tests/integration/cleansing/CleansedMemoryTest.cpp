@@ -1,7 +1,7 @@
 // Whether memory that is given back still holds a key or a plain text. The program has its own new and delete for it
 // and looks at whole blocks, written or not, so it is none of the unit programs, which also run below valgrind.
 
-#include "tests/unit/property/PropertyFixture.h"
+#include "tests/unit/resources/PropertyFixture.h"
 
 #include <algorithm>
 #include <atomic>

@@ -1,1 +1,1 @@
-set(TEST_LIBS lumio)
+set(TEST_LIBS handler)

@@ -1,1 +1,1 @@
-set(TEST_LIBS lumio host)
+set(TEST_LIBS handler host)

@@ -46,13 +46,13 @@ TEST_F(IncludeEdges, TheProjectHasOnlyThoseOfThePicture) {
 
 TEST_F(IncludeEdges, EachRefusedEdgeIsNamedWithFileAndLine) {
     const std::pair<const char*, const char*> edges[] = {
-        {"platform/value/Value.cpp", "handler/SettingsStore.h"},
+        {"platform/value/Value.cpp", "settings/SettingsStore.h"},
         {"codec/Base64.cpp", "krb5/Context.h"},
         {"resources/Camera.cpp", "handler/LumioRequestHandler.h"},
-        {"handler/SettingsStore.cpp", "resources/Camera.h"},
-        {"handler/SettingsStore.h", "handler/LumioRequestHandler.h"},
+        {"settings/SettingsStore.cpp", "resources/Camera.h"},
+        {"settings/SettingsStore.h", "handler/LumioRequestHandler.h"},
         {"adminhostd/Main.cpp", "plugin/Commands.h"},
-        {"adminhostd/Main.cpp", "handler/SettingsStore.h"},
+        {"adminhostd/Main.cpp", "settings/SettingsStore.h"},
         {"adminhostctl/Main.cpp", "platform/task/Task.h"},
         {"adminhostctl/Main.cpp", "adminhostd/Frame.h"},
         {"commands/Commands.cpp", "handler/LumioRequestHandler.h"},
@@ -70,9 +70,9 @@ TEST_F(IncludeEdges, EdgesOfThePictureAreAccepted) {
     const std::pair<const char*, const char*> edges[] = {
         {"plugin/Plugin.cpp", "handler/LumioRequestHandler.h"},
         {"handler/ReadSettings.cpp", "resources/Camera.h"},
-        {"resources/Camera.cpp", "handler/SettingsStore.h"},
-        {"resources/ResourceRequests.cpp", "handler/LumioRequestHandler.h"},
-        {"handler/SettingsStore.cpp", "platform/plist/PropertyList.h"},
+        {"resources/Camera.cpp", "settings/SettingsStore.h"},
+        {"handler/ResourceRequests.cpp", "resources/Property.h"},
+        {"settings/SettingsStore.cpp", "platform/plist/PropertyList.h"},
         {"adminhostctl/Main.cpp", "platform/value/Value.h"},
         {"adminhostd/Main.cpp", "platform/log/Log.h"},
         {"tests/unit/x/Test.cpp", "plugin/Plugin.h"},

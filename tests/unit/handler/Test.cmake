@@ -1,1 +1,1 @@
-set(TEST_LIBS lumio commands)
+set(TEST_LIBS handler commands)

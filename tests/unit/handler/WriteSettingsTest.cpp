@@ -1,8 +1,8 @@
-#include "handler/Revision.h"
 #include "platform/dnssd/EventLoop.h"
 #include "platform/dnssd/NetService.h"
 #include "platform/value/Text.h"
 #include "resources/Property.h"
+#include "settings/Revision.h"
 #include "tests/unit/handler/WriteSettingsFixture.h"
 
 namespace lumio {

@@ -1,6 +1,6 @@
-#include "handler/SettingsStore.h"
-#include "resources/QueryRunner.h"
 #include "resources/Resource.h"
+#include "settings/QueryRunner.h"
+#include "settings/SettingsStore.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <chrono>

@@ -1,6 +1,6 @@
 #include "handler/LumioRequestHandler.h"
 #include "platform/value/Text.h"
-#include "tests/unit/property/PropertyFixture.h"
+#include "tests/unit/resources/PropertyFixture.h"
 
 namespace lumio {
 namespace {

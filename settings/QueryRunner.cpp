@@ -1,7 +1,7 @@
-#include "resources/QueryRunner.h"
+#include "settings/QueryRunner.h"
 
-#include "handler/SettingsStore.h"
 #include "platform/task/Task.h"
+#include "settings/SettingsStore.h"
 
 namespace lumio {
 

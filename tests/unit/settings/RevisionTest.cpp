@@ -1,4 +1,4 @@
-#include "handler/Revision.h"
+#include "settings/Revision.h"
 #include "tests/unit/handler/WriteSettingsFixture.h"
 
 namespace lumio {

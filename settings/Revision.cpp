@@ -1,10 +1,10 @@
-#include "handler/Revision.h"
+#include "settings/Revision.h"
 
-#include "handler/SettingsStore.h"
 #include "platform/crypto/Digest.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/value/Text.h"
-#include "resources/QueryRunner.h"
+#include "settings/QueryRunner.h"
+#include "settings/SettingsStore.h"
 
 #include <array>
 

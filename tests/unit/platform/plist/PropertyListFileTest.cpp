@@ -1,4 +1,4 @@
-#include "tests/unit/plist/PlistTestSupport.h"
+#include "tests/unit/platform/plist/PlistTestSupport.h"
 
 #include <gmock/gmock.h>
 #include <sys/stat.h>

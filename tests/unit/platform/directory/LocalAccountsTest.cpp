@@ -2,7 +2,7 @@
 #include "platform/directory/Entries.h"
 #include "platform/directory/LocalAccounts.h"
 #include "platform/directory/Uuid.h"
-#include "tests/unit/directory/TemporaryAccounts.h"
+#include "tests/unit/platform/directory/TemporaryAccounts.h"
 
 #include <algorithm>
 

@@ -1,5 +1,5 @@
-#include "handler/SettingsStore.h"
 #include "platform/value/Value.h"
+#include "settings/SettingsStore.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <filesystem>

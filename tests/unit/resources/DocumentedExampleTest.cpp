@@ -1,4 +1,4 @@
-#include "tests/unit/property/PropertyFixture.h"
+#include "tests/unit/resources/PropertyFixture.h"
 
 #include <fstream>
 #include <iterator>

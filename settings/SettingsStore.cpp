@@ -1,4 +1,4 @@
-#include "handler/SettingsStore.h"
+#include "settings/SettingsStore.h"
 
 #include "platform/files/File.h"
 #include "platform/plist/PropertyList.h"

@@ -1,7 +1,7 @@
 #include "platform/directory/Entries.h"
 #include "platform/directory/Membership.h"
 #include "platform/directory/Uuid.h"
-#include "tests/unit/directory/TemporaryAccounts.h"
+#include "tests/unit/platform/directory/TemporaryAccounts.h"
 
 #include <gmock/gmock.h>
 

@@ -1,5 +1,5 @@
 #include "platform/value/Text.h"
-#include "tests/unit/property/PropertyFixture.h"
+#include "tests/unit/resources/PropertyFixture.h"
 
 #include <filesystem>
 

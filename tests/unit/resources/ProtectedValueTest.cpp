@@ -1,5 +1,5 @@
 #include "resources/WrappedRows.h"
-#include "tests/unit/property/PropertyFixture.h"
+#include "tests/unit/resources/PropertyFixture.h"
 
 #include <algorithm>
 #include <filesystem>
