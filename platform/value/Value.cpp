@@ -14,7 +14,7 @@ const Value nullValue;
 
 }  // namespace
 
-/// Where each key's entry stands.
+/// The place of each key's entry.
 struct Dictionary::Index {
     struct Hash {
         using is_transparent = void;
@@ -34,9 +34,9 @@ Dictionary& Dictionary::operator=(const Dictionary& other) {
 Dictionary& Dictionary::operator=(Dictionary&&) noexcept = default;
 Dictionary::~Dictionary() = default;
 
-Dictionary::Dictionary(std::initializer_list<DictionaryEntry> entries) {
-    for (const DictionaryEntry& entry : entries) {
-        set(entry.key, entry.value);
+Dictionary::Dictionary(std::initializer_list<GivenEntry> entries) {
+    for (const GivenEntry& entry : entries) {
+        set(entry.key, std::move(entry.value));
     }
 }
 
@@ -74,6 +74,11 @@ Value* Dictionary::find(std::string_view key) noexcept {
 const Value& Dictionary::get(std::string_view key) const noexcept {
     const Value* value = find(key);
     return value == nullptr ? nullValue : *value;
+}
+
+std::string_view Dictionary::text(std::string_view key) const noexcept {
+    const std::string* string = get(key).string();
+    return string == nullptr ? std::string_view() : std::string_view(*string);
 }
 
 const Value& Dictionary::at(std::string_view keyPath) const noexcept {

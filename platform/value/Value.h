@@ -21,12 +21,13 @@ namespace adminhost {
 
 class Value;
 struct DictionaryEntry;
+struct GivenEntry;
 
 using Data = std::vector<std::uint8_t>;
 using Date = std::chrono::sys_seconds;  ///< seconds since 1970-01-01T00:00:00Z, the resolution of a property list
 using Array = std::vector<Value>;
 
-/// String-keyed values in insertion order. A key stands at most once, and never with a null value: storing null
+/// String-keyed values in insertion order. Each key is there at most once, and never with a null value: storing null
 /// removes the key. Look-up takes constant time however many keys there are; removal is linear.
 /// Iterators and pointers to values are invalidated by every change.
 class Dictionary {
@@ -34,7 +35,9 @@ class Dictionary {
     using const_iterator = std::vector<DictionaryEntry>::const_iterator;
 
     Dictionary() noexcept;
-    Dictionary(std::initializer_list<DictionaryEntry> entries);
+    /// `Dictionary{{"key", value}, ...}`. The values are moved into the dictionary: std::move() in the list copies
+    /// nothing. A later entry replaces an earlier one of the same key; one with a null value removes it.
+    Dictionary(std::initializer_list<GivenEntry> entries);
     Dictionary(const Dictionary&);
     Dictionary(Dictionary&&) noexcept;
     Dictionary& operator=(const Dictionary&);
@@ -47,12 +50,15 @@ class Dictionary {
     [[nodiscard]] bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
     /// The value under the key; a null Value (of static life) if there is none.
     [[nodiscard]] const Value& get(std::string_view key) const noexcept;
+    /// The text of the string under the key; empty if there is no value under it or one of another type. Converts
+    /// nothing. Refers to the value in the dictionary, so it is valid only as long as a pointer from find() is.
+    [[nodiscard]] std::string_view text(std::string_view key) const noexcept;
     /// Follows a key path ("optionalArguments.variant") through nested dictionaries; a null Value where it ends early.
     [[nodiscard]] const Value& at(std::string_view keyPath) const noexcept;
 
     /// Stores the value; an existing key keeps its place. A null value removes the key.
     void set(std::string_view key, Value value);
-    /// Removes the key if it is there; answers whether it was.
+    /// Removes the key. Returns false if it is not there.
     bool remove(std::string_view key);
     void clear() noexcept;
 
@@ -112,11 +118,11 @@ class Value {
     [[nodiscard]] bool isNull() const noexcept { return std::holds_alternative<std::monostate>(_value); }
     [[nodiscard]] bool isInteger() const noexcept { return type() == Type::integer; }
 
-    // Each answers null (or nothing) when the value is of another type; none converts.
+    // Each returns null (or nullopt) if the value is of another type; none converts.
     [[nodiscard]] std::optional<bool> boolean() const noexcept;
-    /// Nothing also for an integer above the signed range.
+    /// Also nullopt for an integer above the signed range.
     [[nodiscard]] std::optional<std::int64_t> integer() const noexcept;
-    /// Nothing for a negative integer.
+    /// Also nullopt for a negative integer.
     [[nodiscard]] std::optional<std::uint64_t> unsignedInteger() const noexcept;
     [[nodiscard]] std::optional<double> real() const noexcept;
     [[nodiscard]] std::optional<Date> date() const noexcept;
@@ -139,6 +145,13 @@ struct DictionaryEntry {
     Value value;
 
     friend bool operator==(const DictionaryEntry&, const DictionaryEntry&) = default;
+};
+
+/// One entry of a list that initialises a dictionary. The elements of a std::initializer_list are constant, and only a
+/// mutable member can be moved out of them. A list is therefore good for one dictionary: write it in place.
+struct GivenEntry {
+    std::string_view key;
+    mutable Value value;
 };
 
 /// The name of a type as messages to people use it: "text", "dictionary", "whole number", ...

@@ -63,6 +63,50 @@ TEST(Dictionary, StoringNullRemovesTheKey) {
     EXPECT_EQ(d.size(), 1U);
 }
 
+TEST(Dictionary, ListOfEntriesMovesItsValues) {
+    Value text(std::string(100, 't'));
+    Value data(Data(100));
+    Value array(Array{1, 2, 3});
+    Value inner(Dictionary{{"deep", std::string(100, 'd')}});
+    const char* textBytes = text.string()->data();
+    const std::uint8_t* dataBytes = data.data()->data();
+    const Value* elements = array.array()->data();
+    const DictionaryEntry* entries = &*inner.dictionary()->begin();
+
+    const Dictionary d{{"text", std::move(text)},
+                       {"data", std::move(data)},
+                       {"array", std::move(array)},
+                       {"outer", Dictionary{{"inner", std::move(inner)}}}};
+
+    // A copy would be at another address.
+    EXPECT_EQ(d.get("text").string()->data(), textBytes);
+    EXPECT_EQ(d.get("data").data()->data(), dataBytes);
+    EXPECT_EQ(d.get("array").array()->data(), elements);
+    EXPECT_EQ(&*d.at("outer.inner").dictionary()->begin(), entries);
+    EXPECT_EQ(d.at("outer.inner.deep"), Value(std::string(100, 'd')));
+}
+
+TEST(Dictionary, ListOfEntriesLeavesTheCallersValuesWhereTheyAreNotMoved) {
+    const std::string key = "k" + std::string(100, 'e');
+    const Value value("v");
+    const Dictionary d{{key, value}, {"twice", 1}, {"twice", 2}, {"null", nullptr}, {key + "2", value}};
+    EXPECT_EQ(value, Value("v"));
+    EXPECT_EQ(d.get(key), value);
+    EXPECT_EQ(d.get(key + "2"), value);
+    EXPECT_EQ(d.get("twice"), Value(2));
+    EXPECT_EQ(d.size(), 3U);
+}
+
+TEST(Dictionary, TextOfAKeyIsEmptyUnlessItsValueIsAString) {
+    const Dictionary d{{"text", std::string("a\0b", 3)}, {"empty", ""}, {"number", 1}, {"data", Data{'x'}}};
+    EXPECT_EQ(d.text("text"), std::string_view("a\0b", 3));
+    EXPECT_EQ(d.text("text").data(), d.get("text").string()->data());
+    EXPECT_EQ(d.text("empty"), "");
+    EXPECT_EQ(d.text("number"), "");
+    EXPECT_EQ(d.text("data"), "");
+    EXPECT_EQ(d.text("missing"), "");
+}
+
 TEST(Dictionary, FollowsKeyPathsAndAnswersNullWhereTheyEndEarly) {
     const Dictionary d{{"optionalArguments", Dictionary{{"variant", "getConfig"}}}, {"text", "x"}};
     EXPECT_EQ(d.at("optionalArguments.variant"), Value("getConfig"));
