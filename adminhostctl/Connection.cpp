@@ -29,16 +29,16 @@ struct FreeText {
 }  // namespace
 
 /// Owns the transfer handle.
-class Connection::Handle {
+class Connection::Transfer {
   public:
-    Handle() : _curl(curl_easy_init()) {
+    Transfer() : _curl(curl_easy_init()) {
         if (_curl == nullptr) {
             throw std::bad_alloc();
         }
     }
-    ~Handle() { curl_easy_cleanup(_curl); }
-    Handle(const Handle&) = delete;
-    Handle& operator=(const Handle&) = delete;
+    ~Transfer() { curl_easy_cleanup(_curl); }
+    Transfer(const Transfer&) = delete;
+    Transfer& operator=(const Transfer&) = delete;
 
     [[nodiscard]] CURL* get() const noexcept { return _curl; }
     template <typename T>
@@ -51,20 +51,20 @@ class Connection::Handle {
 };
 
 Connection::Connection(std::string socketPath)
-    : _socketPath(std::move(socketPath)), _handle(std::make_unique<Handle>()) {}
+    : _socketPath(std::move(socketPath)), _transfer(std::make_unique<Transfer>()) {}
 Connection::~Connection() = default;
 Connection::Connection(Connection&&) noexcept = default;
 Connection& Connection::operator=(Connection&&) noexcept = default;
 
-HttpAnswer Connection::get(const std::string& path) {
+DaemonReply Connection::get(const std::string& path) {
     return send(path, nullptr, {});
 }
-HttpAnswer Connection::post(const std::string& path, const std::string& body, const std::string& revision) {
+DaemonReply Connection::post(const std::string& path, const std::string& body, const std::string& revision) {
     return send(path, &body, revision);
 }
 
-HttpAnswer Connection::send(const std::string& path, const std::string* body, const std::string& revision) {
-    HttpAnswer answer;
+DaemonReply Connection::send(const std::string& path, const std::string* body, const std::string& revision) {
+    DaemonReply answer;
     const std::string address = "http://localhost" + path;
     // Without an empty Expect header, larger bodies would wait for a permission that the daemon need not give.
     HeaderList headers(curl_slist_append(nullptr, "Content-Type: application/json"));
@@ -74,25 +74,25 @@ HttpAnswer Connection::send(const std::string& path, const std::string* body, co
         curl_slist_append(headers.get(), ("If-Match: " + revision).c_str());
     }
 
-    curl_easy_reset(_handle->get());
-    _handle->set(CURLOPT_UNIX_SOCKET_PATH, _socketPath.c_str());
-    _handle->set(CURLOPT_URL, address.c_str());
-    _handle->set(CURLOPT_PROTOCOLS_STR, "http");
-    _handle->set(CURLOPT_NOPROXY, "*");
-    _handle->set(CURLOPT_NOSIGNAL, 1L);
-    _handle->set(CURLOPT_CONNECTTIMEOUT, 10L);
-    _handle->set(CURLOPT_HTTPHEADER, headers.get());
-    _handle->set(CURLOPT_WRITEFUNCTION, &append);
-    _handle->set(CURLOPT_WRITEDATA, &answer.body);
+    curl_easy_reset(_transfer->get());
+    _transfer->set(CURLOPT_UNIX_SOCKET_PATH, _socketPath.c_str());
+    _transfer->set(CURLOPT_URL, address.c_str());
+    _transfer->set(CURLOPT_PROTOCOLS_STR, "http");
+    _transfer->set(CURLOPT_NOPROXY, "*");
+    _transfer->set(CURLOPT_NOSIGNAL, 1L);
+    _transfer->set(CURLOPT_CONNECTTIMEOUT, 10L);
+    _transfer->set(CURLOPT_HTTPHEADER, headers.get());
+    _transfer->set(CURLOPT_WRITEFUNCTION, &append);
+    _transfer->set(CURLOPT_WRITEDATA, &answer.body);
     if (body != nullptr) {
-        _handle->set(CURLOPT_POST, 1L);
-        _handle->set(CURLOPT_POSTFIELDS, body->data());
-        _handle->set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body->size()));
+        _transfer->set(CURLOPT_POST, 1L);
+        _transfer->set(CURLOPT_POSTFIELDS, body->data());
+        _transfer->set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body->size()));
     }
-    const CURLcode result = curl_easy_perform(_handle->get());
+    const CURLcode result = curl_easy_perform(_transfer->get());
     if (result != CURLE_OK) {
         long number = 0;
-        curl_easy_getinfo(_handle->get(), CURLINFO_OS_ERRNO, &number);
+        curl_easy_getinfo(_transfer->get(), CURLINFO_OS_ERRNO, &number);
         if (result == CURLE_COULDNT_CONNECT && (number == EACCES || number == EPERM)) {
             throw Failure(ExitStatus::notPermitted, "you may not talk to the daemon at " + _socketPath);
         }
@@ -100,12 +100,12 @@ HttpAnswer Connection::send(const std::string& path, const std::string* body, co
                                                                                : curl_easy_strerror(result);
         throw Failure(ExitStatus::notReachable, "the daemon cannot be reached at " + _socketPath + ": " + why);
     }
-    curl_easy_getinfo(_handle->get(), CURLINFO_RESPONSE_CODE, &answer.status);
+    curl_easy_getinfo(_transfer->get(), CURLINFO_RESPONSE_CODE, &answer.status);
     curl_header* header = nullptr;
-    if (curl_easy_header(_handle->get(), "Request-Id", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
+    if (curl_easy_header(_transfer->get(), "Request-Id", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
         answer.requestId = header->value;
     }
-    if (curl_easy_header(_handle->get(), "ETag", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
+    if (curl_easy_header(_transfer->get(), "ETag", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
         answer.revision = header->value;
     }
     return answer;

@@ -7,7 +7,7 @@
 
 namespace adminhost::ctl {
 
-struct HttpAnswer {
+struct DaemonReply {
     long status = 0;
     std::string body;
     std::string requestId;  ///< the daemon's name for the request; empty if it gave none
@@ -25,19 +25,19 @@ class Connection {
     Connection& operator=(Connection&&) noexcept;
 
     /// The path is the address below "http://host", each of its segments already escaped.
-    [[nodiscard]] HttpAnswer get(const std::string& path);
+    [[nodiscard]] DaemonReply get(const std::string& path);
     /// The body is JSON. With a revision, the daemon refuses the request (412) unless it still is the current one.
-    [[nodiscard]] HttpAnswer post(const std::string& path, const std::string& body, const std::string& revision = {});
+    [[nodiscard]] DaemonReply post(const std::string& path, const std::string& body, const std::string& revision = {});
 
     /// Escapes one segment of a path.
     [[nodiscard]] static std::string escaped(const std::string& segment);
 
   private:
-    class Handle;
-    [[nodiscard]] HttpAnswer send(const std::string& path, const std::string* body, const std::string& revision);
+    class Transfer;
+    [[nodiscard]] DaemonReply send(const std::string& path, const std::string* body, const std::string& revision);
 
     std::string _socketPath;
-    std::unique_ptr<Handle> _handle;
+    std::unique_ptr<Transfer> _transfer;
 };
 
 }  // namespace adminhost::ctl

@@ -15,7 +15,7 @@ void Description::Keys::add(const Value& described) {
     if (key == nullptr) {
         return;
     }
-    KeyDescription description;
+    DescribedKey description;
     description.path = textAt(*key, "path");
     description.type = textAt(*key, "type");
     description.enteredAs = textAt(*key, "enteredAs");
@@ -35,7 +35,7 @@ void Description::Keys::add(const Value& described) {
     all.push_back(std::move(description));
 }
 
-const KeyDescription* Description::Keys::find(std::string_view path) const noexcept {
+const DescribedKey* Description::Keys::find(std::string_view path) const noexcept {
     const auto found = index.find(std::string(path));
     return found == index.end() ? nullptr : &all[found->second];
 }

@@ -12,7 +12,7 @@
 namespace adminhost::ctl {
 
 /// One key of a request or an answer.
-struct KeyDescription {
+struct DescribedKey {
     std::string path;  ///< "configuration.properties[].name"
     std::string type;  ///< "text", "integer", "boolean", "list", "dictionary", "scalar", ...
     std::string enteredAs;
@@ -33,22 +33,22 @@ class Description {
     [[nodiscard]] const std::string& name() const noexcept { return _name; }
     [[nodiscard]] const std::string& summary() const noexcept { return _summary; }
     [[nodiscard]] const std::string& text() const noexcept { return _text; }
-    [[nodiscard]] const std::vector<KeyDescription>& keys() const noexcept { return _keys.all; }
-    [[nodiscard]] const std::vector<KeyDescription>& answerKeys() const noexcept { return _answer.all; }
+    [[nodiscard]] const std::vector<DescribedKey>& keys() const noexcept { return _keys.all; }
+    [[nodiscard]] const std::vector<DescribedKey>& answerKeys() const noexcept { return _answer.all; }
     [[nodiscard]] const Array& errors() const noexcept { return _errors; }
     [[nodiscard]] const Dictionary& example() const noexcept { return _example; }
 
     /// Null if the path is not described.
-    [[nodiscard]] const KeyDescription* key(std::string_view path) const noexcept { return _keys.find(path); }
-    [[nodiscard]] const KeyDescription* answerKey(std::string_view path) const noexcept { return _answer.find(path); }
+    [[nodiscard]] const DescribedKey* key(std::string_view path) const noexcept { return _keys.find(path); }
+    [[nodiscard]] const DescribedKey* answerKey(std::string_view path) const noexcept { return _answer.find(path); }
 
   private:
     struct Keys {
-        std::vector<KeyDescription> all;
+        std::vector<DescribedKey> all;
         std::unordered_map<std::string, std::size_t> index;
 
         void add(const Value& described);
-        [[nodiscard]] const KeyDescription* find(std::string_view path) const noexcept;
+        [[nodiscard]] const DescribedKey* find(std::string_view path) const noexcept;
     };
 
     std::string _name;

@@ -1,10 +1,14 @@
-// adminhostctl: administrate the service from the command line, through the daemon.
+// adminhostctl: the service's command line, through its daemon. Only this file names all of its rooms: the generic
+// client, the desired state and the verbs of this one service.
 
+#include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Failure.h"
+#include "adminhostctl/GeneralVerbs.h"
 #include "adminhostctl/Prompt.h"
-#include "adminhostctl/Request.h"
-#include "adminhostctl/Service.h"
-#include "adminhostctl/Verbs.h"
+#include "adminhostctl/RequestArguments.h"
+#include "adminhostctl/Verb.h"
+#include "adminhostctl/desired/DesiredVerbs.h"
+#include "adminhostctl/lumio/LumioVerbs.h"
 
 #include <algorithm>
 #include <cstdlib>
@@ -39,8 +43,18 @@ int statusOf(ExitStatus status) {
     return static_cast<int>(status);
 }
 
+/// In the order in which help lists them.
+std::vector<adminhost::ctl::Verb> allVerbs() {
+    std::vector<adminhost::ctl::Verb> all;
+    for (const auto& table :
+         {adminhost::ctl::generalVerbs(), adminhost::ctl::lumioVerbs(), adminhost::ctl::desiredVerbs()}) {
+        all.insert(all.end(), table.begin(), table.end());
+    }
+    return all;
+}
+
 int runMain(int count, char** words) {
-    adminhost::ctl::Options options;
+    adminhost::ctl::VerbOptions options;
     std::string socket = defaultSocket;
     std::string format = "text";
     std::vector<std::string> rest;
@@ -79,10 +93,11 @@ int runMain(int count, char** words) {
     options.width = outputWidth();
     options.isProtected = protect ? std::optional(true) : noProtect ? std::optional(false) : std::nullopt;
     try {
-        adminhost::ctl::Service service(socket);
+        adminhost::ctl::DaemonClient service(socket);
         const adminhost::ctl::Sources sources{&adminhost::ctl::readSource, &adminhost::ctl::askSecret,
                                               adminhost::ctl::inputIsTerminal()};
-        const ExitStatus status = adminhost::ctl::run({service, options, sources, std::cout, std::cerr}, rest);
+        const std::vector<adminhost::ctl::Verb> verbs = allVerbs();
+        const ExitStatus status = adminhost::ctl::run({service, options, sources, std::cout, std::cerr, verbs}, rest);
         std::cout.flush();
         if (!std::cout) {
             std::cerr << "adminhostctl: the answer could not be written\n";

@@ -105,7 +105,7 @@ std::string personText(const Dictionary& entry) {
 }
 
 std::string Reading::cell(const Value& value, const std::string& path) const {
-    if (const KeyDescription* key = _description.answerKey(path); key != nullptr && !key->unit.empty()) {
+    if (const DescribedKey* key = _description.answerKey(path); key != nullptr && !key->unit.empty()) {
         std::string text = withUnit(value, key->unit);
         if (!text.empty()) {
             return text;
@@ -143,7 +143,7 @@ void Reading::appendTable(std::string& text, const Array& rows, const std::strin
     std::vector<std::string> keys;
     std::vector<std::string> headings;
     const std::string element = path + "[].";
-    for (const KeyDescription& key : _description.answerKeys()) {
+    for (const DescribedKey& key : _description.answerKeys()) {
         if (!key.column.empty() && key.path.starts_with(element) &&
             key.path.find('.', element.size()) == std::string::npos) {
             keys.push_back(key.path.substr(element.size()));

@@ -1,5 +1,5 @@
+#include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Reading.h"
-#include "adminhostctl/Service.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "tests/unit/adminhostctl/Describe.h"

@@ -1,2 +1,2 @@
-set(TEST_LIBS adminhostctl_room commands util)
+set(TEST_LIBS adminhostctl_client commands util)
 set(TEST_ENVIRONMENT "TZ=Europe/Berlin")

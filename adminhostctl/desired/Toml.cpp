@@ -1,4 +1,4 @@
-#include "adminhostctl/Toml.h"
+#include "adminhostctl/desired/Toml.h"
 
 #include "adminhostctl/Width.h"
 

@@ -36,10 +36,14 @@ struct Sources {
 
 /// The value of a word for a key: a text, "@FILE" or "@-". A secret stands on no command line: with no word, or "@-" at
 /// a terminal, it is asked for. Throws Failure(usage) as buildRequest does.
-[[nodiscard]] Value valueOfWord(const KeyDescription& key, const std::optional<std::string>& word,
+[[nodiscard]] Value valueOfWord(const DescribedKey& key, const std::optional<std::string>& word,
                                 const Sources& sources);
 
+/// The same for a key that holds text.
+[[nodiscard]] std::string textOfWord(const DescribedKey& key, const std::optional<std::string>& word,
+                                     const Sources& sources);
+
 /// The value of a text for a key; throws Failure(usage) when it does not fit.
-[[nodiscard]] Value valueOfText(const KeyDescription& key, const std::string& text);
+[[nodiscard]] Value valueOfText(const DescribedKey& key, const std::string& text);
 
 }  // namespace adminhost::ctl

@@ -1,4 +1,4 @@
-#include "adminhostctl/Service.h"
+#include "adminhostctl/DaemonClient.h"
 
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/Width.h"
@@ -62,8 +62,8 @@ bool isSet(const Value& value) {
 
 }  // namespace
 
-Value Service::get(const std::string& path) {
-    const HttpAnswer answer = _connection.get(path);
+Value DaemonClient::get(const std::string& path) {
+    const DaemonReply answer = _connection.get(path);
     if (answer.status != statusOk) {
         fail(answer);
     }
@@ -75,7 +75,7 @@ Value Service::get(const std::string& path) {
     return std::move(*value);
 }
 
-void Service::fail(const HttpAnswer& answer) {
+void DaemonClient::fail(const DaemonReply& answer) {
     const ExitStatus status = answer.status == statusForbidden ? ExitStatus::notPermitted : ExitStatus::answeredError;
     const auto body = parseJson(answer.body);
     const Dictionary* said = body ? body->dictionary() : nullptr;
@@ -92,11 +92,11 @@ void Service::fail(const HttpAnswer& answer) {
     throw Failure(status, message);
 }
 
-Value Service::overview() {
+Value DaemonClient::overview() {
     return get("/v1/");
 }
 
-const std::vector<PluginInfo>& Service::plugins() {
+const std::vector<PluginInfo>& DaemonClient::plugins() {
     if (!_plugins) {
         std::vector<PluginInfo> plugins;
         const Value all = overview();
@@ -123,7 +123,7 @@ const std::vector<PluginInfo>& Service::plugins() {
     return *_plugins;
 }
 
-CommandRef Service::command(const std::string& name) {
+CommandRef DaemonClient::command(const std::string& name) {
     const std::size_t slash = name.find('/');
     const std::string wanted = slash == std::string::npos ? name : name.substr(slash + 1);
     std::vector<CommandRef> found;
@@ -149,8 +149,8 @@ CommandRef Service::command(const std::string& name) {
     throw usageError("several plug-ins have a command " + wanted + "; write " + found.front().plugin + '/' + wanted);
 }
 
-Answer Service::ask(const CommandRef& command, const Dictionary& request, const std::string& revision) {
-    const HttpAnswer answer = _connection.post(
+CommandAnswer DaemonClient::ask(const CommandRef& command, const Dictionary& request, const std::string& revision) {
+    const DaemonReply answer = _connection.post(
         "/v1/" + Connection::escaped(command.plugin) + '/' + Connection::escaped(command.description.name()),
         jsonOf(request), revision);
     if (answer.status == statusNoContent) {
@@ -167,8 +167,8 @@ Answer Service::ask(const CommandRef& command, const Dictionary& request, const 
     return {std::move(value), answer.requestId, answer.revision};
 }
 
-std::vector<std::string> Service::logLines(const std::string& requestId) {
-    const HttpAnswer answer = _connection.get("/v1/requests/" + Connection::escaped(requestId));
+std::vector<std::string> DaemonClient::logLines(const std::string& requestId) {
+    const DaemonReply answer = _connection.get("/v1/requests/" + Connection::escaped(requestId));
     const auto record = answer.status == statusOk ? parseJson(answer.body) : std::nullopt;
     const Dictionary* dictionary = record ? record->dictionary() : nullptr;
     const Array* log = dictionary != nullptr ? dictionary->get("log").array() : nullptr;

@@ -1,5 +1,5 @@
-#include "adminhostctl/DesiredFile.h"
 #include "adminhostctl/Failure.h"
+#include "adminhostctl/desired/DesiredFile.h"
 #include "tests/unit/adminhostctl/Describe.h"
 
 #include <gmock/gmock.h>
@@ -31,9 +31,9 @@ State sample() {
                       {"server_host", "a \"quoted\"\nhost"},
                       {"max_file_size_in_mb", 2.0},
                       {"web_app_url", "https://derived"}};
-    state.properties = std::vector<Property>{
+    state.properties = std::vector<ListedProperty>{
         {"3", "plain", "left", false}, {"4", "token", std::nullopt, true}, {"5", "empty", std::nullopt, false}};
-    state.cameras = std::vector<Camera>{
+    state.cameras = std::vector<ListedCamera>{
         {"AAAA-1",
          "Hall",
          true,
@@ -101,7 +101,7 @@ TEST(Export, ReadAgainIsNoChange) {
 TEST(Export, EveryWritableSettingIsManagedHereAndNothingElse) {
     State state;
     std::vector<std::string> writable;
-    for (const KeyDescription& key : writeSettings().keys()) {
+    for (const DescribedKey& key : writeSettings().keys()) {
         constexpr std::string_view prefix = "configuration.";
         const std::string name = key.path.starts_with(prefix) ? key.path.substr(prefix.size()) : "";
         if (!name.empty() && name.find_first_of(".[") == std::string::npos) {

@@ -1,8 +1,8 @@
 #pragma once
 
-// The verbs that look back: who the directory knows, what writes of settings changed, and going back.
+// The verbs that look back: what writes of settings changed, and going back.
 
-#include "adminhostctl/Verbs.h"
+#include "adminhostctl/Verb.h"
 
 namespace adminhost::ctl {
 
@@ -10,7 +10,6 @@ namespace adminhost::ctl {
 [[nodiscard]] std::vector<std::string> changesBetween(const Dictionary& before, const Dictionary& after,
                                                       const std::vector<std::string>& keys);
 
-[[nodiscard]] ExitStatus whois(const Context& context, std::span<const std::string> arguments);
 [[nodiscard]] ExitStatus history(const Context& context, std::span<const std::string> arguments);
 /// Writes the settings of an entry as every verb that changes something does it (Writing.h). What is set now and was
 /// not set then stays, and is named with answeredError; a password stays too, and is said.

@@ -1,5 +1,5 @@
 #include "adminhostctl/Failure.h"
-#include "adminhostctl/Request.h"
+#include "adminhostctl/RequestArguments.h"
 #include "tests/unit/adminhostctl/Describe.h"
 
 #include <map>
@@ -15,10 +15,10 @@ using adminhost::Date;
 using adminhost::Dictionary;
 using adminhost::Value;
 using adminhost::ctl::describe;
+using adminhost::ctl::DescribedKey;
 using adminhost::ctl::Description;
 using adminhost::ctl::ExitStatus;
 using adminhost::ctl::Failure;
-using adminhost::ctl::KeyDescription;
 using adminhost::ctl::Sources;
 using testing::HasSubstr;
 
@@ -57,8 +57,8 @@ std::string usageOf(std::string_view command, const std::vector<std::string>& ar
     return {};
 }
 
-KeyDescription keyOf(const char* type) {
-    KeyDescription key;
+DescribedKey keyOf(const char* type) {
+    DescribedKey key;
     key.path = "key";
     key.type = type;
     return key;
@@ -267,10 +267,10 @@ TEST(ValueOfText, DataComesFromAFile) {
 }
 
 /// What a verb takes its word for: the value of a key.
-Value word(const KeyDescription& key, const std::optional<std::string>& text, const Given& given = {}) {
+Value word(const DescribedKey& key, const std::optional<std::string>& text, const Given& given = {}) {
     return adminhost::ctl::valueOfWord(key, text, given.sources());
 }
-std::string wordRefused(const KeyDescription& key, const std::optional<std::string>& text, const Given& given = {}) {
+std::string wordRefused(const DescribedKey& key, const std::optional<std::string>& text, const Given& given = {}) {
     try {
         (void)word(key, text, given);
     } catch (const Failure& failure) {
@@ -280,8 +280,8 @@ std::string wordRefused(const KeyDescription& key, const std::optional<std::stri
     ADD_FAILURE() << "the word was taken";
     return {};
 }
-KeyDescription secretKey() {
-    KeyDescription key = keyOf("text");
+DescribedKey secretKey() {
+    DescribedKey key = keyOf("text");
     key.secret = true;
     return key;
 }

@@ -25,15 +25,15 @@ struct CommandRef {
 };
 
 /// What a command answered, and the request that it answered to.
-struct Answer {
+struct CommandAnswer {
     std::optional<Value> value;  ///< nothing for an answer of nothing
     std::string requestId;
     std::string revision;  ///< of what was read; empty where the command has none
 };
 
-class Service {
+class DaemonClient {
   public:
-    explicit Service(std::string socketPath) : _connection(std::move(socketPath)) {}
+    explicit DaemonClient(std::string socketPath) : _connection(std::move(socketPath)) {}
 
     /// What runs now: the daemon's own account of itself.
     [[nodiscard]] Value overview();
@@ -49,7 +49,8 @@ class Service {
     }
     /// The same, with the request's name and revision. A request that gives a revision fails unless it is still
     /// current.
-    [[nodiscard]] Answer ask(const CommandRef& command, const Dictionary& request, const std::string& revision = {});
+    [[nodiscard]] CommandAnswer ask(const CommandRef& command, const Dictionary& request,
+                                    const std::string& revision = {});
     /// What was logged while the request was performed; empty when the daemon does not know it any more.
     [[nodiscard]] std::vector<std::string> logLines(const std::string& requestId);
 
@@ -57,7 +58,7 @@ class Service {
     [[nodiscard]] Value get(const std::string& path);
 
   private:
-    [[noreturn]] void fail(const HttpAnswer& answer);
+    [[noreturn]] void fail(const DaemonReply& answer);
 
     Connection _connection;
     std::optional<std::vector<PluginInfo>> _plugins;

@@ -2,7 +2,7 @@
 
 // From what is wanted and what is there to the changes that make the one the other. No input, no output.
 
-#include "adminhostctl/State.h"
+#include "adminhostctl/desired/State.h"
 #include "platform/value/Value.h"
 
 #include <optional>
@@ -27,7 +27,7 @@ struct WantedCamera {
     std::optional<bool> restricted;
     std::optional<std::vector<std::string>> users;  ///< short names; nothing: as they are
     std::optional<std::vector<std::string>> groups;
-    std::vector<Person> denied;  ///< by short name; an empty kind means both
+    std::vector<ListedPerson> denied;  ///< by short name; an empty kind means both
     bool remove = false;
 };
 
@@ -42,16 +42,16 @@ struct Wanted {
     bool lookUpController = false;
 };
 
-struct Change {
+struct PlannedChange {
     std::string entry;  ///< "settings.server_port", "cameras.\"Main hall\".users.anna"
     std::string from;   ///< as TOML writes it, or words in parentheses; "(secret)" for every secret
     std::string to;
 
-    friend bool operator==(const Change&, const Change&) = default;
+    friend bool operator==(const PlannedChange&, const PlannedChange&) = default;
 };
 
 struct Plan {
-    std::vector<Change> changes;
+    std::vector<PlannedChange> changes;
     std::vector<std::string> notes;  ///< what is wanted and left as it is, and why
     Dictionary configuration;        ///< for writeSettings; empty when nothing changes
     bool restart = false;            ///< whether the service has to be restarted for a change to take effect
@@ -65,8 +65,8 @@ struct Plan {
 
 /// The changes of the plan that did not take, `from` being what is there instead. `settingsWritten` says that the
 /// service wrote its settings files. What no reading shows is judged by the log lines of the writing request.
-[[nodiscard]] std::vector<Change> changesNotTaken(const Wanted& wanted, const Plan& plan, const State& before,
-                                                  const State& after, bool settingsWritten,
-                                                  std::span<const std::string> log);
+[[nodiscard]] std::vector<PlannedChange> changesNotTaken(const Wanted& wanted, const Plan& plan, const State& before,
+                                                         const State& after, bool settingsWritten,
+                                                         std::span<const std::string> log);
 
 }  // namespace adminhost::ctl

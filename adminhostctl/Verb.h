@@ -1,10 +1,11 @@
 #pragma once
 
-// What can be written after "adminhostctl": one row for each verb. Every other word is a command of a plug-in.
+// A verb: what can be written after "adminhostctl". Each room has a table of its own verbs, Main.cpp joins the tables.
+// Every other word is a command of a plug-in.
 
+#include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Failure.h"
-#include "adminhostctl/Request.h"
-#include "adminhostctl/Service.h"
+#include "adminhostctl/RequestArguments.h"
 
 #include <cstddef>
 #include <optional>
@@ -18,7 +19,7 @@ namespace adminhost::ctl {
 
 enum class Format { text, json, plist };
 
-struct Options {
+struct VerbOptions {
     Format format = Format::text;
     std::string file;                 ///< of the whole request; empty for none
     std::string passwordFile;         ///< of the grid password; empty for none
@@ -28,13 +29,16 @@ struct Options {
     std::size_t width = 80;           ///< columns of the terminal
 };
 
+struct Verb;
+
 /// What a verb works with.
 struct Context {
-    Service& service;
-    const Options& options;
+    DaemonClient& service;
+    const VerbOptions& options;
     const Sources& sources;
     std::ostream& out;
     std::ostream& err;
+    std::span<const Verb> verbs;  ///< all of them
 };
 
 struct Verb {
@@ -46,11 +50,15 @@ struct Verb {
     ExitStatus (*run)(const Context& context, std::span<const std::string> arguments);
 };
 
-[[nodiscard]] std::span<const Verb> verbs() noexcept;
-
 /// Writes a value in the asked format; as text, it stands at the path of the command's answer. Throws Failure.
 void writeValue(const Context& context, const Value& value, const Description& description,
                 const std::string& path = {});
+
+/// Reports the error of an answer (errorOf()) on standard error; done if there is none.
+[[nodiscard]] ExitStatus reportAnswered(const Context& context, const std::string& error);
+
+/// The argument at the index, if so many were given.
+[[nodiscard]] std::optional<std::string> wordAt(std::span<const std::string> arguments, std::size_t index);
 
 /// Runs the verb, or the command, that the words begin with. Throws Failure.
 [[nodiscard]] ExitStatus run(const Context& context, const std::vector<std::string>& words);

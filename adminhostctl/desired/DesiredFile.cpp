@@ -1,9 +1,9 @@
-#include "adminhostctl/DesiredFile.h"
+#include "adminhostctl/desired/DesiredFile.h"
 
 #include "adminhostctl/Failure.h"
-#include "adminhostctl/Toml.h"
 #include "adminhostctl/Width.h"
-#include "adminhostctl/Writing.h"
+#include "adminhostctl/desired/Toml.h"
+#include "adminhostctl/desired/Writing.h"
 
 #include <algorithm>
 #include <set>
@@ -27,9 +27,9 @@ std::string comment(const std::string& text) {
     return "# " + text + '\n';
 }
 
-std::vector<std::string> namesOf(const Camera& camera, std::string_view kind) {
+std::vector<std::string> namesOf(const ListedCamera& camera, std::string_view kind) {
     std::vector<std::string> names;
-    for (const Person& person : camera.allowed) {
+    for (const ListedPerson& person : camera.allowed) {
         if (person.kind == kind && !person.shortName.empty()) {
             names.push_back(person.shortName);
         }
@@ -47,16 +47,16 @@ std::string listText(const std::vector<std::string>& texts) {
     return '[' + list + ']';
 }
 
-void appendProperties(std::string& text, const std::vector<Property>& all) {
-    std::vector<const Property*> sorted;
+void appendProperties(std::string& text, const std::vector<ListedProperty>& all) {
+    std::vector<const ListedProperty*> sorted;
     std::multiset<std::string> names;
-    for (const Property& property : all) {
+    for (const ListedProperty& property : all) {
         sorted.push_back(&property);
         names.insert(property.name);
     }
     std::stable_sort(sorted.begin(), sorted.end(),
-                     [](const Property* a, const Property* b) { return a->name < b->name; });
-    for (const Property* property : sorted) {
+                     [](const ListedProperty* a, const ListedProperty* b) { return a->name < b->name; });
+    for (const ListedProperty* property : sorted) {
         text += '\n';
         if (property->name.empty() || names.count(property->name) > 1) {
             text += comment("properties." + tomlKey(property->name) + ", row " + property->id +
@@ -72,7 +72,7 @@ void appendProperties(std::string& text, const std::vector<Property>& all) {
 }
 
 /// The name, or the UUID where the name does not find this camera alone.
-std::string keyOf(const State& state, const Camera& camera) {
+std::string keyOf(const State& state, const ListedCamera& camera) {
     try {
         return !camera.name.empty() && findCamera(state, camera.name) == &camera ? camera.name : camera.uuid;
     } catch (const Failure&) {
@@ -81,8 +81,8 @@ std::string keyOf(const State& state, const Camera& camera) {
 }
 
 void appendCameras(std::string& text, const State& state) {
-    std::vector<std::pair<std::string, const Camera*>> sorted;
-    for (const Camera& camera : *state.cameras) {
+    std::vector<std::pair<std::string, const ListedCamera*>> sorted;
+    for (const ListedCamera& camera : *state.cameras) {
         sorted.emplace_back(keyOf(state, camera), &camera);
     }
     std::sort(sorted.begin(), sorted.end());
@@ -171,7 +171,7 @@ class Node {
 };
 
 /// Whether a setting can hold the value: of the described type, or of the type that is stored.
-bool fits(const KeyDescription& key, const Value& value, const Value& stored) {
+bool fits(const DescribedKey& key, const Value& value, const Value& stored) {
     if (value.type() == stored.type()) {
         return true;
     }
@@ -188,7 +188,7 @@ void parseSetting(Wanted& wanted, const std::string& key, const Node& node, cons
     if (key == passwordKey) {
         node.fail("is secret and stands in no file: give it with --password-file FILE");
     }
-    const KeyDescription* described = settingKey(writeSettings, key);
+    const DescribedKey* described = settingKey(writeSettings, key);
     if (described == nullptr) {
         node.fail(
             "is no setting that can be written; \"adminhostctl help writeSettings\" lists them below configuration");
@@ -261,7 +261,7 @@ std::string exportOf(const State& state, const Description& writeSettings) {
     std::string text(introduction);
     text += "\n[settings]\n";
     constexpr std::string_view prefix = "configuration.";
-    for (const KeyDescription& key : writeSettings.keys()) {
+    for (const DescribedKey& key : writeSettings.keys()) {
         const std::string name = key.path.starts_with(prefix) ? key.path.substr(prefix.size()) : std::string();
         const Value& value = state.settings.get(name);
         if (name.empty() || value.isNull() || settingKey(writeSettings, name) == nullptr) {
@@ -284,7 +284,7 @@ Wanted parseDesired(std::string_view text, const std::string& from, const Descri
                     const State& state) {
     const toml::table table = parsed(text, from);
     Wanted wanted;
-    std::set<const Camera*> cameras;
+    std::set<const ListedCamera*> cameras;
     for (const auto& [section, content] : Node(from, "", table).entries()) {
         for (const auto& [key, node] :
              section == "settings" || section == "properties" || section == "cameras" || section == "remove_unlisted"
@@ -300,7 +300,7 @@ Wanted parseDesired(std::string_view text, const std::string& from, const Descri
                 wanted.properties.push_back(parseProperty(key, node));
             } else {
                 wanted.cameras.push_back(parseCamera(key, node));
-                const Camera* camera = findCamera(state, key);
+                const ListedCamera* camera = findCamera(state, key);
                 if (camera == nullptr) {
                     node.fail("is no camera of the service; \"adminhostctl camera list\" shows their names");
                 }

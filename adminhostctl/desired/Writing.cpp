@@ -1,7 +1,7 @@
-#include "adminhostctl/Writing.h"
+#include "adminhostctl/desired/Writing.h"
 
-#include "adminhostctl/Toml.h"
 #include "adminhostctl/Width.h"
+#include "adminhostctl/desired/Toml.h"
 #include "platform/value/Text.h"
 
 namespace adminhost::ctl {
@@ -10,9 +10,9 @@ namespace {
 constexpr std::string_view restartAdvice =
     "the service has to be restarted for this to take effect: adminhostctl stopService, then startService";
 
-Array changesValue(std::span<const Change> changes) {
+Array changesValue(std::span<const PlannedChange> changes) {
     Array all;
-    for (const Change& change : changes) {
+    for (const PlannedChange& change : changes) {
         all.emplace_back(Dictionary{{"entry", change.entry}, {"from", change.from}, {"to", change.to}});
     }
     return all;
@@ -34,7 +34,7 @@ const Dictionary& configurationOf(const Dictionary& answer) {
     return *configuration;
 }
 
-void showLine(std::ostream& out, const Change& change) {
+void showLine(std::ostream& out, const PlannedChange& change) {
     out << shown(change.entry) << ": " << change.from << " -> " << change.to << '\n';
 }
 
@@ -51,17 +51,17 @@ void sayResolved(const Context& context, const Wanted& wanted, const State& afte
 
 }  // namespace
 
-const KeyDescription* settingKey(const Description& writeSettings, const std::string& name) {
+const DescribedKey* settingKey(const Description& writeSettings, const std::string& name) {
     if (name.find_first_of(".[") != std::string::npos) {
         return nullptr;
     }
-    const KeyDescription* key = writeSettings.key("configuration." + name);
+    const DescribedKey* key = writeSettings.key("configuration." + name);
     // The lists have verbs of their own, and a boolean there is an order, not a setting.
     return key != nullptr && !key->secret && (key->type == "text" || key->type == "scalar") ? key : nullptr;
 }
 
 CurrentState readState(const Context& context) {
-    const Answer answer = context.service.ask(context.service.command("readSettings"), {});
+    const CommandAnswer answer = context.service.ask(context.service.command("readSettings"), {});
     return {stateOf(configurationOf(dictionaryOf(answer.value))), answer.revision};
 }
 
@@ -76,7 +76,7 @@ void showPlan(const Context& context, const Plan& plan) {
                    Description());
         return;
     }
-    for (const Change& change : plan.changes) {
+    for (const PlannedChange& change : plan.changes) {
         showLine(context.out, change);
     }
     if (plan.changes.empty()) {
@@ -96,14 +96,15 @@ ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentS
         return ExitStatus::done;
     }
     const CommandRef command = context.service.command("writeSettings");
-    const Answer answer = context.service.ask(command, {{"configuration", plan.configuration}}, current.revision);
+    const CommandAnswer answer =
+        context.service.ask(command, {{"configuration", plan.configuration}}, current.revision);
     const Dictionary& said = dictionaryOf(answer.value);
     const std::string error = errorOf(command.description, said);
     const std::vector<std::string> log = context.service.logLines(answer.requestId);
     // Without a configuration nothing is known to have taken.
     const Dictionary* read = said.get("configuration").dictionary();
     const State after = read != nullptr ? stateOf(*read) : State();
-    const std::vector<Change> failed = changesNotTaken(wanted, plan, current.state, after, error.empty(), log);
+    const std::vector<PlannedChange> failed = changesNotTaken(wanted, plan, current.state, after, error.empty(), log);
 
     plan.restart = booleanOf(said.get("needsRecycleOrRestart"));
     showPlan(context, plan);
@@ -116,7 +117,7 @@ ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentS
     }
     if (!failed.empty()) {
         context.err << "adminhostctl: these changes did not take:\n";
-        for (const Change& change : failed) {
+        for (const PlannedChange& change : failed) {
             context.err << "  ";
             showLine(context.err, change);
         }

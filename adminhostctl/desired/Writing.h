@@ -2,8 +2,8 @@
 
 // How every verb that changes something does it: read, plan, write what was planned on, compare what is there then.
 
-#include "adminhostctl/Plan.h"
-#include "adminhostctl/Verbs.h"
+#include "adminhostctl/Verb.h"
+#include "adminhostctl/desired/Plan.h"
 
 #include <string>
 
@@ -19,7 +19,7 @@ struct CurrentState {
 [[nodiscard]] CurrentState readState(const Context& context);
 
 /// The description of a setting that writeSettings takes and that can be read again; null if there is none of the name.
-[[nodiscard]] const KeyDescription* settingKey(const Description& writeSettings, const std::string& name);
+[[nodiscard]] const DescribedKey* settingKey(const Description& writeSettings, const std::string& name);
 
 /// The plan in the asked format.
 void showPlan(const Context& context, const Plan& plan);

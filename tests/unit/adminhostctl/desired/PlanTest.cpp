@@ -1,6 +1,6 @@
 #include "adminhostctl/Failure.h"
-#include "adminhostctl/Plan.h"
-#include "adminhostctl/Toml.h"
+#include "adminhostctl/desired/Plan.h"
+#include "adminhostctl/desired/Toml.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -15,8 +15,8 @@ using namespace adminhost::ctl;
 State sample() {
     State state;
     state.settings = {{"server_port", 8170}, {"server_host", "media"}, {"nimbo_controller", "grid.example.org"}};
-    state.properties = std::vector<Property>{{"3", "plain", "left", false}, {"4", "token", std::nullopt, true}};
-    state.cameras = std::vector<Camera>{
+    state.properties = std::vector<ListedProperty>{{"3", "plain", "left", false}, {"4", "token", std::nullopt, true}};
+    state.cameras = std::vector<ListedCamera>{
         {"AAAA-1", "Hall", true, {{"user", "anna", "U-1"}, {"group", "anna", "G-1"}, {"user", "", "U-2"}}}};
     return state;
 }
@@ -38,7 +38,7 @@ TEST(Plan, EqualSettingsAreNotSentAndTypesCount) {
     wanted.settings.set("server_port", "8170");
     const Plan plan = planOf(wanted, sample());
     EXPECT_EQ(plan.configuration, (Dictionary{{"server_port", "8170"}}));
-    EXPECT_EQ(plan.changes, (std::vector<Change>{{"settings.server_port", "8170", "\"8170\""}}));
+    EXPECT_EQ(plan.changes, (std::vector<PlannedChange>{{"settings.server_port", "8170", "\"8170\""}}));
     EXPECT_FALSE(plan.restart);
 }
 
@@ -84,9 +84,9 @@ TEST(Plan, NewPropertyIsOneRecordAndNeedsAValue) {
 
 TEST(Plan, SecretsShowAsSuchOnBothSides) {
     EXPECT_EQ(planOfProperty({"token", "new", {}, false, true}).changes,
-              (std::vector<Change>{{"properties.token.value", "(secret)", "(secret)"}}));
+              (std::vector<PlannedChange>{{"properties.token.value", "(secret)", "(secret)"}}));
     EXPECT_EQ(planOfProperty({"plain", "next", true, false, false}).changes.front(),
-              (Change{"properties.plain.value", "\"left\"", "(secret)"}));
+              (PlannedChange{"properties.plain.value", "\"left\"", "(secret)"}));
     EXPECT_EQ(planOfProperty({"token", "new", {}, false, false}).notes.size(), 1U) << "a file does not write it again";
 }
 
@@ -111,7 +111,7 @@ TEST(Plan, WhatIsStillDifferentAfterwardsDidNotTake) {
     after.settings.set("server_port", 1);
     after.cameras->clear();
     EXPECT_EQ(changesNotTaken(wanted, plan, sample(), after, true, {}),
-              (std::vector<Change>{{"settings.server_host", "\"media\"", "\"other\""}}));
+              (std::vector<PlannedChange>{{"settings.server_host", "\"media\"", "\"other\""}}));
     EXPECT_EQ(changesNotTaken(wanted, plan, sample(), State(), true, {}).size(), plan.changes.size());
 }
 

@@ -22,8 +22,8 @@
 // any name.
 
 #include "adminhostctl/Description.h"
-#include "adminhostctl/Plan.h"
-#include "adminhostctl/State.h"
+#include "adminhostctl/desired/Plan.h"
+#include "adminhostctl/desired/State.h"
 
 #include <string>
 #include <string_view>

@@ -1,7 +1,7 @@
-#include "adminhostctl/Plan.h"
+#include "adminhostctl/desired/Plan.h"
 
 #include "adminhostctl/Failure.h"
-#include "adminhostctl/Toml.h"
+#include "adminhostctl/desired/Toml.h"
 #include "platform/value/Text.h"
 
 #include <algorithm>
@@ -83,7 +83,7 @@ void planNewProperty(Plan& plan, Array& records, const WantedProperty& wanted, c
 
 void planProperty(Plan& plan, Array& records, const WantedProperty& wanted, const State& state) {
     const std::string entry = "properties." + tomlKey(wanted.name);
-    const Property* stored = findProperty(state, wanted.name);
+    const ListedProperty* stored = findProperty(state, wanted.name);
     if (wanted.remove) {
         if (stored != nullptr) {
             records.emplace_back(Dictionary{{"_id_", stored->id}, {"_obsoleteid_", true}});
@@ -131,10 +131,10 @@ void planRemovals(Plan& plan, Array& records, const Wanted& wanted, const State&
     for (const WantedProperty& property : wanted.properties) {
         listed.insert(property.name);
     }
-    for (const Property& property : state.properties.value_or(std::vector<Property>())) {
+    for (const ListedProperty& property : state.properties.value_or(std::vector<ListedProperty>())) {
         names.insert(property.name);
     }
-    for (const Property& property : state.properties.value_or(std::vector<Property>())) {
+    for (const ListedProperty& property : state.properties.value_or(std::vector<ListedProperty>())) {
         if (!property.name.empty() && names.count(property.name) == 1 && listed.count(property.name) == 0) {
             planProperty(plan, records, {property.name, {}, {}, true, false}, state);
         }
@@ -143,7 +143,7 @@ void planRemovals(Plan& plan, Array& records, const Wanted& wanted, const State&
 
 class AccessList {
   public:
-    AccessList(Plan& plan, const Camera& camera, std::string entry)
+    AccessList(Plan& plan, const ListedCamera& camera, std::string entry)
         : _plan(plan), _camera(camera), _entry(std::move(entry)) {}
 
     void allow(const std::string& kind, const std::vector<std::string>& names) {
@@ -151,9 +151,9 @@ class AccessList {
             if (name.empty()) {
                 throw usageError(_entry + ": a short name is empty");
             }
-            const bool stands = std::any_of(_camera.allowed.begin(), _camera.allowed.end(), [&](const Person& person) {
-                return person.kind == kind && person.shortName == name;
-            });
+            const bool stands = std::any_of(
+                _camera.allowed.begin(), _camera.allowed.end(),
+                [&](const ListedPerson& person) { return person.kind == kind && person.shortName == name; });
             if (!stands && change(kind, name, true)) {
                 _records.emplace_back(Dictionary{{"_newid_", true}, {"type", kind}, {"shortName", name}});
             }
@@ -162,7 +162,7 @@ class AccessList {
 
     /// Takes away everyone of the kind that is not named. Who has no short name cannot be listed and stays.
     void keepOnly(const std::string& kind, const std::vector<std::string>& names) {
-        for (const Person& person : _camera.allowed) {
+        for (const ListedPerson& person : _camera.allowed) {
             if (person.kind == kind && !person.shortName.empty() &&
                 std::find(names.begin(), names.end(), person.shortName) == names.end()) {
                 deny(person);
@@ -170,7 +170,7 @@ class AccessList {
         }
     }
 
-    void deny(const Person& person) {
+    void deny(const ListedPerson& person) {
         if (change(person.kind, person.shortName, false)) {
             _records.emplace_back(Dictionary{{"_obsoleteid_", true}, {"_id_", person.id}});
         }
@@ -181,8 +181,8 @@ class AccessList {
   private:
     /// False when the change stands already.
     bool change(const std::string& kind, const std::string& name, bool allowed) {
-        Change change{_entry + '.' + kind + "s." + tomlKey(name), allowed ? "(not allowed)" : "(allowed)",
-                      allowed ? "(allowed)" : "(not allowed)"};
+        PlannedChange change{_entry + '.' + kind + "s." + tomlKey(name), allowed ? "(not allowed)" : "(allowed)",
+                             allowed ? "(allowed)" : "(not allowed)"};
         if (std::find(_plan.changes.begin(), _plan.changes.end(), change) != _plan.changes.end()) {
             return false;
         }
@@ -191,14 +191,14 @@ class AccessList {
     }
 
     Plan& _plan;
-    const Camera& _camera;
+    const ListedCamera& _camera;
     std::string _entry;
     Array _records;
 };
 
 void planCamera(Plan& plan, Array& records, const WantedCamera& wanted, const State& state, bool removePeople) {
     const std::string entry = "cameras." + tomlKey(wanted.key);
-    const Camera* camera = findCamera(state, wanted.key);
+    const ListedCamera* camera = findCamera(state, wanted.key);
     if (camera == nullptr) {
         throw usageError(entry + ": there is no such camera; \"adminhostctl camera list\" shows the names");
     }
@@ -222,8 +222,8 @@ void planCamera(Plan& plan, Array& records, const WantedCamera& wanted, const St
             }
         }
     }
-    for (const Person& denied : wanted.denied) {
-        for (const Person& person : camera->allowed) {
+    for (const ListedPerson& denied : wanted.denied) {
+        for (const ListedPerson& person : camera->allowed) {
             if (person.shortName == denied.shortName && (denied.kind.empty() || denied.kind == person.kind)) {
                 list.deny(person);
             }
@@ -244,9 +244,9 @@ bool logs(std::span<const std::string> log, std::initializer_list<std::string> t
     });
 }
 
-const Change* changeOf(const Plan& plan, const std::string& entry) {
+const PlannedChange* changeOf(const Plan& plan, const std::string& entry) {
     const auto found = std::find_if(plan.changes.begin(), plan.changes.end(),
-                                    [&](const Change& change) { return change.entry == entry; });
+                                    [&](const PlannedChange& change) { return change.entry == entry; });
     return found != plan.changes.end() ? &*found : nullptr;
 }
 
@@ -287,12 +287,12 @@ Plan planOf(const Wanted& wanted, const State& state) {
     return plan;
 }
 
-std::vector<Change> changesNotTaken(const Wanted& wanted, const Plan& plan, const State& before, const State& after,
-                                    bool settingsWritten, std::span<const std::string> log) {
-    std::vector<Change> failed;
+std::vector<PlannedChange> changesNotTaken(const Wanted& wanted, const Plan& plan, const State& before,
+                                           const State& after, bool settingsWritten, std::span<const std::string> log) {
+    std::vector<PlannedChange> failed;
     Wanted visible = wanted;
     const auto addIf = [&](bool failedToTake, const std::string& entry) {
-        if (const Change* change = failedToTake ? changeOf(plan, entry) : nullptr) {
+        if (const PlannedChange* change = failedToTake ? changeOf(plan, entry) : nullptr) {
             failed.push_back(*change);
         }
     };
@@ -310,7 +310,7 @@ std::vector<Change> changesNotTaken(const Wanted& wanted, const Plan& plan, cons
     }
     for (WantedProperty& property : visible.properties) {
         property.writeSecret = false;
-        const Property* stored = property.remove ? nullptr : findProperty(before, property.name);
+        const ListedProperty* stored = property.remove ? nullptr : findProperty(before, property.name);
         if (stored == nullptr) {
             continue;
         }
@@ -325,9 +325,9 @@ std::vector<Change> changesNotTaken(const Wanted& wanted, const Plan& plan, cons
         return gone;
     });
     try {
-        for (Change& change : planOf(visible, after).changes) {
-            const bool named =
-                std::any_of(failed.begin(), failed.end(), [&](const Change& one) { return one.entry == change.entry; });
+        for (PlannedChange& change : planOf(visible, after).changes) {
+            const bool named = std::any_of(failed.begin(), failed.end(),
+                                           [&](const PlannedChange& one) { return one.entry == change.entry; });
             if (!named) {
                 failed.push_back(std::move(change));
             }

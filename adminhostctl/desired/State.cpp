@@ -1,7 +1,7 @@
-#include "adminhostctl/State.h"
+#include "adminhostctl/desired/State.h"
 
 #include "adminhostctl/Failure.h"
-#include "adminhostctl/Toml.h"
+#include "adminhostctl/desired/Toml.h"
 #include "platform/value/Text.h"
 
 #include <algorithm>
@@ -15,8 +15,9 @@ std::string textAt(const Dictionary& dictionary, std::string_view key) {
     return value.isNull() ? std::string() : textOf(value);
 }
 
-Camera cameraOf(const Dictionary& listed) {
-    Camera camera{textAt(listed, "_id_"), textAt(listed, "name"), booleanOf(listed.get("access_control_enabled")), {}};
+ListedCamera cameraOf(const Dictionary& listed) {
+    ListedCamera camera{
+        textAt(listed, "_id_"), textAt(listed, "name"), booleanOf(listed.get("access_control_enabled")), {}};
     const Array* allowed = listed.get("allowedUsersAndGroups").array();
     for (const Value& entry : allowed != nullptr ? *allowed : Array{}) {
         if (const Dictionary* person = entry.dictionary()) {
@@ -26,8 +27,9 @@ Camera cameraOf(const Dictionary& listed) {
     return camera;
 }
 
-Property propertyOf(const Dictionary& listed) {
-    Property property{textAt(listed, "_id_"), textAt(listed, "name"), std::nullopt, booleanOf(listed.get("protect"))};
+ListedProperty propertyOf(const Dictionary& listed) {
+    ListedProperty property{textAt(listed, "_id_"), textAt(listed, "name"), std::nullopt,
+                            booleanOf(listed.get("protect"))};
     if (listed.contains("value") && !property.isProtected) {
         property.value = textAt(listed, "value");
     }
@@ -61,8 +63,8 @@ State stateOf(const Dictionary& configuration) {
             state.settings.set(entry.key, entry.value);
         }
     }
-    state.properties = listOf<Property>(configuration.get("properties"), &propertyOf);
-    state.cameras = listOf<Camera>(configuration.get("cameras"), &cameraOf);
+    state.properties = listOf<ListedProperty>(configuration.get("properties"), &propertyOf);
+    state.cameras = listOf<ListedCamera>(configuration.get("cameras"), &cameraOf);
     return state;
 }
 
@@ -71,14 +73,14 @@ bool sameUuid(const std::string& a, const std::string& b) {
                       [](unsigned char x, unsigned char y) { return std::tolower(x) == std::tolower(y); });
 }
 
-const Camera* findCamera(const State& state, const std::string& nameOrUuid) {
+const ListedCamera* findCamera(const State& state, const std::string& nameOrUuid) {
     if (!state.cameras) {
         throw notListed("cameras");
     }
-    const Camera* named = nullptr;
+    const ListedCamera* named = nullptr;
     std::string uuids;
     int count = 0;
-    for (const Camera& camera : *state.cameras) {
+    for (const ListedCamera& camera : *state.cameras) {
         if (sameUuid(camera.uuid, nameOrUuid)) {
             return &camera;
         }
@@ -95,12 +97,12 @@ const Camera* findCamera(const State& state, const std::string& nameOrUuid) {
     return named;
 }
 
-const Property* findProperty(const State& state, const std::string& name) {
+const ListedProperty* findProperty(const State& state, const std::string& name) {
     if (!state.properties) {
         throw notListed("properties");
     }
-    const Property* found = nullptr;
-    for (const Property& property : *state.properties) {
+    const ListedProperty* found = nullptr;
+    for (const ListedProperty& property : *state.properties) {
         if (property.name == name && found != nullptr) {
             throw usageError("several properties have the name " + tomlText(name) +
                              "; remove one with writeSettings and its _id_");

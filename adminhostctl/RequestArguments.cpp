@@ -1,4 +1,4 @@
-#include "adminhostctl/Request.h"
+#include "adminhostctl/RequestArguments.h"
 
 #include "adminhostctl/Failure.h"
 #include "platform/json/Json.h"
@@ -73,7 +73,7 @@ std::optional<std::size_t> indexOf(const std::string& segment) {
 std::string describedPath(const Description& command, std::vector<Step>& steps) {
     std::string path;
     for (Step& step : steps) {
-        const KeyDescription* above = command.key(path);
+        const DescribedKey* above = command.key(path);
         const auto index = above != nullptr && above->type == "list" ? indexOf(step.text) : std::nullopt;
         if (index) {
             step.index = index;
@@ -89,7 +89,7 @@ std::string describedPath(const Description& command, std::vector<Step>& steps) 
 bool isBelowAny(const Description& command, const std::string& path) {
     for (std::size_t at = path.find_last_of(".["); at != std::string::npos && at > 0;
          at = path.find_last_of(".[", at - 1)) {
-        const KeyDescription* above = command.key(path.substr(0, at));
+        const DescribedKey* above = command.key(path.substr(0, at));
         if (above != nullptr && above->type == "any") {
             return true;
         }
@@ -132,7 +132,7 @@ void store(Value& node, std::span<const Step> steps, Value value, const std::str
 
 /// The key path of a secret in a value that stands on the command line; empty if there is none.
 std::string secretIn(const Description& command, const Value& value, const std::string& path) {
-    if (const KeyDescription* key = command.key(path); key != nullptr && key->secret) {
+    if (const DescribedKey* key = command.key(path); key != nullptr && key->secret) {
         return path;
     }
     if (const Dictionary* dictionary = value.dictionary()) {
@@ -202,7 +202,7 @@ Value parseStructure(std::string_view bytes, const std::string& from) {
     return std::move(*value);
 }
 
-bool isStructure(const KeyDescription& key) {
+bool isStructure(const DescribedKey& key) {
     return key.type == "list" || key.type == "dictionary";
 }
 
@@ -216,7 +216,7 @@ std::string withoutLineEnd(std::string text) {
     return text;
 }
 
-Value valueOfFile(const KeyDescription& key, const std::string& path, const Sources& sources) {
+Value valueOfFile(const DescribedKey& key, const std::string& path, const Sources& sources) {
     if (path.empty()) {
         throw usageError(key.path + "@ needs the name of a file, or - for standard input");
     }
@@ -238,7 +238,7 @@ Value valueOfFile(const KeyDescription& key, const std::string& path, const Sour
 
 }  // namespace
 
-Value valueOfText(const KeyDescription& key, const std::string& text) {
+Value valueOfText(const DescribedKey& key, const std::string& text) {
     const std::string& type = key.enteredAs.empty() ? key.type : key.enteredAs;
     if (isStructure(key) || type == "data") {
         throw usageError(key.path + " takes a " + type + ": write " + key.path +
@@ -270,7 +270,7 @@ Value valueOfText(const KeyDescription& key, const std::string& text) {
     return std::move(*value);
 }
 
-Value valueOfWord(const KeyDescription& key, const std::optional<std::string>& word, const Sources& sources) {
+Value valueOfWord(const DescribedKey& key, const std::optional<std::string>& word, const Sources& sources) {
     if (word && word->starts_with('@')) {
         return valueOfFile(key, word->substr(1), sources);
     }
@@ -281,6 +281,11 @@ Value valueOfWord(const KeyDescription& key, const std::optional<std::string>& w
         throw usageError(key.path + " needs a value: " + (key.secret ? "@FILE or @-" : "TEXT, @FILE or @-"));
     }
     return word ? valueOfText(key, *word) : Value(sources.ask(key.path));
+}
+
+std::string textOfWord(const DescribedKey& key, const std::optional<std::string>& word, const Sources& sources) {
+    const Value value = valueOfWord(key, word, sources);
+    return value.string() != nullptr ? *value.string() : std::string();
 }
 
 Dictionary parseRequest(std::string_view bytes, const std::string& from) {
@@ -304,8 +309,8 @@ Dictionary buildRequest(const Description& command, Dictionary base, const std::
         }
         std::vector<Step> steps = stepsOf(argument.key);
         const std::string path = describedPath(command, steps);
-        const KeyDescription* key = command.key(path);
-        KeyDescription any;
+        const DescribedKey* key = command.key(path);
+        DescribedKey any;
         if (key == nullptr && isBelowAny(command, path)) {
             any.path = argument.key;
             key = &any;

@@ -1,10 +1,10 @@
-#include "adminhostctl/HistoryVerbs.h"
+#include "adminhostctl/desired/LookingBack.h"
 
 #include "adminhostctl/Connection.h"
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
-#include "adminhostctl/Writing.h"
+#include "adminhostctl/desired/Writing.h"
 #include "platform/value/Text.h"
 
 #include <algorithm>
@@ -18,7 +18,7 @@ const Value secretText("(secret)");
 std::vector<std::string> writableKeys(const Description& write) {
     constexpr std::string_view prefix = "configuration.";
     std::vector<std::string> keys;
-    for (const KeyDescription& key : write.keys()) {
+    for (const DescribedKey& key : write.keys()) {
         const bool single = key.type != "list" && key.path.find_first_of(".[", prefix.size()) == std::string::npos;
         if (key.path.starts_with(prefix) && single && !key.secret) {
             keys.push_back(key.path.substr(prefix.size()));
@@ -64,23 +64,6 @@ std::vector<std::string> changesBetween(const Dictionary& before, const Dictiona
         }
     }
     return changes;
-}
-
-ExitStatus whois(const Context& context, std::span<const std::string> arguments) {
-    const Value answer = context.service.get("/v1/directory?is=" + Connection::escaped(arguments.front()));
-    const Array* entries = answer.dictionary() == nullptr ? nullptr : answer.dictionary()->get("entries").array();
-    if (entries == nullptr || entries->empty()) {
-        throw Failure(ExitStatus::answeredError,
-                      "the directory knows nobody with the name or UUID " + shown(arguments.front()));
-    }
-    if (context.options.format != Format::text) {
-        writeValue(context, *entries, Description());
-        return ExitStatus::done;
-    }
-    for (std::size_t i = 0; i < entries->size(); ++i) {
-        context.out << (i == 0 ? "" : "\n") << Reading(Description(), context.options.width).text((*entries)[i]);
-    }
-    return ExitStatus::done;
 }
 
 ExitStatus history(const Context& context, std::span<const std::string>) {

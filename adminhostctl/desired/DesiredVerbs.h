@@ -1,0 +1,14 @@
+#pragma once
+
+// The verbs of the state that a service is to have: reading and writing settings, the file of a whole state, the
+// history.
+
+#include "adminhostctl/Verb.h"
+
+#include <span>
+
+namespace adminhost::ctl {
+
+[[nodiscard]] std::span<const Verb> desiredVerbs() noexcept;
+
+}  // namespace adminhost::ctl

@@ -1,0 +1,2 @@
+set(TEST_LIBS adminhostctl_desired commands)
+set(TEST_ENVIRONMENT "TZ=Europe/Berlin")
