@@ -79,6 +79,11 @@ bool flag(const Dictionary& description, std::string_view key) {
     return description.get(key) == Value(true);
 }
 
+bool needs(const Dictionary& description, std::string_view name) {
+    const Array* all = description.get("needs").array();
+    return all != nullptr && std::find(all->begin(), all->end(), Value(name)) != all->end();
+}
+
 HttpAnswer findingsAnswer(const Value& findings, const Dictionary& first) {
     const std::size_t count = findings.array()->size();
     HttpAnswer answer = errorAnswer(422, "REQUEST_REFUSED",
@@ -338,12 +343,12 @@ void Front::operation(Exchange& exchange, const Address& address) {
     }
     const std::string_view ifMatch = exchange.header("If-Match");
     auto revisions = revisionsOf(ifMatch);
-    if (!ifMatch.empty() && (!revisions || !flag(description, "revisionGuard"))) {
+    if (!ifMatch.empty() && (!revisions || !flag(description, "takesRevision"))) {
         return refuse(
             errorAnswer(400, "PRECONDITION_NOT_UNDERSTOOD",
                         "If-Match takes quoted revisions, and only for a command that depends on the revision."));
     }
-    if (_hello.contains("databaseTool") && flag(description, "needsDatabase")) {
+    if (_hello.contains("databaseTool") && needs(description, "database")) {
         return refuse(
             errorAnswer(500, "SQLITE_TOOL_UNUSABLE",
                         fmt::format("The command needs the database tool, and {}. The daemon tries it when it starts.",
@@ -355,8 +360,8 @@ void Front::operation(Exchange& exchange, const Address& address) {
     operation.order.set("plugin", address.plugin);
     operation.order.set("command", address.command);
     operation.order.set("request", std::move(*request));
-    operation.order.set("wantsRevision", flag(description, "revision"));
-    if (flag(description, "revisionGuard")) {
+    operation.order.set("wantsRevision", flag(description, "showsRevision"));
+    if (flag(description, "takesRevision")) {
         // Whatever depends on the revision replaces settings, and these are kept first.
         operation.order.set("keep", Dictionary{{"when", record.received},
                                                {"who", fmt::format("uid {}", record.peer.uid)},

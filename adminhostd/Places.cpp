@@ -118,7 +118,7 @@ Dictionary workerConfiguration(const Options& options, const PluginSelection& pl
     for (const DiskPath& file : plugins.files) {
         files.emplace_back(file.text());
     }
-    return {{"build", ADMINHOST_BUILD_IDENTITY},
+    return {{"build", ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY},
             {"root", options.root},
             {"plugins", std::move(files)},
             {"languages", options.languages ? *options.languages : languagesOfEnvironment()},

@@ -1,5 +1,6 @@
 #include "adminhostd/PluginFile.h"
 
+#include "adminhostd/PluginCall.h"
 #include "platform/files/FileDescriptor.h"
 
 #include <algorithm>
@@ -7,6 +8,8 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <set>
+#include <utility>
 
 #include <dlfcn.h>
 #include <elf.h>
@@ -20,6 +23,7 @@ namespace {
 
 constexpr std::size_t notesMaximum = std::size_t{64} << 10U;
 constexpr std::size_t segmentsMaximum = 256;
+constexpr std::size_t wordMaximum = 100;  ///< bytes of a plug-in's or a command's name
 
 bool readAt(int file, std::uint64_t offset, void* place, std::size_t size) {
     return ::pread(file, place, size, static_cast<off_t>(offset)) == static_cast<ssize_t>(size);
@@ -47,6 +51,27 @@ std::optional<std::string> identityIn(std::string_view notes) {
         notes.remove_prefix(std::min(notes.size(), padded(header.n_descsz)));
     }
     return std::nullopt;
+}
+
+bool isAddressWord(std::string_view word) {
+    return !word.empty() && word.size() <= wordMaximum && std::all_of(word.begin(), word.end(), [](char c) {
+        return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '-' || c == '_';
+    });
+}
+
+/// The first name that the front cannot serve: not a word, used twice, or "history", an address of the front's own.
+std::optional<std::string> unusableCommand(const std::vector<Command>& commands) {
+    std::set<std::string_view> names;
+    for (const Command& command : commands) {
+        if (!isAddressWord(command.name) || command.name == "history" || !names.insert(command.name).second) {
+            return command.name;
+        }
+    }
+    return std::nullopt;
+}
+
+tl::unexpected<Error> refused(std::string reason) {
+    return failure({"plugin", 0, std::move(reason)});
 }
 
 }  // namespace
@@ -123,42 +148,55 @@ std::optional<std::string> buildIdentityOf(const DiskPath& path, std::string& pr
     return std::nullopt;
 }
 
-const Plugin* loadPlugin(const DiskPath& file, std::string& problem) {
+Result<LoadedPlugin> loadPlugin(const DiskPath& file) {
+    std::string problem;
     const auto identity = buildIdentityOf(file, problem);
     if (!identity) {
-        return nullptr;
+        return refused(problem);
     }
     if (*identity != ADMINHOST_BUILD_IDENTITY) {
-        problem = fmt::format("{} is of another build (\"{}\", this daemon is \"{}\"); install the one of this release",
-                              file.text(), *identity, ADMINHOST_BUILD_IDENTITY);
-        return nullptr;
+        return refused(fmt::format(
+            "{} is for \"{}\", and this daemon loads plug-ins for \"{}\"; install the plug-in's release that "
+            "is made for this daemon",
+            file.text(), *identity, ADMINHOST_BUILD_IDENTITY));
     }
     // A name without a slash would be searched for in the library path.
     const std::string name = file.text().find('/') == std::string::npos ? "./" + file.text() : file.text();
     void* library = ::dlopen(name.c_str(), RTLD_NOW | RTLD_LOCAL);
     if (library == nullptr) {
-        problem = fmt::format("{} cannot be loaded: {}", file.text(), ::dlerror());
-        return nullptr;
+        return refused(fmt::format("{} cannot be loaded: {}", file.text(), ::dlerror()));
     }
-    using EntryPoint = const Plugin* (*)();
+    using EntryPoint = Plugin* (*)();
     const auto entry = reinterpret_cast<EntryPoint>(::dlsym(library, "adminhost_plugin"));
     if (entry == nullptr) {
-        problem = fmt::format("{} has no entry point adminhost_plugin", file.text());
-        return nullptr;
+        return refused(fmt::format("{} has no entry point adminhost_plugin", file.text()));
     }
-    const Plugin* plugin = entry();
-    if (plugin == nullptr || plugin->name == nullptr || plugin->version == nullptr || plugin->describe == nullptr ||
-        plugin->check == nullptr || plugin->revision == nullptr || plugin->perform == nullptr) {
-        problem = fmt::format("{} offers an incomplete table of functions", file.text());
-        return nullptr;
+    auto loaded = callPlugin([&] {
+        LoadedPlugin described;
+        described.plugin = entry();
+        if (described.plugin != nullptr) {
+            described.name = described.plugin->name();
+            described.version = described.plugin->version();
+            described.commands = described.plugin->commands();
+        }
+        return described;
+    });
+    if (!loaded) {
+        return refused(fmt::format("{} failed while it was loaded: {}", file.text(), *loaded.error().description));
     }
-    const std::string_view word = plugin->name;
-    if (word.empty() || word.find_first_not_of("abcdefghijklmnopqrstuvwxyz0123456789_-") != std::string_view::npos ||
-        word == "requests" || word == "directory") {
-        problem = fmt::format("{} has the name \"{}\", which cannot stand in an address", file.text(), word);
-        return nullptr;
+    if (loaded->plugin == nullptr) {
+        return refused(fmt::format("{} has an entry point that returns no plug-in", file.text()));
     }
-    return plugin;
+    if (!isAddressWord(loaded->name) || loaded->name == "requests" || loaded->name == "directory") {
+        return refused(
+            fmt::format("{} has the name \"{}\", which cannot be part of an address", file.text(), loaded->name));
+    }
+    if (const auto command = unusableCommand(loaded->commands)) {
+        return refused(
+            fmt::format("{} describes a command \"{}\", which cannot be part of an address or is described twice",
+                        file.text(), *command));
+    }
+    return loaded;
 }
 
 }  // namespace adminhost

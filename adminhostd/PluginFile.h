@@ -25,8 +25,16 @@ namespace adminhost {
 /// file is no shared object for a 64-bit machine of this kind or carries no note.
 [[nodiscard]] std::optional<std::string> buildIdentityOf(const DiskPath& file, std::string& problem);
 
-/// Loads a plug-in whose note is that of this build. Null, with the problem and its mend, when it is another build's,
-/// cannot be loaded, or has no entry point or an incomplete table. A loaded plug-in stays loaded.
-[[nodiscard]] const Plugin* loadPlugin(const DiskPath& file, std::string& problem);
+struct LoadedPlugin {
+    Plugin* plugin = nullptr;  ///< lives as long as the process
+    std::string name;
+    std::string version;
+    std::vector<Command> commands;
+};
+
+/// Loads a plug-in whose note has this build's identity, and asks it for its name, version and commands. The error's
+/// description names the file, what is wrong and the fix: the note is another one, the file cannot be loaded or has no
+/// entry point, or name or commands cannot be used in addresses. A loaded file stays loaded, also after an error.
+[[nodiscard]] Result<LoadedPlugin> loadPlugin(const DiskPath& file);
 
 }  // namespace adminhost

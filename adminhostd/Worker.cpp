@@ -2,6 +2,7 @@
 
 #include "adminhostd/DatabaseTool.h"
 #include "adminhostd/Frame.h"
+#include "adminhostd/PluginCall.h"
 #include "adminhostd/PluginFile.h"
 #include "adminhostd/SettingsHistory.h"
 #include "platform/directory/Entries.h"
@@ -17,10 +18,10 @@
 #include <csignal>
 #include <exception>
 #include <map>
-#include <set>
 #include <vector>
 
 #include <fmt/format.h>
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
@@ -59,13 +60,15 @@ class Worker {
     void removeLeftovers() const;
     Value perform(const Dictionary& order);
     Value query(const Dictionary& order);
-    static Value history(const Plugin& plugin);
-    Value performWith(const Plugin& plugin, std::string_view command, const Dictionary& order);
+    static Value history(const LoadedPlugin& loaded);
+    static Value performWith(const LoadedPlugin& loaded, std::string_view command, const Dictionary& order);
+    [[nodiscard]] const LoadedPlugin* pluginNamed(std::string_view name) const;
 
     int _descriptor;
     ForwardingSink _sink;
     FrameReader _reader;
-    std::vector<const Plugin*> _plugins;
+    std::vector<std::string> _languages;
+    std::vector<LoadedPlugin> _plugins;
 };
 
 std::string textAt(const Dictionary& dictionary, std::string_view key) {
@@ -73,45 +76,77 @@ std::string textAt(const Dictionary& dictionary, std::string_view key) {
     return text == nullptr ? std::string() : *text;
 }
 
-/// Whether the front can serve commands that are described like this. "history" is an address of the front's own.
-bool namesCommands(const Value& commands) {
-    std::set<std::string> names;
-    const auto named = [&](const Value& command) {
-        const std::string name = command.dictionary() == nullptr ? "" : textAt(*command.dictionary(), "name");
-        return !name.empty() && name != "history" && names.insert(name).second;
-    };
-    return commands.array() != nullptr && std::all_of(commands.array()->begin(), commands.array()->end(), named);
+constexpr std::string_view nameOf(Access access) noexcept {
+    switch (access) {
+        case Access::read:
+            return "read";
+        case Access::write:
+            return "write";
+        case Access::control:
+            return "control";
+        case Access::account:
+            break;
+    }
+    return "account";
+}
+
+/// The command as clients see it.
+Dictionary describe(const Command& command) {
+    Dictionary described{{"name", command.name}};
+    for (const DictionaryEntry& entry : command.description) {
+        described.set(entry.key, entry.value);
+    }
+    described.set("name", command.name);
+    described.set("access", nameOf(command.access));
+    described.set("showsRevision", command.showsRevision);
+    described.set("takesRevision", command.takesRevision);
+    described.set("needs", Array(command.needs.begin(), command.needs.end()));
+    if (command.deadline.count() > 0) {
+        described.set("deadlineSeconds", command.deadline.count());
+    }
+    return described;
 }
 
 void Worker::load(const DiskPath& file, Array& plugins, Array& refused) {
-    std::string problem;
-    const Plugin* plugin = loadPlugin(file, problem);
-    if (plugin != nullptr && std::any_of(_plugins.begin(), _plugins.end(), [&](const Plugin* other) {
-            return std::string_view(other->name) == plugin->name;
-        })) {
-        problem = fmt::format("{}: a plug-in of the name \"{}\" is already loaded", file.text(), plugin->name);
-        plugin = nullptr;
+    auto loaded = loadPlugin(file);
+    std::string problem = loaded ? "" : textOf(loaded.error().description);
+    if (loaded && pluginNamed(loaded->name) != nullptr) {
+        problem = fmt::format("{}: a plug-in of the name \"{}\" is already loaded", file.text(), loaded->name);
     }
-    Value commands = plugin == nullptr ? Value() : plugin->describe();
-    if (plugin != nullptr && !namesCommands(commands)) {
-        problem = fmt::format("{} does not describe its commands, each with a name of its own", file.text());
-        plugin = nullptr;
+    if (loaded && problem.empty()) {
+        const auto configured = callPlugin([&] { loaded->plugin->configure(_languages); });
+        if (!configured) {
+            problem = fmt::format("{} failed while it was configured: {}", file.text(),
+                                  textOf(configured.error().description));
+        }
     }
-    if (plugin == nullptr) {
+    if (!problem.empty()) {
         refused.emplace_back(Dictionary{{"file", file.text()}, {"reason", problem}});
         return;
     }
-    _plugins.push_back(plugin);
-    plugins.emplace_back(Dictionary{{"name", plugin->name},
-                                    {"version", plugin->version},
+    Array commands;
+    for (const Command& command : loaded->commands) {
+        commands.emplace_back(describe(command));
+    }
+    plugins.emplace_back(Dictionary{{"name", loaded->name},
+                                    {"version", loaded->version},
                                     {"file", file.text()},
                                     {"commands", std::move(commands)}});
+    _plugins.push_back(*std::move(loaded));
+}
+
+const LoadedPlugin* Worker::pluginNamed(std::string_view name) const {
+    const auto found =
+        std::find_if(_plugins.begin(), _plugins.end(), [&](const LoadedPlugin& plugin) { return plugin.name == name; });
+    return found == _plugins.end() ? nullptr : &*found;
 }
 
 Value Worker::configure(const Dictionary& configuration) {
     setSystemRoot(textAt(configuration, "root"));
-    if (configuration.contains("languages")) {
-        setUserDefault("BrennLanguages", configuration.get("languages"));
+    if (const Array* languages = configuration.get("languages").array()) {
+        for (const Value& language : *languages) {
+            _languages.push_back(*language.string());
+        }
     }
     if (const std::string uuids = textAt(configuration, "accountUuids"); !uuids.empty()) {
         setDirectoryNodes({localAccounts(HostPath(uuids))});
@@ -141,25 +176,43 @@ Value Worker::configure(const Dictionary& configuration) {
 
 /// Of workers that were killed in the middle of a write.
 void Worker::removeLeftovers() const {
-    for (const Plugin* plugin : _plugins) {
-        if (plugin->settingsFiles == nullptr) {
+    for (const LoadedPlugin& loaded : _plugins) {
+        const auto files = callPlugin([&] { return loaded.plugin->settingsFiles(); });
+        const auto others = callPlugin([&] { return loaded.plugin->leftovers(); });
+        if (!files || !others) {
+            logEvent(fmt::format("adminhostd: the plug-in {} failed to name what interrupted operations left: {}",
+                                 loaded.name, textOf((files ? others : files).error().description)));
             continue;
         }
-        for (const HostPath& file : plugin->settingsFiles()) {
+        for (const HostPath& file : *files) {
             adminhost::removeLeftovers(file);
         }
-        removeUnfinishedHistory(historyDirectory(plugin->name));
+        for (const HostPath& file : *others) {
+            static_cast<void>(::unlink(diskPath(file).c_str()));
+        }
+        removeUnfinishedHistory(historyDirectory(loaded.name));
     }
 }
 
-Value Worker::performWith(const Plugin& plugin, std::string_view command, const Dictionary& order) {
+Value Worker::performWith(const LoadedPlugin& loaded, std::string_view command, const Dictionary& order) {
     const Dictionary nothing;
     const Dictionary* given = order.get("request").dictionary();
     const Dictionary& request = given == nullptr ? nothing : *given;
+    Plugin& plugin = *loaded.plugin;
+    const auto failed = [&](const Error& error) {
+        logEvent(fmt::format("adminhostd: {}/{} failed: {}", loaded.name, command, textOf(error.description)));
+        const char* message = "The operation failed inside the plug-in. The log lines of this request give the reason.";
+        return Dictionary{{"outcome", outcome::error},
+                          {"response", Dictionary{{"error", "INTERNAL_ERROR"}, {"message", message}}}};
+    };
 
-    if (std::vector<Finding> findings = plugin.check(command, request); !findings.empty()) {
+    auto findings = callPlugin([&] { return plugin.check(command, request); });
+    if (!findings) {
+        return failed(findings.error());
+    }
+    if (!findings->empty()) {
         Array list;
-        for (Finding& finding : findings) {
+        for (Finding& finding : *findings) {
             list.emplace_back(Dictionary{{"keyPath", std::move(finding.keyPath)},
                                          {"rule", std::move(finding.rule)},
                                          {"advice", std::move(finding.advice)}});
@@ -170,28 +223,40 @@ Value Worker::performWith(const Plugin& plugin, std::string_view command, const 
         Clock::now() + std::chrono::milliseconds(order.get("milliseconds").integer().value_or(std::int64_t{0}));
     setTaskDeadline(deadline);
     if (const Array* revisions = order.get("ifMatch").array()) {
-        const std::string revision = plugin.revision();
-        if (std::find(revisions->begin(), revisions->end(), Value(revision)) == revisions->end()) {
-            return Dictionary{{"outcome", outcome::changed}, {"revision", revision}};
+        const auto revision = callPlugin([&] { return plugin.revision(); });
+        if (!revision) {
+            return failed(revision.error());
+        }
+        if (std::find(revisions->begin(), revisions->end(), Value(*revision)) == revisions->end()) {
+            return Dictionary{{"outcome", outcome::changed}, {"revision", *revision}};
         }
     }
-    const Dictionary* about = order.get("keep").dictionary();
-    if (about != nullptr && plugin.settingsFiles != nullptr) {
-        // A full disk must not keep an administrator from settings that may mend it: the write goes on.
-        if (const auto error = keepHistory(historyDirectory(plugin.name), plugin.settingsFiles(), *about)) {
+    if (const Dictionary* about = order.get("keep").dictionary()) {
+        // A full disk must not keep an administrator from settings that may fix it: the write goes on.
+        const auto files = callPlugin([&] { return plugin.settingsFiles(); });
+        const auto error = files ? keepHistory(historyDirectory(loaded.name), *files, *about) : files.error();
+        if (error) {
             logEvent("adminhostd: the settings before this write could not be kept: " + textOf(*error));
         }
     }
-    Response response = plugin.perform(command, request);
-    Dictionary answer;
-    if (order.get("wantsRevision") == Value(true) && response.kind() != Response::Kind::error) {
-        answer.set("revision", plugin.revision());
+    auto response = callPlugin([&] { return plugin.perform(command, request); });
+    if (!response) {
+        return failed(response.error());
     }
-    // A tool that was killed at the deadline makes an answer that misleads: only the overrun is told.
+    Dictionary answer;
+    if (order.get("wantsRevision") == Value(true) && response->kind() != Response::Kind::error) {
+        if (auto revision = callPlugin([&] { return plugin.revision(); })) {
+            answer.set("revision", *std::move(revision));
+        } else {
+            logEvent(fmt::format("adminhostd: {} failed to give its revision: {}", loaded.name,
+                                 textOf(revision.error().description)));
+        }
+    }
+    // A tool that was killed at the deadline makes an answer that misleads: only the overrun is reported.
     if (Clock::now() >= deadline) {
         return Dictionary{{"outcome", outcome::overrun}};
     }
-    switch (response.kind()) {
+    switch (response->kind()) {
         case Response::Kind::nothing:
             answer.set("outcome", outcome::nothing);
             break;
@@ -202,33 +267,26 @@ Value Worker::performWith(const Plugin& plugin, std::string_view command, const 
             answer.set("outcome", outcome::error);
             break;
     }
-    answer.set("response", std::move(response.dictionary()));
+    answer.set("response", std::move(response->dictionary()));
     return answer;
 }
 
-/// The settings' history, narrowed to the keys that the plug-in describes as written.
-Value Worker::history(const Plugin& plugin) {
-    constexpr std::string_view prefix = "configuration.";
+/// The settings' history, narrowed to the keys that the plug-in names.
+Value Worker::history(const LoadedPlugin& loaded) {
+    const auto settings = callPlugin([&] { return loaded.plugin->settingKeys(); });
+    if (!settings) {
+        return Dictionary{{"outcome", outcome::broken}, {"message", textOf(settings.error().description)}};
+    }
     std::vector<std::string> keys;
     std::vector<std::string> secrets;
-    const Value described = plugin.describe();
-    for (const Value& command : *described.array()) {
-        const Array* commandKeys = command.dictionary()->get("keys").array();
-        if (command.dictionary()->get("revisionGuard") != Value(true) || commandKeys == nullptr) {
-            continue;
-        }
-        for (const Value& key : *commandKeys) {
-            const std::string path = textAt(*key.dictionary(), "path");
-            if (path.starts_with(prefix) && path.find_first_of(".[", prefix.size()) == std::string::npos) {
-                keys.push_back(path.substr(prefix.size()));
-                if (key.dictionary()->get("secret") == Value(true)) {
-                    secrets.push_back(keys.back());
-                }
-            }
+    for (const Setting& setting : *settings) {
+        keys.push_back(setting.key);
+        if (setting.secret) {
+            secrets.push_back(setting.key);
         }
     }
     Dictionary response;
-    response.set("history", readHistory(historyDirectory(plugin.name), keys, secrets));
+    response.set("history", readHistory(historyDirectory(loaded.name), keys, secrets));
     return Dictionary{{"outcome", outcome::dictionary}, {"response", std::move(response)}};
 }
 
@@ -236,12 +294,11 @@ Value Worker::query(const Dictionary& order) {
     constexpr std::size_t limit = 50;
     if (textAt(order, "query") == "history") {
         const std::string name = textAt(order, "plugin");
-        const auto found =
-            std::find_if(_plugins.begin(), _plugins.end(), [&](const Plugin* plugin) { return name == plugin->name; });
-        if (found == _plugins.end()) {
+        const LoadedPlugin* found = pluginNamed(name);
+        if (found == nullptr) {
             return Dictionary{{"outcome", outcome::broken}, {"message", "The plug-in \"" + name + "\" is not loaded."}};
         }
-        return history(**found);
+        return history(*found);
     }
     Error error;
     const std::string is = textAt(order, "is");
@@ -258,14 +315,12 @@ Value Worker::query(const Dictionary& order) {
 
 Value Worker::perform(const Dictionary& order) {
     const std::string name = textAt(order, "plugin");
-    const auto found =
-        std::find_if(_plugins.begin(), _plugins.end(), [&](const Plugin* plugin) { return name == plugin->name; });
     try {
         if (order.contains("query")) {
             return query(order);
         }
-        if (found != _plugins.end()) {
-            return performWith(**found, textAt(order, "command"), order);
+        if (const LoadedPlugin* found = pluginNamed(name)) {
+            return performWith(*found, textAt(order, "command"), order);
         }
         return Dictionary{{"outcome", outcome::broken}, {"message", "The plug-in \"" + name + "\" is not loaded."}};
     } catch (const std::exception& exception) {
@@ -290,7 +345,7 @@ int Worker::run() {
         }
         bool sent = false;
         if (frame->type == FrameType::configure) {
-            if (textAt(*payload, "build") != ADMINHOST_BUILD_IDENTITY) {
+            if (textAt(*payload, "build") != ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY) {
                 logEvent("adminhostd: the worker is of another release than the daemon; restart the daemon");
                 return 1;
             }

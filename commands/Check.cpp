@@ -280,7 +280,7 @@ class Check {
 
 }  // namespace
 
-std::vector<Finding> checkRequest(std::string_view command, const Dictionary& request) noexcept {
+std::vector<Finding> checkRequest(std::string_view command, const Dictionary& request) {
     std::vector<Finding> findings;
     if (const CommandDescription* description = findCommand(command)) {
         Check(findings).dictionary(request, description->keys, nullptr, {});

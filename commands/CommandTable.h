@@ -76,7 +76,7 @@ struct CommandDescription {
 /// Looked at are the types of described keys and, in change entries, the keys that the entry's change reads. Keys that
 /// no description names pass, and so does a missing key: operations answer for those themselves.
 [[nodiscard]] std::vector<adminhost::Finding> checkRequest(std::string_view command,
-                                                           const adminhost::Dictionary& request) noexcept;
+                                                           const adminhost::Dictionary& request);
 
 /// One step of the descriptions' flat form, from which describeCommands() builds them.
 struct DescriptionToken {

@@ -1,16 +1,15 @@
-// The plug-in's entry point: the one place that names all of it.
+// The plug-in as the daemon's worker sees it: the one place that names all of it.
 
 #include "platform/framework/Plugin.h"
 
 #include "commands/CommandTable.h"
 #include "handler/LumioRequestHandler.h"
-#include "platform/log/Log.h"
 #include "settings/Revision.h"
 
 #include <algorithm>
-#include <exception>
 #include <iterator>
 #include <string>
+#include <vector>
 
 namespace {
 
@@ -22,6 +21,8 @@ struct Operation {
     std::string_view command;
     Response (*perform)(LumioRequestHandler& handler, const Dictionary& request);
 };
+
+constexpr std::string_view passwordKey = "nimbo_client_password";
 
 constexpr Operation operations[] = {
     {"readSettings", [](LumioRequestHandler& h, const Dictionary& r) { return h.readSettingsWithRequest(r); }},
@@ -42,51 +43,96 @@ constexpr Operation operations[] = {
     {"getProperties", [](LumioRequestHandler& h, const Dictionary& r) { return h.getPropertiesWithRequest(r); }},
 };
 
-LumioRequestHandler& handler() {
-    static LumioRequestHandler theHandler;
-    return theHandler;
+const Operation* operationNamed(std::string_view command) noexcept {
+    const auto* found = std::find_if(std::begin(operations), std::end(operations),
+                                     [&](const Operation& row) { return row.command == command; });
+    return found == std::end(operations) ? nullptr : found;
 }
 
-Response perform(std::string_view command, const Dictionary& request) noexcept {
-    const auto* operation = std::find_if(std::begin(operations), std::end(operations),
-                                         [&](const Operation& row) { return row.command == command; });
-    try {
-        if (operation == std::end(operations)) {
-            return Response::error("UNKNOWN_COMMAND", "The plug-in does not serve this command.");
+adminhost::Access accessOf(std::string_view command, bool changes) noexcept {
+    if (command == "createNimboAccount") {
+        return adminhost::Access::account;
+    }
+    if (command == "startService" || command == "stopService" || command == "recycleService") {
+        return adminhost::Access::control;
+    }
+    return changes ? adminhost::Access::write : adminhost::Access::read;
+}
+
+class LumioPlugin final : public adminhost::Plugin {
+  public:
+    std::string_view name() override { return "lumio"; }
+    std::string_view version() override { return ADMINHOST_RELEASE; }
+
+    std::vector<adminhost::Command> commands() override {
+        std::vector<adminhost::Command> all;
+        const adminhost::Value described = lumio::describeCommands();
+        for (const lumio::CommandDescription& row : lumio::commands()) {
+            adminhost::Command command;
+            command.name = row.name;
+            command.access = accessOf(row.name, row.changes);
+            command.showsRevision = row.revision;
+            command.takesRevision = row.revisionGuard;
+            if (row.needsDatabase) {
+                command.needs.emplace_back("database");
+            }
+            command.description = *(*described.array())[all.size()].dictionary();
+            all.push_back(std::move(command));
         }
-        return operation->perform(handler(), request);
-    } catch (const std::exception& exception) {
-        adminhost::logEvent("adminhost_lumio: " + std::string(command) + " failed: " + exception.what());
-    } catch (...) {
-        adminhost::logEvent("adminhost_lumio: " + std::string(command) + " failed");
+        return all;
     }
-    return handler().responseForError("INTERNAL_ERROR");
-}
 
-std::string revision() noexcept {
-    try {
-        return lumio::settingsRevision();
-    } catch (const std::exception& exception) {
-        adminhost::logEvent(std::string("adminhost_lumio: no revision: ") + exception.what());
-        return {};
+    void configure(const std::vector<std::string>& languages) override {
+        adminhost::setUserDefault("BrennLanguages", adminhost::Array(languages.begin(), languages.end()));
     }
-}
 
-std::vector<adminhost::HostPath> settingsFiles() noexcept {
-    return {LumioRequestHandler::identityPreferencesPath(), LumioRequestHandler::clusterPreferencesPath(),
-            LumioRequestHandler::memberPreferencesPath()};
-}
+    std::vector<adminhost::Finding> check(std::string_view command, const Dictionary& request) override {
+        return lumio::checkRequest(command, request);
+    }
 
-constexpr adminhost::Plugin plugin{
-    .name = "lumio",
-    .version = ADMINHOST_RELEASE,
-    .describe = []() noexcept { return lumio::describeCommands(); },
-    .check = lumio::checkRequest,
-    .revision = revision,
-    .perform = perform,
-    .settingsFiles = settingsFiles,
+    Response perform(std::string_view command, const Dictionary& request) override {
+        const Operation* operation = operationNamed(command);
+        return operation == nullptr ? Response::error("UNKNOWN_COMMAND", "The plug-in does not serve this command.")
+                                    : operation->perform(_handler, request);
+    }
+
+    std::string revision() override { return lumio::settingsRevision(); }
+
+    std::vector<adminhost::Setting> settingKeys() override {
+        std::vector<adminhost::Setting> settings;
+        for (const auto& keys :
+             {LumioRequestHandler::identityPreferencesKeysToCopy(), LumioRequestHandler::memberPreferencesKeysToCopy(),
+              LumioRequestHandler::clusterPreferencesKeysToCopy()}) {
+            for (const std::string_view key : keys) {
+                settings.push_back({std::string(key), false});
+            }
+        }
+        settings.push_back({std::string(passwordKey), true});
+        return settings;
+    }
+
+    adminhost::Result<Dictionary> settings() override {
+        Dictionary values;
+        _handler.copyIdentityPreferencesToConfig(values);
+        if (const auto prefs = LumioRequestHandler::memberPreferences()) {
+            LumioRequestHandler::copyKeys(LumioRequestHandler::memberPreferencesKeysToCopy(), *prefs, values);
+        }
+        if (const auto prefs = LumioRequestHandler::clusterPreferences()) {
+            LumioRequestHandler::copyKeys(LumioRequestHandler::clusterPreferencesKeysToCopy(), *prefs, values);
+            LumioRequestHandler::copyKeys({passwordKey}, *prefs, values);  // protected, as it is stored
+        }
+        return values;
+    }
+
+    std::vector<adminhost::HostPath> settingsFiles() override {
+        return {LumioRequestHandler::identityPreferencesPath(), LumioRequestHandler::clusterPreferencesPath(),
+                LumioRequestHandler::memberPreferencesPath()};
+    }
+
+  private:
+    LumioRequestHandler _handler;
 };
 
 }  // namespace
 
-ADMINHOST_PLUGIN(plugin)
+ADMINHOST_PLUGIN(LumioPlugin)

@@ -1,58 +1,146 @@
 #pragma once
 
-// The interface between the administration daemon's worker and a plug-in.
+// The interface between the daemon's worker and a plug-in: a shared object with one object of a class derived from
+// Plugin, placed by ADMINHOST_PLUGIN.
 //
-// A plug-in is a shared object that exports adminhost_plugin() and carries the note of the build that it belongs to
-// (ADMINHOST_PLUGIN places both). The worker reads the note from the file and loads a plug-in of its own build only, so
-// no code of another build ever runs. All calls come from one thread; a plug-in is never unloaded. No function lets an
-// exception out: an operation that fails inside answers the error response "INTERNAL_ERROR" after logging why.
+// One thread makes all calls, and a plug-in is never unloaded. Any function may throw: the worker catches it, logs it
+// and fails that one call ("INTERNAL_ERROR" if it was perform()). A file is loaded only if its note (BuildNote.h) names
+// this interface. A running operation reports what it changes and what it does not carry out through Report.h; the
+// tools that it starts are bound to the deadline of its request (platform/task).
 
 #include "platform/files/Path.h"
 #include "platform/framework/BuildNote.h"
 #include "platform/framework/PluginRequestHandler.h"
+#include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
+#include <chrono>
+#include <cstdint>
 #include <string>
 #include <string_view>
 #include <vector>
 
 namespace adminhost {
 
-/// What a plug-in's check has to say of one place of a request.
-struct Finding {
-    std::string keyPath;  ///< "configuration.properties.0.name"
-    std::string rule;     ///< what does not fit
-    std::string advice;   ///< what to do about it
+/// The right that a client needs for a command. None implies another.
+enum class Access : std::uint8_t {
+    read,     ///< changes nothing
+    write,    ///< changes settings or resources
+    control,  ///< starts or stops something
+    account,  ///< handles accounts or their passwords
 };
 
-struct Plugin {
-    const char* name;     ///< the word in the daemon's addresses: "lumio"
-    const char* version;  ///< the release, "1.0.0"
-    /// The command descriptions: an array of dictionaries, in the order people read them (commands/README.md). The
-    /// daemon reads "name", "needsDatabase" (refused while the database tool is unusable), "revision" (the answer
-    /// carries revision()) and "revisionGuard" (a client may name the revision that must still hold); a missing flag is
-    /// false.
-    Value (*describe)() noexcept;
-    /// Whether the operations can carry the request: everything that is wrong with it, empty when nothing is.
-    std::vector<Finding> (*check)(std::string_view command, const Dictionary& request) noexcept;
-    /// A short digest of what reading settings would show now; empty when the plug-in keeps no revision.
-    std::string (*revision)() noexcept;
-    /// Serves one command of describe().
-    Response (*perform)(std::string_view command, const Dictionary& request) noexcept;
-    /// The files that commands with "revisionGuard" replace, whose top-level keys are those of the request's
-    /// "configuration"; the daemon keeps their history. Null when there is none to keep.
-    std::vector<HostPath> (*settingsFiles)() noexcept = nullptr;
+struct Command {
+    std::string name;                 ///< last word of its address; unique in the plug-in
+    Access access = Access::account;  ///< the strictest, in case that one is forgotten
+    bool showsRevision = false;       ///< its answer carries revision()
+    bool takesRevision = false;       ///< accepts If-Match, and changes settings(): the host keeps their history
+    std::vector<std::string> needs;   ///< names for probe(); each must be usable before perform() is called
+    std::chrono::seconds deadline{};  ///< its own bound; zero: the daemon's
+    /// For clients: summary, keys, answer, errors, example (commands/README.md). The host adds the members above.
+    Dictionary description;
+};
+
+/// One reason why a whole request is refused.
+struct Finding {
+    std::string keyPath;  ///< "configuration.cameras.0.name"
+    std::string rule;     ///< what is wrong
+    std::string advice;   ///< how to fix it
+};
+
+/// Whether something that commands need is usable. Unknown (time-out, no memory) is not unusable: the host asks again
+/// before the next command that needs it.
+struct Probe {
+    enum class State : std::uint8_t { usable, unusable, unknown };
+    State state = State::usable;
+    std::string reason;  ///< "/usr/bin/tool cannot be run (No such file or directory)"
+    std::string fix;     ///< "install the package tool"
+};
+
+/// The result of one check of the installation.
+struct Diagnosis {
+    enum class Health : std::uint8_t { ok, warning, failure };
+    Health health = Health::ok;
+    std::string name;   ///< "database"
+    std::string found;  ///< one sentence
+    std::string fix;    ///< empty if there is nothing to fix
+};
+
+/// A setting whose history the host keeps: a key of Plugin::settings().
+struct Setting {
+    std::string key;
+    bool secret = false;
+};
+
+/// A log file of the service.
+struct LogFile {
+    std::string name;  ///< "startup_log"
+    HostPath path;
+};
+
+/// A configuration file that the plug-in's tools read.
+struct ToolFile {
+    std::string path;  ///< below the directory that XDG_CONFIG_HOME names for the tools: "tool/toolrc"
+    std::string text;
+};
+
+class Plugin {
+  public:
+    Plugin() = default;
+    Plugin(const Plugin&) = delete;
+    Plugin& operator=(const Plugin&) = delete;
+    virtual ~Plugin() = default;
+
+    /// The word in addresses: "lumio". Lower-case letters, digits, "-" and "_".
+    [[nodiscard]] virtual std::string_view name() = 0;
+    /// The plug-in's own release, "1.0.0".
+    [[nodiscard]] virtual std::string_view version() = 0;
+    /// The commands, in the order in which people read them. Called before configure(), perhaps in another process.
+    [[nodiscard]] virtual std::vector<Command> commands() = 0;
+    /// Called once, before any function below. The system root is set already. Languages for texts in answers, the
+    /// preferred one first.
+    virtual void configure(const std::vector<std::string>& languages) = 0;
+
+    /// Returns everything that is wrong with a request; empty if perform() can carry it out. No side effect, no tool.
+    [[nodiscard]] virtual std::vector<Finding> check(std::string_view command, const Dictionary& request) = 0;
+    /// Serves one command of commands().
+    [[nodiscard]] virtual Response perform(std::string_view command, const Dictionary& request) = 0;
+
+    /// Whether what commands need under this name is usable. Called before the first command that needs it, and again
+    /// while the answer is unknown. Ends within 5 seconds.
+    [[nodiscard]] virtual Probe probe(std::string_view /*need*/) { return {}; }
+    /// Checks of the installation, for an administrator. Each ends within 2 seconds.
+    [[nodiscard]] virtual std::vector<Diagnosis> diagnose() { return {}; }
+    /// A short digest of what reading settings would show now; empty if the plug-in has none.
+    [[nodiscard]] virtual std::string revision() { return {}; }
+
+    /// The settings whose history the host keeps, in the order in which people read them.
+    [[nodiscard]] virtual std::vector<Setting> settingKeys() { return {}; }
+    /// Their values as reading shows them now, without those that are not set. The value of a secret is its stored
+    /// (enciphered) form. On an error the host makes no entry and logs the reason.
+    [[nodiscard]] virtual Result<Dictionary> settings() { return Dictionary(); }
+    /// The files in which these settings are stored, whatever their format; some may not exist. The host copies them
+    /// byte for byte into each entry of the history, and removes what an unfinished write left beside them.
+    [[nodiscard]] virtual std::vector<HostPath> settingsFiles() { return {}; }
+
+    [[nodiscard]] virtual std::vector<LogFile> logs() { return {}; }
+    /// Files that an interrupted operation may have left. The host removes them after a worker's start.
+    [[nodiscard]] virtual std::vector<HostPath> leftovers() { return {}; }
+    /// The host writes these files before the first tool is run, in a private directory.
+    [[nodiscard]] virtual std::vector<ToolFile> toolFiles() { return {}; }
 };
 
 }  // namespace adminhost
 
-/// Defines the plug-in's note and its entry point; stands once in a plug-in, at namespace scope.
-#define ADMINHOST_PLUGIN(plugin)                                                                                   \
+/// Defines the plug-in's note and its entry point for a class derived from Plugin. Once in a plug-in, at namespace
+/// scope.
+#define ADMINHOST_PLUGIN(PluginClass)                                                                              \
     extern "C" {                                                                                                   \
     __attribute__((used, aligned(4),                                                                               \
                    section(".note.adminhost"))) static constinit const adminhost::BuildNote adminhost_build_note = \
         adminhost::makeBuildNote(ADMINHOST_BUILD_IDENTITY);                                                        \
-    __attribute__((visibility("default"))) const adminhost::Plugin* adminhost_plugin() noexcept {                  \
-        return &(plugin);                                                                                          \
+    __attribute__((visibility("default"))) adminhost::Plugin* adminhost_plugin() {                                 \
+        static PluginClass plugin;                                                                                 \
+        return &plugin;                                                                                            \
     }                                                                                                              \
     }

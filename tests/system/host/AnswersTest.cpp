@@ -76,6 +76,14 @@ TEST_F(Answers, FrameworkErrorIs500WithItsTwoKeys) {
     EXPECT_EQ(reply.body, "{\"error\":\"SOME_CODE\",\"message\":\"Some sentence.\"}\n");
 }
 
+TEST_F(Answers, WhatAPluginThrowsIsLoggedAndIs500) {
+    const HttpReply reply = client.post("/v1/fixture/throw");
+    expectError(reply, 500, "INTERNAL_ERROR");
+    EXPECT_EQ(reply.body.find("a fault of the plug-in"), std::string::npos) << "only the log gives the reason";
+    EXPECT_TRUE(daemon.waitForLog("adminhostd: fixture/throw failed: a fault of the plug-in\n")) << daemon.log();
+    EXPECT_EQ(client.post("/v1/fixture/echo").status, 200);
+}
+
 TEST_F(Answers, MalformedBodyIs400WithLineAndColumn) {
     const HttpReply reply = client.post("/v1/fixture/echo", "{\n\"a\": }");
     expectError(reply, 400, "MALFORMED_BODY");

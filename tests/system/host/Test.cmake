@@ -11,20 +11,18 @@ if(NOT TARGET fixture_good)
     fixture_plugin(fixture_other_build BadPlugin.cpp BAD_OTHER_BUILD)
     fixture_plugin(fixture_no_note BadPlugin.cpp BAD_NO_NOTE)
     fixture_plugin(fixture_no_entry_point BadPlugin.cpp BAD_NO_ENTRY_POINT)
-    fixture_plugin(fixture_null_table BadPlugin.cpp BAD_NULL_TABLE)
-    fixture_plugin(fixture_incomplete_table BadPlugin.cpp BAD_INCOMPLETE_TABLE)
-    fixture_plugin(fixture_no_description BadPlugin.cpp BAD_NO_DESCRIPTION)
+    fixture_plugin(fixture_null BadPlugin.cpp BAD_NULL)
     fixture_plugin(fixture_bad_name BadPlugin.cpp "BAD_NAME=\"a/b\"")
     fixture_plugin(fixture_reserved_name BadPlugin.cpp "BAD_NAME=\"directory\"")
-    fixture_plugin(fixture_bad_command BadPlugin.cpp "BAD_COMMAND=adminhost::Value(\"echo\")")
-    fixture_plugin(fixture_reserved_command BadPlugin.cpp
-        "BAD_COMMAND=adminhost::Value(adminhost::Dictionary{{\"name\", \"history\"}})")
+    fixture_plugin(fixture_bad_command BadPlugin.cpp "BAD_COMMAND=\"echo/two\"")
+    fixture_plugin(fixture_reserved_command BadPlugin.cpp "BAD_COMMAND=\"history\"")
+    fixture_plugin(fixture_command_twice BadPlugin.cpp "BAD_COMMAND=\"twice\"")
     fixture_plugin(fixture_crashing CrashingPlugin.cpp)
 endif()
 set(TEST_LIBS host)
-set(TEST_DEPENDS adminhostd fixture_good fixture_other_build fixture_no_note fixture_no_entry_point fixture_null_table
-    fixture_incomplete_table fixture_no_description fixture_bad_name fixture_reserved_name fixture_bad_command
-    fixture_reserved_command fixture_crashing)
+set(TEST_DEPENDS adminhostd fixture_good fixture_other_build fixture_no_note fixture_no_entry_point fixture_null
+    fixture_bad_name fixture_reserved_name fixture_bad_command fixture_reserved_command fixture_command_twice
+    fixture_crashing)
 if(NOT TARGET host_fixtures)
     # For programs that run the daemon with the fixture plug-in.
     add_library(host_fixtures INTERFACE)

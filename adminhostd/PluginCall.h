@@ -1,0 +1,30 @@
+#pragma once
+
+// Calling a plug-in: nothing that it throws reaches the host.
+
+#include "platform/value/Result.h"
+
+#include <exception>
+#include <type_traits>
+#include <utility>
+
+namespace adminhost {
+
+/// Calls a function that runs code of a plug-in. What it throws becomes an error with the exception's text.
+template <class Function>
+[[nodiscard]] auto callPlugin(Function&& function) -> Result<std::invoke_result_t<Function>> {
+    try {
+        if constexpr (std::is_void_v<std::invoke_result_t<Function>>) {
+            std::forward<Function>(function)();
+            return {};
+        } else {
+            return std::forward<Function>(function)();
+        }
+    } catch (const std::exception& exception) {
+        return failure({"plugin", 0, exception.what()});
+    } catch (...) {
+        return failure({"plugin", 0, "an exception of unknown type"});
+    }
+}
+
+}  // namespace adminhost
