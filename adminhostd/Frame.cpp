@@ -2,94 +2,148 @@
 
 #include "platform/value/ValueCodec.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <utility>
 
 #include <sys/socket.h>
+#include <sys/uio.h>
 #include <unistd.h>
 
 namespace adminhost {
 namespace {
 
-constexpr std::uint32_t magic = 0x46484144;
+constexpr std::uint32_t magic = 0x46484145;
 
 struct Header {
     std::uint32_t magic;
     std::uint32_t type;
-    std::uint64_t length;
+    std::uint64_t payload;  ///< length
+    std::uint64_t bytes;    ///< length
 };
 
-/// A buffer that once held a large frame gives its memory back.
+/// A reader's buffer that once held a large frame gives its memory back.
 constexpr std::size_t keptCapacity = std::size_t{256} << 10U;
+
+bool fits(const Header& header) {
+    return header.payload <= frameMaximum && header.bytes <= frameMaximum - header.payload;
+}
+
+void clear(std::string& bytes) {
+    ::explicit_bzero(bytes.data(), bytes.size());
+    bytes.clear();
+    if (bytes.capacity() > keptCapacity) {
+        bytes.shrink_to_fit();
+    }
+}
 
 }  // namespace
 
-std::optional<std::string> encodeFrame(FrameType type, const Value& payload) {
+std::optional<std::string> encodeFrame(const Frame& frame) {
     std::string bytes(sizeof(Header), '\0');
-    encodeValue(payload, bytes);
-    const Header header{magic, static_cast<std::uint32_t>(type), bytes.size() - sizeof(Header)};
-    if (header.length > frameMaximum) {
+    encodeValue(frame.payload, bytes);
+    const Header header{magic, static_cast<std::uint32_t>(frame.type), bytes.size() - sizeof(Header),
+                        frame.bytes.size()};
+    if (!fits(header)) {
         return std::nullopt;
     }
     std::memcpy(bytes.data(), &header, sizeof header);
     return bytes;
 }
 
+FrameReader::~FrameReader() {
+    clear(_bytes);
+}
+
 void FrameReader::append(std::string_view bytes) {
-    // Done here and not frame by frame, which for many small ones would move what follows again and again.
-    _bytes.erase(0, std::exchange(_read, 0));
-    if (_bytes.empty() && _bytes.capacity() > keptCapacity) {
-        _bytes.shrink_to_fit();
+    const std::string_view ofBegun = bytes.substr(0, _missing);
+    if (!ofBegun.empty()) {
+        _begun->bytes += ofBegun;
+        _missing -= ofBegun.size();
+        bytes.remove_prefix(ofBegun.size());
     }
-    _bytes.append(bytes);
+    // Done here and not frame by frame, which for many small ones would move what follows again and again.
+    if (const std::size_t read = std::exchange(_read, 0); read == _bytes.size()) {
+        clear(_bytes);
+    } else {
+        _bytes.erase(0, read);
+    }
+    _bytes += bytes;
 }
 
 std::optional<Frame> FrameReader::next() {
+    if (_broken || _missing > 0) {
+        return std::nullopt;
+    }
+    if (_begun) {
+        return std::exchange(_begun, std::nullopt);
+    }
     Header header{};
-    const std::string_view bytes = std::string_view(_bytes).substr(_read);
-    if (_broken || bytes.size() < sizeof header) {
+    std::string_view bytes = std::string_view(_bytes).substr(_read);
+    if (bytes.size() < sizeof header) {
         return std::nullopt;
     }
     std::memcpy(&header, bytes.data(), sizeof header);
     if (header.magic != magic || header.type < static_cast<std::uint32_t>(FrameType::configure) ||
-        header.type > static_cast<std::uint32_t>(FrameType::answer) || header.length > frameMaximum) {
+        header.type > static_cast<std::uint32_t>(FrameType::answer) || !fits(header)) {
         _broken = true;
         return std::nullopt;
     }
-    if (bytes.size() < sizeof header + header.length) {
+    bytes.remove_prefix(sizeof header);
+    if (bytes.size() < header.payload) {
         return std::nullopt;
     }
-    auto payload = decodeValue(bytes.substr(sizeof header, header.length));
+    auto payload = decodeValue(bytes.substr(0, header.payload));
     if (!payload) {
         _broken = true;
         return std::nullopt;
     }
-    _read += sizeof header + header.length;
-    if (_read == _bytes.size() && _bytes.capacity() > keptCapacity) {
-        std::string().swap(_bytes);
+    bytes.remove_prefix(header.payload);
+    Frame frame{static_cast<FrameType>(header.type), std::move(*payload), {}};
+    const std::string_view here = bytes.substr(0, header.bytes);
+    // Memory that is asked for but not written to costs nothing.
+    frame.bytes.reserve(header.bytes);
+    frame.bytes = here;
+    _read += sizeof header + header.payload + here.size();
+    _missing = header.bytes - here.size();
+    if (_read == _bytes.size()) {
+        clear(_bytes);
         _read = 0;
     }
-    return Frame{static_cast<FrameType>(header.type), std::move(*payload)};
+    if (_missing > 0) {
+        _begun = std::move(frame);
+        return std::nullopt;
+    }
+    return frame;
 }
 
-bool writeFrame(int descriptor, FrameType type, const Value& payload) {
-    const auto bytes = encodeFrame(type, payload);
-    if (!bytes) {
+bool writeFrame(int descriptor, const Frame& frame) {
+    auto head = encodeFrame(frame);
+    if (!head) {
         return false;
     }
-    std::string_view left = *bytes;
-    while (!left.empty()) {
-        const ssize_t written = ::send(descriptor, left.data(), left.size(), MSG_NOSIGNAL);
-        if (written < 0 && errno == EINTR) {
+    std::string_view pieces[] = {*head, frame.bytes};
+    bool written = true;
+    while (written && !(pieces[0].empty() && pieces[1].empty())) {
+        iovec places[] = {{const_cast<char*>(pieces[0].data()), pieces[0].size()},
+                          {const_cast<char*>(pieces[1].data()), pieces[1].size()}};
+        msghdr message{};
+        message.msg_iov = places;
+        message.msg_iovlen = std::size(places);
+        const ssize_t count = ::sendmsg(descriptor, &message, MSG_NOSIGNAL);
+        if (count < 0 && errno == EINTR) {
             continue;
         }
-        if (written <= 0) {
-            return false;
+        written = count > 0;
+        std::size_t sent = written ? static_cast<std::size_t>(count) : 0;
+        for (std::string_view& piece : pieces) {
+            const std::size_t ofPiece = std::min(sent, piece.size());
+            piece.remove_prefix(ofPiece);
+            sent -= ofPiece;
         }
-        left.remove_prefix(static_cast<std::size_t>(written));
     }
-    return true;
+    return written;
 }
 
 std::optional<Frame> readFrame(int descriptor, FrameReader& reader) {
@@ -106,6 +160,7 @@ std::optional<Frame> readFrame(int descriptor, FrameReader& reader) {
             return std::nullopt;
         }
         reader.append({buffer, static_cast<std::size_t>(count)});
+        ::explicit_bzero(buffer, static_cast<std::size_t>(count));
     }
 }
 

@@ -1,9 +1,10 @@
 #pragma once
 
-// Frames: what front and worker say to each other over their socket pair.
+// Frames: the units in which front and worker exchange messages (Protocol.h) over their socket pair.
 //
-// A frame is a header (magic, type, length of the payload) and a payload, one encoded value. Both ends are processes of
-// one build; the checks are there so that a broken peer costs an error and never a misreading.
+// A frame is a header (magic, type, two lengths), a payload (one encoded value) and bytes that are passed on as they
+// are. Both ends are processes of one build; the checks turn a broken peer into an error instead of a misreading.
+// Requests may hold secrets: a reader's memory is cleared once it is no longer needed.
 
 #include "platform/value/Value.h"
 
@@ -16,41 +17,53 @@
 namespace adminhost {
 
 enum class FrameType : std::uint32_t {
-    configure = 1,  ///< front to worker, first: what to load and where
-    hello = 2,      ///< worker to front: what was loaded
-    perform = 3,    ///< front to worker: one operation
-    log = 4,        ///< worker to front: one event of the system log, a text
-    answer = 5,     ///< worker to front: the operation's outcome
+    configure = 1,
+    perform,
+    findAccounts,
+    readHistory,
+    hello,
+    log,
+    change,
+    notDone,
+    answer,
 };
 
-constexpr std::size_t frameMaximum = std::size_t{128} << 20U;  ///< bytes of a payload
+constexpr std::size_t frameMaximum = std::size_t{128} << 20U;  ///< bytes of payload and bytes together
 
 struct Frame {
     FrameType type = FrameType::configure;
     Value payload;
+    std::string bytes;
 };
 
-/// The frame's bytes; nothing when the payload is above the maximum.
-[[nodiscard]] std::optional<std::string> encodeFrame(FrameType type, const Value& payload);
+/// The frame's header and payload; its bytes follow. Returns nullopt if they are together above the maximum.
+[[nodiscard]] std::optional<std::string> encodeFrame(const Frame& frame);
 
 /// Puts frames together from the bytes as they arrive.
 class FrameReader {
   public:
+    FrameReader() = default;
+    FrameReader(const FrameReader&) = delete;
+    FrameReader& operator=(const FrameReader&) = delete;
+    ~FrameReader();
+
     void append(std::string_view bytes);
-    /// The next whole frame; nothing while bytes are missing, or when the stream is broken.
+    /// The next whole frame; nullopt while bytes are missing, or if the stream is broken.
     [[nodiscard]] std::optional<Frame> next();
-    /// Whether what arrived is no frame; nothing that comes later can be read.
+    /// Whether the stream has held something that is not a frame. Nothing that comes later can be read.
     [[nodiscard]] bool broken() const noexcept { return _broken; }
 
   private:
-    std::string _bytes;
-    std::size_t _read = 0;  ///< how many of them belong to frames that were taken
+    std::string _bytes;           ///< headers and payloads, and what follows them in the same reading
+    std::size_t _read = 0;        ///< how many of them belong to frames that were returned
+    std::optional<Frame> _begun;  ///< lacks some of its bytes; they are appended to it and not to _bytes
+    std::size_t _missing = 0;
     bool _broken = false;
 };
 
-/// Blocking, on a descriptor: whether the whole frame was written.
-[[nodiscard]] bool writeFrame(int descriptor, FrameType type, const Value& payload);
-/// Blocking: the next frame; nothing at the end of the stream or when it is broken.
+/// Blocking, on a descriptor. Returns false if the frame is too large, or the other end is closed.
+[[nodiscard]] bool writeFrame(int descriptor, const Frame& frame);
+/// Blocking. The next frame; nullopt at the end of the stream or if it is broken.
 [[nodiscard]] std::optional<Frame> readFrame(int descriptor, FrameReader& reader);
 
 }  // namespace adminhost

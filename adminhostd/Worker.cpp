@@ -35,7 +35,7 @@ class ForwardingSink final : public LogSink {
     void write(std::string_view event) noexcept override {
         try {
             // Lost only together with the front itself.
-            static_cast<void>(writeFrame(_descriptor, FrameType::log, Value(event)));
+            static_cast<void>(writeFrame(_descriptor, {FrameType::log, Value(event), {}}));
         } catch (...) {
             return;
         }
@@ -349,16 +349,17 @@ int Worker::run() {
                 logEvent("adminhostd: the worker is of another release than the daemon; restart the daemon");
                 return 1;
             }
-            sent = writeFrame(_descriptor, FrameType::hello, configure(*payload));
+            sent = writeFrame(_descriptor, {FrameType::hello, configure(*payload), {}});
             // Only now: a shared file system that hangs may hold up requests, never the start.
             removeLeftovers();
         } else if (frame->type == FrameType::perform) {
-            sent = writeFrame(_descriptor, FrameType::answer, perform(*payload));
+            sent = writeFrame(_descriptor, {FrameType::answer, perform(*payload), {}});
             setTaskDeadline(std::nullopt);
             if (!sent) {
                 const char* message = "The answer is too large to be sent.";
-                sent = writeFrame(_descriptor, FrameType::answer,
-                                  Dictionary{{"outcome", outcome::broken}, {"message", message}});
+                sent =
+                    writeFrame(_descriptor,
+                               {FrameType::answer, Dictionary{{"outcome", outcome::broken}, {"message", message}}, {}});
             }
         }
         if (!sent) {

@@ -102,7 +102,7 @@ void WorkerProcess::addTo(std::vector<pollfd>& entries) const {
 }
 
 bool WorkerProcess::send(FrameType type, const Value& payload) {
-    auto bytes = encodeFrame(type, payload);
+    auto bytes = encodeFrame({type, payload, {}});
     if (!bytes) {
         return false;
     }

@@ -1,0 +1,395 @@
+#include "adminhostd/Protocol.h"
+
+#include <limits>
+#include <tuple>
+#include <type_traits>
+
+#include <fmt/format.h>
+
+namespace adminhost::protocol {
+namespace {
+
+template <class Owner, class T>
+struct Member {
+    const char* name;
+    T Owner::*place;
+};
+
+template <class Owner, class T>
+consteval Member<Owner, T> member(const char* name, T Owner::*place) {
+    return {name, place};
+}
+
+/// A message's members and their names. The names occur nowhere else: scripts/check looks for them.
+template <class T>
+constexpr std::nullptr_t members = nullptr;
+
+template <>
+constexpr auto members<Caller> = std::tuple(member("caller.uid", &Caller::uid), member("caller.pid", &Caller::pid));
+template <>
+constexpr auto members<Configure> = std::tuple(member("configure.build", &Configure::build),
+                                               member("configure.root", &Configure::root),
+                                               member("configure.accountUuids", &Configure::accountUuids),
+                                               member("configure.plugins", &Configure::plugins),
+                                               member("configure.languages", &Configure::languages),
+                                               member("configure.toolEnvironment", &Configure::toolEnvironment),
+                                               member("configure.tryOnly", &Configure::tryOnly));
+template <>
+constexpr auto members<Perform> = std::tuple(
+    member("perform.request", &Perform::request), member("perform.plugin", &Perform::plugin),
+    member("perform.command", &Perform::command), member("perform.caller", &Perform::caller),
+    member("perform.received", &Perform::received), member("perform.arguments", &Perform::arguments),
+    member("perform.revisions", &Perform::revisions), member("perform.showsRevision", &Perform::showsRevision),
+    member("perform.keepsHistory", &Perform::keepsHistory), member("perform.milliseconds", &Perform::milliseconds),
+    member("perform.form", &Perform::form));
+template <>
+constexpr auto members<FindAccounts> = std::tuple(member("findAccounts.match", &FindAccounts::match),
+                                                  member("findAccounts.is", &FindAccounts::is),
+                                                  member("findAccounts.form", &FindAccounts::form));
+template <>
+constexpr auto members<ReadHistory> = std::tuple(member("readHistory.plugin", &ReadHistory::plugin),
+                                                 member("readHistory.form", &ReadHistory::form));
+template <>
+constexpr auto members<DescribedCommand> = std::tuple(member("command.name", &DescribedCommand::name),
+                                                      member("command.needsDatabase", &DescribedCommand::needsDatabase),
+                                                      member("command.showsRevision", &DescribedCommand::showsRevision),
+                                                      member("command.takesRevision", &DescribedCommand::takesRevision),
+                                                      member("command.description", &DescribedCommand::description));
+template <>
+constexpr auto members<LoadedPlugin> = std::tuple(member("loaded.name", &LoadedPlugin::name),
+                                                  member("loaded.version", &LoadedPlugin::version),
+                                                  member("loaded.file", &LoadedPlugin::file),
+                                                  member("loaded.commands", &LoadedPlugin::commands));
+template <>
+constexpr auto members<RefusedPlugin> = std::tuple(member("refused.file", &RefusedPlugin::file),
+                                                   member("refused.reason", &RefusedPlugin::reason));
+template <>
+constexpr auto members<Hello> = std::tuple(member("hello.plugins", &Hello::plugins),
+                                           member("hello.refused", &Hello::refused),
+                                           member("hello.databaseTool", &Hello::databaseTool));
+template <>
+constexpr auto members<Log> = std::tuple(member("log.event", &Log::event));
+template <>
+constexpr auto members<Change> = std::tuple(member("change.section", &Change::section),
+                                            member("change.identity", &Change::identity),
+                                            member("change.name", &Change::name), member("change.key", &Change::key),
+                                            member("change.from", &Change::from), member("change.to", &Change::to),
+                                            member("change.secret", &Change::secret),
+                                            member("change.undo", &Change::undo));
+template <>
+constexpr auto members<NotDone> = std::tuple(member("notDone.keyPath", &NotDone::keyPath),
+                                             member("notDone.reason", &NotDone::reason),
+                                             member("notDone.toolMessage", &NotDone::toolMessage));
+template <>
+constexpr auto members<Finding> = std::tuple(member("finding.keyPath", &Finding::keyPath),
+                                             member("finding.rule", &Finding::rule),
+                                             member("finding.advice", &Finding::advice));
+/// Answer::bytes is not among them: it is behind the dictionary, in the frame.
+template <>
+constexpr auto members<Answer> = std::tuple(member("answer.outcome", &Answer::outcome),
+                                            member("answer.error", &Answer::error),
+                                            member("answer.message", &Answer::message),
+                                            member("answer.findings", &Answer::findings),
+                                            member("answer.revision", &Answer::revision),
+                                            member("answer.form", &Answer::form));
+
+template <class E>
+struct Word {
+    E value;
+    const char* text;
+};
+
+constexpr Word<Outcome> outcomeWords[] = {
+    {Outcome::nothing, "nothing"}, {Outcome::answered, "answered"}, {Outcome::error, "error"},
+    {Outcome::refused, "refused"}, {Outcome::conflict, "conflict"}, {Outcome::overrun, "overrun"},
+    {Outcome::broken, "broken"},
+};
+constexpr Word<BodyForm> formWords[] = {{BodyForm::json, "json"}, {BodyForm::propertyList, "propertyList"}};
+
+constexpr auto& wordsOf(Outcome) {
+    return outcomeWords;
+}
+constexpr auto& wordsOf(BodyForm) {
+    return formWords;
+}
+
+template <class T>
+constexpr bool isStruct = !std::is_same_v<std::remove_cvref_t<decltype(members<T>)>, std::nullptr_t>;
+template <class T>
+constexpr bool isVector = false;
+template <class T>
+constexpr bool isVector<std::vector<T>> = true;
+
+// A null Value is an absent member.
+
+Value encoded(Value value) {
+    return value;
+}
+Value encoded(std::string text) {
+    return text;
+}
+Value encoded(Dictionary dictionary) {
+    return dictionary;
+}
+Value encoded(Date date) {
+    return date;
+}
+Value encoded(std::optional<std::string> text) {
+    return text ? Value(std::move(*text)) : Value();
+}
+Value encoded(std::map<std::string, std::string> texts) {
+    Dictionary dictionary;
+    for (auto& [key, text] : texts) {
+        dictionary.set(key, std::move(text));
+    }
+    return dictionary;
+}
+
+template <class T>
+Value encoded(T message) {
+    if constexpr (std::is_integral_v<T>) {
+        return message;
+    } else if constexpr (std::is_enum_v<T>) {
+        for (const auto& word : wordsOf(message)) {
+            if (word.value == message) {
+                return word.text;
+            }
+        }
+        return {};
+    } else if constexpr (isVector<T>) {
+        Array array;
+        array.reserve(message.size());
+        for (auto& element : message) {
+            array.push_back(encoded(std::move(element)));
+        }
+        return array;
+    } else {
+        static_assert(isStruct<T>);
+        Dictionary dictionary;
+        std::apply(
+            [&](const auto&... each) { (dictionary.set(each.name, encoded(std::move(message.*each.place))), ...); },
+            members<T>);
+        return dictionary;
+    }
+}
+
+/// Reads members out of their encoding. Keeps the name of the first that is missing or wrong.
+class Decoder {
+  public:
+    [[nodiscard]] const std::string& problem() const noexcept { return _problem; }
+    bool fail(std::string problem) {
+        _problem = std::move(problem);
+        return false;
+    }
+
+    // Each gets the member's value, null if it is absent, and returns whether it fits.
+    bool read(Value* found, std::string& into) { return take(found == nullptr ? nullptr : text(*found), into); }
+    bool read(Value* found, Dictionary& into) { return take(found == nullptr ? nullptr : found->dictionary(), into); }
+    bool read(Value* found, Value& into) {
+        if (found != nullptr) {
+            into = std::move(*found);
+        }
+        return true;
+    }
+    bool read(Value* found, std::optional<std::string>& into) {
+        return found == nullptr || read(found, into.emplace());
+    }
+    bool read(Value* found, Date& into) {
+        const auto date = found == nullptr ? std::nullopt : found->date();
+        into = date.value_or(Date());
+        return date.has_value();
+    }
+    bool read(Value* found, bool& into) {
+        const auto boolean = found == nullptr ? std::nullopt : found->boolean();
+        into = boolean.value_or(false);
+        return boolean.has_value();
+    }
+    bool read(Value* found, std::map<std::string, std::string>& into) {
+        const Dictionary* texts = found == nullptr ? nullptr : found->dictionary();
+        if (texts == nullptr) {
+            return false;
+        }
+        for (const DictionaryEntry& entry : *texts) {
+            if (entry.value.string() == nullptr) {
+                return false;
+            }
+            into.emplace(entry.key, *entry.value.string());
+        }
+        return true;
+    }
+
+    template <class T>
+    bool read(Value* found, T& into) {
+        if (found == nullptr) {
+            return false;
+        }
+        if constexpr (std::is_integral_v<T>) {
+            return readNumber(*found, into);
+        } else if constexpr (std::is_enum_v<T>) {
+            for (const auto& word : wordsOf(into)) {
+                if (found->string() != nullptr && *found->string() == word.text) {
+                    into = word.value;
+                    return true;
+                }
+            }
+            return false;
+        } else if constexpr (isVector<T>) {
+            Array* array = found->array();
+            if (array == nullptr) {
+                return false;
+            }
+            for (Value& element : *array) {
+                if (!read(&element, into.emplace_back())) {
+                    return false;
+                }
+            }
+            return true;
+        } else {
+            static_assert(isStruct<T>);
+            return readStruct(*found, into);
+        }
+    }
+
+  private:
+    template <class T>
+    static bool take(T* found, T& into) {
+        if (found == nullptr) {
+            return false;
+        }
+        into = std::move(*found);
+        return true;
+    }
+
+    static std::string* text(Value& value) {
+        // The value is a frame's own and about to be dropped: its text is moved, not copied.
+        return const_cast<std::string*>(value.string());
+    }
+
+    template <class T>
+    static bool readNumber(const Value& found, T& into) {
+        if constexpr (std::is_unsigned_v<T>) {
+            const auto number = found.unsignedInteger();
+            into = static_cast<T>(number.value_or(0));
+            return number && *number <= std::numeric_limits<T>::max();
+        } else {
+            const auto number = found.integer();
+            into = static_cast<T>(number.value_or(0));
+            return number && *number <= std::numeric_limits<T>::max() && *number >= std::numeric_limits<T>::min();
+        }
+    }
+
+    template <class T>
+    bool readStruct(Value& value, T& into) {
+        Dictionary* dictionary = value.dictionary();
+        if (dictionary == nullptr) {
+            return false;
+        }
+        std::size_t known = 0;
+        const auto one = [&](const auto& each) {
+            Value* found = dictionary->find(each.name);
+            known += found == nullptr ? 0 : 1;
+            if (read(found, into.*each.place)) {
+                return true;
+            }
+            return _problem.empty() ? fail(fmt::format("{} is missing or wrong", each.name)) : false;
+        };
+        if (!std::apply([&](const auto&... each) { return (one(each) && ...); }, members<T>)) {
+            return false;
+        }
+        return known == dictionary->size() || fail("a dictionary has a surplus member");
+    }
+
+    std::string _problem;
+};
+
+template <class T>
+constexpr FrameType typeOf = FrameType::configure;
+template <>
+constexpr FrameType typeOf<Perform> = FrameType::perform;
+template <>
+constexpr FrameType typeOf<FindAccounts> = FrameType::findAccounts;
+template <>
+constexpr FrameType typeOf<ReadHistory> = FrameType::readHistory;
+template <>
+constexpr FrameType typeOf<Hello> = FrameType::hello;
+template <>
+constexpr FrameType typeOf<Log> = FrameType::log;
+template <>
+constexpr FrameType typeOf<Change> = FrameType::change;
+template <>
+constexpr FrameType typeOf<NotDone> = FrameType::notDone;
+template <>
+constexpr FrameType typeOf<Answer> = FrameType::answer;
+
+Frame encodedFrame(auto message) {
+    return std::visit(
+        []<class T>(T&& one) {
+            Frame frame;
+            frame.type = typeOf<T>;
+            if constexpr (std::is_same_v<T, Answer>) {
+                frame.bytes = std::move(one.bytes);
+            }
+            frame.payload = encoded(std::forward<T>(one));
+            return frame;
+        },
+        std::move(message));
+}
+
+/// Fills the alternative of the frame's type; false if there is none of it.
+template <class T>
+bool decodeAs(Frame& frame, auto& message, Decoder& decoder, bool& fits) {
+    if (frame.type != typeOf<T>) {
+        return false;
+    }
+    T& one = message.template emplace<T>();
+    fits = decoder.read(&frame.payload, one);
+    if constexpr (std::is_same_v<T, Answer>) {
+        one.bytes = std::move(frame.bytes);
+        if (fits && one.outcome == Outcome::refused && one.findings.empty()) {
+            fits = decoder.fail("a refusal has no finding");
+        }
+    } else if (fits && !frame.bytes.empty()) {
+        fits = decoder.fail("bytes follow a message that has none");
+    }
+    return true;
+}
+
+template <class... Ts>
+Result<std::variant<Ts...>> decoded(Frame& frame) {
+    std::variant<Ts...> message;
+    Decoder decoder;
+    bool fits = false;
+    if (!(decodeAs<Ts>(frame, message, decoder, fits) || ...)) {
+        return failure({"protocol", 1, "a message of this type is not for this side"});
+    }
+    if (!fits) {
+        return failure(
+            {"protocol", 2, decoder.problem().empty() ? "the message is not a dictionary" : decoder.problem()});
+    }
+    return message;
+}
+
+template <class... Ts>
+Result<std::variant<Ts...>> decodedLike(Frame& frame, const std::variant<Ts...>*) {
+    return decoded<Ts...>(frame);
+}
+
+}  // namespace
+
+Frame frameOf(ToWorker message) {
+    return encodedFrame(std::move(message));
+}
+
+Frame frameOf(ToFront message) {
+    return encodedFrame(std::move(message));
+}
+
+Result<ToWorker> toWorker(Frame frame) {
+    return decodedLike(frame, static_cast<const ToWorker*>(nullptr));
+}
+
+Result<ToFront> toFront(Frame frame) {
+    return decodedLike(frame, static_cast<const ToFront*>(nullptr));
+}
+
+}  // namespace adminhost::protocol

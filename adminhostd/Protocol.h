@@ -1,0 +1,151 @@
+#pragma once
+
+// The messages between front and worker: one struct for each.
+//
+// They travel as frames (Frame.h). Dictionaries are only their encoding, which Protocol.cpp alone knows. Decoding is
+// strict: an unknown word, a missing or surplus member and a value of another type are errors, and the peer that sent
+// them is ended.
+
+#include "adminhostd/Frame.h"
+#include "adminhostd/RequestBody.h"
+#include "platform/framework/Plugin.h"
+#include "platform/framework/Report.h"
+#include "platform/value/Result.h"
+#include "platform/value/Value.h"
+
+#include <cstdint>
+#include <map>
+#include <optional>
+#include <string>
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include <sys/types.h>
+
+namespace adminhost::protocol {
+
+/// What the worker made of a request. What the front itself makes of one that no worker finished is in
+/// OperationQueue.h.
+enum class Outcome {
+    nothing,   ///< the operation returned nothing
+    answered,  ///< bytes: the answer
+    error,     ///< error, message; bytes: the error response
+    refused,   ///< findings, never empty: the plug-in's check refuses the request
+    conflict,  ///< none of the revisions holds
+    overrun,   ///< the deadline passed
+    broken,    ///< message: the worker could not do it
+};
+
+/// The client, as the kernel knew it when it connected.
+struct Caller {
+    uid_t uid = 0;
+    pid_t pid = 0;
+    bool operator==(const Caller&) const = default;
+};
+
+// From the front to the worker.
+
+/// First, and once.
+struct Configure {
+    std::string build;  ///< the front's; must be the worker's
+    std::string root;
+    std::string accountUuids;  ///< host path of a file; empty: none
+    std::vector<std::string> plugins;
+    std::vector<std::string> languages;
+    std::map<std::string, std::string> toolEnvironment;
+    bool tryOnly = false;  ///< only to see what loads: nothing is cleaned up
+    bool operator==(const Configure&) const = default;
+};
+
+/// One operation of a plug-in.
+struct Perform {
+    std::string request;  ///< its id
+    std::string plugin;
+    std::string command;
+    Caller caller;
+    Date received;
+    Dictionary arguments;
+    std::vector<std::string> revisions;  ///< one of them must hold; empty: no condition
+    bool showsRevision = false;          ///< the answer is to carry the revision
+    bool keepsHistory = false;           ///< the settings are to be kept before it runs
+    std::uint64_t milliseconds = 0;      ///< until its deadline
+    BodyForm form = BodyForm::json;      ///< that the client wants
+    bool operator==(const Perform&) const = default;
+};
+
+/// People and groups by the beginning of their names or, if `is` is not empty, those with exactly that name or UUID.
+struct FindAccounts {
+    std::string match;
+    std::string is;
+    BodyForm form = BodyForm::json;
+    bool operator==(const FindAccounts&) const = default;
+};
+
+/// The history of a plug-in's settings.
+struct ReadHistory {
+    std::string plugin;
+    BodyForm form = BodyForm::json;
+    bool operator==(const ReadHistory&) const = default;
+};
+
+using ToWorker = std::variant<Configure, Perform, FindAccounts, ReadHistory>;
+
+// From the worker to the front.
+
+struct DescribedCommand {
+    std::string name;
+    bool needsDatabase = false;
+    bool showsRevision = false;
+    bool takesRevision = false;
+    Dictionary description;  ///< for clients
+    bool operator==(const DescribedCommand&) const = default;
+};
+struct LoadedPlugin {
+    std::string name;
+    std::string version;
+    std::string file;
+    std::vector<DescribedCommand> commands;
+    bool operator==(const LoadedPlugin&) const = default;
+};
+struct RefusedPlugin {
+    std::string file;
+    std::string reason;
+    bool operator==(const RefusedPlugin&) const = default;
+};
+
+/// The answer to Configure.
+struct Hello {
+    std::vector<LoadedPlugin> plugins;
+    std::vector<RefusedPlugin> refused;
+    std::optional<std::string> databaseTool;  ///< why commands that need it are refused
+    bool operator==(const Hello&) const = default;
+};
+
+/// One event for the system log. Log, Change and NotDone are sent when they happen; while an operation runs they belong
+/// to it.
+struct Log {
+    std::string event;
+    bool operator==(const Log&) const = default;
+};
+
+/// The answer to Perform, FindAccounts and ReadHistory.
+struct Answer {
+    Outcome outcome = Outcome::broken;
+    std::string error;               ///< a code
+    std::string message;             ///< a sentence
+    std::vector<Finding> findings;   ///< of refused
+    std::string revision;            ///< after the operation; empty: not asked for, or not known
+    BodyForm form = BodyForm::json;  ///< of bytes: JSON also where a property list cannot carry the answer
+    std::string bytes;               ///< the whole body; the front passes it on unread
+};
+
+using ToFront = std::variant<Hello, Log, Change, NotDone, Answer>;
+
+[[nodiscard]] Frame frameOf(ToWorker message);
+[[nodiscard]] Frame frameOf(ToFront message);
+/// The message of a frame. Error: the frame is not exactly one message to this side.
+[[nodiscard]] Result<ToWorker> toWorker(Frame frame);
+[[nodiscard]] Result<ToFront> toFront(Frame frame);
+
+}  // namespace adminhost::protocol

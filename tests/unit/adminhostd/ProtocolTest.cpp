@@ -1,0 +1,217 @@
+#include "adminhostd/Protocol.h"
+
+#include <gtest/gtest.h>
+
+namespace adminhost {
+
+static bool operator==(const Finding& a, const Finding& b) {
+    return std::tie(a.keyPath, a.rule, a.advice) == std::tie(b.keyPath, b.rule, b.advice);
+}
+
+namespace protocol {
+
+static bool operator==(const Answer& a, const Answer& b) {
+    return std::tie(a.outcome, a.error, a.message, a.findings, a.revision, a.form, a.bytes) ==
+           std::tie(b.outcome, b.error, b.message, b.findings, b.revision, b.form, b.bytes);
+}
+
+namespace {
+
+using namespace std::chrono_literals;
+
+// No member of a sample has its default value, so that one that is not carried is noticed.
+
+Perform perform() {
+    return {.request = "1-2",
+            .plugin = "p",
+            .command = "c",
+            .caller = {7, 8},
+            .received = Date(90s),
+            .arguments = Dictionary{{"a", Array{Value(1), Value(Dictionary{{"b", 2.5}})}}},
+            .revisions = {"r1", ""},
+            .showsRevision = true,
+            .keepsHistory = true,
+            .milliseconds = 300'000,
+            .form = BodyForm::propertyList};
+}
+
+std::vector<ToWorker> messagesToWorker() {
+    return {Configure{.build = "b",
+                      .root = "/r",
+                      .accountUuids = "/u",
+                      .plugins = {"/a.so", "/b.so"},
+                      .languages = {"de"},
+                      .toolEnvironment = {{"A", "1"}, {"B", ""}},
+                      .tryOnly = true},
+            perform(), FindAccounts{"ma", "is", BodyForm::propertyList}, ReadHistory{"p", BodyForm::propertyList}};
+}
+
+Answer answer(Outcome outcome) {
+    return {.outcome = outcome,
+            .error = "CODE",
+            .message = "A sentence.",
+            .findings = {{"a.0", "is bad", "leave it out"}, {"b", "", ""}},
+            .revision = "r2",
+            .form = BodyForm::propertyList,
+            .bytes = "<plist/>"};
+}
+
+std::vector<ToFront> messagesToFront() {
+    std::vector<ToFront> messages{
+        Hello{.plugins = {{.name = "p",
+                           .version = "1",
+                           .file = "/p.so",
+                           .commands = {{"c", true, true, true, Dictionary{{"summary", "s"}}}, {"d", {}, {}, {}, {}}}}},
+              .refused = {{"/q.so", "why"}},
+              .databaseTool = "none"},
+        Hello{},
+        Log{"an event"},
+        Change{"cameras", "U", "Studio", "users", Value(1), Value("b"), true, Dictionary{{"k", 1}}},
+        Change{"settings", "", "", "k", {}, {}, false, {}},
+        NotDone{"configuration.a", "why", "words"}};
+    for (const Outcome outcome : {Outcome::nothing, Outcome::answered, Outcome::error, Outcome::refused,
+                                  Outcome::conflict, Outcome::overrun, Outcome::broken}) {
+        messages.emplace_back(answer(outcome));
+    }
+    return messages;
+}
+
+std::string bytesOf(const Frame& frame) {
+    return *encodeFrame(frame) + frame.bytes;
+}
+
+std::optional<Frame> frameFrom(std::string_view bytes) {
+    FrameReader reader;
+    reader.append(bytes);
+    return reader.next();
+}
+
+TEST(Protocol, MessageToTheWorkerArrivesWithEveryMember) {
+    for (const ToWorker& message : messagesToWorker()) {
+        const auto read = toWorker(*frameFrom(bytesOf(frameOf(message))));
+        ASSERT_TRUE(read) << read.error().description.value_or("");
+        EXPECT_TRUE(*read == message) << message.index();
+    }
+}
+
+TEST(Protocol, MessageToTheFrontArrivesWithEveryMember) {
+    for (const ToFront& message : messagesToFront()) {
+        const auto read = toFront(*frameFrom(bytesOf(frameOf(message))));
+        ASSERT_TRUE(read) << read.error().description.value_or("");
+        EXPECT_TRUE(*read == message) << message.index();
+    }
+}
+
+TEST(Protocol, MessageForTheOtherSideIsAnError) {
+    for (const ToWorker& message : messagesToWorker()) {
+        EXPECT_FALSE(toFront(frameOf(message)));
+    }
+    for (const ToFront& message : messagesToFront()) {
+        EXPECT_FALSE(toWorker(frameOf(message)));
+    }
+}
+
+/// Calls the function with the payload of every message, and of each whatever is wrong with the payload.
+template <class Decode>
+void spoilEveryMember(const auto& messages, Decode decode) {
+    for (const auto& message : messages) {
+        const Frame frame = frameOf(message);
+        Frame surplus = frame;
+        surplus.payload.dictionary()->set("surplus", 1);
+        EXPECT_FALSE(decode(surplus)) << message.index();
+        for (const Value& other : {Value(), Value("text"), Value(Array{})}) {
+            EXPECT_FALSE(decode({frame.type, other, {}})) << message.index();
+        }
+        for (const DictionaryEntry& entry : *frame.payload.dictionary()) {
+            Frame missing = frame;
+            missing.payload.dictionary()->remove(entry.key);
+            Frame wrong = frame;
+            wrong.payload.dictionary()->set(entry.key, Value(Data{1}));
+            const bool mayBeAbsent = entry.key.ends_with(".databaseTool") || entry.key.ends_with(".from") ||
+                                     entry.key.ends_with(".to") || entry.key.ends_with(".undo");
+            const bool mayBeAnything = mayBeAbsent && !entry.key.ends_with(".databaseTool");
+            EXPECT_EQ(decode(missing).has_value(), mayBeAbsent) << entry.key;
+            EXPECT_EQ(decode(wrong).has_value(), mayBeAnything) << entry.key;
+        }
+    }
+}
+
+TEST(Protocol, MissingSurplusOrWrongMemberIsAnError) {
+    spoilEveryMember(messagesToWorker(), toWorker);
+    spoilEveryMember(messagesToFront(), toFront);
+}
+
+TEST(Protocol, BytesBehindAMessageThatHasNoneAreAnError) {
+    Frame frame = frameOf(Log{"an event"});
+    frame.bytes = "x";
+    const auto read = toFront(frame);
+    ASSERT_FALSE(read);
+    EXPECT_EQ(read.error().description, "bytes follow a message that has none");
+}
+
+TEST(Protocol, UnknownWordIsAnError) {
+    Frame frame = frameOf(answer(Outcome::answered));
+    for (const DictionaryEntry& entry : Dictionary(*frame.payload.dictionary())) {
+        if (entry.value == Value("answered")) {
+            frame.payload.dictionary()->set(entry.key, "Answered");
+        }
+    }
+    const auto read = toFront(frame);
+    ASSERT_FALSE(read);
+    EXPECT_NE(read.error().description->find("is missing or wrong"), std::string::npos);
+}
+
+TEST(Protocol, NumberOutsideTheRangeOfItsMemberIsAnError) {
+    for (const Value& number : {Value(-1), Value(std::int64_t{1} << 40)}) {
+        Frame frame = frameOf(perform());
+        for (const DictionaryEntry& entry : Dictionary(*frame.payload.dictionary())) {
+            const Dictionary* caller = entry.value.dictionary();
+            if (caller != nullptr && caller->size() == 2) {
+                Dictionary changed;
+                for (const DictionaryEntry& one : *caller) {
+                    changed.set(one.key, number);
+                }
+                frame.payload.dictionary()->set(entry.key, changed);
+            }
+        }
+        EXPECT_FALSE(toWorker(frame));
+    }
+}
+
+TEST(Protocol, RefusalWithoutFindingsIsAnError) {
+    Answer refused = answer(Outcome::refused);
+    refused.findings.clear();
+    EXPECT_FALSE(toFront(frameOf(refused)));
+}
+
+/// Changes each bit; what is still accepted must be a message like any other: it encodes, and to the same again.
+template <class Decode>
+void changeEveryBit(const auto& messages, Decode decode) {
+    for (const auto& message : messages) {
+        const std::string bytes = bytesOf(frameOf(message));
+        for (std::size_t bit = 0; bit < bytes.size() * 8; ++bit) {
+            std::string changed = bytes;
+            changed[bit / 8] = static_cast<char>(changed[bit / 8] ^ (1 << (bit % 8)));
+            auto frame = frameFrom(changed);
+            if (!frame) {
+                continue;
+            }
+            const auto read = decode(std::move(*frame));
+            if (read) {
+                const std::string once = bytesOf(frameOf(*read));
+                const auto again = decode(*frameFrom(once));
+                ASSERT_TRUE(again) << "message " << message.index() << ", bit " << bit;
+                EXPECT_EQ(bytesOf(frameOf(*again)), once) << "message " << message.index() << ", bit " << bit;
+            }
+        }
+    }
+}
+
+TEST(Protocol, EachSingleBitChangeIsRejectedOrIsAnotherValidMessage) {
+    changeEveryBit(messagesToWorker(), toWorker);
+    changeEveryBit(messagesToFront(), toFront);
+}
+
+}  // namespace
+}  // namespace protocol
+}  // namespace adminhost
