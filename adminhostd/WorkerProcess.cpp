@@ -1,5 +1,7 @@
 #include "adminhostd/WorkerProcess.h"
 
+#include "platform/task/StartChild.h"
+
 #include <cerrno>
 #include <csignal>
 #include <cstring>
@@ -8,17 +10,14 @@
 
 #include <fcntl.h>
 #include <fmt/format.h>
-#include <spawn.h>
 #include <sys/socket.h>
-#include <sys/syscall.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 namespace adminhost {
 namespace {
 
-/// The worker finds its end of the conversation here.
-constexpr int workerDescriptor = 3;
 /// Bytes that are read in one go. A worker that never stops talking must not keep the front from its clients.
 constexpr std::size_t readMaximum = std::size_t{1} << 20U;
 
@@ -32,30 +31,6 @@ std::string workerProgram() {
     return ::access(beside.c_str(), X_OK) == 0 ? beside : directory + "../lib/adminhostd/adminhostd-worker";
 }
 
-class SpawnPlan {
-  public:
-    SpawnPlan() {
-        ::posix_spawn_file_actions_init(&actions);
-        ::posix_spawnattr_init(&attributes);
-        sigset_t none;
-        sigset_t all;
-        ::sigemptyset(&none);
-        ::sigfillset(&all);
-        ::posix_spawnattr_setsigmask(&attributes, &none);
-        ::posix_spawnattr_setsigdefault(&attributes, &all);
-        ::posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
-    }
-    SpawnPlan(const SpawnPlan&) = delete;
-    SpawnPlan& operator=(const SpawnPlan&) = delete;
-    ~SpawnPlan() {
-        ::posix_spawn_file_actions_destroy(&actions);
-        ::posix_spawnattr_destroy(&attributes);
-    }
-
-    posix_spawn_file_actions_t actions;
-    posix_spawnattr_t attributes;
-};
-
 }  // namespace
 
 std::unique_ptr<WorkerProcess> WorkerProcess::start(bool outputToStandardError) {
@@ -68,23 +43,20 @@ std::unique_ptr<WorkerProcess> WorkerProcess::start(bool outputToStandardError) 
     const FileDescriptor other(ends[1]);
     ::fcntl(ends[0], F_SETFL, O_NONBLOCK);
 
-    SpawnPlan plan;
-    ::posix_spawn_file_actions_addopen(&plan.actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-    if (outputToStandardError) {
-        ::posix_spawn_file_actions_adddup2(&plan.actions, STDERR_FILENO, STDOUT_FILENO);
-    }
-    ::posix_spawn_file_actions_adddup2(&plan.actions, other.get(), workerDescriptor);
-    const std::string program = workerProgram();
-    char name[] = "adminhostd-worker";
-    char* arguments[] = {name, nullptr};
-    const int failure =
-        ::posix_spawn(&worker->_pid, program.c_str(), &plan.actions, &plan.attributes, arguments, environ);
-    if (failure != 0) {
-        worker->_pid = -1;
-        errno = failure;
+    ChildPlan plan;
+    plan.program = workerProgram();
+    plan.arguments = {"adminhostd-worker"};
+    plan.environment = processEnvironment();
+    plan.descriptors = {-1, outputToStandardError ? STDERR_FILENO : STDOUT_FILENO, STDERR_FILENO, other.get()};
+    plan.directory = "/";
+    plan.fileModeMask = S_IWGRP | S_IWOTH;
+    auto started = startChild(plan);
+    if (!started) {
+        errno = static_cast<int>(started.error().code);
         return nullptr;
     }
-    worker->_process = FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, worker->_pid, 0)));
+    worker->_pid = started->pid;
+    worker->_process = std::move(started->exit);
     return worker;
 }
 

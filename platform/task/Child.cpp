@@ -1,71 +1,17 @@
 #include "platform/task/Child.h"
 
+#include "platform/task/StartChild.h"
+
 #include <cerrno>
 #include <csignal>
+#include <utility>
 
 #include <fcntl.h>
-#include <spawn.h>
-#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 namespace adminhost {
 namespace {
-
-class SpawnAttributes {
-  public:
-    SpawnAttributes() noexcept : _failure(::posix_spawnattr_init(&_attributes)) {}
-    SpawnAttributes(const SpawnAttributes&) = delete;
-    SpawnAttributes& operator=(const SpawnAttributes&) = delete;
-    ~SpawnAttributes() { ::posix_spawnattr_destroy(&_attributes); }
-
-    /// A process group of its own, no signal blocked, every signal at its default. The system's error number.
-    int set() noexcept {
-        sigset_t none{};
-        sigset_t all{};
-        ::sigemptyset(&none);
-        ::sigfillset(&all);
-        note(::posix_spawnattr_setsigmask(&_attributes, &none));
-        note(::posix_spawnattr_setsigdefault(&_attributes, &all));
-        note(::posix_spawnattr_setpgroup(&_attributes, 0));
-        note(::posix_spawnattr_setflags(&_attributes,
-                                        POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETPGROUP));
-        return _failure;
-    }
-    [[nodiscard]] const posix_spawnattr_t* get() const noexcept { return &_attributes; }
-
-  private:
-    void note(int failure) noexcept { _failure = _failure != 0 ? _failure : failure; }
-
-    posix_spawnattr_t _attributes{};
-    int _failure;
-};
-
-class SpawnActions {
-  public:
-    SpawnActions() noexcept : _failure(::posix_spawn_file_actions_init(&_actions)) {}
-    SpawnActions(const SpawnActions&) = delete;
-    SpawnActions& operator=(const SpawnActions&) = delete;
-    ~SpawnActions() { ::posix_spawn_file_actions_destroy(&_actions); }
-
-    /// The three standard streams and no other descriptor. input is -1 for /dev/null.
-    int set(int input, int output, int error) noexcept {
-        note(input < 0 ? ::posix_spawn_file_actions_addopen(&_actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0)
-                       : ::posix_spawn_file_actions_adddup2(&_actions, input, STDIN_FILENO));
-        note(::posix_spawn_file_actions_adddup2(&_actions, output, STDOUT_FILENO));
-        note(::posix_spawn_file_actions_adddup2(&_actions, error, STDERR_FILENO));
-        // All of ours are close-on-exec; this is for those that a library opened without it.
-        note(::posix_spawn_file_actions_addclosefrom_np(&_actions, STDERR_FILENO + 1));
-        return _failure;
-    }
-    [[nodiscard]] const posix_spawn_file_actions_t* get() const noexcept { return &_actions; }
-
-  private:
-    void note(int failure) noexcept { _failure = _failure != 0 ? _failure : failure; }
-
-    posix_spawn_file_actions_t _actions{};
-    int _failure;
-};
 
 /// A descriptor above the standard streams: a process that was started with one of them closed would otherwise get
 /// pipe ends in their places, and setting up the child's streams would overwrite one end with another.
@@ -90,29 +36,6 @@ int makePipe(FileDescriptor& readEnd, FileDescriptor& writeEnd, bool oursIsRead)
     return done ? 0 : errno;
 }
 
-/// The null-terminated vector of the exec family. It points into the texts and does not change them.
-std::vector<char*> pointersTo(const std::string* first, const std::vector<std::string>& texts) {
-    std::vector<char*> pointers;
-    pointers.reserve(texts.size() + 2);
-    if (first != nullptr) {
-        pointers.push_back(const_cast<char*>(first->c_str()));
-    }
-    for (const std::string& text : texts) {
-        pointers.push_back(const_cast<char*>(text.c_str()));
-    }
-    pointers.push_back(nullptr);
-    return pointers;
-}
-
-bool holdsNul(const std::vector<std::string>& texts) noexcept {
-    for (const std::string& text : texts) {
-        if (text.find('\0') != std::string::npos) {
-            return true;
-        }
-    }
-    return false;
-}
-
 }  // namespace
 
 Child::~Child() {
@@ -121,11 +44,7 @@ Child::~Child() {
 }
 
 int Child::start(const std::string& tool, const std::vector<std::string>& arguments,
-                 const std::vector<std::string>& environment, bool withInput) {
-    if (!tool.starts_with('/') || tool.find('\0') != std::string::npos || holdsNul(arguments) ||
-        holdsNul(environment)) {
-        return EINVAL;
-    }
+                 std::vector<std::string> environment, bool withInput) {
     FileDescriptor childInput;
     FileDescriptor childOutput;
     FileDescriptor childError;
@@ -138,26 +57,20 @@ int Child::start(const std::string& tool, const std::vector<std::string>& argume
     if (const int failure = makePipe(error, childError, true); failure != 0) {
         return failure;
     }
-    SpawnAttributes attributes;
-    if (const int failure = attributes.set(); failure != 0) {
-        return failure;
+    ChildPlan plan;
+    plan.program = tool;
+    plan.arguments.reserve(arguments.size() + 1);
+    plan.arguments.push_back(tool);
+    plan.arguments.insert(plan.arguments.end(), arguments.begin(), arguments.end());
+    plan.environment = std::move(environment);
+    plan.descriptors = {childInput.get(), childOutput.get(), childError.get()};
+    auto started = startChild(plan);
+    if (!started) {
+        return static_cast<int>(started.error().code);
     }
-    SpawnActions actions;
-    if (const int failure = actions.set(childInput.get(), childOutput.get(), childError.get()); failure != 0) {
-        return failure;
-    }
-    const std::vector<char*> argumentPointers = pointersTo(&tool, arguments);
-    const std::vector<char*> environmentPointers = pointersTo(nullptr, environment);
-    pid_t pid = 0;
-    if (const int failure = ::posix_spawn(&pid, tool.c_str(), actions.get(), attributes.get(), argumentPointers.data(),
-                                          environmentPointers.data());
-        failure != 0) {
-        return failure;
-    }
-    _pid = pid;
-    // The C library declares its wrapper without C linkage.
-    exit = FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
-    return exit.isOpen() ? 0 : errno;
+    _pid = started->pid;
+    exit = std::move(started->exit);
+    return 0;
 }
 
 void Child::kill() noexcept {

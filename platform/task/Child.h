@@ -21,9 +21,9 @@ class Child {
     ~Child();
 
     /// Starts the tool in a process group of its own; withInput says whether it reads a pipe instead of /dev/null.
-    /// Answers the system's error number, 0 for success. Called once.
+    /// Returns the system's error number, 0 for success. Called once.
     [[nodiscard]] int start(const std::string& tool, const std::vector<std::string>& arguments,
-                            const std::vector<std::string>& environment, bool withInput);
+                            std::vector<std::string> environment, bool withInput);
 
     /// SIGKILL for the child's process group; without effect once it has been waited for.
     void kill() noexcept;

@@ -2,6 +2,7 @@
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/task/Child.h"
+#include "platform/task/StartChild.h"
 #include "platform/task/TaskBounds.h"
 #include "platform/value/Text.h"
 
@@ -179,13 +180,8 @@ bool converse(Child& child, std::string_view input, Capture& output, Capture& er
 std::vector<std::string> environmentWith(const Environment& first, const Environment& second) {
     Environment added = second;
     added.insert(first.begin(), first.end());
-    std::vector<std::string> all;
-    for (char** entry = environ; entry != nullptr && *entry != nullptr; ++entry) {
-        const std::string_view text = *entry;
-        if (!added.contains(std::string(text.substr(0, text.find('='))))) {
-            all.emplace_back(text);
-        }
-    }
+    std::vector<std::string> all = processEnvironment();
+    std::erase_if(all, [&](const std::string& entry) { return added.contains(entry.substr(0, entry.find('='))); });
     for (const auto& [name, value] : added) {
         all.emplace_back(name).append(1, '=').append(value);
     }

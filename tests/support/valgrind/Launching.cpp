@@ -1,21 +1,17 @@
-// Preloaded into test programs that run below valgrind: what launching a child process needs and valgrind 3.19 lacks.
-// - pidfd_open(2), which it answers with ENOSYS: a descriptor that turns readable when the child has exited; the child
-//   is not waited for.
-// - posix_spawn(3) answering that the program cannot be executed: valgrind's child shares no memory with its parent to
-//   tell it. Here the usual reasons are looked for before.
+// Preloaded into test programs that run below valgrind: what starting a child needs and valgrind 3.19 does not have.
+// - pidfd_open(2): returns a descriptor that becomes readable when the child has exited, and does not reap the child.
+// - execve(2) that fails with E2BIG. Valgrind checks the program's file itself, and ends the child when the call fails
+//   for another reason.
 
 #include <array>
 #include <cerrno>
 #include <cstdarg>
 #include <cstring>
-#include <string_view>
 #include <system_error>
 #include <thread>
 
 #include <dlfcn.h>
 #include <fcntl.h>
-#include <spawn.h>
-#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -43,29 +39,6 @@ int readableAfterExitOf(pid_t child) noexcept {
     return pipe[0];
 }
 
-/// The error of execve(2), 0 if none is to be expected.
-int whyItCannotBeExecuted(const char* path, char* const* argv) noexcept {
-    constexpr std::size_t longestArgument = 32 * 4096 - 1;
-    for (char* const* argument = argv; *argument != nullptr; ++argument) {
-        if (std::strlen(*argument) > longestArgument) {
-            return E2BIG;
-        }
-    }
-    if (::access(path, X_OK) != 0) {
-        return errno;
-    }
-    struct stat status {};
-    if (::stat(path, &status) == 0 && !S_ISREG(status.st_mode)) {
-        return EACCES;
-    }
-    std::array<char, 4> start{};
-    const int file = ::open(path, O_RDONLY | O_CLOEXEC);
-    const bool isRead = ::read(file, start.data(), start.size()) >= 0;
-    ::close(file);
-    const std::string_view magic(start.data(), start.size());
-    return isRead && magic != "\177ELF" && !magic.starts_with("#!") ? ENOEXEC : 0;
-}
-
 template <class Function>
 Function realFunction(Function /*mine*/, const char* name) noexcept {
     return reinterpret_cast<Function>(::dlsym(RTLD_NEXT, name));
@@ -73,13 +46,16 @@ Function realFunction(Function /*mine*/, const char* name) noexcept {
 
 }  // namespace
 
-extern "C" int posix_spawn(pid_t* pid, const char* path, const posix_spawn_file_actions_t* actions,
-                           const posix_spawnattr_t* attributes, char* const* argv, char* const* envp) {
-    if (const int failure = whyItCannotBeExecuted(path, argv); failure != 0) {
-        return failure;
+extern "C" int execve(const char* path, char* const* argv, char* const* envp) noexcept {
+    constexpr std::size_t longestArgument = 32 * 4096 - 1;
+    for (char* const* argument = argv; *argument != nullptr; ++argument) {
+        if (std::strlen(*argument) > longestArgument) {
+            errno = E2BIG;
+            return -1;
+        }
     }
-    static const auto real = realFunction(&posix_spawn, "posix_spawn");
-    return real(pid, path, actions, attributes, argv, envp);
+    static const auto real = realFunction(&execve, "execve");
+    return real(path, argv, envp);
 }
 
 extern "C" long syscall(long number, ...) noexcept {
