@@ -59,8 +59,8 @@ void appendText(std::string& text, const Value& value, std::size_t indent) {
             }
             break;
         case Value::Type::real: {
-            char buffer[64];
-            const auto end = std::to_chars(buffer, buffer + sizeof buffer, *value.real()).ptr;
+            char buffer[512];  // the longest texts, of the smallest numbers, have about 330 characters
+            const auto end = std::to_chars(buffer, buffer + sizeof buffer, *value.real(), std::chars_format::fixed).ptr;
             text.append(buffer, end);
             break;
         }
@@ -260,6 +260,8 @@ std::optional<Date> localDateOf(std::string_view text) {
 }
 
 std::string localTextOf(Date date) {
+    // localtime_r alone keeps the zone that was read last.
+    ::tzset();
     const std::time_t seconds = date.time_since_epoch().count();
     std::tm parts{};
     ::localtime_r(&seconds, &parts);

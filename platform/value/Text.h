@@ -12,8 +12,10 @@
 namespace adminhost {
 
 /// The text that log lines, messages and statements show for a value: null is "(null)", true "1", false "0", a number
-/// its shortest decimal form, a string itself, a date "2026-01-31 08:00:00 +0000" (UTC), data its bytes in hexadecimal
-/// between angle brackets; arrays and dictionaries are written on indented lines between parentheses and braces.
+/// its shortest decimal form without an exponent (100000.0 is "100000", a very large or small one has all its digits;
+/// "inf" and "nan" are what no digits can show), a string itself, a date "2026-01-31 08:00:00 +0000" (UTC), data its
+/// bytes in hexadecimal between angle brackets; arrays and dictionaries are written on indented lines between
+/// parentheses and braces.
 [[nodiscard]] std::string textOf(const Value& value);
 /// A missing text is "(null)".
 [[nodiscard]] std::string textOf(const std::optional<std::string>& text);
@@ -28,9 +30,9 @@ namespace adminhost {
 [[nodiscard]] bool flagOf(const Value& value) noexcept;
 
 /// Local time in the form "%Y-%m-%d %H:%M:%S". The whole text must be such a date, and a real one of the calendar;
-/// inside a daylight-saving gap the C library's choice holds. Nothing if it is not.
+/// inside a daylight-saving gap the C library's choice holds. Returns nullopt if it is not.
 [[nodiscard]] std::optional<Date> localDateOf(std::string_view text);
-/// The same form, for writing.
+/// The same form, for writing. Follows a change of the machine's time zone at once; reading does within a second.
 [[nodiscard]] std::string localTextOf(Date date);
 
 /// Whether the text is well-formed UTF-8 (RFC 3629: no overlong forms, no surrogates, nothing above U+10FFFF).

@@ -2,6 +2,8 @@
 
 #include <cstdlib>
 #include <ctime>
+#include <limits>
+#include <string>
 
 #include <gtest/gtest.h>
 
@@ -22,6 +24,29 @@ TEST(TextOf, ShowsEachKindAsDocumented) {
     EXPECT_EQ(textOf(Value(Array{Value(1), Value("b")})), "(\n    1,\n    b\n)");
     EXPECT_EQ(textOf(Value(Dictionary{{"k", Array{}}})), "{\n    k = (\n    );\n}");
     EXPECT_EQ(textOf(std::optional<std::string>()), "(null)");
+}
+
+TEST(TextOf, RealsAreWrittenWithoutAnExponent) {
+    EXPECT_EQ(textOf(Value(99999.0)), "99999");
+    EXPECT_EQ(textOf(Value(100000.0)), "100000");
+    EXPECT_EQ(textOf(Value(-1234567.0)), "-1234567");
+    EXPECT_EQ(textOf(Value(9007199254740992.0)), "9007199254740992");
+    EXPECT_EQ(textOf(Value(1e22)), "10000000000000000000000");
+    EXPECT_EQ(textOf(Value(0.00001)), "0.00001");
+    EXPECT_EQ(textOf(Value(1.5e-7)), "0.00000015");
+    EXPECT_EQ(textOf(Value(-0.0)), "-0");
+    EXPECT_EQ(textOf(Value(std::numeric_limits<double>::infinity())), "inf");
+    EXPECT_EQ(textOf(Value(-std::numeric_limits<double>::infinity())), "-inf");
+}
+
+TEST(TextOf, EveryRealIsReadBackFromItsText) {
+    using Limits = std::numeric_limits<double>;
+    for (const double number : {0.1, 1.0 / 3, 1e300, 123456.789, Limits::max(), Limits::lowest(), Limits::min(),
+                                Limits::denorm_min(), -Limits::denorm_min()}) {
+        const std::string text = textOf(Value(number));
+        EXPECT_EQ(text.find('e'), std::string::npos) << text;
+        EXPECT_EQ(std::strtod(text.c_str(), nullptr), number) << text;
+    }
 }
 
 TEST(TextOf, ErrorIsDomainCodeAndDescription) {
@@ -97,6 +122,14 @@ TEST_F(LocalDate, AnotherZoneCountsForADayThatWasReadBefore) {
     const auto after = localDateOf("2026-01-31 09:00:00");
     ASSERT_TRUE(before && after);
     EXPECT_EQ(*before - *after, std::chrono::minutes(285));
+}
+
+TEST_F(LocalDate, WritingFollowsAChangeOfTheZoneAtOnce) {
+    const Date date{std::chrono::seconds(1769846400)};
+    EXPECT_EQ(localTextOf(date), "2026-01-31 09:00:00");
+    ::setenv("TZ", "Asia/Kathmandu", 1);
+    EXPECT_EQ(localTextOf(date), "2026-01-31 13:45:00");
+    EXPECT_EQ(localDateOf("2026-01-31 13:45:00"), date);
 }
 
 TEST_F(LocalDate, InsideADaylightSavingGapIsStillADate) {
