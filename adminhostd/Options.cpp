@@ -107,8 +107,8 @@ Array languagesOfEnvironment() {
                 languages.emplace_back(std::move(language));
             }
         }
-        if (!languages.empty()) {
-            break;  // each variable overrides those after it
+        if (text != nullptr && *text != '\0') {
+            break;  // each variable overrides those after it, also with "C": then no language is preferred
         }
     }
     return languages;

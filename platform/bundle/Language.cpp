@@ -78,10 +78,10 @@ const std::unordered_map<std::string, std::string>& codesByName() {
     return codes;
 }
 
-/// A code begins with the two or three letters of its language. Names of three letters are few, and ICU knows which of
-/// such texts are codes.
+/// A code begins with the two or three letters of its language; what follows begins with one of "-_.@". Names of three
+/// letters are few, and ICU knows which of such texts are codes.
 bool isCode(std::string_view text) {
-    const std::size_t letters = std::min(text.find_first_of("-_"), text.size());
+    const std::size_t letters = std::min(text.find_first_of("-_.@"), text.size());
     const auto isLetter = [](char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); };
     if (letters < 2 || letters > 3 || !std::all_of(text.begin(), text.begin() + static_cast<long>(letters), isLetter)) {
         return false;

@@ -8,8 +8,9 @@
 
 namespace adminhost {
 
-/// Whether the text names a language: an English name ("French", "Simplified Chinese"; in any case, "_" and "-" may
-/// stand for blanks) or a code ("fr", "pt_BR", "zh-Hant").
+/// Returns true for an English name of a language ("French", "Simplified Chinese"; in upper or lower case, with "_" or
+/// "-" for a blank) and for a code ("fr", "pt_BR", "zh-Hant", also as the C library writes it: "de_DE.UTF-8",
+/// "fr@euro").
 [[nodiscard]] bool isLanguage(std::string_view nameOrCode);
 
 /// The localizations that suit the preferred languages, best first, each at most once. For every preferred language in

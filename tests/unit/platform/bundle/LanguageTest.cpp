@@ -8,13 +8,13 @@ namespace {
 using Names = std::vector<std::string>;
 
 TEST(Language, NamesAndCodesAreLanguages) {
-    for (const char* language :
-         {"English", "French", "german", "SPANISH", "Simplified Chinese", "traditional-chinese", "Brazilian_Portuguese",
-          "Farsi", "en", "fr", "pt_BR", "pt-br", "zh-Hant", "zh_Hant_HK", "de_DE", "gsw", "haw"}) {
+    for (const char* language : {"English", "French", "german", "SPANISH", "Simplified Chinese", "traditional-chinese",
+                                 "Brazilian_Portuguese", "Farsi", "en", "fr", "pt_BR", "pt-br", "zh-Hant", "zh_Hant_HK",
+                                 "de_DE", "gsw", "haw", "fr@euro", "de.UTF-8"}) {
         EXPECT_TRUE(isLanguage(language)) << language;
     }
-    for (const char* other :
-         {"", "Base", "Contents", "Resources", "MacOS", "images", "e", "12", "x", "-", "_", "\xC3\xA9"}) {
+    for (const char* other : {"", "Base", "Contents", "Resources", "Programs", "images", "e", "12", "x", "-", "_",
+                              "@euro", ".UTF-8", "\xC3\xA9"}) {
         EXPECT_FALSE(isLanguage(other)) << other;
     }
     EXPECT_FALSE(isLanguage(std::string(100000, 'x')));
@@ -54,6 +54,7 @@ TEST(Matching, PlainLanguageComesAfterTheRegionalOneAndBeforeOtherRegions) {
     EXPECT_EQ(matchingLocalizations({"fr", "fr-BE", "fr-CA"}, {"fr-CA"}), (Names{"fr-CA", "fr", "fr-BE"}));
     EXPECT_EQ(matchingLocalizations({"en", "en-AU"}, {"en-GB"}), (Names{"en", "en-AU"}));
     EXPECT_EQ(matchingLocalizations({"de"}, {"de_AT.UTF-8"}), (Names{"de"}));
+    EXPECT_EQ(matchingLocalizations({"fr-CA", "fr"}, {"fr@euro"}), (Names{"fr", "fr-CA"}));
 }
 
 TEST(Matching, NeverAnotherLanguageAndNeverAnotherScript) {
