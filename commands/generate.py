@@ -36,10 +36,13 @@ RULE_TEXTS = {
 CHANGES = {"added": "changeAdded", "removed": "changeRemoved", "changed": "changeChanged", "ignored": "changeNothing"}
 UNITS = ["bytes", "megabytes", "seconds", "minutes", "people"]
 
-COMMAND_WORDS = {"order", "summary", "description", "needs_database", "revision", "revision_guard", "changes", "available",
+COMMAND_WORDS = {"order", "summary", "description", "needs_database", "revision", "revision_guard", "changes", "state", "available",
                  "errors", "keys", "answer", "include", "example"}
-KEY_WORDS = {"type", "entered_as", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"}
-ANSWER_WORDS = {"type", "unit", "secret", "column", "help"}
+# What programs that compare and write a desired state have to know of a key (README.md).
+STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_file", "kind", "kinds", "secret_if", "file",
+               "locates", "restart", "looked_up", "shown_by"}
+KEY_WORDS = {"type", "entered_as", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"} | STATE_WORDS
+ANSWER_WORDS = {"type", "unit", "secret", "column", "help", "title", "kind"}
 ENTRY_WORDS = {"added_by", "removed_by", "first", "leading_zeros", "otherwise", "added_kinds", "columns", "together"}
 
 
@@ -72,6 +75,11 @@ def check_keys(keys, words, what):
         need(key.get("unit", "bytes") in UNITS, f"{where}: unknown unit")
         need(set(key.get("entry", {})) <= ENTRY_WORDS, f"{where}: unknown word in entry")
         need(key.get("help", "").strip(), f"{where}: help is missing")
+        for word in ("identity", "kind"):  # of a list's element: keys of it
+            need(word not in key or f"{path}.{key[word]}" in keys, f"{where}: {word} is not described")
+        need(all(f"{path}.{below}" in keys for below in key.get("title", [])), f"{where}: title is not described")
+        need("secret_if" not in key or f"{parent(path)}.{key['secret_if']}" in keys, f"{where}: secret_if is not described")
+        need(key.get("looked_up", "local_name") == "local_name", f"{where}: unknown word in looked_up")
         above = parent(path)
         if above:
             need(above in keys, f"{where}: {above} is not described")
@@ -160,6 +168,9 @@ def load(directory):
                     command["example"][what] = value
         except Wrong as error:
             raise Wrong(f"{name}.toml: {error}") from error
+    for word in ("read", "write"):
+        need(sum(command.get("state") == word for command in commands.values()) <= 1, f"two commands have state = {word}")
+    need(all(command.get("state", "read") in ("read", "write") for command in commands.values()), "state is read or write")
     orders = [command["order"] for command in commands.values()]
     need(len(set(orders)) == len(orders), "two commands have the same order")
     return dict(sorted(commands.items(), key=lambda item: item[1]["order"]))
@@ -177,10 +188,21 @@ def key_description(path, key):
     for word in ("allowed", "rules"):
         if key.get(word):
             described[word] = key[word]
-    for word in ("unit", "column"):
+    for word in ("unit", "column", "title"):
         if key.get(word):
             described[word] = key[word]
+    for word in sorted(STATE_WORDS):
+        if key.get(word):
+            described[camel(word)] = key[word]
+    for word in ("added_by", "removed_by"):
+        if key.get("entry", {}).get(word):
+            described[camel(word)] = key["entry"][word]
     return described
+
+
+def camel(word):
+    first, *rest = word.split("_")
+    return first + "".join(part.capitalize() for part in rest)
 
 
 def describe(name, command):
@@ -192,6 +214,7 @@ def describe(name, command):
         "revision": command.get("revision", False),
         "revisionGuard": command.get("revision_guard", False),
         "changes": command.get("changes", False),
+        **({"state": command["state"]} if "state" in command else {}),
         "keys": [key_description(path, key) for path, key in command["keys"].items()],
         "answer": [key_description(path, key) for path, key in command["all_answers"].items()],
         "errors": command.get("errors", []),

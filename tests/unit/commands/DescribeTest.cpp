@@ -73,6 +73,21 @@ TEST(CommandTable, PasswordsAreSecret) {
     EXPECT_EQ(keyOf(describe("createNimboAccount"), "keys", "directoryNode").get("secret"), Value());
 }
 
+TEST(CommandTable, ClientsLearnHowToCompareAndWriteTheState) {
+    EXPECT_EQ(describe("readSettings").get("state"), Value("read"));
+    const Dictionary write = describe("writeSettings");
+    EXPECT_EQ(write.get("state"), Value("write"));
+    const Dictionary camera = keyOf(write, "keys", "configuration.cameras[]");
+    EXPECT_EQ(camera.get("section"), Value("cameras"));
+    EXPECT_EQ(camera.get("byIdentity"), Value(true));
+    EXPECT_EQ(camera.get("removedBy"), Value("_obsoleteid_"));
+    EXPECT_FALSE(camera.contains("addedBy")) << "the service adds cameras, not the administrator";
+    const Dictionary person = keyOf(write, "keys", "configuration.cameras[].allowedUsersAndGroups[]");
+    EXPECT_EQ(person.get("kinds"), Value(Dictionary{{"user", "users"}, {"group", "groups"}}));
+    EXPECT_EQ(keyOf(write, "keys", "configuration.shared_filesystem").get("locates"),
+              Value(adminhost::Array{"member", "cluster"}));
+}
+
 TEST(CommandTable, AnAnswerTakesOverTheKeysOfOtherAnswers) {
     EXPECT_EQ(keyOf(describe("readSettings"), "answer", "configuration.cameras[].created_at").get("type"),
               Value("date"));

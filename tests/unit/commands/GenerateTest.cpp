@@ -72,6 +72,17 @@ TEST_F(Generate, RefusesWhatIsNotRightAndNamesTheFile) {
     EXPECT_THAT(with("order = 1", "order = "), HasSubstr("doIt.toml: "));
 }
 
+TEST_F(Generate, RefusesWordsOfTheDesiredStateThatNameNothing) {
+    EXPECT_THAT(with("order = 1", "order = 1\nstate = \"change\""), HasSubstr("state is read or write"));
+    EXPECT_THAT(with("help", "identity = \"_id_\"\nhelp"), HasSubstr("key a: identity is not described"));
+    EXPECT_THAT(with("help", "secret_if = \"hidden\"\nhelp"), HasSubstr("key a: secret_if is not described"));
+    EXPECT_THAT(with("help", "looked_up = \"always\"\nhelp"), HasSubstr("key a: unknown word in looked_up"));
+    EXPECT_THAT(with("help", "file = \"main\"\nlocates = [\"main\"]\nhelp"), HasSubstr("status 0"));
+    EXPECT_THAT(with("order = 1", "order = 1\nstate = \"write\""), HasSubstr("status 0"));
+    write("doThat.toml", std::string(sound).replace(0, 9, "order = 2\nstate = \"write\""));
+    EXPECT_THAT(table(), HasSubstr("two commands have state = write"));
+}
+
 TEST_F(Generate, RefusesTwoCommandsOfTheSameOrder) {
     write("doIt.toml", sound);
     write("doThat.toml", sound);
