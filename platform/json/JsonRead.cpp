@@ -232,7 +232,15 @@ std::optional<Value> parseJson(std::string_view text, Error* error, std::size_t 
     Builder builder(valuesMaximum);
     if (Builder::Json::sax_parse(CountingIterator(text.data(), &reached),
                                  CountingIterator(text.data() + text.size(), &reached), &builder)) {
-        return builder.take();
+        // The parser takes a NUL for the end of its input. Inside a value it has rejected one.
+        const std::size_t nul = text.find('\0');
+        if (nul == std::string_view::npos) {
+            return builder.take();
+        }
+        if (error != nullptr) {
+            *error = Error{"json", 1, place(text, nul + 1) + "only white space may follow the value"};
+        }
+        return std::nullopt;
     }
     if (error != nullptr) {
         const std::size_t consumed = builder.position().value_or(static_cast<std::size_t>(reached - text.data()));

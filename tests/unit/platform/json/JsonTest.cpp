@@ -180,6 +180,18 @@ TEST(ParseJson, ColumnsCountCharacters) {
     EXPECT_TRUE(problemOf("[\"é€\", x]").starts_with("line 1, column 8: ")) << problemOf("[\"é€\", x]");
 }
 
+TEST(ParseJson, OnlyWhiteSpaceMayFollowTheValue) {
+    using namespace std::string_view_literals;
+    EXPECT_TRUE(parseJson("{\"a\":1} \t\r\n"));
+    for (const std::string_view text : {"{\"a\":1}\0"sv, "{\"a\":1}\0{\"b\":2}"sv, "{\"a\":1} \0 "sv, "1\0"sv,
+                                        "\0{\"a\":1}"sv, "{\"a\":1}x"sv, "{\"a\":1}{}"sv, "{\"a\0\":1}"sv}) {
+        EXPECT_FALSE(parseJson(text)) << text;
+    }
+    Error error;
+    EXPECT_FALSE(parseJson("{\"a\":\n1}\0{}"sv, &error));
+    EXPECT_EQ(error.description, "line 2, column 3: only white space may follow the value");
+}
+
 TEST(ParseJson, BrokenSyntaxIsRefusedWithItsPlace) {
     EXPECT_TRUE(problemOf("").starts_with("line 1, column 1: "));
     EXPECT_TRUE(problemOf("{\n\"a\": }").starts_with("line 2, column 6: "));
