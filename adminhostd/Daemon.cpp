@@ -68,7 +68,9 @@ class Daemon {
     void wait() {
         _entries.clear();
         _entries.push_back({_signals.get(), POLLIN, 0});
-        _entries.push_back({_server ? _server->descriptor() : -1, POLLIN, 0});
+        if (_server) {
+            _server->addTo(_entries);
+        }
         _front.queue().addTo(_entries);
         int timeout = _server ? _server->timeout().value_or(-1) : -1;
         for (const auto& due : {_front.queue().due(), _stopBy}) {

@@ -241,7 +241,7 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Address
         answer.headers.emplace_back("Allow", post ? "POST" : "GET, HEAD");
         return answer;
     }
-    if (post && !bodyFormOf(exchange.header("Content-Type"))) {
+    if (post && !bodyFormOf(exchange.header("Content-Type").value_or(""))) {
         return errorAnswer(415, "UNSUPPORTED_TYPE",
                            "A request's body is application/json (also when no type is given) or application/x-plist.");
     }
@@ -335,18 +335,18 @@ void Front::operation(Exchange& exchange, const Address& address) {
     };
 
     BodyProblem problem;
-    auto request = requestOf(exchange.body(), *bodyFormOf(exchange.header("Content-Type")), problem);
+    auto request = requestOf(exchange.body(), *bodyFormOf(exchange.header("Content-Type").value_or("")), problem);
     exchange.dropBody();
     if (!request) {
         return refuse(problem.tooManyValues ? errorAnswer(413, "BODY_TOO_LARGE", problem.text)
                                             : errorAnswer(400, "MALFORMED_BODY", problem.text));
     }
-    const std::string_view ifMatch = exchange.header("If-Match");
-    auto revisions = revisionsOf(ifMatch);
-    if (!ifMatch.empty() && (!revisions || !flag(description, "takesRevision"))) {
-        return refuse(
-            errorAnswer(400, "PRECONDITION_NOT_UNDERSTOOD",
-                        "If-Match takes quoted revisions, and only for a command that depends on the revision."));
+    const auto ifMatch = exchange.header("If-Match");
+    auto revisions = revisionsOf(ifMatch.value_or("*"));
+    if (ifMatch && (!revisions || !flag(description, "takesRevision"))) {
+        return refuse(errorAnswer(400, "PRECONDITION_NOT_UNDERSTOOD",
+                                  "If-Match must list quoted revisions, and is for commands that depend on the "
+                                  "revision only."));
     }
     if (_hello.contains("databaseTool") && needs(description, "database")) {
         return refuse(

@@ -3,35 +3,74 @@
 #include "adminhostd/RequestBody.h"
 #include "platform/framework/PluginRequestHandler.h"
 #include "platform/json/Json.h"
+#include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
 
 #include <algorithm>
 #include <cctype>
+#include <cerrno>
 #include <charconv>
+#include <cstring>
 #include <stdexcept>
 
 #include <fmt/format.h>
+#include <malloc.h>
 #include <microhttpd.h>
-#include <poll.h>
 #include <strings.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
 
-constexpr unsigned connectionMaximum = 256;
+using namespace std::chrono_literals;
+
+constexpr int acceptedAtOnce = 64;  ///< connections in one turn, so that a flood of them does not hold up the others
+constexpr auto shortagePause = 1s;  ///< until the next try when no descriptor is free
+constexpr auto logPause = 60s;      ///< between two events about the same kind of refusal
+/// Buffers from this size on are worth being returned to the system when they are freed.
+constexpr std::size_t largeBuffer = std::size_t{1} << 20U;
 constexpr std::size_t headMaximum = std::size_t{32}
                                     << 10U;  ///< bytes of a request's head and what the library keeps with it
 /// A body of unknown length that has outgrown the bound is read away up to here, so that the client gets its answer.
 constexpr std::size_t discardMaximum = 4 * bodyMaximum;
 
-std::string_view headerOf(MHD_Connection* connection, const char* name) {
-    const char* value = ::MHD_lookup_connection_value(connection, MHD_HEADER_KIND, name);
+// The library takes a connection over at once, and reports it, only if it knows that no other thread calls it. Before
+// this version it needs no flag for that.
+#if MHD_VERSION >= 0x00097501
+constexpr unsigned oneThread = MHD_USE_NO_THREAD_SAFETY;
+#else
+constexpr unsigned oneThread = 0;
+#endif
+
+std::optional<std::string_view> headerOf(MHD_Connection* connection, const char* name) {
+    const char* value = nullptr;
+    std::size_t size = 0;
+    if (::MHD_lookup_connection_value_n(connection, MHD_HEADER_KIND, name, std::strlen(name), &value, &size) !=
+        MHD_YES) {
+        return std::nullopt;
+    }
     return value == nullptr ? std::string_view() : std::string_view(value);
 }
 
+std::size_t descriptorMaximum() noexcept {
+    rlimit bound{};
+    return ::getrlimit(RLIMIT_NOFILE, &bound) == 0 ? bound.rlim_cur : 0;
+}
+
+/// True when nothing of the kind has been logged lately: clients must not be able to fill the log.
+bool worthLogging(std::optional<std::chrono::steady_clock::time_point>& last) {
+    const auto now = std::chrono::steady_clock::now();
+    if (last && now - *last < logPause) {
+        return false;
+    }
+    last = now;
+    return true;
+}
+
 std::uint64_t announcedLength(MHD_Connection* connection) {
-    const std::string_view text = headerOf(connection, MHD_HTTP_HEADER_CONTENT_LENGTH);
+    const std::string_view text = headerOf(connection, MHD_HTTP_HEADER_CONTENT_LENGTH).value_or("");
     std::uint64_t length = 0;
     const auto parsed = std::from_chars(text.data(), text.data() + text.size(), length);
     return parsed.ec == std::errc::result_out_of_range ? UINT64_MAX : length;
@@ -46,24 +85,55 @@ std::string pathOf(std::string_view target) {
     return target.empty() ? "/" : std::string(target);
 }
 
+/// The connection is closed after it: where one request ends and the next begins may be in doubt.
 HttpAnswer malformed(const char* message) {
-    return {400, Dictionary{{"error", "MALFORMED_HEAD"}, {"message", message}}, {}};
+    return {400, Dictionary{{"error", "MALFORMED_HEAD"}, {"message", message}}, {{"Connection", "close"}}};
+}
+
+/// The values of one header in the order in which they were sent.
+struct HeaderValues {
+    const char* name;
+    std::vector<std::string_view> values = {};
+};
+
+std::vector<std::string_view> headersOf(MHD_Connection* connection, const char* name) {
+    HeaderValues found{name};
+    const auto collect = [](void* context, MHD_ValueKind, const char* key, const char* value) {
+        auto& header = *static_cast<HeaderValues*>(context);
+        if (::strcasecmp(key, header.name) == 0) {
+            header.values.emplace_back(value == nullptr ? "" : value);
+        }
+        return MHD_YES;
+    };
+    ::MHD_get_connection_values(connection, MHD_HEADER_KIND, collect, &found);
+    return std::move(found.values);
 }
 
 /// What is wrong with the head of a request that the library lets pass.
 std::optional<HttpAnswer> headRefusal(MHD_Connection* connection, std::string_view version) {
-    if (version == MHD_HTTP_VERSION_1_1 && headerOf(connection, MHD_HTTP_HEADER_HOST).data() == nullptr) {
-        return malformed("A request has a Host header, whatever it says.");
+    if (version == MHD_HTTP_VERSION_1_1 && !headerOf(connection, MHD_HTTP_HEADER_HOST)) {
+        return malformed("The Host header is missing; send one, with any value.");
     }
-    const std::string_view coding = headerOf(connection, MHD_HTTP_HEADER_TRANSFER_ENCODING);
-    if (!coding.empty() && (coding.size() != 7 || ::strncasecmp(coding.data(), "chunked", 7) != 0)) {
-        return malformed("The only Transfer-Encoding is chunked.");
+    const auto codings = headersOf(connection, MHD_HTTP_HEADER_TRANSFER_ENCODING);
+    const auto lengths = headersOf(connection, MHD_HTTP_HEADER_CONTENT_LENGTH);
+    if (codings.size() > 1) {
+        return malformed("There is more than one Transfer-Encoding; send one.");
+    }
+    if (!codings.empty() && (codings.front().size() != 7 || ::strncasecmp(codings.front().data(), "chunked", 7) != 0)) {
+        return malformed("The only supported Transfer-Encoding is chunked.");
+    }
+    // With two readings of the body's length, the rest of the body could pass as the next request.
+    if (!codings.empty() && !lengths.empty()) {
+        return malformed("Content-Length and Transfer-Encoding exclude each other; send one of them.");
+    }
+    if (std::any_of(lengths.begin(), lengths.end(), [&](std::string_view text) { return text != lengths.front(); })) {
+        return malformed("There are different Content-Length headers; send one.");
     }
     return std::nullopt;
 }
 
-/// Decodes %XX in place. A zero byte would end the text for whoever reads it, so that another address were served than
-/// was asked for: it stays as it was sent, as does what is no code.
+/// Decodes %XX in place. A decoded NUL would end the text, so that another address would be served than the client
+/// asked for: "%00" stays as it was sent, like anything that is not a code.
 std::size_t decodeEscapes(void*, MHD_Connection*, char* text) {
     char* to = text;
     for (const char* from = text; *from != '\0'; ++to) {
@@ -89,8 +159,12 @@ HttpAnswer bodyTooLarge() {
 
 }  // namespace
 
-std::string_view Exchange::header(const char* name) const {
+std::optional<std::string_view> Exchange::header(const char* name) const {
     return headerOf(_connection, name);
+}
+
+bool Exchange::wantsPropertyList() const {
+    return prefersPropertyList(header(MHD_HTTP_HEADER_ACCEPT).value_or(""));
 }
 
 std::string_view Exchange::argument(const char* name) const {
@@ -125,38 +199,26 @@ struct HttpServer::Callbacks {
     }
 
     static void completed(void* context, MHD_Connection* connection, void** place, MHD_RequestTerminationCode) {
-        if (*place != nullptr) {
-            delete static_cast<Exchange*>(*place);
+        auto& server = *static_cast<HttpServer*>(context);
+        if (auto* const exchange = static_cast<Exchange*>(*place)) {
+            server._returnMemory |= exchange->_bytes.size() >= largeBuffer || exchange->_received >= largeBuffer;
+            server.forgetAnswer(*exchange);
+            delete exchange;
             *place = nullptr;
-            --static_cast<HttpServer*>(context)->_open;
+            --server._open;
         }
         if (Client* client = clientOf(connection)) {
             client->receiving = true;
-            client->since = std::chrono::steady_clock::now();
+            client->since = Clock::now();
         }
     }
 
-    static void connection(void* context, MHD_Connection* connection, void** place,
-                           MHD_ConnectionNotificationCode code) {
+    static void connection(void* context, MHD_Connection*, void** place, MHD_ConnectionNotificationCode code) {
         auto& server = *static_cast<HttpServer*>(context);
         if (code == MHD_CONNECTION_NOTIFY_STARTED) {
-            Client client{-1, {}, true, std::chrono::steady_clock::now()};
-            if (const auto* info = ::MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CONNECTION_FD)) {
-                client.socket = info->connect_fd;
-            }
-            ucred credentials{};
-            socklen_t size = sizeof credentials;
-            if (::getsockopt(client.socket, SOL_SOCKET, SO_PEERCRED, &credentials, &size) == 0) {
-                client.peer = {credentials.uid, credentials.gid, credentials.pid};
-            }
-            try {
-                *place = &server._clients.emplace_back(client);
-            } catch (...) {
-                *place = nullptr;
-            }
+            *place = &server._clients.back();  // which accept() has just added
         } else if (*place != nullptr) {
-            const auto* gone = static_cast<Client*>(*place);
-            server._clients.remove_if([&](const Client& client) { return &client == gone; });
+            server.closed(*static_cast<Client*>(*place));
             *place = nullptr;
         }
     }
@@ -167,28 +229,41 @@ HttpServer::HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeo
       _clientTimeout(clientTimeout),
       _head(std::move(head)),
       _serve(std::move(serve)),
+      _limits(descriptorMaximum()),
       // Different after each start, so that an id from a log names one request only.
       _idPrefix(makeUUIDString().substr(0, 8)) {
-    _daemon =
-        ::MHD_start_daemon(MHD_USE_EPOLL | MHD_ALLOW_SUSPEND_RESUME, 0, nullptr, nullptr, &Callbacks::access, this,  //
-                           MHD_OPTION_LISTEN_SOCKET, _listener.get(),                                                //
-                           MHD_OPTION_CONNECTION_LIMIT, connectionMaximum,                                           //
-                           MHD_OPTION_CONNECTION_MEMORY_LIMIT, headMaximum,                                          //
-                           MHD_OPTION_CONNECTION_TIMEOUT, static_cast<unsigned>(_clientTimeout.count()),             //
-                           MHD_OPTION_NOTIFY_COMPLETED, &Callbacks::completed, this,                                 //
-                           MHD_OPTION_NOTIFY_CONNECTION, &Callbacks::connection, this,                               //
-                           MHD_OPTION_UNESCAPE_CALLBACK, &decodeEscapes, nullptr,                                    //
-                           MHD_OPTION_SIGPIPE_HANDLED_BY_APP, 1,                                                     //
-                           MHD_OPTION_END);
+    // The library does not accept by itself: it would stop for good after it has run out of connections or descriptors,
+    // and it does not know which account a connection comes from.
+    _daemon = ::MHD_start_daemon(MHD_USE_EPOLL | MHD_USE_NO_LISTEN_SOCKET | MHD_ALLOW_SUSPEND_RESUME | oneThread, 0,
+                                 nullptr, nullptr, &Callbacks::access, this,                                    //
+                                 MHD_OPTION_CONNECTION_LIMIT, static_cast<unsigned>(_limits.total()),           //
+                                 MHD_OPTION_CONNECTION_MEMORY_LIMIT, headMaximum,                               //
+                                 MHD_OPTION_CONNECTION_TIMEOUT, static_cast<unsigned>(_clientTimeout.count()),  //
+                                 MHD_OPTION_NOTIFY_COMPLETED, &Callbacks::completed, this,                      //
+                                 MHD_OPTION_NOTIFY_CONNECTION, &Callbacks::connection, this,                    //
+                                 MHD_OPTION_UNESCAPE_CALLBACK, &decodeEscapes, nullptr,                         //
+                                 MHD_OPTION_SIGPIPE_HANDLED_BY_APP, 1,                                          //
+                                 MHD_OPTION_END);
     if (_daemon == nullptr) {
-        throw std::runtime_error("the HTTP library does not start");
+        throw std::runtime_error(
+            fmt::format("the HTTP library fails to start: {}; the daemon needs at least {} file descriptors (ulimit "
+                        "-n, LimitNOFILE)",
+                        std::strerror(errno), 2 * ConnectionLimits::ownDescriptors));
     }
     _descriptor = ::MHD_get_daemon_info(_daemon, MHD_DAEMON_INFO_EPOLL_FD)->epoll_fd;
 }
 
 HttpServer::~HttpServer() {
-    quiesce();
     ::MHD_stop_daemon(_daemon);
+}
+
+bool HttpServer::accepting() const noexcept {
+    return _listener.isOpen() && !_limits.full() && !_acceptAfter;
+}
+
+void HttpServer::addTo(std::vector<pollfd>& entries) const {
+    entries.push_back({_descriptor, POLLIN, 0});
+    entries.push_back({accepting() ? _listener.get() : -1, POLLIN, 0});
 }
 
 std::optional<int> HttpServer::timeout() const {
@@ -197,19 +272,92 @@ std::optional<int> HttpServer::timeout() const {
     if (::MHD_get_timeout(_daemon, &milliseconds) == MHD_YES) {
         timeout = static_cast<int>(std::min<MHD_UNSIGNED_LONG_LONG>(milliseconds, 60'000));
     }
-    // Slow clients are looked for once a second.
-    return _clients.empty() ? timeout : std::min(timeout.value_or(1000), 1000);
+    // Slow clients, and a descriptor that has become free, are looked for once a second.
+    return _clients.empty() && !_acceptAfter ? timeout : std::min(timeout.value_or(1000), 1000);
 }
 
 void HttpServer::run() {
     dropSlowClients();
+    if (_acceptAfter && Clock::now() >= *_acceptAfter) {
+        _acceptAfter.reset();
+    }
+    accept();
     ::MHD_run(_daemon);
+    if (_returnMemory) {
+        // The allocator keeps what lies below anything still in use, which after large answers may be most of them.
+        ::malloc_trim(0);
+        _returnMemory = false;
+    }
 }
 
-void HttpServer::quiesce() {
-    if (_listener.isOpen() && ::MHD_quiesce_daemon(_daemon) != MHD_INVALID_SOCKET) {
-        _listener.close();
+void HttpServer::accept() {
+    for (int i = 0; i < acceptedAtOnce && accepting() && acceptOne(); ++i) {
     }
+}
+
+bool HttpServer::acceptOne() {
+    FileDescriptor socket(::accept4(_listener.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+    if (!socket.isOpen()) {
+        if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) {
+            const int failure = errno;
+            _acceptAfter = Clock::now() + shortagePause;
+            if (worthLogging(_shortageLogged)) {
+                logEvent(
+                    fmt::format("adminhostd: cannot accept connections: {}; {} are open; raise the number of file "
+                                "descriptors (LimitNOFILE)",
+                                std::strerror(failure), _clients.size()));
+            }
+        }
+        return errno == EINTR || errno == ECONNABORTED;
+    }
+    ucred credentials{};
+    socklen_t size = sizeof credentials;
+    if (::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) {
+        return true;  // without them nothing may be served: closes the connection
+    }
+    if (!_limits.add(credentials.uid)) {
+        refuse(socket.get(), credentials.uid);
+        return true;
+    }
+    try {
+        _clients.push_back({socket.get(), {credentials.uid, credentials.gid, credentials.pid}, true, Clock::now()});
+    } catch (...) {
+        _limits.remove(credentials.uid);
+        throw;
+    }
+    const Client& client = _clients.back();
+    sockaddr address{};
+    address.sa_family = AF_UNIX;
+    // From here on the socket is the library's, also when it fails.
+    if (::MHD_add_connection(_daemon, socket.release(), &address, sizeof address.sa_family) != MHD_YES) {
+        closed(client);
+        _acceptAfter = Clock::now() + shortagePause;
+        return false;
+    }
+    return true;
+}
+
+/// The request is not waited for: the answer is there when the client reads.
+void HttpServer::refuse(int socket, uid_t uid) {
+    if (worthLogging(_refusalLogged)) {
+        logEvent(fmt::format("adminhostd: uid {} has too many connections open; further ones are refused", uid));
+    }
+    const std::string body = jsonOf(Dictionary{{"error", "TOO_MANY_CONNECTIONS"},
+                                               {"message",
+                                                "This account has too many connections open; close some, "
+                                                "or try again later."}}) +
+                             "\n";
+    const std::string text = fmt::format(
+        "HTTP/1.1 503 Service Unavailable\r\nConnection: close\r\nRetry-After: 1\r\nContent-Type: "
+        "application/json\r\nContent-Length: {}\r\n\r\n{}",
+        body.size(), body);
+    static_cast<void>(::send(socket, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL));
+}
+
+void HttpServer::closed(const Client& client) noexcept {
+    _limits.remove(client.peer.uid);
+    _clients.remove_if([&](const Client& other) { return &other == &client; });
+    _acceptAfter.reset();  // its descriptor is about to be free
 }
 
 HttpServer::Client* HttpServer::clientOf(MHD_Connection* connection) {
@@ -219,7 +367,7 @@ HttpServer::Client* HttpServer::clientOf(MHD_Connection* connection) {
 
 void HttpServer::dropSlowClients() {
     // The library's own bound is on silence; one byte every few seconds would hold a connection for ever.
-    const auto now = std::chrono::steady_clock::now();
+    const auto now = Clock::now();
     for (Client& client : _clients) {
         if (client.receiving && now - client.since > _clientTimeout) {
             ::shutdown(client.socket, SHUT_RDWR);
@@ -251,7 +399,7 @@ int HttpServer::begin(MHD_Connection* connection, const char* url, const char* m
     if (!begun._refusal && tooLarge) {
         begun._refusal = bodyTooLarge();
     }
-    const bool waits = !headerOf(connection, MHD_HTTP_HEADER_EXPECT).empty();
+    const bool waits = headerOf(connection, MHD_HTTP_HEADER_EXPECT).has_value();
     if (begun._refusal && (tooLarge || waits || begun._refusal->status == 403)) {
         begun._answer = std::move(begun._refusal);  // at once, without taking the body
         return send(begun);
@@ -294,13 +442,37 @@ int HttpServer::access(MHD_Connection* connection, const char* url, const char* 
     return send(exchange);
 }
 
+void HttpServer::forgetAnswer(Exchange& exchange) noexcept {
+    if (exchange._unread > 0) {
+        _unread -= exchange._unread;
+        exchange._unread = 0;
+        _sending.remove(&exchange);
+    }
+}
+
+void HttpServer::dropOldAnswers(const Exchange& newest) {
+    while (_unread > unreadMaximum && _sending.front() != &newest) {
+        Exchange& oldest = *_sending.front();
+        logEvent(
+            fmt::format("adminhostd: the answer to request {} is dropped after {} of {} bytes of unread answers: "
+                        "its client did not read it",
+                        oldest._id, _unread, unreadMaximum));
+        ::shutdown(oldest._socket, SHUT_RDWR);
+        forgetAnswer(oldest);
+    }
+}
+
 int HttpServer::send(Exchange& exchange) {
-    const HttpAnswer& answer = *exchange._answer;
+    HttpAnswer& answer = *exchange._answer;
     const char* type = nullptr;
-    if (answer.body) {
+    if (answer.text) {
+        exchange._bytes = std::move(answer.text->bytes);
+        type = answer.text->type;
+        answer.text.reset();
+    } else if (answer.body) {
         std::optional<std::string> text;
         // A value that a property list cannot carry is sent as JSON all the same: the type says what it is.
-        if (prefersPropertyList(exchange.header(MHD_HTTP_HEADER_ACCEPT))) {
+        if (exchange.wantsPropertyList()) {
             text = xmlPropertyList(*answer.body);
             type = "application/x-plist";
         }
@@ -309,7 +481,16 @@ int HttpServer::send(Exchange& exchange) {
             *text += '\n';
             type = "application/json";
         }
+        answer.body.reset();  // one form in memory is enough, for as long as the client takes to read it
         exchange._bytes = std::move(*text);
+        exchange._bytes.shrink_to_fit();
+    }
+    if (!exchange._bytes.empty()) {
+        _sending.push_back(&exchange);
+        exchange._unread = exchange._bytes.size();
+        _unread += exchange._unread;
+        _returnMemory |= exchange._unread >= largeBuffer;
+        dropOldAnswers(exchange);
     }
     MHD_Response* response =
         ::MHD_create_response_from_buffer(exchange._bytes.size(), exchange._bytes.data(), MHD_RESPMEM_PERSISTENT);

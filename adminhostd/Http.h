@@ -1,7 +1,9 @@
 #pragma once
 
-// The HTTP side of the front: libmicrohttpd on a listening Unix socket, driven by the front's own loop.
+// The HTTP side of the front: accepts connections on a Unix socket and hands them to libmicrohttpd, which the front's
+// own loop drives.
 
+#include "adminhostd/ConnectionLimits.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/value/Value.h"
 
@@ -16,6 +18,7 @@
 #include <utility>
 #include <vector>
 
+#include <poll.h>
 #include <sys/types.h>
 
 struct MHD_Connection;
@@ -24,6 +27,9 @@ struct MHD_Daemon;
 namespace adminhost {
 
 constexpr std::size_t bodyMaximum = std::size_t{8} << 20U;  ///< bytes of a request's body
+/// Bytes of all answers that clients have not read yet. Beyond it the oldest of them is dropped with its connection;
+/// the newest never is, so that an answer of any size arrives.
+constexpr std::size_t unreadMaximum = std::size_t{64} << 20U;
 
 /// The process at the other end, as the kernel knew it when it connected.
 struct Peer {
@@ -32,10 +38,17 @@ struct Peer {
     pid_t pid = 0;
 };
 
+/// The text of an answer, in the form that its client prefers (Exchange::wantsPropertyList()).
+struct AnswerText {
+    std::string bytes;
+    const char* type = "application/json";
+};
+
 struct HttpAnswer {
     unsigned status = 200;
     std::optional<Value> body;  ///< sent as JSON, or as a property list to a client that asks for one
     std::vector<std::pair<std::string, std::string>> headers;
+    std::optional<AnswerText> text = std::nullopt;  ///< sent as it is, instead of a body
 };
 
 /// One request and the place for its answer. Owned by the server; alive until it has been answered.
@@ -49,12 +62,16 @@ class Exchange {
     [[nodiscard]] const std::string& method() const noexcept { return _method; }
     [[nodiscard]] const std::string& path() const noexcept { return _path; }  ///< decoded, without the query
     [[nodiscard]] const std::string& body() const noexcept { return _body; }
-    // Empty when the client did not send it.
-    [[nodiscard]] std::string_view header(const char* name) const;
-    [[nodiscard]] std::string_view argument(const char* name) const;  ///< of the address's query, decoded
-    /// Gives the body's memory back once it has been read.
+    /// Returns nullopt when the client did not send the header, and an empty text when it sent an empty one. A NUL ends
+    /// the text.
+    [[nodiscard]] std::optional<std::string_view> header(const char* name) const;
+    /// A value of the address's query, decoded; empty when the client did not send it.
+    [[nodiscard]] std::string_view argument(const char* name) const;
+    /// Returns true when the answer's text is to be a property list, and false for JSON.
+    [[nodiscard]] bool wantsPropertyList() const;
+    /// Frees the body once it has been read.
     void dropBody() noexcept { std::string().swap(_body); }
-    /// Whether the client has closed its connection.
+    /// Returns true when the client has closed its connection, or its sending half.
     [[nodiscard]] bool clientGone() const noexcept;
     /// Answers the request, now or later, once. The exchange may be gone when the server runs next.
     void answer(HttpAnswer answer);
@@ -73,7 +90,8 @@ class Exchange {
     std::size_t _received = 0;
     std::optional<HttpAnswer> _refusal;  ///< decided from the head, sent when the body has been read away
     std::optional<HttpAnswer> _answer;
-    std::string _bytes;  ///< of the answer, while it is sent
+    std::string _bytes;       ///< of the answer, while it is sent
+    std::size_t _unread = 0;  ///< bytes of it that count as unread; 0 when it has been dropped
     bool _suspended = false;
 };
 
@@ -85,30 +103,32 @@ class HttpServer {
     using Serve = std::function<void(Exchange&)>;
 
     /// Takes the listening socket. A client that takes longer than the time for a request, or to read on, is dropped.
-    /// Throws std::runtime_error when the library refuses to start.
+    /// Throws std::runtime_error when the library fails to start.
     HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeout, Head head, Serve serve);
     HttpServer(const HttpServer&) = delete;
     HttpServer& operator=(const HttpServer&) = delete;
     /// Every exchange must have been answered.
     ~HttpServer();
 
-    /// Becomes readable when run() has something to do.
-    [[nodiscard]] int descriptor() const noexcept { return _descriptor; }
-    /// Milliseconds until run() must be called; nothing when there is no hurry.
+    /// Adds the descriptors that become readable when run() has something to do. The listener is among them only while
+    /// a connection can be accepted: otherwise it would stay readable and the loop would spin.
+    void addTo(std::vector<pollfd>& entries) const;
+    /// Milliseconds until run() must be called; nullopt when there is no hurry.
     [[nodiscard]] std::optional<int> timeout() const;
     /// Accepts, reads, serves and sends whatever can be done without waiting.
     void run();
-    /// Accepts no further connection; answers the listening socket's end of life.
-    void quiesce();
+    /// Closes the listening socket: accepts no further connection.
+    void quiesce() noexcept { _listener.close(); }
     /// Requests that have begun and are not fully answered.
     [[nodiscard]] std::size_t open() const noexcept { return _open; }
 
   private:
+    using Clock = std::chrono::steady_clock;
     struct Client {
         int socket;
         Peer peer;
         bool receiving;
-        std::chrono::steady_clock::time_point since;
+        Clock::time_point since;
     };
     struct Callbacks;
 
@@ -117,16 +137,30 @@ class HttpServer {
     int begin(MHD_Connection* connection, const char* url, const char* method, const char* version, Exchange** place);
     int send(Exchange& exchange);
     static Client* clientOf(MHD_Connection* connection);
+    [[nodiscard]] bool accepting() const noexcept;
+    void accept();
+    bool acceptOne();
+    void refuse(int socket, uid_t uid);
     void dropSlowClients();
+    void dropOldAnswers(const Exchange& newest);
+    void forgetAnswer(Exchange& exchange) noexcept;
+    void closed(const Client& client) noexcept;
 
     FileDescriptor _listener;
     std::chrono::seconds _clientTimeout;
     Head _head;
     Serve _serve;
     MHD_Daemon* _daemon = nullptr;
-    int _descriptor = -1;
+    int _descriptor = -1;  ///< of the library: readable when it has something to do
+    ConnectionLimits _limits;
     std::list<Client> _clients;
+    std::optional<Clock::time_point> _acceptAfter;  ///< set while no descriptor is free
+    std::optional<Clock::time_point> _refusalLogged;
+    std::optional<Clock::time_point> _shortageLogged;
     std::size_t _open = 0;
+    std::list<Exchange*> _sending;  ///< whose answers count as unread, the oldest first
+    std::size_t _unread = 0;        ///< their bytes
+    bool _returnMemory = false;     ///< large buffers have been freed
     std::string _idPrefix;
     unsigned long _idCount = 0;
 };

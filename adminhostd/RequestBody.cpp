@@ -107,6 +107,9 @@ std::optional<Array> revisionsOf(std::string_view ifMatch) {
     if (ifMatch == "*") {
         return revisions;
     }
+    if (ifMatch.empty()) {
+        return std::nullopt;  // a condition that cannot be checked: never as if there were none
+    }
     while (!ifMatch.empty()) {
         const std::size_t end = ifMatch.find('"', 1);
         if (ifMatch.front() != '"' || end == std::string_view::npos) {

@@ -32,7 +32,8 @@ struct BodyProblem {
 /// first.
 [[nodiscard]] bool prefersPropertyList(std::string_view accept);
 
-/// The revisions that an If-Match header names; empty for none and for "*". Nothing when it is malformed.
+/// The revisions that an If-Match header lists; an empty list for "*". Returns nullopt when the header is malformed, or
+/// empty.
 [[nodiscard]] std::optional<Array> revisionsOf(std::string_view ifMatch);
 
 }  // namespace adminhost

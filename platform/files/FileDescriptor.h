@@ -30,6 +30,9 @@ class FileDescriptor {
     [[nodiscard]] int get() const noexcept { return _number; }
     [[nodiscard]] bool isOpen() const noexcept { return _number >= 0; }
 
+    /// Gives up ownership: the caller closes the descriptor.
+    [[nodiscard]] int release() noexcept { return std::exchange(_number, -1); }
+
     /// Closes it if it is open and answers the system's error number, 0 for success. errno stays as it was.
     int close() noexcept {
         const int before = errno;

@@ -11,6 +11,7 @@
 
 #include <fcntl.h>
 #include <spawn.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -57,10 +58,21 @@ DaemonProcess::DaemonProcess(const Options& options) {
     }
     posix_spawn_file_actions_t actions;
     ::posix_spawn_file_actions_init(&actions);
-    ::posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, (_directory / "log").c_str(),
-                                       O_WRONLY | O_CREAT | O_APPEND, 0600);
+    if (options.standardError >= 0) {
+        ::posix_spawn_file_actions_adddup2(&actions, options.standardError, STDERR_FILENO);
+    } else {
+        ::posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, (_directory / "log").c_str(),
+                                           O_WRONLY | O_CREAT | O_APPEND, 0600);
+    }
+    rlimit before{};
+    ::getrlimit(RLIMIT_NOFILE, &before);
+    if (options.descriptors > 0) {
+        const rlimit bound{options.descriptors, before.rlim_max};  // inherited, like ulimit -n in a shell
+        ::setrlimit(RLIMIT_NOFILE, &bound);
+    }
     const int failure =
         ::posix_spawn(&_pid, DAEMON, &actions, nullptr, pointersTo(arguments).data(), pointersTo(environment).data());
+    ::setrlimit(RLIMIT_NOFILE, &before);
     ::posix_spawn_file_actions_destroy(&actions);
     if (failure != 0) {
         _pid = -1;

@@ -23,6 +23,8 @@ class DaemonProcess {
         std::vector<std::string> environment = {};  ///< "NAME=value", beside the test's own
         bool waitUntilReady = true;                 ///< until it answers its first request
         std::string socket = {};                    ///< where to listen, instead of in the directory
+        unsigned descriptors = 0;                   ///< how many it may have open (ulimit -n); 0: the test's own bound
+        int standardError = -1;                     ///< where its log goes, instead of to a file
     };
 
     explicit DaemonProcess(const Options& options);

@@ -273,6 +273,42 @@ TEST_F(Answers, RevisionTravelsAsETagAndGuardsAChange) {
     expectError(client.post("/v1/fixture/echo", "{}", {"If-Match: \"r3\""}), 400, "PRECONDITION_NOT_UNDERSTOOD");
 }
 
+TEST_F(Answers, EmptyConditionIsNeverAnUnguardedChange) {
+    using namespace std::string_literals;
+    for (const std::string& header : {"If-Match:"s, "If-Match: "s, "If-Match:\t"s, "If-Match: \0"s,
+                                      "If-Match: \0\"r1\""s, "If-Match: ,"s, "If-Match:\r\nIf-Match: \"r1\""s}) {
+        UnixHttp other = daemon.connect();
+        other.begin("POST", "/v1/fixture/change", "{}", {header});
+        const HttpReply reply = other.reply();
+        EXPECT_EQ(reply.status, 400) << header;
+    }
+    EXPECT_EQ(client.post("/v1/fixture/look").headers.at("etag"), "\"r1\"") << "nothing was changed";
+}
+
+TEST_F(Answers, TwoReadingsOfTheBodysLengthAreRefusedAndTheConnectionIsClosed) {
+    const std::string chunks = "2\r\n{}\r\n0\r\n\r\n";
+    for (const char* text :
+         {"Content-Length: 2\r\nContent-Length: 3\r\n\r\n{}", "Content-Length: 3\r\nContent-Length: 2\r\n\r\n{} ",
+          "Content-Length: 0\r\nContent-Length: 2\r\n\r\n{}", "Content-Length: 2\r\nContent-length: 02\r\n\r\n{}"}) {
+        UnixHttp other = daemon.connect();
+        other.send(std::string("POST /v1/fixture/echo HTTP/1.1\r\nHost: x\r\n") + text);
+        expectError(other.reply(), 400, "MALFORMED_HEAD");
+        EXPECT_TRUE(other.closedWithin(std::chrono::seconds(5))) << text;
+    }
+    for (const char* text : {"Transfer-Encoding: chunked\r\nContent-Length: 2\r\n\r\n",
+                             "Content-Length: 2\r\nTransfer-Encoding: chunked\r\n\r\n",
+                             "Transfer-Encoding: chunked\r\nTransfer-Encoding: chunked\r\n\r\n",
+                             "Transfer-Encoding: gzip\r\nTransfer-Encoding: chunked\r\n\r\n",
+                             "Transfer-Encoding: chunked\r\nTransfer-Encoding: identity\r\n\r\n"}) {
+        UnixHttp other = daemon.connect();
+        other.send(std::string("POST /v1/fixture/echo HTTP/1.1\r\nHost: x\r\n") + text + chunks);
+        expectError(other.reply(), 400, "MALFORMED_HEAD");
+        EXPECT_TRUE(other.closedWithin(std::chrono::seconds(5))) << text;
+    }
+    client.send("POST /v1/fixture/echo HTTP/1.1\r\nHost: x\r\nContent-Length: 2\r\nContent-Length: 2\r\n\r\n{}");
+    EXPECT_EQ(client.reply().status, 200) << "the same length twice has one reading";
+}
+
 TEST_F(Answers, RequestIsRememberedWithDurationResultAndLogLines) {
     const HttpReply reply = client.post("/v1/fixture/log", R"({"lines": ["one", "two %s\twith tab", ""]})");
     ASSERT_EQ(reply.status, 204);

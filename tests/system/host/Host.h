@@ -5,10 +5,12 @@
 #include "platform/json/Json.h"
 #include "tests/support/DaemonProcess.h"
 
+#include <chrono>
 #include <filesystem>
 #include <functional>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -19,7 +21,7 @@ inline std::string pluginFile(const std::string& name) {
 }
 
 inline DaemonProcess::Options withFixture(const std::string& configuration = "") {
-    return {{"--plugin", pluginFile("fixture_good")}, configuration, {}, true, {}};
+    return {{"--plugin", pluginFile("fixture_good")}, configuration, {}, true, {}, 0, -1};
 }
 
 inline Dictionary dictionaryOf(const HttpReply& reply) {
@@ -63,6 +65,27 @@ inline UnixHttp startSleeping(const DaemonProcess& daemon, int milliseconds) {
                  R"({"milliseconds":)" + std::to_string(milliseconds) + R"(,"touch":")" + mark + "\"}");
     EXPECT_TRUE(eventually([&] { return std::filesystem::exists(mark); }));
     return client;
+}
+
+/// Opens so many connections in each burst, each with an unfinished request, waits until the daemon holds as many as it
+/// can, and closes them all. After each burst an ordinary request must be answered within a second.
+inline void burst(const DaemonProcess& daemon, int bursts, int connections) {
+    for (int i = 0; i < bursts; ++i) {
+        {
+            std::vector<UnixHttp> clients;
+            for (int n = 0; n < connections; ++n) {
+                clients.push_back(daemon.connect());
+                try {
+                    clients.back().send("GET /v1/ HTTP/1.1\r\n");
+                } catch (const std::runtime_error&) {
+                    // The daemon may have refused this one already.
+                }
+            }
+            std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        }
+        UnixHttp ordinary(daemon.socket(), std::chrono::seconds(1));
+        ASSERT_EQ(ordinary.get("/v1/").status, 200) << "after burst " << i;
+    }
 }
 
 }  // namespace adminhost::test

@@ -76,7 +76,8 @@ TEST(PrefersPropertyList, WeighsWhatIsAcceptedAndTakesTheFirstOfEquals) {
 }
 
 TEST(RevisionsOf, ReadsAListOfQuotedTexts) {
-    EXPECT_EQ(revisionsOf(""), Array{});
+    EXPECT_EQ(revisionsOf(""), std::nullopt);
+    EXPECT_EQ(revisionsOf(" "), std::nullopt);
     EXPECT_EQ(revisionsOf("*"), Array{});
     EXPECT_EQ(revisionsOf("\"a\""), Array{Value("a")});
     EXPECT_EQ(revisionsOf(" \"a\" ,\"b,c\" "), (Array{Value("a"), Value("b,c")}));
