@@ -74,7 +74,9 @@ int Child::start(const std::string& tool, const std::vector<std::string>& argume
 }
 
 void Child::kill() noexcept {
-    if (_pid > 0) {
+    siginfo_t exited{};
+    if (_pid > 0 && !_exited && ::waitid(P_PID, static_cast<id_t>(_pid), &exited, WEXITED | WNOHANG | WNOWAIT) == 0 &&
+        exited.si_pid == 0) {
         ::kill(-_pid, SIGKILL);
     }
 }

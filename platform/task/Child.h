@@ -25,11 +25,15 @@ class Child {
     [[nodiscard]] int start(const std::string& tool, const std::vector<std::string>& arguments,
                             std::vector<std::string> environment, bool withInput);
 
-    /// SIGKILL for the child's process group; without effect once it has been waited for.
+    /// SIGKILL for the child's process group, unless the child itself has exited: what it has left in its group is a
+    /// daemon that stays.
     void kill() noexcept;
 
-    /// Waits for the exit of this very child: its status, 128 + the number of the signal that ended it, or -1 if the
-    /// system cannot tell.
+    /// Call when `exit` is readable.
+    void noteExit() noexcept { _exited = true; }
+
+    /// Waits for the exit of this very child. Returns its status, 128 + the number of the signal that ended it, or -1
+    /// if the system does not know it.
     [[nodiscard]] std::int32_t wait() noexcept;
 
     FileDescriptor input;   ///< write end, non-blocking; empty without input
@@ -39,6 +43,7 @@ class Child {
 
   private:
     pid_t _pid = 0;  ///< 0 when there is nothing to wait for
+    bool _exited = false;
 };
 
 }  // namespace adminhost

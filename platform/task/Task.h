@@ -1,24 +1,24 @@
 #pragma once
 
-// Child processes: run a tool to completion, without a shell.
+// Child processes: run a tool to completion, without a shell. TaskGroup.h runs several at once.
 //
-// Each function blocks until the tool has exited and answers its exit status; a death by signal is 128 + the signal's
+// Each function blocks until the tool has exited and returns its exit status; a death by signal is 128 + the signal's
 // number. A tool that cannot be started (missing, not executable, its path not absolute, an argument with a NUL byte or
 // above the kernel's 128 KiB with the NUL that ends it) is -1, with "TOOL: " and the system's text in the captured
 // error, TOOL being the tool's host path. The tool gets exactly the given arguments (argv[0] is the tool's path on
 // disk), standard input /dev/null where no input is given, no signal blocked or ignored, no descriptor of ours, and the
 // daemon's environment extended by the given one. Its umask and current directory are the process's, which
 // prepareForTasks() has set to 022 and "/": a relative path names the same file here and there. A tool need not read
-// its input: what it leaves is dropped.
+// its input: the rest is dropped.
 //
-// Standard output and error are captured whole, up to 256 MiB each; more is a failure: the tool's process group is
-// killed and -1 answered, never a truncation. Bytes that are not UTF-8 arrive as U+FFFD each: captured text must be
-// able to travel in a property list, and those bytes are lost. A tool may leave a daemon behind that holds the pipes:
-// once the tool itself has exited, what is in the pipes is read, at most 200 ms are waited for more, and the daemon
-// lives on (its later output meets a closed pipe).
+// Standard output and error are captured whole, up to 256 MiB together. More is a failure, never a truncation: the
+// tool's process group is killed and -1 returned. Bytes that are not UTF-8 become U+FFFD each, because captured text
+// must be able to travel in a property list; those bytes are lost. A tool may leave a daemon behind that holds the
+// pipes: once the tool itself has exited, what is in the pipes is read, at most 200 ms are waited for more, and the
+// daemon stays alive (its later output meets a closed pipe).
 //
 // A null place for captured text means that the stream is read and dropped, within the same bound. Places are
-// replaced, not appended to; both are empty after a failure but for the error's text.
+// replaced, not appended to. After a failure both are empty, except for the error's text.
 
 #include "platform/files/Path.h"
 
@@ -43,13 +43,13 @@ namespace adminhost {
     const DiskPath& tool, const std::vector<std::string>& arguments, const std::optional<std::string>& input,
     std::string* output, std::string* error, const std::map<std::string, std::string>& environment);
 
-/// Makes the process fit to launch tools: umask 022, current directory "/", and SIGCHLD, which the process may have
+/// Prepares the process for launching tools: umask 022, current directory "/", and SIGCHLD, which the process may have
 /// inherited as ignored (exit statuses would be lost), at its default. Called once at the start of a process that
 /// launches tools.
 void prepareForTasks() noexcept;
 
 /// The moment at which a running tool of this process is killed with its process group (status 128 + 9, and no further
-/// tool is started: -1); nothing means no bound. It applies to tools started after the call. The worker sets it for
+/// tool is started: -1); nullopt means no bound. It applies to tools started after the call. The worker sets it for
 /// each request.
 void setTaskDeadline(std::optional<std::chrono::steady_clock::time_point> deadline) noexcept;
 

@@ -1,14 +1,24 @@
 #pragma once
 
-// The bound on what is captured of one stream of a tool. A variable only so that tests need no 256 MiB.
+// What applies to every tool that this process runs. The functions of Task.h set it, except the bound, which only tests
+// change: they need no 256 MiB.
 
+#include <chrono>
 #include <cstddef>
+#include <map>
+#include <string>
 
 namespace adminhost {
 
+using TaskEnvironment = std::map<std::string, std::string>;
+
 constexpr std::size_t taskDefaultOutputBound = std::size_t{256} << 20U;  ///< bytes
 
-/// Sets the bound for tools launched from now on, in bytes.
+/// Sets the bound for task groups made from now on, in bytes.
 void setTaskOutputBound(std::size_t bytes) noexcept;
+
+[[nodiscard]] std::size_t taskOutputBound() noexcept;
+[[nodiscard]] std::chrono::steady_clock::time_point taskDeadline() noexcept;  ///< the maximum for none
+[[nodiscard]] const TaskEnvironment& taskEnvironment() noexcept;
 
 }  // namespace adminhost

@@ -1,0 +1,338 @@
+#include "platform/task/TaskGroup.h"
+
+#include "platform/task/Child.h"
+#include "platform/task/StartChild.h"
+#include "platform/task/TaskBounds.h"
+#include "platform/value/Text.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <ctime>
+#include <string_view>
+#include <system_error>
+#include <utility>
+
+#include <fmt/format.h>
+#include <pthread.h>
+#include <sys/ioctl.h>
+#include <unistd.h>
+
+namespace adminhost {
+namespace {
+
+using Clock = TaskGroup::Clock;
+
+constexpr auto waitForDaemonsOutput = std::chrono::milliseconds(200);
+
+/// Keeps SIGPIPE from this thread while a tool that may not read its input is written to.
+class WithoutSigpipe {
+  public:
+    WithoutSigpipe() noexcept {
+        sigset_t pending{};
+        ::sigpending(&pending);
+        _wasPending = ::sigismember(&pending, SIGPIPE) == 1;
+        ::sigemptyset(&_sigpipe);
+        ::sigaddset(&_sigpipe, SIGPIPE);
+        ::pthread_sigmask(SIG_BLOCK, &_sigpipe, &_before);
+    }
+    WithoutSigpipe(const WithoutSigpipe&) = delete;
+    WithoutSigpipe& operator=(const WithoutSigpipe&) = delete;
+    ~WithoutSigpipe() {
+        if (!_wasPending) {  // consume the one that a broken pipe raised meanwhile
+            const timespec now{};
+            while (::sigtimedwait(&_sigpipe, nullptr, &now) < 0 && errno == EINTR) {
+            }
+        }
+        ::pthread_sigmask(SIG_SETMASK, &_before, nullptr);
+    }
+
+  private:
+    sigset_t _sigpipe{};
+    sigset_t _before{};
+    bool _wasPending = false;
+};
+
+/// What arrives on one of the tool's streams.
+class Capture {
+  public:
+    /// `held` counts the bytes of the whole group.
+    Capture(FileDescriptor& stream, bool kept, std::size_t& held) noexcept
+        : _stream(stream), _kept(kept), _held(held) {}
+
+    [[nodiscard]] bool isOpen() const noexcept { return _stream.isOpen(); }
+    [[nodiscard]] int descriptor() const noexcept { return _stream.get(); }  ///< -1, which poll skips, after the end
+    [[nodiscard]] std::size_t count() const noexcept { return _count; }
+
+    /// Reads once, unless that exceeds the bound; closes the stream at its end.
+    void readSome(std::size_t bound) {
+        std::array<char, 65536> buffer;  // not initialised: read() fills what is used
+        const ssize_t count = ::read(_stream.get(), buffer.data(), buffer.size());
+        if (count > 0) {
+            _count += static_cast<std::size_t>(count);
+            _held += static_cast<std::size_t>(count);
+            if (_kept && _held <= bound) {
+                _bytes.append(buffer.data(), static_cast<std::size_t>(count));
+            }
+        } else if (count == 0 || (errno != EAGAIN && errno != EINTR)) {
+            _stream.close();
+        }
+    }
+
+    /// Reads what is in the pipe at this moment, however long that takes, and no more than that.
+    void readWhatIsThere(std::size_t bound) {
+        int waiting = 0;
+        if (!isOpen() || ::ioctl(_stream.get(), FIONREAD, &waiting) != 0) {
+            return;
+        }
+        const std::size_t until = _count + static_cast<std::size_t>(waiting);
+        while (isOpen() && _count < until && _held <= bound) {
+            readSome(bound);
+        }
+    }
+
+    /// Drops the bytes.
+    void release() noexcept {
+        _held -= std::exchange(_count, 0);
+        std::string().swap(_bytes);
+    }
+
+    /// The text, with what is not UTF-8 replaced.
+    [[nodiscard]] std::string takeText() { return isUtf8(_bytes) ? std::move(_bytes) : utf8Of(_bytes); }
+
+  private:
+    FileDescriptor& _stream;
+    bool _kept;
+    std::size_t& _held;
+    std::string _bytes;
+    std::size_t _count = 0;
+};
+
+/// This process's environment with the variables of the two maps in place of its own, the second before the first.
+std::vector<std::string> environmentWith(const TaskEnvironment& first, const TaskEnvironment& second) {
+    TaskEnvironment added = second;
+    added.insert(first.begin(), first.end());
+    std::vector<std::string> all = processEnvironment();
+    std::erase_if(all, [&](const std::string& entry) { return added.contains(entry.substr(0, entry.find('='))); });
+    for (const auto& [name, value] : added) {
+        all.emplace_back(name).append(1, '=').append(value);
+    }
+    return all;
+}
+
+bool namesVariables(const TaskEnvironment& environment) {
+    return std::none_of(environment.begin(), environment.end(), [](const auto& variable) {
+        return variable.first.empty() || variable.first.find('=') != std::string::npos;
+    });
+}
+
+}  // namespace
+
+class TaskGroup::RunningTask {
+  public:
+    static constexpr std::size_t entryCount = 4;
+
+    RunningTask(TaskPlan plan, std::size_t bound, std::size_t& held)
+        : _tool(std::move(plan.tool)),
+          _bound(bound),
+          _held(held),
+          _output(_child.output, plan.keepsOutput, held),
+          _error(_child.error, plan.keepsError, held),
+          _input(plan.input.value_or("")),
+          _rest(_input),
+          _until(taskDeadline()) {
+        if (Clock::now() >= _until) {
+            fail("not started: the time allowed for the request is over");
+            return;
+        }
+        const int number =
+            !namesVariables(plan.environment)
+                ? EINVAL
+                : _child.start(_tool.text(), plan.arguments, environmentWith(taskEnvironment(), plan.environment),
+                               plan.input.has_value());
+        if (number != 0) {
+            fail(std::generic_category().message(number));
+        } else if (_rest.empty()) {
+            _child.input.close();
+        }
+    }
+    RunningTask(const RunningTask&) = delete;
+    RunningTask& operator=(const RunningTask&) = delete;
+    ~RunningTask() {
+        _output.release();
+        _error.release();
+    }
+
+    [[nodiscard]] bool ended() const noexcept { return _ended; }
+    [[nodiscard]] Clock::time_point until() const noexcept { return _until; }
+
+    void addTo(std::vector<pollfd>& entries) const {
+        entries.push_back({_output.descriptor(), POLLIN, 0});
+        entries.push_back({_error.descriptor(), POLLIN, 0});
+        entries.push_back({_exited ? -1 : _child.exit.get(), POLLIN, 0});
+        entries.push_back({_child.input.get(), POLLOUT, 0});
+    }
+
+    /// Moves bytes both ways, until the child has exited and its streams are read.
+    void serve(const pollfd* ready) {
+        if (ready[0].revents != 0) {
+            _output.readSome(_bound);
+        }
+        if (ready[1].revents != 0 && _held <= _bound) {
+            _error.readSome(_bound);
+        }
+        if (ready[3].revents != 0) {
+            writeSome();
+        }
+        if (ready[2].revents != 0) {
+            _exited = true;
+            _child.noteExit();
+            _child.input.close();
+            _output.readWhatIsThere(_bound);
+            _error.readWhatIsThere(_bound);
+            _until = Clock::now() + waitForDaemonsOutput;
+        }
+        if (_held > _bound) {
+            stopForItsOutput();
+        } else if (_exited && !_output.isOpen() && !_error.isOpen()) {
+            finish();
+        } else if (Clock::now() >=
+                   _until) {  // checked after reading too: a stream that never falls silent must not last
+            if (_exited) {
+                finish();
+            } else {
+                _child.kill();
+                _until = Clock::time_point::max();  // its exit comes now
+            }
+        }
+    }
+
+    TaskResult result() { return std::move(_result); }
+
+  private:
+    /// Writes as much as the pipe takes; closes it when all is written or nobody reads it any more.
+    void writeSome() {
+        const WithoutSigpipe guard;
+        const ssize_t count = ::write(_child.input.get(), _rest.data(), _rest.size());
+        if (count > 0) {
+            _rest.remove_prefix(static_cast<std::size_t>(count));
+        }
+        if (_rest.empty() || (count < 0 && errno != EAGAIN && errno != EINTR)) {
+            _child.input.close();
+        }
+    }
+
+    void stopForItsOutput() {
+        const bool alone = _output.count() + _error.count() > _bound;
+        if (!_exited) {
+            _child.kill();
+        }
+        (void)_child.wait();
+        fail(alone ? fmt::format("stopped: it wrote more than {} bytes", _bound)
+                   : fmt::format("stopped: it and the tools beside it wrote more than {} bytes", _bound));
+    }
+
+    void finish() {
+        _result.status = _child.wait();
+        _result.output = _output.takeText();
+        _result.error = _error.takeText();
+        close();
+    }
+
+    void fail(std::string_view text) {
+        _output.release();
+        _error.release();
+        _result = {-1, {}, utf8Of(fmt::format("{}: {}", hostPath(_tool).text(), text))};
+        close();
+    }
+
+    void close() noexcept {
+        _child.input.close();
+        _child.output.close();
+        _child.error.close();
+        _child.exit.close();
+        _ended = true;
+    }
+
+    DiskPath _tool;
+    std::size_t _bound;
+    std::size_t& _held;
+    Child _child;
+    Capture _output;
+    Capture _error;
+    std::string _input;
+    std::string_view _rest;
+    Clock::time_point _until;  ///< the deadline; after the exit, the end of the wait for a daemon's output
+    bool _exited = false;
+    bool _ended = false;
+    TaskResult _result;
+};
+
+TaskGroup::TaskGroup() noexcept : _bound(taskOutputBound()) {}
+
+TaskGroup::~TaskGroup() = default;
+
+TaskGroup::Id TaskGroup::start(TaskPlan plan) {
+    _tasks.push_back(std::make_unique<RunningTask>(std::move(plan), _bound, _held));
+    return _tasks.size() - 1;
+}
+
+void TaskGroup::addTo(std::vector<pollfd>& entries) const {
+    for (const auto& task : _tasks) {
+        if (task && !task->ended()) {
+            task->addTo(entries);
+        }
+    }
+}
+
+std::optional<Clock::time_point> TaskGroup::due() const {
+    Clock::time_point earliest = Clock::time_point::max();
+    for (const auto& task : _tasks) {
+        if (task && !task->ended()) {
+            earliest = std::min(earliest, task->until());
+        }
+    }
+    return earliest == Clock::time_point::max() ? std::nullopt : std::optional(earliest);
+}
+
+void TaskGroup::serve() {
+    serveFor(0);
+}
+
+bool TaskGroup::ended(Id id) const {
+    return _tasks.at(id)->ended();
+}
+
+TaskResult TaskGroup::collect(Id id) {
+    while (!_tasks.at(id)->ended()) {
+        serveFor(milliseconds());
+    }
+    const std::unique_ptr<RunningTask> task = std::move(_tasks.at(id));
+    return task->result();
+}
+
+/// Milliseconds for poll until the next moment, rounded up so that the moment has passed afterwards; -1 for never.
+int TaskGroup::milliseconds() const {
+    const auto moment = due();
+    if (!moment) {
+        return -1;
+    }
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*moment - Clock::now()).count();
+    return static_cast<int>(std::clamp<std::int64_t>(left, 0, 3'600'000));
+}
+
+void TaskGroup::serveFor(int milliseconds) {
+    _entries.clear();
+    addTo(_entries);
+    // A failed or timed-out call leaves every revents 0.
+    (void)::poll(_entries.data(), _entries.size(), milliseconds);
+    const pollfd* ready = _entries.data();
+    for (const auto& task : _tasks) {
+        if (task && !task->ended()) {
+            task->serve(std::exchange(ready, ready + RunningTask::entryCount));
+        }
+    }
+}
+
+}  // namespace adminhost

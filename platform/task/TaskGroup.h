@@ -1,0 +1,78 @@
+#pragma once
+
+// Several tools at once, from one thread: start them, wait or poll, collect their results in any order.
+//
+// What Task.h says of one tool holds for each: its descriptors, its environment, the daemon that it may leave behind,
+// and the deadline, which is that of the process at the moment of the start. One bound holds for all bytes that the
+// group has read and that were not collected yet. The tool that exceeds it is killed with its process group and fails;
+// its bytes are dropped, and the others go on.
+
+#include "platform/files/Path.h"
+
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <poll.h>
+
+namespace adminhost {
+
+struct TaskPlan {
+    DiskPath tool;
+    std::vector<std::string> arguments;  ///< without the tool itself
+    std::optional<std::string> input = std::nullopt;
+    std::map<std::string, std::string> environment = {};  ///< added to the process's
+    bool keepsOutput = true;                              ///< otherwise it is read and dropped
+    bool keepsError = true;
+};
+
+struct TaskResult {
+    std::int32_t status = -1;  ///< as launch_task returns it
+    std::string output;
+    std::string error;
+};
+
+class TaskGroup {
+  public:
+    using Clock = std::chrono::steady_clock;
+    using Id = std::size_t;
+
+    TaskGroup() noexcept;
+    TaskGroup(const TaskGroup&) = delete;
+    TaskGroup& operator=(const TaskGroup&) = delete;
+    /// Kills what still runs, with its process group.
+    ~TaskGroup();
+
+    /// Starts a tool. One that cannot be started has ended with status -1.
+    [[nodiscard]] Id start(TaskPlan plan);
+
+    /// Adds what to poll for. When one is ready, call serve().
+    void addTo(std::vector<pollfd>& entries) const;
+    /// The latest moment of the next call of serve(), if there is one.
+    [[nodiscard]] std::optional<Clock::time_point> due() const;
+    /// Does everything that can be done without waiting.
+    void serve();
+
+    /// True once the tool has ended and its output has been read: collect() does not wait.
+    [[nodiscard]] bool ended(Id id) const;
+    /// Waits until the tool has ended, serves the others meanwhile, and returns its result. Once for each tool.
+    [[nodiscard]] TaskResult collect(Id id);
+
+  private:
+    class RunningTask;
+
+    void serveFor(int milliseconds);
+    [[nodiscard]] int milliseconds() const;
+
+    std::size_t _bound;
+    std::size_t _held = 0;                             ///< bytes read and not collected
+    std::vector<std::unique_ptr<RunningTask>> _tasks;  ///< by id; null when collected
+    std::vector<pollfd> _entries;
+};
+
+}  // namespace adminhost
