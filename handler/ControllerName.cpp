@@ -1,13 +1,12 @@
 // Resolution of the grid controller's DNS-SD name to a host name.
 
+#include "handler/AddressWait.h"
 #include "handler/LumioRequestHandler.h"
 #include "platform/dnssd/EventLoop.h"
 #include "platform/dnssd/HostName.h"
 #include "platform/dnssd/NetService.h"
 #include "platform/log/Log.h"
 #include "platform/value/Text.h"
-
-#include <chrono>
 
 namespace lumio {
 
@@ -20,11 +19,7 @@ std::optional<std::string> LumioRequestHandler::hostNameOfController(const std::
     service.setDelegate({[this](NetService& from, const Dictionary& error) { netService(from, error); },
                          [this](NetService& from) { netServiceDidStop(from); }});
     mBJError.reset();
-    service.resolveWithTimeout(std::chrono::seconds(10));
-    // Ten turns of at most a second each bound the wait, whatever the resolver's own time-out does.
-    for (int turns = 10; !mBJError && service.addresses().empty() && turns > 0; --turns) {
-        loop.runOnce(std::chrono::seconds(1));
-    }
+    waitForAddress(service, loop, [this] { return mBJError.has_value(); });
     std::optional<std::string> host;
     if (!service.addresses().empty()) {
         adminhost::HostName found = adminhost::hostNameOf(service.addresses().front());

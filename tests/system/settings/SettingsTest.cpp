@@ -92,6 +92,27 @@ TEST_F(Settings, TwoWritersComeOneAfterTheOtherAndNothingIsMixed) {
     EXPECT_EQ(config.get("server_host"), config.get("tunnel_server_host"));
 }
 
+TEST_F(Settings, WriterOfAMemberKeyAndWriterOfAClusterKeyKeepEachOthersValues) {
+    for (const std::string round : {"1", "2", "3", "4"}) {
+        test::UnixHttp member = daemon.connect();
+        test::UnixHttp cluster = daemon.connect();
+        member.begin("POST", "/v1/lumio/writeSettings",
+                     R"({"configuration":{"server_host":"host)" + round + R"(","nimbo_grid_id":"of the first"}})");
+        cluster.begin("POST", "/v1/lumio/writeSettings",
+                      R"({"configuration":{"submissions_groupname":"group)" + round +
+                          R"(","nimbo_grid_id":"of the second","tunnel_server_host":"tunnel)" + round + R"("}})");
+        EXPECT_EQ(member.reply().status, 200);
+        EXPECT_EQ(cluster.reply().status, 200);
+        const Value read = valueOf(post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})"));
+        const Dictionary& config = *read.dictionary()->get("configuration").dictionary();
+        EXPECT_EQ(config.get("server_host"), Value("host" + round));
+        EXPECT_EQ(config.get("submissions_groupname"), Value("group" + round));
+        EXPECT_EQ(config.get("tunnel_server_host"), Value("tunnel" + round));
+        EXPECT_TRUE(config.get("nimbo_grid_id") == Value("of the first") ||
+                    config.get("nimbo_grid_id") == Value("of the second"));
+    }
+}
+
 TEST_F(Settings, NextStartRemovesWhatKilledWorkersLeftAndNothingElse) {
     const std::string server = "/Library/SorvaneProducer/Shared/Server/";
     const std::vector<std::string> leftovers{

@@ -38,7 +38,20 @@ class ReadSettings : public testing::Test {
             database,
             "create table cameras(id integer primary key,name,uuid,create_user_uuid,created_at,update_user_uuid,"
             "updated_at,last_recording_uuid,use_user_uuid,used_at,recording_status,access_control_enabled,disabled);"
-            "insert into cameras(name,uuid,recording_status) values('Aula','C-1','offline');");
+            "create table workflows(id integer primary key,uuid,bundle_path,disabled,access_control_enabled,"
+            "use_user_uuid,created_at,updated_at,used_at);"
+            "create table properties(id integer primary key,name,value,protect,created_at,updated_at);"
+            "create table access_control_entries(record_uuid,resource_type,resource_id);"
+            "insert into cameras(name,uuid,recording_status) values('Aula','C-1','offline');"
+            "insert into workflows(uuid,bundle_path,disabled) values('W-1','Lecture.bundle','f');"
+            "insert into properties(name,value,protect) values('n','left','f');");
+    }
+    [[nodiscard]] static std::vector<std::string> keysOf(const Dictionary& dictionary) {
+        std::vector<std::string> keys;
+        for (const auto& entry : dictionary) {
+            keys.push_back(entry.key);
+        }
+        return keys;
     }
     Dictionary read(std::optional<std::string_view> variant = std::nullopt) {
         Dictionary request;
@@ -110,6 +123,34 @@ TEST_F(ReadSettings, CopiesTheKeysOfTheTablesAndNoOthersInTheirOrder) {
     EXPECT_EQ(config.get("library_version"), Value(7));
 }
 
+TEST_F(ReadSettings, DefaultSharedFilesystemIsTheDefaultWhateverTheSettingsSay) {
+    writeSettings();
+    for (const auto variant : {std::optional<std::string_view>(), std::optional<std::string_view>("getConfig")}) {
+        EXPECT_EQ(read(variant).get("default_shared_filesystem"), Value("/Library/SorvaneProducer/Shared"));
+        EXPECT_EQ(read(variant).get("shared_filesystem"), Value("/shared"));
+    }
+}
+
+TEST_F(ReadSettings, IdentityValueThatIsNotATextNamesThePlaceByItsTextForm) {
+    root.writePropertyList("/Library/Preferences/com.brenn.lumioserverd.plist",
+                           "<key>shared_filesystem</key><string>/shared</string><key>member_uuid</key>"
+                           "<integer>7</integer>");
+    root.writePropertyList("/shared/Server/member_preferences_7.plist", "<key>server_host</key><string>h</string>");
+    const Dictionary config = read("getConfig");
+    EXPECT_EQ(config.get("member_uuid"), Value(7)) << "copied with its type";
+    EXPECT_EQ(config.get("server_host"), Value("h"));
+}
+
+TEST_F(ReadSettings, EmptyIdentityValuesAreValuesAndNotMissingOnes) {
+    root.writePropertyList("/Library/Preferences/com.brenn.lumioserverd.plist",
+                           "<key>shared_filesystem</key><string></string><key>member_uuid</key><string></string>");
+    root.writePropertyList("/Server/member_preferences_.plist", "<key>server_host</key><string>h</string>");
+    const Dictionary config = read("getConfig");
+    EXPECT_EQ(config.get("shared_filesystem"), Value(""));
+    EXPECT_EQ(config.get("member_uuid"), Value(""));
+    EXPECT_EQ(config.get("server_host"), Value("h"));
+}
+
 TEST_F(ReadSettings, KeyThatTheFileLacksIsAbsent) {
     writeSettings();
     EXPECT_FALSE(read().contains("tunnel_agent_host"));
@@ -156,6 +197,21 @@ TEST_F(ReadSettings, CatalogPortIsClampedTo32BitsAndWraps) {
     EXPECT_EQ(catalogFor("<real>nan</real>"), "http://h:1/sorvaneproducer/catalogs");
 }
 
+TEST_F(ReadSettings, PortWithLeadingZerosIsDecimalAndHexadecimalDigitsEndIt) {
+    writeSettings();
+    EXPECT_EQ(catalogFor("<string>010</string>"), "http://h:11/sorvaneproducer/catalogs");
+    EXPECT_EQ(catalogFor("<string>0x10</string>"), "http://h:1/sorvaneproducer/catalogs");
+}
+
+TEST_F(ReadSettings, WebAddressShowsTheTextOfAPortAsItStands) {
+    writeSettings();
+    for (const char* port : {"010", "0x10", " 8170x", "http", ""}) {
+        writeMember("<key>server_host</key><string>h</string><key>server_port</key><string>" + std::string(port) +
+                    "</string>");
+        EXPECT_EQ(read().get("web_app_url"), Value("https://h:" + std::string(port) + "/sorvaneproducer/capture"));
+    }
+}
+
 TEST_F(ReadSettings, WebAddressShowsTheNumberOfAPort) {
     writeSettings();
     writeMember("<key>server_host</key><string>h</string><key>server_port</key><integer>443</integer>");
@@ -180,11 +236,35 @@ TEST_F(ReadSettings, VariantGetCamerasAnswersOnlyTheCameras) {
     EXPECT_TRUE(config.contains("default_shared_filesystem"));
 }
 
+TEST_F(ReadSettings, EmptyListingIsAnEmptyListAndNotAMissingKey) {
+    writeSettings();
+    writeDatabase();
+    root.sql(database, "delete from cameras; delete from properties;");
+    const Dictionary config = read();
+    EXPECT_EQ(config.get("cameras"), Value(adminhost::Array{}));
+    EXPECT_EQ(config.get("properties"), Value(adminhost::Array{}));
+    EXPECT_EQ(keysOf(read("getCameras")), (std::vector<std::string>{"default_shared_filesystem", "cameras"}));
+}
+
+TEST_F(ReadSettings, DescriptionThatIsNotATextIsShownAsItStands) {
+    writeSettings();
+    writeDatabase();
+    root.write(
+        "/System/Library/SorvaneProducer/SorvaneProducerServerLocalizations.bundle/Contents/Resources/en.lproj/"
+        "PropertyDescriptions.strings",
+        "n = (one, two);");
+    const Dictionary config = read("getProperties");
+    ASSERT_EQ(config.get("properties").array()->size(), 1U);
+    EXPECT_EQ(config.get("properties").array()->front().dictionary()->get("description"),
+              Value(adminhost::Array{"one", "two"}));
+}
+
 TEST_F(ReadSettings, VariantGetConfigHasNeitherCamerasNorWorkflows) {
     writeSettings();
     writeDatabase();
     const Dictionary config = read("getConfig");
     EXPECT_TRUE(config.contains("member_uuid"));
+    EXPECT_TRUE(config.contains("properties"));
     EXPECT_FALSE(config.contains("cameras"));
     EXPECT_FALSE(config.contains("workflows"));
 }

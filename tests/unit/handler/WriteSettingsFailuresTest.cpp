@@ -25,7 +25,13 @@ TEST_F(WriteSettingsFailures, FailedIdentityWriteIs400WithItsTextAndLaterStepsAr
     root.writeTool(libraryScript, "#!/bin/sh\ntouch " + root.path("/library-ran").string() + "\n");
     fs::rename(root.path("/Library/Preferences"), root.path("/Library/gone"));
     root.write("/Library/Preferences", "a file where the directory belongs");
-    const Dictionary answer = write({{"shared_filesystem", "/shared"}});
+    const std::string member = root.read(memberFile);
+    const std::string cluster = root.read(clusterFile);
+    const Dictionary answer =
+        write({{"shared_filesystem", "/shared"}, {"server_port", 1}, {"nimbo_controller", "second.example"}});
+    EXPECT_EQ(root.read(memberFile), member);
+    EXPECT_EQ(root.read(clusterFile), cluster);
+    EXPECT_FALSE(fs::exists(root.path("/Library/SorvaneProducer/Shared"))) << "nor those of the default place";
     EXPECT_EQ(answer.get("writeStatus"), Value(400));
     ASSERT_NE(answer.get("errorDescription").string(), nullptr);
     EXPECT_THAT(*answer.get("errorDescription").string(), HasSubstr(std::string(identityFile)));

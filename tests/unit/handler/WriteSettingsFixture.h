@@ -88,6 +88,7 @@ class WriteSettings : public testing::Test {
             "create table properties(id integer primary key,name,value,protect,created_at,updated_at);"
             "create table access_control_entries(record_uuid,resource_type,resource_id);"
             "insert into cameras(name,uuid,access_control_enabled) values('Aula','C-1','f');"
+            "insert into workflows(uuid,bundle_path,disabled) values('W-1','Lecture.bundle','f');"
             "insert into properties(name,value,protect) values('p','old','f');");
     }
 

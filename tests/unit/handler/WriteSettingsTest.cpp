@@ -79,10 +79,17 @@ TEST_F(WriteSettings, ANewSharedFilesystemNeedsARestartAndIsWhereTheOtherFilesAr
 TEST_F(WriteSettings, CachedCopiesAreTheStartWhereTheNewSharedFilesystemHasNoFiles) {
     root.writePropertyList("/var/lumio/server/cached_member_preferences.plist",
                            "<key>kept</key><string>cached</string>");
+    root.writePropertyList("/var/lumio/server/cached_cluster_preferences.plist",
+                           "<key>kept</key><string>cached too</string>"
+                           "<key>nimbo_client_username</key><string>cached</string>");
     fs::create_directories(root.path("/other/Server"));
-    (void)write({{"shared_filesystem", "/other"}});
+    (void)write({{"shared_filesystem", "/other"}, {"nimbo_grid_id", 3}});
     EXPECT_EQ(file("/other/Server/member_preferences_M.plist"), (Dictionary{{"kept", "cached"}}));
+    EXPECT_EQ(file("/other/Server/cluster_preferences.plist"),
+              (Dictionary{{"kept", "cached too"}, {"nimbo_client_username", "cached"}, {"nimbo_grid_id", 3}}));
     EXPECT_EQ(file("/var/lumio/server/cached_member_preferences.plist"), (Dictionary{{"kept", "cached"}}));
+    EXPECT_EQ(file("/var/lumio/server/cached_cluster_preferences.plist"),
+              (Dictionary{{"kept", "cached too"}, {"nimbo_client_username", "cached"}}));
 }
 
 TEST_F(WriteSettings, ASharedFilesystemThatWasNotStoredNeedsARestart) {
@@ -194,6 +201,39 @@ TEST_F(WriteSettings, ReadBackIsNarrowedByTheRequestsVariant) {
     const Dictionary all = write({{"server_port", 12}}, std::nullopt);
     EXPECT_EQ(all.at("configuration.server_port"), Value(12));
     EXPECT_TRUE(all.get("configuration").dictionary()->contains("properties"));
+}
+
+TEST_F(WriteSettings, EachVariantSendsExactlyItsOwnKeysBack) {
+    makeDatabase();
+    using Keys = std::vector<std::string>;
+    const bool listsWorkflows = handler.getWorkflowsWithRequest({}).dictionary().contains("workflows");
+    const Keys start{"default_shared_filesystem"};
+    const Keys settings{"member_uuid",      "shared_filesystem",
+                        "nimbo_controller", "nimbo_client_username",
+                        "nimbo_grid_id",    "nimbo_client_password_is_set",
+                        "server_port"};
+    const Keys workflows = listsWorkflows ? Keys{"workflows"} : Keys{};
+    const auto joined = [](std::initializer_list<Keys> lists) {
+        Keys all;
+        for (const Keys& list : lists) {
+            all.insert(all.end(), list.begin(), list.end());
+        }
+        return all;
+    };
+    const auto sentBack = [&](std::optional<std::string_view> variant) {
+        Keys keys;
+        const Dictionary answer = write({{"nimbo_grid_id", 1}}, variant);
+        for (const auto& entry : *answer.get("configuration").dictionary()) {
+            keys.push_back(entry.key);
+        }
+        return keys;
+    };
+    EXPECT_EQ(sentBack(std::nullopt), joined({start, settings, {"cameras"}, workflows, {"properties"}}));
+    EXPECT_EQ(sentBack("getConfig"), joined({start, settings, {"properties"}}));
+    EXPECT_EQ(sentBack("getCameras"), joined({start, {"cameras"}}));
+    EXPECT_EQ(sentBack("getWorkflows"), joined({start, workflows}));
+    EXPECT_EQ(sentBack("getProperties"), joined({start, {"properties"}}));
+    EXPECT_EQ(sentBack("getconfig"), start);
 }
 
 TEST_F(WriteSettings, PreferencesScriptRunsAtTheStartAndOnceMoreForTheReadBack) {

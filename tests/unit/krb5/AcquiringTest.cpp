@@ -249,6 +249,17 @@ TEST_F(Acquiring, KeytabWithoutTheClientsKeyFails) {
     EXPECT_EQ(cache->errorCode(), ENOENT);
 }
 
+TEST_F(Acquiring, FailedKeytabRequestEmptiesTheCache) {
+    const auto cache = aliceWithTicketEndingIn(599);
+    const auto keytab =
+        KRB5Keytab::initWithName((realm().directory() / "client.keytab").string(), std::nullopt, _context);
+    ASSERT_EQ(cache->credentials().size(), 1U);
+    cache->acquireInitialCredentialWithKeytab(keytab.get());
+    EXPECT_EQ(cache->errorCode(), KRB5_KT_NOTFOUND) << cache->errorMessage();
+    EXPECT_TRUE(cache->credentials().empty());
+    EXPECT_EQ(cache->principal()->name(), "alice");
+}
+
 TEST_F(Acquiring, AcquiringForAnotherPrincipalRebindsTheCache) {
     const auto cache = aliceWithTicket();
     const auto paul = principal("paul");

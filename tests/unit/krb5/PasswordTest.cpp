@@ -15,17 +15,23 @@ struct Wiped {
     std::size_t size;
 };
 
-const char* passwordSeen = nullptr;
-std::string passwordTextSeen;
-std::vector<Wiped> wiped;
+/// What is recorded, from the library's call on; null outside the test that asks. The program goes on to wipe memory
+/// after its last test.
+struct Recording {
+    const char* password = nullptr;
+    std::string passwordText;
+    std::vector<Wiped> wiped;
+};
+
+Recording* recording = nullptr;
 
 void wipe(void* start, std::size_t size) {
     auto* bytes = static_cast<volatile char*>(start);
     for (std::size_t i = 0; i < size; ++i) {
         bytes[i] = 0;
     }
-    if (passwordSeen != nullptr) {
-        wiped.push_back({start, size});
+    if (recording != nullptr && recording->password != nullptr) {
+        recording->wiped.push_back({start, size});
     }
 }
 
@@ -37,9 +43,10 @@ krb5_error_code krb5_get_init_creds_password(krb5_context context, krb5_creds* c
                                              const char* password, krb5_prompter_fct prompter, void* data,
                                              krb5_deltat start_time, const char* in_tkt_service,
                                              krb5_get_init_creds_opt* options) {
-    passwordSeen = password;
-    passwordTextSeen = password;
-    wiped.clear();
+    if (recording != nullptr) {
+        recording->password = password;
+        recording->passwordText = password;
+    }
     const auto real =
         reinterpret_cast<decltype(&krb5_get_init_creds_password)>(dlsym(RTLD_NEXT, "krb5_get_init_creds_password"));
     return real(context, creds, client, password, prompter, data, start_time, in_tkt_service, options);
@@ -64,18 +71,19 @@ class Password : public RealmTest {};
 
 TEST_F(Password, CopyGivenToTheLibraryIsWipedWholeWhetherTheRequestSucceedsOrFails) {
     for (const std::string text : {alicePassword, "a wrong one"}) {
-        passwordSeen = nullptr;
         const auto cache = cacheOf(*principal("alice"));
+        Recording seen;
+        recording = &seen;
         cache->acquireInitialCredentialWithPassword(text);
+        recording = nullptr;
         EXPECT_EQ(cache->errorCode() == 0, text == alicePassword);
-        ASSERT_NE(passwordSeen, nullptr);
-        EXPECT_EQ(passwordTextSeen, text);
+        ASSERT_NE(seen.password, nullptr);
+        EXPECT_EQ(seen.passwordText, text);
         bool found = false;
-        for (const Wiped& area : wiped) {
-            found = found || (area.start == passwordSeen && area.size >= text.size() + 1);
+        for (const Wiped& area : seen.wiped) {
+            found = found || (area.start == seen.password && area.size >= text.size() + 1);
         }
         EXPECT_TRUE(found) << text;
-        passwordSeen = nullptr;
     }
 }
 

@@ -1,8 +1,13 @@
 #include "tests/unit/krb5/Realm.h"
 
+#include "tests/support/CapturedLog.h"
+
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
+#include <optional>
+
+#include <gmock/gmock.h>
 
 namespace lumio {
 namespace {
@@ -31,6 +36,23 @@ std::filesystem::path makeDirectory() {
     }
     return pattern;
 }
+
+}  // namespace
+
+namespace {
+
+/// The layer keeps statuses and texts for its callers and logs nothing itself: watched over during every test.
+class SilenceWatch final : public testing::EmptyTestEventListener {
+    void OnTestStart(const testing::TestInfo& /*test*/) override { _log.emplace(); }
+    void OnTestEnd(const testing::TestInfo& /*test*/) override {
+        EXPECT_THAT(_log->lines, testing::IsEmpty());
+        _log.reset();
+    }
+
+    std::optional<adminhost::test::CapturedLog> _log;
+};
+
+const bool watched = (testing::UnitTest::GetInstance()->listeners().Append(new SilenceWatch), true);
 
 }  // namespace
 

@@ -91,6 +91,23 @@ TEST_F(SettingsStoreTest, AnExistingFileThatCannotBeParsedGivesNullAndNotTheCach
     std::filesystem::create_directories(root.path("/shared/Server/cluster_preferences.plist"));
     EXPECT_EQ(SettingsStore::memberPreferences(), std::nullopt);
     EXPECT_EQ(SettingsStore::clusterPreferences(), std::nullopt);
+    std::filesystem::remove(root.path("/shared/Server/cluster_preferences.plist"));
+    root.write("/shared/Server/cluster_preferences.plist", "not a property list either");
+    EXPECT_EQ(SettingsStore::clusterPreferences(), std::nullopt);
+}
+
+TEST_F(SettingsStoreTest, IdentityValuesThatAreNotTextsAreReadInTheirTextForm) {
+    root.writePropertyList(identity, "<key>shared_filesystem</key><integer>5</integer><key>member_uuid</key><true/>");
+    EXPECT_EQ(SettingsStore::sharedFilesystemPath(), "5");
+    EXPECT_EQ(SettingsStore::memberUUID(), "1");
+    EXPECT_EQ(SettingsStore::memberPreferencesPath(), HostPath("5/Server/member_preferences_1.plist"));
+}
+
+TEST_F(SettingsStoreTest, EmptyIdentityValuesStayEmpty) {
+    useSharedFilesystem("", "");
+    EXPECT_EQ(SettingsStore::sharedFilesystemPath(), "");
+    EXPECT_EQ(SettingsStore::memberUUID(), "");
+    EXPECT_EQ(SettingsStore::memberPreferencesPath(), HostPath("/Server/member_preferences_.plist"));
 }
 
 TEST_F(SettingsStoreTest, AnExistingFileThatCannotBeReadGivesNullAndNotTheCachedCopy) {

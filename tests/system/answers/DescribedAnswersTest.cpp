@@ -1,0 +1,132 @@
+// Runs every reading command of the plug-in on the sample service and compares the answers with the descriptions.
+
+#include "platform/json/Json.h"
+#include "tests/support/DaemonProcess.h"
+#include "tests/support/SampleRoot.h"
+
+#include <map>
+#include <set>
+
+#include <gtest/gtest.h>
+
+namespace adminhost {
+namespace {
+
+/// The keys of an answer by their paths, each with the types that it was seen with: "configuration.cameras[].name".
+using Seen = std::map<std::string, std::set<Value::Type>>;
+
+void collect(const Value& value, const std::string& path, Seen& seen) {
+    if (!path.empty()) {
+        seen[path].insert(value.type());
+    }
+    if (const Dictionary* dictionary = value.dictionary()) {
+        for (const DictionaryEntry& entry : *dictionary) {
+            collect(entry.value, path.empty() ? entry.key : path + '.' + entry.key, seen);
+        }
+    } else if (const Array* array = value.array()) {
+        for (const Value& element : *array) {
+            collect(element, path + "[]", seen);
+        }
+    }
+}
+
+/// Whether a value of this type may stand where an answer's description names that one.
+bool fits(Value::Type type, const std::string& described) {
+    using T = Value::Type;
+    static const std::map<std::string, std::set<T>> types{
+        {"any", {T::null, T::boolean, T::integer, T::real, T::string, T::date, T::data, T::array, T::dictionary}},
+        {"scalar", {T::boolean, T::integer, T::real, T::string, T::date}},
+        {"text", {T::string}},
+        {"integer", {T::integer}},
+        {"real", {T::real, T::integer}},
+        {"boolean", {T::boolean}},
+        {"date", {T::date}},
+        {"data", {T::data}},
+        {"list", {T::array}},
+        {"dictionary", {T::dictionary}}};
+    const auto found = types.find(described);
+    return found != types.end() && found->second.contains(type);
+}
+
+class DescribedAnswers : public testing::Test {
+  protected:
+    [[nodiscard]] test::DaemonProcess::Options options() const {
+        test::DaemonProcess::Options options;
+        options.arguments = {"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"};
+        return options;
+    }
+    [[nodiscard]] static Value valueOf(const test::HttpReply& reply) {
+        if (reply.body.empty()) {
+            return {};  // an answer of nothing
+        }
+        const auto value = parseJson(reply.body);
+        EXPECT_TRUE(value) << reply.body;
+        return value ? *value : Value();
+    }
+    [[nodiscard]] static std::string textAt(const Value& value, std::string_view key) {
+        const Dictionary* dictionary = value.dictionary();
+        const std::string* text = dictionary == nullptr ? nullptr : dictionary->get(key).string();
+        return text == nullptr ? std::string() : *text;
+    }
+    /// The answer, unless this release does not serve the command.
+    [[nodiscard]] std::optional<Value> answerOf(const std::string& command, const std::string& request) const {
+        const Value answer = valueOf(daemon.connect().post("/v1/lumio/" + command, request));
+        return textAt(answer, "error") == "NOT_AVAILABLE" ? std::nullopt : std::optional(answer);
+    }
+
+    const test::SampleRoot root;
+    const test::DaemonProcess daemon{options()};
+};
+
+TEST_F(DescribedAnswers, EveryReadingCommandAnswersWithTheKeysAndTypesOfItsDescription) {
+    const Value described = valueOf(daemon.connect().get("/v1/lumio"));
+    const Array* commands = described.array();
+    ASSERT_NE(commands, nullptr);
+    int compared = 0;
+    std::set<std::string> notServed;  // paths in answers of commands that this release only declares
+    std::map<std::string, std::set<std::string>> missing;
+    for (const Value& command : *commands) {
+        const std::string name = textAt(command, "name");
+        if (command.dictionary()->get("changes") == Value(true)) {
+            continue;
+        }
+        SCOPED_TRACE(name);
+        const Array& keys = *command.dictionary()->get("answer").array();
+        const auto whole = answerOf(name, "{}");
+        if (!whole) {
+            for (const Value& key : keys) {
+                notServed.insert(textAt(key, "path"));
+            }
+            continue;
+        }
+        ++compared;
+        Seen seen;
+        collect(*whole, "", seen);
+        for (const Value& key : keys) {
+            const std::string path = textAt(key, "path");
+            const auto found = seen.find(path);
+            if (found == seen.end()) {
+                missing[name].insert(path);
+                continue;
+            }
+            for (const Value::Type type : found->second) {
+                EXPECT_TRUE(fits(type, textAt(key, "type"))) << path << " is a " << nameOf(type);
+            }
+            seen.erase(found);
+        }
+        for (const auto& [path, types] : seen) {
+            ADD_FAILURE() << path << " is not described";
+        }
+    }
+    // The sample has a value for everything that is described.
+    for (const auto& [name, paths] : missing) {
+        for (const std::string& path : paths) {
+            const std::string own = path.substr(path.starts_with("configuration.") ? 14 : 0);
+            EXPECT_TRUE(notServed.contains(own)) << name << ": the sample's answer does not have " << path;
+        }
+    }
+    EXPECT_GT(compared, 0);
+}
+
+}  // namespace
+}  // namespace adminhost
