@@ -2,6 +2,7 @@
 
 #include "adminhostd/PluginCall.h"
 #include "platform/files/FileDescriptor.h"
+#include "platform/value/Text.h"
 
 #include <algorithm>
 #include <bit>
@@ -23,6 +24,7 @@ namespace {
 
 constexpr std::size_t notesMaximum = std::size_t{64} << 10U;
 constexpr std::size_t segmentsMaximum = 256;
+constexpr int depthMaximum = 32;          ///< of a description
 constexpr std::size_t wordMaximum = 100;  ///< bytes of a plug-in's or a command's name
 
 bool readAt(int file, std::uint64_t offset, void* place, std::size_t size) {
@@ -60,7 +62,7 @@ bool isAddressWord(std::string_view word) {
 }
 
 /// The first name that the front cannot serve: not a word, used twice, or "history", an address of the front's own.
-std::optional<std::string> unusableCommand(const std::vector<Command>& commands) {
+std::optional<std::string> unusableName(const std::vector<Command>& commands) {
     std::set<std::string_view> names;
     for (const Command& command : commands) {
         if (!isAddressWord(command.name) || command.name == "history" || !names.insert(command.name).second) {
@@ -68,6 +70,25 @@ std::optional<std::string> unusableCommand(const std::vector<Command>& commands)
         }
     }
     return std::nullopt;
+}
+
+/// Whether clients can be sent it: every text is UTF-8, and it is not nested without end.
+bool isPresentable(const Value& value, int depth) {
+    if (depth > depthMaximum) {
+        return false;
+    }
+    if (const std::string* text = value.string()) {
+        return isUtf8(*text);
+    }
+    if (const Array* array = value.array()) {
+        return std::all_of(array->begin(), array->end(), [&](const Value& v) { return isPresentable(v, depth + 1); });
+    }
+    if (const Dictionary* dictionary = value.dictionary()) {
+        return std::all_of(dictionary->begin(), dictionary->end(), [&](const DictionaryEntry& entry) {
+            return isUtf8(entry.key) && isPresentable(entry.value, depth + 1);
+        });
+    }
+    return true;
 }
 
 tl::unexpected<Error> refused(std::string reason) {
@@ -115,44 +136,48 @@ std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory) {
     return files;
 }
 
-std::optional<std::string> buildIdentityOf(const DiskPath& path, std::string& problem) {
+Result<std::string> buildIdentityOf(const DiskPath& path) {
     const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
     if (!file.isOpen()) {
-        problem = fmt::format("{}: {}; install it or correct its name", path.text(), std::strerror(errno));
-        return std::nullopt;
+        return refused(fmt::format("{}: {}; install it or correct its name", path.text(), std::strerror(errno)));
     }
     constexpr int ownOrder = std::endian::native == std::endian::little ? ELFDATA2LSB : ELFDATA2MSB;
     Elf64_Ehdr header{};
     if (!readAt(file.get(), 0, &header, sizeof header) || std::memcmp(header.e_ident, ELFMAG, SELFMAG) != 0 ||
         header.e_ident[EI_CLASS] != ELFCLASS64 || header.e_ident[EI_DATA] != ownOrder || header.e_type != ET_DYN ||
         header.e_phentsize != sizeof(Elf64_Phdr)) {
-        problem = fmt::format("{} is no shared object of this kind of machine", path.text());
-        return std::nullopt;
+        return refused(fmt::format("{} is not a shared object for this kind of machine", path.text()));
     }
+    struct stat status {};
+    const std::uint64_t length = ::fstat(file.get(), &status) == 0 ? static_cast<std::uint64_t>(status.st_size) : 0;
+    std::optional<std::string> identity;
     for (std::size_t i = 0; i < std::min<std::size_t>(header.e_phnum, segmentsMaximum); ++i) {
         Elf64_Phdr segment{};
         if (!readAt(file.get(), header.e_phoff + i * sizeof segment, &segment, sizeof segment)) {
             break;
         }
-        if (segment.p_type != PT_NOTE || segment.p_filesz > notesMaximum) {
+        if (segment.p_type == PT_LOAD && (segment.p_offset > length || segment.p_filesz > length - segment.p_offset)) {
+            // Running it would end in SIGBUS, but perhaps only in the middle of an operation.
+            return refused(fmt::format("{} is truncated; install it again", path.text()));
+        }
+        if (identity || segment.p_type != PT_NOTE || segment.p_filesz > notesMaximum) {
             continue;
         }
         std::string notes(segment.p_filesz, '\0');
         if (readAt(file.get(), segment.p_offset, notes.data(), notes.size())) {
-            if (auto identity = identityIn(notes)) {
-                return identity;
-            }
+            identity = identityIn(notes);
         }
     }
-    problem = fmt::format("{} carries no build note: it is no plug-in of this daemon", path.text());
-    return std::nullopt;
+    if (!identity) {
+        return refused(fmt::format("{} has no build note: it is not a plug-in for this daemon", path.text()));
+    }
+    return *identity;
 }
 
 Result<LoadedPlugin> loadPlugin(const DiskPath& file) {
-    std::string problem;
-    const auto identity = buildIdentityOf(file, problem);
+    const auto identity = buildIdentityOf(file);
     if (!identity) {
-        return refused(problem);
+        return failure(identity.error());
     }
     if (*identity != ADMINHOST_BUILD_IDENTITY) {
         return refused(fmt::format(
@@ -191,10 +216,20 @@ Result<LoadedPlugin> loadPlugin(const DiskPath& file) {
         return refused(
             fmt::format("{} has the name \"{}\", which cannot be part of an address", file.text(), loaded->name));
     }
-    if (const auto command = unusableCommand(loaded->commands)) {
+    if (const auto command = unusableName(loaded->commands)) {
         return refused(
             fmt::format("{} describes a command \"{}\", which cannot be part of an address or is described twice",
                         file.text(), *command));
+    }
+    for (const Command& command : loaded->commands) {
+        const bool named = std::all_of(command.needs.begin(), command.needs.end(), isAddressWord);
+        if (!named || command.deadline.count() < 0 || !isPresentable(command.description, 0)) {
+            return refused(fmt::format("{} describes its command \"{}\" in a form that clients cannot be sent",
+                                       file.text(), command.name));
+        }
+    }
+    if (!isUtf8(loaded->version)) {
+        return refused(fmt::format("{} has a version that is not text", file.text()));
     }
     return loaded;
 }

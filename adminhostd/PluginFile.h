@@ -21,9 +21,9 @@ namespace adminhost {
 /// The plug-ins (*.so) of a directory in the order of their names. Nothing if it cannot be read; errno says why.
 [[nodiscard]] std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory);
 
-/// The build identity in the file's note, read without running any of its code. Nothing, with the problem, when the
-/// file is no shared object for a 64-bit machine of this kind or carries no note.
-[[nodiscard]] std::optional<std::string> buildIdentityOf(const DiskPath& file, std::string& problem);
+/// The build identity in the file's note, read without running any of its code. The error names the file: it is not a
+/// shared object for a 64-bit machine of this kind, it is truncated, or it has no note.
+[[nodiscard]] Result<std::string> buildIdentityOf(const DiskPath& file);
 
 struct LoadedPlugin {
     Plugin* plugin = nullptr;  ///< lives as long as the process

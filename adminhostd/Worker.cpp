@@ -4,6 +4,7 @@
 #include "adminhostd/Frame.h"
 #include "adminhostd/PluginCall.h"
 #include "adminhostd/PluginFile.h"
+#include "adminhostd/PluginTrial.h"
 #include "adminhostd/SettingsHistory.h"
 #include "platform/directory/Entries.h"
 #include "platform/directory/LocalAccounts.h"
@@ -162,8 +163,17 @@ Value Worker::configure(const Dictionary& configuration) {
     Array plugins;
     Array refused;
     if (const Array* files = configuration.get("plugins").array()) {
+        std::vector<DiskPath> paths;
         for (const Value& file : *files) {
-            load(DiskPath(*file.string()), plugins, refused);
+            paths.emplace_back(*file.string());
+        }
+        const auto reasons = tryPlugins(paths);
+        for (std::size_t i = 0; i < paths.size(); ++i) {
+            if (reasons[i]) {
+                refused.emplace_back(Dictionary{{"file", paths[i].text()}, {"reason", *reasons[i]}});
+            } else {
+                load(paths[i], plugins, refused);
+            }
         }
     }
     Dictionary hello{{"plugins", std::move(plugins)}, {"refused", std::move(refused)}};

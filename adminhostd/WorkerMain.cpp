@@ -1,15 +1,20 @@
 // adminhostd-worker: started by the front, with the conversation as descriptor 3.
 
+#include "adminhostd/PluginTrial.h"
 #include "adminhostd/Worker.h"
 
 #include <cstdlib>
 #include <exception>
 #include <iostream>
+#include <string_view>
 
 #include <fcntl.h>
 #include <sys/stat.h>
 
-int main() {
+int main(int count, char** arguments) {
+    if (count == 3 && std::string_view(arguments[1]) == adminhost::trialArgument) {
+        return adminhost::serveTrial(arguments[2]);
+    }
     constexpr int conversation = 3;
     struct stat status {};
     if (::fstat(conversation, &status) != 0 || !S_ISSOCK(status.st_mode)) {

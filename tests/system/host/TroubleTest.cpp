@@ -126,7 +126,7 @@ TEST(WorkerTrouble, RequestWhoseClientWentAwayBeforeItsTurnIsNotRun) {
 
 TEST(WorkerTrouble, WorkerThatCannotStartIsAClearAnswerAndTriedAgain) {
     auto options = withFixture();
-    options.arguments = {"--plugin", pluginFile("fixture_crashing")};
+    options.arguments = {"--plugin", pluginFile("fixture_crashing_later")};
     DaemonProcess daemon(options);
     UnixHttp client = daemon.connect();
     const HttpReply reply = client.post("/v1/fixture/echo", "{}");
