@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <csignal>
 #include <optional>
+#include <thread>
 
 #include <sys/signalfd.h>
 
@@ -20,6 +21,8 @@ using namespace std::chrono_literals;
 using Clock = std::chrono::steady_clock;
 
 constexpr auto runningBound = 10s;  ///< for the running operation when the daemon is to stop
+constexpr int logPause = 100;       ///< milliseconds until the next try while the log cannot be written
+constexpr auto logBound = 200ms;    ///< for the log's last events at the end
 constexpr auto sendingBound = 2s;   ///< for its clients to take their answers then
 
 FileDescriptor stopSignals() {
@@ -73,6 +76,9 @@ class Daemon {
         }
         _front.queue().addTo(_entries);
         int timeout = _server ? _server->timeout().value_or(-1) : -1;
+        if (!flushLog()) {
+            timeout = timeout < 0 ? logPause : std::min(timeout, logPause);
+        }
         for (const auto& due : {_front.queue().due(), _stopBy}) {
             if (due) {
                 const auto left = std::chrono::ceil<std::chrono::milliseconds>(*due - Clock::now()).count();
@@ -127,6 +133,9 @@ int runDaemon(const Options& options) {
     const ToolConfiguration tools(privateParent(options));
     const PluginSelection plugins = selectPlugins(options);
     Daemon(options, plugins, tools, socket).run();
+    for (const auto end = Clock::now() + logBound; !flushLog() && Clock::now() < end;) {
+        std::this_thread::sleep_for(10ms);
+    }
     return 0;
 }
 

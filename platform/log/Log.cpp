@@ -1,64 +1,45 @@
 #include "platform/log/Log.h"
 
-#include <atomic>
-#include <cerrno>
-#include <string>
+#include "platform/log/QueuedSink.h"
+#include "platform/log/StandardError.h"
+#include "platform/log/SystemLog.h"
 
-#include <syslog.h>
-#include <unistd.h>
+#include <atomic>
 
 namespace adminhost {
 namespace {
 
-class SyslogSink final : public LogSink {
-  public:
-    void write(std::string_view event) noexcept override {
-        ::syslog(LOG_DAEMON | LOG_NOTICE, "%.*s", static_cast<int>(event.size()), event.data());
-    }
-};
+/// Never destroyed: events may come from destructors at the very end of the process.
+QueuedSink& theStandardErrorSink() noexcept {
+    static auto& sink = *new QueuedSink(writeToStandardError);
+    return sink;
+}
 
-class StandardErrorSink final : public LogSink {
-  public:
-    void write(std::string_view event) noexcept override {
-        std::string line;
-        try {
-            line.assign(event).push_back('\n');
-        } catch (...) {
-            return;
-        }
-        const char* at = line.data();
-        std::size_t left = line.size();
-        while (left > 0) {
-            const ssize_t written = ::write(STDERR_FILENO, at, left);
-            if (written < 0) {
-                if (errno == EINTR) {
-                    continue;
-                }
-                return;
-            }
-            at += written;
-            left -= static_cast<std::size_t>(written);
-        }
-    }
-};
+std::atomic<LogSink*> currentSink = nullptr;
 
-SyslogSink theSyslogSink;
-StandardErrorSink theStandardErrorSink;
-std::atomic<LogSink*> currentSink = &theStandardErrorSink;
+LogSink& current() noexcept {
+    LogSink* sink = currentSink.load();
+    return sink == nullptr ? standardErrorSink() : *sink;
+}
 
 }  // namespace
 
 LogSink& syslogSink() noexcept {
-    return theSyslogSink;
+    static auto& socket = *new SystemLog("/dev/log");
+    static auto& sink = *new QueuedSink([](std::string_view line) { return socket.write(line); });
+    return sink;
 }
 LogSink& standardErrorSink() noexcept {
-    return theStandardErrorSink;
+    return theStandardErrorSink();
 }
 void setLogSink(LogSink& sink) noexcept {
     currentSink = &sink;
 }
 void logEvent(std::string_view event) noexcept {
-    currentSink.load()->write(event);
+    current().write(event);
+}
+bool flushLog() noexcept {
+    return current().flush();
 }
 
 }  // namespace adminhost

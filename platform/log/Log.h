@@ -1,27 +1,42 @@
 #pragma once
 
-// The system log: one call per event, the text exactly as given. Platform rooms do not log; who calls them does.
+// The system log: one call per event. Platform rooms do not log; their callers do.
+//
+// Every sink writes the text as logTextOf() returns it, so that a name, a value or the output of a tool cannot look
+// like an event of its own. No sink ever blocks: what cannot be written at once waits in a queue of 1 MiB, events
+// beyond it are lost, and their number is logged as soon as the log can be written again.
 
-#include <functional>
+#include <string>
 #include <string_view>
 
 namespace adminhost {
 
-/// Where events go. Called on the thread that logs; must not throw.
+/// Where events go. Called on the thread that logs; must not throw and must not block.
 class LogSink {
   public:
     virtual ~LogSink() = default;
     virtual void write(std::string_view event) noexcept = 0;
+    /// Tries to write what is still queued; returns true when nothing is left.
+    virtual bool flush() noexcept { return true; }
 };
 
-/// syslog(3), facility daemon, priority notice. Line feeds inside an event stay in it, as syslog escapes them.
+/// The text of an event as it is logged. A text without control characters is returned as it is. The lines after the
+/// first are indented by four blanks, line feeds at the end are left out. Other control characters (C0 with the tab,
+/// DEL, C1) and bytes that are not UTF-8 are escaped: "\t", "\r", "\x1b", "\u0085".
+[[nodiscard]] std::string logTextOf(std::string_view event);
+
+/// The syslog socket /dev/log, which is the journal's where it runs: facility daemon, priority notice, one message for
+/// each event. A text beyond what the socket accepts is cut, with the number of omitted bytes.
 [[nodiscard]] LogSink& syslogSink() noexcept;
-/// Standard error, a line feed after each event.
+/// Standard error, with a line feed after each event.
 [[nodiscard]] LogSink& standardErrorSink() noexcept;
 
 /// Sets the process's sink; the caller keeps ownership and keeps it alive. The first sink is standardErrorSink().
 void setLogSink(LogSink& sink) noexcept;
 /// Logs one event.
 void logEvent(std::string_view event) noexcept;
+/// Tries to write what the process's sink has queued; returns true when nothing is left. To be called from time to time
+/// while it returns false: without it, queued events wait for the next one.
+bool flushLog() noexcept;
 
 }  // namespace adminhost

@@ -347,10 +347,13 @@ TEST_F(Answers, RememberedLogIsBoundedAndSaysSo) {
     EXPECT_TRUE(daemon.waitForLog(std::string(10'000, 'y'))) << "the system log has all of it";
 }
 
-TEST_F(Answers, LogTextArrivesExactlyAsItWasGiven) {
-    client.post("/v1/fixture/log", R"({"lines": ["adminhost_lumio: 100% ä [x]", "a\nb"]})");
+TEST_F(Answers, LogTextArrivesExactlyAsItWasGivenButForControlCharacters) {
+    client.post("/v1/fixture/log",
+                R"({"lines": ["adminhost_lumio: 100% ä [x]", "a\nadminhostd: forged", "b\u001b[2J\r\u009b"]})");
     ASSERT_TRUE(daemon.waitForLog("fixture/log"));
-    EXPECT_NE(daemon.log().find("adminhost_lumio: 100% ä [x]\na\nb\n"), std::string::npos) << daemon.log();
+    EXPECT_NE(daemon.log().find("adminhost_lumio: 100% ä [x]\na\n    adminhostd: forged\nb\\x1b[2J\\r\\u009b\n"),
+              std::string::npos)
+        << daemon.log();
 }
 
 TEST_F(Answers, AuditNamesWhoAskedWhatAndTheResultButNoValue) {

@@ -182,5 +182,33 @@ TEST(Connections, AnswersThatNobodyReadsAreBoundedInTotalAndTheOldestIsDropped) 
     EXPECT_TRUE(daemon.waitForLog("its client did not read it"));
 }
 
+TEST(Connections, LogIntoAPipeThatNobodyReadsKeepsNobodyWaiting) {
+    int pipe[2];
+    ASSERT_EQ(::pipe2(pipe, O_CLOEXEC), 0);
+    auto options = withFixture();
+    options.standardError = pipe[1];
+    DaemonProcess daemon(options);
+    UnixHttp client = daemon.connect();
+    for (int i = 0; i < 1000; ++i) {
+        ASSERT_EQ(client.post("/v1/fixture/nothing").status, 204) << i;
+    }
+    ASSERT_EQ(client.post("/v1/fixture/flood", R"({"lines": 40, "bytes": 100000})").status, 204);
+    // Read again, the log goes on, and says what it lacks.
+    std::string text;
+    EXPECT_TRUE(eventually([&] {
+        char buffer[64 << 10];
+        ::fcntl(pipe[0], F_SETFL, O_NONBLOCK);
+        for (ssize_t count = 0; (count = ::read(pipe[0], buffer, sizeof buffer)) > 0;) {
+            text.append(buffer, static_cast<std::size_t>(count));
+        }
+        return text.find("events were lost") != std::string::npos;
+    })) << text.substr(text.size() - std::min<std::size_t>(text.size(), 500));
+    EXPECT_EQ(client.post("/v1/fixture/echo", "{}").status, 200);
+    daemon.signal(SIGTERM);
+    EXPECT_EQ(daemon.wait(), 0);
+    ::close(pipe[0]);
+    ::close(pipe[1]);
+}
+
 }  // namespace
 }  // namespace adminhost::test

@@ -1,0 +1,13 @@
+#pragma once
+
+#include "platform/log/QueuedSink.h"
+
+#include <string_view>
+
+namespace adminhost {
+
+/// Writes to standard error without blocking, whatever it is: a file, a terminal, a pipe that nobody reads, or a
+/// socket. Its flags are left alone, because other processes share them.
+[[nodiscard]] QueuedSink::Written writeToStandardError(std::string_view text);
+
+}  // namespace adminhost
