@@ -76,6 +76,11 @@ Response LumioRequestHandler::getCamerasWithRequest(const Dictionary&) {
     if (!cameras) {
         return failedListing(error);
     }
+    std::vector<Resource*> all;
+    for (const auto& camera : *cameras) {
+        all.push_back(camera.get());
+    }
+    Resource::expandAll(all);
     Array list;
     list.reserve(cameras->size());
     for (const auto& camera : *cameras) {

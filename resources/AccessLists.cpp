@@ -6,6 +6,7 @@
 #include "platform/task/Task.h"
 #include "platform/value/Text.h"
 #include "resources/Resource.h"
+#include "settings/StatementBatch.h"
 
 #include <algorithm>
 #include <cctype>
@@ -96,12 +97,13 @@ void Resource::setACLEnabled(bool enabled) {
     }
 }
 
-std::vector<std::string> Resource::getUserAndGroupACLs() {
-    std::optional<Error> error;
-    const auto rows = querySorvaneDatabase<Dictionary>(
-        "select record_uuid from access_control_entries where resource_type = '" + capitalised(resourceType()) +
-            "' and resource_id = '" + textOf(_data ? _data->get("id") : Value()) + "'",
-        error);
+std::string Resource::accessListStatement() const {
+    return "select record_uuid from access_control_entries where resource_type = '" + capitalised(resourceType()) +
+           "' and resource_id = '" + textOf(_data ? _data->get("id") : Value()) + "'";
+}
+
+std::vector<std::string> Resource::uuidsIn(const std::optional<std::vector<Dictionary>>& rows,
+                                           const std::optional<Error>& error) {
     if (!rows) {
         adminhost::logEvent("getUserAndGroupACLs SQL query returned error: " + textOf(error));
         return {};
@@ -113,6 +115,12 @@ std::vector<std::string> Resource::getUserAndGroupACLs() {
         }
     }
     return uuids;
+}
+
+std::vector<std::string> Resource::getUserAndGroupACLs() {
+    std::optional<Error> error;
+    const auto rows = querySorvaneDatabase<Dictionary>(accessListStatement(), error);
+    return uuidsIn(rows, error);
 }
 
 std::vector<Dictionary> Resource::getDirectoryDetailsForUUIDs(const std::vector<std::string>& uuids,
@@ -152,18 +160,42 @@ std::vector<Dictionary> Resource::getGroupDetailsForUUIDs(const std::vector<std:
 }
 
 void Resource::expandACLs() {
-    if (_data) {
-        const std::string* user = _data->get("use_user_uuid").string();
-        if (user != nullptr && !user->empty()) {
-            const std::vector<Dictionary> entries = getUserDetailsForUUIDs({*user});
-            if (!entries.empty()) {
-                const Dictionary& last = entries.back();
-                _data->set("useUser", last.get(last.contains("longName") ? "longName" : "shortName"));
-            }
-        }
-        _data->set("access_control_enabled", _data->get("access_control_enabled") == Value("t"));
+    expandColumns();
+    expandList(getUserAndGroupACLs());
+}
+
+void Resource::expandAll(const std::vector<Resource*>& resources) {
+    std::vector<std::string> statements;
+    statements.reserve(resources.size());
+    for (const Resource* resource : resources) {
+        statements.push_back(resource->accessListStatement());
     }
-    const std::vector<std::string> uuids = getUserAndGroupACLs();
+    // The tools run ahead while the directory is asked; everything else happens in the order of the resources.
+    StatementBatch batch(std::move(statements));
+    for (Resource* resource : resources) {
+        resource->expandColumns();
+        std::optional<Error> error;
+        const auto rows = batch.next(error);
+        resource->expandList(uuidsIn(rows, error));
+    }
+}
+
+void Resource::expandColumns() {
+    if (!_data) {
+        return;
+    }
+    const std::string* user = _data->get("use_user_uuid").string();
+    if (user != nullptr && !user->empty()) {
+        const std::vector<Dictionary> entries = getUserDetailsForUUIDs({*user});
+        if (!entries.empty()) {
+            const Dictionary& last = entries.back();
+            _data->set("useUser", last.get(last.contains("longName") ? "longName" : "shortName"));
+        }
+    }
+    _data->set("access_control_enabled", _data->get("access_control_enabled") == Value("t"));
+}
+
+void Resource::expandList(const std::vector<std::string>& uuids) {
     _aclsAreExpanded = true;
     std::vector<Dictionary> entries;
     if (!uuids.empty()) {

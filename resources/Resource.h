@@ -80,6 +80,9 @@ class Resource {
     /// The record as administrators see it, or null: with its access list expanded, which happens once. A missing
     /// record is not loaded for it.
     [[nodiscard]] virtual const adminhost::Dictionary* dictionary();
+    /// Expands the access lists of all these resources as dictionary() does, several queries at a time. Answers and log
+    /// lines are in the order of the resources. None of them may have been expanded before.
+    static void expandAll(const std::vector<Resource*>& resources);
     /// "CLASS - guid: UUID, " and the record from the next line on: the fields as they stand, nothing is loaded.
     [[nodiscard]] std::string description() const;
 
@@ -118,6 +121,12 @@ class Resource {
     /// Adds "useUser" and "allowedUsersAndGroups" to the record and makes its access switch a boolean. Works on the
     /// record as it stands: run a second time it would take the boolean true for a text other than "t".
     void expandACLs();
+    // Its steps, with the statement that is run between them.
+    void expandColumns();
+    [[nodiscard]] std::string accessListStatement() const;
+    [[nodiscard]] static std::vector<std::string> uuidsIn(const std::optional<std::vector<adminhost::Dictionary>>& rows,
+                                                          const std::optional<adminhost::Error>& error);
+    void expandList(const std::vector<std::string>& uuids);
     /// The directory's entries for the UUIDs, of one record type or of people and groups. A failing directory is told
     /// on standard output and gives an empty list.
     [[nodiscard]] static std::vector<adminhost::Dictionary> getDirectoryDetailsForUUIDs(

@@ -1,6 +1,5 @@
 #include "settings/QueryRunner.h"
 
-#include "platform/task/Task.h"
 #include "settings/SettingsStore.h"
 
 namespace lumio {
@@ -55,18 +54,22 @@ std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
     return records;
 }
 
-std::optional<std::vector<Dictionary>> runStatement(const std::string& statement, std::optional<Error>& error) {
+adminhost::TaskPlan planOf(const std::string& statement) {
     static const adminhost::HostPath tool("/usr/bin/sqlite3");
-    const std::string database = adminhost::diskPath(SettingsStore::dbPath()).text();
-    std::string output;
-    std::string errorText;
-    const std::int32_t status =
-        adminhost::launch_task(adminhost::diskPath(tool), {"-line", database, statement}, &output, &errorText);
-    if (status != 0) {
-        error = Error{"sqliteQuery", status, "Can't execute sqlite3 query: " + errorText};
+    return {adminhost::diskPath(tool), {"-line", adminhost::diskPath(SettingsStore::dbPath()).text(), statement}};
+}
+
+std::optional<std::vector<Dictionary>> rowsOf(const adminhost::TaskResult& result, std::optional<Error>& error) {
+    if (result.status != 0) {
+        error = Error{"sqliteQuery", result.status, "Can't execute sqlite3 query: " + result.error};
         return std::nullopt;
     }
-    return recordsOfLineOutput(output);
+    return recordsOfLineOutput(result.output);
+}
+
+std::optional<std::vector<Dictionary>> runStatement(const std::string& statement, std::optional<Error>& error) {
+    adminhost::TaskGroup tool;
+    return rowsOf(tool.collect(tool.start(planOf(statement))), error);
 }
 
 }  // namespace lumio

@@ -5,6 +5,7 @@
 // The statement is one argument of the tool, never seen by a shell; its caller has inserted values verbatim. That is
 // the service's contract: nothing is escaped, quoted otherwise or bound here.
 
+#include "platform/task/TaskGroup.h"
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
 
@@ -21,6 +22,12 @@ namespace lumio {
 /// error text. Rows printed before a failure are dropped.
 [[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> runStatement(const std::string& statement,
                                                                              std::optional<adminhost::Error>& error);
+
+/// The tool's run for the statement.
+[[nodiscard]] adminhost::TaskPlan planOf(const std::string& statement);
+/// What runStatement() returns for the result of that run.
+[[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> rowsOf(const adminhost::TaskResult& result,
+                                                                       std::optional<adminhost::Error>& error);
 
 /// The rows in the tool's line output.
 [[nodiscard]] std::vector<adminhost::Dictionary> recordsOfLineOutput(std::string_view output);

@@ -1,0 +1,40 @@
+#pragma once
+
+// Independent statements of one listing, several of them running at a time.
+//
+// The results are those of runStatement() for each statement in turn, and are handed out in that order. As many tools
+// run at once as there are processors, at most 8, and at most 64 results wait to be taken. All share the request's
+// deadline and one bound on captured bytes. With one statement or one processor the tools run one after the other.
+
+#include "platform/task/TaskGroup.h"
+#include "settings/QueryRunner.h"
+
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace lumio {
+
+class StatementBatch {
+  public:
+    /// `atOnce`: how many tools may run at the same time; 0 chooses as described above.
+    explicit StatementBatch(std::vector<std::string> statements, std::size_t atOnce = 0);
+
+    /// The result of the next statement, as runStatement() returns it. Called once for each statement.
+    [[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> next(std::optional<adminhost::Error>& error);
+
+  private:
+    void startMore();
+    void serve();
+    [[nodiscard]] std::size_t running() const;
+    [[nodiscard]] adminhost::TaskResult runAlone();
+
+    std::vector<std::string> _statements;
+    std::size_t _atOnce;
+    std::vector<adminhost::TaskGroup::Id> _tasks;  ///< of the statements that were started, in their order
+    std::size_t _next = 0;                         ///< the statement whose result is handed out next
+    adminhost::TaskGroup _group;
+};
+
+}  // namespace lumio

@@ -1,0 +1,2 @@
+set(TEST_LIBS settings)
+set(TEST_LABELS soak)
