@@ -1,6 +1,7 @@
 // adminhostd-worker: started by the front, with the conversation as descriptor 3.
 
 #include "adminhostd/PluginTrial.h"
+#include "adminhostd/ProcessStart.h"
 #include "adminhostd/Worker.h"
 
 #include <cstdlib>
@@ -8,10 +9,10 @@
 #include <iostream>
 #include <string_view>
 
-#include <fcntl.h>
 #include <sys/stat.h>
 
 int main(int count, char** arguments) {
+    adminhost::startProcess();
     if (count == 3 && std::string_view(arguments[1]) == adminhost::trialArgument) {
         return adminhost::serveTrial(arguments[2]);
     }
@@ -21,7 +22,6 @@ int main(int count, char** arguments) {
         std::cerr << "adminhostd-worker is started by adminhostd\n";
         return 2;
     }
-    ::fcntl(conversation, F_SETFD, FD_CLOEXEC);
     ::unsetenv("NOTIFY_SOCKET");
     try {
         return adminhost::runWorker(conversation);

@@ -129,8 +129,14 @@ bool WorkerProcess::converse() {
 }
 
 const std::optional<std::string>& WorkerProcess::ending() {
+    if (_ending) {
+        return _ending;
+    }
     int status = 0;
-    if (!_ending && ::waitpid(_pid, &status, WNOHANG) == _pid) {
+    const pid_t waited = ::waitpid(_pid, &status, WNOHANG);
+    if (waited < 0 && errno == ECHILD) {
+        _ending = "ended, and the system does not know how";
+    } else if (waited == _pid) {
         if (WIFSIGNALED(status)) {
             _ending = fmt::format("was killed by signal {} ({})", WTERMSIG(status), ::strsignal(WTERMSIG(status)));
         } else {

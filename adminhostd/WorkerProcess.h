@@ -1,6 +1,6 @@
 #pragma once
 
-// The front's side of a worker: the child process and the buffered, never waiting conversation with it.
+// The front's side of a worker: the child process and the buffered conversation with it, which never blocks.
 
 #include "adminhostd/Frame.h"
 #include "platform/files/FileDescriptor.h"
@@ -33,17 +33,17 @@ class WorkerProcess {
 
     /// Queues a frame and sends what can be sent. False when it is too large for a frame.
     [[nodiscard]] bool send(FrameType type, const Value& payload);
-    /// Reads and writes what can be done without waiting, but not without end: answers whether there may be more to
+    /// Reads and writes what can be done without waiting, but not without end: returns true if there may be more to
     /// read at once.
     bool converse();
     /// The next frame that has arrived.
     [[nodiscard]] std::optional<Frame> next() { return _reader.next(); }
-    /// Whether the worker says what is no frame.
+    /// Whether the worker has sent bytes that are not a frame.
     [[nodiscard]] bool broken() const noexcept { return _reader.broken(); }
-    /// How the process ended ("was killed by signal 11 (Segmentation fault)"); nothing while it runs.
+    /// How the process ended ("was killed by signal 11 (Segmentation fault)"); nullopt while it runs.
     [[nodiscard]] const std::optional<std::string>& ending();
     void kill() noexcept;
-    /// Asks it to end by closing the conversation; waits for that, but not longer than the milliseconds.
+    /// Asks it to end by closing the conversation, and waits for its end, at most for the milliseconds.
     void finish(int milliseconds);
 
   private:

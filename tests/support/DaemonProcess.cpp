@@ -151,6 +151,9 @@ std::optional<int> DaemonProcess::wait(std::chrono::milliseconds bound) {
 }
 
 std::size_t descriptorsOf(pid_t pid) {
+    if (::geteuid() != 0 && ::access(("/proc/" + std::to_string(pid) + "/fd").c_str(), R_OK) != 0) {
+        return 0;  // the daemon denies its inspection; only root sees its descriptors
+    }
     const std::filesystem::directory_iterator entries("/proc/" + std::to_string(pid) + "/fd");
     return static_cast<std::size_t>(std::distance(begin(entries), end(entries)));
 }

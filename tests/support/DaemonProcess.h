@@ -58,7 +58,7 @@ class DaemonProcess {
     std::optional<int> _status;
 };
 
-/// Open descriptors of a process.
+/// Open descriptors of a process. Always 0 for a daemon if the test does not run as root.
 [[nodiscard]] std::size_t descriptorsOf(pid_t pid);
 /// Resident memory of a process in kilobytes.
 [[nodiscard]] std::size_t residentKilobytesOf(pid_t pid);

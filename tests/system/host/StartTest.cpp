@@ -5,14 +5,18 @@
 #include "tests/system/host/Host.h"
 
 #include <csignal>
+#include <cstdint>
 #include <fstream>
 #include <iterator>
 
 #include <fcntl.h>
 #include <grp.h>
+#include <linux/capability.h>
 #include <sys/file.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -21,6 +25,23 @@ namespace adminhost::test {
 namespace {
 
 namespace fs = std::filesystem;
+
+/// A set of signals of a process, by its name in /proc.
+std::uint64_t signalsOf(pid_t pid, const std::string& name) {
+    std::ifstream file("/proc/" + std::to_string(pid) + "/status");
+    for (std::string word; file >> word;) {
+        if (word == name + ":") {
+            std::uint64_t signals = ~std::uint64_t{0};
+            file >> std::hex >> signals;
+            return signals;
+        }
+    }
+    return ~std::uint64_t{0};
+}
+
+constexpr std::uint64_t bitOf(int signal) {
+    return std::uint64_t{1} << static_cast<unsigned>(signal - 1);
+}
 
 class Start : public ::testing::Test {
   protected:
@@ -95,7 +116,8 @@ TEST_F(Start, RelativeRootAndPluginAreBelowTheDirectoryThatItIsStartedIn) {
 
 TEST_F(Start, WorkerAndSoItsToolsRunInTheRootDirectory) {
     const DaemonProcess daemon(withFixture());
-    EXPECT_EQ(fs::read_symlink("/proc/" + std::to_string(daemon.workerPid()) + "/cwd"), "/");
+    const Dictionary answer = dictionaryOf(daemon.connect().post("/v1/fixture/run", R"({"script": "pwd -P"})"));
+    EXPECT_EQ(answer.get("output"), Value("/\n"));
 }
 
 TEST_F(Start, WhatOperationsPrintGoesToStandardOutputWhenTheLogDoesNot) {
@@ -324,11 +346,87 @@ TEST_F(Start, WhatTheParentLeftOpenReachesNoTool) {
     ASSERT_EQ(::pipe(ends), 0);  // inherited by whatever this test starts
     DaemonProcess daemon(withFixture());
     ::close(ends[1]);
-    const fs::path pipe = fs::read_symlink("/proc/self/fd/" + std::to_string(ends[0]));
-    for (const auto& entry : fs::directory_iterator("/proc/" + std::to_string(daemon.workerPid()) + "/fd")) {
-        EXPECT_NE(fs::read_symlink(entry.path()), pipe) << entry.path();
-    }
+    // The daemon itself still has it.
+    const std::string listing = "for fd in /proc/self/fd/*; do readlink $fd; done";
+    const Dictionary answer =
+        dictionaryOf(daemon.connect().post("/v1/fixture/run", "{\"script\": \"" + listing + "\"}"));
+    const std::string pipe = fs::read_symlink("/proc/self/fd/" + std::to_string(ends[0]));
+    EXPECT_EQ(textAt(answer, "output").find(pipe + "\n"), std::string::npos) << textAt(answer, "output");
+    EXPECT_NE(textAt(answer, "output").find("/dev/null\n"), std::string::npos) << textAt(answer, "output");
     ::close(ends[0]);
+}
+
+TEST_F(Start, SignalsThatTheParentIgnoredOrBlockedAreAtTheirDefaultInBothProcesses) {
+    sigset_t blocked{};
+    sigset_t unblocked{};
+    ::sigemptyset(&blocked);
+    ::sigaddset(&blocked, SIGUSR2);
+    ASSERT_EQ(::pthread_sigmask(SIG_BLOCK, &blocked, &unblocked), 0);
+    const auto before = std::signal(SIGCHLD, SIG_IGN);
+    DaemonProcess daemon(withFixture());
+    static_cast<void>(std::signal(SIGCHLD, before));
+    ::pthread_sigmask(SIG_SETMASK, &unblocked, nullptr);
+    for (const pid_t pid : {daemon.pid(), daemon.workerPid()}) {
+        EXPECT_EQ(signalsOf(pid, "SigIgn") & bitOf(SIGCHLD), 0U);
+        EXPECT_EQ(signalsOf(pid, "SigBlk") & bitOf(SIGUSR2), 0U);
+    }
+}
+
+/// Whether this process may inspect another one.
+bool inspects(pid_t pid) {
+    char buffer[8];
+    return ::readlink(("/proc/" + std::to_string(pid) + "/exe").c_str(), buffer, sizeof buffer) > 0;
+}
+
+/// Gives up root's right to inspect every process, for this process and for what it starts.
+bool inspectNoLongerAsRoot() {
+    __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+    __user_cap_data_struct capabilities[_LINUX_CAPABILITY_U32S_3]{};
+    if (::geteuid() != 0) {
+        return true;
+    }
+    if (::prctl(PR_CAPBSET_DROP, CAP_SYS_PTRACE, 0, 0, 0) != 0 || ::syscall(SYS_capget, &header, capabilities) != 0) {
+        return false;
+    }
+    for (auto* set : {&capabilities[0].effective, &capabilities[0].permitted, &capabilities[0].inheritable}) {
+        *set &= ~(1U << CAP_SYS_PTRACE);
+    }
+    return ::syscall(SYS_capset, &header, capabilities) == 0;
+}
+
+TEST_F(Start, OtherProcessesOfTheAccountCannotInspectFrontAndWorkerOnlyTheirTools) {
+#ifdef ADMINHOST_SANITIZED
+    constexpr bool expected = true;  // a sanitizer inspects its own process
+#else
+    constexpr bool expected = false;
+#endif
+    const pid_t child = ::fork();
+    if (child == 0) {
+        int status = 1;
+        if (inspectNoLongerAsRoot()) {
+            try {
+                DaemonProcess daemon(withFixture());
+                const pid_t worker = daemon.workerPid();
+                const std::string mark = daemon.directory() / "tool";
+                UnixHttp client = daemon.connect();
+                client.begin("POST", "/v1/fixture/run",
+                             "{\"script\": \"echo $$ > " + mark + ".new; mv " + mark + ".new " + mark +
+                                 "; read line < /dev/zero\"}");
+                pid_t tool = 0;
+                status = eventually([&] { return fs::exists(mark); }) && std::ifstream(mark) >> tool ? 0 : 2;
+                status += inspects(daemon.pid()) == expected ? 0 : 10;
+                status += inspects(worker) == expected ? 0 : 20;
+                status += inspects(tool) ? 0 : 40;
+                ::kill(tool, SIGKILL);
+            } catch (const std::exception&) {
+                status = 3;
+            }
+        }
+        ::_exit(status);
+    }
+    int status = -1;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    EXPECT_EQ(status, 0) << WEXITSTATUS(status);
 }
 
 TEST_F(Start, CommandLineMistakesAreUsageErrors) {

@@ -52,6 +52,19 @@ TEST(WorkerTrouble, KilledWhileIdleItIsReplaced) {
     }
 }
 
+TEST(WorkerTrouble, KilledUnderADaemonThatWasStartedWithSigchldIgnoredItIsReplaced) {
+    const auto before = std::signal(SIGCHLD, SIG_IGN);
+    DaemonProcess daemon(withFixture());
+    static_cast<void>(std::signal(SIGCHLD, before));
+    const pid_t first = daemon.workerPid();
+    UnixHttp client = startSleeping(daemon, 10'000);
+    ::kill(first, SIGKILL);
+    expectError(client.reply(), 500, "WORKER_FAILED");
+    EXPECT_TRUE(daemon.waitForLog("the worker was killed by signal 9"));
+    EXPECT_EQ(client.post("/v1/fixture/echo", "{}").status, 200);
+    EXPECT_NE(daemon.workerPid(), first);
+}
+
 TEST(WorkerTrouble, OverrunIs504AndTheNextRequestWorks) {
     DaemonProcess daemon(withFixture("request_deadline_seconds = 0.3\n"));
     UnixHttp client = daemon.connect();
