@@ -3,7 +3,7 @@
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/Width.h"
 #include "platform/json/Json.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 

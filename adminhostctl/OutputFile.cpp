@@ -2,7 +2,6 @@
 
 #include "adminhostctl/Failure.h"
 #include "platform/files/ReplaceFile.h"
-#include "platform/value/Text.h"
 
 #include <filesystem>
 #include <fstream>

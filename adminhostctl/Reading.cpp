@@ -2,7 +2,7 @@
 
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 #include <array>

@@ -3,7 +3,8 @@
 #include "adminhostctl/Failure.h"
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/text/LocalDate.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <cctype>

@@ -3,7 +3,7 @@
 #include "adminhostctl/Reading.h"
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 

@@ -1,6 +1,6 @@
 #include "adminhostctl/Width.h"
 
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <clocale>
@@ -11,26 +11,6 @@
 
 namespace adminhost::ctl {
 namespace {
-
-/// One character of well-formed UTF-8.
-struct Character {
-    char32_t code;
-    std::size_t size;
-};
-
-Character characterAt(std::string_view text, std::size_t at) noexcept {
-    const auto byte = [&](std::size_t i) { return static_cast<unsigned char>(text[at + i]); };
-    const unsigned first = byte(0);
-    const std::size_t size = first < 0x80 ? 1 : first < 0xE0 ? 2 : first < 0xF0 ? 3 : 4;
-    if (size == 1 || at + size > text.size()) {
-        return {first, 1};
-    }
-    char32_t code = first & (0xFFU >> (size + 1));
-    for (std::size_t i = 1; i < size; ++i) {
-        code = (code << 6U) | (byte(i) & 0x3FU);
-    }
-    return {code, size};
-}
 
 /// Widths are those of the C library's Unicode locale, whatever locale the program runs in.
 class UnicodeLocale {
@@ -73,7 +53,7 @@ std::size_t fitting(std::string_view text, std::size_t width) {
     std::size_t at = 0;
     std::size_t used = 0;
     while (at < text.size()) {
-        const Character character = characterAt(text, at);
+        const Utf8Character character = firstCharacterOf(std::string_view(text).substr(at));
         const std::size_t more = widthOfCode(character.code);
         if (used + more > width && at > 0) {
             break;
@@ -90,7 +70,7 @@ std::string shown(std::string_view text) {
     const std::string clean = utf8Of(text);
     std::string out;
     for (std::size_t at = 0; at < clean.size();) {
-        const Character character = characterAt(clean, at);
+        const Utf8Character character = firstCharacterOf(std::string_view(clean).substr(at));
         if (character.code != '\n' && isActedOn(character.code)) {
             out += character.code < 0x100 ? fmt::format("\\x{:02x}", static_cast<std::uint32_t>(character.code))
                                           : fmt::format("\\u{:04x}", static_cast<std::uint32_t>(character.code));
@@ -105,7 +85,7 @@ std::string shown(std::string_view text) {
 std::size_t widthOf(std::string_view text) {
     std::size_t width = 0;
     for (std::size_t at = 0; at < text.size();) {
-        const Character character = characterAt(text, at);
+        const Utf8Character character = firstCharacterOf(std::string_view(text).substr(at));
         width += widthOfCode(character.code);
         at += character.size;
     }

@@ -3,7 +3,7 @@
 #include "adminhostd/RequestBody.h"
 #include "adminhostd/Worker.h"
 #include "platform/log/Log.h"
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <functional>

@@ -2,7 +2,7 @@
 
 #include "adminhostd/PluginCall.h"
 #include "platform/files/FileDescriptor.h"
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <bit>

@@ -3,7 +3,7 @@
 #include "adminhostd/PluginFile.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/task/StartChild.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -12,7 +12,7 @@
 #include "platform/files/ReplaceFile.h"
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 #include <chrono>

@@ -8,7 +8,7 @@
 #include "platform/directory/Directory.h"
 #include "platform/directory/Entries.h"
 #include "platform/directory/LocalAccounts.h"
-#include "platform/directory/Uuid.h"
+#include "platform/directory/NameBasedUuid.h"
 
 #include <chrono>
 #include <cstdlib>

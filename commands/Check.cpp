@@ -2,7 +2,7 @@
 // what those cannot carry is therefore refused here, as a whole, before anything has been changed.
 
 #include "commands/CommandTable.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 #include <array>

@@ -2,7 +2,7 @@
 // refused with a place and in valid UTF-8.
 
 #include "platform/json/Json.h"
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
 
 #include <cstdint>
 #include <cstdlib>

@@ -6,7 +6,7 @@
 #include "platform/dnssd/HostName.h"
 #include "platform/dnssd/NetService.h"
 #include "platform/log/Log.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 namespace lumio {
 

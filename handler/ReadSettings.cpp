@@ -1,6 +1,6 @@
 #include "handler/LumioRequestHandler.h"
 #include "platform/crypto/Crypt.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "resources/Property.h"
 
 #include <algorithm>

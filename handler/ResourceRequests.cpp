@@ -1,6 +1,6 @@
 #include "handler/LumioRequestHandler.h"
 #include "platform/log/Log.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "resources/Camera.h"
 #include "resources/Property.h"
 

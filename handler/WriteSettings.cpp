@@ -5,7 +5,7 @@
 #include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/task/Task.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "resources/Property.h"
 
 #include <string>

@@ -2,8 +2,8 @@
 
 #include "krb5/KRB5CredentialCache.h"
 #include "krb5/KRB5Keytab.h"
-#include "krb5/Text.h"
-#include "platform/value/Text.h"
+#include "krb5/LibraryText.h"
+#include "platform/text/Utf8.h"
 
 #include <cerrno>
 #include <cstdlib>

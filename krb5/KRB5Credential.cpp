@@ -1,6 +1,6 @@
 #include "krb5/KRB5Credential.h"
 
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <utility>
 

@@ -1,6 +1,6 @@
 #include "krb5/KRB5CredentialCache.h"
 
-#include "krb5/Text.h"
+#include "krb5/LibraryText.h"
 
 #include <algorithm>
 #include <cstdint>

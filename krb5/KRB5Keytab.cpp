@@ -1,6 +1,7 @@
 #include "krb5/KRB5Keytab.h"
 
-#include "krb5/Text.h"
+#include "krb5/LibraryText.h"
+#include "platform/value/ValueText.h"
 
 #include <array>
 #include <cstring>

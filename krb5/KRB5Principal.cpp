@@ -1,6 +1,6 @@
 #include "krb5/KRB5Principal.h"
 
-#include "krb5/Text.h"
+#include "krb5/LibraryText.h"
 
 #include <utility>
 

@@ -4,7 +4,7 @@
 #include "platform/directory/Membership.h"
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "resources/Resource.h"
 #include "settings/StatementBatch.h"
 

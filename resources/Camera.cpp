@@ -2,7 +2,7 @@
 
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <cstdlib>
 

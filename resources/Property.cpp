@@ -4,7 +4,8 @@
 #include "platform/bundle/Bundle.h"
 #include "platform/crypto/Crypt.h"
 #include "platform/log/Log.h"
-#include "platform/value/Text.h"
+#include "platform/text/LocalDate.h"
+#include "platform/value/ValueText.h"
 #include "resources/WrappedRows.h"
 
 #include <algorithm>

@@ -3,7 +3,8 @@
 #include "platform/files/File.h"
 #include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
+#include "platform/value/ValueText.h"
 #include "resources/Property.h"
 #include "settings/SettingsStore.h"
 

@@ -1,7 +1,8 @@
 #include "resources/Resource.h"
 
 #include "platform/bundle/Bundle.h"
-#include "platform/value/Text.h"
+#include "platform/text/LocalDate.h"
+#include "platform/value/ValueText.h"
 
 namespace lumio {
 

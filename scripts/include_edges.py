@@ -12,7 +12,7 @@ SOURCES = {".cpp", ".h"}
 INCLUDE = re.compile(r'^\s*#\s*include\s*"([^"]+)"')
 # Room: the rooms and folders that it may include besides itself. Rooms and folders are path prefixes. Of a file's path the
 # longest prefix counts, so a room inside another one, or a folder or file that is named on its own, goes before it.
-CONTROL = {"platform/value", "platform/plist", "platform/json", "platform/files"}
+CONTROL = {"platform/value", "platform/text", "platform/plist", "platform/json", "platform/files"}
 MAY_INCLUDE = {
     "platform": set(),
     "codec": {"platform"},

@@ -2,7 +2,7 @@
 
 #include "platform/crypto/Digest.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "settings/QueryRunner.h"
 #include "settings/SettingsStore.h"
 

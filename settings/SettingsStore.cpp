@@ -2,7 +2,8 @@
 
 #include "platform/files/File.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
+#include "platform/value/ValueText.h"
 
 #include <unicode/uchar.h>
 #include <unicode/utf8.h>

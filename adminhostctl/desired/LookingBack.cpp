@@ -5,7 +5,7 @@
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/Writing.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 

@@ -2,7 +2,7 @@
 
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/desired/Toml.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 #include <array>

@@ -1,11 +1,12 @@
 #include "adminhostctl/desired/Toml.h"
 
 #include "adminhostctl/Width.h"
+#include "platform/text/IsoDate.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <cmath>
 
-#include <fmt/chrono.h>
 #include <fmt/format.h>
 
 namespace adminhost::ctl {
@@ -24,18 +25,14 @@ std::string tomlText(std::string_view text) {
             quoted += fmt::format("\\u{:04X}", byte);
         } else if (byte >= 0xC0) {
             // A whole character: what a terminal would act on (C1 controls, changes of direction) is written by number.
-            const std::size_t length = byte < 0xE0 ? 2 : byte < 0xF0 ? 3 : 4;
-            const std::string_view character = text.substr(at, length);
+            const Utf8Character first = firstCharacterOf(text.substr(at));
+            const std::string_view character = text.substr(at, first.size);
             if (shown(character) == character) {
                 quoted += character;
             } else {
-                std::uint32_t number = byte & (0xFFU >> (length + 1));
-                for (const char next : character.substr(1)) {
-                    number = (number << 6U) | (static_cast<unsigned char>(next) & 0x3FU);
-                }
-                quoted += fmt::format("\\U{:08X}", number);
+                quoted += fmt::format("\\U{:08X}", static_cast<std::uint32_t>(first.code));
             }
-            at += length - 1;
+            at += first.size - 1;
         } else {
             quoted += text[at];
         }
@@ -66,7 +63,7 @@ std::optional<std::string> tomlValue(const Value& value) {
         return std::isfinite(*real) && text.find_first_of(".e") == std::string::npos ? text + ".0" : text;
     }
     if (const auto date = value.date()) {
-        return fmt::format("{:%Y-%m-%dT%H:%M:%SZ}", fmt::gmtime(std::chrono::system_clock::to_time_t(*date)));
+        return isoTextOf(*date);
     }
     return std::nullopt;
 }

@@ -2,7 +2,7 @@
 
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/Toml.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 namespace adminhost::ctl {
 namespace {

@@ -4,7 +4,7 @@
 #include "adminhostctl/desired/State.h"
 #include "adminhostctl/desired/Toml.h"
 #include "adminhostctl/desired/Writing.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <array>
 

@@ -3,7 +3,7 @@
 
 #include "krb5/KRB5CredentialCache.h"
 #include "krb5/KRB5Keytab.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <ctime>
 #include <iomanip>

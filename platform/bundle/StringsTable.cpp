@@ -1,7 +1,9 @@
 #include "platform/bundle/StringsTable.h"
 
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/text/Hex.h"
+#include "platform/text/LineAndColumn.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <cstring>
@@ -20,25 +22,6 @@ void setError(Error* error, std::string description) {
     }
 }
 
-void appendUtf8(std::string& text, char32_t character) {
-    const auto add = [&](char32_t bits) { text += static_cast<char>(bits); };
-    if (character < 0x80) {
-        add(character);
-    } else if (character < 0x800) {
-        add(0xC0 | (character >> 6U));
-        add(0x80 | (character & 0x3FU));
-    } else if (character < 0x10000) {
-        add(0xE0 | (character >> 12U));
-        add(0x80 | ((character >> 6U) & 0x3FU));
-        add(0x80 | (character & 0x3FU));
-    } else {
-        add(0xF0 | (character >> 18U));
-        add(0x80 | ((character >> 12U) & 0x3FU));
-        add(0x80 | ((character >> 6U) & 0x3FU));
-        add(0x80 | (character & 0x3FU));
-    }
-}
-
 bool isHighSurrogate(char32_t unit) noexcept {
     return unit >= 0xD800 && unit < 0xDC00;
 }
@@ -49,31 +32,13 @@ char32_t joined(char32_t high, char32_t low) noexcept {
     return 0x10000 + ((high - 0xD800) << 10U) + (low - 0xDC00);
 }
 
-/// Nothing if it is not well-formed.
+/// Returns nullopt if it is not well-formed.
 std::optional<std::string> textOfUtf16(std::string_view bytes, bool bigEndian) {
-    if (bytes.size() % 2 != 0) {
-        return std::nullopt;
-    }
-    const auto unitAt = [&](std::size_t at) -> char32_t {
-        const auto first = static_cast<unsigned char>(bytes[at]);
-        const auto second = static_cast<unsigned char>(bytes[at + 1]);
-        return bigEndian ? (char32_t{first} << 8U) | second : (char32_t{second} << 8U) | first;
-    };
-    std::string text;
-    for (std::size_t at = 0; at < bytes.size(); at += 2) {
-        char32_t unit = unitAt(at);
-        if (isHighSurrogate(unit) && at + 2 < bytes.size() && isLowSurrogate(unitAt(at + 2))) {
-            at += 2;
-            unit = joined(unit, unitAt(at));
-        } else if (isHighSurrogate(unit) || isLowSurrogate(unit)) {
-            return std::nullopt;
-        }
-        appendUtf8(text, unit);
-    }
-    return text;
+    FromUtf16 converted = utf8OfUtf16(bytes, bigEndian);
+    return converted.end == bytes.size() ? std::optional(std::move(converted.text)) : std::nullopt;
 }
 
-/// The table's text in UTF-8 without a byte-order mark; nothing if it is in no encoding that is read.
+/// The table's text in UTF-8 without a byte-order mark. Returns nullopt if it is in none of the encodings read.
 std::optional<std::string> textOfTable(std::string_view bytes) {
     if (bytes.starts_with("\xFE\xFF") || bytes.starts_with("\xFF\xFE")) {
         return textOfUtf16(bytes.substr(2), bytes[0] == '\xFE');
@@ -93,13 +58,6 @@ bool isBlank(char c) noexcept {
 }
 bool isOctal(char c) noexcept {
     return c >= '0' && c <= '7';
-}
-int hexValue(char c) noexcept {
-    if (c >= '0' && c <= '9') {
-        return c - '0';
-    }
-    c = static_cast<char>(c | 0x20);
-    return c >= 'a' && c <= 'f' ? c - 'a' + 10 : -1;
 }
 bool isUnquoted(char c) noexcept {
     return (c >= '0' && c <= '9') || (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') ||
@@ -127,12 +85,7 @@ class Parser {
     }
 
     [[nodiscard]] std::string problem() const {
-        const std::string_view before = _text.substr(0, _at);
-        const auto line = std::count(before.begin(), before.end(), '\n') + 1;
-        const std::string_view lineStart = before.substr(before.rfind('\n') + 1);
-        const auto column =
-            std::count_if(lineStart.begin(), lineStart.end(), [](char c) { return (c & 0xC0) != 0x80; }) + 1;
-        return fmt::format("line {}, column {}: {}", line, column, _problem);
+        return fmt::format("{}: {}", lineAndColumnAfter(_text.substr(0, _at)), _problem);
     }
 
   private:
@@ -247,7 +200,7 @@ class Parser {
     bool readData(Data& data) {
         int high = -1;
         for (; !atEnd(); ++_at) {
-            const int digit = hexValue(_text[_at]);
+            const int digit = hexValueOf(_text[_at]);
             if (digit >= 0) {
                 if (high >= 0) {
                     data.push_back(static_cast<std::uint8_t>(high * 16 + digit));
@@ -355,7 +308,7 @@ class Parser {
         ++_at;
         unit = 0;
         for (int i = 0; i < 4; ++i, ++_at) {
-            const int digit = atEnd() ? -1 : hexValue(_text[_at]);
+            const int digit = atEnd() ? -1 : hexValueOf(_text[_at]);
             if (digit < 0) {
                 return false;
             }

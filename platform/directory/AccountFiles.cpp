@@ -1,7 +1,9 @@
 #include "platform/directory/AccountFiles.h"
 
+#include "platform/directory/NameBasedUuid.h"
 #include "platform/files/File.h"
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 #include <cerrno>

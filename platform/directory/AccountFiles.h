@@ -6,8 +6,8 @@
 // many look-ups one request makes, they share one pass over the accounts. Every look-up asks the file system
 // whether that still holds; a file changed within the clock's resolution of being read is read again.
 
-#include "platform/directory/Uuid.h"
 #include "platform/files/Path.h"
+#include "platform/text/Uuid.h"
 #include "platform/value/Error.h"
 
 #include <cstddef>

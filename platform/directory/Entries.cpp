@@ -1,6 +1,6 @@
 #include "platform/directory/Entries.h"
 
-#include "platform/directory/Uuid.h"
+#include "platform/text/Uuid.h"
 
 #include <set>
 #include <tuple>

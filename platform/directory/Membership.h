@@ -5,7 +5,7 @@
 // All look-ups go through the nodes of the default session and so see the accounts below the system root, not the name
 // service of the machine the process runs on. A directory that cannot answer counts as "not found".
 
-#include "platform/directory/Uuid.h"
+#include "platform/text/Uuid.h"
 
 #include <cstdint>
 #include <optional>

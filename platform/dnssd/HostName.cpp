@@ -1,6 +1,6 @@
 #include "platform/dnssd/HostName.h"
 
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
 
 #include <cstring>
 

@@ -1,7 +1,7 @@
 #include "platform/dnssd/NetService.h"
 
 #include "platform/dnssd/Poll.h"
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <cstring>

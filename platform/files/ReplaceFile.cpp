@@ -1,6 +1,7 @@
 #include "platform/files/ReplaceFile.h"
 
 #include "platform/files/Directory.h"
+#include "platform/text/Hex.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -25,7 +26,6 @@
 namespace adminhost {
 namespace {
 
-constexpr std::string_view hexDigits = "0123456789abcdef";
 constexpr std::size_t randomDigits = 16;
 constexpr const char* accessList = "system.posix_acl_access";
 
@@ -54,7 +54,7 @@ void removeLeftoversIn(const FilePlace& place) {
     while (const dirent* entry = ::readdir(directory.get())) {
         const std::string_view name = entry->d_name;
         if (name.size() != prefix.size() + randomDigits || !name.starts_with(prefix) ||
-            name.find_first_not_of(hexDigits, prefix.size()) != std::string_view::npos) {
+            name.find_first_not_of(lowerHexDigits, prefix.size()) != std::string_view::npos) {
             continue;
         }
         const FileDescriptor leftover(

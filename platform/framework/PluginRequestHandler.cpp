@@ -1,10 +1,6 @@
 #include "platform/framework/PluginRequestHandler.h"
 
-#include <array>
-#include <cstdint>
-#include <stdexcept>
-
-#include <sys/random.h>
+#include "platform/text/Uuid.h"
 
 namespace adminhost {
 namespace {
@@ -50,22 +46,7 @@ void setUserDefault(std::string_view name, Value value) {
 }
 
 std::string makeUUIDString() {
-    std::array<std::uint8_t, 16> bytes{};
-    if (::getrandom(bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size())) {
-        throw std::runtime_error("the system's random source did not answer");
-    }
-    bytes[6] = static_cast<std::uint8_t>((bytes[6] & 0x0fU) | 0x40U);  // version 4
-    bytes[8] = static_cast<std::uint8_t>((bytes[8] & 0x3fU) | 0x80U);  // variant of RFC 4122
-    constexpr std::string_view digits = "0123456789ABCDEF";
-    std::string text;
-    for (std::size_t i = 0; i < bytes.size(); ++i) {
-        if (i == 4 || i == 6 || i == 8 || i == 10) {
-            text += '-';
-        }
-        text += digits[bytes[i] >> 4U];
-        text += digits[bytes[i] & 0x0fU];
-    }
-    return text;
+    return textOf(randomUuid());
 }
 
 }  // namespace adminhost

@@ -1,5 +1,7 @@
 #include "platform/json/Json.h"
-#include "platform/json/JsonForms.h"
+#include "platform/text/Base64Text.h"
+#include "platform/text/IsoDate.h"
+#include "platform/text/LineAndColumn.h"
 
 #include <algorithm>
 #include <iterator>
@@ -156,13 +158,13 @@ bool Builder::string(const std::string& value) {
     }
     Level& level = _levels.back();
     if (level.form == "$date") {
-        const auto date = json::dateOf(value);
+        const auto date = isoDateOf(value);
         if (!date) {
             return fail("a date is written as {\"$date\": \"2026-01-31T08:00:00Z\"}");
         }
         level.formed = *date;
     } else if (level.form == "$data") {
-        auto data = json::base64Data(value);
+        auto data = bytesOfBase64Text(value);
         if (!data) {
             return fail("data is written as {\"$data\": BASE64}, with padding and without line feeds");
         }
@@ -214,17 +216,6 @@ bool Builder::parse_error(std::size_t position, const std::string&, const Json::
     return fail(std::string(text));
 }
 
-std::string place(std::string_view text, std::size_t consumed) {
-    // The last character that was read is the offending one.
-    const std::string_view before = text.substr(0, consumed == 0 ? 0 : consumed - 1);
-    const std::size_t lineStart = before.rfind('\n') == std::string_view::npos ? 0 : before.rfind('\n') + 1;
-    const auto line = std::count(before.begin(), before.end(), '\n') + 1;
-    const auto column = std::count_if(before.begin() + static_cast<std::ptrdiff_t>(lineStart), before.end(),
-                                      [](char c) { return (static_cast<unsigned char>(c) & 0xC0U) != 0x80U; }) +
-                        1;
-    return fmt::format("line {}, column {}: ", line, column);
-}
-
 }  // namespace
 
 std::optional<Value> parseJson(std::string_view text, Error* error, std::size_t valuesMaximum) {
@@ -238,14 +229,16 @@ std::optional<Value> parseJson(std::string_view text, Error* error, std::size_t 
             return builder.take();
         }
         if (error != nullptr) {
-            *error = Error{"json", 1, place(text, nul + 1) + "only white space may follow the value"};
+            *error =
+                Error{"json", 1, lineAndColumnAfter(text.substr(0, nul)) + ": only white space may follow the value"};
         }
         return std::nullopt;
     }
     if (error != nullptr) {
         const std::size_t consumed = builder.position().value_or(static_cast<std::size_t>(reached - text.data()));
+        // The last character that was read is the offending one.
         *error = Error{"json", builder.tooMany() ? jsonTooManyValues : 1,
-                       place(text, std::min(consumed, text.size() + 1)) + builder.problem()};
+                       lineAndColumnAfter(text.substr(0, consumed == 0 ? 0 : consumed - 1)) + ": " + builder.problem()};
     }
     return std::nullopt;
 }

@@ -1,6 +1,8 @@
 #include "platform/json/Json.h"
-#include "platform/json/JsonForms.h"
-#include "platform/value/Text.h"
+#include "platform/text/Base64Text.h"
+#include "platform/text/Hex.h"
+#include "platform/text/IsoDate.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <charconv>
@@ -61,7 +63,6 @@ void Writer::writeString(std::string_view bytes) {
         writeString(utf8Of(bytes));
         return;
     }
-    constexpr std::string_view digits = "0123456789abcdef";
     _text += '"';
     const auto isPlain = [](char c) {
         return static_cast<unsigned char>(c) >= 0x20 && c != '"' && c != '\\' && c != 0x7f;
@@ -91,8 +92,7 @@ void Writer::writeString(std::string_view bytes) {
                 break;
             default:
                 _text += "\\u00";
-                _text += digits[static_cast<unsigned char>(c) >> 4U];
-                _text += digits[static_cast<unsigned char>(c) & 0x0fU];
+                appendHex(_text, static_cast<std::uint8_t>(c));
         }
     }
     _text += '"';
@@ -120,10 +120,10 @@ void Writer::write(const Value& value, std::size_t level) {
             writeString(*value.string());
             return;
         case Value::Type::date:
-            writeWrapped("$date", json::dateText(*value.date()));
+            writeWrapped("$date", isoTextOf(*value.date()));
             return;
         case Value::Type::data:
-            writeWrapped("$data", json::base64Text(*value.data()));
+            writeWrapped("$data", base64TextOf(*value.data()));
             return;
         case Value::Type::array: {
             const char* separator = "[";

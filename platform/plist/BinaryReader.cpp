@@ -1,5 +1,7 @@
-#include "platform/plist/Formats.h"
 #include "platform/plist/PropertyList.h"
+#include "platform/plist/Readers.h"
+#include "platform/text/IsoDate.h"
+#include "platform/text/Utf8.h"
 
 #include <bit>
 #include <cmath>
@@ -186,7 +188,7 @@ class BinaryReader {
             return fail(at, "a date outside the years 0000 to 9999");
         }
         const Date date(std::chrono::seconds(static_cast<std::int64_t>(seconds) + epochOfDates));
-        if (!isWritableDate(date)) {
+        if (!hasFourDigitYear(date)) {
             return fail(at, "a date outside the years 0000 to 9999");
         }
         return Value(date);

@@ -1,7 +1,7 @@
 #include "platform/files/File.h"
 #include "platform/files/ReplaceFile.h"
-#include "platform/plist/Formats.h"
 #include "platform/plist/PropertyList.h"
+#include "platform/plist/Readers.h"
 
 #include <utility>
 

@@ -1,5 +1,9 @@
-#include "platform/plist/Formats.h"
 #include "platform/plist/PropertyList.h"
+#include "platform/plist/Readers.h"
+#include "platform/text/Base64Text.h"
+#include "platform/text/IsoDate.h"
+#include "platform/text/LineAndColumn.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <array>
@@ -64,7 +68,7 @@ std::string shortened(std::string_view text) {
         return std::string(text);
     }
     std::size_t end = longest;
-    while (end > 0 && (static_cast<unsigned char>(text[end]) & 0xC0U) == 0x80U) {
+    while (end > 0 && continuesCharacter(text[end])) {
         --end;
     }
     return std::string(text.substr(0, end)) + "...";
@@ -72,10 +76,13 @@ std::string shortened(std::string_view text) {
 
 constexpr std::string_view whiteSpace = " \t\r\n";
 
+constexpr bool isWhiteSpace(char c) noexcept {
+    return c == '\t' || c == '\n' || c == ' ' || c == '\r';
+}
+
 /// Most character events of an indented list are this; the library's search takes longer.
-bool isWhiteSpace(std::string_view text) noexcept {
-    return std::all_of(text.begin(), text.end(),
-                       [](char c) { return c == '\t' || c == '\n' || c == ' ' || c == '\r'; });
+bool isAllWhiteSpace(std::string_view text) noexcept {
+    return std::all_of(text.begin(), text.end(), isWhiteSpace);
 }
 
 std::string_view trimmed(std::string_view text) noexcept {
@@ -117,28 +124,10 @@ std::optional<Value> realOf(std::string_view text) {
     return number;
 }
 
-/// "2026-01-31T08:00:00Z" and no other form; a real date of the calendar.
+/// "2026-01-31T08:00:00Z": a date whose year has four digits.
 std::optional<Value> dateOf(std::string_view text) {
-    constexpr std::string_view form = "dddd-dd-ddTdd:dd:ddZ";
-    const auto fits = [](char c, char f) { return f == 'd' ? c >= '0' && c <= '9' : c == f; };
-    if (text.size() != form.size() || !std::equal(text.begin(), text.end(), form.begin(), fits)) {
-        return std::nullopt;
-    }
-    const auto numberAt = [&](std::size_t at, std::size_t length) {
-        int number = 0;
-        std::from_chars(text.data() + at, text.data() + at + length, number);
-        return number;
-    };
-    using namespace std::chrono;
-    const year_month_day day{year(numberAt(0, 4)), month(static_cast<unsigned>(numberAt(5, 2))),
-                             std::chrono::day(static_cast<unsigned>(numberAt(8, 2)))};
-    const int hour = numberAt(11, 2);
-    const int minute = numberAt(14, 2);
-    const int second = numberAt(17, 2);
-    if (!day.ok() || hour > 23 || minute > 59 || second > 59) {
-        return std::nullopt;
-    }
-    return Date(sys_days(day) + hours(hour) + minutes(minute) + seconds(second));
+    const auto date = isoDateOf(text);
+    return date && hasFourDigitYear(*date) ? std::optional<Value>(*date) : std::nullopt;
 }
 
 class XmlReader {
@@ -285,7 +274,7 @@ class XmlReader {
     void characters(std::string_view text) {
         if (_leaf) {
             _text.append(text);
-        } else if (!isWhiteSpace(text)) {
+        } else if (!isAllWhiteSpace(text)) {
             fail("text outside the elements that hold text");
         }
     }
@@ -325,7 +314,8 @@ class XmlReader {
                 value = dateOf(trimmed(_text));
                 break;
             case Element::data:
-                if (auto data = dataOfBase64(_text)) {
+                std::erase_if(_text, isWhiteSpace);
+                if (auto data = bytesOfBase64Text(_text)) {
                     value = Value(std::move(*data));
                 }
                 break;
@@ -373,15 +363,6 @@ class XmlReader {
     std::size_t _values = 0;
 };
 
-/// Line and column after the text, both from 1.
-std::string placeAfter(std::string_view text) {
-    const auto lines = std::count(text.begin(), text.end(), '\n');
-    const std::size_t lastLine = text.rfind('\n') + 1;  // npos + 1 is 0
-    const auto columns = std::count_if(text.begin() + static_cast<std::ptrdiff_t>(lastLine), text.end(),
-                                       [](char c) { return (static_cast<unsigned char>(c) & 0xC0U) != 0x80U; });
-    return fmt::format("line {}, column {}", lines + 1, columns + 1);
-}
-
 }  // namespace
 
 std::optional<Value> parseXml(std::string_view bytes, Error& error, std::size_t valuesMaximum) {
@@ -396,7 +377,7 @@ std::optional<Value> parseXml(std::string_view bytes, Error& error, std::size_t 
     }
     const FromUtf16 converted = utf8OfUtf16(bytes, bigEndian);
     if (converted.end < bytes.size()) {
-        error = contentError(placeAfter(converted.text) + ": invalid UTF-16");
+        error = contentError(lineAndColumnAfter(converted.text) + ": invalid UTF-16");
         return std::nullopt;
     }
     return XmlReader("UTF-8", valuesMaximum).parse(converted.text, error);

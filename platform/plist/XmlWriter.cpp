@@ -1,6 +1,8 @@
-#include "platform/plist/Formats.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/plist/Readers.h"
+#include "platform/text/Base64Text.h"
+#include "platform/text/IsoDate.h"
+#include "platform/text/Utf8.h"
 
 #include <charconv>
 #include <cmath>
@@ -52,7 +54,7 @@ class XmlWriter {
             case Value::Type::date:
                 return appendDate(*value.date());
             case Value::Type::data:
-                _text += "<data>" + plist::base64Of(*value.data()) + "</data>\n";
+                _text += "<data>" + base64TextOf(*value.data()) + "</data>\n";
                 return true;
             case Value::Type::array:
                 return appendArray(*value.array(), depth);
@@ -80,15 +82,10 @@ class XmlWriter {
     }
 
     bool appendDate(Date date) {
-        if (!plist::isWritableDate(date)) {
+        if (!hasFourDigitYear(date)) {
             return refuse("a date outside the years 0000 to 9999 cannot be written");
         }
-        const auto day = std::chrono::floor<std::chrono::days>(date);
-        const std::chrono::year_month_day calendar(day);
-        const std::chrono::hh_mm_ss time(date - day);
-        _text += fmt::format("<date>{:04}-{:02}-{:02}T{:02}:{:02}:{:02}Z</date>\n", static_cast<int>(calendar.year()),
-                             static_cast<unsigned>(calendar.month()), static_cast<unsigned>(calendar.day()),
-                             time.hours().count(), time.minutes().count(), time.seconds().count());
+        _text += "<date>" + isoTextOf(date) + "</date>\n";
         return true;
     }
 

@@ -3,7 +3,7 @@
 #include "platform/task/Child.h"
 #include "platform/task/StartChild.h"
 #include "platform/task/TaskBounds.h"
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <array>

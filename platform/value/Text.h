@@ -1,43 +1,7 @@
 #pragma once
 
-// Text of values, and values of text: the one place where the two meet.
+// The text headers under their former common name.
 
-#include "platform/value/Error.h"
-#include "platform/value/Value.h"
-
-#include <optional>
-#include <string>
-#include <string_view>
-
-namespace adminhost {
-
-/// The text that log lines, messages and statements show for a value: null is "(null)", true "1", false "0", a number
-/// its shortest decimal form without an exponent (100000.0 is "100000", a very large or small one has all its digits;
-/// "inf" and "nan" are what no digits can show), a string itself, a date "2026-01-31 08:00:00 +0000" (UTC), data its
-/// bytes in hexadecimal between angle brackets; arrays and dictionaries are written on indented lines between
-/// parentheses and braces.
-[[nodiscard]] std::string textOf(const Value& value);
-/// A missing text is "(null)".
-[[nodiscard]] std::string textOf(const std::optional<std::string>& text);
-/// "DOMAIN (CODE): DESCRIPTION", or "DOMAIN (CODE)" for an error without description; a missing error is "(null)".
-[[nodiscard]] std::string textOf(const Error& error);
-[[nodiscard]] std::string textOf(const std::optional<Error>& error);
-
-/// The boolean reading of a stored or requested value: a boolean as it is, a number when non-zero, a string when its
-/// first character that is no blank (space, tab) is one of Y y T t or 1 to 9. Anything else is false.
-[[nodiscard]] bool booleanOf(const Value& value) noexcept;
-/// The reading of a change entry's flags: as booleanOf, but a string's leading zeros are skipped too ("01" is true).
-[[nodiscard]] bool flagOf(const Value& value) noexcept;
-
-/// Local time in the form "%Y-%m-%d %H:%M:%S". The whole text must be such a date, and a real one of the calendar;
-/// inside a daylight-saving gap the C library's choice holds. Returns nullopt if it is not.
-[[nodiscard]] std::optional<Date> localDateOf(std::string_view text);
-/// The same form, for writing. Follows a change of the machine's time zone at once; reading does within a second.
-[[nodiscard]] std::string localTextOf(Date date);
-
-/// Whether the text is well-formed UTF-8 (RFC 3629: no overlong forms, no surrogates, nothing above U+10FFFF).
-[[nodiscard]] bool isUtf8(std::string_view text) noexcept;
-/// The text with every byte that is not part of well-formed UTF-8 replaced by U+FFFD.
-[[nodiscard]] std::string utf8Of(std::string_view bytes);
-
-}  // namespace adminhost
+#include "platform/text/LocalDate.h"
+#include "platform/text/Utf8.h"
+#include "platform/value/ValueText.h"

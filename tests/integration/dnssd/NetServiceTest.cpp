@@ -1,6 +1,6 @@
 #include "platform/dnssd/HostName.h"
 #include "platform/dnssd/NetService.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "tests/support/AvahiNamespace.h"
 #include "tests/support/Environment.h"
 

@@ -2,7 +2,7 @@
 
 #include "handler/LumioRequestHandler.h"
 #include "platform/task/Task.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "tests/support/Traced.h"
 
 #include <algorithm>

@@ -1,5 +1,5 @@
 #include "platform/dnssd/NetService.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "tests/unit/handler/WriteSettingsFixture.h"
 
 namespace lumio {

@@ -1,6 +1,6 @@
 #include "platform/dnssd/EventLoop.h"
 #include "platform/dnssd/NetService.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "resources/Property.h"
 #include "settings/Revision.h"
 #include "tests/unit/handler/WriteSettingsFixture.h"

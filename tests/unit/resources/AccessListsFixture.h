@@ -4,7 +4,7 @@
 
 #include "handler/LumioRequestHandler.h"
 #include "platform/directory/LocalAccounts.h"
-#include "platform/directory/Uuid.h"
+#include "platform/directory/NameBasedUuid.h"
 #include "resources/Camera.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TemporaryRoot.h"

@@ -1,5 +1,5 @@
 #include "handler/LumioRequestHandler.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "tests/unit/resources/PropertyFixture.h"
 
 namespace lumio {

@@ -1,4 +1,5 @@
-#include "platform/value/Text.h"
+#include "platform/text/LocalDate.h"
+#include "platform/value/ValueText.h"
 #include "tests/unit/resources/PropertyFixture.h"
 
 #include <filesystem>

@@ -1,6 +1,6 @@
 #include "platform/directory/Entries.h"
 #include "platform/directory/Membership.h"
-#include "platform/directory/Uuid.h"
+#include "platform/directory/NameBasedUuid.h"
 #include "tests/unit/platform/directory/TemporaryAccounts.h"
 
 #include <gmock/gmock.h>

@@ -1,7 +1,7 @@
 #include "platform/directory/AccountFiles.h"
 #include "platform/directory/Entries.h"
 #include "platform/directory/LocalAccounts.h"
-#include "platform/directory/Uuid.h"
+#include "platform/directory/NameBasedUuid.h"
 #include "tests/unit/platform/directory/TemporaryAccounts.h"
 
 #include <algorithm>

@@ -1,4 +1,4 @@
-#include "platform/directory/Uuid.h"
+#include "platform/directory/NameBasedUuid.h"
 #include "platform/task/Task.h"
 
 #include <string>

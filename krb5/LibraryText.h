@@ -3,7 +3,7 @@
 // Texts that cross to and from the Kerberos library.
 
 #include "krb5/Handle.h"
-#include "platform/value/Text.h"
+#include "platform/text/Utf8.h"
 
 #include <optional>
 #include <string>

@@ -1,23 +1,12 @@
 #pragma once
 
-// UUIDs of directory records.
+// UUIDs that are made from names.
 
-#include <array>
-#include <cstdint>
-#include <optional>
-#include <string>
+#include "platform/text/Uuid.h"
+
 #include <string_view>
 
 namespace adminhost {
-
-/// The 16 bytes of a UUID in the order of its text.
-using Uuid = std::array<std::uint8_t, 16>;
-
-/// Reads the canonical text of 36 characters, digits in either case. Nothing for any other text.
-[[nodiscard]] std::optional<Uuid> uuidOf(std::string_view text) noexcept;
-
-/// The canonical text, upper case.
-[[nodiscard]] std::string textOf(const Uuid& uuid);
 
 /// The name-based UUID (RFC 4122, version 5, SHA-1) of a name in a namespace.
 [[nodiscard]] Uuid nameBasedUuid(const Uuid& space, std::string_view name);

@@ -1,4 +1,4 @@
-#include "platform/directory/Uuid.h"
+#include "platform/directory/NameBasedUuid.h"
 
 #include <algorithm>
 #include <memory>
@@ -8,25 +8,6 @@
 
 namespace adminhost {
 namespace {
-
-constexpr std::size_t textLength = 36;
-
-constexpr bool hyphenAt(std::size_t position) noexcept {
-    return position == 8 || position == 13 || position == 18 || position == 23;
-}
-
-int digitOf(char c) noexcept {
-    if (c >= '0' && c <= '9') {
-        return c - '0';
-    }
-    if (c >= 'a' && c <= 'f') {
-        return c - 'a' + 10;
-    }
-    if (c >= 'A' && c <= 'F') {
-        return c - 'A' + 10;
-    }
-    return -1;
-}
 
 /// SHA-1, fetched once and with one context: a pass over a large machine's accounts hashes every name.
 class Sha1 {
@@ -58,42 +39,6 @@ class Sha1 {
 };
 
 }  // namespace
-
-std::optional<Uuid> uuidOf(std::string_view text) noexcept {
-    if (text.size() != textLength) {
-        return std::nullopt;
-    }
-    Uuid uuid{};
-    std::size_t digits = 0;
-    for (std::size_t i = 0; i < textLength; ++i) {
-        if (hyphenAt(i)) {
-            if (text[i] != '-') {
-                return std::nullopt;
-            }
-            continue;
-        }
-        const int digit = digitOf(text[i]);
-        if (digit < 0) {
-            return std::nullopt;
-        }
-        std::uint8_t& byte = uuid[digits++ / 2];
-        byte = static_cast<std::uint8_t>(byte << 4U | static_cast<unsigned>(digit));
-    }
-    return uuid;
-}
-
-std::string textOf(const Uuid& uuid) {
-    std::string text;
-    text.reserve(textLength);
-    for (const std::uint8_t byte : uuid) {
-        if (hyphenAt(text.size())) {
-            text += '-';
-        }
-        text += "0123456789ABCDEF"[byte >> 4U];
-        text += "0123456789ABCDEF"[byte & 0xFU];
-    }
-    return text;
-}
 
 Uuid nameBasedUuid(const Uuid& space, std::string_view name) {
     thread_local Sha1 sha1;

@@ -1,0 +1,32 @@
+#pragma once
+
+// The texts of values, and the booleans that values and texts stand for.
+
+#include "platform/value/Error.h"
+#include "platform/value/Value.h"
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace adminhost {
+
+/// The text that log lines, messages and statements show for a value: null is "(null)", true "1", false "0", a number
+/// its shortest decimal form without an exponent (100000.0 is "100000", a very large or small one has all its digits;
+/// "inf" and "nan" are what no digits can show), a string itself, a date "2026-01-31 08:00:00 +0000" (UTC), data its
+/// bytes in hexadecimal between angle brackets; arrays and dictionaries are written on indented lines between
+/// parentheses and braces.
+[[nodiscard]] std::string textOf(const Value& value);
+/// A missing text is "(null)".
+[[nodiscard]] std::string textOf(const std::optional<std::string>& text);
+/// "DOMAIN (CODE): DESCRIPTION", or "DOMAIN (CODE)" for an error without description; a missing error is "(null)".
+[[nodiscard]] std::string textOf(const Error& error);
+[[nodiscard]] std::string textOf(const std::optional<Error>& error);
+
+/// The boolean reading of a stored or requested value: a boolean as it is, a number when non-zero, a string when its
+/// first character that is no blank (space, tab) is one of Y y T t or 1 to 9. Anything else is false.
+[[nodiscard]] bool booleanOf(const Value& value) noexcept;
+/// The reading of a change entry's flags: as booleanOf, but a string's leading zeros are skipped too ("01" is true).
+[[nodiscard]] bool flagOf(const Value& value) noexcept;
+
+}  // namespace adminhost
