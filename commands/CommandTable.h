@@ -56,10 +56,11 @@ struct KeyDescription {
 struct CommandDescription {
     std::string_view name;
     std::string_view summary;
-    bool needsDatabase;  ///< refused while the database tool does not work as it must
-    bool revision;       ///< its answer carries the settings' revision
-    bool revisionGuard;  ///< may be made to depend on a revision
-    bool changes;        ///< changes something
+    adminhost::Access access;
+    bool showsRevision;                       ///< its answer carries the settings' revision
+    bool takesRevision;                       ///< can be made to depend on a revision
+    std::span<const std::string_view> needs;  ///< what the plug-in is asked about before it runs: "database"
+    std::int64_t deadlineSeconds;             ///< its own bound; 0: the daemon's
     std::span<const KeyDescription> keys;
 };
 

@@ -36,7 +36,14 @@ RULE_TEXTS = {
 CHANGES = {"added": "changeAdded", "removed": "changeRemoved", "changed": "changeChanged", "ignored": "changeNothing"}
 UNITS = ["bytes", "megabytes", "seconds", "minutes", "people"]
 
-COMMAND_WORDS = {"order", "summary", "description", "needs_database", "revision", "revision_guard", "changes", "state", "available",
+ACCESS = {
+    "read": "It changes nothing.",
+    "write": "It changes settings or resources.",
+    "control": "It starts or stops the service.",
+    "account": "It handles accounts and their passwords.",
+}
+
+COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline_seconds", "shows_revision", "takes_revision", "state", "available",
                  "errors", "keys", "answer", "include", "example"}
 # What programs that compare and write a desired state have to know of a key (README.md).
 STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_file", "kind", "kinds", "secret_if", "file",
@@ -151,6 +158,10 @@ def load(directory):
             need(set(command) <= COMMAND_WORDS, f"unknown word {sorted(set(command) - COMMAND_WORDS)}")
             need(command.get("summary", "").strip(), "summary is missing")
             need(isinstance(command.get("order"), int), "order is missing")
+            need(command.get("access") in ACCESS, f"access must be one of {list(ACCESS)}")
+            need(isinstance(command.get("deadline_seconds", 1), int) and command.get("deadline_seconds", 1) > 0,
+                 "deadline_seconds must be a whole number above 0")
+            need(all(isinstance(name, str) and name for name in command.get("needs", [])), "needs must be a list of names")
             command["all_answers"] = included(commands, command.get("answer", {}), command.get("include", {}), {name})
             keys = command.setdefault("keys", {})
             for path, key in keys.items():  # a setting is described once, where it is read
@@ -210,10 +221,6 @@ def describe(name, command):
         "name": name,
         "summary": command["summary"].strip(),
         "description": " ".join(command.get("description", command["summary"]).split()),
-        "needsDatabase": command.get("needs_database", False),
-        "revision": command.get("revision", False),
-        "revisionGuard": command.get("revision_guard", False),
-        "changes": command.get("changes", False),
         **({"state": command["state"]} if "state" in command else {}),
         "keys": [key_description(path, key) for path, key in command["keys"].items()],
         "answer": [key_description(path, key) for path, key in command["all_answers"].items()],
@@ -287,9 +294,10 @@ class Table:
         rows = []
         for name, command in commands.items():
             described = describe(name, command)
-            flags = ", ".join("true" if described[flag] else "false"
-                              for flag in ("needsDatabase", "revision", "revisionGuard", "changes"))
-            rows.append(f"{{{quoted(name)}, {quoted(described['summary'])}, {flags}, {self.keys(command['keys'], '')}}}")
+            flags = ", ".join("true" if command.get(flag) else "false" for flag in ("shows_revision", "takes_revision"))
+            rows.append(f"{{{quoted(name)}, {quoted(described['summary'])}, adminhost::Access::{command['access']}, {flags}, "
+                        f"{self.texts(command.get('needs'))}, {command.get('deadline_seconds', 0)}, "
+                        f"{self.keys(command['keys'], '')}}}")
         self.lines.append("constexpr CommandDescription table[] = {\n    " + ",\n    ".join(rows) + ",\n};")
 
     def tokens(self, value, key=""):
@@ -374,13 +382,15 @@ def docs(commands):
         if not command.get("available", True):
             out += ["Not served by this release: it answers the error `NOT_AVAILABLE`.", ""]
         notes = [text for flag, text in (
-            ("changes", "It changes something."),
-            ("needsDatabase", "It needs the service's database tool."),
-            ("revision", "Its answer carries the settings' revision."),
-            ("revisionGuard", "It can be made to depend on the revision that was read."),
-        ) if described[flag]]
-        if notes:
-            out += [" ".join(notes), ""]
+            ("shows_revision", "Its answer carries the settings' revision."),
+            ("takes_revision", "It can be made to depend on the revision that was read."),
+        ) if command.get(flag)]
+        notes.insert(0, f"Access: {command['access']}. {ACCESS[command['access']]}")
+        if command.get("needs"):
+            notes.append(f"It needs the service's {' and '.join(command['needs'])}.")
+        if command.get("deadline_seconds"):
+            notes.append(f"It is ended after {command['deadline_seconds']} seconds.")
+        out += [" ".join(notes), ""]
         if described["keys"]:
             out += ["| key | type | |", "|---|---|---|"] + key_rows(described["keys"]) + [""]
         if described["answer"]:

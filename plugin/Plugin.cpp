@@ -4,9 +4,11 @@
 
 #include "commands/CommandTable.h"
 #include "handler/LumioRequestHandler.h"
+#include "settings/DatabaseTool.h"
 #include "settings/Revision.h"
 
 #include <algorithm>
+#include <chrono>
 #include <iterator>
 #include <string>
 #include <vector>
@@ -49,16 +51,6 @@ const Operation* operationNamed(std::string_view command) noexcept {
     return found == std::end(operations) ? nullptr : found;
 }
 
-adminhost::Access accessOf(std::string_view command, bool changes) noexcept {
-    if (command == "createNimboAccount") {
-        return adminhost::Access::account;
-    }
-    if (command == "startService" || command == "stopService" || command == "recycleService") {
-        return adminhost::Access::control;
-    }
-    return changes ? adminhost::Access::write : adminhost::Access::read;
-}
-
 class LumioPlugin final : public adminhost::Plugin {
   public:
     std::string_view name() override { return "lumio"; }
@@ -70,12 +62,11 @@ class LumioPlugin final : public adminhost::Plugin {
         for (const lumio::CommandDescription& row : lumio::commands()) {
             adminhost::Command command;
             command.name = row.name;
-            command.access = accessOf(row.name, row.changes);
-            command.showsRevision = row.revision;
-            command.takesRevision = row.revisionGuard;
-            if (row.needsDatabase) {
-                command.needs.emplace_back("database");
-            }
+            command.access = row.access;
+            command.showsRevision = row.showsRevision;
+            command.takesRevision = row.takesRevision;
+            command.needs.assign(row.needs.begin(), row.needs.end());
+            command.deadline = std::chrono::seconds(row.deadlineSeconds);
             command.description = *(*described.array())[all.size()].dictionary();
             all.push_back(std::move(command));
         }
@@ -95,6 +86,9 @@ class LumioPlugin final : public adminhost::Plugin {
         return operation == nullptr ? Response::error("UNKNOWN_COMMAND", "The plug-in does not serve this command.")
                                     : operation->perform(_handler, request);
     }
+
+    /// "database" is all that a command names.
+    adminhost::Probe probe(std::string_view) override { return _databaseTool.probe(); }
 
     std::string revision() override { return lumio::settingsRevision(); }
 
@@ -129,8 +123,11 @@ class LumioPlugin final : public adminhost::Plugin {
                 LumioRequestHandler::memberPreferencesPath()};
     }
 
+    std::vector<adminhost::ToolFile> toolFiles() override { return {lumio::databaseToolStartFile()}; }
+
   private:
     LumioRequestHandler _handler;
+    lumio::DatabaseTool _databaseTool;
 };
 
 }  // namespace

@@ -48,8 +48,8 @@ struct Finding {
     std::string advice;   ///< how to fix it
 };
 
-/// Whether something that commands need is usable. Unknown (time-out, no memory) is not unusable: the host asks again
-/// before the next command that needs it.
+/// Whether something that commands need is usable. Unknown (time-out, no memory) is not unusable: a client may send the
+/// same request again.
 struct Probe {
     enum class State : std::uint8_t { usable, unusable, unknown };
     State state = State::usable;
@@ -106,8 +106,8 @@ class Plugin {
     /// Serves one command of commands().
     [[nodiscard]] virtual Response perform(std::string_view command, const Dictionary& request) = 0;
 
-    /// Whether what commands need under this name is usable. Called before the first command that needs it, and again
-    /// while the answer is unknown. Ends within 5 seconds.
+    /// Whether what commands need under this name is usable. Called before each command that needs it, so a plug-in
+    /// keeps a result that took time and looks again only while it is not usable. Its tools are ended after 5 seconds.
     [[nodiscard]] virtual Probe probe(std::string_view /*need*/) { return {}; }
     /// Checks of the installation, for an administrator. Each ends within 2 seconds.
     [[nodiscard]] virtual std::vector<Diagnosis> diagnose() { return {}; }

@@ -41,7 +41,7 @@ TEST(CommandTable, HoldsEveryCommandOfThePlugInOnce) {
     EXPECT_EQ(lumio::findCommand(""), nullptr);
 }
 
-TEST(CommandTable, DescriptionsStandInTheTablesOrderWithItsFlags) {
+TEST(CommandTable, DescriptionsAreInTheTablesOrder) {
     const Value all = lumio::describeCommands();
     ASSERT_NE(all.array(), nullptr);
     ASSERT_EQ(all.array()->size(), lumio::commands().size());
@@ -50,19 +50,33 @@ TEST(CommandTable, DescriptionsStandInTheTablesOrderWithItsFlags) {
         const lumio::CommandDescription& command = lumio::commands()[i];
         EXPECT_EQ(described.get("name"), Value(command.name));
         EXPECT_EQ(described.get("summary"), Value(command.summary));
-        EXPECT_EQ(described.get("needsDatabase"), Value(command.needsDatabase));
-        EXPECT_EQ(described.get("revision"), Value(command.revision));
-        EXPECT_EQ(described.get("revisionGuard"), Value(command.revisionGuard));
-        EXPECT_EQ(described.get("changes"), Value(command.changes));
         EXPECT_NE(described.get("example").dictionary(), nullptr);
     }
 }
 
 TEST(CommandTable, RevisionsAreReadBySettingsAndGuardTheirWriting) {
-    EXPECT_TRUE(lumio::findCommand("readSettings")->revision);
-    EXPECT_TRUE(lumio::findCommand("writeSettings")->revisionGuard);
-    EXPECT_FALSE(lumio::findCommand("getCameras")->revision);
-    EXPECT_FALSE(lumio::findCommand("readSettings")->changes);
+    EXPECT_TRUE(lumio::findCommand("readSettings")->showsRevision);
+    EXPECT_TRUE(lumio::findCommand("writeSettings")->takesRevision);
+    EXPECT_FALSE(lumio::findCommand("getCameras")->showsRevision);
+}
+
+TEST(CommandTable, OnlyCommandsThatChangeNothingAreOpenToReaders) {
+    using adminhost::Access;
+    for (const auto& command : lumio::commands()) {
+        const bool reads = command.name.starts_with("get") || command.name.starts_with("read");
+        EXPECT_EQ(command.access == Access::read, reads) << command.name;
+    }
+    EXPECT_EQ(lumio::findCommand("writeSettings")->access, Access::write);
+    EXPECT_EQ(lumio::findCommand("stopService")->access, Access::control);
+    EXPECT_EQ(lumio::findCommand("createNimboAccount")->access, Access::account);
+}
+
+TEST(CommandTable, CommandsSayWhatTheyNeedAndTheirOwnTimeLimit) {
+    EXPECT_THAT(lumio::findCommand("readSettings")->needs, testing::ElementsAre("database"));
+    EXPECT_THAT(lumio::findCommand("getState")->needs, testing::IsEmpty()) << "the state is shown without a database";
+    EXPECT_EQ(lumio::findCommand("getState")->deadlineSeconds, 60);
+    EXPECT_EQ(lumio::findCommand("validateSettings")->deadlineSeconds, 60);
+    EXPECT_EQ(lumio::findCommand("readSettings")->deadlineSeconds, 0);
 }
 
 TEST(CommandTable, PasswordsAreSecret) {
@@ -90,7 +104,7 @@ TEST(CommandTable, ClientsLearnHowToCompareAndWriteTheState) {
 
 TEST(CommandTable, AnAnswerTakesOverTheKeysOfOtherAnswers) {
     EXPECT_EQ(keyOf(describe("readSettings"), "answer", "configuration.cameras[].created_at").get("type"),
-              Value("date"));
+              Value("scalar"));
     EXPECT_EQ(keyOf(describe("writeSettings"), "answer", "configuration.workflows[].allowedUsersAndGroups[].type")
                   .get("type"),
               Value("text"));

@@ -14,6 +14,7 @@ namespace {
 using testing::HasSubstr;
 
 constexpr const char* sound = R"(order = 1
+access = "read"
 summary = "Do it"
 [keys.a]
 type = "text"
@@ -70,6 +71,10 @@ TEST_F(Generate, RefusesWhatIsNotRightAndNamesTheFile) {
     EXPECT_THAT(with("{\"a\": \"x\"}", "{\"a\": 5}"), HasSubstr("example's request: a is not a text"));
     EXPECT_THAT(with("{\"a\": \"x\"}", "{\"z\": 5}"), HasSubstr("example's request: z is not described"));
     EXPECT_THAT(with("order = 1", "order = "), HasSubstr("doIt.toml: "));
+    EXPECT_THAT(with("access = \"read\"\n", ""), HasSubstr("doIt.toml: access must be one of"));
+    EXPECT_THAT(with("\"read\"", "\"all\""), HasSubstr("doIt.toml: access must be one of"));
+    EXPECT_THAT(with("order = 1", "order = 1\ndeadline_seconds = 0"), HasSubstr("deadline_seconds must be"));
+    EXPECT_THAT(with("order = 1", "order = 1\nneeds = [1]"), HasSubstr("needs must be a list of names"));
 }
 
 TEST_F(Generate, RefusesWordsOfTheDesiredStateThatNameNothing) {

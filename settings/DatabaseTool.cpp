@@ -1,0 +1,117 @@
+#include "settings/DatabaseTool.h"
+
+#include "platform/files/Path.h"
+#include "platform/task/Task.h"
+#include "settings/SettingsStore.h"
+
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <string_view>
+#include <vector>
+
+#include <pwd.h>
+#include <unistd.h>
+
+namespace lumio {
+
+using adminhost::Probe;
+
+namespace {
+
+constexpr std::int32_t diedBySignal = 128;
+
+// Everything that the readers of rows rely on: double-quoted text is text, names are padded to the longest, an absent
+// value is empty, and control characters are printed as they are.
+constexpr const char* statement =
+    "select 'x = y' as a, \"quoted text\" as longername, null as c where 'quoted text' = \"quoted text\" "
+    "union all select 2, 3.5, '' "
+    "union all select 3, 'line' || char(10) || 'feed' || char(9) || 'tab' || char(27) || 'escape', 'z'";
+constexpr const char* expected =
+    "         a = x = y\n"
+    "longername = quoted text\n"
+    "         c = \n"
+    "\n"
+    "         a = 2\n"
+    "longername = 3.5\n"
+    "         c = \n"
+    "\n"
+    "         a = 3\n"
+    "longername = line\nfeed\ttab\x1b"
+    "escape\n"
+    "         c = z\n";
+
+/// Whether a failed run says more about the machine at this moment than about the tool.
+bool isPassing(std::int32_t status, std::string_view error) {
+    if (status == diedBySignal + SIGKILL) {
+        return true;  // at the deadline, or for want of memory
+    }
+    for (const int number : {EAGAIN, ENOMEM, EMFILE, ENFILE, ETXTBSY, EINTR}) {
+        if (error.find(std::strerror(number)) != std::string_view::npos) {
+            return true;
+        }
+    }
+    return error.find("out of memory") != std::string_view::npos;
+}
+
+std::string firstLine(const std::string& text) {
+    return text.substr(0, text.find('\n'));
+}
+
+}  // namespace
+
+std::string DatabaseTool::homeOfAccount() {
+    passwd entry{};
+    passwd* found = nullptr;
+    std::array<char, 16384> buffer{};
+    const int failure = ::getpwuid_r(::geteuid(), &entry, buffer.data(), buffer.size(), &found);
+    return failure == 0 && found != nullptr ? std::string(entry.pw_dir) : std::string();
+}
+
+Probe DatabaseTool::probe() {
+    const adminhost::HostPath tool("/usr/bin/sqlite3");
+    const std::string startFile = _home + "/.sqliterc";
+    if (::access(startFile.c_str(), F_OK) == 0) {
+        return {Probe::State::unusable, startFile + " can change what " + tool.text() + " prints",
+                "remove the file, or move it away"};
+    }
+    if (_usable || !SettingsStore::dbPathExists()) {
+        return {};
+    }
+    std::string output;
+    std::string error;
+    const std::int32_t status =
+        adminhost::launch_task(adminhost::diskPath(tool), {"-line", ":memory:", statement}, &output, &error);
+    if (status != 0 && isPassing(status, error)) {
+        return {Probe::State::unknown,
+                status == diedBySignal + SIGKILL ? tool.text() + " was ended before it had finished" : firstLine(error),
+                "try again later"};
+    }
+    if (status == -1) {
+        return {Probe::State::unusable, tool.text() + " cannot be run (" + firstLine(error) + ")",
+                "install the package sqlite3"};
+    }
+    if (status != 0) {
+        return {Probe::State::unusable,
+                tool.text() + " failed with status " + std::to_string(status) + ": " + firstLine(error),
+                "install a supported release of the package sqlite3"};
+    }
+    if (output != expected) {
+        return {Probe::State::unusable, tool.text() + " does not print rows in the form that this release reads",
+                "install a supported release of the package sqlite3"};
+    }
+    _usable = true;
+    return {};
+}
+
+adminhost::ToolFile databaseToolStartFile() {
+    // The answers to the settings themselves must not end up among the rows.
+    return {"sqlite3/sqliterc",
+            ".output /dev/null\n"
+            ".dbconfig dqs_dml on\n"
+            ".dbconfig dqs_ddl on\n"
+            ".output\n"};
+}
+
+}  // namespace lumio

@@ -1,0 +1,34 @@
+#pragma once
+
+// Whether the database tool prints what this plug-in reads.
+
+#include "platform/framework/Plugin.h"
+
+#include <string>
+
+namespace lumio {
+
+class DatabaseTool {
+  public:
+    /// The home directory of the daemon's account, as the account database has it. The tool looks there for its start
+    /// file, whatever HOME says. Empty if the account is unknown.
+    [[nodiscard]] static std::string homeOfAccount();
+
+    explicit DatabaseTool(std::string home = homeOfAccount()) : _home(std::move(home)) {}
+
+    /// Unusable while the account has a start file of the tool: it can change what every run prints, also when it
+    /// appears later, so it is looked for each time. Otherwise the tool is tried once, with a statement whose output is
+    /// known; that it is usable is kept, every other result is found out again. Without a database file nothing needs
+    /// the tool, and it is not tried.
+    [[nodiscard]] adminhost::Probe probe();
+
+  private:
+    std::string _home;
+    bool _usable = false;
+};
+
+/// The tool's start file, for its private configuration directory: it lets releases that refuse double-quoted text
+/// accept it.
+[[nodiscard]] adminhost::ToolFile databaseToolStartFile();
+
+}  // namespace lumio

@@ -1,0 +1,7 @@
+if(NOT TARGET small_plugin)
+    add_library(small_plugin MODULE ${CMAKE_SOURCE_DIR}/tests/support/smallplugin/SmallPlugin.cpp)
+    set_target_properties(small_plugin PROPERTIES PREFIX "" LIBRARY_OUTPUT_DIRECTORY ${CMAKE_BINARY_DIR}/tests/plugins)
+    target_link_libraries(small_plugin PRIVATE adminhost)
+endif()
+set(TEST_LIBS host)
+set(TEST_DEPENDS adminhostd adminhostd-worker adminhost_lumio small_plugin)
