@@ -50,17 +50,15 @@ class Daemon {
         for (;;) {
             // Clients that come before the first worker is ready wait in the socket's backlog.
             if (!_server && _front.queue().settled() && !_stopBy) {
-                _server.emplace(
-                    _socket.take(), _options.clientTimeout,
-                    [this](const Exchange& exchange) { return _front.head(exchange); },
-                    [this](Exchange& exchange) { _front.serve(exchange); });
+                _server.emplace(_socket.take(), _options.clientTimeout,
+                                [this](Exchange& exchange) { return _front.head(exchange); });
                 notify("READY=1");
             }
             if (finished()) {
                 return;
             }
             wait();
-            _front.queue().run();
+            _front.queue().run(_entries);
             if (_server) {
                 _server->run();
             }

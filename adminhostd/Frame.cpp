@@ -100,7 +100,8 @@ std::optional<Frame> FrameReader::next() {
         return std::nullopt;
     }
     bytes.remove_prefix(header.payload);
-    Frame frame{static_cast<FrameType>(header.type), std::move(*payload), {}};
+    Frame frame{
+        static_cast<FrameType>(header.type), std::move(*payload), {}, sizeof header + header.payload + header.bytes};
     const std::string_view here = bytes.substr(0, header.bytes);
     // Memory that is asked for but not written to costs nothing.
     frame.bytes.reserve(header.bytes);

@@ -34,6 +34,7 @@ struct Frame {
     FrameType type = FrameType::configure;
     Value payload;
     std::string bytes;
+    std::size_t size = 0;  ///< of a frame that was read: its bytes on the way
 };
 
 /// The frame's header and payload; its bytes follow. Returns nullopt if they are together above the maximum.

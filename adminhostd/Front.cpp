@@ -1,13 +1,13 @@
 #include "adminhostd/Front.h"
 
 #include "adminhostd/RequestBody.h"
-#include "adminhostd/Worker.h"
 #include "platform/log/Log.h"
 #include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <functional>
 #include <memory>
+#include <utility>
 
 #include <fmt/format.h>
 #include <fmt/ranges.h>
@@ -29,144 +29,185 @@ HttpAnswer retryLater(std::string_view code, std::string_view message) {
     return answer;
 }
 
+/// The code of an error that the front itself made.
+std::string_view codeOf(const HttpAnswer& answer) {
+    const Dictionary* body = answer.status >= 400 && answer.body ? answer.body->dictionary() : nullptr;
+    return body == nullptr ? std::string_view() : body->text("error");
+}
+
+/// These accounts also see the reports of others' requests.
 bool permitted(const Peer& peer) {
     return peer.uid == 0 || peer.uid == ::geteuid();
 }
 
-std::string_view textAt(const Dictionary& dictionary, std::string_view key) {
-    const std::string* text = dictionary.get(key).string();
-    return text == nullptr ? std::string_view() : std::string_view(*text);
-}
-
-/// The names in a list of dictionaries, for a message.
-std::string namesIn(const Value& list) {
+/// The names of plug-ins or commands, for a message.
+std::string namesIn(const auto& named) {
     std::vector<std::string_view> names;
-    if (const Array* array = list.array()) {
-        for (const Value& element : *array) {
-            names.push_back(textAt(*element.dictionary(), "name"));
-        }
+    for (const auto& one : named) {
+        names.push_back(one.name);
     }
     return names.empty() ? "none" : fmt::format("{}", fmt::join(names, ", "));
 }
 
-const Dictionary* elementNamed(const Value& list, std::string_view name) {
-    if (const Array* array = list.array()) {
-        for (const Value& element : *array) {
-            if (element.dictionary() != nullptr && textAt(*element.dictionary(), "name") == name) {
-                return element.dictionary();
-            }
-        }
+const auto* elementNamed(const auto& named, std::string_view name) {
+    const auto found = std::find_if(named.begin(), named.end(), [&](const auto& one) { return one.name == name; });
+    return found == named.end() ? nullptr : &*found;
+}
+
+std::string_view nameOf(Access access) {
+    switch (access) {
+        case Access::read:
+            return "read";
+        case Access::write:
+            return "write";
+        case Access::control:
+            return "control";
+        case Access::account:
+            break;
     }
-    return nullptr;
+    return "account";
 }
 
-/// A list of dictionaries, each with a name.
-bool isNamedList(const Value& list) {
-    return list.array() != nullptr && std::all_of(list.array()->begin(), list.array()->end(), [](const Value& element) {
-               return element.dictionary() != nullptr && element.dictionary()->get("name").string() != nullptr;
-           });
+/// The command as clients see it.
+Dictionary describe(const Command& command) {
+    Dictionary described{{"name", command.name}};
+    for (const DictionaryEntry& entry : command.description) {
+        described.set(entry.key, entry.value);
+    }
+    described.set("name", command.name);
+    described.set("access", nameOf(command.access));
+    described.set("showsRevision", command.showsRevision);
+    described.set("takesRevision", command.takesRevision);
+    described.set("needs", Array(command.needs.begin(), command.needs.end()));
+    if (command.deadline.count() > 0) {
+        described.set("deadlineSeconds", command.deadline.count());
+    }
+    return described;
 }
 
-/// What a worker says first is looked at as a whole: everything else here relies on its form.
-bool isHello(const Dictionary& hello) {
-    const Value& plugins = hello.get("plugins");
-    return isNamedList(plugins) &&
-           std::all_of(plugins.array()->begin(), plugins.array()->end(),
-                       [](const Value& plugin) { return isNamedList(plugin.dictionary()->get("commands")); });
+Array describe(const std::vector<Command>& commands) {
+    Array described;
+    for (const Command& command : commands) {
+        described.emplace_back(describe(command));
+    }
+    return described;
 }
 
-bool flag(const Dictionary& description, std::string_view key) {
-    return description.get(key) == Value(true);
-}
-
-bool needs(const Dictionary& description, std::string_view name) {
-    const Array* all = description.get("needs").array();
-    return all != nullptr && std::find(all->begin(), all->end(), Value(name)) != all->end();
-}
-
-HttpAnswer findingsAnswer(const Value& findings, const Dictionary& first) {
-    const std::size_t count = findings.array()->size();
-    HttpAnswer answer = errorAnswer(422, "REQUEST_REFUSED",
-                                    fmt::format("The request cannot be carried out. {}{}: {}.",
-                                                count == 1 ? "" : fmt::format("The first of {} findings: ", count),
-                                                textAt(first, "keyPath"), textAt(first, "rule")));
-    answer.body->dictionary()->set("findings", findings);
+HttpAnswer findingsAnswer(const std::vector<Finding>& findings) {
+    const Finding& first = findings.front();
+    HttpAnswer answer =
+        errorAnswer(422, "REQUEST_REFUSED",
+                    fmt::format("The request cannot be carried out. {}{}: {}.",
+                                findings.size() == 1 ? "" : fmt::format("The first of {} findings: ", findings.size()),
+                                first.keyPath, first.rule));
+    Array list;
+    for (const Finding& finding : findings) {
+        list.emplace_back(Dictionary{{"keyPath", finding.keyPath}, {"rule", finding.rule}, {"advice", finding.advice}});
+    }
+    answer.body->dictionary()->set("findings", std::move(list));
     return answer;
 }
 
-/// Takes the worker's response out of its answer: a listing is large.
-HttpAnswer answerFor(Dictionary& worker) {
-    const auto response = [&] {
-        Value* found = worker.find("response");
-        return found == nullptr ? Value() : std::move(*found);
-    };
-    const std::string_view word = textAt(worker, "outcome");
-    const std::string_view message = textAt(worker, "message");
-    if (word == outcome::nothing) {
-        return {204, std::nullopt, {}};
+HttpAnswer textAnswer(unsigned status, protocol::Answer& answer) {
+    HttpAnswer http{status, std::nullopt, {}};
+    http.text = AnswerText{std::move(answer.bytes), answer.form == BodyForm::json ? "application/json"  //
+                                                                                  : "application/x-plist"};
+    return http;
+}
+
+HttpAnswer answerFor(protocol::Answer& answer) {
+    using protocol::Outcome;
+    switch (answer.outcome) {
+        case Outcome::nothing:
+            return {204, std::nullopt, {}};
+        case Outcome::answered:
+            return textAnswer(200, answer);
+        case Outcome::error:
+            return textAnswer(500, answer);
+        case Outcome::refused:
+            return findingsAnswer(answer.findings);
+        case Outcome::conflict:
+            return errorAnswer(412, "REVISION_CHANGED",
+                               "The settings have changed since they were read. Read them again.");
+        case Outcome::overrun:
+            return errorAnswer(504, "DEADLINE_EXCEEDED", "The command did not end in time and was stopped.");
+        case Outcome::broken:
+            break;
     }
-    if (word == outcome::dictionary) {
-        return {200, response(), {}};
+    return errorAnswer(500, "WORKER_FAILED", answer.message);
+}
+
+HttpAnswer answerFor(const Unserved& unserved) {
+    using Reason = Unserved::Reason;
+    switch (unserved.reason) {
+        case Reason::overrun:
+            return errorAnswer(504, "DEADLINE_EXCEEDED", "The command did not end in time and was stopped.");
+        case Reason::unavailable:
+            return retryLater("WORKER_UNAVAILABLE", unserved.message);
+        case Reason::stopping:
+            return retryLater("STOPPING", unserved.message);
+        case Reason::abandoned:
+            return retryLater("CLIENT_GONE", unserved.message);
+        case Reason::failed:
+        case Reason::tooLarge:
+            break;
     }
-    if (word == outcome::error) {
-        return {500, response(), {}};
+    return errorAnswer(500, "WORKER_FAILED", unserved.message);
+}
+
+/// Logs the end of a request and completes its record.
+void close(RequestRecord& record, unsigned status, std::string_view code) {
+    const std::chrono::duration<double, std::milli> duration = std::chrono::steady_clock::now() - record.arrival;
+    record.milliseconds = duration.count();
+    record.state = RequestRecord::State::done;
+    record.status = status;
+    record.error = code;
+    // Names from an address come from the client: only printable ones may reach the log.
+    std::string name = record.plugin + "/" + record.command;
+    for (char& c : name) {
+        c = c < 0x21 || c > 0x7e ? '?' : c;
     }
-    const Array* findings = worker.get("findings").array();
-    if (word == outcome::refused && findings != nullptr && !findings->empty() &&
-        findings->front().dictionary() != nullptr) {
-        return findingsAnswer(worker.get("findings"), *findings->front().dictionary());
-    }
-    if (word == outcome::changed) {
-        return errorAnswer(412, "REVISION_CHANGED", "The settings have changed since they were read. Read them again.");
-    }
-    if (word == outcome::overrun) {
-        return errorAnswer(504, "DEADLINE_EXCEEDED", "The command did not end in time and was stopped.");
-    }
-    if (word == outcome::unavailable) {
-        return retryLater("WORKER_UNAVAILABLE", message);
-    }
-    if (word == outcome::stopping) {
-        return retryLater("STOPPING", message);
-    }
-    if (word == outcome::abandoned) {
-        return retryLater("CLIENT_GONE", message);
-    }
-    return errorAnswer(500, "WORKER_FAILED", message);
+    logEvent(fmt::format("adminhostd: request {} {} by uid {} pid {}: {}{}{} in {:.1f} ms", record.id, name,
+                         record.peer.uid, record.peer.pid, record.status, record.error.empty() ? "" : " ", record.error,
+                         record.milliseconds));
+}
+
+BodyForm wantedForm(const Exchange& exchange) {
+    return exchange.wantsPropertyList() ? BodyForm::propertyList : BodyForm::json;
 }
 
 }  // namespace
 
-Front::Front(OperationQueue::Settings settings, Array refused)
+Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused)
     : _refused(std::move(refused)),
-      _queue(std::move(settings),
-             {[this](const Dictionary& hello) { return welcome(hello); },
-              [](const std::string& event) { logEvent(event); },
-              [this](const Operation& operation, Dictionary answer) { finished(operation, std::move(answer)); }}) {}
+      _queue(std::move(settings), {[this](protocol::Hello hello) { welcome(std::move(hello)); },
+                                   [](const std::string& event) { logEvent(event); },
+                                   [this](const Operation& operation, OperationQueue::Ending ending) {
+                                       finished(operation, std::move(ending));
+                                   }}) {}
 
-bool Front::welcome(const Dictionary& hello) {
-    if (!isHello(hello)) {
-        return false;
+std::vector<protocol::RefusedPlugin> Front::refusedPlugins() const {
+    std::vector<protocol::RefusedPlugin> refused = _refused;
+    if (_hello) {
+        refused.insert(refused.end(), _hello->refused.begin(), _hello->refused.end());
     }
-    _hello = hello;
-    const Array none;
-    const Array* others = hello.get("refused").array();
-    for (const Array& refused : {std::cref(_refused), std::cref(others == nullptr ? none : *others)}) {
-        for (const Value& plugin : refused) {
-            const Dictionary* described = plugin.dictionary();
-            logEvent(fmt::format("adminhostd: a plug-in is refused: {}",
-                                 described == nullptr ? "" : textAt(*described, "reason")));
-        }
-    }
-    if (hello.contains("databaseTool")) {
-        logEvent(
-            fmt::format("adminhostd: commands that need the database are refused: {}", textAt(hello, "databaseTool")));
-    }
-    logEvent(fmt::format("adminhostd: release " ADMINHOST_RELEASE " serves with the plug-ins {}",
-                         namesIn(hello.get("plugins"))));
-    return true;
+    return refused;
 }
 
-Front::Address Front::addressOf(std::string_view path) {
+void Front::welcome(protocol::Hello hello) {
+    _hello = std::move(hello);
+    for (const protocol::RefusedPlugin& plugin : refusedPlugins()) {
+        logEvent(fmt::format("adminhostd: a plug-in is refused: {}", plugin.reason));
+    }
+    if (_hello->databaseTool) {
+        logEvent(fmt::format("adminhostd: commands that need the database are refused: {}", *_hello->databaseTool));
+    }
+    logEvent(
+        fmt::format("adminhostd: release " ADMINHOST_RELEASE " serves with the plug-ins {}", namesIn(_hello->plugins)));
+}
+
+Front::Target Front::targetOf(std::string_view path) {
+    using Kind = Target::Kind;
     constexpr std::string_view root = "/v1";
     if (path == root) {
         path = "/v1/";
@@ -176,64 +217,85 @@ Front::Address Front::addressOf(std::string_view path) {
     }
     path.remove_prefix(root.size() + 1);
     if (path.empty()) {
-        return {Address::Kind::overview, {}, {}};
+        return {Kind::overview, {}, {}};
     }
     const std::size_t slash = path.find('/');
-    const std::string_view first = path.substr(0, slash);
-    const std::string_view second = slash == std::string_view::npos ? std::string_view() : path.substr(slash + 1);
+    const std::string first(path.substr(0, slash));
+    const std::string second(slash == std::string_view::npos ? std::string_view() : path.substr(slash + 1));
     if (first == "requests") {
-        return {second.empty() ? Address::Kind::unknown : Address::Kind::request, {}, second};
+        return {second.empty() ? Kind::unknown : Kind::request, {}, second};
     }
     if (path == "directory") {
-        return {Address::Kind::directory, {}, path};
+        return {Kind::directory, {}, first};
     }
     if (second == "history") {
-        return {Address::Kind::history, first, second};
+        return {Kind::history, first, second};
     }
-    return {second.empty() ? Address::Kind::plugin : Address::Kind::command, first, second};
+    return {second.empty() ? Kind::plugin : Kind::command, first, second};
 }
 
-const Dictionary* Front::pluginNamed(std::string_view name) const {
-    return elementNamed(_hello.get("plugins"), name);
+const protocol::OfferedPlugin* Front::pluginNamed(std::string_view name) const {
+    return _hello ? elementNamed(_hello->plugins, name) : nullptr;
 }
 
-const Dictionary* Front::commandNamed(const Dictionary& plugin, std::string_view name) {
-    return elementNamed(plugin.get("commands"), name);
-}
-
-std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Address& address) const {
-    using Kind = Address::Kind;
-    if (!permitted(exchange.peer())) {
-        return errorAnswer(403, "NOT_PERMITTED",
-                           fmt::format("The account with uid {} may not use this daemon.", exchange.peer().uid));
+std::optional<HttpAnswer> Front::adoptId(Exchange& exchange, const Target& target) {
+    const auto id = exchange.header("Request-Id");
+    if (!id || !target.isOperation()) {
+        return std::nullopt;
     }
-    if (address.kind == Kind::unknown) {
+    if (!isCanonicalUuid(*id)) {
+        return errorAnswer(400, "MALFORMED_REQUEST_ID",
+                           "Request-Id must be a UUID in its canonical form of 36 characters.");
+    }
+    if (!_log.use(*id)) {
+        return errorAnswer(
+            409, "REQUEST_ID_USED",
+            fmt::format("The request id {} has been used already; nothing was run. /v1/requests/{} shows what became "
+                        "of that request; a new request needs a new id.",
+                        *id, *id));
+    }
+    exchange.adoptId(std::string(*id));
+    return std::nullopt;
+}
+
+std::optional<HttpAnswer> Front::missing(const Target& target) const {
+    const protocol::OfferedPlugin* plugin = pluginNamed(target.plugin);
+    if (plugin == nullptr && !_hello) {
+        return retryLater("WORKER_UNAVAILABLE", "No worker has started yet, so that no plug-in is known.");
+    }
+    if (plugin == nullptr) {
+        return errorAnswer(
+            404, "UNKNOWN_PLUGIN",
+            fmt::format("There is no plug-in \"{}\". Known plug-ins: {}.", target.plugin, namesIn(_hello->plugins)));
+    }
+    if (target.kind == Target::Kind::command && elementNamed(plugin->commands, target.command) == nullptr) {
+        return errorAnswer(404, "UNKNOWN_COMMAND",
+                           fmt::format("The plug-in \"{}\" has no command \"{}\". Known commands: {}.", target.plugin,
+                                       target.command, namesIn(plugin->commands)));
+    }
+    return std::nullopt;
+}
+
+std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target& target) const {
+    using Kind = Target::Kind;
+    if (target.kind == Kind::unknown) {
         return errorAnswer(404, "UNKNOWN_ADDRESS",
                            "Known addresses: /v1/, /v1/PLUGIN, /v1/PLUGIN/COMMAND, /v1/PLUGIN/history, /v1/directory, "
                            "/v1/requests/ID.");
     }
-    if (address.kind == Kind::plugin || address.kind == Kind::command || address.kind == Kind::history) {
-        const Dictionary* plugin = pluginNamed(address.plugin);
-        if (plugin == nullptr && _hello.empty()) {
-            return retryLater("WORKER_UNAVAILABLE", "No worker has started yet, so that no plug-in is known.");
-        }
-        if (plugin == nullptr) {
-            return errorAnswer(404, "UNKNOWN_PLUGIN",
-                               fmt::format("There is no plug-in \"{}\". Known plug-ins: {}.", address.plugin,
-                                           namesIn(_hello.get("plugins"))));
-        }
-        if (address.kind == Kind::command && commandNamed(*plugin, address.command) == nullptr) {
-            return errorAnswer(404, "UNKNOWN_COMMAND",
-                               fmt::format("The plug-in \"{}\" has no command \"{}\". Known commands: {}.",
-                                           address.plugin, address.command, namesIn(plugin->get("commands"))));
+    if (target.kind == Kind::plugin || target.kind == Kind::command || target.kind == Kind::history) {
+        if (auto answer = missing(target)) {
+            return answer;
         }
     }
-    if (address.kind == Kind::request && _history.find(address.command) == nullptr) {
-        return errorAnswer(
+    if (target.kind == Kind::request && _log.find(target.command) == nullptr) {
+        HttpAnswer answer = errorAnswer(
             404, "UNKNOWN_REQUEST",
-            fmt::format("The request \"{}\" is not among the latest {}.", address.command, History::length));
+            fmt::format("The request \"{}\" is not among the latest {}.", target.command, RequestLog::length));
+        answer.body->dictionary()->set("state", "unknown");
+        return answer;
     }
-    const bool post = address.kind == Kind::command;
+    const bool post = target.kind == Kind::command;
     const bool allowed = post ? exchange.method() == "POST" : exchange.method() == "GET" || exchange.method() == "HEAD";
     if (!allowed) {
         HttpAnswer answer = errorAnswer(405, "METHOD_NOT_ALLOWED",
@@ -248,43 +310,54 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Address
     return std::nullopt;
 }
 
-std::optional<HttpAnswer> Front::head(const Exchange& exchange) {
-    const Address address = addressOf(exchange.path());
-    auto answer = refusal(exchange, address);
+std::variant<HttpAnswer, HttpServer::Serve> Front::head(Exchange& exchange) {
+    const Target target = targetOf(exchange.path());
     const bool stranger = !permitted(exchange.peer());
-    if (answer && (stranger || exchange.method() == "POST")) {
-        // Who may not ask is logged, but must not push what others asked for out of the daemon's memory.
-        const std::shared_ptr<RequestRecord> record = stranger ? History::begin(exchange) : _history.add(exchange);
-        record->plugin = address.plugin.substr(0, keptName);
-        record->command = address.command.substr(0, keptName);
-        close(*record, *answer);
+    std::optional<HttpAnswer> answer;
+    if (stranger) {
+        answer = errorAnswer(403, "NOT_PERMITTED",
+                             fmt::format("The account with uid {} may not use this daemon.", exchange.peer().uid));
+    } else {
+        answer = adoptId(exchange, target);
     }
-    return answer;
+    if (!answer) {
+        answer = refusal(exchange, target);
+    }
+    if (!answer) {
+        return [this, target](Exchange& whole) { serve(whole, target); };
+    }
+    if (stranger || exchange.method() == "POST") {
+        // Log unauthorised requests, but keep them out of what the daemon remembers.
+        const std::shared_ptr<RequestRecord> record = stranger ? RequestLog::begin(exchange) : _log.add(exchange);
+        record->plugin = target.plugin.substr(0, keptName);
+        record->command = target.command.substr(0, keptName);
+        close(*record, answer->status, codeOf(*answer));
+    }
+    return std::move(*answer);
 }
 
-void Front::serve(Exchange& exchange) {
-    const Address address = addressOf(exchange.path());
-    // Between head and body a new worker may have brought other plug-ins.
-    if (auto answer = refusal(exchange, address)) {
-        exchange.answer(std::move(*answer));
-        return;
-    }
-    switch (address.kind) {
-        case Address::Kind::command:
-            operation(exchange, address);
+void Front::serve(Exchange& exchange, const Target& target) {
+    switch (target.kind) {
+        case Target::Kind::command:
+            operation(exchange, target);
             return;
-        case Address::Kind::directory:
-        case Address::Kind::history:
-            query(exchange, address);
+        case Target::Kind::directory:
+        case Target::Kind::history:
+            query(exchange, target);
             return;
-        case Address::Kind::plugin:
-            exchange.answer({200, pluginNamed(address.plugin)->get("commands"), {}});
+        case Target::Kind::plugin: {
+            const protocol::OfferedPlugin* plugin = pluginNamed(target.plugin);
+            exchange.answer(plugin == nullptr ? *missing(target) : HttpAnswer{200, describe(plugin->commands), {}});
             return;
-        case Address::Kind::request:
-            exchange.answer({200, _history.find(address.command)->describe(), {}});
+        }
+        case Target::Kind::request: {
+            const RequestRecord* record = _log.find(target.command);
+            const bool withReports = exchange.peer().uid == record->peer.uid || permitted(exchange.peer());
+            exchange.answer({200, record->describe(withReports), {}});
             return;
-        case Address::Kind::overview:
-        case Address::Kind::unknown:
+        }
+        case Target::Kind::overview:
+        case Target::Kind::unknown:
             exchange.answer(overview());
             return;
     }
@@ -292,26 +365,27 @@ void Front::serve(Exchange& exchange) {
 
 HttpAnswer Front::overview() const {
     Array plugins;
-    if (const Array* loaded = _hello.get("plugins").array()) {
-        for (const Value& element : *loaded) {
-            const Dictionary& plugin = *element.dictionary();
+    if (_hello) {
+        for (const protocol::OfferedPlugin& plugin : _hello->plugins) {
             Array commands;
-            for (const Value& command : *plugin.get("commands").array()) {
-                commands.push_back(command.dictionary()->get("name"));
+            for (const Command& command : plugin.commands) {
+                commands.emplace_back(command.name);
             }
-            plugins.emplace_back(Dictionary{
-                {"name", plugin.get("name")}, {"version", plugin.get("version")}, {"commands", std::move(commands)}});
+            plugins.emplace_back(
+                Dictionary{{"name", plugin.name}, {"version", plugin.version}, {"commands", std::move(commands)}});
         }
     }
-    Array refused = _refused;
-    if (const Array* others = _hello.get("refused").array()) {
-        refused.insert(refused.end(), others->begin(), others->end());
+    Array refused;
+    for (const protocol::RefusedPlugin& plugin : refusedPlugins()) {
+        refused.emplace_back(Dictionary{{"file", plugin.file}, {"reason", plugin.reason}});
     }
     Dictionary text{{"release", ADMINHOST_RELEASE}, {"plugins", std::move(plugins)}};
     text.set("refusedPlugins", refused.empty() ? Value() : Value(std::move(refused)));
-    text.set("databaseToolProblem", _hello.get("databaseTool"));
+    if (_hello && _hello->databaseTool) {
+        text.set("databaseToolProblem", *_hello->databaseTool);
+    }
     if (const Operation* running = _queue.running()) {
-        Dictionary description = running->record->describe();
+        Dictionary description = running->record->describe(false);
         description.remove("log");
         description.remove("state");
         text.set("running", std::move(description));
@@ -323,17 +397,42 @@ HttpAnswer Front::overview() const {
     return {200, std::move(text), {}};
 }
 
-void Front::operation(Exchange& exchange, const Address& address) {
-    const Dictionary& description = *commandNamed(*pluginNamed(address.plugin), address.command);
-    Operation operation{&exchange, _history.add(exchange), {}};
+void Front::end(const Operation& operation, HttpAnswer answer, std::string_view code) {
     RequestRecord& record = *operation.record;
-    record.plugin = address.plugin;
-    record.command = address.command;
+    close(record, answer.status, code);
+    for (const auto& [name, count] :
+         {std::pair("Adminhost-Changes", record.changes()), std::pair("Adminhost-Not-Done", record.notDone())}) {
+        if (count > 0) {
+            answer.headers.emplace_back(name, std::to_string(count));
+        }
+    }
+    operation.exchange->answer(std::move(answer));
+}
+
+void Front::enqueue(Operation operation) {
+    if (_queue.full()) {
+        end(operation, retryLater("TOO_MANY_WAITING", fmt::format("{} requests wait already.", _queue.waiting())),
+            "TOO_MANY_WAITING");
+        return;
+    }
+    _queue.add(std::move(operation));
+}
+
+void Front::operation(Exchange& exchange, const Target& target) {
+    Operation operation{&exchange, _log.add(exchange), {}, {}};
+    RequestRecord& record = *operation.record;
+    record.plugin = target.plugin;
+    record.command = target.command;
     const auto refuse = [&](HttpAnswer answer) {
-        close(record, answer);
-        exchange.answer(std::move(answer));
+        const std::string code(codeOf(answer));
+        end(operation, std::move(answer), code);
     };
 
+    // Between head and body a new worker may have brought other plug-ins.
+    if (auto answer = missing(target)) {
+        return refuse(std::move(*answer));
+    }
+    const Command& command = *elementNamed(pluginNamed(target.plugin)->commands, target.command);
     BodyProblem problem;
     auto request = requestOf(exchange.body(), *bodyFormOf(exchange.header("Content-Type").value_or("")), problem);
     exchange.dropBody();
@@ -343,89 +442,68 @@ void Front::operation(Exchange& exchange, const Address& address) {
     }
     const auto ifMatch = exchange.header("If-Match");
     auto revisions = revisionsOf(ifMatch.value_or("*"));
-    if (ifMatch && (!revisions || !flag(description, "takesRevision"))) {
+    if (ifMatch && (!revisions || !command.takesRevision)) {
         return refuse(errorAnswer(400, "PRECONDITION_NOT_UNDERSTOOD",
                                   "If-Match must list quoted revisions, and is for commands that depend on the "
                                   "revision only."));
     }
-    if (_hello.contains("databaseTool") && needs(description, "database")) {
+    if (_hello->databaseTool && std::count(command.needs.begin(), command.needs.end(), "database") > 0) {
         return refuse(
             errorAnswer(500, "SQLITE_TOOL_UNUSABLE",
                         fmt::format("The command needs the database tool, and {}. The daemon tries it when it starts.",
-                                    textAt(_hello, "databaseTool"))));
+                                    *_hello->databaseTool)));
     }
-    if (_queue.full()) {
-        return refuse(retryLater("TOO_MANY_WAITING", fmt::format("{} requests wait already.", _queue.waiting())));
-    }
-    operation.order.set("plugin", address.plugin);
-    operation.order.set("command", address.command);
-    operation.order.set("request", std::move(*request));
-    operation.order.set("wantsRevision", flag(description, "showsRevision"));
-    if (flag(description, "takesRevision")) {
-        // Whatever depends on the revision replaces settings, and these are kept first.
-        operation.order.set("keep", Dictionary{{"when", record.received},
-                                               {"who", fmt::format("uid {}", record.peer.uid)},
-                                               {"command", record.command},
-                                               {"request", record.id}});
-    }
-    if (revisions && !revisions->empty()) {
-        operation.order.set("ifMatch", std::move(*revisions));
-    }
-    _queue.add(std::move(operation));
+    operation.deadline = command.deadline;
+    operation.order = protocol::Perform{
+        .request = record.id,
+        .plugin = record.plugin,
+        .command = record.command,
+        .caller = {record.peer.uid, record.peer.pid},
+        .received = record.received,
+        .arguments = std::move(*request),
+        .revisions = std::move(*revisions),
+        .showsRevision = command.showsRevision,
+        .keepsHistory = command.takesRevision,
+        .milliseconds = 0,
+        .form = wantedForm(exchange),
+    };
+    enqueue(std::move(operation));
 }
 
-void Front::query(Exchange& exchange, const Address& address) {
-    Operation operation{&exchange, _history.add(exchange), {}};
-    operation.record->plugin = address.plugin;
-    operation.record->command = address.command;
-    if (_queue.full()) {
-        HttpAnswer answer = retryLater("TOO_MANY_WAITING", fmt::format("{} requests wait already.", _queue.waiting()));
-        close(*operation.record, answer);
-        exchange.answer(std::move(answer));
-        return;
-    }
-    operation.order.set("query", address.command);
-    operation.order.set("plugin", address.plugin);
+void Front::query(Exchange& exchange, const Target& target) {
+    Operation operation{&exchange, _log.add(exchange), {}, {}};
+    operation.record->plugin = target.plugin;
+    operation.record->command = target.command;
     for (const char* argument : {"match", "is"}) {
-        const std::string_view text = exchange.argument(argument);
-        if (!isUtf8(text)) {
-            HttpAnswer answer =
-                errorAnswer(400, "MALFORMED_ADDRESS", fmt::format("The text of \"{}\" is not UTF-8.", argument));
-            close(*operation.record, answer);
-            exchange.answer(std::move(answer));
+        if (!isUtf8(exchange.argument(argument))) {
+            end(operation,
+                errorAnswer(400, "MALFORMED_ADDRESS", fmt::format("The text of \"{}\" is not UTF-8.", argument)),
+                "MALFORMED_ADDRESS");
             return;
         }
-        operation.order.set(argument, text);
     }
-    _queue.add(std::move(operation));
+    if (target.kind == Target::Kind::history) {
+        operation.order = protocol::ReadHistory{target.plugin, wantedForm(exchange)};
+    } else {
+        operation.order = protocol::FindAccounts{std::string(exchange.argument("match")),
+                                                 std::string(exchange.argument("is")), wantedForm(exchange)};
+    }
+    enqueue(std::move(operation));
 }
 
-void Front::finished(const Operation& operation, Dictionary answer) {
+void Front::finished(const Operation& operation, OperationQueue::Ending ending) {
+    if (const auto* unserved = std::get_if<Unserved>(&ending)) {
+        HttpAnswer http = answerFor(*unserved);
+        const std::string code(codeOf(http));
+        return end(operation, std::move(http), code);
+    }
+    auto& answer = std::get<protocol::Answer>(ending);
     HttpAnswer http = answerFor(answer);
-    const std::string_view revision = textAt(answer, "revision");
-    if (http.status < 300 && !revision.empty()) {
-        http.headers.emplace_back("ETag", fmt::format("\"{}\"", revision));
+    if (http.status < 300 && !answer.revision.empty()) {
+        http.headers.emplace_back("ETag", fmt::format("\"{}\"", answer.revision));
     }
-    close(*operation.record, http);
-    operation.exchange->answer(std::move(http));
-}
-
-void Front::close(RequestRecord& record, const HttpAnswer& answer) {
-    const std::chrono::duration<double, std::milli> duration = std::chrono::steady_clock::now() - record.arrival;
-    record.milliseconds = duration.count();
-    record.state = RequestRecord::State::done;
-    record.status = answer.status;
-    if (answer.status >= 400 && answer.body && answer.body->dictionary() != nullptr) {
-        record.error = textAt(*answer.body->dictionary(), "error");
-    }
-    // Names from an address come from the client: only printable ones may reach the log.
-    std::string name = record.plugin + "/" + record.command;
-    for (char& c : name) {
-        c = c < 0x21 || c > 0x7e ? '?' : c;
-    }
-    logEvent(fmt::format("adminhostd: request {} {} by uid {} pid {}: {}{}{} in {:.1f} ms", record.id, name,
-                         record.peer.uid, record.peer.pid, record.status, record.error.empty() ? "" : " ", record.error,
-                         record.milliseconds));
+    const std::string code(http.text ? answer.error : codeOf(http));
+    end(operation, std::move(http), code);
 }
 
 }  // namespace adminhost

@@ -1,56 +1,70 @@
 #pragma once
 
-// The front: what each address answers, who may ask, and the audit.
+// The front: what each address serves, who may ask, and the audit.
 
-#include "adminhostd/History.h"
 #include "adminhostd/Http.h"
 #include "adminhostd/OperationQueue.h"
+#include "adminhostd/RequestLog.h"
 
 #include <optional>
 #include <string>
 #include <string_view>
+#include <variant>
+#include <vector>
 
 namespace adminhost {
 
 class Front {
   public:
-    /// The configuration for the workers; its "refused" lists the plug-ins that were not even offered to them. Hands
-    /// the operations to a worker, which it starts.
-    Front(OperationQueue::Settings settings, Array refused);
+    /// The configuration for the workers, and the plug-ins that were not even offered to them. Hands the operations to
+    /// a worker, which it starts.
+    Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused);
     Front(const Front&) = delete;
     Front& operator=(const Front&) = delete;
 
     [[nodiscard]] OperationQueue& queue() noexcept { return _queue; }
 
-    /// The answer that needs no body: who may not ask, what does not exist, what is not understood.
-    [[nodiscard]] std::optional<HttpAnswer> head(const Exchange& exchange);
-    /// Serves a request that head() let pass: at once or, an operation, when it has run.
-    void serve(Exchange& exchange);
+    /// For a request whose head has arrived: the answer that needs no body (not permitted, not found, not understood),
+    /// or the function that serves it once its body is there, at once or, an operation, when it has run. Permission,
+    /// address and id are looked at here only.
+    [[nodiscard]] std::variant<HttpAnswer, HttpServer::Serve> head(Exchange& exchange);
 
   private:
-    struct Address {
+    struct Target {
         enum class Kind { unknown, overview, plugin, command, request, directory, history };
         Kind kind = Kind::unknown;
-        std::string_view plugin;
-        std::string_view command;
+        std::string plugin;
+        std::string command;  ///< or, of a request, its id
+
+        /// Whether it is served by the worker, and remembered.
+        [[nodiscard]] bool isOperation() const noexcept {
+            return kind == Kind::command || kind == Kind::directory || kind == Kind::history;
+        }
     };
 
-    /// Takes over what a worker says of itself; false when it is not of the form that everything else relies on.
-    bool welcome(const Dictionary& hello);
-    [[nodiscard]] static Address addressOf(std::string_view path);
-    [[nodiscard]] const Dictionary* pluginNamed(std::string_view name) const;
-    [[nodiscard]] static const Dictionary* commandNamed(const Dictionary& plugin, std::string_view name);
-    [[nodiscard]] std::optional<HttpAnswer> refusal(const Exchange& exchange, const Address& address) const;
-    [[nodiscard]] HttpAnswer overview() const;
-    void operation(Exchange& exchange, const Address& address);
-    /// What the worker answers without an operation of a plug-in.
-    void query(Exchange& exchange, const Address& address);
-    void finished(const Operation& operation, Dictionary answer);
-    void close(RequestRecord& record, const HttpAnswer& answer);
+    void welcome(protocol::Hello hello);
+    [[nodiscard]] static Target targetOf(std::string_view path);
+    [[nodiscard]] const protocol::OfferedPlugin* pluginNamed(std::string_view name) const;
+    [[nodiscard]] std::vector<protocol::RefusedPlugin> refusedPlugins() const;
 
-    History _history;
-    Array _refused;     ///< plug-ins that were refused before a worker saw them
-    Dictionary _hello;  ///< what the latest worker said of itself
+    /// Makes the id that a client may have sent the exchange's; an answer if it cannot be.
+    std::optional<HttpAnswer> adoptId(Exchange& exchange, const Target& target);
+    /// The answer if the plug-in or its command does not exist.
+    [[nodiscard]] std::optional<HttpAnswer> missing(const Target& target) const;
+    [[nodiscard]] std::optional<HttpAnswer> refusal(const Exchange& exchange, const Target& target) const;
+    void serve(Exchange& exchange, const Target& target);
+    [[nodiscard]] HttpAnswer overview() const;
+    void operation(Exchange& exchange, const Target& target);
+    /// What the worker serves without an operation of a plug-in.
+    void query(Exchange& exchange, const Target& target);
+    void enqueue(Operation operation);
+    void finished(const Operation& operation, OperationQueue::Ending ending);
+    /// Answers an operation, and logs its end.
+    static void end(const Operation& operation, HttpAnswer answer, std::string_view code);
+
+    RequestLog _log;
+    std::vector<protocol::RefusedPlugin> _refused;  ///< before a worker saw them
+    std::optional<protocol::Hello> _hello;          ///< of the latest worker
     OperationQueue _queue;
 };
 

@@ -178,6 +178,11 @@ bool Exchange::clientGone() const noexcept {
     return ::poll(&entry, 1, 0) == 1 && (entry.revents & (POLLRDHUP | POLLHUP | POLLERR)) != 0;
 }
 
+void Exchange::dropBody() noexcept {
+    ::explicit_bzero(_body.data(), _body.size());
+    std::string().swap(_body);
+}
+
 void Exchange::answer(HttpAnswer answer) {
     _answer = std::move(answer);
     if (_suspended) {
@@ -224,11 +229,10 @@ struct HttpServer::Callbacks {
     }
 };
 
-HttpServer::HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeout, Head head, Serve serve)
+HttpServer::HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeout, Head head)
     : _listener(std::move(listener)),
       _clientTimeout(clientTimeout),
       _head(std::move(head)),
-      _serve(std::move(serve)),
       _limits(descriptorMaximum()),
       // Different after each start, so that an id from a log names one request only.
       _idPrefix(makeUUIDString().substr(0, 8)) {
@@ -390,7 +394,12 @@ int HttpServer::begin(MHD_Connection* connection, const char* url, const char* m
     *place = exchange.release();
     ++_open;
     Exchange& begun = **place;
-    begun._refusal = _head(begun);
+    auto decided = _head(begun);
+    if (auto* refusal = std::get_if<HttpAnswer>(&decided)) {
+        begun._refusal = std::move(*refusal);
+    } else {
+        begun._serve = std::move(std::get<Serve>(decided));
+    }
     if (auto refusal = begun._refusal ? std::nullopt : headRefusal(connection, version)) {
         begun._answer = std::move(refusal);
         return send(begun);
@@ -431,7 +440,7 @@ int HttpServer::access(MHD_Connection* connection, const char* url, const char* 
         if (exchange._refusal) {
             exchange._answer = std::move(exchange._refusal);
         } else {
-            _serve(exchange);
+            exchange._serve(exchange);
         }
     }
     if (!exchange._answer) {

@@ -16,6 +16,7 @@
 #include <string>
 #include <string_view>
 #include <utility>
+#include <variant>
 #include <vector>
 
 #include <poll.h>
@@ -69,8 +70,10 @@ class Exchange {
     [[nodiscard]] std::string_view argument(const char* name) const;
     /// Returns true when the answer's text is to be a property list, and false for JSON.
     [[nodiscard]] bool wantsPropertyList() const;
-    /// Frees the body once it has been read.
-    void dropBody() noexcept { std::string().swap(_body); }
+    /// Replaces the id by the one that the client has given.
+    void adoptId(std::string id) noexcept { _id = std::move(id); }
+    /// Clears and frees the body once it has been read.
+    void dropBody() noexcept;
     /// Returns true when the client has closed its connection, or its sending half.
     [[nodiscard]] bool clientGone() const noexcept;
     /// Answers the request, now or later, once. The exchange may be gone when the server runs next.
@@ -88,7 +91,8 @@ class Exchange {
     std::string _path;
     std::string _body;
     std::size_t _received = 0;
-    std::optional<HttpAnswer> _refusal;  ///< decided from the head, sent when the body has been read away
+    std::function<void(Exchange&)> _serve;  ///< what head() returned
+    std::optional<HttpAnswer> _refusal;     ///< decided from the head, sent when the body has been read away
     std::optional<HttpAnswer> _answer;
     std::string _bytes;       ///< of the answer, while it is sent
     std::size_t _unread = 0;  ///< bytes of it that count as unread; 0 when it has been dropped
@@ -97,14 +101,15 @@ class Exchange {
 
 class HttpServer {
   public:
-    /// Called when the head of a request is there: an answer refuses it before its body is read.
-    using Head = std::function<std::optional<HttpAnswer>(const Exchange&)>;
     /// Called with the whole request.
     using Serve = std::function<void(Exchange&)>;
+    /// Called when the head of a request is there. An answer refuses it before its body is read; else what is returned
+    /// is called with the whole request.
+    using Head = std::function<std::variant<HttpAnswer, Serve>(Exchange&)>;
 
     /// Takes the listening socket. A client that takes longer than the time for a request, or to read on, is dropped.
     /// Throws std::runtime_error when the library fails to start.
-    HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeout, Head head, Serve serve);
+    HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeout, Head head);
     HttpServer(const HttpServer&) = delete;
     HttpServer& operator=(const HttpServer&) = delete;
     /// Every exchange must have been answered.
@@ -149,7 +154,6 @@ class HttpServer {
     FileDescriptor _listener;
     std::chrono::seconds _clientTimeout;
     Head _head;
-    Serve _serve;
     MHD_Daemon* _daemon = nullptr;
     int _descriptor = -1;  ///< of the library: readable when it has something to do
     ConnectionLimits _limits;

@@ -1,7 +1,5 @@
 #include "adminhostd/OperationQueue.h"
 
-#include "adminhostd/Worker.h"
-
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
@@ -14,14 +12,10 @@ namespace {
 using namespace std::chrono_literals;
 
 constexpr auto startBound = 30s;
-/// A worker kills its tools at the deadline and says so; one that does not is killed itself.
+/// A worker kills its tools at the deadline and reports the overrun; one that does not is killed itself.
 constexpr auto overrunGrace = 2s;
 constexpr auto firstPause = 100ms;
 constexpr auto longestPause = 30s;
-
-Dictionary answerOf(const char* outcome, const std::string& message) {
-    return {{"outcome", outcome}, {"message", message}};
-}
 
 }  // namespace
 
@@ -37,9 +31,9 @@ std::optional<pid_t> OperationQueue::workerPid() const {
 void OperationQueue::add(Operation operation) {
     _waiting.push_back(std::move(operation));
     if (_stopping) {
-        failWaiting(outcome::stopping, "The daemon is being stopped.");
+        failWaiting(Unserved::Reason::stopping, "The daemon is being stopped.");
     } else if (_state == State::paused) {
-        failWaiting(outcome::unavailable, _startProblem);
+        failWaiting(Unserved::Reason::unavailable, _startProblem);
     } else if (_state == State::idle) {
         next();
     }
@@ -57,7 +51,7 @@ void OperationQueue::addTo(std::vector<pollfd>& entries) const {
 void OperationQueue::start() {
     ++_starts;
     _worker = WorkerProcess::start(_settings.outputToStandardError);
-    if (!_worker || !_worker->send(FrameType::configure, _settings.configuration)) {
+    if (!_worker || !_worker->send(protocol::frameOf(_settings.configuration))) {
         startFailed(fmt::format("cannot be started: {}", std::strerror(errno)));
         return;
     }
@@ -74,66 +68,109 @@ void OperationQueue::startFailed(const std::string& reason) {
     _due = Clock::now() + _pause;
     _events.log("adminhostd: the worker " + reason + "; the next start is in " + std::to_string(_pause.count()) +
                 " ms");
-    failWaiting(outcome::unavailable, _startProblem);
+    failWaiting(Unserved::Reason::unavailable, _startProblem);
 }
 
-void OperationQueue::failWaiting(const char* outcome, const std::string& message) {
+void OperationQueue::failWaiting(Unserved::Reason reason, const std::string& message) {
     while (!_waiting.empty()) {
         const Operation operation = std::move(_waiting.front());
         _waiting.pop_front();
-        _events.finished(operation, answerOf(outcome, message));
+        _events.finished(operation, Unserved{reason, message});
     }
 }
 
-void OperationQueue::run() {
+void OperationQueue::run(std::span<const pollfd> polled) {
     if (_worker) {
-        // Asked first: what a worker said before its end is read in any case.
-        const auto ending = _worker->ending();
-        const unsigned long asked = _starts;
-        const bool more = _worker->converse();
-        while (_worker && _starts == asked) {
-            auto frame = _worker->next();
-            if (!frame) {
-                break;
-            }
-            take(std::move(*frame));
-        }
-        if (_worker && _starts == asked && _worker->broken()) {
-            _worker->kill();
-            workerEnded("sent what cannot be read");
-        } else if (_worker && _starts == asked && ending && !more) {
-            workerEnded(*ending);
-        }
+        converse(polled);
     }
-    std::erase_if(_dying, [](const auto& worker) { return worker->ending().has_value(); });
+    std::erase_if(_dying, [&](const auto& worker) { return worker->mayHaveEnded(polled) && worker->ending(); });
     if (_due && Clock::now() >= *_due) {
         timeUp();
     }
 }
 
-void OperationQueue::take(Frame frame) {
-    Dictionary* payload = frame.payload.dictionary();
-    if (frame.type == FrameType::log && frame.payload.string() != nullptr) {
-        if (_running) {
-            _running->record->addLog(*frame.payload.string());
-        }
-        _events.log(*frame.payload.string());
-    } else if (frame.type == FrameType::hello && _state == State::starting && payload != nullptr &&
-               _events.hello(*payload)) {
-        _state = State::idle;
-        _settled = true;
-        _due.reset();
-        _pause = 0ms;
-        next();
-    } else if (frame.type == FrameType::answer && _state == State::busy && payload != nullptr) {
-        _state = State::idle;
-        _due.reset();
-        finish(std::move(*payload));
-        next();
-    } else {
-        _worker->kill();
-        workerEnded("sent what it was not asked");
+void OperationQueue::converse(std::span<const pollfd> polled) {
+    // Asked first: what a worker sent before its end is read in any case.
+    const bool ended = _worker->mayHaveEnded(polled) && _worker->ending();
+    if (!ended && !_worker->mayConverse(polled)) {
+        return;
     }
+    const unsigned long asked = _starts;
+    const auto same = [&] { return _worker && _starts == asked; };
+    const bool more = _worker->converse();
+    while (same()) {
+        auto frame = _worker->next();
+        if (!frame) {
+            break;
+        }
+        receive(std::move(*frame));
+    }
+    if (same() && _worker->broken()) {
+        endWorker("sent what cannot be read");
+    } else if (same() && ended && !more) {
+        const std::string how = *_worker->ending();  // the worker itself goes with its end
+        workerEnded(how);
+    }
+}
+
+void OperationQueue::receive(Frame frame) {
+    auto message = protocol::toFront(std::move(frame));
+    if (!message) {
+        endWorker(fmt::format("sent what cannot be read ({})", message.error().description.value_or("")));
+    } else if (!std::visit([&](auto& one) { return take(std::move(one)); }, *message)) {
+        endWorker("sent what it was not asked");
+    }
+}
+
+bool OperationQueue::take(const protocol::Log& log) {
+    if (_running) {
+        _running->record->add(log.event);
+    }
+    _events.log(log.event);
+    return true;
+}
+
+bool OperationQueue::take(const Change& change) {
+    if (_running) {
+        _running->record->add(change);
+    }
+    return _running.has_value();
+}
+
+bool OperationQueue::take(const NotDone& part) {
+    if (_running) {
+        _running->record->add(part);
+    }
+    return _running.has_value();
+}
+
+bool OperationQueue::take(protocol::Hello hello) {
+    if (_state != State::starting) {
+        return false;
+    }
+    _events.hello(std::move(hello));
+    _state = State::idle;
+    _settled = true;
+    _due.reset();
+    _pause = 0ms;
+    next();
+    return true;
+}
+
+bool OperationQueue::take(protocol::Answer answer) {
+    if (_state != State::busy) {
+        return false;
+    }
+    _state = State::idle;
+    _due.reset();
+    finish(std::move(answer));
+    next();
+    return true;
+}
+
+void OperationQueue::endWorker(const std::string& why) {
+    _worker->kill();
+    workerEnded(why);
 }
 
 void OperationQueue::workerEnded(const std::string& how) {
@@ -149,8 +186,8 @@ void OperationQueue::workerEnded(const std::string& how) {
     }
     _events.log("adminhostd: the worker " + how);
     if (_running) {
-        finish(answerOf(outcome::failed,
-                        "The process that ran the command " + how + ". What it had begun may be half done."));
+        finish(Unserved{Unserved::Reason::failed,
+                        "The process that ran the command " + how + ". What it had begun may be half done."});
     }
     if (!_stopping) {
         start();
@@ -166,19 +203,13 @@ void OperationQueue::timeUp() {
             }
             break;
         case State::starting:
-            _worker->kill();
-            workerEnded("did not get ready in time and was killed");
+            endWorker("did not get ready in time and was killed");
             break;
-        case State::busy: {
-            const bool stopping = _stopping;
-            Dictionary answer = stopping
-                                    ? answerOf(outcome::stopping, "The daemon was stopped before the command ended.")
-                                    : Dictionary{{"outcome", outcome::overrun}};
-            finish(std::move(answer));
-            _worker->kill();
-            workerEnded("did not stop in time and was killed");
+        case State::busy:
+            finish(_stopping ? Unserved{Unserved::Reason::stopping, "The daemon was stopped before the command ended."}
+                             : Unserved{Unserved::Reason::overrun, {}});
+            endWorker("did not stop in time and was killed");
             break;
-        }
         case State::idle:
             break;
     }
@@ -189,28 +220,31 @@ void OperationQueue::next() {
         Operation operation = std::move(_waiting.front());
         _waiting.pop_front();
         if (operation.exchange->clientGone()) {
-            _events.finished(operation, answerOf(outcome::abandoned, "The client went away before its turn."));
+            _events.finished(operation, Unserved{Unserved::Reason::abandoned, "The client went away before its turn."});
             continue;
         }
-        operation.order.set("milliseconds", _settings.deadline.count());
-        if (!_worker->send(FrameType::perform, operation.order)) {
-            _events.finished(operation, answerOf(outcome::broken, "The request is too large to be passed on."));
+        const auto deadline = operation.deadline > 0ms ? operation.deadline : _settings.deadline;
+        if (auto* perform = std::get_if<protocol::Perform>(&operation.order)) {
+            perform->milliseconds = static_cast<std::uint64_t>(deadline.count());
+        }
+        if (!_worker->send(protocol::frameOf(std::exchange(operation.order, {})))) {
+            _events.finished(operation,
+                             Unserved{Unserved::Reason::tooLarge, "The request is too large to be passed on."});
             continue;
         }
-        operation.order.clear();
         operation.record->state = RequestRecord::State::running;
         operation.record->since = std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now());
         operation.record->start = Clock::now();
-        _due = operation.record->start + _settings.deadline + overrunGrace;
+        _due = operation.record->start + deadline + overrunGrace;
         _running = std::move(operation);
         _state = State::busy;
     }
 }
 
-void OperationQueue::finish(Dictionary answer) {
+void OperationQueue::finish(Ending ending) {
     const Operation operation = std::move(*_running);
     _running.reset();
-    _events.finished(operation, std::move(answer));
+    _events.finished(operation, std::move(ending));
 }
 
 void OperationQueue::stop(std::chrono::milliseconds bound) {
@@ -218,7 +252,7 @@ void OperationQueue::stop(std::chrono::milliseconds bound) {
         return;
     }
     _stopping = true;
-    failWaiting(outcome::stopping, "The daemon is being stopped.");
+    failWaiting(Unserved::Reason::stopping, "The daemon is being stopped.");
     if (_state == State::busy) {
         _due = std::min(*_due, Clock::now() + bound);
     } else {

@@ -2,10 +2,12 @@
 
 // The queue of operations and the worker that runs them: one at a time, in the order of their arrival.
 //
-// A worker that crashes or overruns the deadline costs the operation that it ran; the next worker takes the others. One
-// that does not even start costs all that wait, and is tried again after a pause that grows.
+// A worker that crashes, overruns the deadline or breaks the protocol costs the operation that it was running; the next
+// worker runs the others. One that does not even start costs all that are waiting, and is started again after a pause
+// that grows.
 
-#include "adminhostd/History.h"
+#include "adminhostd/Protocol.h"
+#include "adminhostd/RequestLog.h"
 #include "adminhostd/WorkerProcess.h"
 
 #include <chrono>
@@ -13,7 +15,9 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
+#include <variant>
 #include <vector>
 
 namespace adminhost {
@@ -21,34 +25,42 @@ namespace adminhost {
 struct Operation {
     Exchange* exchange;
     std::shared_ptr<RequestRecord> record;
-    Dictionary order;  ///< the payload for the worker, without the time that is left
+    protocol::ToWorker order;              ///< without the time that is left
+    std::chrono::milliseconds deadline{};  ///< its own; zero: the queue's
 };
 
-// Outcomes of an operation that come from the queue itself, beside the worker's (Worker.h); each has a message.
-namespace outcome {
-constexpr const char* failed = "failed";            ///< the worker died
-constexpr const char* unavailable = "unavailable";  ///< no worker starts
-constexpr const char* stopping = "stopping";        ///< the daemon ends
-constexpr const char* abandoned = "abandoned";      ///< the client went away before its turn
-}  // namespace outcome
+/// Why an operation ended without an answer of a worker.
+struct Unserved {
+    enum class Reason {
+        failed,       ///< the worker died, or broke the protocol
+        tooLarge,     ///< the request does not fit a frame
+        overrun,      ///< the deadline passed
+        unavailable,  ///< no worker starts
+        stopping,     ///< the daemon ends
+        abandoned,    ///< the client went away before its turn
+    };
+    Reason reason = Reason::failed;
+    std::string message;
+};
 
 class OperationQueue {
   public:
     struct Settings {
-        Dictionary configuration;            ///< what every worker is told first
+        protocol::Configure configuration;   ///< sent to every worker first
         bool outputToStandardError = false;  ///< of the worker
         std::size_t limit = 64;
         std::chrono::milliseconds deadline{300'000};
     };
+    using Ending = std::variant<protocol::Answer, Unserved>;
     struct Events {
-        std::function<bool(const Dictionary&)> hello;  ///< whether it is of the form that Worker.h describes
-        std::function<void(const std::string&)> log;   ///< an event of the plug-ins or of the queue, for the system log
-        std::function<void(const Operation&, Dictionary)> finished;
+        std::function<void(protocol::Hello)> hello;
+        std::function<void(const std::string&)> log;  ///< an event of the plug-ins or of the queue, for the system log
+        std::function<void(const Operation&, Ending)> finished;
     };
 
     OperationQueue(Settings settings, Events events);
 
-    /// Whether another operation may wait.
+    /// Whether no further operation may wait.
     [[nodiscard]] bool full() const noexcept {
         const bool runsAtOnce = _state == State::idle && _waiting.empty();
         return !runsAtOnce && _waiting.size() >= _settings.limit;
@@ -60,14 +72,14 @@ class OperationQueue {
     /// Whether the first worker has said hello, or could not.
     [[nodiscard]] bool settled() const noexcept { return _settled; }
 
-    /// Answers what waits; the running operation has so long. Then no worker runs any more.
+    /// Ends what is waiting; the running operation has the time of the bound. Then no worker is started any more.
     void stop(std::chrono::milliseconds bound);
     [[nodiscard]] bool stopped() const noexcept { return _stopping && !_running; }
 
     void addTo(std::vector<pollfd>& entries) const;
     [[nodiscard]] std::optional<std::chrono::steady_clock::time_point> due() const { return _due; }
-    /// Does whatever can be done without waiting.
-    void run();
+    /// Does what can be done without waiting, after a poll of these entries: addTo() has added the queue's.
+    void run(std::span<const pollfd> polled);
 
   private:
     using Clock = std::chrono::steady_clock;
@@ -75,12 +87,20 @@ class OperationQueue {
 
     void start();
     void startFailed(const std::string& reason);
-    void take(Frame frame);
+    void converse(std::span<const pollfd> polled);
+    void receive(Frame frame);
+    /// Each returns whether the message was expected.
+    bool take(protocol::Hello hello);
+    bool take(const protocol::Log& log);
+    bool take(const Change& change);
+    bool take(const NotDone& part);
+    bool take(protocol::Answer answer);
+    void endWorker(const std::string& why);
     void workerEnded(const std::string& how);
     void timeUp();
     void next();
-    void finish(Dictionary answer);
-    void failWaiting(const char* outcome, const std::string& message);
+    void finish(Ending ending);
+    void failWaiting(Unserved::Reason reason, const std::string& message);
 
     Settings _settings;
     Events _events;
@@ -92,7 +112,7 @@ class OperationQueue {
     std::optional<Clock::time_point> _due;  ///< when timeUp() has to act
     std::chrono::milliseconds _pause{0};
     std::string _startProblem;
-    unsigned long _starts = 0;  ///< tells one worker from the next
+    unsigned long _starts = 0;  ///< distinguishes one worker from the next
     bool _settled = false;
     bool _stopping = false;
 };

@@ -20,14 +20,24 @@
 namespace adminhost {
 namespace {
 
-Value refusedFile(const DiskPath& file, const std::string& reason) {
-    return Dictionary{{"file", file.text()}, {"reason", reason}};
+protocol::RefusedPlugin refusedFile(const DiskPath& file, const std::string& reason) {
+    return {file.text(), reason};
 }
 
-/// The worker's first words, or what hinders it from speaking.
-Dictionary helloOf(const Dictionary& configuration, std::string& problem) {
+std::vector<std::string> textsOf(const Array& list) {
+    std::vector<std::string> texts;
+    for (const Value& value : list) {
+        if (value.string() != nullptr) {
+            texts.push_back(*value.string());
+        }
+    }
+    return texts;
+}
+
+/// The worker's first message. Without one the problem says why.
+protocol::Hello helloOf(const protocol::Configure& configuration, std::string& problem) {
     const auto worker = WorkerProcess::start(true);
-    if (!worker || !worker->send(FrameType::configure, configuration)) {
+    if (!worker || !worker->send(protocol::frameOf(configuration))) {
         problem = fmt::format("The worker cannot be started: {}", std::strerror(errno));
         return {};
     }
@@ -36,10 +46,11 @@ Dictionary helloOf(const Dictionary& configuration, std::string& problem) {
         worker->addTo(entries);
         ::poll(entries.data(), entries.size(), 100);
         static_cast<void>(worker->converse());
-        while (const auto frame = worker->next()) {
-            if (frame->type == FrameType::hello && frame->payload.dictionary() != nullptr) {
+        while (auto frame = worker->next()) {
+            auto message = protocol::toFront(std::move(*frame));
+            if (auto* hello = message ? std::get_if<protocol::Hello>(&*message) : nullptr) {
                 worker->finish(1000);
-                return *frame->payload.dictionary();
+                return std::move(*hello);
             }
         }
         if (worker->ending()) {
@@ -112,18 +123,18 @@ std::string privateParent(const Options& options) {
     return options.socket ? std::filesystem::temp_directory_path().string() : diskPath(options.runDirectory).text();
 }
 
-Dictionary workerConfiguration(const Options& options, const PluginSelection& plugins,
-                               const std::string& toolConfiguration) {
-    Array files;
+protocol::Configure workerConfiguration(const Options& options, const PluginSelection& plugins,
+                                        const std::string& toolConfiguration) {
+    protocol::Configure configuration;
+    configuration.build = ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY;
+    configuration.root = options.root;
     for (const DiskPath& file : plugins.files) {
-        files.emplace_back(file.text());
+        configuration.plugins.push_back(file.text());
     }
-    return {{"build", ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY},
-            {"root", options.root},
-            {"plugins", std::move(files)},
-            {"languages", options.languages ? *options.languages : languagesOfEnvironment()},
-            {"accountUuids", options.accountUuids},
-            {"environment", Dictionary{{"XDG_CONFIG_HOME", toolConfiguration}}}};
+    configuration.languages = textsOf(options.languages ? *options.languages : languagesOfEnvironment());
+    configuration.accountUuids = options.accountUuids;
+    configuration.toolEnvironment = {{"XDG_CONFIG_HOME", toolConfiguration}};
+    return configuration;
 }
 
 int check(const Options& options) {
@@ -153,25 +164,22 @@ int check(const Options& options) {
         const PluginSelection plugins = selectPlugins(options);
         const ToolConfiguration tools(std::filesystem::temp_directory_path().string());
         std::string problem;
-        const Dictionary hello = helloOf(workerConfiguration(options, plugins, tools.directory()), problem);
+        protocol::Configure configuration = workerConfiguration(options, plugins, tools.directory());
+        configuration.tryOnly = true;
+        const protocol::Hello hello = helloOf(configuration, problem);
         if (!problem.empty()) {
             problems.push_back(problem);
         }
-        Array refused = plugins.refused;
-        if (const Array* others = hello.get("refused").array()) {
-            refused.insert(refused.end(), others->begin(), others->end());
-        }
-        for (const Value& entry : refused) {
-            problems.push_back(*entry.dictionary()->get("reason").string());
-        }
-        if (const std::string* text = hello.get("databaseTool").string()) {
-            problems.push_back("Commands that need the database will be refused: " + *text);
-        }
-        if (const Array* list = hello.get("plugins").array()) {
-            for (const Value& entry : *list) {
-                loaded += fmt::format(" {} {}", *entry.dictionary()->get("name").string(),
-                                      *entry.dictionary()->get("version").string());
+        for (const auto& refused : {plugins.refused, hello.refused}) {
+            for (const protocol::RefusedPlugin& plugin : refused) {
+                problems.push_back(plugin.reason);
             }
+        }
+        if (hello.databaseTool) {
+            problems.push_back("Commands that need the database will be refused: " + *hello.databaseTool);
+        }
+        for (const protocol::OfferedPlugin& plugin : hello.plugins) {
+            loaded += fmt::format(" {} {}", plugin.name, plugin.version);
         }
         if (loaded.empty() && problems.empty()) {
             problems.push_back("There is no plug-in in " + diskPath(options.pluginDirectory).text() +

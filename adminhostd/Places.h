@@ -3,6 +3,7 @@
 // What the daemon finds on this machine: its plug-ins, its group, its directories.
 
 #include "adminhostd/Options.h"
+#include "adminhostd/Protocol.h"
 
 #include <string>
 #include <vector>
@@ -13,7 +14,7 @@ namespace adminhost {
 
 struct PluginSelection {
     std::vector<DiskPath> files;
-    Array refused;  ///< [{file, reason}]: not trustworthy, or not readable
+    std::vector<protocol::RefusedPlugin> refused;  ///< not trustworthy, or not readable
 };
 
 /// The plug-ins to load: those that were named (refused only when everybody may write them), else the plug-in
@@ -34,7 +35,7 @@ struct PluginSelection {
 [[nodiscard]] int check(const Options& options);
 
 /// What every worker is told first.
-[[nodiscard]] Dictionary workerConfiguration(const Options& options, const PluginSelection& plugins,
-                                             const std::string& toolConfiguration);
+[[nodiscard]] protocol::Configure workerConfiguration(const Options& options, const PluginSelection& plugins,
+                                                      const std::string& toolConfiguration);
 
 }  // namespace adminhost

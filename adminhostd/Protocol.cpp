@@ -9,6 +9,8 @@
 namespace adminhost::protocol {
 namespace {
 
+constexpr std::int64_t longestDeadline = 1'000'000;  ///< seconds; a longer one would overflow in computations
+
 template <class Owner, class T>
 struct Member {
     const char* name;
@@ -50,16 +52,18 @@ template <>
 constexpr auto members<ReadHistory> = std::tuple(member("readHistory.plugin", &ReadHistory::plugin),
                                                  member("readHistory.form", &ReadHistory::form));
 template <>
-constexpr auto members<DescribedCommand> = std::tuple(member("command.name", &DescribedCommand::name),
-                                                      member("command.needsDatabase", &DescribedCommand::needsDatabase),
-                                                      member("command.showsRevision", &DescribedCommand::showsRevision),
-                                                      member("command.takesRevision", &DescribedCommand::takesRevision),
-                                                      member("command.description", &DescribedCommand::description));
+constexpr auto members<Command> = std::tuple(member("command.name", &Command::name),
+                                             member("command.access", &Command::access),
+                                             member("command.showsRevision", &Command::showsRevision),
+                                             member("command.takesRevision", &Command::takesRevision),
+                                             member("command.needs", &Command::needs),
+                                             member("command.deadline", &Command::deadline),
+                                             member("command.description", &Command::description));
 template <>
-constexpr auto members<LoadedPlugin> = std::tuple(member("loaded.name", &LoadedPlugin::name),
-                                                  member("loaded.version", &LoadedPlugin::version),
-                                                  member("loaded.file", &LoadedPlugin::file),
-                                                  member("loaded.commands", &LoadedPlugin::commands));
+constexpr auto members<OfferedPlugin> = std::tuple(member("offered.name", &OfferedPlugin::name),
+                                                   member("offered.version", &OfferedPlugin::version),
+                                                   member("offered.file", &OfferedPlugin::file),
+                                                   member("offered.commands", &OfferedPlugin::commands));
 template <>
 constexpr auto members<RefusedPlugin> = std::tuple(member("refused.file", &RefusedPlugin::file),
                                                    member("refused.reason", &RefusedPlugin::reason));
@@ -105,7 +109,12 @@ constexpr Word<Outcome> outcomeWords[] = {
     {Outcome::broken, "broken"},
 };
 constexpr Word<BodyForm> formWords[] = {{BodyForm::json, "json"}, {BodyForm::propertyList, "propertyList"}};
+constexpr Word<Access> accessWords[] = {
+    {Access::read, "read"}, {Access::write, "write"}, {Access::control, "control"}, {Access::account, "account"}};
 
+constexpr auto& wordsOf(Access) {
+    return accessWords;
+}
 constexpr auto& wordsOf(Outcome) {
     return outcomeWords;
 }
@@ -133,6 +142,9 @@ Value encoded(Dictionary dictionary) {
 }
 Value encoded(Date date) {
     return date;
+}
+Value encoded(std::chrono::seconds duration) {
+    return duration.count();
 }
 Value encoded(std::optional<std::string> text) {
     return text ? Value(std::move(*text)) : Value();
@@ -198,6 +210,11 @@ class Decoder {
         const auto date = found == nullptr ? std::nullopt : found->date();
         into = date.value_or(Date());
         return date.has_value();
+    }
+    bool read(Value* found, std::chrono::seconds& into) {
+        const auto count = found == nullptr ? std::nullopt : found->integer();
+        into = std::chrono::seconds(count.value_or(0));
+        return count && *count >= 0 && *count <= longestDeadline;
     }
     bool read(Value* found, bool& into) {
         const auto boolean = found == nullptr ? std::nullopt : found->boolean();

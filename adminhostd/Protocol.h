@@ -93,20 +93,12 @@ using ToWorker = std::variant<Configure, Perform, FindAccounts, ReadHistory>;
 
 // From the worker to the front.
 
-struct DescribedCommand {
-    std::string name;
-    bool needsDatabase = false;
-    bool showsRevision = false;
-    bool takesRevision = false;
-    Dictionary description;  ///< for clients
-    bool operator==(const DescribedCommand&) const = default;
-};
-struct LoadedPlugin {
+struct OfferedPlugin {
     std::string name;
     std::string version;
     std::string file;
-    std::vector<DescribedCommand> commands;
-    bool operator==(const LoadedPlugin&) const = default;
+    std::vector<Command> commands;
+    bool operator==(const OfferedPlugin&) const = default;
 };
 struct RefusedPlugin {
     std::string file;
@@ -116,7 +108,7 @@ struct RefusedPlugin {
 
 /// The answer to Configure.
 struct Hello {
-    std::vector<LoadedPlugin> plugins;
+    std::vector<OfferedPlugin> plugins;
     std::vector<RefusedPlugin> refused;
     std::optional<std::string> databaseTool;  ///< why commands that need it are refused
     bool operator==(const Hello&) const = default;
@@ -138,6 +130,7 @@ struct Answer {
     std::string revision;            ///< after the operation; empty: not asked for, or not known
     BodyForm form = BodyForm::json;  ///< of bytes: JSON also where a property list cannot carry the answer
     std::string bytes;               ///< the whole body; the front passes it on unread
+    bool operator==(const Answer&) const = default;
 };
 
 using ToFront = std::variant<Hello, Log, Change, NotDone, Answer>;

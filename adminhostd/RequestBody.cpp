@@ -101,8 +101,8 @@ bool prefersPropertyList(std::string_view accept) {
     return list > 0 && list >= (jsonIsNamed ? json : other);
 }
 
-std::optional<Array> revisionsOf(std::string_view ifMatch) {
-    Array revisions;
+std::optional<std::vector<std::string>> revisionsOf(std::string_view ifMatch) {
+    std::vector<std::string> revisions;
     ifMatch = trimmed(ifMatch);
     if (ifMatch == "*") {
         return revisions;

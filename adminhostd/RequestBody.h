@@ -8,6 +8,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace adminhost {
 
@@ -34,6 +35,6 @@ struct BodyProblem {
 
 /// The revisions that an If-Match header lists; an empty list for "*". Returns nullopt when the header is malformed, or
 /// empty.
-[[nodiscard]] std::optional<Array> revisionsOf(std::string_view ifMatch);
+[[nodiscard]] std::optional<std::vector<std::string>> revisionsOf(std::string_view ifMatch);
 
 }  // namespace adminhost

@@ -1,16 +1,19 @@
 #include "adminhostd/Worker.h"
 
 #include "adminhostd/DatabaseTool.h"
-#include "adminhostd/Frame.h"
 #include "adminhostd/PluginCall.h"
 #include "adminhostd/PluginFile.h"
 #include "adminhostd/PluginTrial.h"
+#include "adminhostd/Protocol.h"
 #include "adminhostd/SettingsHistory.h"
 #include "platform/directory/Entries.h"
 #include "platform/directory/LocalAccounts.h"
 #include "platform/files/Path.h"
 #include "platform/files/ReplaceFile.h"
+#include "platform/framework/Report.h"
+#include "platform/json/Json.h"
 #include "platform/log/Log.h"
+#include "platform/plist/PropertyList.h"
 #include "platform/task/Task.h"
 #include "platform/value/ValueText.h"
 
@@ -18,29 +21,52 @@
 #include <chrono>
 #include <csignal>
 #include <exception>
-#include <map>
+#include <optional>
+#include <string>
+#include <utility>
 #include <vector>
 
 #include <fmt/format.h>
+#include <malloc.h>
 #include <unistd.h>
 
 namespace adminhost {
 namespace {
 
 using Clock = std::chrono::steady_clock;
+using protocol::Outcome;
 
-/// Hands every event to the front, which writes the system log and keeps the request's lines.
-class ForwardingSink final : public LogSink {
+/// Bytes of a message after which freed memory is returned to the system.
+constexpr std::size_t largeMessage = std::size_t{1} << 20U;
+
+bool send(int descriptor, protocol::ToFront message) {
+    return writeFrame(descriptor, protocol::frameOf(std::move(message)));
+}
+
+/// Passes events and reports on to the front when they happen. The front writes the system log and keeps both with the
+/// request's record. They are lost only together with the front itself.
+class ForwardingSink final : public LogSink, public ReportSink {
   public:
-    explicit ForwardingSink(int descriptor) : _descriptor(descriptor) {}
+    explicit ForwardingSink(int descriptor) : _descriptor(descriptor) {
+        setLogSink(*this);
+        setReportSink(this);
+    }
+    ForwardingSink(const ForwardingSink&) = delete;
+    ForwardingSink& operator=(const ForwardingSink&) = delete;
+    ~ForwardingSink() override {
+        setReportSink(nullptr);
+        setLogSink(standardErrorSink());
+    }
+
     void write(std::string_view event) noexcept override {
         try {
-            // Lost only together with the front itself.
-            static_cast<void>(writeFrame(_descriptor, {FrameType::log, Value(event), {}}));
+            static_cast<void>(send(_descriptor, protocol::Log{std::string(event)}));
         } catch (...) {
             return;
         }
     }
+    void changed(Change change) override { static_cast<void>(send(_descriptor, std::move(change))); }
+    void notDone(NotDone part) override { static_cast<void>(send(_descriptor, std::move(part))); }
 
   private:
     int _descriptor;
@@ -48,21 +74,23 @@ class ForwardingSink final : public LogSink {
 
 class Worker {
   public:
-    explicit Worker(int descriptor) : _descriptor(descriptor), _sink(descriptor) { setLogSink(_sink); }
-    ~Worker() { setLogSink(standardErrorSink()); }
+    explicit Worker(int descriptor) : _descriptor(descriptor), _sink(descriptor) {}
     Worker(const Worker&) = delete;
     Worker& operator=(const Worker&) = delete;
 
     int run();
 
   private:
-    Value configure(const Dictionary& configuration);
-    void load(const DiskPath& file, Array& plugins, Array& refused);
+    /// Serves one message; returns the process's exit status if it cannot go on.
+    std::optional<int> serve(protocol::ToWorker message);
+    protocol::Hello configure(const protocol::Configure& configuration);
+    void load(const DiskPath& file, protocol::Hello& hello);
     void removeLeftovers() const;
-    Value perform(const Dictionary& order);
-    Value query(const Dictionary& order);
-    static Value history(const LoadedPlugin& loaded);
-    static Value performWith(const LoadedPlugin& loaded, std::string_view command, const Dictionary& order);
+
+    protocol::Answer answer(const protocol::Perform& order);
+    protocol::Answer answer(const protocol::FindAccounts& order);
+    protocol::Answer answer(const protocol::ReadHistory& order);
+    static protocol::Answer perform(const LoadedPlugin& loaded, const protocol::Perform& order);
     [[nodiscard]] const LoadedPlugin* pluginNamed(std::string_view name) const;
 
     int _descriptor;
@@ -70,45 +98,44 @@ class Worker {
     FrameReader _reader;
     std::vector<std::string> _languages;
     std::vector<LoadedPlugin> _plugins;
+    bool _returnMemory = false;  ///< a large message has been freed
 };
 
-std::string textAt(const Dictionary& dictionary, std::string_view key) {
-    const std::string* text = dictionary.get(key).string();
-    return text == nullptr ? std::string() : *text;
+protocol::Answer broken(std::string message) {
+    protocol::Answer answer;
+    answer.outcome = Outcome::broken;
+    answer.message = std::move(message);
+    return answer;
 }
 
-constexpr std::string_view nameOf(Access access) noexcept {
-    switch (access) {
-        case Access::read:
-            return "read";
-        case Access::write:
-            return "write";
-        case Access::control:
-            return "control";
-        case Access::account:
-            break;
-    }
-    return "account";
+protocol::Answer notLoaded(const std::string& plugin) {
+    return broken("The plug-in \"" + plugin + "\" is not loaded.");
 }
 
-/// The command as clients see it.
-Dictionary describe(const Command& command) {
-    Dictionary described{{"name", command.name}};
-    for (const DictionaryEntry& entry : command.description) {
-        described.set(entry.key, entry.value);
+/// The answer's text in the form that the client wants; in JSON where a property list cannot carry it. The dictionary
+/// is dropped: an answer is in memory in one form at a time.
+protocol::Answer written(Outcome outcome, Dictionary response, BodyForm form) {
+    protocol::Answer answer;
+    answer.outcome = outcome;
+    if (outcome == Outcome::error) {
+        answer.error = response.text("error");
+        answer.message = response.text("message");
     }
-    described.set("name", command.name);
-    described.set("access", nameOf(command.access));
-    described.set("showsRevision", command.showsRevision);
-    described.set("takesRevision", command.takesRevision);
-    described.set("needs", Array(command.needs.begin(), command.needs.end()));
-    if (command.deadline.count() > 0) {
-        described.set("deadlineSeconds", command.deadline.count());
+    const Value value(std::move(response));
+    std::optional<std::string> text;
+    if (form == BodyForm::propertyList) {
+        text = xmlPropertyList(value);
     }
-    return described;
+    answer.form = text ? form : BodyForm::json;
+    answer.bytes = text ? std::move(*text) : jsonOf(value) + '\n';
+    return answer;
 }
 
-void Worker::load(const DiskPath& file, Array& plugins, Array& refused) {
+protocol::Answer errorAnswer(std::string_view code, std::string_view message, BodyForm form) {
+    return written(Outcome::error, Dictionary{{"error", code}, {"message", message}}, form);
+}
+
+void Worker::load(const DiskPath& file, protocol::Hello& hello) {
     auto loaded = loadPlugin(file);
     std::string problem = loaded ? "" : textOf(loaded.error().description);
     if (loaded && pluginNamed(loaded->name) != nullptr) {
@@ -122,17 +149,10 @@ void Worker::load(const DiskPath& file, Array& plugins, Array& refused) {
         }
     }
     if (!problem.empty()) {
-        refused.emplace_back(Dictionary{{"file", file.text()}, {"reason", problem}});
+        hello.refused.push_back({file.text(), problem});
         return;
     }
-    Array commands;
-    for (const Command& command : loaded->commands) {
-        commands.emplace_back(describe(command));
-    }
-    plugins.emplace_back(Dictionary{{"name", loaded->name},
-                                    {"version", loaded->version},
-                                    {"file", file.text()},
-                                    {"commands", std::move(commands)}});
+    hello.plugins.push_back({loaded->name, loaded->version, file.text(), loaded->commands});
     _plugins.push_back(*std::move(loaded));
 }
 
@@ -142,45 +162,27 @@ const LoadedPlugin* Worker::pluginNamed(std::string_view name) const {
     return found == _plugins.end() ? nullptr : &*found;
 }
 
-Value Worker::configure(const Dictionary& configuration) {
-    setSystemRoot(textAt(configuration, "root"));
-    if (const Array* languages = configuration.get("languages").array()) {
-        for (const Value& language : *languages) {
-            _languages.push_back(*language.string());
-        }
+protocol::Hello Worker::configure(const protocol::Configure& configuration) {
+    setSystemRoot(configuration.root);
+    _languages = configuration.languages;
+    if (!configuration.accountUuids.empty()) {
+        setDirectoryNodes({localAccounts(HostPath(configuration.accountUuids))});
     }
-    if (const std::string uuids = textAt(configuration, "accountUuids"); !uuids.empty()) {
-        setDirectoryNodes({localAccounts(HostPath(uuids))});
-    }
-    std::map<std::string, std::string> environment;
-    if (const Dictionary* variables = configuration.get("environment").dictionary()) {
-        for (const DictionaryEntry& variable : *variables) {
-            environment.emplace(variable.key, *variable.value.string());
-        }
-    }
-    setTaskEnvironment(std::move(environment));
+    setTaskEnvironment(configuration.toolEnvironment);
 
-    Array plugins;
-    Array refused;
-    if (const Array* files = configuration.get("plugins").array()) {
-        std::vector<DiskPath> paths;
-        for (const Value& file : *files) {
-            paths.emplace_back(*file.string());
-        }
-        const auto reasons = tryPlugins(paths);
-        for (std::size_t i = 0; i < paths.size(); ++i) {
-            if (reasons[i]) {
-                refused.emplace_back(Dictionary{{"file", paths[i].text()}, {"reason", *reasons[i]}});
-            } else {
-                load(paths[i], plugins, refused);
-            }
+    protocol::Hello hello;
+    const std::vector<DiskPath> files(configuration.plugins.begin(), configuration.plugins.end());
+    const auto reasons = tryPlugins(files);
+    for (std::size_t i = 0; i < files.size(); ++i) {
+        if (reasons[i]) {
+            hello.refused.push_back({files[i].text(), *reasons[i]});
+        } else {
+            load(files[i], hello);
         }
     }
-    Dictionary hello{{"plugins", std::move(plugins)}, {"refused", std::move(refused)}};
     setTaskDeadline(Clock::now() + std::chrono::seconds(5));
-    if (const auto problem = databaseToolProblem()) {
-        hello.set("databaseTool", *problem);
-    }
+    hello.databaseTool = databaseToolProblem();
+    setTaskDeadline(std::nullopt);
     return hello;
 }
 
@@ -204,88 +206,96 @@ void Worker::removeLeftovers() const {
     }
 }
 
-Value Worker::performWith(const LoadedPlugin& loaded, std::string_view command, const Dictionary& order) {
-    const Dictionary nothing;
-    const Dictionary* given = order.get("request").dictionary();
-    const Dictionary& request = given == nullptr ? nothing : *given;
+protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Perform& order) {
     Plugin& plugin = *loaded.plugin;
     const auto failed = [&](const Error& error) {
-        logEvent(fmt::format("adminhostd: {}/{} failed: {}", loaded.name, command, textOf(error.description)));
-        const char* message = "The operation failed inside the plug-in. The log lines of this request give the reason.";
-        return Dictionary{{"outcome", outcome::error},
-                          {"response", Dictionary{{"error", "INTERNAL_ERROR"}, {"message", message}}}};
+        logEvent(fmt::format("adminhostd: {}/{} failed: {}", loaded.name, order.command, textOf(error.description)));
+        return errorAnswer("INTERNAL_ERROR",
+                           "The operation failed inside the plug-in. The log lines of this request give the reason.",
+                           order.form);
     };
 
-    auto findings = callPlugin([&] { return plugin.check(command, request); });
+    auto findings = callPlugin([&] { return plugin.check(order.command, order.arguments); });
     if (!findings) {
         return failed(findings.error());
     }
+    protocol::Answer answer;
     if (!findings->empty()) {
-        Array list;
-        for (Finding& finding : *findings) {
-            list.emplace_back(Dictionary{{"keyPath", std::move(finding.keyPath)},
-                                         {"rule", std::move(finding.rule)},
-                                         {"advice", std::move(finding.advice)}});
-        }
-        return Dictionary{{"outcome", outcome::refused}, {"findings", std::move(list)}};
+        answer.outcome = Outcome::refused;
+        answer.findings = *std::move(findings);
+        return answer;
     }
-    const auto deadline =
-        Clock::now() + std::chrono::milliseconds(order.get("milliseconds").integer().value_or(std::int64_t{0}));
+    const auto deadline = Clock::now() + std::chrono::milliseconds(order.milliseconds);
     setTaskDeadline(deadline);
-    if (const Array* revisions = order.get("ifMatch").array()) {
+    if (!order.revisions.empty()) {
         const auto revision = callPlugin([&] { return plugin.revision(); });
         if (!revision) {
             return failed(revision.error());
         }
-        if (std::find(revisions->begin(), revisions->end(), Value(*revision)) == revisions->end()) {
-            return Dictionary{{"outcome", outcome::changed}, {"revision", *revision}};
+        if (std::find(order.revisions.begin(), order.revisions.end(), *revision) == order.revisions.end()) {
+            answer.outcome = Outcome::conflict;
+            return answer;
         }
     }
-    if (const Dictionary* about = order.get("keep").dictionary()) {
+    if (order.keepsHistory) {
         // A full disk must not keep an administrator from settings that may fix it: the write goes on.
         const auto files = callPlugin([&] { return plugin.settingsFiles(); });
-        const auto error = files ? keepHistory(historyDirectory(loaded.name), *files, *about) : files.error();
+        const Dictionary about{{"when", order.received},
+                               {"who", fmt::format("uid {}", order.caller.uid)},
+                               {"command", order.command},
+                               {"request", order.request}};
+        const auto error = files ? keepHistory(historyDirectory(loaded.name), *files, about) : files.error();
         if (error) {
             logEvent("adminhostd: the settings before this write could not be kept: " + textOf(*error));
         }
     }
-    auto response = callPlugin([&] { return plugin.perform(command, request); });
+    auto response = callPlugin([&] { return plugin.perform(order.command, order.arguments); });
     if (!response) {
         return failed(response.error());
     }
-    Dictionary answer;
-    if (order.get("wantsRevision") == Value(true) && response->kind() != Response::Kind::error) {
-        if (auto revision = callPlugin([&] { return plugin.revision(); })) {
-            answer.set("revision", *std::move(revision));
+    std::string revision;
+    if (order.showsRevision && response->kind() != Response::Kind::error) {
+        if (auto now = callPlugin([&] { return plugin.revision(); })) {
+            revision = *std::move(now);
         } else {
             logEvent(fmt::format("adminhostd: {} failed to give its revision: {}", loaded.name,
-                                 textOf(revision.error().description)));
+                                 textOf(now.error().description)));
         }
     }
     // A tool that was killed at the deadline makes an answer that misleads: only the overrun is reported.
     if (Clock::now() >= deadline) {
-        return Dictionary{{"outcome", outcome::overrun}};
+        answer.outcome = Outcome::overrun;
+        return answer;
     }
     switch (response->kind()) {
         case Response::Kind::nothing:
-            answer.set("outcome", outcome::nothing);
+            answer.outcome = Outcome::nothing;
             break;
         case Response::Kind::dictionary:
-            answer.set("outcome", outcome::dictionary);
+            answer = written(Outcome::answered, std::move(response->dictionary()), order.form);
             break;
         case Response::Kind::error:
-            answer.set("outcome", outcome::error);
+            answer = written(Outcome::error, std::move(response->dictionary()), order.form);
             break;
     }
-    answer.set("response", std::move(response->dictionary()));
+    answer.revision = std::move(revision);
     return answer;
 }
 
+protocol::Answer Worker::answer(const protocol::Perform& order) {
+    const LoadedPlugin* found = pluginNamed(order.plugin);
+    return found == nullptr ? notLoaded(order.plugin) : perform(*found, order);
+}
+
 /// The settings' history, narrowed to the keys that the plug-in names.
-Value Worker::history(const LoadedPlugin& loaded) {
-    const auto settings = callPlugin([&] { return loaded.plugin->settingKeys(); });
+protocol::Answer Worker::answer(const protocol::ReadHistory& order) {
+    const LoadedPlugin* found = pluginNamed(order.plugin);
+    if (found == nullptr) {
+        return notLoaded(order.plugin);
+    }
+    const auto settings = callPlugin([&] { return found->plugin->settingKeys(); });
     if (!settings) {
-        return Dictionary{{"outcome", outcome::broken}, {"message", textOf(settings.error().description)}};
+        return broken(textOf(settings.error().description));
     }
     std::vector<std::string> keys;
     std::vector<std::string> secrets;
@@ -295,47 +305,56 @@ Value Worker::history(const LoadedPlugin& loaded) {
             secrets.push_back(setting.key);
         }
     }
-    Dictionary response;
-    response.set("history", readHistory(historyDirectory(loaded.name), keys, secrets));
-    return Dictionary{{"outcome", outcome::dictionary}, {"response", std::move(response)}};
+    Dictionary response{{"history", readHistory(historyDirectory(found->name), keys, secrets)}};
+    return written(Outcome::answered, std::move(response), order.form);
 }
 
-Value Worker::query(const Dictionary& order) {
+protocol::Answer Worker::answer(const protocol::FindAccounts& order) {
     constexpr std::size_t limit = 50;
-    if (textAt(order, "query") == "history") {
-        const std::string name = textAt(order, "plugin");
-        const LoadedPlugin* found = pluginNamed(name);
-        if (found == nullptr) {
-            return Dictionary{{"outcome", outcome::broken}, {"message", "The plug-in \"" + name + "\" is not loaded."}};
-        }
-        return history(*found);
-    }
     Error error;
-    const std::string is = textAt(order, "is");
     std::optional<Array> entries =
-        is.empty() ? directoryEntries(textAt(order, "match"), limit, &error) : directoryEntriesOf(is, &error);
+        order.is.empty() ? directoryEntries(order.match, limit, &error) : directoryEntriesOf(order.is, &error);
     if (!entries) {
-        return Dictionary{{"outcome", outcome::error},
-                          {"response", Dictionary{{"error", "DIRECTORY_UNAVAILABLE"}, {"message", textOf(error)}}}};
+        return errorAnswer("DIRECTORY_UNAVAILABLE", textOf(error), order.form);
     }
-    Dictionary response;
-    response.set("entries", std::move(*entries));
-    return Dictionary{{"outcome", outcome::dictionary}, {"response", std::move(response)}};
+    return written(Outcome::answered, Dictionary{{"entries", std::move(*entries)}}, order.form);
 }
 
-Value Worker::perform(const Dictionary& order) {
-    const std::string name = textAt(order, "plugin");
-    try {
-        if (order.contains("query")) {
-            return query(order);
+std::optional<int> Worker::serve(protocol::ToWorker message) {
+    if (const auto* configuration = std::get_if<protocol::Configure>(&message)) {
+        if (configuration->build != ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY) {
+            logEvent("adminhostd: the worker is of another release than the daemon; restart the daemon");
+            return 1;
         }
-        if (const LoadedPlugin* found = pluginNamed(name)) {
-            return performWith(*found, textAt(order, "command"), order);
+        if (!send(_descriptor, configure(*configuration))) {
+            return 1;
         }
-        return Dictionary{{"outcome", outcome::broken}, {"message", "The plug-in \"" + name + "\" is not loaded."}};
-    } catch (const std::exception& exception) {
-        return Dictionary{{"outcome", outcome::broken}, {"message", exception.what()}};
+        if (!configuration->tryOnly) {
+            // Only now: a shared file system that hangs may hold up requests, but not the start.
+            removeLeftovers();
+        }
+        return std::nullopt;
     }
+    protocol::Answer answered;
+    try {
+        answered = std::visit(
+            [&]<class Order>(const Order& order) {
+                if constexpr (std::is_same_v<Order, protocol::Configure>) {
+                    return broken({});
+                } else {
+                    return answer(order);
+                }
+            },
+            message);
+    } catch (const std::exception& exception) {
+        answered = broken(exception.what());
+    }
+    setTaskDeadline(std::nullopt);
+    const Frame frame = protocol::frameOf(std::move(answered));
+    _returnMemory |= frame.bytes.size() >= largeMessage;
+    const bool sent =
+        writeFrame(_descriptor, frame) || send(_descriptor, broken("The answer is too large to be sent."));
+    return sent ? std::nullopt : std::optional(1);
 }
 
 int Worker::run() {
@@ -345,35 +364,22 @@ int Worker::run() {
     }
     prepareForTasks();
     for (;;) {
-        const auto frame = readFrame(_descriptor, _reader);
+        auto frame = readFrame(_descriptor, _reader);
         if (!frame) {
             return 0;
         }
-        const Dictionary* payload = frame->payload.dictionary();
-        if (payload == nullptr) {
+        _returnMemory |= frame->size >= largeMessage;
+        auto message = protocol::toWorker(std::move(*frame));
+        if (!message) {
+            logEvent("adminhostd: the worker was sent what it cannot read: " + textOf(message.error().description));
             return 1;
         }
-        bool sent = false;
-        if (frame->type == FrameType::configure) {
-            if (textAt(*payload, "build") != ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY) {
-                logEvent("adminhostd: the worker is of another release than the daemon; restart the daemon");
-                return 1;
-            }
-            sent = writeFrame(_descriptor, {FrameType::hello, configure(*payload), {}});
-            // Only now: a shared file system that hangs may hold up requests, never the start.
-            removeLeftovers();
-        } else if (frame->type == FrameType::perform) {
-            sent = writeFrame(_descriptor, {FrameType::answer, perform(*payload), {}});
-            setTaskDeadline(std::nullopt);
-            if (!sent) {
-                const char* message = "The answer is too large to be sent.";
-                sent =
-                    writeFrame(_descriptor,
-                               {FrameType::answer, Dictionary{{"outcome", outcome::broken}, {"message", message}}, {}});
-            }
+        if (const auto status = serve(*std::move(message))) {
+            return *status;
         }
-        if (!sent) {
-            return 1;
+        if (_returnMemory) {
+            ::malloc_trim(0);
+            _returnMemory = false;
         }
     }
 }

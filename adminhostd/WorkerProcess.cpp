@@ -2,6 +2,7 @@
 
 #include "platform/task/StartChild.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstring>
@@ -29,6 +30,11 @@ std::string workerProgram() {
     const std::string directory = self.substr(0, self.rfind('/') + 1);
     std::string beside = directory + "adminhostd-worker";
     return ::access(beside.c_str(), X_OK) == 0 ? beside : directory + "../lib/adminhostd/adminhostd-worker";
+}
+
+bool isReady(std::span<const pollfd> polled, int descriptor) noexcept {
+    return std::any_of(polled.begin(), polled.end(),
+                       [&](const pollfd& entry) { return entry.fd == descriptor && entry.revents != 0; });
 }
 
 }  // namespace
@@ -73,11 +79,20 @@ void WorkerProcess::addTo(std::vector<pollfd>& entries) const {
     entries.push_back({_process.get(), POLLIN, 0});
 }
 
-bool WorkerProcess::send(FrameType type, const Value& payload) {
-    auto bytes = encodeFrame({type, payload, {}});
+bool WorkerProcess::mayConverse(std::span<const pollfd> polled) const noexcept {
+    return !_closed && isReady(polled, _socket.get());
+}
+
+bool WorkerProcess::mayHaveEnded(std::span<const pollfd> polled) const noexcept {
+    return _ending || !_process.isOpen() || isReady(polled, _process.get());
+}
+
+bool WorkerProcess::send(const Frame& frame) {
+    auto bytes = encodeFrame(frame);
     if (!bytes) {
         return false;
     }
+    *bytes += frame.bytes;
     if (_unsent.empty()) {
         _unsent = std::move(*bytes);
     } else {
@@ -115,6 +130,7 @@ bool WorkerProcess::converse() {
         const ssize_t count = ::recv(_socket.get(), buffer, sizeof buffer, 0);
         if (count > 0) {
             _reader.append({buffer, static_cast<std::size_t>(count)});
+            ::explicit_bzero(buffer, static_cast<std::size_t>(count));
             taken += static_cast<std::size_t>(count);
             if (static_cast<std::size_t>(count) < sizeof buffer) {
                 return false;

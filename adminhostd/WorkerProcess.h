@@ -7,6 +7,7 @@
 
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <vector>
 
@@ -31,8 +32,12 @@ class WorkerProcess {
     /// What to poll for: first the conversation, then the end of the process.
     void addTo(std::vector<pollfd>& entries) const;
 
-    /// Queues a frame and sends what can be sent. False when it is too large for a frame.
-    [[nodiscard]] bool send(FrameType type, const Value& payload);
+    /// After a poll of these entries: whether converse() has something to do, and whether the process may have ended.
+    [[nodiscard]] bool mayConverse(std::span<const pollfd> polled) const noexcept;
+    [[nodiscard]] bool mayHaveEnded(std::span<const pollfd> polled) const noexcept;
+
+    /// Queues a frame and sends what can be sent. Returns false if it is too large.
+    [[nodiscard]] bool send(const Frame& frame);
     /// Reads and writes what can be done without waiting, but not without end: returns true if there may be more to
     /// read at once.
     bool converse();

@@ -39,6 +39,8 @@ struct Command {
     std::chrono::seconds deadline{};  ///< its own bound; zero: the daemon's
     /// For clients: summary, keys, answer, errors, example (commands/README.md). The host adds the members above.
     Dictionary description;
+
+    bool operator==(const Command&) const = default;
 };
 
 /// One reason why a whole request is refused.
@@ -46,6 +48,8 @@ struct Finding {
     std::string keyPath;  ///< "configuration.cameras.0.name"
     std::string rule;     ///< what is wrong
     std::string advice;   ///< how to fix it
+
+    bool operator==(const Finding&) const = default;
 };
 
 /// Whether something that commands need is usable. Unknown (time-out, no memory) is not unusable: a client may send the

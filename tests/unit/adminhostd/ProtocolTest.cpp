@@ -2,19 +2,7 @@
 
 #include <gtest/gtest.h>
 
-namespace adminhost {
-
-static bool operator==(const Finding& a, const Finding& b) {
-    return std::tie(a.keyPath, a.rule, a.advice) == std::tie(b.keyPath, b.rule, b.advice);
-}
-
-namespace protocol {
-
-static bool operator==(const Answer& a, const Answer& b) {
-    return std::tie(a.outcome, a.error, a.message, a.findings, a.revision, a.form, a.bytes) ==
-           std::tie(b.outcome, b.error, b.message, b.findings, b.revision, b.form, b.bytes);
-}
-
+namespace adminhost::protocol {
 namespace {
 
 using namespace std::chrono_literals;
@@ -61,7 +49,10 @@ std::vector<ToFront> messagesToFront() {
         Hello{.plugins = {{.name = "p",
                            .version = "1",
                            .file = "/p.so",
-                           .commands = {{"c", true, true, true, Dictionary{{"summary", "s"}}}, {"d", {}, {}, {}, {}}}}},
+                           .commands = {{"c", Access::control, true, true, {"n"}, 5s, Dictionary{{"summary", "s"}}},
+                                        {"d", Access::read, {}, {}, {}, {}, {}},
+                                        {"e", Access::write, {}, {}, {}, {}, {}},
+                                        {"f", Access::account, {}, {}, {}, {}, {}}}}},
               .refused = {{"/q.so", "why"}},
               .databaseTool = "none"},
         Hello{},
@@ -213,5 +204,4 @@ TEST(Protocol, EachSingleBitChangeIsRejectedOrIsAnotherValidMessage) {
 }
 
 }  // namespace
-}  // namespace protocol
-}  // namespace adminhost
+}  // namespace adminhost::protocol

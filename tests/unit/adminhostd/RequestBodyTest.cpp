@@ -76,11 +76,12 @@ TEST(PrefersPropertyList, WeighsWhatIsAcceptedAndTakesTheFirstOfEquals) {
 }
 
 TEST(RevisionsOf, ReadsAListOfQuotedTexts) {
+    using Texts = std::vector<std::string>;
     EXPECT_EQ(revisionsOf(""), std::nullopt);
     EXPECT_EQ(revisionsOf(" "), std::nullopt);
-    EXPECT_EQ(revisionsOf("*"), Array{});
-    EXPECT_EQ(revisionsOf("\"a\""), Array{Value("a")});
-    EXPECT_EQ(revisionsOf(" \"a\" ,\"b,c\" "), (Array{Value("a"), Value("b,c")}));
+    EXPECT_EQ(revisionsOf("*"), Texts{});
+    EXPECT_EQ(revisionsOf("\"a\""), Texts{"a"});
+    EXPECT_EQ(revisionsOf(" \"a\" ,\"b,c\" "), (Texts{"a", "b,c"}));
     for (const char* text : {"a", "\"a", "\"a\" \"b\"", "W/\"a\"", "\"", "*, \"a\""}) {
         EXPECT_EQ(revisionsOf(text), std::nullopt) << text;
     }

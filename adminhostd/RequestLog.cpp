@@ -1,0 +1,143 @@
+#include "adminhostd/RequestLog.h"
+
+#include "platform/value/ValueCodec.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace adminhost {
+namespace {
+
+char lowerCase(char c) noexcept {
+    return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+}
+
+bool sameId(std::string_view a, std::string_view b) noexcept {
+    return std::equal(a.begin(), a.end(), b.begin(), b.end(),
+                      [](char x, char y) { return lowerCase(x) == lowerCase(y); });
+}
+
+Value countOrNull(std::size_t count) {
+    return count == 0 ? Value() : Value(count);
+}
+
+}  // namespace
+
+void RequestRecord::add(std::string_view event) {
+    if (_logBytes + event.size() > logMaximum) {
+        ++_logDropped;
+        return;
+    }
+    _logBytes += event.size();
+    _log.emplace_back(event);
+}
+
+void RequestRecord::add(const Change& change) {
+    keep(_changes, Dictionary{{"section", change.section},
+                              {"identity", change.identity},
+                              {"name", change.name},
+                              {"key", change.key},
+                              {"from", change.from},
+                              {"to", change.to},
+                              {"secret", change.secret},
+                              {"undo", change.undo}});
+}
+
+void RequestRecord::add(const NotDone& part) {
+    keep(_notDone, Dictionary{{"keyPath", part.keyPath}, {"reason", part.reason}, {"toolMessage", part.toolMessage}});
+}
+
+void RequestRecord::keep(Reports& reports, Dictionary report) {
+    ++reports.reported;
+    std::string bytes;
+    if (reports.kept.size() < reportsMaximum) {
+        encodeValue(report, bytes);
+    }
+    if (reports.kept.size() == reportsMaximum || _reportBytes + bytes.size() > reportBytesMaximum) {
+        return;
+    }
+    _reportBytes += bytes.size();
+    reports.kept.emplace_back(std::move(report));
+}
+
+Dictionary RequestRecord::describe(bool withReports) const {
+    constexpr const char* names[] = {"waiting", "running", "done"};
+    Dictionary text{{"request", id},       {"state", names[static_cast<int>(state)]},
+                    {"plugin", plugin},    {"command", command},
+                    {"uid", peer.uid},     {"pid", peer.pid},
+                    {"received", received}};
+    if (state == State::running) {
+        text.set("since", since);
+    }
+    if (state == State::done) {
+        text.set("milliseconds", milliseconds);
+        text.set("status", status);
+        text.set("error", error.empty() ? Value() : Value(error));
+    }
+    text.set("log", _log);
+    text.set("logLinesDropped", countOrNull(_logDropped));
+    if (withReports) {
+        text.set("changes", _changes.kept);
+        text.set("changesDropped", countOrNull(_changes.reported - _changes.kept.size()));
+        text.set("notDone", _notDone.kept);
+        text.set("notDoneDropped", countOrNull(_notDone.reported - _notDone.kept.size()));
+    }
+    return text;
+}
+
+std::shared_ptr<RequestRecord> RequestLog::begin(const Exchange& exchange) {
+    auto record = std::make_shared<RequestRecord>();
+    record->id = exchange.id();
+    record->peer = exchange.peer();
+    record->received = std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now());
+    record->arrival = std::chrono::steady_clock::now();
+    return record;
+}
+
+std::shared_ptr<RequestRecord> RequestLog::add(const Exchange& exchange) {
+    auto record = begin(exchange);
+    add(record);
+    return record;
+}
+
+void RequestLog::add(std::shared_ptr<RequestRecord> record) {
+    _records.push_back(std::move(record));
+    std::size_t bytes = 0;
+    for (const auto& one : _records) {
+        bytes += one->reportBytes();
+    }
+    while (_records.size() > length || bytes > reportBytesMaximum) {
+        bytes -= _records.front()->reportBytes();
+        _records.pop_front();
+    }
+}
+
+const RequestRecord* RequestLog::find(std::string_view id) const {
+    const auto found =
+        std::find_if(_records.begin(), _records.end(), [&](const auto& record) { return sameId(record->id, id); });
+    return found == _records.end() ? nullptr : found->get();
+}
+
+bool RequestLog::use(std::string_view id) {
+    std::string key(id);
+    std::transform(key.begin(), key.end(), key.begin(), lowerCase);
+    if (!_used.insert(key).second) {
+        return false;
+    }
+    _usedInOrder.push_back(std::move(key));
+    if (_usedInOrder.size() > usedMaximum) {
+        _used.erase(_usedInOrder.front());
+        _usedInOrder.pop_front();
+    }
+    return true;
+}
+
+bool isCanonicalUuid(std::string_view text) noexcept {
+    constexpr std::string_view form = "00000000-0000-0000-0000-000000000000";
+    return std::equal(text.begin(), text.end(), form.begin(), form.end(), [](char c, char wanted) {
+        const char lower = lowerCase(c);
+        return wanted == '-' ? c == '-' : (lower >= '0' && lower <= '9') || (lower >= 'a' && lower <= 'f');
+    });
+}
+
+}  // namespace adminhost

@@ -1,0 +1,97 @@
+#pragma once
+
+// What the daemon remembers of the latest requests for operations.
+
+#include "adminhostd/Http.h"
+#include "platform/framework/Report.h"
+#include "platform/value/Value.h"
+
+#include <chrono>
+#include <cstddef>
+#include <deque>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <unordered_set>
+#include <vector>
+
+namespace adminhost {
+
+/// One request, from its arrival on. Of the values in requests and answers it holds those that are reported as changed,
+/// never a secret.
+struct RequestRecord {
+    enum class State { waiting, running, done };
+
+    static constexpr std::size_t logMaximum = std::size_t{64} << 10U;  ///< bytes of a request's events
+    static constexpr std::size_t reportsMaximum = 1000;                ///< of each kind
+    static constexpr std::size_t reportBytesMaximum = std::size_t{4} << 20U;
+
+    std::string id;
+    std::string plugin;
+    std::string command;
+    Peer peer;
+    State state = State::waiting;
+    Date received;
+    std::chrono::steady_clock::time_point arrival;
+    Date since;  ///< when it began to run
+    std::chrono::steady_clock::time_point start;
+    double milliseconds = 0;  ///< from arrival to answer
+    unsigned status = 0;
+    std::string error;  ///< the code of an answer that is an error
+
+    // Beyond the bounds above, events and reports are only counted.
+    void add(std::string_view event);
+    void add(const Change& change);
+    void add(const NotDone& part);
+
+    /// How many were reported, including those that were not kept.
+    [[nodiscard]] std::size_t changes() const noexcept { return _changes.reported; }
+    [[nodiscard]] std::size_t notDone() const noexcept { return _notDone.reported; }
+    [[nodiscard]] std::size_t reportBytes() const noexcept { return _reportBytes; }
+
+    /// The form that clients get. The reports are for the account that sent the request, and for those that may read
+    /// every request's.
+    [[nodiscard]] Dictionary describe(bool withReports) const;
+
+  private:
+    struct Reports {
+        Array kept;
+        std::size_t reported = 0;
+    };
+    void keep(Reports& reports, Dictionary report);
+
+    Array _log;
+    std::size_t _logBytes = 0;
+    std::size_t _logDropped = 0;
+    Reports _changes;
+    Reports _notDone;
+    std::size_t _reportBytes = 0;
+};
+
+class RequestLog {
+  public:
+    static constexpr std::size_t length = 200;
+    static constexpr std::size_t reportBytesMaximum = std::size_t{64} << 20U;  ///< of all records together
+    static constexpr std::size_t usedMaximum = 10'000;  ///< ids of clients that are not accepted again
+
+    /// A record that is not remembered.
+    [[nodiscard]] static std::shared_ptr<RequestRecord> begin(const Exchange& exchange);
+    /// Begins a record. The oldest one is forgotten, and more of them if their reports take too much memory.
+    std::shared_ptr<RequestRecord> add(const Exchange& exchange);
+    void add(std::shared_ptr<RequestRecord> record);
+    /// Upper and lower case are one in an id.
+    [[nodiscard]] const RequestRecord* find(std::string_view id) const;
+
+    /// Marks a client's id as used. Returns false if it was already.
+    [[nodiscard]] bool use(std::string_view id);
+
+  private:
+    std::deque<std::shared_ptr<RequestRecord>> _records;
+    std::deque<std::string> _usedInOrder;
+    std::unordered_set<std::string> _used;
+};
+
+/// Whether a text is a UUID in its canonical form: 32 hexadecimal digits of either case with hyphens (8-4-4-4-12).
+[[nodiscard]] bool isCanonicalUuid(std::string_view text) noexcept;
+
+}  // namespace adminhost

@@ -1,0 +1,99 @@
+#include "adminhostd/RequestLog.h"
+
+#include <gtest/gtest.h>
+
+namespace adminhost {
+namespace {
+
+Change change(std::size_t bytes) {
+    return {"settings", "", "", "key", Value(), std::string(bytes, 'x'), false, Value()};
+}
+
+std::size_t sizeOf(const Dictionary& text, std::string_view key) {
+    return text.get(key).array() == nullptr ? 0 : text.get(key).array()->size();
+}
+
+TEST(RequestRecord, ReportsAreShownToThoseWhoMayReadThemOnly) {
+    RequestRecord record;
+    record.add(change(1));
+    record.add(NotDone{"configuration.a", "It is not known.", ""});
+    record.add(std::string_view("an event"));
+    EXPECT_EQ(sizeOf(record.describe(true), "changes"), 1U);
+    EXPECT_EQ(sizeOf(record.describe(true), "notDone"), 1U);
+    const Dictionary others = record.describe(false);
+    EXPECT_FALSE(others.contains("changes"));
+    EXPECT_FALSE(others.contains("notDone"));
+    EXPECT_EQ(sizeOf(others, "log"), 1U);
+}
+
+TEST(RequestRecord, LargeReportsAreCountedOnlyBeyondTheirBound) {
+    RequestRecord record;
+    for (int i = 0; i < 6; ++i) {
+        record.add(change(1'000'000));
+    }
+    record.add(change(1));
+    EXPECT_EQ(record.changes(), 7U);
+    EXPECT_EQ(sizeOf(record.describe(true), "changes"), 5U) << "four large ones and the small one";
+    EXPECT_EQ(record.describe(true).get("changesDropped"), Value(2));
+    EXPECT_LE(record.reportBytes(), RequestRecord::reportBytesMaximum);
+}
+
+std::shared_ptr<RequestRecord> recordNamed(const std::string& id) {
+    auto record = std::make_shared<RequestRecord>();
+    record->id = id;
+    return record;
+}
+
+TEST(RequestLog, ForgetsTheOldestBeyondItsLength) {
+    RequestLog log;
+    for (std::size_t i = 0; i <= RequestLog::length; ++i) {
+        log.add(recordNamed(std::to_string(i)));
+    }
+    EXPECT_EQ(log.find("0"), nullptr);
+    EXPECT_NE(log.find("1"), nullptr);
+    EXPECT_NE(log.find(std::to_string(RequestLog::length)), nullptr);
+}
+
+TEST(RequestLog, ForgetsTheOldestWhenTheReportsOfAllTakeTooMuchMemory) {
+    RequestLog log;
+    for (int i = 0; i < 30; ++i) {
+        auto record = recordNamed(std::to_string(i));
+        log.add(record);
+        for (int k = 0; k < 4; ++k) {
+            record->add(change(1'000'000));
+        }
+    }
+    log.add(recordNamed("last"));
+    EXPECT_EQ(log.find("0"), nullptr);
+    EXPECT_NE(log.find("29"), nullptr);
+    EXPECT_NE(log.find("last"), nullptr);
+}
+
+TEST(RequestLog, IdIsUsedOnceInAnyCase) {
+    RequestLog log;
+    EXPECT_TRUE(log.use("6ba7b810-9dad-11d1-80b4-00c04fd430c8"));
+    EXPECT_FALSE(log.use("6BA7B810-9DAD-11D1-80B4-00C04FD430C8"));
+    EXPECT_TRUE(log.use("6ba7b811-9dad-11d1-80b4-00c04fd430c8"));
+}
+
+TEST(RequestLog, OldestUsedIdIsForgottenBeyondTheBound) {
+    RequestLog log;
+    for (std::size_t i = 0; i <= RequestLog::usedMaximum; ++i) {
+        EXPECT_TRUE(log.use(std::to_string(i)));
+    }
+    EXPECT_FALSE(log.use("1"));
+    EXPECT_TRUE(log.use("0"));
+}
+
+TEST(IsCanonicalUuid, AcceptsOneFormInEitherCase) {
+    EXPECT_TRUE(isCanonicalUuid("6ba7b810-9dad-11d1-80b4-00c04fd430c8"));
+    EXPECT_TRUE(isCanonicalUuid("6BA7B810-9DAD-11D1-80B4-00C04FD430C8"));
+    EXPECT_FALSE(isCanonicalUuid(""));
+    EXPECT_FALSE(isCanonicalUuid("6ba7b8109dad11d180b400c04fd430c8"));
+    EXPECT_FALSE(isCanonicalUuid("6ba7b810-9dad-11d1-80b4-00c04fd430c8 "));
+    EXPECT_FALSE(isCanonicalUuid("6ba7b810-9dad-11d1-80b4-00c04fd430cg"));
+    EXPECT_FALSE(isCanonicalUuid("6ba7b810-9dad-11d1-80b4-00c04fd430c"));
+}
+
+}  // namespace
+}  // namespace adminhost
