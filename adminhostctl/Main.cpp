@@ -9,6 +9,7 @@
 #include "adminhostctl/Verb.h"
 #include "adminhostctl/desired/DesiredVerbs.h"
 #include "adminhostctl/lumio/LumioVerbs.h"
+#include "platform/files/StandardDescriptors.h"
 
 #include <algorithm>
 #include <cstdlib>
@@ -114,6 +115,10 @@ int runMain(int count, char** words) {
 }  // namespace
 
 int main(int count, char** words) {
+    // Without this a password could be read from the connection's own socket.
+    if (!adminhost::openStandardDescriptors()) {
+        return statusOf(ExitStatus::answeredError);
+    }
     try {
         return runMain(count, words);
     } catch (const std::exception& error) {
