@@ -1,14 +1,18 @@
 #include "adminhostd/Options.h"
+#include "platform/files/File.h"
 
 #include <cmath>
 #include <sstream>
 #include <stdexcept>
+#include <system_error>
 
 #include <fmt/format.h>
 #include <toml++/toml.h>
 
 namespace adminhost {
 namespace {
+
+constexpr std::size_t configurationMaximum = std::size_t{1} << 20U;  ///< bytes
 
 /// One key of the file, with the place for messages.
 struct Entry {
@@ -18,7 +22,7 @@ struct Entry {
 
     [[noreturn]] void fail(std::string_view expected) const {
         throw std::runtime_error(
-            fmt::format("{}, line {}: \"{}\" takes {}", file, node.source().begin.line, key, expected));
+            fmt::format("{}, line {}: \"{}\" must be {}", file, node.source().begin.line, key, expected));
     }
     [[nodiscard]] std::string text() const {
         const auto value = node.value_exact<std::string>();
@@ -42,7 +46,7 @@ struct Entry {
     [[nodiscard]] double seconds() const {
         const auto value = node.is_number() ? node.value<double>() : std::nullopt;
         if (!value || !std::isfinite(*value) || *value <= 0 || *value > 86'400) {
-            fail("seconds, above 0 and at most 86400");
+            fail("a number of seconds, above 0 and at most 86400");
         }
         return *value;
     }
@@ -83,7 +87,7 @@ void apply(const Entry& entry, Options& options) {
         options.logToStandardError = text == "stderr";
     } else {
         throw std::runtime_error(
-            fmt::format("{}, line {}: there is no key \"{}\"; known keys: plugins, plugin_directory, socket, "
+            fmt::format("{}, line {}: unknown key \"{}\"; known keys: plugins, plugin_directory, socket, "
                         "socket_group, languages, account_uuids, "
                         "request_deadline_seconds, client_timeout_seconds, queue_limit, log",
                         entry.file, entry.node.source().begin.line, entry.key));
@@ -93,9 +97,16 @@ void apply(const Entry& entry, Options& options) {
 }  // namespace
 
 void readConfiguration(const std::string& file, Options& options) {
+    Error unreadable;
+    // The parser would read a directory, or what fails while it is read, as an empty file.
+    const auto text = readFile(DiskPath(file), configurationMaximum, &unreadable);
+    if (!text) {
+        throw std::runtime_error(fmt::format("{}: {}; the configuration must be a readable file", file,
+                                             std::generic_category().message(static_cast<int>(unreadable.code))));
+    }
     toml::table table;
     try {
-        table = toml::parse_file(file);
+        table = toml::parse(*text, file);
     } catch (const toml::parse_error& error) {
         const auto place = error.source().begin;
         throw std::runtime_error(

@@ -1,10 +1,10 @@
 #include "adminhostd/ListeningSocket.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstdlib>
 #include <cstring>
-#include <filesystem>
 #include <stdexcept>
 #include <thread>
 
@@ -26,36 +26,31 @@ namespace {
     fail(text + ": " + std::strerror(errno));
 }
 
+constexpr std::size_t pathMaximum = sizeof(sockaddr_un::sun_path) - 1;
+
 sockaddr_un addressOf(const std::string& path) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
-    if (path.empty() || path.size() >= sizeof address.sun_path) {
-        fail(fmt::format("the socket's path {} must have 1 to {} bytes; choose a shorter one", path,
-                         sizeof address.sun_path - 1));
-    }
-    std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+    std::memcpy(address.sun_path, path.data(), std::min(path.size(), pathMaximum));
     return address;
 }
 
 FileDescriptor newSocket() {
     FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
     if (!socket.isOpen()) {
-        failWithErrno("cannot make a socket");
+        failWithErrno("cannot create a socket");
     }
     return socket;
 }
 
-void refuseWhatIsInTheWay(const std::string& path, const sockaddr_un& address) {
+void refuseLivingDaemon(const std::string& path, const sockaddr_un& address) {
     struct stat status {};
     if (::lstat(path.c_str(), &status) != 0) {
         return;
     }
-    if (const auto problem = inTheWay(path)) {
-        fail(*problem);
-    }
     const FileDescriptor probe = newSocket();
     const int connected = ::connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
-    // A daemon whose backlog is full answers EAGAIN; it lives all the same.
+    // EAGAIN comes from a living daemon whose backlog is full.
     if (connected == 0 || errno == EAGAIN) {
         fail("another daemon serves " + path + "; stop it or choose another path");
     }
@@ -64,32 +59,67 @@ void refuseWhatIsInTheWay(const std::string& path, const sockaddr_un& address) {
     }
 }
 
-/// Whoever may read the directory may lock it: nobody is waited for without end.
-void waitForLock(int directory, const std::string& path) {
-    for (int tries = 0; ::flock(directory, LOCK_EX | LOCK_NB) != 0; ++tries) {
-        if (errno != EWOULDBLOCK && errno != EINTR) {
-            failWithErrno("cannot lock the directory of the socket " + path);
-        }
-        if (tries == 100) {
-            fail("another process holds a lock on the directory of the socket " + path +
-                 "; end it (fuser names it) or choose another path");
-        }
-        std::this_thread::sleep_for(std::chrono::milliseconds(50));
-    }
-}
-
-/// The private directory in which the socket is made.
-class Cradle {
+/// Held while the socket is created: of two daemons that start at once, the second waits and then finds the first.
+/// The locked file is beside the socket and private. A directory could be locked by any account that may read it.
+class StartLock {
   public:
-    explicit Cradle(const std::string& parent) : _path(parent + "/.adminhostd.XXXXXX") {
+    explicit StartLock(const std::string& socketPath) : _path(socketPath + ".lock") {
+        for (int tries = 0; !(open() && lock() && isInPlace()); ++tries) {
+            if (tries == 100) {
+                fail("another process holds a lock on " + _path + "; end it (fuser prints its process id)");
+            }
+            std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        }
+    }
+    StartLock(const StartLock&) = delete;
+    StartLock& operator=(const StartLock&) = delete;
+    ~StartLock() { ::unlink(_path.c_str()); }
+
+  private:
+    bool open() {
+        _file = FileDescriptor(::open(_path.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600));
+        struct stat status {};
+        if (!_file.isOpen() || ::fstat(_file.get(), &status) != 0) {
+            failWithErrno("cannot create " + _path);
+        }
+        if (!S_ISREG(status.st_mode) || status.st_uid != ::geteuid() || (status.st_mode & 077U) != 0) {
+            fail(_path + " is not a private file of this account; remove it");
+        }
+        return true;
+    }
+    bool lock() {
+        if (::flock(_file.get(), LOCK_EX | LOCK_NB) == 0) {
+            return true;
+        }
+        if (errno != EWOULDBLOCK && errno != EINTR) {
+            failWithErrno("cannot lock " + _path);
+        }
+        return false;
+    }
+    /// The daemon that held the lock before has removed its file at the end.
+    bool isInPlace() const {
+        struct stat ours {};
+        struct stat there {};
+        return ::fstat(_file.get(), &ours) == 0 && ::lstat(_path.c_str(), &there) == 0 && ours.st_dev == there.st_dev &&
+               ours.st_ino == there.st_ino;
+    }
+
+    std::string _path;
+    FileDescriptor _file;
+};
+
+/// The directory in which the socket is created.
+class PrivateDirectory {
+  public:
+    explicit PrivateDirectory(const std::string& parent) : _path(parent + "/.adminhostd.XXXXXX") {
         if (::mkdtemp(_path.data()) == nullptr) {
             failWithErrno("cannot write in " + parent);
         }
         _directory = FileDescriptor(::open(_path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
     }
-    Cradle(const Cradle&) = delete;
-    Cradle& operator=(const Cradle&) = delete;
-    ~Cradle() {
+    PrivateDirectory(const PrivateDirectory&) = delete;
+    PrivateDirectory& operator=(const PrivateDirectory&) = delete;
+    ~PrivateDirectory() {
         ::unlink(socketPath().c_str());
         ::rmdir(_path.c_str());
     }
@@ -105,36 +135,36 @@ class Cradle {
 
 }  // namespace
 
-std::optional<std::string> inTheWay(const std::string& path) {
-    struct stat status {};
-    if (::lstat(path.c_str(), &status) != 0 || S_ISSOCK(status.st_mode)) {
-        return std::nullopt;
+std::optional<std::string> socketPathProblem(const std::string& path) {
+    if (path.empty() || path.size() > pathMaximum) {
+        return fmt::format("the socket path {} must have 1 to {} bytes; choose a shorter one", path, pathMaximum);
     }
-    return path + " is there already and is no socket; remove it or choose another path";
+    struct stat status {};
+    if (::lstat(path.c_str(), &status) == 0 && !S_ISSOCK(status.st_mode)) {
+        return path + " exists and is not a socket; remove it or choose another path";
+    }
+    return std::nullopt;
 }
 
 ListeningSocket::ListeningSocket(std::string path, gid_t group) : _path(std::move(path)) {
-    const sockaddr_un address = addressOf(_path);
+    if (const auto problem = socketPathProblem(_path)) {
+        fail(*problem);
+    }
     const std::size_t slash = _path.rfind('/');
     const std::string parent = slash == std::string::npos ? "." : slash == 0 ? "/" : _path.substr(0, slash);
-    // Two daemons that start at once take their turn here.
-    const FileDescriptor lock(::open(parent.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (!lock.isOpen()) {
-        failWithErrno("cannot use the directory of the socket " + _path);
-    }
-    waitForLock(lock.get(), _path);
-    refuseWhatIsInTheWay(_path, address);
+    const StartLock lock(_path);
+    refuseLivingDaemon(_path, addressOf(_path));
 
-    const Cradle cradle(parent);
-    const std::string place = cradle.socketPath();
-    const sockaddr_un placeAddress = addressOf(cradle.shortPath());
+    const PrivateDirectory directory(parent);
+    const std::string place = directory.socketPath();
+    const sockaddr_un placeAddress = addressOf(directory.shortPath());
     _socket = newSocket();
     struct stat status {};
     if (::bind(_socket.get(), reinterpret_cast<const sockaddr*>(&placeAddress), sizeof placeAddress) != 0 ||
         (group != sameGroup && ::lchown(place.c_str(), static_cast<uid_t>(-1), group) != 0) ||
         ::chmod(place.c_str(), 0660) != 0 || ::listen(_socket.get(), SOMAXCONN) != 0 ||
         ::lstat(place.c_str(), &status) != 0 || ::rename(place.c_str(), _path.c_str()) != 0) {
-        failWithErrno("cannot make the socket " + _path);
+        failWithErrno("cannot create the socket " + _path);
     }
     _device = status.st_dev;
     _inode = status.st_ino;

@@ -11,18 +11,18 @@
 
 namespace adminhost {
 
-/// What stands in the way of a socket at the path, with the mend: a file that is no socket. Nothing for a free path and
-/// for a socket, living or dead.
-[[nodiscard]] std::optional<std::string> inTheWay(const std::string& path);
+/// Why no socket can be at the path, with a suggested fix: its length, or a file that is not a socket. Returns nullopt
+/// for a free path and for a socket, living or dead.
+[[nodiscard]] std::optional<std::string> socketPathProblem(const std::string& path);
 
 /// Listens at the path with mode 0660. The socket gets its group and mode in a private directory and is then moved to
-/// its place, so that nobody ever meets it with other rights. A socket that a dead daemon left is replaced; one that a
-/// living daemon serves, and anything that is no socket, is an error. The path is removed with its owner.
+/// its path, so that nobody ever meets it with other rights. A socket that a dead daemon left is replaced; one that a
+/// living daemon serves, and anything that is not a socket, is an error. The path is removed with its owner.
 class ListeningSocket {
   public:
     static constexpr gid_t sameGroup = static_cast<gid_t>(-1);
 
-    /// Throws std::runtime_error with what is wrong and the mend.
+    /// Throws std::runtime_error with what is wrong and a suggested fix.
     ListeningSocket(std::string path, gid_t group);
     ListeningSocket(const ListeningSocket&) = delete;
     ListeningSocket& operator=(const ListeningSocket&) = delete;

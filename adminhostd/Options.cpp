@@ -29,15 +29,15 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
 
     CLI::App app("Server administration daemon: serves the operations of its plug-ins over a Unix socket.",
                  "adminhostd");
-    app.add_option("--root", options.root, "Directory below which all fixed places lie")->type_name("DIR");
+    app.add_option("--root", options.root, "Directory below which all fixed paths are")->type_name("DIR");
     app.add_option("--plugin", plugins, "Plug-in to load, instead of those of the plug-in directory")
         ->type_name("FILE")
         ->allow_extra_args(false);
-    app.add_option("--socket", socket, "Socket to listen at, taken as it stands")->type_name("PATH");
+    app.add_option("--socket", socket, "Socket to listen at; not below the root")->type_name("PATH");
     app.add_option("--config", configuration, "Configuration file (/etc/adminhostd.toml below the root)")
         ->type_name("FILE");
     app.add_option("--log", log, "Where the log goes: syslog or stderr")->check(CLI::IsMember({"syslog", "stderr"}));
-    app.add_flag("--check", options.check, "Look at configuration, plug-ins and places, say what is wrong, and end");
+    app.add_flag("--check", options.check, "Check configuration, plug-ins and paths, report what is wrong, and exit");
     app.set_version_flag("--version", std::string("adminhostd ") + ADMINHOST_RELEASE);
     try {
         app.parse(count, arguments);
@@ -50,9 +50,9 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
         options.root = absolute(options.root);
         setSystemRoot(options.root);
         options.root = systemRoot();
-        // Places below it are made where they are missing, but a slip of the pen is no new root.
+        // Missing directories below it are created, but a typo is not a new root.
         if (!std::filesystem::is_directory(options.root)) {
-            throw std::runtime_error(options.root + " is no directory; make it or correct --root");
+            throw std::runtime_error(options.root + " is not a directory; create it or correct --root");
         }
         const DiskPath standard = diskPath(HostPath(defaultConfiguration));
         // It names what is loaded into the daemon, so the same rules hold for it as for plug-ins.

@@ -29,11 +29,12 @@ struct Options {
 };
 
 /// Reads both; the command line wins. Sets the system root. A relative root or plug-in lies below the current
-/// directory. Nothing when the daemon is to end at once: help was printed, or what is wrong was; then status is the
-/// exit status.
+/// directory. Returns nullopt when the daemon must exit at once, because help or a mistake was printed; then status is
+/// the exit status.
 [[nodiscard]] std::optional<Options> readOptions(int count, const char* const* arguments, int& status);
 
-/// Applies a configuration file to the options. Throws std::runtime_error with file, line, what is wrong and the mend.
+/// Applies a configuration file to the options. Throws std::runtime_error with file, line, what is wrong and a
+/// suggested fix.
 void readConfiguration(const std::string& file, Options& options);
 
 /// The languages that the environment names, the most wanted first.

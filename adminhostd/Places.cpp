@@ -58,7 +58,7 @@ protocol::Hello helloOf(const protocol::Configure& configuration, std::string& p
             return {};
         }
     }
-    problem = "The worker does not get ready: a plug-in hangs while it is loaded.";
+    problem = "The worker is not ready in time: a plug-in hangs while it is loaded.";
     return {};
 }
 
@@ -102,7 +102,7 @@ std::string socketPath(const Options& options) {
     }
     const std::string directory = diskPath(options.runDirectory).text();
     std::error_code ignored;
-    // What hinders this shows when the socket is made.
+    // A failure shows when the socket is created.
     std::filesystem::create_directories(directory, ignored);
     return directory + "/adminhostd.sock";
 }
@@ -114,7 +114,7 @@ gid_t groupOf(const std::string& name) {
     const group* entry = ::getgrnam(name.c_str());
     if (entry == nullptr) {
         throw std::runtime_error(
-            fmt::format("there is no group \"{}\"; make it or correct socket_group in the configuration", name));
+            fmt::format("unknown group \"{}\"; create it or correct socket_group in the configuration", name));
     }
     return entry->gr_gid;
 }
@@ -143,16 +143,16 @@ int check(const Options& options) {
     const std::string socket = socketPath(options);
     const std::string directory = std::filesystem::path(socket).parent_path().string();
     if (::access(directory.empty() ? "." : directory.c_str(), W_OK | X_OK) != 0) {
-        problems.push_back(
-            fmt::format("The socket {} cannot be made: {}; make its directory, or choose another with --socket", socket,
-                        std::strerror(errno)));
+        problems.push_back(fmt::format(
+            "The socket {} cannot be created: {}; create its directory, or choose another path with --socket", socket,
+            std::strerror(errno)));
     }
-    if (const auto problem = inTheWay(socket)) {
+    if (const auto problem = socketPathProblem(socket)) {
         problems.push_back(*problem);
     }
     if (const DiskPath uuids = diskPath(HostPath(options.accountUuids));
         !options.accountUuids.empty() && ::access(uuids.c_str(), R_OK) != 0) {
-        problems.push_back(fmt::format("No access list can be read: {}: {}; make the file or correct account_uuids",
+        problems.push_back(fmt::format("Access lists cannot be read: {}: {}; create the file or correct account_uuids",
                                        uuids.text(), std::strerror(errno)));
     }
     try {
@@ -182,7 +182,7 @@ int check(const Options& options) {
             loaded += fmt::format(" {} {}", plugin.name, plugin.version);
         }
         if (loaded.empty() && problems.empty()) {
-            problems.push_back("There is no plug-in in " + diskPath(options.pluginDirectory).text() +
+            problems.push_back("No plug-in found in " + diskPath(options.pluginDirectory).text() +
                                "; install one, or name one with --plugin");
         }
     } catch (const std::exception& error) {

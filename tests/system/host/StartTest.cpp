@@ -168,7 +168,7 @@ TEST_F(Start, WhatIsNoSocketIsNeverReplaced) {
     std::ofstream(path) << "precious";
     const ProgramResult result = run({"--socket", path, "--plugin", pluginFile("fixture_good")});
     EXPECT_EQ(result.status, 1);
-    EXPECT_NE(result.output.find("is no socket"), std::string::npos) << result.output;
+    EXPECT_NE(result.output.find("is not a socket"), std::string::npos) << result.output;
     EXPECT_EQ(fs::file_size(path), 8U);
 }
 
@@ -226,7 +226,7 @@ TEST_F(Start, PluginDirectoryMustBeTrustworthyAsAWhole) {
         EXPECT_NE(run(command).output.find("good.so belongs to uid 65534; chown it to root"), std::string::npos);
     }
     fs::remove(plugins / "good.so");
-    EXPECT_NE(run(command).output.find("There is no plug-in in"), std::string::npos);
+    EXPECT_NE(run(command).output.find("No plug-in found in"), std::string::npos);
     fs::remove_all(plugins);
     EXPECT_NE(run(command).output.find("No such file or directory"), std::string::npos);
 }
@@ -249,18 +249,18 @@ TEST_F(Start, CheckSaysThatNothingIsWrongAndLeavesNothingBehind) {
     EXPECT_TRUE(fs::is_empty(directory));
 }
 
-TEST_F(Start, CheckNamesEveryProblemWithItsMend) {
+TEST_F(Start, CheckNamesEveryProblemWithASuggestedFix) {
     const std::string file = configuration("socket_group = \"no-such-group\"\n");
     const ProgramResult result = run({"--check", "--config", file, "--plugin", pluginFile("fixture_good"), "--socket",
                                       directory / "none" / "socket"});
     EXPECT_EQ(result.status, 1);
-    EXPECT_NE(result.output.find("there is no group \"no-such-group\""), std::string::npos) << result.output;
-    EXPECT_NE(result.output.find("make its directory, or choose another with --socket"), std::string::npos)
+    EXPECT_NE(result.output.find("unknown group \"no-such-group\""), std::string::npos) << result.output;
+    EXPECT_NE(result.output.find("create its directory, or choose another path with --socket"), std::string::npos)
         << result.output;
     const std::string accounts = configuration("account_uuids = \"" + (directory / "uuids").string() + "\"\n");
     EXPECT_NE(
         run({"--check", "--config", accounts, "--plugin", pluginFile("fixture_good"), "--socket", directory / "s"})
-            .output.find("uuids: No such file or directory; make the file or correct account_uuids"),
+            .output.find("uuids: No such file or directory; create the file or correct account_uuids"),
         std::string::npos);
     configuration("socket_group = \"no-such-group\"\n");
     EXPECT_NE(run({"--check", "--config", file, "--plugin", pluginFile("fixture_no_note"), "--socket", directory / "s"})
@@ -269,7 +269,7 @@ TEST_F(Start, CheckNamesEveryProblemWithItsMend) {
         << "one problem does not hide the others";
     std::ofstream(directory / "file") << "precious";
     EXPECT_NE(run({"--check", "--plugin", pluginFile("fixture_good"), "--socket", directory / "file"})
-                  .output.find("file is there already and is no socket"),
+                  .output.find("file exists and is not a socket"),
               std::string::npos);
     const ProgramResult crashing =
         run({"--check", "--plugin", pluginFile("fixture_crashing_later"), "--socket", directory / "socket"});
@@ -282,17 +282,17 @@ TEST_F(Start, MistakesInTheConfigurationAreNamedWithTheirLine) {
         const char* text;
         const char* expected;
     } const cases[] = {
-        {"queue_limit = 1\nqueu_limit = 2\n", "line 2: there is no key \"queu_limit\"; known keys: plugins"},
-        {"\nqueue_limit = \"2\"\n", "line 2: \"queue_limit\" takes a whole number"},
-        {"queue_limit = -1\n", "line 1: \"queue_limit\" takes"},
-        {"request_deadline_seconds = 0\n", "line 1: \"request_deadline_seconds\" takes seconds"},
-        {"request_deadline_seconds = nan\n", "line 1: \"request_deadline_seconds\" takes seconds"},
-        {"client_timeout_seconds = true\n", "line 1: \"client_timeout_seconds\" takes seconds"},
-        {"log = \"file\"\n", "line 1: \"log\" takes"},
-        {"languages = \"de\"\n", "line 1: \"languages\" takes a list of texts"},
-        {"plugins = [1]\n", "line 1: \"plugins\" takes a list of texts"},
-        {"socket = 1\n", "line 1: \"socket\" takes a text"},
-        {"[section]\nlog = \"syslog\"\n", "line 1: there is no key \"section\""},
+        {"queue_limit = 1\nqueu_limit = 2\n", "line 2: unknown key \"queu_limit\"; known keys: plugins"},
+        {"\nqueue_limit = \"2\"\n", "line 2: \"queue_limit\" must be a whole number"},
+        {"queue_limit = -1\n", "line 1: \"queue_limit\" must be"},
+        {"request_deadline_seconds = 0\n", "line 1: \"request_deadline_seconds\" must be a number of seconds"},
+        {"request_deadline_seconds = nan\n", "line 1: \"request_deadline_seconds\" must be a number of seconds"},
+        {"client_timeout_seconds = true\n", "line 1: \"client_timeout_seconds\" must be a number of seconds"},
+        {"log = \"file\"\n", "line 1: \"log\" must be"},
+        {"languages = \"de\"\n", "line 1: \"languages\" must be a list of texts"},
+        {"plugins = [1]\n", "line 1: \"plugins\" must be a list of texts"},
+        {"socket = 1\n", "line 1: \"socket\" must be a text"},
+        {"[section]\nlog = \"syslog\"\n", "line 1: unknown key \"section\""},
         {"queue_limit = = 2\n", "line 1, column"},
     };
     for (const auto& entry : cases) {
@@ -309,7 +309,7 @@ TEST_F(Start, RootThatDoesNotExistIsNeitherMadeNorServed) {
                                                       {"--root", missing, "--socket", directory / "socket"}}) {
         const ProgramResult result = run(arguments);
         EXPECT_EQ(result.status, 1);
-        EXPECT_NE(result.output.find("missing is no directory; make it or correct --root"), std::string::npos)
+        EXPECT_NE(result.output.find("missing is not a directory; create it or correct --root"), std::string::npos)
             << result.output;
     }
     EXPECT_FALSE(fs::exists(missing));
@@ -332,13 +332,67 @@ TEST_F(Start, ConfigurationThatOthersMayWriteIsRefused) {
     EXPECT_NE(open.output.find("may be written by everybody; chmod o-w it"), std::string::npos) << open.output;
 }
 
-TEST_F(Start, LockOfAStrangerOnTheSocketsDirectoryIsAnErrorAndNoHang) {
+TEST_F(Start, LockOfAStrangerOnTheSocketsDirectoryDoesNotMatter) {
     const int stranger = ::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     ASSERT_EQ(::flock(stranger, LOCK_EX), 0);
-    const ProgramResult result = run({"--socket", directory / "socket", "--plugin", pluginFile("fixture_good")});
+    auto options = withFixture();
+    options.socket = directory / "socket";
+    {
+        DaemonProcess daemon(options);
+        EXPECT_EQ(daemon.connect().get("/v1/").status, 200);
+        EXPECT_EQ(std::distance(fs::directory_iterator(directory), {}), 1)
+            << "the socket alone: no lock is left behind";
+        daemon.signal(SIGTERM);
+        EXPECT_EQ(daemon.wait(), 0);
+    }
     ::close(stranger);
+}
+
+TEST_F(Start, LockIsAPrivateFileAndWaitingForItHasABound) {
+    const fs::path path = directory / "socket.lock";
+    const std::vector<std::string> command = {"--socket", directory / "socket", "--plugin", pluginFile("fixture_good")};
+    const int holder = ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
+    ASSERT_EQ(::flock(holder, LOCK_EX), 0);
+    const ProgramResult held = run(command);
+    EXPECT_EQ(held.status, 1);
+    EXPECT_NE(held.output.find("another process holds a lock on " + path.string()), std::string::npos) << held.output;
+
+    // Anyone who may open it may lock it.
+    ASSERT_EQ(::fchmod(holder, 0644), 0);
+    const ProgramResult open = run(command);
+    EXPECT_EQ(open.status, 1);
+    EXPECT_NE(open.output.find("socket.lock is not a private file of this account; remove it"), std::string::npos)
+        << open.output;
+    ::close(holder);
+    fs::remove(path);
+    std::ofstream(directory / "target") << "precious";
+    fs::create_symlink("target", path);
+    EXPECT_EQ(run(command).status, 1) << "a link is not followed";
+}
+
+TEST_F(Start, CheckReportsASocketPathThatIsTooLong) {
+    const fs::path deep = directory / std::string(100, 'x');
+    fs::create_directory(deep);
+    const ProgramResult result = run({"--check", "--socket", deep / "socket", "--plugin", pluginFile("fixture_good")});
     EXPECT_EQ(result.status, 1);
-    EXPECT_NE(result.output.find("holds a lock on the directory of the socket"), std::string::npos) << result.output;
+    EXPECT_NE(result.output.find("must have 1 to 107 bytes; choose a shorter one"), std::string::npos) << result.output;
+}
+
+TEST_F(Start, ConfigurationThatIsADirectoryIsAnError) {
+    for (const std::vector<std::string>& arguments :
+         {std::vector<std::string>{"--check", "--config", directory, "--plugin", pluginFile("fixture_good")},
+          {"--config", directory, "--socket", directory / "socket"}}) {
+        const ProgramResult result = run(arguments);
+        EXPECT_EQ(result.status, 1);
+        EXPECT_NE(
+            result.output.find(directory.string() + ": Is a directory; the configuration must be a readable file"),
+            std::string::npos)
+            << result.output;
+    }
+    fs::create_directories(directory / "root/etc/adminhostd.toml");
+    const ProgramResult standard = run({"--root", directory / "root", "--check"});
+    EXPECT_EQ(standard.status, 1);
+    EXPECT_NE(standard.output.find("etc/adminhostd.toml: Is a directory"), std::string::npos) << standard.output;
 }
 
 TEST_F(Start, WhatTheParentLeftOpenReachesNoTool) {

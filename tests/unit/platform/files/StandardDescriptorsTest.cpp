@@ -13,7 +13,7 @@ namespace {
 int nullDescriptorsAfter(unsigned closed) {
     const pid_t child = ::fork();
     if (child == 0) {
-        struct stat before[3] {};
+        struct stat before[3]{};
         struct stat null {};
         ::stat("/dev/null", &null);
         const int other = ::open("/", O_RDONLY | O_DIRECTORY);
