@@ -3,6 +3,7 @@
 #include "platform/value/ValueText.h"
 #include "resources/Camera.h"
 #include "resources/Property.h"
+#include "resources/Workflow.h"
 
 namespace lumio {
 
@@ -76,11 +77,7 @@ Response LumioRequestHandler::getCamerasWithRequest(const Dictionary&) {
     if (!cameras) {
         return failedListing(error);
     }
-    std::vector<Resource*> all;
-    for (const auto& camera : *cameras) {
-        all.push_back(camera.get());
-    }
-    Resource::expandAll(all);
+    Resource::expandAll(*cameras);
     Array list;
     list.reserve(cameras->size());
     for (const auto& camera : *cameras) {
@@ -104,8 +101,20 @@ Response LumioRequestHandler::processCameraChangesWithRequest(const Array* chang
     return nullptr;
 }
 
-Response LumioRequestHandler::getWorkflowsWithRequest(const Dictionary&) {
-    return responseForError("NOT_AVAILABLE");
+Response LumioRequestHandler::getWorkflowsWithRequest(const Dictionary& request) {
+    std::optional<Error> error;
+    const auto workflows = Workflow::allWorkflowsWithError(error);
+    if (!workflows) {
+        return failedListing(error);
+    }
+    const std::vector<std::string> languages = languagesOf(request);
+    Array list;
+    list.reserve(workflows->size());
+    for (const auto& workflow : *workflows) {
+        workflow->localizeUsingLanguages(languages);
+        list.emplace_back(*workflow->dictionary());
+    }
+    return listing("getWorkflows", "workflows", std::move(list));
 }
 
 Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary& request) {
@@ -122,8 +131,10 @@ Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary& request
     return listing("getProperties", "properties", std::move(list));
 }
 
-Response LumioRequestHandler::setWorkflowACLWithRequest(const Array*) {
-    return responseForError("NOT_AVAILABLE");
+Response LumioRequestHandler::setWorkflowACLWithRequest(const Array* changes) {
+    forEachEntry(changes,
+                 [](const Dictionary& entry) { changeAccess(*Workflow::initWithGUID(identifierOf(entry)), entry); });
+    return nullptr;
 }
 
 Response LumioRequestHandler::processPropertyChangesWithRequest(const Array* changes) {

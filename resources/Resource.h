@@ -83,6 +83,15 @@ class Resource {
     /// Expands the access lists of all these resources as dictionary() does, several queries at a time. Answers and log
     /// lines are in the order of the resources. None of them may have been expanded before.
     static void expandAll(const std::vector<Resource*>& resources);
+    template <class Class>
+    static void expandAll(const std::vector<std::unique_ptr<Class>>& resources) {
+        std::vector<Resource*> all;
+        all.reserve(resources.size());
+        for (const auto& resource : resources) {
+            all.push_back(resource.get());
+        }
+        expandAll(all);
+    }
     /// "CLASS - guid: UUID, " and the record from the next line on: the fields as they stand, nothing is loaded.
     [[nodiscard]] std::string description() const;
 

@@ -69,7 +69,7 @@ TEST_F(PluginTable, CommandsThatThisReleaseDoesNotOfferSaySo) {
         }
     }
     EXPECT_THAT(unavailable, ElementsAre("getState", "getLogPaths", "startService", "stopService", "validateSettings",
-                                         "createNimboAccount", "getWorkflows"));
+                                         "createNimboAccount"));
 }
 
 TEST_F(PluginTable, RecycleServiceAnswersNothingAndChangesNothingWhateverTheVariant) {
