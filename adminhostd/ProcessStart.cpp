@@ -1,8 +1,10 @@
 #include "adminhostd/ProcessStart.h"
 
-#include <csignal>
+#include "platform/files/StandardDescriptors.h"
 
-#include <fcntl.h>
+#include <csignal>
+#include <cstdlib>
+
 #include <sys/prctl.h>
 #include <unistd.h>
 
@@ -25,12 +27,8 @@ void resetSignals() noexcept {
 }
 
 void tidyDescriptors() noexcept {
-    int descriptor = 0;
-    do {
-        descriptor = ::open("/dev/null", O_RDWR);
-    } while (descriptor >= 0 && descriptor <= STDERR_FILENO);
-    if (descriptor >= 0) {
-        ::close(descriptor);
+    if (!openStandardDescriptors()) {
+        ::_exit(EXIT_FAILURE);  // there is nowhere to say why
     }
     ::close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC);
 }

@@ -1,17 +1,15 @@
 #include "platform/log/Log.h"
-
-#include <cstdint>
+#include "platform/text/Utf8.h"
 
 #include <fmt/format.h>
-#include <unicode/utf8.h>
 
 namespace adminhost {
 namespace {
 
 constexpr std::string_view indentation = "    ";
 
-/// Appends one character as it is logged. A negative code is a byte that is not part of well-formed UTF-8.
-void append(std::string& text, std::string_view bytes, UChar32 code) {
+void append(std::string& text, std::string_view bytes, const Utf8Character& character) {
+    const char32_t code = character.code;
     if (code == '\n') {
         text += bytes;
         text += indentation;
@@ -19,10 +17,8 @@ void append(std::string& text, std::string_view bytes, UChar32 code) {
         text += "\\t";
     } else if (code == '\r') {
         text += "\\r";
-    } else if (code < 0x20 || code == 0x7f) {
-        for (const char byte : bytes) {
-            text += fmt::format("\\x{:02x}", static_cast<unsigned char>(byte));
-        }
+    } else if (!character.wellFormed || code < 0x20 || code == 0x7f) {
+        text += fmt::format("\\x{:02x}", static_cast<unsigned char>(bytes.front()));
     } else if (code >= 0x80 && code < 0xa0) {
         text += fmt::format("\\u{:04x}", static_cast<unsigned>(code));
     } else {
@@ -36,13 +32,10 @@ std::string logTextOf(std::string_view event) {
     event = event.substr(0, event.find_last_not_of('\n') + 1);
     std::string text;
     text.reserve(event.size() + 1);
-    const auto* bytes = reinterpret_cast<const std::uint8_t*>(event.data());
-    std::size_t at = 0;
-    while (at < event.size()) {
-        const std::size_t begin = at;
-        UChar32 code = 0;
-        U8_NEXT(bytes, at, event.size(), code);
-        append(text, event.substr(begin, at - begin), code);
+    while (!event.empty()) {
+        const Utf8Character character = firstCharacterOf(event);
+        append(text, event.substr(0, character.size), character);
+        event.remove_prefix(character.size);
     }
     return text;
 }

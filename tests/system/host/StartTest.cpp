@@ -145,6 +145,38 @@ TEST_F(Start, WhatOperationsPrintGoesToStandardOutputWhenTheLogDoesNot) {
     EXPECT_EQ(std::string(std::istreambuf_iterator<char>(file), {}), "a line on standard output\n");
 }
 
+TEST_F(Start, ClosedStandardDescriptorsAreTheNullDeviceInBothProcesses) {
+    const std::string socket = directory / "socket";
+    const std::string plugin = pluginFile("fixture_good");
+    const std::string program = std::string(BINARY_DIR) + "/bin/adminhostd";
+    const pid_t pid = ::fork();
+    if (pid == 0) {
+        for (int i = 0; i < 3; ++i) {
+            ::close(i);
+        }
+        ::execl(program.c_str(), program.c_str(), "--root", directory.c_str(), "--socket", socket.c_str(), "--plugin",
+                plugin.c_str(), "--log", "stderr", nullptr);
+        ::_exit(127);
+    }
+    ASSERT_GT(pid, 0);
+    ASSERT_TRUE(eventually([&] { return fs::exists(socket); }));
+    UnixHttp client(socket);
+    EXPECT_EQ(client.post("/v1/fixture/stdout").status, 204) << "what it prints does not reach the conversation";
+    const auto worker = dictionaryOf(client.get("/v1/")).get("workerPid").integer();
+    for (const auto process : {std::int64_t{pid}, worker.value_or(std::int64_t{-1})}) {
+        for (int i = 0; i < 3 && ::geteuid() == 0; ++i) {  // only root may look at them
+            std::error_code problem;
+            EXPECT_EQ(fs::read_symlink("/proc/" + std::to_string(process) + "/fd/" + std::to_string(i), problem),
+                      "/dev/null")
+                << problem.message();
+        }
+    }
+    ::kill(pid, SIGTERM);
+    int status = -1;
+    EXPECT_EQ(::waitpid(pid, &status, 0), pid);
+    EXPECT_EQ(status, 0);
+}
+
 TEST_F(Start, StaleSocketIsReplacedAndALiveOneIsAnError) {
     const fs::path path = directory / "socket";
     const int stale = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
