@@ -3,8 +3,10 @@
 #include "adminhostd/Front.h"
 #include "adminhostd/ListeningSocket.h"
 #include "adminhostd/Notify.h"
-#include "adminhostd/Places.h"
+#include "adminhostd/PluginSelection.h"
+#include "adminhostd/RunDirectory.h"
 #include "adminhostd/ToolConfiguration.h"
+#include "adminhostd/WorkerConfiguration.h"
 #include "platform/log/Log.h"
 
 #include <algorithm>

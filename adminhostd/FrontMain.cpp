@@ -1,8 +1,8 @@
 // adminhostd: the front of the daemon.
 
 #include "adminhostd/Daemon.h"
-#include "adminhostd/Places.h"
 #include "adminhostd/ProcessStart.h"
+#include "adminhostd/SelfCheck.h"
 
 #include <exception>
 #include <iostream>

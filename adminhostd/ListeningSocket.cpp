@@ -10,6 +10,7 @@
 
 #include <fcntl.h>
 #include <fmt/format.h>
+#include <grp.h>
 #include <sys/file.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -176,6 +177,18 @@ void ListeningSocket::remove() noexcept {
         ::unlink(_path.c_str());
     }
     _inode = 0;
+}
+
+gid_t groupOf(const std::string& name) {
+    if (name.empty()) {
+        return ListeningSocket::sameGroup;
+    }
+    const group* entry = ::getgrnam(name.c_str());
+    if (entry == nullptr) {
+        throw std::runtime_error(
+            fmt::format("unknown group \"{}\"; create it or correct socket_group in the configuration", name));
+    }
+    return entry->gr_gid;
 }
 
 }  // namespace adminhost

@@ -40,4 +40,7 @@ class ListeningSocket {
     ino_t _inode = 0;
 };
 
+/// The group's number; ListeningSocket::sameGroup for an empty name. Throws std::runtime_error for an unknown group.
+[[nodiscard]] gid_t groupOf(const std::string& name);
+
 }  // namespace adminhost

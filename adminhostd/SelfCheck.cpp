@@ -1,38 +1,24 @@
-#include "adminhostd/Places.h"
+#include "adminhostd/SelfCheck.h"
 
 #include "adminhostd/ListeningSocket.h"
-#include "adminhostd/PluginFile.h"
+#include "adminhostd/PluginSelection.h"
+#include "adminhostd/RunDirectory.h"
 #include "adminhostd/ToolConfiguration.h"
+#include "adminhostd/WorkerConfiguration.h"
 #include "adminhostd/WorkerProcess.h"
-#include "platform/framework/BuildNote.h"
 
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
 #include <iostream>
-#include <stdexcept>
+#include <string>
+#include <vector>
 
 #include <fmt/format.h>
-#include <grp.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 namespace adminhost {
 namespace {
-
-protocol::RefusedPlugin refusedFile(const DiskPath& file, const std::string& reason) {
-    return {file.text(), reason};
-}
-
-std::vector<std::string> textsOf(const Array& list) {
-    std::vector<std::string> texts;
-    for (const Value& value : list) {
-        if (value.string() != nullptr) {
-            texts.push_back(*value.string());
-        }
-    }
-    return texts;
-}
 
 /// The worker's first message. Without one the problem says why.
 protocol::Hello helloOf(const protocol::Configure& configuration, std::string& problem) {
@@ -63,79 +49,6 @@ protocol::Hello helloOf(const protocol::Configure& configuration, std::string& p
 }
 
 }  // namespace
-
-PluginSelection selectPlugins(const Options& options) {
-    PluginSelection selection;
-    if (!options.plugins.empty()) {
-        for (const DiskPath& file : options.plugins) {
-            if (const auto reason = openToEverybody(file)) {
-                selection.refused.push_back(refusedFile(file, *reason));
-            } else {
-                selection.files.push_back(file);
-            }
-        }
-        return selection;
-    }
-    const DiskPath directory = diskPath(options.pluginDirectory);
-    if (const auto reason = distrust(directory)) {
-        selection.refused.push_back(refusedFile(directory, *reason));
-        return selection;
-    }
-    const auto files = pluginsIn(directory);
-    if (!files) {
-        selection.refused.push_back(refusedFile(directory, directory.text() + ": " + std::strerror(errno)));
-        return selection;
-    }
-    for (const DiskPath& file : *files) {
-        if (const auto reason = distrust(file)) {
-            selection.refused.push_back(refusedFile(file, *reason));
-        } else {
-            selection.files.push_back(file);
-        }
-    }
-    return selection;
-}
-
-std::string socketPath(const Options& options) {
-    if (options.socket) {
-        return options.socket->text();
-    }
-    const std::string directory = diskPath(options.runDirectory).text();
-    std::error_code ignored;
-    // A failure shows when the socket is created.
-    std::filesystem::create_directories(directory, ignored);
-    return directory + "/adminhostd.sock";
-}
-
-gid_t groupOf(const std::string& name) {
-    if (name.empty()) {
-        return ListeningSocket::sameGroup;
-    }
-    const group* entry = ::getgrnam(name.c_str());
-    if (entry == nullptr) {
-        throw std::runtime_error(
-            fmt::format("unknown group \"{}\"; create it or correct socket_group in the configuration", name));
-    }
-    return entry->gr_gid;
-}
-
-std::string privateParent(const Options& options) {
-    return options.socket ? std::filesystem::temp_directory_path().string() : diskPath(options.runDirectory).text();
-}
-
-protocol::Configure workerConfiguration(const Options& options, const PluginSelection& plugins,
-                                        const std::string& toolConfiguration) {
-    protocol::Configure configuration;
-    configuration.build = ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY;
-    configuration.root = options.root;
-    for (const DiskPath& file : plugins.files) {
-        configuration.plugins.push_back(file.text());
-    }
-    configuration.languages = textsOf(options.languages ? *options.languages : languagesOfEnvironment());
-    configuration.accountUuids = options.accountUuids;
-    configuration.toolEnvironment = {{"XDG_CONFIG_HOME", toolConfiguration}};
-    return configuration;
-}
 
 int check(const Options& options) {
     std::vector<std::string> problems;

@@ -1,0 +1,36 @@
+#include "adminhostd/WorkerConfiguration.h"
+
+#include "platform/framework/BuildNote.h"
+
+#include <vector>
+
+namespace adminhost {
+namespace {
+
+std::vector<std::string> textsOf(const Array& list) {
+    std::vector<std::string> texts;
+    for (const Value& value : list) {
+        if (value.string() != nullptr) {
+            texts.push_back(*value.string());
+        }
+    }
+    return texts;
+}
+
+}  // namespace
+
+protocol::Configure workerConfiguration(const Options& options, const PluginSelection& plugins,
+                                        const std::string& toolConfiguration) {
+    protocol::Configure configuration;
+    configuration.build = ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY;
+    configuration.root = options.root;
+    for (const DiskPath& file : plugins.files) {
+        configuration.plugins.push_back(file.text());
+    }
+    configuration.languages = textsOf(options.languages ? *options.languages : languagesOfEnvironment());
+    configuration.accountUuids = options.accountUuids;
+    configuration.toolEnvironment = {{"XDG_CONFIG_HOME", toolConfiguration}};
+    return configuration;
+}
+
+}  // namespace adminhost

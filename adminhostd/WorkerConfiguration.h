@@ -1,0 +1,17 @@
+#pragma once
+
+// What every worker is sent first.
+
+#include "adminhostd/Options.h"
+#include "adminhostd/PluginSelection.h"
+#include "adminhostd/Protocol.h"
+
+#include <string>
+
+namespace adminhost {
+
+/// The tool configuration is the directory in which tools look for their settings.
+[[nodiscard]] protocol::Configure workerConfiguration(const Options& options, const PluginSelection& plugins,
+                                                      const std::string& toolConfiguration);
+
+}  // namespace adminhost
