@@ -43,7 +43,7 @@ ACCESS = {
     "account": "It handles accounts and their passwords.",
 }
 
-COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline_seconds", "shows_revision", "takes_revision", "state", "available",
+COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline_seconds", "shows_revision", "takes_revision", "state", "parts", "available",
                  "errors", "keys", "answer", "include", "example"}
 # What programs that compare and write a desired state have to know of a key (README.md).
 STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_file", "kind", "kinds", "secret_if", "file",
@@ -71,7 +71,7 @@ def parent(path):
     return path[:-2] if path.endswith("[]") else path.rpartition(".")[0]
 
 
-def check_keys(keys, words, what):
+def check_keys(keys, words, what, names):
     for path, key in keys.items():
         where = f"{what} {path}"
         need(set(key) <= words, f"{where}: unknown word {sorted(set(key) - words)}")
@@ -85,6 +85,7 @@ def check_keys(keys, words, what):
         for word in ("identity", "kind"):  # of a list's element: keys of it
             need(word not in key or f"{path}.{key[word]}" in keys, f"{where}: {word} is not described")
         need(all(f"{path}.{below}" in keys for below in key.get("title", [])), f"{where}: title is not described")
+        need(set(key.get("restart", [])) <= names, f"{where}: restart names an unknown command")
         need("secret_if" not in key or f"{parent(path)}.{key['secret_if']}" in keys, f"{where}: secret_if is not described")
         need(key.get("looked_up", "local_name") == "local_name", f"{where}: unknown word in looked_up")
         above = parent(path)
@@ -166,11 +167,14 @@ def load(directory):
             keys = command.setdefault("keys", {})
             for path, key in keys.items():  # a setting is described once, where it is read
                 key.setdefault("help", command["all_answers"].get(path, {}).get("help", ""))
-            check_keys(keys, KEY_WORDS, "key")
-            check_keys(command["all_answers"], ANSWER_WORDS, "answer")
+            check_keys(keys, KEY_WORDS, "key", set(commands))
+            check_keys(command["all_answers"], ANSWER_WORDS, "answer", set(commands))
             for error in command.get("errors", []):
                 need(set(error) in ({"key", "meaning"}, {"code", "meaning"}), "an error has key or code, and meaning")
                 need("key" not in error or error["key"] in command["all_answers"], f"error {error}: not an answer key")
+            for section, text in command.get("parts", {}).items():
+                command["parts"][section] = json.loads(text, object_pairs_hook=from_json)
+                check_example(command["parts"][section], keys, "", f"part {section}")
             need("request" in command.get("example", {}), "example.request is missing")
             for what, described in (("request", keys), ("answer", command["all_answers"])):
                 if what in command["example"]:
@@ -221,7 +225,7 @@ def describe(name, command):
         "name": name,
         "summary": command["summary"].strip(),
         "description": " ".join(command.get("description", command["summary"]).split()),
-        **({"state": command["state"]} if "state" in command else {}),
+        **{word: command[word] for word in ("state", "parts") if word in command},
         "keys": [key_description(path, key) for path, key in command["keys"].items()],
         "answer": [key_description(path, key) for path, key in command["all_answers"].items()],
         "errors": command.get("errors", []),

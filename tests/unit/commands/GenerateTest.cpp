@@ -82,6 +82,9 @@ TEST_F(Generate, RefusesWordsOfTheDesiredStateThatNameNothing) {
     EXPECT_THAT(with("help", "identity = \"_id_\"\nhelp"), HasSubstr("key a: identity is not described"));
     EXPECT_THAT(with("help", "secret_if = \"hidden\"\nhelp"), HasSubstr("key a: secret_if is not described"));
     EXPECT_THAT(with("help", "looked_up = \"always\"\nhelp"), HasSubstr("key a: unknown word in looked_up"));
+    EXPECT_THAT(with("help", "restart = [\"doThat\"]\nhelp"), HasSubstr("key a: restart names an unknown command"));
+    EXPECT_THAT(with("order = 1", "order = 1\nparts = { all = '{\"b\": 1}' }"),
+                HasSubstr("part all: b is not described"));
     EXPECT_THAT(with("help", "file = \"main\"\nlocates = [\"main\"]\nhelp"), HasSubstr("status 0"));
     EXPECT_THAT(with("order = 1", "order = 1\nstate = \"write\""), HasSubstr("status 0"));
     write("doThat.toml", std::string(sound).replace(0, 9, "order = 2\nstate = \"write\""));
