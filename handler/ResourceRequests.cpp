@@ -1,4 +1,5 @@
 #include "handler/LumioRequestHandler.h"
+#include "platform/framework/Report.h"
 #include "platform/log/Log.h"
 #include "platform/value/ValueText.h"
 #include "resources/Camera.h"
@@ -28,17 +29,23 @@ Response listing(std::string_view command, std::string_view key, Array list) {
     return answer;
 }
 
-/// Applies each change entry in order; an element that is no dictionary is passed over.
+/// Applies each change entry in order, with its index; an element that is not a dictionary is passed over.
 template <class Change>
 void forEachEntry(const Array* changes, Change change) {
     if (changes == nullptr) {
         return;
     }
-    for (const Value& element : *changes) {
-        if (const Dictionary* entry = element.dictionary()) {
-            change(*entry);
+    for (std::size_t index = 0; index < changes->size(); ++index) {
+        if (const Dictionary* entry = (*changes)[index].dictionary()) {
+            change(*entry, index);
         }
     }
+}
+
+/// Reports that a change entry of the list was not carried out.
+void reportEntryNotDone(std::string_view list, std::size_t index, std::string reason, const Error& error) {
+    adminhost::reportNotDone(
+        {"configuration." + std::string(list) + '.' + std::to_string(index), std::move(reason), textOf(error)});
 }
 
 std::optional<std::string> identifierOf(const Dictionary& entry) {
@@ -87,12 +94,13 @@ Response LumioRequestHandler::getCamerasWithRequest(const Dictionary&) {
 }
 
 Response LumioRequestHandler::processCameraChangesWithRequest(const Array* changes) {
-    forEachEntry(changes, [](const Dictionary& entry) {
+    forEachEntry(changes, [](const Dictionary& entry, std::size_t index) {
         const auto camera = Camera::initWithGUID(identifierOf(entry));
         if (flagOf(entry.get("_obsoleteid_"))) {
             if (const auto error = camera->delete_()) {
                 logEvent("adminhost_lumio: could not delete camera with uuid: " + textOf(entry.get("_id_")) +
                          ", error: " + textOf(*error));
+                reportEntryNotDone("cameras", index, "the camera was not removed", *error);
             }
             return;
         }
@@ -138,17 +146,19 @@ Response LumioRequestHandler::setWorkflowACLWithRequest(const Array* changes) {
 }
 
 Response LumioRequestHandler::processPropertyChangesWithRequest(const Array* changes) {
-    forEachEntry(changes, [](const Dictionary& entry) {
+    forEachEntry(changes, [](const Dictionary& entry, std::size_t index) {
         const Value& id = entry.get("_id_");
         // An entry that is both obsolete and new is deleted.
         if (flagOf(entry.get("_obsoleteid_"))) {
             if (const auto error = Property::deletePropertyWithID(id)) {
                 logEvent("adminhost_lumio: could not delete property with id: " + textOf(id) +
                          ", error: " + textOf(*error));
+                reportEntryNotDone("properties", index, "the property was not removed", *error);
             }
         } else if (flagOf(entry.get("_newid_"))) {
             if (const auto error = Property::initNewPropertyWithDictionary(entry)->write()) {
                 logEvent("adminhost_lumio: could not insert new property: " + textOf(*error));
+                reportEntryNotDone("properties", index, "the property was not added", *error);
             }
         } else {
             logEvent("adminhost_lumio: update property");
@@ -157,6 +167,7 @@ Response LumioRequestHandler::processPropertyChangesWithRequest(const Array* cha
             if (const auto error = property->write()) {
                 logEvent("adminhost_lumio: could not update property with id: " + textOf(id) +
                          ", error: " + textOf(*error));
+                reportEntryNotDone("properties", index, "the property was not changed", *error);
             }
         }
     });

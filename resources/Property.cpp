@@ -3,6 +3,7 @@
 #include "codec/LumioCategories.h"
 #include "platform/bundle/Bundle.h"
 #include "platform/crypto/Crypt.h"
+#include "platform/framework/Report.h"
 #include "platform/log/Log.h"
 #include "platform/text/LocalDate.h"
 #include "platform/value/ValueText.h"
@@ -208,6 +209,11 @@ std::optional<Error> Property::write() {
             } else if (std::optional<std::string> plain = decryptValue(stored("value"))) {
                 working.set("value", std::move(*plain));
                 deciphered = true;
+            } else {
+                adminhost::reportNotDone({"configuration.properties",
+                                          "the protected value of " + textOf(stored("name")) +
+                                              " cannot be deciphered; it stays as it is stored",
+                                          ""});
             }
         }
     }
