@@ -1,6 +1,6 @@
 #include "adminhostctl/Connection.h"
 
-#include "adminhostctl/Failure.h"
+#include "adminhostctl/Interrupt.h"
 
 #include <cerrno>
 #include <cstring>
@@ -15,6 +15,11 @@ namespace {
 std::size_t append(char* bytes, std::size_t size, std::size_t count, void* place) noexcept {
     static_cast<std::string*>(place)->append(bytes, size * count);
     return size * count;
+}
+
+/// Called by the library at least once a second.
+int stopWhenInterrupted(void*, curl_off_t, curl_off_t, curl_off_t, curl_off_t) noexcept {
+    return isInterrupted() ? 1 : 0;
 }
 
 struct FreeList {
@@ -59,19 +64,22 @@ Connection& Connection::operator=(Connection&&) noexcept = default;
 DaemonReply Connection::get(const std::string& path) {
     return send(path, nullptr, {});
 }
-DaemonReply Connection::post(const std::string& path, const std::string& body, const std::string& revision) {
-    return send(path, &body, revision);
+DaemonReply Connection::post(const std::string& path, const std::string& body, const PostHeaders& headers) {
+    return send(path, &body, headers);
 }
 
-DaemonReply Connection::send(const std::string& path, const std::string* body, const std::string& revision) {
+DaemonReply Connection::send(const std::string& path, const std::string* body, const PostHeaders& extra) {
     DaemonReply answer;
     const std::string address = "http://localhost" + path;
     // Without an empty Expect header, larger bodies would wait for a permission that the daemon need not give.
     HeaderList headers(curl_slist_append(nullptr, "Content-Type: application/json"));
     curl_slist_append(headers.get(), "Expect:");
     curl_slist_append(headers.get(), "Accept: application/json");
-    if (!revision.empty()) {
-        curl_slist_append(headers.get(), ("If-Match: " + revision).c_str());
+    if (!extra.revision.empty()) {
+        curl_slist_append(headers.get(), ("If-Match: " + extra.revision).c_str());
+    }
+    if (!extra.requestId.empty()) {
+        curl_slist_append(headers.get(), ("Request-Id: " + extra.requestId).c_str());
     }
 
     curl_easy_reset(_transfer->get());
@@ -84,8 +92,14 @@ DaemonReply Connection::send(const std::string& path, const std::string* body, c
     _transfer->set(CURLOPT_HTTPHEADER, headers.get());
     _transfer->set(CURLOPT_WRITEFUNCTION, &append);
     _transfer->set(CURLOPT_WRITEDATA, &answer.body);
+    if (!extra.requestId.empty()) {
+        // On a kept connection that turns out to be closed the library would send the request a second time.
+        _transfer->set(CURLOPT_FRESH_CONNECT, 1L);
+    }
     if (body != nullptr) {
         _transfer->set(CURLOPT_POST, 1L);
+        _transfer->set(CURLOPT_NOPROGRESS, 0L);
+        _transfer->set(CURLOPT_XFERINFOFUNCTION, &stopWhenInterrupted);
         _transfer->set(CURLOPT_POSTFIELDS, body->data());
         _transfer->set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(body->size()));
     }
@@ -98,6 +112,12 @@ DaemonReply Connection::send(const std::string& path, const std::string* body, c
         }
         const std::string why = result == CURLE_COULDNT_CONNECT && number != 0 ? std::strerror(static_cast<int>(number))
                                                                                : curl_easy_strerror(result);
+        long sent = 0;
+        curl_easy_getinfo(_transfer->get(), CURLINFO_REQUEST_SIZE, &sent);
+        if (body != nullptr && sent > 0) {
+            throw LostConnection(ExitStatus::undetermined,
+                                 isInterrupted() ? "interrupted" : "the connection to the daemon was lost: " + why);
+        }
         throw Failure(ExitStatus::notReachable, "the daemon cannot be reached at " + _socketPath + ": " + why);
     }
     curl_easy_getinfo(_transfer->get(), CURLINFO_RESPONSE_CODE, &answer.status);
@@ -105,6 +125,8 @@ DaemonReply Connection::send(const std::string& path, const std::string* body, c
     if (curl_easy_header(_transfer->get(), "Request-Id", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
         answer.requestId = header->value;
     }
+    answer.notDone =
+        curl_easy_header(_transfer->get(), "Adminhost-Not-Done", 0, CURLH_HEADER, -1, &header) == CURLHE_OK;
     if (curl_easy_header(_transfer->get(), "ETag", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
         answer.revision = header->value;
     }

@@ -2,6 +2,8 @@
 
 // HTTP over the daemon's Unix socket.
 
+#include "adminhostctl/Failure.h"
+
 #include <memory>
 #include <string>
 
@@ -12,10 +14,24 @@ struct DaemonReply {
     std::string body;
     std::string requestId;  ///< the daemon's name for the request; empty if it gave none
     std::string revision;   ///< of what was read, as the ETag header gives it; empty if it gave none
+    bool notDone = false;   ///< parts of the request were not carried out, or were ignored
+};
+
+/// The daemon was reached, and the connection ended before the answer: the request may have been carried out.
+class LostConnection : public Failure {
+  public:
+    using Failure::Failure;
+};
+
+/// What a request that may change something is sent with.
+struct PostHeaders {
+    std::string requestId;  ///< a UUID of the client's choice; empty: the daemon chooses
+    std::string revision;  ///< the daemon refuses the request (412) unless this is the current one; empty: no condition
 };
 
 /// One connection, kept open between requests. Throws Failure when the daemon cannot be reached (notReachable) or the
-/// socket may not be opened (notPermitted). Waits for an answer as long as the daemon takes: the daemon bounds
+/// socket may not be opened (notPermitted), and LostConnection from post() when the connection ends without an answer
+/// or isInterrupted() becomes true meanwhile. Waits for an answer as long as the daemon takes: the daemon bounds
 /// requests.
 class Connection {
   public:
@@ -26,15 +42,15 @@ class Connection {
 
     /// The path is the address below "http://host", each of its segments already escaped.
     [[nodiscard]] DaemonReply get(const std::string& path);
-    /// The body is JSON. With a revision, the daemon refuses the request (412) unless it still is the current one.
-    [[nodiscard]] DaemonReply post(const std::string& path, const std::string& body, const std::string& revision = {});
+    /// The body is JSON.
+    [[nodiscard]] DaemonReply post(const std::string& path, const std::string& body, const PostHeaders& headers = {});
 
     /// Escapes one segment of a path.
     [[nodiscard]] static std::string escaped(const std::string& segment);
 
   private:
     class Transfer;
-    [[nodiscard]] DaemonReply send(const std::string& path, const std::string* body, const std::string& revision);
+    [[nodiscard]] DaemonReply send(const std::string& path, const std::string* body, const PostHeaders& headers);
 
     std::string _socketPath;
     std::unique_ptr<Transfer> _transfer;

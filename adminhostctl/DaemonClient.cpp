@@ -1,11 +1,14 @@
 #include "adminhostctl/DaemonClient.h"
 
-#include "adminhostctl/Failure.h"
+#include "adminhostctl/Interrupt.h"
 #include "adminhostctl/Width.h"
 #include "platform/json/Json.h"
+#include "platform/text/Uuid.h"
 #include "platform/value/ValueText.h"
 
 #include <algorithm>
+#include <chrono>
+#include <thread>
 
 namespace adminhost::ctl {
 namespace {
@@ -14,6 +17,7 @@ constexpr long statusOk = 200;
 constexpr long statusNoContent = 204;
 constexpr long statusForbidden = 403;
 constexpr long statusInternal = 500;
+constexpr long statusTimeout = 504;
 
 std::string textAt(const Dictionary& dictionary, std::string_view key) {
     const std::string* text = dictionary.get(key).string();
@@ -52,6 +56,40 @@ std::string joined(const std::vector<PluginInfo>& plugins) {
     return text;
 }
 
+std::string rawTextAt(const Dictionary& dictionary, std::string_view key) {
+    const std::string* text = dictionary.get(key).string();
+    return text != nullptr ? *text : std::string();
+}
+
+std::uint64_t countAt(const Dictionary& dictionary, std::string_view key) {
+    return static_cast<std::uint64_t>(std::max<std::int64_t>(dictionary.get(key).integer().value_or(0), 0));
+}
+
+std::vector<const Dictionary*> dictionariesAt(const Dictionary& dictionary, std::string_view key) {
+    std::vector<const Dictionary*> all;
+    if (const Array* array = dictionary.get(key).array()) {
+        for (const Value& element : *array) {
+            if (const Dictionary* one = element.dictionary()) {
+                all.push_back(one);
+            }
+        }
+    }
+    return all;
+}
+
+/// What an answer that is an error says, with its findings.
+std::string messageOf(const DaemonReply& reply) {
+    const auto body = parseJson(reply.body);
+    const Dictionary* said = body ? body->dictionary() : nullptr;
+    if (said == nullptr) {
+        return "the daemon returned HTTP status " + std::to_string(reply.status);
+    }
+    const std::string message = textAt(*said, "message");
+    const std::string code = textAt(*said, "error");
+    return (message.empty() ? code : message + (code.empty() ? "" : " (" + code + ")")) +
+           findingsText(said->get("findings"));
+}
+
 /// Whether a value under a status or error key means failure.
 bool isSet(const Value& value) {
     if (const auto number = value.integer()) {
@@ -75,21 +113,12 @@ Value DaemonClient::get(const std::string& path) {
     return std::move(*value);
 }
 
-void DaemonClient::fail(const DaemonReply& answer) {
-    const ExitStatus status = answer.status == statusForbidden ? ExitStatus::notPermitted : ExitStatus::answeredError;
-    const auto body = parseJson(answer.body);
-    const Dictionary* said = body ? body->dictionary() : nullptr;
-    if (said == nullptr) {
-        throw Failure(status, "the daemon answered HTTP status " + std::to_string(answer.status));
+void DaemonClient::fail(const DaemonReply& reply) {
+    std::string message = messageOf(reply);
+    if (reply.status == statusInternal && !reply.requestId.empty()) {
+        message += logText(report(reply.requestId).log);
     }
-    std::string message = textAt(*said, "message");
-    const std::string code = textAt(*said, "error");
-    message = message.empty() ? code : message + (code.empty() ? "" : " (" + code + ")");
-    message += findingsText(said->get("findings"));
-    if (answer.status == statusInternal && !answer.requestId.empty()) {
-        message += logText(logLines(answer.requestId));
-    }
-    throw Failure(status, message);
+    throw Failure(reply.status == statusForbidden ? ExitStatus::notPermitted : ExitStatus::answeredError, message);
 }
 
 Value DaemonClient::overview() {
@@ -141,46 +170,116 @@ CommandRef DaemonClient::command(const std::string& name) {
         return found.front();
     }
     if (plugins().empty()) {
-        throw Failure(ExitStatus::answeredError, "the daemon has loaded no plug-in; adminhostctl status says more");
+        throw Failure(ExitStatus::answeredError, "the daemon has loaded no plug-in; its log says why");
     }
     if (found.empty()) {
-        throw usageError("there is no command " + shown(name) + "; there are " + joined(plugins()));
+        throw usageError("command not found: " + name + "; the commands are " + joined(plugins()));
     }
-    throw usageError("several plug-ins have a command " + wanted + "; write " + found.front().plugin + '/' + wanted);
+    throw usageError("several plug-ins have a command " + wanted + "; use " + found.front().plugin + '/' + wanted);
+}
+
+CommandRef DaemonClient::stateCommand(std::string_view state) {
+    std::vector<CommandRef> found;
+    for (const PluginInfo& plugin : plugins()) {
+        for (const Description& command : plugin.commands) {
+            if (command.state() == state) {
+                found.push_back({plugin.name, command});
+            }
+        }
+    }
+    if (found.size() == 1) {
+        return found.front();
+    }
+    throw usageError(found.empty() ? "no plug-in of the daemon has a state that can be compared and written"
+                                   : "several plug-ins have a state that can be written; use their commands");
 }
 
 CommandAnswer DaemonClient::ask(const CommandRef& command, const Dictionary& request, const std::string& revision) {
-    const DaemonReply answer = _connection.post(
-        "/v1/" + Connection::escaped(command.plugin) + '/' + Connection::escaped(command.description.name()),
-        jsonOf(request), revision);
-    if (answer.status == statusNoContent) {
-        return {std::nullopt, answer.requestId, answer.revision};
+    const std::string path =
+        "/v1/" + Connection::escaped(command.plugin) + '/' + Connection::escaped(command.description.name());
+    const PostHeaders headers{textOf(randomUuid()), revision};
+    DaemonReply reply;
+    if (command.description.changes()) {
+        const InterruptGuard guard;
+        try {
+            reply = _connection.post(path, jsonOf(request), headers);
+        } catch (const LostConnection& lost) {
+            throw LostAnswer(lost.status(), lost.what(), headers.requestId);
+        }
+    } else {
+        reply = _connection.post(path, jsonOf(request), headers);
     }
-    if (answer.status != statusOk) {
-        fail(answer);
+    const std::string id = reply.requestId.empty() ? headers.requestId : reply.requestId;
+    if (reply.status == statusNoContent) {
+        return {std::nullopt, id, reply.revision, reply.notDone};
+    }
+    if (reply.status != statusOk) {
+        if (command.description.changes() && (reply.status == statusInternal || reply.status == statusTimeout)) {
+            throw LostAnswer(ExitStatus::answeredError, messageOf(reply), id);
+        }
+        fail(reply);
     }
     Error error;
-    auto value = parseJson(answer.body, &error);
+    auto value = parseJson(reply.body, &error);
     if (!value) {
         throw Failure(ExitStatus::answeredError, "the answer cannot be read: " + textOf(error));
     }
-    return {std::move(value), answer.requestId, answer.revision};
+    return {std::move(value), id, reply.revision, reply.notDone};
 }
 
-std::vector<std::string> DaemonClient::logLines(const std::string& requestId) {
-    const DaemonReply answer = _connection.get("/v1/requests/" + Connection::escaped(requestId));
-    const auto record = answer.status == statusOk ? parseJson(answer.body) : std::nullopt;
-    const Dictionary* dictionary = record ? record->dictionary() : nullptr;
-    const Array* log = dictionary != nullptr ? dictionary->get("log").array() : nullptr;
-    std::vector<std::string> lines;
-    for (const Value& line : log != nullptr ? *log : Array{}) {
-        lines.push_back(textOf(line));
+RequestReport DaemonClient::report(const std::string& requestId) {
+    RequestReport report;
+    DaemonReply reply;
+    try {
+        reply = _connection.get("/v1/requests/" + Connection::escaped(requestId));
+    } catch (const Failure&) {
+        report.state = RequestReport::State::notReachable;
+        return report;
     }
-    return lines;
+    const auto record = reply.status == statusOk ? parseJson(reply.body) : std::nullopt;
+    const Dictionary* said = record ? record->dictionary() : nullptr;
+    if (said == nullptr) {
+        return report;
+    }
+    const std::string state = rawTextAt(*said, "state");
+    report.state = state == "waiting"   ? RequestReport::State::waiting
+                   : state == "running" ? RequestReport::State::running
+                   : state == "done"    ? RequestReport::State::done
+                                        : RequestReport::State::unknown;
+    for (const Dictionary* change : dictionariesAt(*said, "changes")) {
+        report.changes.push_back({rawTextAt(*change, "section"), rawTextAt(*change, "identity"),
+                                  rawTextAt(*change, "name"), rawTextAt(*change, "key"), change->get("from"),
+                                  change->get("to"), change->get("secret").boolean().value_or(false)});
+    }
+    for (const Dictionary* gap : dictionariesAt(*said, "notDone")) {
+        report.notDone.push_back(
+            {rawTextAt(*gap, "keyPath"), rawTextAt(*gap, "reason"), rawTextAt(*gap, "toolMessage")});
+    }
+    report.changesDropped = countAt(*said, "changesDropped");
+    report.notDoneDropped = countAt(*said, "notDoneDropped");
+    const Array* log = said->get("log").array();
+    for (const Value& line : log != nullptr ? *log : Array{}) {
+        report.log.push_back(textOf(line));
+    }
+    return report;
+}
+
+RequestReport DaemonClient::settledReport(const std::string& requestId) {
+    constexpr auto patience = std::chrono::seconds(10);
+    constexpr auto pause = std::chrono::milliseconds(100);
+    const auto end = std::chrono::steady_clock::now() + patience;
+    while (true) {
+        RequestReport found = report(requestId);
+        const bool settled = found.state == RequestReport::State::done || found.state == RequestReport::State::unknown;
+        if (settled || std::chrono::steady_clock::now() >= end) {
+            return found;
+        }
+        std::this_thread::sleep_for(pause);
+    }
 }
 
 std::string errorOf(const Description& command, const Dictionary& answer) {
-    std::vector<std::string> keys = {"readStatus", "writeStatus"};
+    std::vector<std::string> keys;
     for (const Value& error : command.errors()) {
         const std::string* key = error.dictionary() != nullptr ? error.dictionary()->get("key").string() : nullptr;
         if (key != nullptr && std::find(keys.begin(), keys.end(), *key) == keys.end()) {

@@ -1,13 +1,16 @@
 #pragma once
 
-// The daemon, as the verbs use it.
+// The daemon, as the verbs use it: its plug-ins and commands, what they answer, and what became of a request.
 
 #include "adminhostctl/Connection.h"
 #include "adminhostctl/Description.h"
+#include "adminhostctl/Failure.h"
 #include "platform/value/Value.h"
 
+#include <cstdint>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace adminhost::ctl {
@@ -24,11 +27,59 @@ struct CommandRef {
     Description description;
 };
 
+/// One thing that a request has changed, as the daemon reports it.
+struct ReportedChange {
+    std::string section;
+    std::string identity;
+    std::string name;
+    std::string key;
+    Value from;
+    Value to;
+    bool secret = false;
+};
+
+/// A part of a request that was not carried out, or was ignored.
+struct ReportedGap {
+    std::string keyPath;  ///< "configuration.cameras.0.name"
+    std::string reason;
+    std::string toolMessage;
+};
+
+/// What the daemon knows of a request.
+struct RequestReport {
+    enum class State {
+        waiting,
+        running,
+        done,
+        unknown,       ///< not known to the daemon: it never arrived, was forgotten, or the daemon was started again
+        notReachable,  ///< there is no daemon to ask
+    };
+    State state = State::unknown;
+    std::vector<ReportedChange> changes;
+    std::vector<ReportedGap> notDone;
+    std::uint64_t changesDropped = 0;  ///< happened and are not listed
+    std::uint64_t notDoneDropped = 0;
+    std::vector<std::string> log;
+};
+
+/// The answer to a request that may have changed something is missing: the connection was lost, the daemon reports a
+/// failure (500) or the deadline (504), or the program was interrupted. Such a request is never sent again.
+class LostAnswer : public Failure {
+  public:
+    LostAnswer(ExitStatus status, const std::string& message, std::string requestId)
+        : Failure(status, message), _requestId(std::move(requestId)) {}
+    [[nodiscard]] const std::string& requestId() const noexcept { return _requestId; }
+
+  private:
+    std::string _requestId;
+};
+
 /// What a command answered, and the request that it answered to.
 struct CommandAnswer {
     std::optional<Value> value;  ///< nothing for an answer of nothing
     std::string requestId;
     std::string revision;  ///< of what was read; empty where the command has none
+    bool notDone = false;  ///< parts of the request were not carried out: see report()
 };
 
 class DaemonClient {
@@ -42,17 +93,18 @@ class DaemonClient {
     /// The command of that name, "PLUGIN/COMMAND" where two plug-ins have it. Throws Failure(usage) with the known
     /// ones.
     [[nodiscard]] CommandRef command(const std::string& name);
-    /// The answer; nothing for an answer of nothing. Throws Failure with the daemon's message, its findings and, after
-    /// a failure inside the service, the log lines of the request.
-    [[nodiscard]] std::optional<Value> perform(const CommandRef& command, const Dictionary& request) {
-        return ask(command, request).value;
-    }
-    /// The same, with the request's name and revision. A request that gives a revision fails unless it is still
-    /// current.
+    /// The command that reads, or writes, the state that a file can describe: state is "read" or "write". Throws
+    /// Failure(usage) when no plug-in has one, or several have.
+    [[nodiscard]] CommandRef stateCommand(std::string_view state);
+    /// The answer; its value is nothing for an answer of nothing. A request that gives a revision fails unless it is
+    /// still current. Throws Failure with the daemon's message, its findings and, after a failure inside the service,
+    /// the log lines of the request. Where the command changes something and its answer is missing: LostAnswer.
     [[nodiscard]] CommandAnswer ask(const CommandRef& command, const Dictionary& request,
                                     const std::string& revision = {});
-    /// What was logged while the request was performed; empty when the daemon does not know it any more.
-    [[nodiscard]] std::vector<std::string> logLines(const std::string& requestId);
+    /// What the daemon knows of a request now. A daemon that cannot be asked is a state, not a failure.
+    [[nodiscard]] RequestReport report(const std::string& requestId);
+    /// The same, waiting up to ten seconds for a request that is not done, and for a daemon that is not reachable.
+    [[nodiscard]] RequestReport settledReport(const std::string& requestId);
 
     /// What an address of the daemon answers. Throws as perform().
     [[nodiscard]] Value get(const std::string& path);
@@ -64,8 +116,8 @@ class DaemonClient {
     std::optional<std::vector<PluginInfo>> _plugins;
 };
 
-/// What the answer says of a failure: a status that is not 0, or a key that the description lists under its errors.
-/// One sentence; empty when the answer is none of an error.
+/// What the answer says of a failure: the keys that the description lists under its errors, unless they are null or the
+/// number 0. One sentence; empty when there is no error.
 [[nodiscard]] std::string errorOf(const Description& command, const Dictionary& answer);
 
 }  // namespace adminhost::ctl

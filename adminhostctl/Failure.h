@@ -13,6 +13,7 @@ enum class ExitStatus : int {
     usage = 2,
     notReachable = 3,  ///< no daemon behind the socket
     notPermitted = 4,
+    undetermined = 6,  ///< the answer to a write is missing, and whether everything was written cannot be determined
 };
 
 /// Ends the program with a message for people and a status; caught in one place, main().

@@ -47,7 +47,7 @@ std::string typeText(const DescribedKey& key) {
                                                : type;
 }
 
-/// Key paths are long and cannot be broken: each has a line of its own, and its meaning stands below.
+/// Key paths are long and cannot be broken: each has a line of its own, with its meaning below.
 std::string keyList(const std::vector<DescribedKey>& keys, std::size_t width) {
     constexpr std::size_t indent = 6;
     std::string text;
@@ -56,7 +56,7 @@ std::string keyList(const std::vector<DescribedKey>& keys, std::size_t width) {
         for (std::size_t i = 0; i < key.allowed.size(); ++i) {
             help += (i == 0 ? " One of " : ", ") + key.allowed[i] + (i + 1 == key.allowed.size() ? "." : "");
         }
-        help += key.required ? " Needed." : "";
+        help += key.required ? " Required." : "";
         help += key.secret ? " Secret: " + key.path + "@FILE or " + key.path + "@-." : "";
         text += "  " + shown(key.path) + " (" + shown(typeText(key)) + ")\n";
         for (const std::string& line : wrapped(shown(help), width - indent)) {
@@ -91,7 +91,7 @@ void helpOfCommand(const Context& context, const std::string& name) {
         context.out << "\nErrors:\n" << Reading(Description(), context.options.width).text(description.errors());
     }
     context.out << "\nExample of a request (as with --file):\n"
-                << jsonOf(description.example().get("request"), true) << '\n';
+                << shownJson(jsonOf(description.example().get("request"), true)) << '\n';
 }
 
 ExitStatus help(const Context& context, Words arguments) {
@@ -115,8 +115,7 @@ ExitStatus whois(const Context& context, Words arguments) {
     const Value answer = context.service.get("/v1/directory?is=" + Connection::escaped(arguments.front()));
     const Array* entries = answer.dictionary() == nullptr ? nullptr : answer.dictionary()->get("entries").array();
     if (entries == nullptr || entries->empty()) {
-        throw Failure(ExitStatus::answeredError,
-                      "the directory knows nobody with the name or UUID " + shown(arguments.front()));
+        throw usageError("no person or group in the directory has the name or UUID " + arguments.front());
     }
     if (context.options.format != Format::text) {
         writeValue(context, *entries, Description());
@@ -129,10 +128,10 @@ ExitStatus whois(const Context& context, Words arguments) {
 }
 
 constexpr std::array table = {
-    Verb{"status", "", "What the daemon runs now, its plug-ins and how many requests wait", 0, 0, &status},
-    Verb{"commands", "[--names]", "The commands, with a sentence each", 0, 0, &commands},
-    Verb{"help", "[COMMAND]", "The verbs, or a command's keys and answer", 0, 1, &help},
-    Verb{"whois", "NAME|UUID", "Who has this name or UUID, and which directory knows it", 1, 1, &whois},
+    Verb{"status", "", "Show the running request, the waiting ones and the plug-ins", 0, 0, &status},
+    Verb{"commands", "[--names]", "List the commands", 0, 0, &commands},
+    Verb{"help", "[COMMAND]", "List the verbs, or describe a command", 0, 1, &help},
+    Verb{"whois", "NAME|UUID", "Show the people and groups with this name or UUID", 1, 1, &whois},
 };
 
 }  // namespace

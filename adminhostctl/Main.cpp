@@ -4,9 +4,11 @@
 #include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/GeneralVerbs.h"
+#include "adminhostctl/Interrupt.h"
 #include "adminhostctl/Prompt.h"
 #include "adminhostctl/RequestArguments.h"
 #include "adminhostctl/Verb.h"
+#include "adminhostctl/Width.h"
 #include "adminhostctl/desired/DesiredVerbs.h"
 #include "adminhostctl/lumio/LumioVerbs.h"
 #include "platform/files/StandardDescriptors.h"
@@ -14,6 +16,7 @@
 #include <algorithm>
 #include <cstdlib>
 #include <iostream>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -29,7 +32,7 @@ using adminhost::ctl::Format;
 constexpr const char* defaultSocket = "/run/adminhostd/adminhostd.sock";
 constexpr std::size_t widthWithoutTerminal = 120;
 
-/// Columns of the terminal; COLUMNS, or a fixed number, where the output is none.
+/// Columns of the terminal; COLUMNS, or a fixed number, where the output is not a terminal.
 std::size_t outputWidth() {
     winsize size{};
     if (::isatty(STDOUT_FILENO) == 1 && ::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0) {
@@ -60,31 +63,38 @@ int runMain(int count, char** words) {
     std::string format = "text";
     std::vector<std::string> rest;
     CLI::App app(
-        "Administrates the service through its daemon.\n\"adminhostctl help\" lists the verbs, \"adminhostctl "
+        "Administers the service through its daemon.\n\"adminhostctl help\" lists the verbs, \"adminhostctl "
         "commands\" the service's commands.",
         "adminhostctl");
     app.add_option("--socket", socket, "The daemon's socket")->envname("ADMINHOST_SOCKET")->type_name("PATH");
-    app.add_option("--format", format, "How to write the answer: text (for reading), json or plist")
+    app.add_option("--format", format, "Format of the answer: text (for reading), json or plist")
         ->check(CLI::IsMember({"text", "json", "plist"}))
         ->type_name("FORMAT");
-    app.add_option("--file", options.file, "The request, as JSON or property list; - is standard input")
+    app.add_option("--file", options.file, "Read the request from a file, JSON or property list; - is standard input")
         ->type_name("FILE");
-    app.add_flag("--names", options.names, "Only names, one a line");
-    app.add_flag("--group", options.group, "With camera allow and camera deny: the names are groups'");
+    app.add_flag("--names", options.names, "Print only names, one a line");
+    app.add_flag("--group", options.group, "With camera allow and camera deny: the names are names of groups");
     app.add_option("--password-file", options.passwordFile,
-                   "With plan and apply: the grid account's password; - asks, or reads standard input")
+                   "With plan and apply: read the service's password from a file; - asks, or reads standard input")
         ->type_name("FILE");
+    bool clear = false;
+    app.add_flag("--clear", clear, "Remove a stored secret: without this an empty secret is rejected");
     bool protect = false;
     bool noProtect = false;
     CLI::Option* const on = app.add_flag("--protect", protect, "With property set: store the value encrypted");
-    app.add_flag("--no-protect", noProtect, "With property set: store the value as it is")->excludes(on);
+    app.add_flag("--no-protect", noProtect, "With property set: store the value unencrypted")->excludes(on);
     app.add_option("words", rest, "A verb or a command, and its arguments: KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-")
         ->type_name("WORD");
     app.set_version_flag("--version", std::string("adminhostctl ") + ADMINHOST_RELEASE);
     try {
         app.parse(count, words);
     } catch (const CLI::ParseError& error) {
-        return app.exit(error) == 0 ? statusOf(ExitStatus::done) : statusOf(ExitStatus::usage);
+        std::ostringstream out;
+        std::ostringstream err;
+        const bool isHelp = app.exit(error, out, err) == 0;
+        std::cout << out.str();
+        std::cerr << adminhost::ctl::shown(err.str());  // it repeats words of the command line
+        return isHelp ? statusOf(ExitStatus::done) : statusOf(ExitStatus::usage);
     }
     if (rest.empty()) {
         std::cerr << "adminhostctl: a verb or a command is missing; adminhostctl help lists them\n";
@@ -96,18 +106,20 @@ int runMain(int count, char** words) {
     try {
         adminhost::ctl::DaemonClient service(socket);
         const adminhost::ctl::Sources sources{&adminhost::ctl::readSource, &adminhost::ctl::askSecret,
-                                              adminhost::ctl::inputIsTerminal()};
+                                              adminhost::ctl::inputIsTerminal(), clear};
         const std::vector<adminhost::ctl::Verb> verbs = allVerbs();
         const ExitStatus status = adminhost::ctl::run({service, options, sources, std::cout, std::cerr, verbs}, rest);
         std::cout.flush();
+        adminhost::ctl::endIfInterrupted();
         if (!std::cout) {
-            std::cerr << "adminhostctl: the answer could not be written\n";
+            std::cerr << "adminhostctl: standard output cannot be written\n";
             return statusOf(ExitStatus::usage);
         }
         return statusOf(status);
     } catch (const adminhost::ctl::Failure& failure) {
         std::cout.flush();
-        std::cerr << "adminhostctl: " << failure.what() << '\n';
+        std::cerr << "adminhostctl: " << adminhost::ctl::shown(failure.what()) << '\n';
+        adminhost::ctl::endIfInterrupted();
         return statusOf(failure.status());
     }
 }
@@ -122,7 +134,7 @@ int main(int count, char** words) {
     try {
         return runMain(count, words);
     } catch (const std::exception& error) {
-        std::cerr << "adminhostctl: " << error.what() << '\n';
+        std::cerr << "adminhostctl: " << adminhost::ctl::shown(error.what()) << '\n';
         return statusOf(ExitStatus::answeredError);
     }
 }

@@ -102,7 +102,7 @@ std::string readSource(const std::string& path) {
     const bool isInput = path == "-";
     static bool inputWasRead = false;
     if (isInput && inputWasRead) {
-        throw usageError("standard input can be read only once");
+        throw usageError("standard input can be read only once; use a file for the other value");
     }
     inputWasRead = inputWasRead || isInput;
     const std::unique_ptr<std::FILE, CloseFile> opened(isInput ? nullptr : std::fopen(path.c_str(), "rbe"));
@@ -124,16 +124,17 @@ std::string readSource(const std::string& path) {
     return bytes;
 }
 
-std::string askSecret(const std::string& key) {
+namespace {
+
+std::string askOnce(const std::string& key, const std::string& question) {
     std::string line;
     bool ended = false;
     {
         const SignalGuard signals;
         const EchoGuard echo;
         if (!echo.changed()) {
-            throw usageError("the terminal does not hide what is typed; give " + key + " with a file");
+            throw usageError(key + ": the terminal cannot hide what is typed; use @FILE");
         }
-        const std::string question = key + ": ";
         static_cast<void>(!::write(STDERR_FILENO, question.data(), question.size()));
         char c = 0;
         while (!ended && c != '\n') {
@@ -144,14 +145,24 @@ std::string askSecret(const std::string& key) {
         }
     }
     if (const int number = caughtSignal; number != 0) {
-        // The terminal is as it was; now let the signal do what it does.
+        // The terminal is restored; now let the signal do what it does.
         static_cast<void>(std::raise(number));
         throw usageError("interrupted");
     }
     if (ended && line.empty()) {
-        throw usageError(key + " was not given");
+        throw usageError(key + ": no value was typed");
     }
     return line;
+}
+
+}  // namespace
+
+std::string askSecret(const std::string& key) {
+    const std::string first = askOnce(key, key + ": ");
+    if (askOnce(key, key + " again: ") != first) {
+        throw usageError(key + ": the two values differ; nothing was sent");
+    }
+    return first;
 }
 
 }  // namespace adminhost::ctl

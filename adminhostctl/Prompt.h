@@ -1,6 +1,6 @@
 #pragma once
 
-// Standard input, as it is asked for values.
+// Values from files, standard input and people.
 
 #include <string>
 
@@ -13,8 +13,9 @@ namespace adminhost::ctl {
 /// when standard input is asked for twice.
 [[nodiscard]] std::string readSource(const std::string& path);
 
-/// Asks for a secret on the terminal without showing what is typed. A signal that would end or stop the program puts
-/// the terminal back first. Throws Failure(usage) when the input ends without a line.
+/// Asks for a secret on the terminal, and once more, without showing what is typed. A signal that would end or stop the
+/// program restores the terminal first. Throws Failure(usage) when the input ends without a line, and when the two
+/// lines differ.
 [[nodiscard]] std::string askSecret(const std::string& key);
 
 }  // namespace adminhost::ctl

@@ -22,16 +22,6 @@ bool isTable(const Value& value) {
            std::all_of(array->begin(), array->end(), [](const Value& v) { return v.dictionary() != nullptr; });
 }
 
-bool isPeople(const Value& value) {
-    return isTable(value) && std::all_of(value.array()->begin(), value.array()->end(),
-                                         [](const Value& v) { return !personText(*v.dictionary()).empty(); });
-}
-
-/// Whether the value gets lines of its own below its key.
-bool isSection(const Value& value) {
-    return (value.dictionary() != nullptr && !value.dictionary()->empty()) || (isTable(value) && !isPeople(value));
-}
-
 /// The number of a number, also of one that is stored as text.
 std::optional<double> numberOf(const Value& value) {
     if (const auto real = value.real()) {
@@ -88,20 +78,38 @@ std::string dateText(Date date) {
                        parts.tm_year + 1900L, parts.tm_hour, parts.tm_min);
 }
 
-std::string personText(const Dictionary& entry) {
-    const std::string* type = entry.get("type").string();
-    const std::string* name = entry.get("longName").string();
-    if (name == nullptr || name->empty()) {
-        name = entry.get("shortName").string();
-    }
-    if (type == nullptr || (*type != "user" && *type != "group")) {
+std::string personText(const DescribedKey& element, const Dictionary& entry) {
+    const auto textAt = [&](const std::string& key) {
+        const std::string* text = entry.get(key).string();
+        return text != nullptr ? *text : std::string();
+    };
+    const std::string kind = textAt(element.kind);
+    if (kind.empty()) {
         return {};
     }
-    const std::string* guid = entry.get("guid").string();
-    if (name == nullptr && guid == nullptr) {
-        return {};
+    for (const std::string& key : element.title) {
+        if (const std::string text = textAt(key); !text.empty()) {
+            return shown(text) + " (" + shown(kind) + ")";
+        }
     }
-    return shown(name != nullptr ? *name : *guid) + " (" + *type + ")";
+    return {};
+}
+
+std::string Reading::personAt(const Dictionary& entry, const std::string& path) const {
+    const DescribedKey* element = _description.answerKey(path);
+    return element != nullptr && !element->title.empty() ? personText(*element, entry) : std::string();
+}
+
+bool Reading::isPeople(const Value& value, const std::string& path) const {
+    return isTable(value) && std::all_of(value.array()->begin(), value.array()->end(), [&](const Value& element) {
+               return !personAt(*element.dictionary(), path + "[]").empty();
+           });
+}
+
+/// Whether the value gets lines of its own below its key.
+bool Reading::isSection(const Value& value, const std::string& path) const {
+    return (value.dictionary() != nullptr && !value.dictionary()->empty()) ||
+           (isTable(value) && !isPeople(value, path));
 }
 
 std::string Reading::cell(const Value& value, const std::string& path) const {
@@ -124,7 +132,7 @@ std::string Reading::cell(const Value& value, const std::string& path) const {
         std::string text;
         for (const Value& element : *array) {
             const Dictionary* entry = element.dictionary();
-            std::string one = entry != nullptr ? personText(*entry) : std::string();
+            std::string one = entry != nullptr ? personAt(*entry, path + "[]") : std::string();
             text += (text.empty() ? "" : ", ") + (one.empty() ? cell(element, path + "[]") : one);
         }
         return text.empty() ? "none" : text;
@@ -176,15 +184,15 @@ void Reading::appendTable(std::string& text, const Array& rows, const std::strin
 
 void Reading::appendDictionary(std::string& text, const Dictionary& dictionary, const std::string& path,
                                std::size_t indent) const {
+    const auto below = [&](const DictionaryEntry& entry) { return path.empty() ? entry.key : path + '.' + entry.key; };
     std::size_t longest = 0;
     for (const DictionaryEntry& entry : dictionary) {
-        longest = isSection(entry.value) ? longest : std::max(longest, widthOf(shown(entry.key)));
+        longest = isSection(entry.value, below(entry)) ? longest : std::max(longest, widthOf(shown(entry.key)));
     }
-    const auto below = [&](const DictionaryEntry& entry) { return path.empty() ? entry.key : path + '.' + entry.key; };
     const std::size_t column = indent + longest + 2;
     // Single values first: between tables they would be lost.
     for (const DictionaryEntry& entry : dictionary) {
-        if (isSection(entry.value)) {
+        if (isSection(entry.value, below(entry))) {
             continue;
         }
         const std::string key = shown(entry.key);
@@ -201,7 +209,7 @@ void Reading::appendDictionary(std::string& text, const Dictionary& dictionary, 
     }
     bool empty = text.empty();
     for (const DictionaryEntry& entry : dictionary) {
-        if (!isSection(entry.value)) {
+        if (!isSection(entry.value, below(entry))) {
             continue;
         }
         text += empty ? "" : "\n";
@@ -221,7 +229,7 @@ std::string Reading::text(const Value& value, const std::string& path) const {
     std::string text;
     if (value.dictionary() != nullptr && !value.dictionary()->empty()) {
         appendDictionary(text, *value.dictionary(), path, 0);
-    } else if (isTable(value) && !isPeople(value)) {
+    } else if (isTable(value) && !isPeople(value, path)) {
         appendTable(text, *value.array(), path, 0);
     } else {
         for (const std::string& line : wrapped(cell(value, path), _width)) {

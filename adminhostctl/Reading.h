@@ -1,6 +1,6 @@
 #pragma once
 
-// Answers as people read them: aligned keys, tables for lists of dictionaries, sizes, durations and dates in words.
+// Answers as people read them: aligned keys, tables for lists of dictionaries, sizes, durations and dates as texts.
 
 #include "adminhostctl/Description.h"
 #include "platform/value/Value.h"
@@ -16,13 +16,16 @@ class Reading {
   public:
     Reading(const Description& description, std::size_t width) noexcept : _description(description), _width(width) {}
 
-    /// The text of a value that stands at the path of the answer; "" is the whole answer. Ends in a line feed.
+    /// The text of the value at the path of the answer; "" is the whole answer. Ends in a line feed.
     [[nodiscard]] std::string text(const Value& value, const std::string& path = {}) const;
 
   private:
     void appendDictionary(std::string& text, const Dictionary& dictionary, const std::string& path,
                           std::size_t indent) const;
     void appendTable(std::string& text, const Array& rows, const std::string& path, std::size_t indent) const;
+    [[nodiscard]] bool isPeople(const Value& value, const std::string& path) const;
+    [[nodiscard]] bool isSection(const Value& value, const std::string& path) const;
+    [[nodiscard]] std::string personAt(const Dictionary& entry, const std::string& path) const;
     [[nodiscard]] std::string cell(const Value& value, const std::string& path) const;
 
     const Description& _description;
@@ -33,7 +36,7 @@ class Reading {
 [[nodiscard]] std::string sizeText(std::uint64_t bytes);
 /// "31 Jan 2026, 09:00", local time.
 [[nodiscard]] std::string dateText(Date date);
-/// "Anna Berg (user)" for a dictionary that names a person or group; empty for another one.
-[[nodiscard]] std::string personText(const Dictionary& entry);
+/// "Anna Berg (user)" for a dictionary that the key describes as a person or group; empty for another one.
+[[nodiscard]] std::string personText(const DescribedKey& element, const Dictionary& entry);
 
 }  // namespace adminhost::ctl

@@ -29,7 +29,7 @@ struct Argument {
 Argument parseArgument(const std::string& word) {
     const std::size_t at = word.find_first_of("=@");
     if (at == std::string::npos || at == 0 || word.starts_with(":=")) {
-        throw usageError("\"" + word + "\" is no KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-");
+        throw usageError("\"" + word + "\" is not KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-");
     }
     if (word[at] == '@') {
         return {word.substr(0, at), Form::file, word.substr(at + 1)};
@@ -53,7 +53,7 @@ std::vector<Step> stepsOf(const std::string& key) {
         const std::size_t dot = key.find('.', begin);
         steps.push_back({key.substr(begin, dot - begin), std::nullopt});
         if (steps.back().text.empty()) {
-            throw usageError("\"" + key + "\" is no key path");
+            throw usageError("\"" + key + "\" is not a key path");
         }
         if (dot == std::string::npos) {
             return steps;
@@ -69,8 +69,8 @@ std::optional<std::size_t> indexOf(const std::string& segment) {
     return result.ec == std::errc() && result.ptr == end ? std::optional(index) : std::nullopt;
 }
 
-/// The path as descriptions write it ("configuration.properties.0.name" is "configuration.properties[].name"); says of
-/// each step whether it is a list's element.
+/// The path as descriptions write it ("configuration.properties.0.name" is "configuration.properties[].name"); marks
+/// the steps that are elements of a list.
 std::string describedPath(const Description& command, std::vector<Step>& steps) {
     std::string path;
     for (Step& step : steps) {
@@ -86,7 +86,7 @@ std::string describedPath(const Description& command, std::vector<Step>& steps) 
     return path;
 }
 
-/// Whether something above the path takes any value, whatever stands in it.
+/// Whether a key above the path accepts any value.
 bool isBelowAny(const Description& command, const std::string& path) {
     for (std::size_t at = path.find_last_of(".["); at != std::string::npos && at > 0;
          at = path.find_last_of(".[", at - 1)) {
@@ -109,7 +109,7 @@ void store(Value& node, std::span<const Step> steps, Value value, const std::str
     }
     if (Array* array = node.array(); array != nullptr && step.index) {
         if (*step.index > array->size()) {
-            throw usageError(key + ": the list has " + std::to_string(array->size()) + " elements, so " + step.text +
+            throw usageError(key + ": the list has " + std::to_string(array->size()) + " elements; " + step.text +
                              " is neither one of them nor the next");
         }
         if (*step.index == array->size()) {
@@ -120,7 +120,7 @@ void store(Value& node, std::span<const Step> steps, Value value, const std::str
     }
     Dictionary* dictionary = node.dictionary();
     if (dictionary == nullptr || step.index) {
-        throw usageError(key + ": " + step.text + " does not stand in a " + (step.index ? "list" : "dictionary"));
+        throw usageError(key + ": " + step.text + " is not in a " + (step.index ? "list" : "dictionary"));
     }
     if (Value* below = dictionary->find(step.text)) {
         store(*below, steps.subspan(1), std::move(value), key);
@@ -131,7 +131,7 @@ void store(Value& node, std::span<const Step> steps, Value value, const std::str
     dictionary->set(step.text, std::move(below));
 }
 
-/// The key path of a secret in a value that stands on the command line; empty if there is none.
+/// The key path of a secret in a value of the command line; empty if there is none.
 std::string secretIn(const Description& command, const Value& value, const std::string& path) {
     if (const DescribedKey* key = command.key(path); key != nullptr && key->secret) {
         return path;
@@ -217,12 +217,21 @@ std::string withoutLineEnd(std::string text) {
     return text;
 }
 
+/// The value of a text that was read. A secret that is empty by mistake (standard input is /dev/null) would remove the
+/// stored one.
+Value notEmpty(const DescribedKey& key, const std::string& text, const Sources& sources) {
+    if (key.secret && text.empty() && !sources.clear) {
+        throw usageError(key.path + ": the value is empty; use --clear to remove the stored one");
+    }
+    return valueOfText(key, text);
+}
+
 Value valueOfFile(const DescribedKey& key, const std::string& path, const Sources& sources) {
     if (path.empty()) {
-        throw usageError(key.path + "@ needs the name of a file, or - for standard input");
+        throw usageError(key.path + ": the name of a file is missing after \"@\"; - is standard input");
     }
     if (path == "-" && key.secret && sources.terminal) {
-        return sources.ask(key.path);
+        return notEmpty(key, sources.ask(key.path), sources);
     }
     std::string bytes = sources.read(path);
     if (key.type == "data") {
@@ -232,9 +241,9 @@ Value valueOfFile(const DescribedKey& key, const std::string& path, const Source
         return parseStructure(bytes, path);
     }
     if (!isUtf8(bytes)) {
-        throw usageError(path + " is no UTF-8 text");
+        throw usageError(path + ": not UTF-8 text");
     }
-    return valueOfText(key, withoutLineEnd(std::move(bytes)));
+    return notEmpty(key, withoutLineEnd(std::move(bytes)), sources);
 }
 
 }  // namespace
@@ -242,7 +251,7 @@ Value valueOfFile(const DescribedKey& key, const std::string& path, const Source
 Value valueOfText(const DescribedKey& key, const std::string& text) {
     const std::string& type = key.enteredAs.empty() ? key.type : key.enteredAs;
     if (isStructure(key) || type == "data") {
-        throw usageError(key.path + " takes a " + type + ": write " + key.path +
+        throw usageError(key.path + ": the value is " + (type == "data" ? "data" : "a " + type) + "; use " + key.path +
                          (type == "data" ? "@FILE" : ":=JSON or " + key.path + "@FILE"));
     }
     std::optional<Value> value;
@@ -252,36 +261,42 @@ Value valueOfText(const DescribedKey& key, const std::string& text) {
         if (!value) {
             value = numberOf<std::uint64_t>(text);
         }
-        wanted = "whole number";
+        wanted = "a whole number";
     } else if (type == "real") {
         value = numberOf<double>(text);
-        wanted = "number";
+        wanted = "a number";
     } else if (type == "boolean") {
         value = booleanOfText(text);
         wanted = "yes or no";
     } else if (type == "date") {
         value = dateOfText(text);
-        wanted = "date such as \"2026-01-31 08:00\"";
+        wanted = "a date such as \"2026-01-31 08:00\"";
     } else {
         value = text;
     }
     if (!value) {
-        throw usageError(key.path + ": \"" + text + "\" is no " + wanted);
+        throw usageError(key.path + ": \"" + text + "\" is not " + wanted);
     }
     return std::move(*value);
 }
 
 Value valueOfWord(const DescribedKey& key, const std::optional<std::string>& word, const Sources& sources) {
+    if (!word && key.secret && sources.clear) {
+        return "";
+    }
     if (word && word->starts_with('@')) {
         return valueOfFile(key, word->substr(1), sources);
     }
     if (key.secret && word) {
-        throw usageError(key.path + " is secret and others can read command lines: write @FILE, or @- to be asked");
+        throw usageError(key.path +
+                         ": a secret is not accepted on the command line, which others can read; use @FILE, or " +
+                         "@- to be asked");
     }
     if (!word && !(key.secret && sources.terminal)) {
-        throw usageError(key.path + " needs a value: " + (key.secret ? "@FILE or @-" : "TEXT, @FILE or @-"));
+        throw usageError(key.path + ": the value is missing; use " +
+                         (key.secret ? "@FILE or @-" : "TEXT, @FILE or @-"));
     }
-    return word ? valueOfText(key, *word) : Value(sources.ask(key.path));
+    return word ? valueOfText(key, *word) : notEmpty(key, sources.ask(key.path), sources);
 }
 
 std::string textOfWord(const DescribedKey& key, const std::optional<std::string>& word, const Sources& sources) {
@@ -293,8 +308,7 @@ Dictionary parseRequest(std::string_view bytes, const std::string& from) {
     Value value = parseStructure(bytes, from);
     Dictionary* dictionary = value.dictionary();
     if (dictionary == nullptr) {
-        throw usageError(from + ": a request is a dictionary, not a value of type " +
-                         std::string(nameOf(value.type())));
+        throw usageError(from + ": a request is a dictionary, not a " + std::string(nameOf(value.type())));
     }
     return std::move(*dictionary);
 }
@@ -306,7 +320,7 @@ Dictionary buildRequest(const Description& command, Dictionary base, const std::
     for (const std::string& word : arguments) {
         const Argument argument = parseArgument(word);
         if (!given.insert(argument.key).second) {
-            throw usageError(argument.key + " is given twice");
+            throw usageError(argument.key + ": given twice");
         }
         std::vector<Step> steps = stepsOf(argument.key);
         const std::string path = describedPath(command, steps);
@@ -317,8 +331,8 @@ Dictionary buildRequest(const Description& command, Dictionary base, const std::
             key = &any;
         }
         if (key == nullptr && argument.form != Form::json) {
-            throw usageError(command.name() + " has no key " + argument.key + "; see adminhostctl help " +
-                             command.name() + ", or write " + argument.key + ":=JSON to send it all the same");
+            throw usageError(command.name() + " has no key " + argument.key + "; adminhostctl help " + command.name() +
+                             " lists its keys, " + argument.key + ":=JSON sends it nevertheless");
         }
         Value value;
         if (argument.form == Form::file) {
@@ -326,15 +340,16 @@ Dictionary buildRequest(const Description& command, Dictionary base, const std::
         } else {
             value = argument.form == Form::json ? parseStructure(argument.value, argument.key) : Value(argument.value);
             if (const std::string secret = secretIn(command, value, path); !secret.empty()) {
-                throw usageError(secret + " is secret and others can read command lines: write " + argument.key +
-                                 (secret == path ? "@FILE, or " + argument.key + "@- to be asked" : "@FILE"));
+                throw usageError(
+                    secret + ": a secret is not accepted on the command line, which others can read; use " +
+                    argument.key + (secret == path ? "@FILE, or " + argument.key + "@- to be asked" : "@FILE"));
             }
             if (argument.form == Form::text) {
                 value = valueOfText(*key, argument.value);
             }
         }
         if (value.isNull()) {
-            throw usageError(argument.key + ": null is no value; leave the key out instead");
+            throw usageError(argument.key + ": null is not a value; omit the key instead");
         }
         store(request, steps, std::move(value), argument.key);
     }

@@ -128,7 +128,7 @@ std::string Table::text(std::size_t width, std::size_t indent) const {
         appendRow(text, row, columns, indent);
     }
     if (!leftOut.empty()) {
-        text.append(indent, ' ').append("(not shown for want of room: " + leftOut + ")\n");
+        text.append(indent, ' ').append("(omitted columns: " + leftOut + ")\n");
     }
     return text;
 }

@@ -1,6 +1,7 @@
 #include "adminhostctl/Verb.h"
 
 #include "adminhostctl/Reading.h"
+#include "adminhostctl/Width.h"
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/value/ValueText.h"
@@ -12,6 +13,28 @@ namespace {
 
 using Words = std::span<const std::string>;
 
+void printNotDone(const Context& context, const RequestReport& report) {
+    if (report.notDone.empty()) {
+        return;
+    }
+    context.err << "adminhostctl: these parts of the request were not carried out:\n";
+    for (const ReportedGap& gap : report.notDone) {
+        context.err << "  " << shown(gapText(gap)) << '\n';
+    }
+    if (report.notDoneDropped > 0) {
+        context.err << "  and " << report.notDoneDropped << " more\n";
+    }
+}
+
+std::string changeText(const ReportedChange& change) {
+    const auto valueText = [&](const Value& value) {
+        return change.secret ? "(secret)" : value.isNull() ? "(not set)" : textOf(value);
+    };
+    const std::string& name = change.name.empty() ? change.identity : change.name;
+    return change.section + (name.empty() ? "" : '.' + name) + (change.key.empty() ? "" : '.' + change.key) + ": " +
+           valueText(change.from) + " -> " + valueText(change.to);
+}
+
 ExitStatus perform(const Context& context, Words words) {
     const CommandRef command = context.service.command(words.front());
     Dictionary base;
@@ -20,14 +43,26 @@ ExitStatus perform(const Context& context, Words words) {
     }
     const Dictionary request =
         buildRequest(command.description, std::move(base), {words.begin() + 1, words.end()}, context.sources);
-    const auto answer = context.service.perform(command, request);
-    if (!answer) {
-        context.out << (context.options.format == Format::text ? "done\n" : "");
-        return ExitStatus::done;
+    CommandAnswer answer;
+    try {
+        answer = context.service.ask(command, request);
+    } catch (const LostAnswer& lost) {
+        const RequestReport report = reportLost(context, lost);
+        return report.state == RequestReport::State::done ? ExitStatus::answeredError : ExitStatus::undetermined;
     }
-    writeValue(context, *answer, command.description);
-    return reportAnswered(context,
-                          answer->dictionary() != nullptr ? errorOf(command.description, *answer->dictionary()) : "");
+    ExitStatus status = ExitStatus::done;
+    if (!answer.value) {
+        context.out << (context.options.format == Format::text && !answer.notDone ? "done\n" : "");
+    } else {
+        writeValue(context, *answer.value, command.description);
+        const Dictionary* dictionary = answer.value->dictionary();
+        status = reportAnswered(context, dictionary != nullptr ? errorOf(command.description, *dictionary) : "");
+    }
+    if (answer.notDone) {
+        status = ExitStatus::answeredError;
+        printNotDone(context, context.service.report(answer.requestId));
+    }
+    return status;
 }
 
 std::vector<std::string> splitWords(std::string_view words) {
@@ -46,15 +81,16 @@ void writeValue(const Context& context, const Value& value, const Description& d
             context.out << Reading(description, context.options.width).text(value, path);
             break;
         case Format::json:
-            context.out << jsonOf(value, true) << '\n';
+            context.out << shownJson(jsonOf(value, true)) << '\n';
             break;
         case Format::plist: {
             Error error;
             const auto text = xmlPropertyList(value, &error);
             if (!text) {
-                throw Failure(ExitStatus::answeredError, "a property list cannot carry the answer: " + textOf(error));
+                throw Failure(ExitStatus::answeredError,
+                              "the answer cannot be written as a property list: " + textOf(error));
             }
-            context.out << *text;
+            context.out << shownXml(*text);
             break;
         }
     }
@@ -64,8 +100,42 @@ ExitStatus reportAnswered(const Context& context, const std::string& error) {
     if (error.empty()) {
         return ExitStatus::done;
     }
-    context.err << "adminhostctl: the service answered an error: " << error << '\n';
+    context.err << "adminhostctl: the service returned an error: " << error << '\n';
     return ExitStatus::answeredError;
+}
+
+std::string gapText(const ReportedGap& gap) {
+    return gap.keyPath + (gap.keyPath.empty() ? "" : ": ") + gap.reason +
+           (gap.toolMessage.empty() ? "" : " (" + gap.toolMessage + ")");
+}
+
+RequestReport reportLost(const Context& context, const LostAnswer& lost) {
+    context.err << "adminhostctl: " << shown(lost.what()) << '\n';
+    const RequestReport report = context.service.settledReport(lost.requestId());
+    const char* const state = report.state == RequestReport::State::done      ? "has ended"
+                              : report.state == RequestReport::State::running ? "is still running"
+                              : report.state == RequestReport::State::waiting ? "is still waiting"
+                              : report.state == RequestReport::State::unknown
+                                  ? "is not known to the daemon"
+                                  : "cannot be looked up: the daemon cannot be reached";
+    context.err << "adminhostctl: the request " << shown(lost.requestId()) << ' ' << state << "; it was not repeated\n";
+    if (!report.changes.empty()) {
+        context.err << "the daemon reports these changes:\n";
+        for (const ReportedChange& change : report.changes) {
+            context.err << "  " << shown(changeText(change)) << '\n';
+        }
+        if (report.changesDropped > 0) {
+            context.err << "  and " << report.changesDropped << " more\n";
+        }
+    }
+    printNotDone(context, report);
+    if (!report.log.empty()) {
+        context.err << "log lines of the request:\n";
+        for (const std::string& line : report.log) {
+            context.err << "  " << shown(line) << '\n';
+        }
+    }
+    return report;
 }
 
 std::optional<std::string> wordAt(Words arguments, std::size_t index) {
@@ -84,13 +154,13 @@ ExitStatus run(const Context& context, const std::vector<std::string>& words) {
         }
         const Words arguments = Words(words).subspan(own.size());
         if (arguments.size() < verb.least || arguments.size() > verb.most) {
-            throw usageError("write adminhostctl " + std::string(verb.words) +
+            throw usageError("usage: adminhostctl " + std::string(verb.words) +
                              (verb.arguments.empty() ? "" : " " + std::string(verb.arguments)));
         }
         return verb.run(context, arguments);
     }
     if (!known.empty()) {
-        throw usageError("there are " + known);
+        throw usageError("\"" + words.front() + "\" needs another word: " + known);
     }
     return perform(context, words);
 }

@@ -22,7 +22,7 @@ enum class Format { text, json, plist };
 struct VerbOptions {
     Format format = Format::text;
     std::string file;                 ///< of the whole request; empty for none
-    std::string passwordFile;         ///< of the grid password; empty for none
+    std::string passwordFile;         ///< of the secret setting of a desired state; empty for none
     bool names = false;               ///< only names, one a line, for completion
     bool group = false;               ///< short names are groups'
     std::optional<bool> isProtected;  ///< whether a property is to be protected
@@ -50,12 +50,19 @@ struct Verb {
     ExitStatus (*run)(const Context& context, std::span<const std::string> arguments);
 };
 
-/// Writes a value in the asked format; as text, it stands at the path of the command's answer. Throws Failure.
+/// Writes a value in the asked format; as text, as the value at the path of the command's answer. Throws Failure.
 void writeValue(const Context& context, const Value& value, const Description& description,
                 const std::string& path = {});
 
-/// Reports the error of an answer (errorOf()) on standard error; done if there is none.
+/// Prints the error of an answer (errorOf()) on standard error; done if there is none.
 [[nodiscard]] ExitStatus reportAnswered(const Context& context, const std::string& error);
+
+/// "configuration.cameras.0: reason (words of the tool)".
+[[nodiscard]] std::string gapText(const ReportedGap& gap);
+
+/// Prints on standard error why the answer to a request is missing and what became of it, without repeating it: what
+/// the daemon reports as changed and as not done, and the log lines. Returns what it has printed.
+RequestReport reportLost(const Context& context, const LostAnswer& lost);
 
 /// The argument at the index, if so many were given.
 [[nodiscard]] std::optional<std::string> wordAt(std::span<const std::string> arguments, std::size_t index);

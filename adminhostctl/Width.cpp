@@ -48,6 +48,23 @@ bool isActedOn(char32_t code) noexcept {
            (code >= 0x2028 && code <= 0x202E) || (code >= 0x2066 && code <= 0x2069);
 }
 
+template <typename Write>
+std::string replaced(std::string_view text, const Write& write) {
+    const std::string clean = utf8Of(text);
+    std::string out;
+    for (std::size_t at = 0; at < clean.size();) {
+        const Utf8Character character = firstCharacterOf(std::string_view(clean).substr(at));
+        // Formats are laid out with line feeds and tabs of their own, and escape those of values.
+        if (isActedOn(character.code) && character.code != '\n' && character.code != '\t') {
+            out += write(static_cast<std::uint32_t>(character.code));
+        } else {
+            out.append(clean, at, character.size);
+        }
+        at += character.size;
+    }
+    return out;
+}
+
 /// Length of the longest beginning that takes at most so many columns; at least one character.
 std::size_t fitting(std::string_view text, std::size_t width) {
     std::size_t at = 0;
@@ -80,6 +97,14 @@ std::string shown(std::string_view text) {
         at += character.size;
     }
     return out;
+}
+
+std::string shownJson(std::string_view json) {
+    return replaced(json, [](std::uint32_t code) { return fmt::format("\\u{:04x}", code); });
+}
+
+std::string shownXml(std::string_view xml) {
+    return replaced(xml, [](std::uint32_t code) { return fmt::format("&#x{:x};", code); });
 }
 
 std::size_t widthOf(std::string_view text) {

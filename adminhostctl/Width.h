@@ -13,6 +13,11 @@ namespace adminhost::ctl {
 /// U+007F and those that change the direction of writing. Line feeds stay.
 [[nodiscard]] std::string shown(std::string_view text);
 
+/// JSON text with the same characters written as \uNNNN. Both lose nothing: such characters stand only within strings.
+[[nodiscard]] std::string shownJson(std::string_view json);
+/// XML text with the same characters written as &#xNN;
+[[nodiscard]] std::string shownXml(std::string_view xml);
+
 /// Columns that the text takes: wide characters two, combining ones none. For texts without control characters.
 [[nodiscard]] std::size_t widthOf(std::string_view text);
 

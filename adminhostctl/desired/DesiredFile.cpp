@@ -3,9 +3,9 @@
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/Toml.h"
-#include "adminhostctl/desired/Writing.h"
 
 #include <algorithm>
+#include <optional>
 #include <set>
 
 #include <fmt/format.h>
@@ -14,29 +14,36 @@
 namespace adminhost::ctl {
 namespace {
 
-constexpr std::string_view introduction =
-    "# The desired state: \"adminhostctl plan FILE\" shows what would change, \"adminhostctl apply FILE\" changes it.\n"
-    "# What is not listed stays as it is, unless a switch here says otherwise.\n"
-    "\n"
-    "[remove_unlisted]\n"
-    "properties = false\n"
-    "access = false\n";
+constexpr std::string_view switchesTable = "remove_unlisted";
 
 /// Text of a comment: one line.
 std::string comment(const std::string& text) {
     return "# " + text + '\n';
 }
 
-std::vector<std::string> namesOf(const ListedCamera& camera, std::string_view kind) {
-    std::vector<std::string> names;
-    for (const ListedPerson& person : camera.allowed) {
-        if (person.kind == kind && !person.shortName.empty()) {
-            names.push_back(person.shortName);
+std::string introduction(const StateForm& form) {
+    std::string text =
+        "# The desired state: \"adminhostctl plan FILE\" shows what would change, \"adminhostctl apply FILE\" changes "
+        "it.\n"
+        "# What is not listed stays as it is, unless a switch here says otherwise.\n"
+        "\n";
+    text += "[" + std::string(switchesTable) + "]\n";
+    for (const std::string& name : form.switches()) {
+        text += tomlKey(name) + " = false\n";
+    }
+    return text;
+}
+
+std::vector<std::string> labelsOf(const std::vector<Person>& people, std::string_view kind) {
+    std::vector<std::string> labels;
+    for (const Person& person : people) {
+        if (person.kind == kind && !person.label.empty()) {
+            labels.push_back(person.label);
         }
     }
-    std::sort(names.begin(), names.end());
-    names.erase(std::unique(names.begin(), names.end()), names.end());
-    return names;
+    std::sort(labels.begin(), labels.end());
+    labels.erase(std::unique(labels.begin(), labels.end()), labels.end());
+    return labels;
 }
 
 std::string listText(const std::vector<std::string>& texts) {
@@ -47,53 +54,52 @@ std::string listText(const std::vector<std::string>& texts) {
     return '[' + list + ']';
 }
 
-void appendProperties(std::string& text, const std::vector<ListedProperty>& all) {
-    std::vector<const ListedProperty*> sorted;
-    std::multiset<std::string> names;
-    for (const ListedProperty& property : all) {
-        sorted.push_back(&property);
-        names.insert(property.name);
-    }
-    std::stable_sort(sorted.begin(), sorted.end(),
-                     [](const ListedProperty* a, const ListedProperty* b) { return a->name < b->name; });
-    for (const ListedProperty* property : sorted) {
-        text += '\n';
-        if (property->name.empty() || names.count(property->name) > 1) {
-            text += comment("properties." + tomlKey(property->name) + ", row " + property->id +
-                            ": not managed here, its name does not stand for it alone");
-            continue;
-        }
-        text += "[properties." + tomlKey(property->name) + "]\n";
-        text += property->value         ? "value = " + tomlText(*property->value) + '\n'
-                : property->isProtected ? comment("value = (secret)")
-                                        : std::string();
-        text += std::string("protect = ") + (property->isProtected ? "true" : "false") + '\n';
-    }
-}
-
-/// The name, or the UUID where the name does not find this camera alone.
-std::string keyOf(const State& state, const ListedCamera& camera) {
+/// What a file names the element by: its label, its identity where the label does not find this element alone, or
+/// nothing.
+std::optional<std::string> nameOf(const State& state, const ListForm& list, const Element& element) {
     try {
-        return !camera.name.empty() && findCamera(state, camera.name) == &camera ? camera.name : camera.uuid;
+        if (!element.label.empty() && findElement(state, list, element.label) == &element) {
+            return element.label;
+        }
     } catch (const Failure&) {
-        return camera.uuid;
+        // several have the label
+    }
+    return list.byIdentity ? std::optional(element.identity) : std::nullopt;
+}
+
+void appendElement(std::string& text, const ListForm& list, const std::string& name, const Element& element) {
+    text += "\n[" + tomlKey(list.section) + '.' + tomlKey(name) + "]\n";
+    if (name != element.label) {
+        text += comment("name: " + tomlText(element.label));
+    }
+    for (const FieldForm& field : list.fields) {
+        const Value& value = element.fields.get(field.key);
+        if (isSecret(field, element)) {
+            text += comment(tomlKey(field.inFile) + " = (secret)");
+        } else if (const auto written = tomlValue(value)) {
+            text += tomlKey(field.inFile) + " = " + *written + '\n';
+        }
+    }
+    for (const PeopleForm& people : list.people) {
+        for (const auto& [kind, inFile] : people.kinds) {
+            text += tomlKey(inFile) + " = " + listText(labelsOf(element.people.at(people.key), kind)) + '\n';
+        }
     }
 }
 
-void appendCameras(std::string& text, const State& state) {
-    std::vector<std::pair<std::string, const ListedCamera*>> sorted;
-    for (const ListedCamera& camera : *state.cameras) {
-        sorted.emplace_back(keyOf(state, camera), &camera);
+void appendSection(std::string& text, const State& state, const ListForm& list) {
+    std::vector<std::pair<std::string, const Element*>> sorted;
+    for (const Element& element : elementsOf(state, list)) {
+        sorted.emplace_back(nameOf(state, list, element).value_or(element.label), &element);
     }
-    std::sort(sorted.begin(), sorted.end());
-    for (const auto& [key, camera] : sorted) {
-        text += "\n[cameras." + tomlKey(key) + "]\n";
-        if (key != camera->name) {
-            text += comment("name: " + tomlText(camera->name));
+    std::stable_sort(sorted.begin(), sorted.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
+    for (const auto& [name, element] : sorted) {
+        if (nameOf(state, list, *element)) {
+            appendElement(text, list, name, *element);
+        } else {
+            text += '\n' + comment(tomlKey(list.section) + '.' + tomlKey(name) + ", " + element->identity +
+                                   ": not managed here, other elements may have this name");
         }
-        text += std::string("access_control = ") + (camera->restricted ? "true" : "false") + '\n';
-        text += "users = " + listText(namesOf(*camera, "user")) + '\n';
-        text += "groups = " + listText(namesOf(*camera, "group")) + '\n';
     }
 }
 
@@ -110,7 +116,7 @@ class Node {
     [[nodiscard]] std::vector<std::pair<std::string, Node>> entries() const {
         const toml::table* table = _node.as_table();
         if (table == nullptr) {
-            fail("is a table: [" + _path + "]");
+            fail("must be a table: [" + _path + "]");
         }
         std::vector<std::pair<std::string, Node>> all;
         for (const auto& [key, node] : *table) {
@@ -121,22 +127,22 @@ class Node {
     }
     [[nodiscard]] bool flag() const {
         const auto value = _node.value_exact<bool>();
-        return value ? *value : (fail("takes true or false"), false);
+        return value ? *value : (fail("must be true or false"), false);
     }
     [[nodiscard]] std::string text() const {
         const auto value = _node.value_exact<std::string>();
-        return value ? *value : (fail("takes a text in quotes"), std::string());
+        return value ? *value : (fail("must be a text in quotes"), std::string());
     }
     [[nodiscard]] std::vector<std::string> texts() const {
         const toml::array* array = _node.as_array();
         if (array == nullptr) {
-            fail("takes a list of short names: [\"anna\", \"ben\"]");
+            fail("must be a list of names: [\"anna\", \"ben\"]");
         }
         std::vector<std::string> all;
         for (const toml::node& element : *array) {
             all.push_back(Node(_from, "an entry of " + _path, element).text());
             if (all.back().empty()) {
-                fail("has an empty short name");
+                fail("is an empty name");
             }
         }
         return all;
@@ -161,7 +167,7 @@ class Node {
             return Date(day + std::chrono::hours(date->time.hour) + std::chrono::minutes(date->time.minute) +
                         std::chrono::seconds(date->time.second) - std::chrono::minutes(date->offset->minutes));
         }
-        fail("takes a text, a number, true, false, or a date such as 2026-01-31T08:00:00Z");
+        fail("must be a text, a number, true, false, or a date such as 2026-01-31T08:00:00Z");
     }
 
   private:
@@ -183,65 +189,80 @@ bool fits(const DescribedKey& key, const Value& value, const Value& stored) {
                                : true;
 }
 
-void parseSetting(Wanted& wanted, const std::string& key, const Node& node, const Description& writeSettings,
-                  const State& state) {
-    if (key == passwordKey) {
-        node.fail("is secret and stands in no file: give it with --password-file FILE");
+std::string joined(const std::vector<std::string>& words) {
+    std::string text;
+    for (std::size_t i = 0; i < words.size(); ++i) {
+        text += (i == 0 ? "" : i + 1 < words.size() ? ", " : " and ") + words[i];
     }
-    const DescribedKey* described = settingKey(writeSettings, key);
+    return text;
+}
+
+void parseSetting(Wanted& wanted, const std::string& key, const Node& node, const StateForm& form, const State& state) {
+    if (form.secret(key) != nullptr) {
+        node.fail("is a secret, which a file must not hold; use --password-file FILE");
+    }
+    const DescribedKey* described = form.setting(key);
     if (described == nullptr) {
-        node.fail(
-            "is no setting that can be written; \"adminhostctl help writeSettings\" lists them below configuration");
+        node.fail("is not a setting that can be written; \"adminhostctl help " + form.command() +
+                  "\" lists them below " + form.root());
     }
     Value value = node.value();
     const Value& stored = state.settings.get(key);
     if (!fits(*described, value, stored)) {
         const std::string& type = described->enteredAs.empty() ? described->type : described->enteredAs;
-        node.fail("takes " + std::string(type == "integer"   ? "a whole number, without quotes"
-                                         : type == "boolean" ? "true or false"
-                                         : type == "real"    ? "a number"
-                                                             : "a text in quotes"));
+        node.fail("must be " + std::string(type == "integer"   ? "a whole number, without quotes"
+                                           : type == "boolean" ? "true or false"
+                                           : type == "real"    ? "a number"
+                                                               : "a text in quotes"));
     }
     wanted.settings.set(key, std::move(value));
 }
 
-WantedProperty parseProperty(const std::string& name, const Node& table) {
-    WantedProperty property{name, {}, {}, false, false};
-    for (const auto& [key, node] : table.entries()) {
-        if (key == "value") {
-            property.value = node.text();
-        } else if (key == "protect") {
-            property.isProtected = node.flag();
-        } else {
-            node.fail("is unknown; a property has value and protect");
+WantedElement parseElement(const ListForm& list, const std::string& name, const Node& table) {
+    WantedElement element{name, {}, {}, {}, false, false};
+    std::vector<std::string> known;
+    for (const FieldForm& field : list.fields) {
+        known.push_back(field.inFile);
+    }
+    for (const PeopleForm& people : list.people) {
+        for (const auto& [kind, inFile] : people.kinds) {
+            known.push_back(inFile);
         }
     }
-    return property;
-}
-
-WantedCamera parseCamera(const std::string& name, const Node& table) {
-    WantedCamera camera{name, {}, {}, {}, {}, false};
     for (const auto& [key, node] : table.entries()) {
-        if (key == "access_control") {
-            camera.restricted = node.flag();
-        } else if (key == "users") {
-            camera.users = node.texts();
-        } else if (key == "groups") {
-            camera.groups = node.texts();
+        const FieldForm* field = list.fieldInFile(key);
+        if (field != nullptr) {
+            element.fields.set(field->key, field->boolean ? Value(node.flag()) : Value(node.text()));
+        } else if (std::find(known.begin(), known.end(), key) != known.end()) {
+            element.lists[key] = node.texts();
         } else {
-            node.fail("is unknown; a camera has access_control, users and groups");
+            node.fail("is unknown; the keys here are " + joined(known));
         }
     }
-    return camera;
+    return element;
 }
 
-void parseSwitch(Wanted& wanted, const std::string& key, const Node& node) {
-    if (key == "properties") {
-        wanted.removeProperties = node.flag();
-    } else if (key == "access") {
-        wanted.removePeople = node.flag();
-    } else {
-        node.fail("is unknown; remove_unlisted has properties and access");
+void parseSwitch(Wanted& wanted, const std::string& key, const Node& node, const StateForm& form) {
+    const std::vector<std::string> switches = form.switches();
+    if (std::find(switches.begin(), switches.end(), key) == switches.end()) {
+        node.fail("is unknown; the switches are " + joined(switches));
+    }
+    if (node.flag()) {
+        wanted.removeUnlisted.insert(key);
+    }
+}
+
+void parseSection(Wanted& wanted, const ListForm& list, const Node& table, const State& state) {
+    std::set<const Element*> present;
+    for (const auto& [name, node] : table.entries()) {
+        wanted.elements[list.section].push_back(parseElement(list, name, node));
+        const Element* element = findElement(state, list, name);
+        if (element == nullptr && list.addedBy.empty()) {
+            node.fail("not found in the service; \"adminhostctl export\" lists the names");
+        }
+        if (element != nullptr && !present.insert(element).second) {
+            node.fail("is in the file twice, by its name and by its identity");
+        }
     }
 }
 
@@ -257,56 +278,48 @@ toml::table parsed(std::string_view text, const std::string& from) {
 
 }  // namespace
 
-std::string exportOf(const State& state, const Description& writeSettings) {
-    std::string text(introduction);
-    text += "\n[settings]\n";
-    constexpr std::string_view prefix = "configuration.";
-    for (const DescribedKey& key : writeSettings.keys()) {
-        const std::string name = key.path.starts_with(prefix) ? key.path.substr(prefix.size()) : std::string();
+std::string exportOf(const StateForm& form, const State& state) {
+    std::string text = introduction(form);
+    text += "\n[" + tomlKey(form.settingsSection()) + "]\n";
+    for (const DescribedKey& key : form.settings()) {
+        const std::string name = form.nameOf(key);
         const Value& value = state.settings.get(name);
-        if (name.empty() || value.isNull() || settingKey(writeSettings, name) == nullptr) {
+        if (value.isNull()) {
             continue;
         }
         const auto written = tomlValue(value);
-        text += written ? tomlKey(name) + " = " + *written + '\n'
-                        : comment(tomlKey(name) + ": a " + std::string(nameOf(value.type())) + ", not managed here");
+        text +=
+            written
+                ? tomlKey(name) + " = " + *written + '\n'
+                : comment(tomlKey(name) + ": a " + std::string(adminhost::nameOf(value.type())) + ", not managed here");
     }
-    if (state.properties) {
-        appendProperties(text, *state.properties);
-    }
-    if (state.cameras) {
-        appendCameras(text, state);
+    for (const ListForm& list : form.lists()) {
+        appendSection(text, state, list);
     }
     return text;
 }
 
-Wanted parseDesired(std::string_view text, const std::string& from, const Description& writeSettings,
-                    const State& state) {
+Wanted parseDesired(std::string_view text, const std::string& from, const StateForm& form, const State& state) {
     const toml::table table = parsed(text, from);
+    std::vector<std::string> known{form.settingsSection()};
+    for (const ListForm& list : form.lists()) {
+        known.push_back(list.section);
+    }
+    known.emplace_back(switchesTable);
     Wanted wanted;
-    std::set<const ListedCamera*> cameras;
     for (const auto& [section, content] : Node(from, "", table).entries()) {
-        for (const auto& [key, node] :
-             section == "settings" || section == "properties" || section == "cameras" || section == "remove_unlisted"
-                 ? content.entries()
-                 : (content.fail("is unknown; there are settings, properties, cameras and "
-                                 "remove_unlisted"),
-                    std::vector<std::pair<std::string, Node>>())) {
-            if (section == "settings") {
-                parseSetting(wanted, key, node, writeSettings, state);
-            } else if (section == "remove_unlisted") {
-                parseSwitch(wanted, key, node);
-            } else if (section == "properties") {
-                wanted.properties.push_back(parseProperty(key, node));
+        if (std::find(known.begin(), known.end(), section) == known.end()) {
+            content.fail("is unknown; the tables are " + joined(known));
+        }
+        if (section != form.settingsSection() && section != switchesTable) {
+            parseSection(wanted, form.list(section), content, state);
+            continue;
+        }
+        for (const auto& [key, node] : content.entries()) {
+            if (section == switchesTable) {
+                parseSwitch(wanted, key, node, form);
             } else {
-                wanted.cameras.push_back(parseCamera(key, node));
-                const ListedCamera* camera = findCamera(state, key);
-                if (camera == nullptr) {
-                    node.fail("is no camera of the service; \"adminhostctl camera list\" shows their names");
-                }
-                if (!cameras.insert(camera).second) {
-                    node.fail("is a camera that stands in the file twice, by name and by UUID");
-                }
+                parseSetting(wanted, key, node, form, state);
             }
         }
     }

@@ -1,27 +1,20 @@
 #pragma once
 
-// The desired state as a file: what "export" writes and "plan" and "apply" read. One form, TOML:
+// The desired state as a file: what "export" writes and "plan" and "apply" read. One form, TOML. The tables are the
+// sections that the descriptions name (StateForm.h):
 //
 //     [remove_unlisted]
-//     properties = false       # remove properties that are not listed here
-//     access = false           # take people from access lists who are not listed here
+//     SWITCH = false           # remove what is not listed here
 //
-//     [settings]
-//     server_port = 8170
+//     [SETTINGS]
+//     KEY = 8170
 //
-//     [properties.watermark]
-//     value = "left"
-//     protect = false
+//     [SECTION."Main hall"]    # label, or identity where people may use it
+//     FIELD = true
+//     PEOPLE = ["anna"]
 //
-//     [cameras."Main hall"]    # or its UUID
-//     access_control = true
-//     users = ["anna"]
-//     groups = ["lecturers"]
-//
-// What is not listed stays as it is. The switches stand in a table of their own because a property or a camera may have
-// any name.
+// What is not listed stays as it is. The switches have a table of their own because an element may have any name.
 
-#include "adminhostctl/Description.h"
 #include "adminhostctl/desired/Plan.h"
 #include "adminhostctl/desired/State.h"
 
@@ -30,13 +23,14 @@
 
 namespace adminhost::ctl {
 
-/// The file of a state. Its plan on that state has no change. Settings are the writable ones of writeSettings. What the
-/// file cannot carry (a protected value, one of several properties of a name) stands in it as a comment.
-[[nodiscard]] std::string exportOf(const State& state, const Description& writeSettings);
+/// The file of a state. Its plan on that state has no change. What the file cannot carry (a secret, one of several
+/// elements of a name) is a comment. Throws Failure(answeredError) when the service did not list a section: the file
+/// would read as if all of its elements were gone.
+[[nodiscard]] std::string exportOf(const StateForm& form, const State& state);
 
 /// Throws Failure(usage) with what is wrong, in which line and column, and what to do: broken TOML, an unknown table,
 /// key or setting, a value of another type than its key and what is stored under it.
-[[nodiscard]] Wanted parseDesired(std::string_view text, const std::string& from, const Description& writeSettings,
+[[nodiscard]] Wanted parseDesired(std::string_view text, const std::string& from, const StateForm& form,
                                   const State& state);
 
 }  // namespace adminhost::ctl

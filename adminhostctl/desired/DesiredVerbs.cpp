@@ -14,64 +14,69 @@ namespace {
 using Words = std::span<const std::string>;
 
 /// What the file, and the password file, ask for.
-Wanted wantedOf(const Context& context, const std::string& file, const State& state) {
-    const CommandRef command = context.service.command("writeSettings");
-    Wanted wanted = parseDesired(context.sources.read(file), file, command.description, state);
+Wanted wantedOf(const Context& context, const std::string& file, const CurrentState& current) {
+    Wanted wanted = parseDesired(context.sources.read(file), file, current.form, current.state);
     if (!context.options.passwordFile.empty()) {
-        DescribedKey key;
-        key.path = passwordKey;
-        key.secret = true;
-        wanted.password = textOfWord(key, '@' + context.options.passwordFile, context.sources);
+        if (current.form.secrets().size() != 1) {
+            throw usageError("--password-file: the service has " + std::to_string(current.form.secrets().size()) +
+                             " secret settings; use \"settings set\"");
+        }
+        const DescribedKey& key = current.form.secrets().front();
+        wanted.secrets[current.form.nameOf(key)] = textOfWord(key, '@' + context.options.passwordFile, context.sources);
     }
     return wanted;
 }
 
 ExitStatus settingsGet(const Context& context, Words arguments) {
-    const CommandRef command = context.service.command("readSettings");
-    const Dictionary settings = readState(context).state.settings;
+    const CommandRef command = context.service.stateCommand("read");
+    const StateForm form(context.service.stateCommand("write").description);
+    if (!arguments.empty()) {
+        if (const DescribedKey* secret = form.secret(arguments.front())) {
+            throw usageError(arguments.front() + ": a secret is never returned; \"settings get " + secret->shownBy +
+                             "\" shows whether it is set");
+        }
+    }
+    const Dictionary settings = readState(context, form.settingsSection()).state.settings;
     if (arguments.empty()) {
-        writeValue(context, settings, command.description, "configuration");
+        writeValue(context, settings, command.description, form.root());
         return ExitStatus::done;
     }
     const std::string& key = arguments.front();
-    if (key == passwordKey) {
-        throw usageError("the password is never answered; nimbo_client_password_is_set says whether there is one");
-    }
     const Value& value = settings.get(key);
     if (!value.isNull()) {
-        writeValue(context, value, command.description, "configuration." + key);
+        writeValue(context, value, command.description, form.root() + '.' + key);
         return ExitStatus::done;
     }
-    if (command.description.answerKey("configuration." + key) == nullptr) {
-        throw usageError("there is no setting " + shown(key) + "; \"adminhostctl settings get\" shows them");
+    if (command.description.answerKey(form.root() + '.' + key) == nullptr) {
+        throw usageError("setting not found: " + key + "; \"adminhostctl settings get\" lists them");
     }
-    throw Failure(ExitStatus::answeredError, shown(key) + " is not set");
+    throw Failure(ExitStatus::answeredError, key + " is not set");
 }
 
 ExitStatus settingsSet(const Context& context, Words arguments) {
-    const CommandRef command = context.service.command("writeSettings");
+    const StateForm form(context.service.stateCommand("write").description);
     const std::string& name = arguments.front();
-    const DescribedKey* described = settingKey(command.description, name);
-    if (described == nullptr && name != passwordKey) {
-        throw usageError("there is no setting " + shown(name) + " that can be written; \"adminhostctl help " +
-                         "writeSettings\" lists them below configuration");
+    const DescribedKey* secret = form.secret(name);
+    const DescribedKey* described = secret != nullptr ? secret : form.setting(name);
+    if (described == nullptr) {
+        throw usageError("not a setting that can be written: " + name + "; \"adminhostctl help " + form.command() +
+                         "\" lists them below " + form.root());
     }
-    DescribedKey key = described != nullptr ? *described : DescribedKey();
+    DescribedKey key = *described;
     key.path = name;
-    key.secret = key.secret || name == passwordKey;
     Wanted wanted;
-    if (key.secret) {
-        wanted.password = textOfWord(key, wordAt(arguments, 1), context.sources);
+    if (secret != nullptr) {
+        wanted.secrets[name] = textOfWord(key, wordAt(arguments, 1), context.sources);
     } else {
         wanted.settings.set(name, valueOfWord(key, wordAt(arguments, 1), context.sources));
     }
-    wanted.lookUpController = true;
+    wanted.lookUp = true;
     return carryOut(context, wanted, readState(context));
 }
 
 ExitStatus exportState(const Context& context, Words arguments) {
-    const CommandRef command = context.service.command("writeSettings");
-    const std::string text = exportOf(readState(context).state, command.description);
+    const CurrentState current = readState(context);
+    const std::string text = exportOf(current.form, current.state);
     if (arguments.empty() || arguments.front() == "-") {
         context.out << text;
         return ExitStatus::done;
@@ -81,12 +86,14 @@ ExitStatus exportState(const Context& context, Words arguments) {
 }
 
 ExitStatus planFile(const Context& context, Words arguments) {
-    const State state = readState(context).state;
-    const Wanted wanted = wantedOf(context, arguments.front(), state);
-    Plan plan = planOf(wanted, state);
-    if (!wanted.password) {
-        plan.notes.emplace_back(
-            "settings.nimbo_client_password: unknown, it is compared with nothing unless --password-file gives it");
+    const CurrentState current = readState(context);
+    const Wanted wanted = wantedOf(context, arguments.front(), current);
+    Plan plan = planOf(current.form, wanted, current.state);
+    for (const DescribedKey& key : current.form.secrets()) {
+        if (wanted.secrets.count(current.form.nameOf(key)) == 0) {
+            plan.notes.push_back(current.form.settingsSection() + '.' + current.form.nameOf(key) +
+                                 ": unknown and not compared; --password-file gives it");
+        }
     }
     showPlan(context, plan);
     return ExitStatus::done;
@@ -94,7 +101,7 @@ ExitStatus planFile(const Context& context, Words arguments) {
 
 ExitStatus applyFile(const Context& context, Words arguments) {
     const CurrentState current = readState(context);
-    return carryOut(context, wantedOf(context, arguments.front(), current.state), current);
+    return carryOut(context, wantedOf(context, arguments.front(), current), current);
 }
 
 constexpr std::array table = {

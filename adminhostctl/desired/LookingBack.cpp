@@ -14,15 +14,11 @@ namespace {
 
 const Value secretText("(secret)");
 
-/// The settings that a write can set: keys that stand directly in its configuration and hold one value.
-std::vector<std::string> writableKeys(const Description& write) {
-    constexpr std::string_view prefix = "configuration.";
+/// Names of the settings that a write can set and reading shows.
+std::vector<std::string> writableKeys(const StateForm& form) {
     std::vector<std::string> keys;
-    for (const DescribedKey& key : write.keys()) {
-        const bool single = key.type != "list" && key.path.find_first_of(".[", prefix.size()) == std::string::npos;
-        if (key.path.starts_with(prefix) && single && !key.secret) {
-            keys.push_back(key.path.substr(prefix.size()));
-        }
+    for (const DescribedKey& key : form.settings()) {
+        keys.push_back(form.nameOf(key));
     }
     return keys;
 }
@@ -44,13 +40,6 @@ const Dictionary& dictionaryAt(const Dictionary& dictionary, std::string_view ke
     return found == nullptr ? none : *found;
 }
 
-Dictionary currentSettings(const Context& context) {
-    const auto answer = context.service.perform(context.service.command("readSettings"),
-                                                {{"optionalArguments", Dictionary{{"variant", "getConfig"}}}});
-    return answer && answer->dictionary() != nullptr ? dictionaryAt(*answer->dictionary(), "configuration")
-                                                     : Dictionary();
-}
-
 }  // namespace
 
 std::vector<std::string> changesBetween(const Dictionary& before, const Dictionary& after,
@@ -67,7 +56,7 @@ std::vector<std::string> changesBetween(const Dictionary& before, const Dictiona
 }
 
 ExitStatus history(const Context& context, std::span<const std::string>) {
-    const CommandRef write = context.service.command("writeSettings");
+    const CommandRef write = context.service.stateCommand("write");
     const Array entries = entriesOf(context, write);
     if (context.options.format != Format::text) {
         writeValue(context, entries, Description());
@@ -77,8 +66,9 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
         context.out << "No settings have been written yet.\n";
         return ExitStatus::done;
     }
-    const std::vector<std::string> keys = writableKeys(write.description);
-    const Dictionary current = currentSettings(context);
+    const StateForm form(write.description);
+    const std::vector<std::string> keys = writableKeys(form);
+    const Dictionary current = readState(context, form.settingsSection()).state.settings;
     Table table({"number", "when", "who", "changed"});
     // The newest first: that is the one that people look for.
     for (std::size_t i = entries.size(); i-- > 0;) {
@@ -99,36 +89,41 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
 }
 
 ExitStatus rollback(const Context& context, std::span<const std::string> arguments) {
-    const CommandRef write = context.service.command("writeSettings");
+    const CommandRef write = context.service.stateCommand("write");
     const Array entries = entriesOf(context, write);
     const auto found = std::find_if(entries.begin(), entries.end(), [&](const Value& entry) {
         return textOf(entry.dictionary()->get("number")) == arguments.front();
     });
     if (found == entries.end()) {
-        throw usageError("the history has no entry " + shown(arguments.front()) + "; adminhostctl history lists them");
+        throw usageError("history entry not found: " + arguments.front() + "; \"adminhostctl history\" lists them");
     }
     const Dictionary& settings = dictionaryAt(*found->dictionary(), "settings");
     const CurrentState current = readState(context);
+    const StateForm& form = current.form;
     Wanted wanted;
     std::vector<std::string> staying;
-    for (const std::string& key : writableKeys(write.description)) {
+    for (const std::string& key : writableKeys(form)) {
         if (settings.contains(key)) {
             wanted.settings.set(key, settings.get(key));
         } else if (current.state.settings.contains(key)) {
             staying.push_back(key);
         }
     }
-    wanted.lookUpController = true;
-    const bool changes = !planOf(wanted, current.state).changes.empty();
+    wanted.lookUp = true;
+    const bool changes = !planOf(form, wanted, current.state).changes.empty();
     const ExitStatus status = carryOut(context, wanted, current);
-    if (changes && settings.contains(passwordKey)) {
-        context.err << "The grid password stays as it is: a stored password cannot be written back.\n";
+    for (const DescribedKey& key : form.secrets()) {
+        if (changes && settings.contains(form.nameOf(key))) {
+            context.err << form.settingsSection() << '.' << form.nameOf(key)
+                        << ": not restored, a stored secret cannot be written back\n";
+        }
     }
     for (const std::string& key : staying) {
-        context.err << "adminhostctl: settings." << key << " was not set then; it cannot be taken out and stays "
+        context.err << "adminhostctl: " << form.settingsSection() << '.' << key
+                    << ": not set at that time; it cannot be removed and stays "
                     << settingText(current.state.settings.get(key)) << '\n';
     }
-    return staying.empty() ? status : ExitStatus::answeredError;
+    return status == ExitStatus::done && !staying.empty() ? ExitStatus::answeredError : status;
 }
 
 }  // namespace adminhost::ctl

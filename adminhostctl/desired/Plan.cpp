@@ -5,337 +5,435 @@
 #include "platform/value/ValueText.h"
 
 #include <algorithm>
-#include <array>
-#include <set>
 
 namespace adminhost::ctl {
 namespace {
 
-constexpr std::string_view secret = "(secret)";
-/// Where the other settings files lie: with one of these changed, they are other files.
-constexpr std::array<std::string_view, 2> placeKeys = {"shared_filesystem", "member_uuid"};
-constexpr std::array<std::string_view, 2> restartKeys = {"shared_filesystem", "nimbo_client_username"};
+constexpr std::string_view secretText = "(secret)";
 
 std::string valueText(const Value& value) {
     return value.isNull() ? "(not set)" : tomlValue(value).value_or("(" + std::string(nameOf(value.type())) + ")");
 }
-std::string flagText(bool flag) {
-    return flag ? "true" : "false";
+std::string textOrSecret(bool hidden, const Value& value) {
+    return hidden ? std::string(secretText) : valueText(value);
 }
 
-bool contains(std::span<const std::string_view> keys, std::string_view key) {
-    return std::find(keys.begin(), keys.end(), key) != keys.end();
+template <typename Range, typename Element>
+bool contains(const Range& range, const Element& element) {
+    return std::find(std::begin(range), std::end(range), element) != std::end(range);
 }
 
-void planSettings(Plan& plan, const Wanted& wanted, const State& state) {
-    bool moves = false;
-    for (const DictionaryEntry& entry : wanted.settings) {
-        const Value& stored = state.settings.get(entry.key);
-        if (entry.value == stored) {
-            continue;
-        }
-        if (entry.key == controllerKey && !wanted.lookUpController && entry.value.string() != nullptr &&
-            isLookedUp(*entry.value.string())) {
-            plan.notes.push_back("settings.nimbo_controller: " + valueText(entry.value) +
-                                 " will be resolved by the write that sets it, so it is left as it is, " +
-                                 valueText(stored) +
-                                 "; use \"settings set nimbo_controller\", then put the name that it stored here");
-            continue;
-        }
-        plan.changes.push_back({"settings." + entry.key, valueText(stored), valueText(entry.value)});
-        plan.configuration.set(entry.key, entry.value);
-        plan.restart = plan.restart || contains(restartKeys, entry.key);
-        moves = moves || contains(placeKeys, entry.key);
-    }
-    if (moves) {
-        // What is equal now need not be equal in the files that are used from then on.
-        for (const DictionaryEntry& entry : wanted.settings) {
-            if (entry.key != controllerKey) {
-                plan.configuration.set(entry.key, entry.value);
-            }
+/// The settings files that are others once the wanted settings are written.
+std::set<std::string> movedFiles(const StateForm& form, const Wanted& wanted, const State& state) {
+    std::set<std::string> files;
+    for (const DescribedKey& key : form.settings()) {
+        const Value& value = wanted.settings.get(form.nameOf(key));
+        if (!value.isNull() && value != state.settings.get(form.nameOf(key))) {
+            files.insert(key.locates.begin(), key.locates.end());
         }
     }
-    if (wanted.password) {
-        const bool isSet = booleanOf(state.settings.get("nimbo_client_password_is_set"));
-        if (!wanted.password->empty() || isSet) {
-            plan.changes.push_back({"settings." + std::string(passwordKey), isSet ? std::string(secret) : "(not set)",
-                                    wanted.password->empty() ? "(not set)" : std::string(secret)});
-            plan.configuration.set(passwordKey, *wanted.password);
-        }
-    }
+    return files;
 }
 
-void planNewProperty(Plan& plan, Array& records, const WantedProperty& wanted, const std::string& entry) {
-    if (wanted.name.empty()) {
-        throw usageError("a property needs a name");
-    }
-    if (!wanted.value) {
-        throw usageError(entry + " does not exist yet, and a new property needs a value");
-    }
-    const bool isProtected = wanted.isProtected.value_or(false);
-    Dictionary record{{"_newid_", true}, {"name", wanted.name}, {"value", *wanted.value}};
-    if (isProtected) {
-        record.set("protect", true);
-    }
-    records.emplace_back(std::move(record));
-    plan.changes.push_back({entry, "(not there)", isProtected ? std::string(secret) : tomlText(*wanted.value)});
-}
-
-void planProperty(Plan& plan, Array& records, const WantedProperty& wanted, const State& state) {
-    const std::string entry = "properties." + tomlKey(wanted.name);
-    const ListedProperty* stored = findProperty(state, wanted.name);
-    if (wanted.remove) {
-        if (stored != nullptr) {
-            records.emplace_back(Dictionary{{"_id_", stored->id}, {"_obsoleteid_", true}});
-            plan.changes.push_back(
-                {entry, stored->value ? tomlText(*stored->value) : std::string(secret), "(removed)"});
-        }
+void planSetting(Plan& plan, const StateForm& form, const Wanted& wanted, const DictionaryEntry& entry,
+                 const State& state, bool moved) {
+    const DescribedKey* key = form.setting(entry.key);
+    const Value& stored = state.settings.get(entry.key);
+    const std::string name = form.settingsSection() + '.' + entry.key;
+    const bool differs = entry.value != stored;
+    if (differs && !moved && key != nullptr && !wanted.lookUp && isLookedUp(*key, entry.value)) {
+        plan.notes.push_back(name + ": " + valueText(entry.value) + " is looked up by the write, so it is left at " +
+                             valueText(stored) + "; \"settings set " + entry.key +
+                             "\" writes it, then put the stored name here");
         return;
     }
-    if (stored == nullptr) {
-        planNewProperty(plan, records, wanted, entry);
-        return;
-    }
-    // The service takes "protect" as an order: sent without a change, it would protect what is protected already.
-    const bool becomes = wanted.isProtected.value_or(stored->isProtected);
-    const bool switches = becomes != stored->isProtected;
-    bool writes = wanted.value && wanted.value != stored->value;
-    if (writes && stored->isProtected && becomes && !wanted.writeSecret) {
-        plan.notes.push_back(entry +
-                             ".value: (secret), cannot be compared and is left as it is; \"property set\" writes it");
-        writes = false;
-    }
-    if (!writes && !switches) {
-        return;
-    }
-    Dictionary record{{"_id_", stored->id}};
-    if (writes) {
-        const auto text = [](bool hidden, const std::optional<std::string>& value) {
-            return hidden ? std::string(secret) : value ? tomlText(*value) : "(not set)";
-        };
-        record.set("value", *wanted.value);
+    if (differs) {
         plan.changes.push_back(
-            {entry + ".value", text(stored->isProtected, stored->value), text(becomes, wanted.value)});
+            {name, valueText(stored), valueText(entry.value), form.root() + '.' + entry.key, false, {}, entry.key});
+        for (const std::string& command : key != nullptr ? key->restart : std::vector<std::string>()) {
+            if (!contains(plan.restart, command)) {
+                plan.restart.push_back(command);
+            }
+        }
     }
-    if (switches) {
-        record.set("protect", becomes);
-        plan.changes.push_back({entry + ".protect", flagText(stored->isProtected), flagText(becomes)});
+    // What is equal now need not be equal in the file that is used from then on.
+    if (differs || moved) {
+        plan.root.set(entry.key, entry.value);
     }
-    records.emplace_back(std::move(record));
 }
 
-/// Properties that a file can name: unlisted ones are removed, the others left alone.
-void planRemovals(Plan& plan, Array& records, const Wanted& wanted, const State& state) {
-    std::set<std::string> listed;
-    std::multiset<std::string> names;
-    for (const WantedProperty& property : wanted.properties) {
-        listed.insert(property.name);
+void planSettings(Plan& plan, const StateForm& form, const Wanted& wanted, const State& state) {
+    const std::set<std::string> moved = movedFiles(form, wanted, state);
+    for (const DictionaryEntry& entry : wanted.settings) {
+        const DescribedKey* key = form.setting(entry.key);
+        planSetting(plan, form, wanted, entry, state, key != nullptr && moved.count(key->file) > 0);
     }
-    for (const ListedProperty& property : state.properties.value_or(std::vector<ListedProperty>())) {
-        names.insert(property.name);
+    for (const auto& [name, value] : wanted.secrets) {
+        const DescribedKey* key = form.secret(name);
+        const bool isSet = key != nullptr && booleanOf(state.settings.get(key->shownBy));
+        if (!value.empty() || isSet) {
+            plan.changes.push_back({form.settingsSection() + '.' + name,
+                                    isSet ? std::string(secretText) : "(not set)",
+                                    value.empty() ? "(not set)" : std::string(secretText),
+                                    form.root() + '.' + name,
+                                    true,
+                                    {},
+                                    name});
+            plan.root.set(name, value);
+        }
     }
-    for (const ListedProperty& property : state.properties.value_or(std::vector<ListedProperty>())) {
-        if (!property.name.empty() && names.count(property.name) == 1 && listed.count(property.name) == 0) {
-            planProperty(plan, records, {property.name, {}, {}, true, false}, state);
+    plan.moves = !moved.empty();
+    std::string unlisted;
+    for (const DescribedKey& key : form.settings()) {
+        const std::string name = form.nameOf(key);
+        if (moved.count(key.file) > 0 && !wanted.settings.contains(name) && !state.settings.get(name).isNull()) {
+            unlisted += (unlisted.empty() ? "" : ", ") + name;
+        }
+    }
+    if (!unlisted.empty()) {
+        plan.notes.push_back(form.settingsSection() + ": read from other files then, which may not have them: " +
+                             unlisted + "; \"adminhostctl export\" writes all settings down");
+    }
+    for (const DescribedKey& key : form.secrets()) {
+        const std::string name = form.nameOf(key);
+        if (moved.count(key.file) > 0 && wanted.secrets.count(name) == 0 &&
+            booleanOf(state.settings.get(key.shownBy))) {
+            plan.notes.push_back(form.settingsSection() + '.' + name +
+                                 ": a secret, read from another file then; \"settings set " + name +
+                                 "\" sets it there");
         }
     }
 }
 
-class AccessList {
+/// Changes of the elements of one section.
+class Section {
   public:
-    AccessList(Plan& plan, const ListedCamera& camera, std::string entry)
-        : _plan(plan), _camera(camera), _entry(std::move(entry)) {}
+    Section(Plan& plan, const StateForm& form, const ListForm& list, const State& state)
+        : _plan(plan), _list(list), _state(state), _path(form.root() + '.' + list.key + '.') {}
 
-    void allow(const std::string& kind, const std::vector<std::string>& names) {
-        for (const std::string& name : names) {
-            if (name.empty()) {
-                throw usageError(_entry + ": a short name is empty");
+    void change(const WantedElement& wanted, const std::set<std::string>& removeUnlisted) {
+        _entry = _list.section + '.' + tomlKey(wanted.name);
+        _element = findElement(_state, _list, wanted.name);
+        if (wanted.remove) {
+            remove();
+        } else if (_element == nullptr) {
+            add(wanted);
+        } else {
+            Dictionary record{{_list.identity, _element->identity}};
+            changeFields(record, wanted);
+            for (const PeopleForm& people : _list.people) {
+                changePeople(record, people, wanted, removeUnlisted.count(people.unlisted) > 0);
             }
-            const bool stands = std::any_of(
-                _camera.allowed.begin(), _camera.allowed.end(),
-                [&](const ListedPerson& person) { return person.kind == kind && person.shortName == name; });
-            if (!stands && change(kind, name, true)) {
-                _records.emplace_back(Dictionary{{"_newid_", true}, {"type", kind}, {"shortName", name}});
-            }
-        }
-    }
-
-    /// Takes away everyone of the kind that is not named. Who has no short name cannot be listed and stays.
-    void keepOnly(const std::string& kind, const std::vector<std::string>& names) {
-        for (const ListedPerson& person : _camera.allowed) {
-            if (person.kind == kind && !person.shortName.empty() &&
-                std::find(names.begin(), names.end(), person.shortName) == names.end()) {
-                deny(person);
+            if (record.size() > 1) {
+                _records.emplace_back(std::move(record));
             }
         }
     }
 
-    void deny(const ListedPerson& person) {
-        if (change(person.kind, person.shortName, false)) {
-            _records.emplace_back(Dictionary{{"_obsoleteid_", true}, {"_id_", person.id}});
+    /// Removes the elements that a file can name and does not list.
+    void removeUnlisted(const std::vector<WantedElement>& listed) {
+        std::multiset<std::string> labels;
+        for (const Element& element : elementsOf(_state, _list)) {
+            labels.insert(element.label);
+        }
+        for (const Element& element : elementsOf(_state, _list)) {
+            const bool isListed = std::any_of(listed.begin(), listed.end(),
+                                              [&](const WantedElement& one) { return one.name == element.label; });
+            if (!element.label.empty() && labels.count(element.label) == 1 && !isListed) {
+                change({element.label, {}, {}, {}, true, false}, {});
+            }
         }
     }
 
-    [[nodiscard]] Array& records() noexcept { return _records; }
+    /// Puts the records where the request has them.
+    void finish() {
+        if (!_records.empty()) {
+            _plan.root.set(_list.key, std::move(_records));
+        }
+    }
 
   private:
-    /// False when the change stands already.
-    bool change(const std::string& kind, const std::string& name, bool allowed) {
-        PlannedChange change{_entry + '.' + kind + "s." + tomlKey(name), allowed ? "(not allowed)" : "(allowed)",
-                             allowed ? "(allowed)" : "(not allowed)"};
-        if (std::find(_plan.changes.begin(), _plan.changes.end(), change) != _plan.changes.end()) {
+    void push(const std::string& entry, std::string from, std::string to, const std::string& below, bool hidden,
+              const std::string& key) {
+        _plan.changes.push_back({entry, std::move(from), std::move(to),
+                                 recordPath() + (below.empty() ? "" : '.' + below), hidden,
+                                 _element != nullptr ? _element->identity : "", key});
+    }
+    [[nodiscard]] std::string recordPath() const { return _path + std::to_string(_records.size()); }
+
+    void remove() {
+        if (_element == nullptr) {
+            return;
+        }
+        std::string from = "(present)";
+        for (const FieldForm& field : _list.fields) {
+            if (!field.boolean) {
+                from = textOrSecret(isSecret(field, *_element), _element->fields.get(field.key));
+                break;
+            }
+        }
+        push(_entry, std::move(from), "(removed)", "", false, "");
+        _records.emplace_back(Dictionary{{_list.identity, _element->identity}, {_list.removedBy, true}});
+    }
+
+    void add(const WantedElement& wanted) {
+        if (_list.addedBy.empty()) {
+            throw usageError(_entry + ": not found; \"adminhostctl export\" lists the names");
+        }
+        if (wanted.name.empty()) {
+            throw usageError(_entry + ": the name is empty");
+        }
+        Dictionary record{{_list.addedBy, true}, {_list.label, wanted.name}};
+        std::string to = "(added)";
+        for (const FieldForm& field : _list.fields) {
+            const Value& value = wanted.fields.get(field.key);
+            if (!field.boolean && value.isNull()) {
+                throw usageError(_entry + ": not found, and adding it needs a " + field.inFile);
+            }
+            if (!field.boolean) {
+                to = textOrSecret(wanted.fields.get(field.secretIf).boolean().value_or(false), value);
+            }
+            if (!field.boolean || value.boolean().value_or(false)) {
+                record.set(field.key, value);
+            }
+        }
+        push(_entry, "(not present)", std::move(to), "", false, "");
+        _records.emplace_back(std::move(record));
+    }
+
+    void changeFields(Dictionary& record, const WantedElement& wanted) {
+        for (const FieldForm& field : _list.fields) {
+            const Value& value = wanted.fields.get(field.key);
+            const Value& stored = _element->fields.get(field.key);
+            if (value.isNull() || value == stored) {
+                continue;
+            }
+            const bool isHidden = isSecret(field, *_element);
+            const bool becomesHidden = wanted.fields.get(field.secretIf).boolean().value_or(isHidden);
+            if (isHidden && becomesHidden && !wanted.writeSecret) {
+                _plan.notes.push_back(_entry + '.' + field.inFile +
+                                      ": (secret), cannot be compared and is left as it is; set it by its own verb");
+                continue;
+            }
+            const bool switchesSecrecy =
+                std::any_of(_list.fields.begin(), _list.fields.end(),
+                            [&](const FieldForm& other) { return other.secretIf == field.key; });
+            push(_entry + '.' + field.inFile, textOrSecret(isHidden, stored), textOrSecret(becomesHidden, value),
+                 field.key, becomesHidden || switchesSecrecy, field.key);
+            record.set(field.key, value);
+        }
+    }
+
+    void changePeople(Dictionary& record, const PeopleForm& form, const WantedElement& wanted, bool removeOthers) {
+        Array entries;
+        static const std::vector<Person> none;
+        const auto found = _element->people.find(form.key);
+        const std::vector<Person>& present = found != _element->people.end() ? found->second : none;
+        for (const auto& [kind, list] : form.kinds) {
+            const auto names = wanted.lists.find(list);
+            if (names == wanted.lists.end()) {
+                continue;
+            }
+            for (const std::string& name : names->second) {
+                if (name.empty()) {
+                    throw usageError(_entry + '.' + list + ": a name is empty");
+                }
+                const bool isAllowed = std::any_of(
+                    present.begin(), present.end(),
+                    [&, &wantedKind = kind](const Person& p) { return p.kind == wantedKind && p.label == name; });
+                if (!isAllowed && pushPerson(entries, form, list, name, true)) {
+                    entries.emplace_back(Dictionary{{form.addedBy, true}, {form.kind, kind}, {form.label, name}});
+                }
+            }
+            // People without a short name cannot be listed in a file: they stay.
+            for (const Person& person : present) {
+                if (removeOthers && person.kind == kind && !person.label.empty() &&
+                    !contains(names->second, person.label)) {
+                    deny(entries, form, person);
+                }
+            }
+        }
+        for (const Person& denied : wanted.denied) {
+            for (const Person& person : present) {
+                if (person.label == denied.label && (denied.kind.empty() || denied.kind == person.kind)) {
+                    deny(entries, form, person);
+                }
+            }
+        }
+        if (!entries.empty()) {
+            record.set(form.key, std::move(entries));
+        }
+    }
+
+    void deny(Array& entries, const PeopleForm& form, const Person& person) {
+        for (const auto& [kind, list] : form.kinds) {
+            if (kind == person.kind && pushPerson(entries, form, list, person.label, false)) {
+                entries.emplace_back(Dictionary{{form.removedBy, true}, {form.identity, person.identity}});
+            }
+        }
+    }
+
+    /// False when the same change is planned already.
+    bool pushPerson(const Array& entries, const PeopleForm& form, const std::string& list, const std::string& name,
+                    bool allowed) {
+        const std::string entry = _entry + '.' + list + '.' + tomlKey(name);
+        const PlannedChange change{
+            entry, allowed ? "(not allowed)" : "(allowed)", allowed ? "(allowed)" : "(not allowed)", {}, false, {}, {}};
+        if (contains(_plan.changes, change)) {
             return false;
         }
-        _plan.changes.push_back(std::move(change));
+        push(entry, change.from, change.to, form.key + '.' + std::to_string(entries.size()), false, list);
         return true;
     }
 
     Plan& _plan;
-    const ListedCamera& _camera;
-    std::string _entry;
+    const ListForm& _list;
+    const State& _state;
+    std::string _path;
     Array _records;
+    std::string _entry;
+    const Element* _element = nullptr;
 };
 
-void planCamera(Plan& plan, Array& records, const WantedCamera& wanted, const State& state, bool removePeople) {
-    const std::string entry = "cameras." + tomlKey(wanted.key);
-    const ListedCamera* camera = findCamera(state, wanted.key);
-    if (camera == nullptr) {
-        throw usageError(entry + ": there is no such camera; \"adminhostctl camera list\" shows the names");
-    }
-    Dictionary record{{"_id_", camera->uuid}};
-    if (wanted.remove) {
-        record.set("_obsoleteid_", true);
-        records.emplace_back(std::move(record));
-        plan.changes.push_back({entry, "(there)", "(removed)"});
-        return;
-    }
-    if (wanted.restricted && *wanted.restricted != camera->restricted) {
-        record.set("access_control_enabled", *wanted.restricted);
-        plan.changes.push_back({entry + ".access_control", flagText(camera->restricted), flagText(*wanted.restricted)});
-    }
-    AccessList list(plan, *camera, entry);
-    for (const auto& [kind, names] : {std::pair{"user", &wanted.users}, std::pair{"group", &wanted.groups}}) {
-        if (*names) {
-            list.allow(kind, **names);
-            if (removePeople) {
-                list.keepOnly(kind, **names);
-            }
-        }
-    }
-    for (const ListedPerson& denied : wanted.denied) {
-        for (const ListedPerson& person : camera->allowed) {
-            if (person.shortName == denied.shortName && (denied.kind.empty() || denied.kind == person.kind)) {
-                list.deny(person);
-            }
-        }
-    }
-    if (!list.records().empty()) {
-        record.set("allowedUsersAndGroups", std::move(list.records()));
-    }
-    if (record.size() > 1) {
-        records.emplace_back(std::move(record));
-    }
+bool isBelow(const std::string& path, const std::string& above) {
+    return path.starts_with(above) && (path.size() == above.size() || path[above.size()] == '.');
 }
 
-bool logs(std::span<const std::string> log, std::initializer_list<std::string> texts) {
-    return std::any_of(log.begin(), log.end(), [&](const std::string& line) {
-        return std::any_of(texts.begin(), texts.end(),
-                           [&](const std::string& text) { return line.find(text) != std::string::npos; });
+std::string reasonOf(const ReportedGap& gap) {
+    return gap.reason + (gap.toolMessage.empty() ? "" : " (" + gap.toolMessage + ")");
+}
+
+/// The report on a part of the request that has to do with the change; null if there is none. `exact`: on the change
+/// itself or a part of it, not on what it is a part of.
+const ReportedGap* gapOf(const PlannedChange& change, const RequestReport& report, bool exact) {
+    for (const ReportedGap& gap : report.notDone) {
+        if (isBelow(gap.keyPath, change.keyPath) ||
+            (!exact && !gap.keyPath.empty() && isBelow(change.keyPath, gap.keyPath))) {
+            return &gap;
+        }
+    }
+    return nullptr;
+}
+
+bool isReported(const StateForm& form, const PlannedChange& change, const RequestReport& report) {
+    return std::any_of(report.changes.begin(), report.changes.end(), [&](const ReportedChange& one) {
+        const bool isSetting = change.identity.empty();
+        return one.key == change.key &&
+               (isSetting ? one.section == form.settingsSection()
+                          : one.section != form.settingsSection() && one.identity == change.identity);
     });
 }
 
-const PlannedChange* changeOf(const Plan& plan, const std::string& entry) {
-    const auto found = std::find_if(plan.changes.begin(), plan.changes.end(),
-                                    [&](const PlannedChange& change) { return change.entry == entry; });
-    return found != plan.changes.end() ? &*found : nullptr;
-}
-
-/// What the service logs when it cannot protect a text or read a protected one.
-bool cipherFailed(std::span<const std::string> log) {
-    return logs(log, {"failed to load", "kek shared_secret not found", "no convertedValueData from"});
+/// What of the wanted can be compared with what is there afterwards.
+Wanted comparable(const StateForm& form, const Wanted& wanted, const Plan& plan, const State& before,
+                  const State& after, bool answered) {
+    Wanted visible = wanted;
+    visible.secrets.clear();
+    for (const DescribedKey& key : form.settings()) {
+        const std::string name = form.nameOf(key);
+        const Value& value = wanted.settings.get(name);
+        // What is stored is what the lookup found, which need not be what was written.
+        if (!value.isNull() && isLookedUp(key, value) &&
+            (answered || !plan.root.contains(name) || after.settings.get(name) != before.settings.get(name))) {
+            visible.settings.remove(name);
+        }
+    }
+    for (const ListForm& list : form.lists()) {
+        const auto elements = visible.elements.find(list.section);
+        if (elements == visible.elements.end()) {
+            continue;
+        }
+        for (WantedElement& element : elements->second) {
+            element.writeSecret = false;
+        }
+        if (after.lists.count(list.section) > 0) {
+            std::erase_if(elements->second, [&](const WantedElement& element) {
+                return element.remove && findElement(after, list, element.name) == nullptr;
+            });
+        }
+    }
+    visible.lookUp = true;
+    return visible;
 }
 
 }  // namespace
 
-bool isLookedUp(const std::string& controller) {
-    if (controller.ends_with(".local")) {
-        return controller.size() > std::string_view(".local").size();
+bool isLookedUp(const DescribedKey& setting, const Value& value) {
+    constexpr std::string_view local = ".local";
+    const std::string* name = value.string();
+    if (setting.lookedUp != "local_name" || name == nullptr) {
+        return false;
     }
-    return !controller.empty() && controller.find('.') == std::string::npos;
+    if (name->ends_with(local)) {
+        return name->size() > local.size();
+    }
+    return !name->empty() && name->find('.') == std::string::npos;
 }
 
-Plan planOf(const Wanted& wanted, const State& state) {
+Plan planOf(const StateForm& form, const Wanted& wanted, const State& state) {
     Plan plan;
-    planSettings(plan, wanted, state);
-    Array properties;
-    for (const WantedProperty& property : wanted.properties) {
-        planProperty(plan, properties, property, state);
-    }
-    if (wanted.removeProperties) {
-        planRemovals(plan, properties, wanted, state);
-    }
-    Array cameras;
-    for (const WantedCamera& camera : wanted.cameras) {
-        planCamera(plan, cameras, camera, state, wanted.removePeople);
-    }
-    if (!cameras.empty()) {
-        plan.configuration.set("cameras", std::move(cameras));
-    }
-    if (!properties.empty()) {
-        plan.configuration.set("properties", std::move(properties));
+    planSettings(plan, form, wanted, state);
+    static const std::vector<WantedElement> none;
+    for (const ListForm& list : form.lists()) {
+        const auto found = wanted.elements.find(list.section);
+        const std::vector<WantedElement>& elements = found != wanted.elements.end() ? found->second : none;
+        Section section(plan, form, list, state);
+        for (const WantedElement& element : elements) {
+            section.change(element, wanted.removeUnlisted);
+        }
+        if (!list.unlisted.empty() && wanted.removeUnlisted.count(list.unlisted) > 0) {
+            section.removeUnlisted(elements);
+        }
+        section.finish();
     }
     return plan;
 }
 
-std::vector<PlannedChange> changesNotTaken(const Wanted& wanted, const Plan& plan, const State& before,
-                                           const State& after, bool settingsWritten, std::span<const std::string> log) {
-    std::vector<PlannedChange> failed;
-    Wanted visible = wanted;
-    const auto addIf = [&](bool failedToTake, const std::string& entry) {
-        if (const PlannedChange* change = failedToTake ? changeOf(plan, entry) : nullptr) {
-            failed.push_back(*change);
-        }
-    };
-
-    if (wanted.password) {
-        const bool isSet = booleanOf(after.settings.get("nimbo_client_password_is_set"));
-        addIf(!settingsWritten || isSet == wanted.password->empty() ||
-                  logs(log, {"nimbo_client_password encryption failed"}),
-              "settings." + std::string(passwordKey));
-        visible.password.reset();
-    }
-    if (const std::string* controller = wanted.settings.get(controllerKey).string();
-        controller != nullptr && settingsWritten && isLookedUp(*controller)) {
-        visible.settings.remove(controllerKey);  // what stands there now is what the service made of it
-    }
-    for (WantedProperty& property : visible.properties) {
-        property.writeSecret = false;
-        const ListedProperty* stored = property.remove ? nullptr : findProperty(before, property.name);
-        if (stored == nullptr) {
-            continue;
-        }
-        const bool becomes = property.isProtected.value_or(stored->isProtected);
-        const std::string entry = "properties." + tomlKey(property.name);
-        const bool refused = logs(log, {"could not update property with id: " + stored->id + ','});
-        addIf(becomes && refused, entry + ".value");
-        addIf(stored->isProtected && !becomes && !property.value && cipherFailed(log), entry + ".protect");
-    }
-    std::erase_if(visible.cameras, [&](const WantedCamera& camera) {
-        const bool gone = camera.remove && after.cameras && findCamera(after, camera.key) == nullptr;
-        return gone;
-    });
+PlanOutcome outcomeOf(const StateForm& form, const Wanted& wanted, const Plan& plan, const State& before,
+                      const std::optional<State>& after, bool answered, const RequestReport& report) {
+    PlanOutcome outcome;
+    std::vector<PlannedChange> remaining;
+    bool isReadable = after.has_value();
     try {
-        for (PlannedChange& change : planOf(visible, after).changes) {
-            const bool named = std::any_of(failed.begin(), failed.end(),
-                                           [&](const PlannedChange& one) { return one.entry == change.entry; });
-            if (!named) {
-                failed.push_back(std::move(change));
-            }
+        if (after) {
+            remaining = planOf(form, comparable(form, wanted, plan, before, *after, answered), *after).changes;
         }
     } catch (const Failure&) {
-        return plan.changes;  // what was there before is no more, or cannot be read: nothing is known to have taken
+        isReadable = false;  // an element is no longer there, or its section cannot be read
     }
-    return failed;
+    const bool isDone = report.state == RequestReport::State::done;
+    for (const PlannedChange& change : plan.changes) {
+        const auto still = std::find_if(remaining.begin(), remaining.end(),
+                                        [&](const PlannedChange& one) { return one.entry == change.entry; });
+        const ReportedGap* gap = gapOf(change, report, !change.hidden);
+        const DescribedKey* secret = change.identity.empty() ? form.secret(change.key) : nullptr;
+        const auto fail = [&](const PlannedChange& what) {
+            const ReportedGap* reason = gapOf(change, report, false);
+            outcome.failed.push_back({what, reason != nullptr ? reasonOf(*reason) : ""});
+        };
+        if (still != remaining.end()) {
+            fail(*still);
+        } else if (gap != nullptr) {
+            fail(change);
+        } else if (!isReadable) {
+            outcome.undetermined.push_back(change);
+        } else if (secret != nullptr &&
+                   booleanOf(after->settings.get(secret->shownBy)) == wanted.secrets.at(change.key).empty()) {
+            fail(change);
+        } else if (change.hidden && !(isDone && answered) && !isReported(form, change, report)) {
+            outcome.undetermined.push_back(change);
+        } else {
+            outcome.applied.push_back(change);
+        }
+    }
+    for (const PlannedChange& change : remaining) {
+        const bool isPlanned = std::any_of(plan.changes.begin(), plan.changes.end(),
+                                           [&](const PlannedChange& one) { return one.entry == change.entry; });
+        if (!isPlanned) {
+            outcome.failed.push_back({change, ""});
+        }
+    }
+    return outcome;
 }
 
 }  // namespace adminhost::ctl

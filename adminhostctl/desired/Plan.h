@@ -1,72 +1,86 @@
 #pragma once
 
-// From what is wanted and what is there to the changes that make the one the other. No input, no output.
+// From what is wanted and what is there to the changes between them, and what became of the changes. No input, no
+// output.
 
+#include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/desired/State.h"
 #include "platform/value/Value.h"
 
+#include <map>
 #include <optional>
-#include <span>
+#include <set>
 #include <string>
 #include <vector>
 
 namespace adminhost::ctl {
 
-struct WantedProperty {
-    std::string name;
-    std::optional<std::string> value;  ///< nothing: as it is
-    std::optional<bool> isProtected;   ///< nothing: as it is
+/// What is wanted of one element. What is absent stays as it is.
+struct WantedElement {
+    std::string name;                                       ///< label, or identity where people may use it
+    Dictionary fields;                                      ///< by their key
+    std::map<std::string, std::vector<std::string>> lists;  ///< labels of people, by the name of their list in a file
+    std::vector<Person> denied;                             ///< by label; an empty kind means all kinds
     bool remove = false;
-    /// Write the value of a protected property too. It cannot be compared, so a file that is applied again and again
-    /// does not ask for it.
+    /// Write a text that is a secret already. It cannot be compared, so a file that is applied again and again does not
+    /// ask for it.
     bool writeSecret = false;
-};
-
-struct WantedCamera {
-    std::string key;  ///< name or UUID
-    std::optional<bool> restricted;
-    std::optional<std::vector<std::string>> users;  ///< short names; nothing: as they are
-    std::optional<std::vector<std::string>> groups;
-    std::vector<ListedPerson> denied;  ///< by short name; an empty kind means both
-    bool remove = false;
 };
 
 struct Wanted {
     Dictionary settings;
-    std::optional<std::string> password;  ///< of the grid account; "" removes the stored one
-    std::vector<WantedProperty> properties;
-    std::vector<WantedCamera> cameras;
-    bool removeProperties = false;  ///< remove those that are not listed
-    bool removePeople = false;      ///< of each list of users or groups that is given
-    /// Write a controller's name that the write itself looks up, although what it finds cannot be told before.
-    bool lookUpController = false;
+    std::map<std::string, std::string> secrets;                  ///< secret settings; "" removes the stored one
+    std::map<std::string, std::vector<WantedElement>> elements;  ///< by section
+    std::set<std::string> removeUnlisted;                        ///< switches that are on
+    /// Write a name that the write itself looks up, although what it finds is not known before.
+    bool lookUp = false;
 };
 
 struct PlannedChange {
-    std::string entry;  ///< "settings.server_port", "cameras.\"Main hall\".users.anna"
-    std::string from;   ///< as TOML writes it, or words in parentheses; "(secret)" for every secret
-    std::string to;
+    std::string entry;     ///< "settings.server_port", "cameras.\"Main hall\".users.anna"
+    std::string from;      ///< as TOML writes it, or words in parentheses; "(secret)" for every secret
+    std::string to;        ///< the same
+    std::string keyPath;   ///< where in the request it is: "configuration.cameras.0"
+    bool hidden = false;   ///< reading does not show whether it was applied
+    std::string identity;  ///< of the element
+    std::string key;       ///< of the setting, or of the element
 
-    friend bool operator==(const PlannedChange&, const PlannedChange&) = default;
+    /// Of what changes; where in the request it is does not matter.
+    friend bool operator==(const PlannedChange& a, const PlannedChange& b) {
+        return a.entry == b.entry && a.from == b.from && a.to == b.to;
+    }
 };
 
 struct Plan {
     std::vector<PlannedChange> changes;
-    std::vector<std::string> notes;  ///< what is wanted and left as it is, and why
-    Dictionary configuration;        ///< for writeSettings; empty when nothing changes
-    bool restart = false;            ///< whether the service has to be restarted for a change to take effect
+    std::vector<std::string> notes;    ///< what is wanted and left as it is, what follows from a change
+    Dictionary root;                   ///< what to write; empty when nothing changes
+    std::vector<std::string> restart;  ///< commands that have to be run for a change to take effect
+    bool moves = false;                ///< other settings files, perhaps another database, are used from then on
 };
 
-/// Whether writing the controller's name makes the service look it up and store the host name that it finds.
-[[nodiscard]] bool isLookedUp(const std::string& controller);
+/// Whether writing the value makes the service look it up and store what it finds.
+[[nodiscard]] bool isLookedUp(const DescribedKey& setting, const Value& value);
 
 /// Throws Failure(usage) when something wanted does not fit what is there, naming it.
-[[nodiscard]] Plan planOf(const Wanted& wanted, const State& state);
+[[nodiscard]] Plan planOf(const StateForm& form, const Wanted& wanted, const State& state);
 
-/// The changes of the plan that did not take, `from` being what is there instead. `settingsWritten` says that the
-/// service wrote its settings files. What no reading shows is judged by the log lines of the writing request.
-[[nodiscard]] std::vector<PlannedChange> changesNotTaken(const Wanted& wanted, const Plan& plan, const State& before,
-                                                         const State& after, bool settingsWritten,
-                                                         std::span<const std::string> log);
+/// A change that was not applied, and why as far as the daemon reports it.
+struct FailedChange {
+    PlannedChange change;  ///< its `from` is what is there instead
+    std::string reason;    ///< empty if there is no report
+};
+
+struct PlanOutcome {
+    std::vector<PlannedChange> applied;
+    std::vector<FailedChange> failed;
+    std::vector<PlannedChange> undetermined;
+};
+
+/// What became of the plan's changes. `after` is what reading shows afterwards, nothing when it cannot be read.
+/// `answered` says that the writing command answered without an error. Reading decides; the daemon's report of what was
+/// not carried out decides on what reading does not show.
+[[nodiscard]] PlanOutcome outcomeOf(const StateForm& form, const Wanted& wanted, const Plan& plan, const State& before,
+                                    const std::optional<State>& after, bool answered, const RequestReport& report);
 
 }  // namespace adminhost::ctl

@@ -15,99 +15,95 @@ std::string textAt(const Dictionary& dictionary, std::string_view key) {
     return value.isNull() ? std::string() : textOf(value);
 }
 
-ListedCamera cameraOf(const Dictionary& listed) {
-    ListedCamera camera{
-        textAt(listed, "_id_"), textAt(listed, "name"), booleanOf(listed.get("access_control_enabled")), {}};
-    const Array* allowed = listed.get("allowedUsersAndGroups").array();
-    for (const Value& entry : allowed != nullptr ? *allowed : Array{}) {
-        if (const Dictionary* person = entry.dictionary()) {
-            camera.allowed.push_back({textAt(*person, "type"), textAt(*person, "shortName"), textAt(*person, "_id_")});
-        }
-    }
-    return camera;
-}
-
-ListedProperty propertyOf(const Dictionary& listed) {
-    ListedProperty property{textAt(listed, "_id_"), textAt(listed, "name"), std::nullopt,
-                            booleanOf(listed.get("protect"))};
-    if (listed.contains("value") && !property.isProtected) {
-        property.value = textAt(listed, "value");
-    }
-    return property;
-}
-
-template <typename Element>
-std::optional<std::vector<Element>> listOf(const Value& list, Element (*make)(const Dictionary&)) {
-    if (list.array() == nullptr) {
-        return std::nullopt;
-    }
-    std::vector<Element> all;
-    for (const Value& element : *list.array()) {
-        if (element.dictionary() != nullptr && !textAt(*element.dictionary(), "_id_").empty()) {
-            all.push_back(make(*element.dictionary()));
-        }
-    }
-    return all;
-}
-
-Failure notListed(const std::string& what) {
-    return {ExitStatus::answeredError, "the service answered no " + what + ": its database cannot be read"};
-}
-
-}  // namespace
-
-State stateOf(const Dictionary& configuration) {
-    State state;
-    for (const DictionaryEntry& entry : configuration) {
-        if (entry.key != "cameras" && entry.key != "workflows" && entry.key != "properties") {
-            state.settings.set(entry.key, entry.value);
-        }
-    }
-    state.properties = listOf<ListedProperty>(configuration.get("properties"), &propertyOf);
-    state.cameras = listOf<ListedCamera>(configuration.get("cameras"), &cameraOf);
-    return state;
-}
-
-bool sameUuid(const std::string& a, const std::string& b) {
+bool sameInAnyCase(const std::string& a, const std::string& b) {
     return std::equal(a.begin(), a.end(), b.begin(), b.end(),
                       [](unsigned char x, unsigned char y) { return std::tolower(x) == std::tolower(y); });
 }
 
-const ListedCamera* findCamera(const State& state, const std::string& nameOrUuid) {
-    if (!state.cameras) {
-        throw notListed("cameras");
-    }
-    const ListedCamera* named = nullptr;
-    std::string uuids;
-    int count = 0;
-    for (const ListedCamera& camera : *state.cameras) {
-        if (sameUuid(camera.uuid, nameOrUuid)) {
-            return &camera;
+std::vector<Person> peopleOf(const PeopleForm& form, const Dictionary& listed) {
+    std::vector<Person> people;
+    const Array* entries = listed.get(form.key).array();
+    for (const Value& entry : entries != nullptr ? *entries : Array{}) {
+        if (const Dictionary* person = entry.dictionary()) {
+            people.push_back({textAt(*person, form.kind), textAt(*person, form.label), textAt(*person, form.identity)});
         }
-        if (camera.name == nameOrUuid) {
-            named = &camera;
-            uuids += "\n  " + camera.uuid;
+    }
+    return people;
+}
+
+Element elementOf(const ListForm& list, const Dictionary& listed) {
+    Element element{textAt(listed, list.identity), textAt(listed, list.label), {}, {}};
+    for (const FieldForm& field : list.fields) {
+        if (field.boolean) {
+            element.fields.set(field.key, booleanOf(listed.get(field.key)));
+        }
+    }
+    for (const FieldForm& field : list.fields) {
+        if (!field.boolean && listed.contains(field.key) && !isSecret(field, element)) {
+            element.fields.set(field.key, textAt(listed, field.key));
+        }
+    }
+    for (const PeopleForm& people : list.people) {
+        element.people[people.key] = peopleOf(people, listed);
+    }
+    return element;
+}
+
+}  // namespace
+
+State stateOf(const StateForm& form, const Dictionary& root) {
+    State state;
+    for (const DictionaryEntry& entry : root) {
+        if (entry.value.array() == nullptr || form.setting(entry.key) != nullptr) {
+            state.settings.set(entry.key, entry.value);
+        }
+    }
+    for (const ListForm& list : form.lists()) {
+        const Array* elements = root.get(list.key).array();
+        if (elements == nullptr) {
+            continue;
+        }
+        std::vector<Element>& all = state.lists[list.section];
+        for (const Value& element : *elements) {
+            if (element.dictionary() != nullptr && !textAt(*element.dictionary(), list.identity).empty()) {
+                all.push_back(elementOf(list, *element.dictionary()));
+            }
+        }
+    }
+    return state;
+}
+
+bool isSecret(const FieldForm& field, const Element& element) {
+    return !field.secretIf.empty() && element.fields.get(field.secretIf).boolean().value_or(false);
+}
+
+const std::vector<Element>& elementsOf(const State& state, const ListForm& list) {
+    const auto found = state.lists.find(list.section);
+    if (found == state.lists.end()) {
+        throw Failure(ExitStatus::answeredError,
+                      "the service does not list its " + list.section + ": its database is missing or cannot be read");
+    }
+    return found->second;
+}
+
+const Element* findElement(const State& state, const ListForm& list, const std::string& name) {
+    const Element* found = nullptr;
+    std::string identities;
+    int count = 0;
+    for (const Element& element : elementsOf(state, list)) {
+        if (list.byIdentity && sameInAnyCase(element.identity, name)) {
+            return &element;
+        }
+        if (element.label == name) {
+            found = &element;
+            identities += "\n  " + element.identity;
             ++count;
         }
     }
     if (count > 1) {
-        throw usageError("several cameras have the name " + tomlText(nameOrUuid) +
-                         "; give one of their UUIDs:" + uuids);
-    }
-    return named;
-}
-
-const ListedProperty* findProperty(const State& state, const std::string& name) {
-    if (!state.properties) {
-        throw notListed("properties");
-    }
-    const ListedProperty* found = nullptr;
-    for (const ListedProperty& property : *state.properties) {
-        if (property.name == name && found != nullptr) {
-            throw usageError("several properties have the name " + tomlText(name) +
-                             "; remove one with writeSettings and its _id_");
-        }
-        found = property.name == name ? &property : found;
+        throw usageError(list.section + ": several have the name " + tomlText(name) +
+                         (list.byIdentity ? "; use one of these instead:" : "; remove all but one of these:") +
+                         identities);
     }
     return found;
 }

@@ -1,59 +1,50 @@
 #pragma once
 
-// The configuration as the service answers it, in the form that changes are derived from.
+// A state as the service answers it, in the form that changes are derived from.
 
+#include "adminhostctl/desired/StateForm.h"
 #include "platform/value/Value.h"
 
+#include <map>
 #include <optional>
 #include <string>
-#include <string_view>
 #include <vector>
 
 namespace adminhost::ctl {
 
-// Settings that are no plain values: one is written and never answered, one may be looked up.
-inline constexpr std::string_view passwordKey = "nimbo_client_password";
-inline constexpr std::string_view controllerKey = "nimbo_controller";
-
-/// An entry of an access list that the directory knows.
-struct ListedPerson {
-    std::string kind;  ///< "user" or "group"
-    std::string shortName;
-    std::string id;  ///< UUID
+/// An entry of a list of people. The service lists only those that the directory knows.
+struct Person {
+    std::string kind;  ///< "user", "group"
+    std::string label;
+    std::string identity;
 };
 
-struct ListedCamera {
-    std::string uuid;
-    std::string name;
-    bool restricted = false;  ///< only the people of the list may use it
-    std::vector<ListedPerson> allowed;
-};
-
-struct ListedProperty {
-    std::string id;  ///< row number
-    std::string name;
-    std::optional<std::string> value;  ///< nothing for a protected one
-    bool isProtected = false;
+/// An element of a section.
+struct Element {
+    std::string identity;
+    std::string label;
+    Dictionary fields;                                  ///< texts and booleans by their key; a secret text is absent
+    std::map<std::string, std::vector<Person>> people;  ///< by the key of the list
 };
 
 struct State {
-    Dictionary settings;  ///< all but the lists, also what is derived and cannot be written
-    /// In the service's order. Nothing when the service answered no list: its database cannot be read.
-    std::optional<std::vector<ListedProperty>> properties;
-    std::optional<std::vector<ListedCamera>> cameras;
+    Dictionary settings;  ///< all plain values, also those that cannot be written
+    /// By section, in the service's order. A section is missing when the service listed none: its database is missing
+    /// or cannot be read.
+    std::map<std::string, std::vector<Element>> lists;
 };
 
-/// Elements without identity are left out; what has an unexpected type counts as missing.
-[[nodiscard]] State stateOf(const Dictionary& configuration);
+/// Elements without identity are left out; a value of an unexpected type counts as missing.
+[[nodiscard]] State stateOf(const StateForm& form, const Dictionary& root);
 
-/// Whether two texts are the same UUID, in whatever case.
-[[nodiscard]] bool sameUuid(const std::string& a, const std::string& b);
+/// Whether the text of the field is a secret of this element.
+[[nodiscard]] bool isSecret(const FieldForm& field, const Element& element);
 
-/// The camera with the UUID (in any case) or, if there is none, with the name; null if there is none of the name.
-/// Throws Failure: several have the name (usage), cameras are not listed (answeredError).
-[[nodiscard]] const ListedCamera* findCamera(const State& state, const std::string& nameOrUuid);
+/// The elements of a section. Throws Failure(answeredError) when the service listed none.
+[[nodiscard]] const std::vector<Element>& elementsOf(const State& state, const ListForm& list);
 
-/// Null if there is none. Throws Failure: several have the name (usage), properties are not listed (answeredError).
-[[nodiscard]] const ListedProperty* findProperty(const State& state, const std::string& name);
+/// The element with the identity, in any case (where people may use it), or else with the label; null if there is none.
+/// Throws Failure: several have the label (usage), the section is not listed (answeredError).
+[[nodiscard]] const Element* findElement(const State& state, const ListForm& list, const std::string& name);
 
 }  // namespace adminhost::ctl

@@ -7,82 +7,188 @@
 namespace adminhost::ctl {
 namespace {
 
-constexpr std::string_view restartAdvice =
-    "the service has to be restarted for this to take effect: adminhostctl stopService, then startService";
-
-Array changesValue(std::span<const PlannedChange> changes) {
-    Array all;
-    for (const PlannedChange& change : changes) {
-        all.emplace_back(Dictionary{{"entry", change.entry}, {"from", change.from}, {"to", change.to}});
-    }
-    return all;
-}
-
 /// The dictionary of an answer that has to be one.
 const Dictionary& dictionaryOf(const std::optional<Value>& answer) {
     if (!answer || answer->dictionary() == nullptr) {
-        throw Failure(ExitStatus::answeredError, "the service answered no dictionary");
+        throw Failure(ExitStatus::answeredError, "the service did not return a dictionary");
     }
     return *answer->dictionary();
 }
 
-const Dictionary& configurationOf(const Dictionary& answer) {
-    const Dictionary* configuration = answer.get("configuration").dictionary();
-    if (configuration == nullptr) {
-        throw Failure(ExitStatus::answeredError, "the service answered no configuration");
-    }
-    return *configuration;
-}
-
 void showLine(std::ostream& out, const PlannedChange& change) {
-    out << shown(change.entry) << ": " << change.from << " -> " << change.to << '\n';
+    out << shown(change.entry) << ": " << change.from << " -> " << change.to;
 }
 
-void sayResolved(const Context& context, const Wanted& wanted, const State& after) {
-    const Value& name = wanted.settings.get(controllerKey);
-    if (!wanted.lookUpController || name.string() == nullptr || !isLookedUp(*name.string())) {
-        return;
+void showLines(std::ostream& err, const char* heading, const std::vector<PlannedChange>& changes) {
+    if (!changes.empty()) {
+        err << "adminhostctl: " << heading << '\n';
     }
-    const Value& stored = after.settings.get(controllerKey);
-    context.err << (stored == name ? "the name was not found on the local network and is stored as it stands"
-                                   : "the name was resolved to " + tomlValue(stored).value_or("nothing"))
-                << '\n';
+    for (const PlannedChange& change : changes) {
+        err << "  ";
+        showLine(err, change);
+        err << '\n';
+    }
 }
+
+void showFailed(std::ostream& err, const std::vector<FailedChange>& failed) {
+    if (!failed.empty()) {
+        err << "adminhostctl: these changes were not applied:\n";
+    }
+    for (const FailedChange& one : failed) {
+        err << "  ";
+        showLine(err, one.change);
+        err << (one.reason.empty() ? "" : ": " + shown(one.reason)) << '\n';
+    }
+}
+
+/// Names that the write has looked up, and what it has stored.
+void showLookedUp(const Context& context, const StateForm& form, const Plan& plan, const State& after) {
+    for (const DescribedKey& key : form.settings()) {
+        const std::string name = form.nameOf(key);
+        const Value& written = plan.root.get(name);
+        if (written.isNull() || !isLookedUp(key, written)) {
+            continue;
+        }
+        const Value& stored = after.settings.get(name);
+        context.err << form.settingsSection() << '.' << name << ": "
+                    << (stored == written
+                            ? "not found on the local network, stored as it is"
+                            : "found on the local network, stored as " + tomlValue(stored).value_or("(not set)"))
+                    << '\n';
+    }
+}
+
+/// One write, and what became of it.
+class PlannedWrite {
+  public:
+    PlannedWrite(const Context& context, const CurrentState& current, const Wanted& wanted, Plan plan)
+        : _context(context),
+          _current(current),
+          _wanted(wanted),
+          _plan(std::move(plan)),
+          _command(context.service.stateCommand("write")) {}
+
+    ExitStatus perform() {
+        CommandAnswer answer;
+        try {
+            answer = _context.service.ask(_command, {{_current.form.root(), _plan.root}}, _current.revision);
+        } catch (const LostAnswer& lost) {
+            return afterLost(lost);
+        }
+        const Dictionary& said = dictionaryOf(answer.value);
+        const std::string error = errorOf(_command.description, said);
+        const RequestReport report = _context.service.report(answer.requestId);
+        std::optional<State> after;
+        if (const Dictionary* root = said.get(_current.form.root()).dictionary()) {
+            after = stateOf(_current.form, *root);
+        }
+        const PlanOutcome outcome =
+            outcomeOf(_current.form, _wanted, _plan, _current.state, after, error.empty(), report);
+        showPlan(_context, _plan);
+        if (after) {
+            showLookedUp(_context, _current.form, _plan, *after);
+        }
+        const ExitStatus status = reportAnswered(_context, error);
+        showFailed(_context.err, outcome.failed);
+        showLines(_context.err, "it could not be determined whether these changes were applied:", outcome.undetermined);
+        if (status == ExitStatus::done && outcome.failed.empty() && outcome.undetermined.empty()) {
+            return ExitStatus::done;
+        }
+        _context.err << (report.log.empty() ? "the request logged nothing\n" : "log lines of the request:\n");
+        for (const std::string& line : report.log) {
+            _context.err << "  " << shown(line) << '\n';
+        }
+        return status == ExitStatus::done && outcome.failed.empty() ? ExitStatus::undetermined
+                                                                    : ExitStatus::answeredError;
+    }
+
+  private:
+    /// Nothing is sent again: reading and the daemon's report show what was written.
+    ExitStatus afterLost(const LostAnswer& lost) {
+        const RequestReport report = reportLost(_context, lost);
+        std::optional<State> after;
+        // While the request runs, reading would only wait for it and show nothing that is final.
+        if (report.state == RequestReport::State::done || report.state == RequestReport::State::unknown) {
+            try {
+                after = readState(_context).state;
+            } catch (const Failure& failure) {
+                _context.err << "adminhostctl: reading back: " << shown(failure.what()) << '\n';
+            }
+        }
+        PlanOutcome outcome = outcomeOf(_current.form, _wanted, _plan, _current.state, after, false, report);
+        Plan applied;
+        applied.changes = outcome.applied;
+        applied.restart = outcome.applied.empty() ? std::vector<std::string>() : _plan.restart;
+        if (!applied.changes.empty()) {
+            _context.err << "these changes were applied:\n";
+            _context.err.flush();
+            showPlan(_context, applied);
+        }
+        showFailed(_context.err, outcome.failed);
+        showLines(_context.err, "it could not be determined whether these changes were applied:", outcome.undetermined);
+        return !outcome.undetermined.empty()               ? ExitStatus::undetermined
+               : !outcome.failed.empty()                   ? ExitStatus::answeredError
+               : lost.status() == ExitStatus::undetermined ? ExitStatus::done
+                                                           : lost.status();
+    }
+
+    const Context& _context;
+    const CurrentState& _current;
+    const Wanted& _wanted;
+    Plan _plan;
+    CommandRef _command;
+};
 
 }  // namespace
 
-const DescribedKey* settingKey(const Description& writeSettings, const std::string& name) {
-    if (name.find_first_of(".[") != std::string::npos) {
-        return nullptr;
+CurrentState readState(const Context& context, const std::string& section) {
+    StateForm form(context.service.stateCommand("write").description);
+    const CommandRef command = context.service.stateCommand("read");
+    const CommandAnswer answer = context.service.ask(command, command.description.partOf(section));
+    const Dictionary* root = dictionaryOf(answer.value).get(form.root()).dictionary();
+    if (root == nullptr) {
+        throw Failure(ExitStatus::answeredError, "the service did not return its " + form.root());
     }
-    const DescribedKey* key = writeSettings.key("configuration." + name);
-    // The lists have verbs of their own, and a boolean there is an order, not a setting.
-    return key != nullptr && !key->secret && (key->type == "text" || key->type == "scalar") ? key : nullptr;
-}
-
-CurrentState readState(const Context& context) {
-    const CommandAnswer answer = context.service.ask(context.service.command("readSettings"), {});
-    return {stateOf(configurationOf(dictionaryOf(answer.value))), answer.revision};
+    if (answer.notDone) {
+        std::string reasons;
+        for (const ReportedGap& gap : context.service.report(answer.requestId).notDone) {
+            reasons += "\n  " + gapText(gap);
+        }
+        throw Failure(ExitStatus::answeredError, "parts of the state could not be read:" + reasons);
+    }
+    State state = stateOf(form, *root);
+    return {std::move(form), std::move(state), answer.revision};
 }
 
 void showPlan(const Context& context, const Plan& plan) {
     if (context.options.format != Format::text) {
+        Array changes;
+        for (const PlannedChange& change : plan.changes) {
+            changes.emplace_back(Dictionary{{"entry", change.entry}, {"from", change.from}, {"to", change.to}});
+        }
         Array notes;
         for (const std::string& note : plan.notes) {
             notes.emplace_back(note);
         }
-        writeValue(context,
-                   Dictionary{{"changes", changesValue(plan.changes)}, {"notes", notes}, {"restart", plan.restart}},
-                   Description());
+        writeValue(
+            context,
+            Dictionary{
+                {"changes", std::move(changes)}, {"notes", std::move(notes)}, {"restart", !plan.restart.empty()}},
+            Description());
         return;
     }
     for (const PlannedChange& change : plan.changes) {
         showLine(context.out, change);
+        context.out << '\n';
     }
     if (plan.changes.empty()) {
         context.out << "no change\n";
-    } else if (plan.restart) {
-        context.out << restartAdvice << '\n';
+    } else if (!plan.restart.empty()) {
+        context.out << "the service has to be restarted for this to take effect: adminhostctl ";
+        for (std::size_t i = 0; i < plan.restart.size(); ++i) {
+            context.out << (i == 0 ? "" : ", then ") << shown(plan.restart[i]);
+        }
+        context.out << '\n';
     }
     for (const std::string& note : plan.notes) {
         context.err << shown(note) << '\n';
@@ -90,43 +196,32 @@ void showPlan(const Context& context, const Plan& plan) {
 }
 
 ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentState& current) {
-    Plan plan = planOf(wanted, current.state);
+    Plan plan = planOf(current.form, wanted, current.state);
     if (plan.changes.empty()) {
         showPlan(context, plan);
         return ExitStatus::done;
     }
-    const CommandRef command = context.service.command("writeSettings");
-    const CommandAnswer answer =
-        context.service.ask(command, {{"configuration", plan.configuration}}, current.revision);
-    const Dictionary& said = dictionaryOf(answer.value);
-    const std::string error = errorOf(command.description, said);
-    const std::vector<std::string> log = context.service.logLines(answer.requestId);
-    // Without a configuration nothing is known to have taken.
-    const Dictionary* read = said.get("configuration").dictionary();
-    const State after = read != nullptr ? stateOf(*read) : State();
-    const std::vector<PlannedChange> failed = changesNotTaken(wanted, plan, current.state, after, error.empty(), log);
-
-    plan.restart = booleanOf(said.get("needsRecycleOrRestart"));
-    showPlan(context, plan);
-    sayResolved(context, wanted, after);
-    if (error.empty() && failed.empty()) {
+    Wanted settings = wanted;
+    settings.elements.clear();
+    settings.removeUnlisted.clear();
+    Plan first = planOf(current.form, settings, current.state);
+    if (!plan.moves || first.changes.size() == plan.changes.size()) {
+        return PlannedWrite(context, current, wanted, std::move(plan)).perform();
+    }
+    // The new files may come with another database, in which an identity stands for another element.
+    const ExitStatus status = PlannedWrite(context, current, settings, std::move(first)).perform();
+    if (status != ExitStatus::done) {
+        return status;
+    }
+    Wanted elements = wanted;
+    elements.settings = {};
+    elements.secrets.clear();
+    const CurrentState moved = readState(context);
+    Plan second = planOf(moved.form, elements, moved.state);
+    if (second.changes.empty()) {
         return ExitStatus::done;
     }
-    if (!error.empty()) {
-        context.err << "adminhostctl: the service answered an error: " << error << '\n';
-    }
-    if (!failed.empty()) {
-        context.err << "adminhostctl: these changes did not take:\n";
-        for (const PlannedChange& change : failed) {
-            context.err << "  ";
-            showLine(context.err, change);
-        }
-    }
-    context.err << (log.empty() ? "the request logged nothing\n" : "log lines of the request:\n");
-    for (const std::string& line : log) {
-        context.err << "  " << shown(line) << '\n';
-    }
-    return ExitStatus::answeredError;
+    return PlannedWrite(context, moved, elements, std::move(second)).perform();
 }
 
 }  // namespace adminhost::ctl

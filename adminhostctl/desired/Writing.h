@@ -9,24 +9,25 @@
 
 namespace adminhost::ctl {
 
-/// What the service says now, and the revision that stands for it.
+/// What the service says now, what it consists of, and the revision of it.
 struct CurrentState {
+    StateForm form;
     State state;
     std::string revision;
 };
 
-/// Throws Failure when the service cannot answer its configuration.
-[[nodiscard]] CurrentState readState(const Context& context);
-
-/// The description of a setting that writeSettings takes and that can be read again; null if there is none of the name.
-[[nodiscard]] const DescribedKey* settingKey(const Description& writeSettings, const std::string& name);
+/// The state, or only one section of it. Throws Failure when the service cannot answer it, or answers that parts of it
+/// could not be read.
+[[nodiscard]] CurrentState readState(const Context& context, const std::string& section = {});
 
 /// The plan in the asked format.
 void showPlan(const Context& context, const Plan& plan);
 
-/// Changes what differs from what is wanted, and says what. Nothing is sent when nothing differs. The write is refused
-/// by the daemon when another client has changed something since the reading. Answers answeredError after naming each
-/// change that did not take, with the log lines of the request.
+/// Changes what differs from what is wanted, and prints what. Nothing is sent when nothing differs. The write is
+/// refused by the daemon when another client has changed something since the reading. A change that moves settings
+/// files is written before the elements, which are planned again on what is there then. Returns answeredError after
+/// naming each change that was not applied, and undetermined when the answer is missing and reading and the daemon's
+/// report do not show what was written. Nothing is ever written twice.
 [[nodiscard]] ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentState& current);
 
 }  // namespace adminhost::ctl

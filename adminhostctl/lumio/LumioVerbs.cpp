@@ -4,7 +4,6 @@
 #include "adminhostctl/desired/State.h"
 #include "adminhostctl/desired/Toml.h"
 #include "adminhostctl/desired/Writing.h"
-#include "platform/value/ValueText.h"
 
 #include <array>
 
@@ -13,34 +12,31 @@ namespace {
 
 using Words = std::span<const std::string>;
 
-// Lists of the service
+constexpr const char* cameras = "cameras";
+constexpr const char* properties = "properties";
 
-/// The list under the key of the command's answer. When the command answers an error, says so and answers null.
-Value listOf(const Context& context, const CommandRef& command, const std::string& key) {
-    const auto answer = context.service.perform(command, {});
-    if (!answer || answer->dictionary() == nullptr) {
-        static_cast<void>(reportAnswered(context, "it answered no dictionary"));
-        return {};
-    }
-    std::string error = errorOf(command.description, *answer->dictionary());
-    const Value& list = answer->dictionary()->get(key);
-    if (error.empty() && list.array() == nullptr) {
+/// The list under the key of the command's answer. Throws Failure when the command answers an error.
+Array listOf(const Context& context, const CommandRef& command, const std::string& key) {
+    const CommandAnswer answer = context.service.ask(command, {});
+    const Dictionary* said = answer.value ? answer.value->dictionary() : nullptr;
+    std::string error = said == nullptr ? "it did not return a dictionary" : errorOf(command.description, *said);
+    if (error.empty() && said->get(key).array() == nullptr) {
         error = key + " is missing";
     }
-    return reportAnswered(context, error) == ExitStatus::done ? list : Value();
+    if (!error.empty()) {
+        throw Failure(ExitStatus::answeredError, "the service returned an error: " + error);
+    }
+    return *said->get(key).array();
 }
 
 ExitStatus list(const Context& context, const std::string& name, const std::string& key) {
     const CommandRef command = context.service.command(name);
-    const Value all = listOf(context, command, key);
-    if (all.isNull()) {
-        return ExitStatus::answeredError;
-    }
+    const Array all = listOf(context, command, key);
     if (!context.options.names) {
         writeValue(context, all, command.description, key);
         return ExitStatus::done;
     }
-    for (const Value& element : *all.array()) {
+    for (const Value& element : all) {
         const std::string* text =
             element.dictionary() != nullptr ? element.dictionary()->get("name").string() : nullptr;
         context.out << (text != nullptr ? shown(*text) + '\n' : "");
@@ -48,64 +44,58 @@ ExitStatus list(const Context& context, const std::string& name, const std::stri
     return ExitStatus::done;
 }
 
-/// Shows the one element of a list that has the name or, in any case, the UUID.
-ExitStatus show(const Context& context, const std::string& name, const std::string& key, const std::string& wanted) {
-    const CommandRef command = context.service.command(name);
-    const Value all = listOf(context, command, key);
-    if (all.isNull()) {
-        return ExitStatus::answeredError;
-    }
-    Array named;
-    for (const Value& element : *all.array()) {
-        const Dictionary* dictionary = element.dictionary();
-        const std::string* uuid = dictionary != nullptr ? dictionary->get("uuid").string() : nullptr;
-        if (uuid != nullptr && sameUuid(*uuid, wanted)) {
-            named = {element};
-            break;
-        }
-        if (dictionary != nullptr && dictionary->get("name") == Value(wanted)) {
-            named.push_back(element);
-        }
-    }
-    if (named.empty()) {
-        throw Failure(ExitStatus::answeredError, "there is none with the name or UUID " + shown(wanted));
-    }
-    if (named.size() > 1) {
-        std::string uuids;
-        for (const Value& element : named) {
-            uuids += "\n  " + shown(textOf(element.dictionary()->get("uuid")));
-        }
-        throw usageError("several have the name " + shown(wanted) + "; give one of their UUIDs:" + uuids);
-    }
-    writeValue(context, named.front(), command.description, key + "[]");
-    return ExitStatus::done;
+Failure notFound(const std::string& kind, const std::string& name) {
+    return usageError(kind + " not found: " + name + "; \"adminhostctl " + kind + " list\" shows the names");
 }
 
 ExitStatus cameraList(const Context& context, Words) {
-    return list(context, "getCameras", "cameras");
-}
-ExitStatus cameraShow(const Context& context, Words words) {
-    return show(context, "getCameras", "cameras", words.front());
+    return list(context, "getCameras", cameras);
 }
 ExitStatus propertyList(const Context& context, Words) {
-    return list(context, "getProperties", "properties");
+    return list(context, "getProperties", properties);
 }
 
-ExitStatus changeCamera(const Context& context, WantedCamera camera) {
+ExitStatus cameraShow(const Context& context, Words words) {
+    const CommandRef command = context.service.command("getCameras");
+    const Array all = listOf(context, command, cameras);
+    const StateForm form(context.service.stateCommand("write").description);
+    const State state = stateOf(form, {{cameras, all}});
+    const Element* camera = findElement(state, form.list(cameras), words.front());
+    if (camera == nullptr) {
+        throw notFound("camera", words.front());
+    }
+    for (const Value& element : all) {
+        if (element.dictionary() != nullptr && element.dictionary()->get("_id_") == Value(camera->identity)) {
+            writeValue(context, element, command.description, std::string(cameras) + "[]");
+        }
+    }
+    return ExitStatus::done;
+}
+
+/// Changes one camera, which has to be there.
+ExitStatus changeCamera(const Context& context, WantedElement camera) {
+    const CurrentState current = readState(context);
+    if (findElement(current.state, current.form.list(cameras), camera.name) == nullptr) {
+        throw notFound("camera", camera.name);
+    }
     Wanted wanted;
-    wanted.cameras.push_back(std::move(camera));
-    return carryOut(context, wanted, readState(context));
+    wanted.elements[cameras].push_back(std::move(camera));
+    return carryOut(context, wanted, current);
+}
+
+WantedElement wantedOf(const std::string& name) {
+    return {name, {}, {}, {}, false, false};
 }
 
 ExitStatus cameraAllow(const Context& context, Words arguments) {
-    WantedCamera camera{arguments.front(), {}, {}, {}, {}, false};
-    (context.options.group ? camera.groups : camera.users) =
+    WantedElement camera = wantedOf(arguments.front());
+    camera.lists[context.options.group ? "groups" : "users"] =
         std::vector<std::string>(arguments.begin() + 1, arguments.end());
     return changeCamera(context, std::move(camera));
 }
 
 ExitStatus cameraDeny(const Context& context, Words arguments) {
-    WantedCamera camera{arguments.front(), {}, {}, {}, {}, false};
+    WantedElement camera = wantedOf(arguments.front());
     for (const std::string& name : arguments.subspan(1)) {
         camera.denied.push_back({context.options.group ? "group" : "", name, ""});
     }
@@ -114,42 +104,55 @@ ExitStatus cameraDeny(const Context& context, Words arguments) {
 
 ExitStatus cameraAccess(const Context& context, Words arguments) {
     if (arguments[1] != "on" && arguments[1] != "off") {
-        throw usageError("write adminhostctl camera access CAMERA on, or off");
+        throw usageError("camera access: \"" + arguments[1] + "\" is neither on nor off");
     }
-    return changeCamera(context, {arguments.front(), arguments[1] == "on", {}, {}, {}, false});
+    WantedElement camera = wantedOf(arguments.front());
+    camera.fields.set("access_control_enabled", arguments[1] == "on");
+    return changeCamera(context, std::move(camera));
 }
 
 ExitStatus cameraRemove(const Context& context, Words arguments) {
-    return changeCamera(context, {arguments.front(), {}, {}, {}, {}, true});
+    WantedElement camera = wantedOf(arguments.front());
+    camera.remove = true;
+    return changeCamera(context, std::move(camera));
+}
+
+ExitStatus changeProperty(const Context& context, WantedElement property, const CurrentState& current) {
+    Wanted wanted;
+    wanted.elements[properties].push_back(std::move(property));
+    return carryOut(context, wanted, current);
 }
 
 ExitStatus propertySet(const Context& context, Words arguments) {
     const CurrentState current = readState(context);
-    const std::string& name = arguments.front();
-    const ListedProperty* stored = findProperty(current.state, name);
-    WantedProperty property{name, std::nullopt, context.options.isProtected, false, true};
-    const bool isProtected = stored != nullptr && stored->isProtected;
-    const bool switches = stored != nullptr && property.isProtected && property.isProtected != isProtected;
-    if (arguments.size() > 1 || !switches) {
-        DescribedKey key;
-        key.path = "the value of " + tomlText(name);
-        key.type = "text";
-        key.secret = property.isProtected.value_or(isProtected);
-        property.value = textOfWord(key, wordAt(arguments, 1), context.sources);
+    const ListForm& list = current.form.list(properties);
+    const Element* stored = findElement(current.state, list, arguments.front());
+    WantedElement property = wantedOf(arguments.front());
+    property.writeSecret = true;
+    const bool isProtected = stored != nullptr && stored->fields.get("protect") == Value(true);
+    const bool becomes = context.options.isProtected.value_or(isProtected);
+    if (context.options.isProtected) {
+        property.fields.set("protect", becomes);
     }
-    Wanted wanted;
-    wanted.properties.push_back(std::move(property));
-    return carryOut(context, wanted, current);
+    // Without a value, switching the protection keeps the stored one.
+    if (arguments.size() > 1 || stored == nullptr || becomes == isProtected) {
+        DescribedKey key;
+        key.path = "the value of " + tomlText(arguments.front());
+        key.type = "text";
+        key.secret = becomes;
+        property.fields.set("value", textOfWord(key, wordAt(arguments, 1), context.sources));
+    }
+    return changeProperty(context, std::move(property), current);
 }
 
 ExitStatus propertyRemove(const Context& context, Words arguments) {
     const CurrentState current = readState(context);
-    if (findProperty(current.state, arguments.front()) == nullptr) {
-        throw usageError("there is no property " + tomlText(arguments.front()));
+    if (findElement(current.state, current.form.list(properties), arguments.front()) == nullptr) {
+        throw notFound("property", arguments.front());
     }
-    Wanted wanted;
-    wanted.properties.push_back({arguments.front(), std::nullopt, std::nullopt, true, false});
-    return carryOut(context, wanted, current);
+    WantedElement property = wantedOf(arguments.front());
+    property.remove = true;
+    return changeProperty(context, std::move(property), current);
 }
 
 constexpr std::array table = {

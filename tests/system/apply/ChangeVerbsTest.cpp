@@ -36,11 +36,11 @@ TEST_F(ChangeVerbs, ControllerNameThatNobodyAnswersToIsStoredAndSaidSo) {
 }
 
 TEST_F(ChangeVerbs, UnknownSettingsWrongTypesAndReadOnlyOnesAreUsageErrors) {
-    for (const auto& [key, value, text] : {std::tuple{"no_such", "1", "no setting no_such"},
-                                           {"server_port", "x", "no whole number"},
-                                           {"web_app_url", "x", "no setting web_app_url that can be written"},
-                                           {"cameras", "x", "no setting cameras"},
-                                           {"nimbo_controller_resolve_name", "yes", "no setting"}}) {
+    for (const auto& [key, value, text] : {std::tuple{"no_such", "1", "not a setting that can be written: no_such"},
+                                           {"server_port", "x", "not a whole number"},
+                                           {"web_app_url", "x", "not a setting that can be written: web_app_url"},
+                                           {"cameras", "x", "not a setting that can be written: cameras"},
+                                           {"nimbo_controller_resolve_name", "yes", "not a setting"}}) {
         const ProgramResult set = ctl({"settings", "set", key, value});
         EXPECT_EQ(set.status, 2) << key;
         EXPECT_THAT(set.output, HasSubstr(text));
@@ -60,7 +60,15 @@ TEST_F(ChangeVerbs, GridPasswordComesFromAFileOnlyAndIsShownNowhere) {
     const std::string after = read(root.clusterPreferencesPath());
     EXPECT_NE(after, before);
     EXPECT_THAT(after, Not(HasSubstr("planted-password")));
-    EXPECT_EQ(ctl({"settings", "set", "nimbo_client_password", "@" + file("empty", "")}).output,
+    for (const std::string& empty : {"@" + file("empty", ""), std::string("@/dev/null"), "@" + file("line", "\n")}) {
+        const ProgramResult refused = ctl({"settings", "set", "nimbo_client_password", empty});
+        EXPECT_EQ(refused.status, 2) << empty;
+        EXPECT_THAT(refused.output, HasSubstr("the value is empty; use --clear"));
+    }
+    EXPECT_EQ(ctl({"writeSettings", "configuration.nimbo_client_password@/dev/null"}).status, 2);
+    EXPECT_EQ(ctl({"apply", file("nothing.toml", ""), "--password-file", "/dev/null"}).status, 2);
+    EXPECT_EQ(read(root.clusterPreferencesPath()), after) << "the stored password is untouched";
+    EXPECT_EQ(ctl({"settings", "set", "nimbo_client_password", "--clear"}).output,
               "settings.nimbo_client_password: (secret) -> (not set)\n");
     EXPECT_EQ(ctl({"settings", "get", "nimbo_client_password_is_set"}).output, "no\n");
 }
@@ -69,12 +77,12 @@ TEST_F(ChangeVerbs, PasswordThatCannotBeProtectedIsNamedWithTheServicesLogLines)
     root.write("/Library/SorvaneProducer/Shared/Server/Secrets/kek.plist", "no property list");
     const ProgramResult set = ctl({"settings", "set", "nimbo_client_password", "@" + file("password", "new")});
     EXPECT_EQ(set.status, 1);
-    EXPECT_THAT(set.output, HasSubstr("did not take:\n  settings.nimbo_client_password"));
+    EXPECT_THAT(set.output, HasSubstr("not applied:\n  settings.nimbo_client_password"));
     EXPECT_THAT(set.output, HasSubstr("nimbo_client_password encryption failed"));
 }
 
 TEST_F(ChangeVerbs, PropertyIsAddedChangedAndRemoved) {
-    EXPECT_EQ(ctl({"property", "set", "colour", "blue"}).output, "properties.colour: (not there) -> \"blue\"\n");
+    EXPECT_EQ(ctl({"property", "set", "colour", "blue"}).output, "properties.colour: (not present) -> \"blue\"\n");
     EXPECT_EQ(ctl({"property", "set", "colour", "red"}).output, "properties.colour.value: \"blue\" -> \"red\"\n");
     EXPECT_EQ(root.sql("select value, protect from properties where name='colour'"), "red|f\n");
     EXPECT_EQ(ctl({"property", "set", "colour", "red"}).output, "no change\n");
@@ -86,7 +94,7 @@ TEST_F(ChangeVerbs, PropertyIsAddedChangedAndRemoved) {
 TEST_F(ChangeVerbs, ProtectedPropertyIsEncryptedOnceAndItsValueNeverShown) {
     const std::string row = "select value, protect from properties where name='token'";
     const ProgramResult added = ctl({"property", "set", "token", "@" + file("token", "planted-token\n"), "--protect"});
-    EXPECT_EQ(added.output, "properties.token: (not there) -> (secret)\n");
+    EXPECT_EQ(added.output, "properties.token: (not present) -> (secret)\n");
     EXPECT_THAT(root.sql(row), testing::EndsWith("|t\n"));
     EXPECT_THAT(root.sql(row), Not(HasSubstr("planted-token")));
     EXPECT_EQ(ctl({"property", "set", "token", "other"}).status, 2) << "a secret on the command line";
@@ -103,12 +111,12 @@ TEST_F(ChangeVerbs, ProtectedValueThatCannotBeWrittenIsNamed) {
     root.write("/Library/SorvaneProducer/Shared/Server/Secrets/kek.plist", "no property list");
     const ProgramResult set = ctl({"property", "set", "upload_token", "@" + file("token", "planted-token")});
     EXPECT_EQ(set.status, 1);
-    EXPECT_THAT(set.output, HasSubstr("did not take:\n  properties.upload_token.value: (secret) -> (secret)"));
+    EXPECT_THAT(set.output, HasSubstr("not applied:\n  properties.upload_token.value: (secret) -> (secret)"));
     EXPECT_THAT(set.output, HasSubstr("could not update property with id"));
     EXPECT_THAT(set.output, Not(HasSubstr("planted-token")));
     const ProgramResult plain = ctl({"property", "set", "upload_token", "--no-protect"});
     EXPECT_EQ(plain.status, 1) << "the flag is stored, but the value could not be deciphered";
-    EXPECT_THAT(plain.output, HasSubstr("did not take:\n  properties.upload_token.protect"));
+    EXPECT_THAT(plain.output, HasSubstr("not applied:\n  properties.upload_token.protect"));
 }
 
 TEST_F(ChangeVerbs, PropertyNameThatAStatementCannotCarryIsRefusedWithAdvice) {
@@ -158,10 +166,10 @@ TEST_F(ChangeVerbs, ConfigurationToolThatFailsIsToldByTheReadBack) {
     root.setSwitch("lumioconfig.exit", "3");
     const ProgramResult allow = ctl({"camera", "allow", "Main hall", "ben"});
     EXPECT_EQ(allow.status, 1);
-    EXPECT_THAT(allow.output, HasSubstr("did not take:\n  cameras.\"Main hall\".users.ben"));
+    EXPECT_THAT(allow.output, HasSubstr("not applied:\n  cameras.\"Main hall\".users.ben"));
     const ProgramResult removal = ctl({"camera", "remove", "Studio A"});
     EXPECT_EQ(removal.status, 1);
-    EXPECT_THAT(removal.output, HasSubstr("did not take:\n  cameras.\"Studio A\""));
+    EXPECT_THAT(removal.output, HasSubstr("not applied:\n  cameras.\"Studio A\""));
     EXPECT_THAT(removal.output, HasSubstr("could not delete camera with uuid"));
 }
 
@@ -170,7 +178,7 @@ TEST_F(ChangeVerbs, SettingsFileThatCannotBeWrittenIsNamedWithItsReason) {
     const ProgramResult set = ctl({"settings", "set", "server_port", "8180"});
     EXPECT_EQ(set.status, 1);
     EXPECT_THAT(set.output, HasSubstr("writeStatus is 7"));
-    EXPECT_THAT(set.output, HasSubstr("did not take:\n  settings.server_port: 8170 -> 8180"));
+    EXPECT_THAT(set.output, HasSubstr("not applied:\n  settings.server_port: 8170 -> 8180"));
 }
 
 }  // namespace

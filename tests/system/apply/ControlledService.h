@@ -18,8 +18,12 @@ namespace adminhost::test {
 
 class ControlledService : public testing::Test {
   protected:
+    ControlledService() = default;
+    explicit ControlledService(std::string configuration) : _configuration(std::move(configuration)) {}
+
     [[nodiscard]] DaemonProcess::Options options() const {
         DaemonProcess::Options options;
+        options.configuration = _configuration;
         options.arguments = {"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"};
         return options;
     }
@@ -40,6 +44,10 @@ class ControlledService : public testing::Test {
         return content.str();
     }
 
+  private:
+    const std::string _configuration;  // used while the daemon is started
+
+  protected:
     const SampleRoot root;
     const DaemonProcess daemon{options()};
 };

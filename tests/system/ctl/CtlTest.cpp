@@ -91,7 +91,7 @@ TEST_F(Ctl, ATextThatDoesNotFitIsUsage) {
     const Result result = run({"echoTyped", "count=seven"});
     EXPECT_EQ(result.status, 2);
     EXPECT_EQ(result.out, "");
-    EXPECT_EQ(result.err, "adminhostctl: count: \"seven\" is no whole number\n");
+    EXPECT_EQ(result.err, "adminhostctl: count: \"seven\" is not a whole number\n");
 }
 
 TEST_F(Ctl, ASecretComesFromStandardInputButNotFromTheCommandLine) {
@@ -99,7 +99,8 @@ TEST_F(Ctl, ASecretComesFromStandardInputButNotFromTheCommandLine) {
               Value(Dictionary{{"password", "hunter2"}}));
     const Result result = run({"echoTyped", "password=hunter2"});
     EXPECT_EQ(result.status, 2);
-    EXPECT_THAT(result.err, AllOf(HasSubstr("password is secret"), Not(HasSubstr("hunter2"))));
+    EXPECT_THAT(result.err,
+                AllOf(HasSubstr("password: a secret is not accepted on the command line"), Not(HasSubstr("hunter2"))));
 }
 
 TEST_F(Ctl, AWholeRequestComesFromAFileOrStandardInput) {
@@ -146,7 +147,7 @@ TEST_F(Ctl, AnAnswerThatHoldsAnErrorIsWrittenAndIsStatusOne) {
     const Result result = run({"fail", "status=5"});
     EXPECT_EQ(result.status, 1);
     EXPECT_EQ(result.out, "readStatus  5\nproblem     no room\n");
-    EXPECT_EQ(result.err, "adminhostctl: the service answered an error: readStatus is 5, problem is no room\n");
+    EXPECT_EQ(result.err, "adminhostctl: the service returned an error: readStatus is 5, problem is no room\n");
 }
 
 TEST_F(Ctl, AFailureInsideTheServiceShowsTheLogLinesOfItsRequest) {
@@ -168,7 +169,7 @@ TEST_F(Ctl, AnAnswerOfNothingIsDone) {
 TEST_F(Ctl, AnUnknownCommandIsUsageAndTheKnownOnesAreListed) {
     const Result result = run({"ecoTyped"});
     EXPECT_EQ(result.status, 2);
-    EXPECT_THAT(result.err, HasSubstr("there is no command ecoTyped; there are echoTyped, measure, "));
+    EXPECT_THAT(result.err, HasSubstr("command not found: ecoTyped; the commands are echoTyped, measure, "));
 }
 
 TEST_F(Ctl, CommandsAndHelpComeFromTheDaemon) {
@@ -208,7 +209,7 @@ TEST(CtlReach, VersionAndOptionsNeedNoDaemon) {
     const Result options = runIn(program, {"--help"}, "/nowhere/socket");
     EXPECT_EQ(options.status, 0);
     for (const char* option : {"--socket", "--format", "--file", "--names", "--group", "--password-file", "--protect",
-                               "--no-protect", "--version"}) {
+                               "--no-protect", "--clear", "--version"}) {
         EXPECT_THAT(options.out, HasSubstr(option));
     }
 }
@@ -217,7 +218,7 @@ TEST(CtlReach, AnswerThatCannotBeWrittenIsSaid) {
     const adminhost::test::ProgramResult result = adminhost::test::runProgram(
         {"/bin/sh", "-c", std::string(program) + " help >/dev/full"}, adminhost::test::Errors::merge);
     EXPECT_EQ(result.status, 2);
-    EXPECT_EQ(result.output, "adminhostctl: the answer could not be written\n");
+    EXPECT_EQ(result.output, "adminhostctl: standard output cannot be written\n");
 }
 
 TEST(CtlReach, HelpOfTheVerbsNeedsNoDaemon) {
@@ -260,7 +261,7 @@ TEST(CtlPlugins, ACommandOfTwoPlugInsNeedsThePlugInsName) {
         withPlugins({"tests/plugins/fixture_described.so", "lib/adminhost_lumio.so"}, {"--root", root.path()}));
     const Result both = runIn(program, {"getCameras"}, daemon.socket());
     EXPECT_EQ(both.status, 2);
-    EXPECT_THAT(both.err, HasSubstr("several plug-ins have a command getCameras; write described/getCameras"));
+    EXPECT_THAT(both.err, HasSubstr("several plug-ins have a command getCameras; use described/getCameras"));
     EXPECT_EQ(runIn(program, {"described/getCameras"}, daemon.socket()).out, "done\n");
     EXPECT_THAT(runIn(program, {"lumio/getCameras"}, daemon.socket()).out, HasSubstr("cameras ("));
 }
@@ -300,7 +301,10 @@ TEST_F(CtlLumio, ACameraIsShownByNameAndByUuidInAnyCase) {
     ASSERT_NE(byName.value().dictionary(), nullptr) << byName.out;
     EXPECT_EQ(*byName.value().dictionary()->get("name").string(), line(name));
     EXPECT_EQ(run({"--format", "json", "camera", "show", line(uuid)}).out, byName.out);
-    EXPECT_EQ(run({"camera", "show", "nobody's"}).status, 1);
+    const Result unknown = run({"camera", "show", "nobody's"});
+    EXPECT_EQ(unknown.status, 2);
+    EXPECT_EQ(run({"camera", "remove", "nobody's"}).err, unknown.err) << "the same mistake has the same words";
+    EXPECT_EQ(run({"camera", "remove", "nobody's"}).status, 2);
 }
 
 TEST_F(CtlLumio, TheNamesForCompletionAreThoseOfTheList) {

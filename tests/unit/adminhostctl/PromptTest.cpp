@@ -80,8 +80,20 @@ TEST(AskSecret, ShowsNothingOfWhatIsTyped) {
     OnTerminal child(&askAndSayLength);
     EXPECT_THAT(child.showsUntil("password: "), HasSubstr("password: "));
     child.type("hunter2\n");
+    EXPECT_THAT(child.showsUntil("password again: "), HasSubstr("password again: "));
+    child.type("hunter2\n");
     EXPECT_THAT(child.showsUntil("."), testing::AllOf(HasSubstr("length 7 right."), Not(HasSubstr("hunter2"))));
     EXPECT_EQ(child.wait(), 0);
+}
+
+TEST(AskSecret, TwoDifferentValuesAreAUsageError) {
+    OnTerminal child(&askAndSayLength);
+    child.showsUntil("password: ");
+    child.type("hunter2\n");
+    child.showsUntil("password again: ");
+    child.type("hunter3\n");
+    EXPECT_THAT(child.showsUntil("sent."), HasSubstr("password: the two values differ; nothing was sent"));
+    EXPECT_EQ(WEXITSTATUS(child.wait()), 2);
 }
 
 TEST(AskSecret, PutsTheTerminalBackBeforeASignalEndsTheProgram) {
@@ -106,7 +118,7 @@ TEST(AskSecret, AnEndOfInputWithoutALineIsAUsageError) {
     OnTerminal child(&askAndSayLength);
     child.showsUntil("password: ");
     child.type("\x04");  // end of input
-    EXPECT_THAT(child.showsUntil("given."), HasSubstr("password was not given"));
+    EXPECT_THAT(child.showsUntil("typed."), HasSubstr("password: no value was typed"));
     EXPECT_EQ(WEXITSTATUS(child.wait()), 2);
 }
 

@@ -2,6 +2,8 @@
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
+#include "platform/json/Json.h"
+#include "platform/plist/PropertyList.h"
 #include "tests/unit/adminhostctl/Describe.h"
 
 #include <gmock/gmock.h>
@@ -162,6 +164,18 @@ TEST(Reading, NothingReachesTheTerminalThatItWouldActOn) {
     EXPECT_EQ(read(Array{Dictionary{{"k\r", "\xE2\x80\xAEtxt"}}}), "K\\X0D\n\\u202etxt\n");
 }
 
+TEST(Shown, JsonAndXmlKeepWhatATerminalWouldActOnByNumber) {
+    using adminhost::ctl::shownJson;
+    using adminhost::ctl::shownXml;
+    const std::string acting = "a\x7F\xC2\x9B\xE2\x80\xAE\xE2\x81\xA6";
+    EXPECT_EQ(shownJson('"' + acting + "é\"\n"), "\"a\\u007f\\u009b\\u202e\\u2066é\"\n");
+    EXPECT_EQ(adminhost::parseJson(shownJson(adminhost::jsonOf(Value(acting)))), Value(acting)) << "nothing is lost";
+    EXPECT_EQ(shownXml("<string>" + acting + "</string>\n"), "<string>a&#x7f;&#x9b;&#x202e;&#x2066;</string>\n");
+    const auto list = adminhost::xmlPropertyList(Value(acting));
+    ASSERT_TRUE(list);
+    EXPECT_EQ(adminhost::parsePropertyList(shownXml(*list)), Value(acting));
+}
+
 TEST(SizeText, IsDecimalWithOneDecimalForSmallNumbers) {
     using adminhost::ctl::sizeText;
     EXPECT_EQ(sizeText(0), "0 bytes");
@@ -182,7 +196,9 @@ TEST(DateText, IsLocalTime) {
 }
 
 TEST(PersonText, NamesKindAndFullName) {
-    using adminhost::ctl::personText;
+    const Description description = describe("getCameras");
+    const adminhost::ctl::DescribedKey& element = *description.answerKey("cameras[].allowedUsersAndGroups[]");
+    const auto personText = [&](const Dictionary& entry) { return adminhost::ctl::personText(element, entry); };
     EXPECT_EQ(personText(person("anna", "Anna Berg", "user")), "Anna Berg (user)");
     EXPECT_EQ(personText({{"shortName", "editors"}, {"type", "group"}}), "editors (group)");
     EXPECT_EQ(personText({{"guid", "5B1C"}, {"type", "user"}}), "5B1C (user)");
@@ -244,7 +260,7 @@ TEST(Table, LeavesOutItsLastColumnsWhenNarrowingIsNotEnough) {
               "FIRST           SECOND\n"
               "aaaaaaaaaaaaaa  bbbbbbbbbbbbbb\n"
               "aaaaaa          bbbbbb\n"
-              "(not shown for want of room: THIRD)\n");
+              "(omitted columns: THIRD)\n");
 }
 
 TEST(ErrorOf, FindsStatusesAndTheErrorKeysOfTheDescription) {
@@ -256,7 +272,7 @@ TEST(ErrorOf, FindsStatusesAndTheErrorKeysOfTheDescription) {
         "writeStatus is 400, errorDescription is no room");
     EXPECT_EQ(errorOf(describe("validateSettings"), {{"shared_filesystem_error", "kFilesystemNotExistsError"}}),
               "shared_filesystem_error is kFilesystemNotExistsError");
-    EXPECT_EQ(errorOf({}, {{"writeStatus", -1}}), "writeStatus is -1") << "also where no description says so";
+    EXPECT_EQ(errorOf(describe("readSettings"), {{"readStatus", -1}}), "readStatus is -1");
     EXPECT_EQ(errorOf({}, {{"readStatus", 0}}), "");
 }
 

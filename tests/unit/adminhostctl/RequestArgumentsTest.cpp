@@ -27,6 +27,7 @@ struct Given {
     std::map<std::string, std::string> files;
     std::string typed;
     bool terminal = false;
+    bool clear = false;
 
     [[nodiscard]] Sources sources() const {
         return {[this](const std::string& path) {
@@ -36,7 +37,7 @@ struct Given {
                     }
                     return found->second;
                 },
-                [this](const std::string&) { return typed; }, terminal};
+                [this](const std::string&) { return typed; }, terminal, clear};
     }
 };
 
@@ -96,7 +97,7 @@ TEST(BuildRequest, ATextIsConvertedToTheTypeInWhichASettingIsEntered) {
 
 TEST(BuildRequest, ATextThatDoesNotFitItsKeyIsAUsageError) {
     EXPECT_EQ(usageOf("writeSettings", {"configuration.server_port=eighty"}),
-              "configuration.server_port: \"eighty\" is no whole number");
+              "configuration.server_port: \"eighty\" is not a whole number");
 }
 
 TEST(BuildRequest, JsonSaysItsTypeItself) {
@@ -109,7 +110,7 @@ TEST(BuildRequest, JsonSaysItsTypeItself) {
 TEST(BuildRequest, BrokenJsonIsAUsageErrorWithItsPlace) {
     EXPECT_THAT(usageOf("readSettings", {"optionalArguments:={\"a\" 1}"}),
                 HasSubstr("optionalArguments: line 1, column 6: "));
-    EXPECT_THAT(usageOf("readSettings", {"optionalArguments:=null"}), HasSubstr("null is no value"));
+    EXPECT_THAT(usageOf("readSettings", {"optionalArguments:=null"}), HasSubstr("null is not a value"));
 }
 
 TEST(BuildRequest, OnlyJsonBringsAKeyThatIsNotDescribed) {
@@ -126,9 +127,10 @@ TEST(BuildRequest, AKeyThatTakesAnythingTakesText) {
 }
 
 TEST(BuildRequest, AListTakesJsonOrAFileButNoText) {
-    EXPECT_THAT(usageOf("readSettings", {"optionalArguments.languages=de"}),
-                HasSubstr("takes a list: write optionalArguments.languages:=JSON or optionalArguments.languages@FILE"));
-    EXPECT_EQ(build("readSettings", {"optionalArguments.languages@f"}, {{{"f", " [\"de\"]\n"}}, "", false}),
+    EXPECT_THAT(
+        usageOf("readSettings", {"optionalArguments.languages=de"}),
+        HasSubstr("the value is a list; use optionalArguments.languages:=JSON or optionalArguments.languages@FILE"));
+    EXPECT_EQ(build("readSettings", {"optionalArguments.languages@f"}, {{{"f", " [\"de\"]\n"}}, "", false, false}),
               (Dictionary{{"optionalArguments", Dictionary{{"languages", Array{"de"}}}}}));
 }
 
@@ -150,7 +152,7 @@ TEST(BuildRequest, ArgumentsReplaceWhatTheFileHolds) {
 
 TEST(BuildRequest, AKeyBelowSomethingThatIsNoDictionaryIsAUsageError) {
     EXPECT_THAT(usageOf("writeSettings", {"configuration.server_port=2"}, {}, {{"configuration", "text"}}),
-                HasSubstr("server_port does not stand in a dictionary"));
+                HasSubstr("server_port is not in a dictionary"));
 }
 
 TEST(BuildRequest, AKeyGivenTwiceIsAUsageError) {
@@ -159,7 +161,7 @@ TEST(BuildRequest, AKeyGivenTwiceIsAUsageError) {
 
 TEST(BuildRequest, WordsOfAnotherFormAreUsageErrors) {
     for (const char* word : {"variant", "=x", "@x", ":=5", "", "a..b=x", ".a=x", "a.=x"}) {
-        EXPECT_THAT(usageOf("getState", {word}), HasSubstr("is no ")) << word;
+        EXPECT_THAT(usageOf("getState", {word}), HasSubstr("is not ")) << word;
     }
 }
 
@@ -170,36 +172,50 @@ TEST(BuildRequest, AValueMayHoldTheSignsThatSeparate) {
 
 TEST(BuildRequest, ASecretIsRefusedOnTheCommandLine) {
     EXPECT_THAT(usageOf("validateSettings", {"nimbo_client_password=hunter2"}),
-                testing::AllOf(HasSubstr("nimbo_client_password is secret"), testing::Not(HasSubstr("hunter2"))));
-    EXPECT_THAT(usageOf("validateSettings", {"nimbo_client_password:=\"hunter2\""}), HasSubstr("is secret"));
+                testing::AllOf(HasSubstr("nimbo_client_password: a secret is not accepted"),
+                               testing::Not(HasSubstr("hunter2"))));
+    EXPECT_THAT(usageOf("validateSettings", {"nimbo_client_password:=\"hunter2\""}),
+                HasSubstr("a secret is not accepted"));
     EXPECT_THAT(usageOf("writeSettings", {"configuration:={\"nimbo_client_password\": \"hunter2\"}"}),
-                HasSubstr("configuration.nimbo_client_password is secret"));
+                HasSubstr("configuration.nimbo_client_password: a secret is not accepted"));
 }
 
 TEST(BuildRequest, ASecretComesFromAFileWithoutItsLineEnd) {
     for (const char* content : {"hunter2", "hunter2\n", "hunter2\r\n"}) {
-        EXPECT_EQ(build("validateSettings", {"nimbo_client_password@f"}, {{{"f", content}}, "", false}),
+        EXPECT_EQ(build("validateSettings", {"nimbo_client_password@f"}, {{{"f", content}}, "", false, false}),
                   (Dictionary{{"nimbo_client_password", "hunter2"}}));
     }
-    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@f"}, {{{"f", "two\nlines\n\n"}}, "", false}),
+    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@f"}, {{{"f", "two\nlines\n\n"}}, "", false, false}),
               (Dictionary{{"nimbo_client_password", "two\nlines\n"}}));
 }
 
 TEST(BuildRequest, ASecretIsAskedForAtATerminalAndReadFromAPipe) {
-    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@-"}, {{}, "typed", true}),
+    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@-"}, {{}, "typed", true, false}),
               (Dictionary{{"nimbo_client_password", "typed"}}));
-    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@-"}, {{{"-", "piped\n"}}, "typed", false}),
+    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@-"}, {{{"-", "piped\n"}}, "typed", false, false}),
               (Dictionary{{"nimbo_client_password", "piped"}}));
-    EXPECT_EQ(build("validateSettings", {"shared_filesystem@-"}, {{{"-", "/srv\n"}}, "typed", true}),
+    EXPECT_EQ(build("validateSettings", {"shared_filesystem@-"}, {{{"-", "/srv\n"}}, "typed", true, false}),
               (Dictionary{{"shared_filesystem", "/srv"}}))
         << "what is no secret is read, not asked for";
 }
 
+TEST(BuildRequest, AnEmptySecretIsRefusedUnlessItIsMeant) {
+    Given given{{{"f", "\n"}, {"-", ""}}, "", false, false};
+    EXPECT_EQ(usageOf("validateSettings", {"nimbo_client_password@f"}, given),
+              "nimbo_client_password: the value is empty; use --clear to remove the stored one");
+    EXPECT_THAT(usageOf("validateSettings", {"nimbo_client_password@-"}, given), HasSubstr("the value is empty"));
+    given.terminal = true;
+    EXPECT_THAT(usageOf("validateSettings", {"nimbo_client_password@-"}, given), HasSubstr("the value is empty"));
+    given.clear = true;
+    EXPECT_EQ(build("validateSettings", {"nimbo_client_password@f"}, given),
+              (Dictionary{{"nimbo_client_password", ""}}));
+}
+
 TEST(BuildRequest, AFileThatCannotServeIsAUsageError) {
     EXPECT_THAT(usageOf("getState", {"variant@missing"}), HasSubstr("missing: No such file"));
-    EXPECT_THAT(usageOf("getState", {"variant@"}), HasSubstr("needs the name of a file"));
-    EXPECT_THAT(usageOf("validateSettings", {"shared_filesystem@f"}, {{{"f", "\xFF"}}, "", false}),
-                HasSubstr("no UTF-8 text"));
+    EXPECT_THAT(usageOf("getState", {"variant@"}), HasSubstr("the name of a file is missing"));
+    EXPECT_THAT(usageOf("validateSettings", {"shared_filesystem@f"}, {{{"f", "\xFF"}}, "", false, false}),
+                HasSubstr("not UTF-8 text"));
 }
 
 TEST(ParseRequest, ReadsJsonAndPropertyLists) {
@@ -213,7 +229,7 @@ TEST(ParseRequest, ReadsJsonAndPropertyLists) {
 TEST(ParseRequest, NamesFileLineAndColumn) {
     for (const auto& [bytes, message] :
          std::map<std::string, std::string>{{"{\n  \"a\" 1}", "f: line 2, column "},
-                                            {"[1]", "f: a request is a dictionary, not a value of type list"},
+                                            {"[1]", "f: a request is a dictionary, not a list"},
                                             {"", "f: line 1, column "}}) {
         try {
             static_cast<void>(adminhost::ctl::parseRequest(bytes, "f"));
@@ -229,20 +245,20 @@ TEST(ValueOfText, ReadsWholeNumbersOfTheWholeRange) {
     EXPECT_EQ(convert("integer", "-9223372036854775808"), Value(INT64_MIN));
     EXPECT_EQ(convert("integer", "18446744073709551615"), Value(UINT64_MAX));
     for (const char* text : {"", "1.0", "1e3", " 1", "1 ", "0x1", "18446744073709551616", "+1"}) {
-        EXPECT_THAT(refused("integer", text), HasSubstr("is no whole number")) << text;
+        EXPECT_THAT(refused("integer", text), HasSubstr("is not a whole number")) << text;
     }
 }
 
 TEST(ValueOfText, ReadsNumbersBooleansAndText) {
     EXPECT_EQ(convert("real", "1.5"), Value(1.5));
-    EXPECT_THAT(refused("real", "1,5"), HasSubstr("is no number"));
+    EXPECT_THAT(refused("real", "1,5"), HasSubstr("is not a number"));
     for (const char* text : {"yes", "TRUE", "on", "1", "t", "Y"}) {
         EXPECT_EQ(convert("boolean", text), Value(true)) << text;
     }
     for (const char* text : {"no", "False", "off", "0", "f"}) {
         EXPECT_EQ(convert("boolean", text), Value(false)) << text;
     }
-    EXPECT_THAT(refused("boolean", "maybe"), HasSubstr("is no yes or no"));
+    EXPECT_THAT(refused("boolean", "maybe"), HasSubstr("is not yes or no"));
     EXPECT_EQ(convert("text", "5"), Value("5"));
     EXPECT_EQ(convert("scalar", "5"), Value("5")) << "nothing says that it is entered as a number";
 }
@@ -254,14 +270,14 @@ TEST(ValueOfText, ReadsDatesInUniversalAndInLocalTime) {
     EXPECT_EQ(convert("date", "2026-01-31 09:00"), wanted);
     EXPECT_EQ(convert("date", "2026-01-31"), Value(Date(std::chrono::seconds(1769846400 - 9 * 3600))));
     for (const char* text : {"yesterday", "2026-02-30", "2026-01-31 25:00", ""}) {
-        EXPECT_THAT(refused("date", text), HasSubstr("is no date")) << text;
+        EXPECT_THAT(refused("date", text), HasSubstr("is not a date")) << text;
     }
 }
 
 TEST(ValueOfText, DataComesFromAFile) {
-    EXPECT_THAT(refused("data", "AAEC"), HasSubstr("write key@FILE"));
+    EXPECT_THAT(refused("data", "AAEC"), HasSubstr("use key@FILE"));
     Dictionary command = {{"name", "x"}, {"keys", Array{Dictionary{{"path", "blob"}, {"type", "data"}}}}};
-    const Given given{{{"f", std::string("\0\xFF\n", 3)}}, "", false};
+    const Given given{{{"f", std::string("\0\xFF\n", 3)}}, "", false, false};
     EXPECT_EQ(adminhost::ctl::buildRequest(Description(command), {}, {"blob@f"}, given.sources()),
               (Dictionary{{"blob", Data{0, 0xFF, '\n'}}}));
 }
@@ -290,32 +306,41 @@ TEST(ValueOfWord, WordIsConvertedToTheTypeOfTheKey) {
     EXPECT_EQ(word(keyOf("integer"), "8170"), Value(8170));
     EXPECT_EQ(word(keyOf("text"), "8170"), Value("8170"));
     EXPECT_EQ(word(keyOf("text"), ""), Value(""));
-    EXPECT_THAT(wordRefused(keyOf("integer"), "x"), HasSubstr("is no whole number"));
+    EXPECT_THAT(wordRefused(keyOf("integer"), "x"), HasSubstr("is not a whole number"));
 }
 
 TEST(ValueOfWord, WordBehindAnAtSignIsAFileOrStandardInput) {
-    const Given given{{{"port", "8170\n"}, {"-", "typed\n"}, {"bytes", "\xFF"}}, "", false};
+    const Given given{{{"port", "8170\n"}, {"-", "typed\n"}, {"bytes", "\xFF"}}, "", false, false};
     EXPECT_EQ(word(keyOf("integer"), "@port", given), Value(8170));
     EXPECT_EQ(word(keyOf("text"), "@-", given), Value("typed"));
-    EXPECT_THAT(wordRefused(keyOf("text"), "@bytes", given), HasSubstr("no UTF-8"));
+    EXPECT_THAT(wordRefused(keyOf("text"), "@bytes", given), HasSubstr("not UTF-8"));
     EXPECT_THAT(wordRefused(keyOf("text"), "@missing", given), HasSubstr("No such file"));
-    EXPECT_THAT(wordRefused(keyOf("text"), "@", given), HasSubstr("needs the name of a file"));
+    EXPECT_THAT(wordRefused(keyOf("text"), "@", given), HasSubstr("the name of a file is missing"));
 }
 
 TEST(ValueOfWord, MissingWordIsAskedForOnlyAtATerminalAndOnlyForASecret) {
-    const Given terminal{{}, "typed", true};
+    const Given terminal{{}, "typed", true, false};
     EXPECT_EQ(word(secretKey(), std::nullopt, terminal), Value("typed"));
     EXPECT_EQ(word(secretKey(), "@-", terminal), Value("typed"));
     EXPECT_THAT(wordRefused(secretKey(), std::nullopt), HasSubstr("@FILE or @-"));
     EXPECT_THAT(wordRefused(keyOf("text"), std::nullopt, terminal), HasSubstr("TEXT, @FILE or @-"));
 }
 
+TEST(ValueOfWord, MissingSecretIsEmptyOnlyWhenItIsToBeCleared) {
+    Given given{{}, "", true, false};
+    EXPECT_THAT(wordRefused(secretKey(), std::nullopt, given), HasSubstr("the value is empty; use --clear"));
+    given.clear = true;
+    EXPECT_EQ(word(secretKey(), std::nullopt, given), Value(""));
+    EXPECT_THAT(wordRefused(keyOf("text"), std::nullopt, given), HasSubstr("the value is missing"));
+}
+
 TEST(ValueOfWord, SecretOnTheCommandLineIsRefusedAndNotRepeated) {
-    const std::string message = wordRefused(secretKey(), "planted-password", {{}, "typed", true});
-    EXPECT_THAT(message, HasSubstr("write @FILE, or @- to be asked"));
+    const std::string message = wordRefused(secretKey(), "planted-password", {{}, "typed", true, false});
+    EXPECT_THAT(message, HasSubstr("use @FILE, or @- to be asked"));
     EXPECT_THAT(message, testing::Not(HasSubstr("planted-password")));
-    EXPECT_THAT(wordRefused(secretKey(), ""), HasSubstr("is secret"));
-    EXPECT_EQ(word(secretKey(), "@file", {{{"file", "from the file\n"}}, "typed", true}), Value("from the file"));
+    EXPECT_THAT(wordRefused(secretKey(), ""), HasSubstr("a secret is not accepted"));
+    EXPECT_EQ(word(secretKey(), "@file", {{{"file", "from the file\n"}}, "typed", true, false}),
+              Value("from the file"));
 }
 
 }  // namespace

@@ -20,35 +20,62 @@ const Description& writeSettings() {
     static const Description description = describe("writeSettings");
     return description;
 }
-
-State sample() {
-    State state;
-    state.settings = {{"default_shared_filesystem", "/Library/SorvaneProducer/Shared"},
-                      {"shared_filesystem", "/shared"},
-                      {"nimbo_client_password_is_set", true},
-                      {"server_port", 8170},
-                      {"sorvane_capture_web_enabled", true},
-                      {"server_host", "a \"quoted\"\nhost"},
-                      {"max_file_size_in_mb", 2.0},
-                      {"web_app_url", "https://derived"}};
-    state.properties = std::vector<ListedProperty>{
-        {"3", "plain", "left", false}, {"4", "token", std::nullopt, true}, {"5", "empty", std::nullopt, false}};
-    state.cameras = std::vector<ListedCamera>{
-        {"AAAA-1",
-         "Hall",
-         true,
-         {{"user", "ben", "U-2"}, {"user", "anna", "U-1"}, {"group", "staff", "G-1"}, {"user", "", "U-3"}}},
-        {"AAAA-2", "Lab", false, {}}};
-    return state;
+const StateForm& form() {
+    static const StateForm form(writeSettings());
+    return form;
 }
 
-std::string exported(const State& state) {
-    return exportOf(state, writeSettings());
+Value property(const char* id, const char* name, const char* value, bool isProtected = false) {
+    Dictionary listed{{"_id_", id}, {"name", name}, {"protect", isProtected}};
+    if (value != nullptr) {
+        listed.set("value", value);
+    }
+    return listed;
 }
-Wanted parse(std::string_view text, const State& state = sample()) {
-    return parseDesired(text, "state.toml", writeSettings(), state);
+Value camera(const char* uuid, const char* name, bool restricted = false, Array allowed = {}) {
+    return Dictionary{{"_id_", uuid},
+                      {"name", name},
+                      {"access_control_enabled", restricted},
+                      {"allowedUsersAndGroups", std::move(allowed)}};
 }
-std::string refused(std::string_view text, const State& state = sample()) {
+Value person(const char* kind, const char* name, const char* uuid) {
+    return Dictionary{{"type", kind}, {"shortName", name}, {"_id_", uuid}};
+}
+
+Dictionary sample() {
+    return {{"default_shared_filesystem", "/Library/SorvaneProducer/Shared"},
+            {"shared_filesystem", "/shared"},
+            {"nimbo_client_password_is_set", true},
+            {"server_port", 8170},
+            {"sorvane_capture_web_enabled", true},
+            {"server_host", "a \"quoted\"\nhost"},
+            {"max_file_size_in_mb", 2.0},
+            {"web_app_url", "https://derived"},
+            {"properties", Array{property("3", "plain", "left"), property("4", "token", nullptr, true),
+                                 property("5", "empty", nullptr)}},
+            {"cameras", Array{camera("AAAA-1", "Hall", true,
+                                     {person("user", "ben", "U-2"), person("user", "anna", "U-1"),
+                                      person("group", "staff", "G-1"), person("user", "", "U-3")}),
+                              camera("AAAA-2", "Lab")}}};
+}
+Dictionary sampleWith(const char* list, std::vector<Value> more) {
+    Dictionary root = sample();
+    for (Value& element : more) {
+        root.find(list)->array()->push_back(std::move(element));
+    }
+    return root;
+}
+
+std::string exported(const Dictionary& root) {
+    return exportOf(form(), stateOf(form(), root));
+}
+Wanted parse(std::string_view text, const Dictionary& root = sample()) {
+    return parseDesired(text, "state.toml", form(), stateOf(form(), root));
+}
+Plan planOf(const Wanted& wanted, const Dictionary& root) {
+    return planOf(form(), wanted, stateOf(form(), root));
+}
+std::string refused(std::string_view text, const Dictionary& state = sample()) {
     try {
         (void)parse(text, state);
     } catch (const Failure& failure) {
@@ -99,53 +126,60 @@ TEST(Export, ReadAgainIsNoChange) {
 }
 
 TEST(Export, EveryWritableSettingIsManagedHereAndNothingElse) {
-    State state;
+    Dictionary root{{"cameras", Array{}}, {"properties", Array{}}};
     std::vector<std::string> writable;
     for (const DescribedKey& key : writeSettings().keys()) {
         constexpr std::string_view prefix = "configuration.";
         const std::string name = key.path.starts_with(prefix) ? key.path.substr(prefix.size()) : "";
         if (!name.empty() && name.find_first_of(".[") == std::string::npos) {
-            state.settings.set(name, "x");
             writable.push_back(name);
+            if (key.type != "list") {
+                root.set(name, "x");
+            }
         }
     }
-    const Wanted wanted = parse(exported(state), state);
+    const Wanted wanted = parse(exported(root), root);
     EXPECT_EQ(wanted.settings.size(), 27U) << "the keys of the three files that are written";
     for (const char* other : {"nimbo_client_password", "nimbo_controller_resolve_name", "cameras", "properties"}) {
         EXPECT_THAT(writable, testing::Contains(other));
         EXPECT_FALSE(wanted.settings.contains(other)) << other;
-        EXPECT_THAT(exported(state), Not(HasSubstr(std::string(other) + " = \"x\"")));
+        EXPECT_THAT(exported(root), Not(HasSubstr(std::string(other) + " = \"x\"")));
     }
 }
 
 TEST(Export, ValueThatALineCannotCarryIsAComment) {
-    State state = sample();
-    state.settings.set("server_port", Array{1});
-    EXPECT_THAT(exported(state), HasSubstr("\n# server_port: a list, not managed here\n"));
-    EXPECT_FALSE(parse(exported(state), state).settings.contains("server_port"));
+    Dictionary root = sample();
+    root.set("server_port", Array{1});
+    EXPECT_THAT(exported(root), HasSubstr("\n# server_port: a list, not managed here\n"));
+    EXPECT_FALSE(parse(exported(root), root).settings.contains("server_port"));
 }
 
 TEST(Export, WhatHasNoNameOfItsOwnIsAComment) {
-    State state = sample();
-    state.properties->push_back({"6", "plain", "other", false});
-    state.properties->push_back({"7", "", "nameless", false});
-    state.properties->push_back({"8", "two\nlines", "x", false});
-    state.cameras->push_back({"AAAA-3", "Hall", false, {}});
-    state.cameras->push_back({"AAAA-4", "AAAA-2", false, {}});
-    const std::string text = exported(state);
-    EXPECT_THAT(text, AllOf(HasSubstr("# properties.plain, row 3: "), HasSubstr("# properties.plain, row 6: "),
-                            HasSubstr("# properties.\"\", row 7: "), HasSubstr("[properties.\"two\\nlines\"]\n")));
+    Dictionary root = sampleWith("properties", {property("6", "plain", "other"), property("7", "", "nameless"),
+                                                property("8", "two\nlines", "x")});
+    root.find("cameras")->array()->push_back(camera("AAAA-3", "Hall"));
+    root.find("cameras")->array()->push_back(camera("AAAA-4", "AAAA-2"));
+    const std::string text = exported(root);
+    EXPECT_THAT(text, AllOf(HasSubstr("# properties.plain, 3: "), HasSubstr("# properties.plain, 6: "),
+                            HasSubstr("# properties.\"\", 7: "), HasSubstr("[properties.\"two\\nlines\"]\n")));
     EXPECT_THAT(text, AllOf(HasSubstr("[cameras.AAAA-1]\n# name: \"Hall\"\n"),
                             HasSubstr("[cameras.AAAA-3]\n# name: \"Hall\"\n"),
                             HasSubstr("[cameras.AAAA-4]\n# name: \"AAAA-2\"\n"), HasSubstr("[cameras.Lab]\n")));
-    EXPECT_THAT(planOf(parse(text, state), state).changes, IsEmpty());
+    EXPECT_THAT(planOf(parse(text, root), root).changes, IsEmpty());
 }
 
-TEST(Export, ListsThatTheServiceDoesNotAnswerAreLeftOut) {
-    State state = sample();
-    state.properties.reset();
-    state.cameras.reset();
-    EXPECT_THAT(exported(state), Not(testing::ContainsRegex("\\[(properties|cameras)\\.")));
+TEST(Export, FailsWhenTheServiceDoesNotListASection) {
+    for (const char* list : {"properties", "cameras"}) {
+        Dictionary root = sample();
+        root.remove(list);
+        try {
+            (void)exported(root);
+            ADD_FAILURE() << list;
+        } catch (const Failure& failure) {
+            EXPECT_EQ(failure.status(), ExitStatus::answeredError);
+            EXPECT_THAT(failure.what(), HasSubstr(std::string("does not list its ") + list));
+        }
+    }
 }
 
 TEST(Desired, FileIsReadAsItStands) {
@@ -160,23 +194,22 @@ TEST(Desired, FileIsReadAsItStands) {
     EXPECT_EQ(wanted.settings.get("server_port"), Value(9000));
     EXPECT_EQ(wanted.settings.get("server_host"), Value("media"));
     EXPECT_EQ(wanted.settings.get("sorvane_capture_web_enabled"), Value(false));
-    EXPECT_TRUE(wanted.removeProperties);
-    EXPECT_TRUE(wanted.removePeople);
-    EXPECT_FALSE(wanted.lookUpController);
-    EXPECT_FALSE(wanted.password);
-    ASSERT_EQ(wanted.properties.size(), 2U);
-    EXPECT_EQ(wanted.properties[0].name, "fresh");
-    EXPECT_EQ(wanted.properties[0].value, "x");
-    EXPECT_EQ(wanted.properties[0].isProtected, true);
-    EXPECT_EQ(wanted.properties[1].value, std::nullopt);
-    EXPECT_EQ(wanted.properties[1].isProtected, false);
-    EXPECT_FALSE(wanted.properties[1].writeSecret) << "a file that is applied again and again does not ask for it";
-    ASSERT_EQ(wanted.cameras.size(), 2U);
-    EXPECT_EQ(wanted.cameras[0].restricted, false);
-    EXPECT_THAT(*wanted.cameras[0].users, ElementsAre("ben"));
-    EXPECT_EQ(wanted.cameras[0].groups, std::nullopt) << "what is not given stays as it is";
-    EXPECT_THAT(*wanted.cameras[1].groups, IsEmpty());
-    EXPECT_EQ(wanted.cameras[1].restricted, std::nullopt);
+    EXPECT_THAT(wanted.removeUnlisted, ElementsAre("access", "properties"));
+    EXPECT_FALSE(wanted.lookUp);
+    EXPECT_TRUE(wanted.secrets.empty());
+    const std::vector<WantedElement>& properties = wanted.elements.at("properties");
+    ASSERT_EQ(properties.size(), 2U);
+    EXPECT_EQ(properties[0].name, "fresh");
+    EXPECT_EQ(properties[0].fields, (Dictionary{{"protect", true}, {"value", "x"}}));
+    EXPECT_EQ(properties[1].fields, (Dictionary{{"protect", false}}));
+    EXPECT_FALSE(properties[1].writeSecret) << "a file that is applied again and again does not ask for it";
+    const std::vector<WantedElement>& cameras = wanted.elements.at("cameras");
+    ASSERT_EQ(cameras.size(), 2U);
+    EXPECT_EQ(cameras[0].fields, (Dictionary{{"access_control_enabled", false}}));
+    EXPECT_THAT(cameras[0].lists.at("users"), ElementsAre("ben"));
+    EXPECT_EQ(cameras[0].lists.count("groups"), 0U) << "what is not given stays as it is";
+    EXPECT_THAT(cameras[1].lists.at("groups"), IsEmpty());
+    EXPECT_TRUE(cameras[1].fields.empty());
 }
 
 TEST(Desired, EmptyFileWantsNothing) {
@@ -187,20 +220,20 @@ TEST(Desired, EmptyFileWantsNothing) {
 
 TEST(Desired, SettingIsOfItsOwnTypeOrOfTheStoredOnes) {
     EXPECT_EQ(parse("[settings]\nserver_port = 1\n").settings.get("server_port"), Value(1));
-    EXPECT_THAT(refused("[settings]\nserver_port = \"1\"\n"), EndsWith("takes a whole number, without quotes"));
-    EXPECT_THAT(refused("[settings]\nserver_port = 1.0\n"), HasSubstr("takes a whole number"));
-    EXPECT_THAT(refused("[settings]\nserver_host = 1\n"), HasSubstr("takes a text in quotes"));
-    EXPECT_THAT(refused("[settings]\nsorvane_capture_web_enabled = \"yes\"\n"), HasSubstr("takes true or false"));
-    State state = sample();
-    state.settings.set("server_port", "8170");
+    EXPECT_THAT(refused("[settings]\nserver_port = \"1\"\n"), EndsWith("must be a whole number, without quotes"));
+    EXPECT_THAT(refused("[settings]\nserver_port = 1.0\n"), HasSubstr("must be a whole number"));
+    EXPECT_THAT(refused("[settings]\nserver_host = 1\n"), HasSubstr("must be a text in quotes"));
+    EXPECT_THAT(refused("[settings]\nsorvane_capture_web_enabled = \"yes\"\n"), HasSubstr("must be true or false"));
+    Dictionary state = sample();
+    state.set("server_port", "8170");
     EXPECT_EQ(parse("[settings]\nserver_port = \"1\"\n", state).settings.get("server_port"), Value("1"));
     EXPECT_EQ(parse("[settings]\nmax_file_size_in_mb = 3.5\n").settings.get("max_file_size_in_mb"), Value(3.5));
 }
 
 TEST(Desired, DatesAreMomentsWithAnOffset) {
-    State state = sample();
+    Dictionary state = sample();
     const Date noon(std::chrono::sys_days(std::chrono::year(2026) / 1 / 31) + std::chrono::hours(12));
-    state.settings.set("server_port", noon);
+    state.set("server_port", noon);
     EXPECT_THAT(exported(state), HasSubstr("server_port = 2026-01-31T12:00:00Z\n"));
     EXPECT_EQ(parse("[settings]\nserver_port = 2026-01-31T13:30:00+01:30\n", state).settings.get("server_port"),
               Value(noon));
@@ -214,30 +247,30 @@ TEST(Desired, DatesAreMomentsWithAnOffset) {
 TEST(Desired, EveryRefusalNamesThePlace) {
     EXPECT_THAT(refused("[settings]\nserver_port = \n"), StartsWith("state.toml, line 2, column "));
     EXPECT_THAT(refused("[settings]\nserver_port = [1]\n"),
-                StartsWith("state.toml, line 2, column 15: settings.server_port takes a text, a number, true"));
+                StartsWith("state.toml, line 2, column 15: settings.server_port must be a text, a number, true"));
     EXPECT_THAT(refused("[settings]\nnimbo_client_password = \"planted\"\n"),
                 AllOf(StartsWith("state.toml, line 2, column 25: "), HasSubstr("--password-file FILE"),
                       Not(HasSubstr("planted"))));
-    EXPECT_THAT(refused("[settings]\nweb_app_url = \"x\"\n"), HasSubstr("is no setting that can be written"));
-    EXPECT_THAT(refused("[settings]\nnimbo_controller_resolve_name = true\n"), HasSubstr("is no setting"));
-    EXPECT_THAT(refused("[setting]\n"), HasSubstr("setting is unknown; there are settings, properties, cameras"));
-    EXPECT_THAT(refused("properties = []\n"), HasSubstr("properties is a table: [properties]"));
-    EXPECT_THAT(refused("[properties]\nx = 1\n"), HasSubstr("properties.x is a table"));
+    EXPECT_THAT(refused("[settings]\nweb_app_url = \"x\"\n"), HasSubstr("is not a setting that can be written"));
+    EXPECT_THAT(refused("[settings]\nnimbo_controller_resolve_name = true\n"), HasSubstr("is not a setting"));
+    EXPECT_THAT(refused("[setting]\n"), HasSubstr("setting is unknown; the tables are settings, properties, cameras"));
+    EXPECT_THAT(refused("properties = []\n"), HasSubstr("properties must be a table: [properties]"));
+    EXPECT_THAT(refused("[properties]\nx = 1\n"), HasSubstr("properties.x must be a table"));
     EXPECT_THAT(refused("[properties.x]\nname = \"y\"\n"), HasSubstr("properties.x.name is unknown"));
-    EXPECT_THAT(refused("[properties.x]\nprotect = \"yes\"\n"), HasSubstr("properties.x.protect takes true or false"));
+    EXPECT_THAT(refused("[properties.x]\nprotect = \"yes\"\n"),
+                HasSubstr("properties.x.protect must be true or false"));
     EXPECT_THAT(refused("[cameras.Hall]\nuser = []\n"), HasSubstr("cameras.Hall.user is unknown"));
-    EXPECT_THAT(refused("[cameras.Hall]\nusers = [1]\n"), HasSubstr("takes a text in quotes"));
-    EXPECT_THAT(refused("[cameras.Hall]\nusers = [\"\"]\n"), HasSubstr("has an empty short name"));
-    EXPECT_THAT(refused("[cameras.Roof]\n"), HasSubstr("cameras.Roof is no camera of the service"));
-    EXPECT_THAT(refused("[cameras.Hall]\n[cameras.aaaa-1]\n"), HasSubstr("stands in the file twice"));
+    EXPECT_THAT(refused("[cameras.Hall]\nusers = [1]\n"), HasSubstr("must be a text in quotes"));
+    EXPECT_THAT(refused("[cameras.Hall]\nusers = [\"\"]\n"), HasSubstr("is an empty name"));
+    EXPECT_THAT(refused("[cameras.Roof]\n"), HasSubstr("cameras.Roof not found in the service"));
+    EXPECT_THAT(refused("[cameras.Hall]\n[cameras.aaaa-1]\n"), HasSubstr("is in the file twice"));
     EXPECT_THAT(refused("[remove_unlisted]\ncameras = true\n"), HasSubstr("remove_unlisted.cameras is unknown"));
-    EXPECT_THAT(refused("[remove_unlisted]\naccess = 1\n"), HasSubstr("takes true or false"));
+    EXPECT_THAT(refused("[remove_unlisted]\naccess = 1\n"), HasSubstr("must be true or false"));
 }
 
 TEST(Desired, CameraOfASharedNameIsRefusedWithTheUuids) {
-    State state = sample();
-    state.cameras->push_back({"AAAA-3", "Hall", false, {}});
-    EXPECT_THAT(refused("[cameras.Hall]\n", state), AllOf(HasSubstr("AAAA-1"), HasSubstr("AAAA-3")));
+    EXPECT_THAT(refused("[cameras.Hall]\n", sampleWith("cameras", {camera("AAAA-3", "Hall")})),
+                AllOf(HasSubstr("AAAA-1"), HasSubstr("AAAA-3")));
 }
 
 TEST(Desired, MessageShowsWhatATerminalWouldActOnByNumber) {

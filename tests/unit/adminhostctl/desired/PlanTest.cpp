@@ -1,6 +1,7 @@
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/desired/Plan.h"
 #include "adminhostctl/desired/Toml.h"
+#include "tests/unit/adminhostctl/Describe.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -11,119 +12,294 @@ using adminhost::Array;
 using adminhost::Dictionary;
 using adminhost::Value;
 using namespace adminhost::ctl;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
 
+const StateForm& form() {
+    static const StateForm form(describe("writeSettings"));
+    return form;
+}
+
+Dictionary person(const char* kind, const char* name, const char* uuid) {
+    return {{"type", kind}, {"shortName", name}, {"_id_", uuid}};
+}
+
+Dictionary sampleRoot() {
+    return {
+        {"server_port", 8170},
+        {"server_host", "media"},
+        {"nimbo_controller", "grid.example.org"},
+        {"shared_filesystem", "/old"},
+        {"member_uuid", "M-1"},
+        {"nimbo_client_password_is_set", true},
+        {"properties", Array{Dictionary{{"_id_", "3"}, {"name", "plain"}, {"value", "left"}, {"protect", false}},
+                             Dictionary{{"_id_", "4"}, {"name", "token"}, {"protect", true}}}},
+        {"cameras",
+         Array{Dictionary{{"_id_", "AAAA-1"},
+                          {"name", "Hall"},
+                          {"access_control_enabled", true},
+                          {"allowedUsersAndGroups", Array{person("user", "anna", "U-1"), person("group", "anna", "G-1"),
+                                                          person("user", "", "U-2")}}}}}};
+}
 State sample() {
-    State state;
-    state.settings = {{"server_port", 8170}, {"server_host", "media"}, {"nimbo_controller", "grid.example.org"}};
-    state.properties = std::vector<ListedProperty>{{"3", "plain", "left", false}, {"4", "token", std::nullopt, true}};
-    state.cameras = std::vector<ListedCamera>{
-        {"AAAA-1", "Hall", true, {{"user", "anna", "U-1"}, {"group", "anna", "G-1"}, {"user", "", "U-2"}}}};
-    return state;
+    return stateOf(form(), sampleRoot());
 }
 
-Plan planOfProperty(WantedProperty property) {
+WantedElement element(const char* name, Dictionary fields = {}) {
+    return {name, std::move(fields), {}, {}, false, false};
+}
+
+Plan planOfProperty(WantedElement property) {
     Wanted wanted;
-    wanted.properties.push_back(std::move(property));
-    return planOf(wanted, sample());
+    wanted.elements["properties"].push_back(std::move(property));
+    return planOf(form(), wanted, sample());
 }
 
-Value propertyRecords(WantedProperty property) {
-    return planOfProperty(std::move(property)).configuration.get("properties");
+Value propertyRecords(WantedElement property) {
+    return planOfProperty(std::move(property)).root.get("properties");
+}
+
+WantedElement secretly(WantedElement property) {
+    property.writeSecret = true;
+    return property;
+}
+
+RequestReport done(std::vector<ReportedGap> notDone = {}) {
+    RequestReport report;
+    report.state = RequestReport::State::done;
+    report.notDone = std::move(notDone);
+    return report;
+}
+
+std::vector<PlannedChange> failedOf(const PlanOutcome& outcome) {
+    std::vector<PlannedChange> changes;
+    for (const FailedChange& one : outcome.failed) {
+        changes.push_back(one.change);
+    }
+    return changes;
+}
+
+TEST(StateForm, IsLearntFromTheDescriptionOfTheWritingCommand) {
+    EXPECT_EQ(form().root(), "configuration");
+    EXPECT_EQ(form().settingsSection(), "settings");
+    EXPECT_EQ(form().lists().size(), 2U);
+    EXPECT_THAT(form().switches(), ElementsAre("properties", "access"));
+    EXPECT_NE(form().secret("nimbo_client_password"), nullptr);
+    EXPECT_EQ(form().setting("nimbo_client_password"), nullptr);
+    EXPECT_EQ(form().setting("nimbo_controller_resolve_name"), nullptr) << "an order, not a setting";
+    EXPECT_THROW((void)form().list("doors"), Failure);
+    EXPECT_THROW(StateForm(describe("getState")), Failure);
 }
 
 TEST(Plan, EqualSettingsAreNotSentAndTypesCount) {
     Wanted wanted;
     wanted.settings = {{"server_port", 8170}, {"server_host", "media"}};
-    EXPECT_TRUE(planOf(wanted, sample()).configuration.empty());
+    EXPECT_TRUE(planOf(form(), wanted, sample()).root.empty());
     wanted.settings.set("server_port", "8170");
-    const Plan plan = planOf(wanted, sample());
-    EXPECT_EQ(plan.configuration, (Dictionary{{"server_port", "8170"}}));
-    EXPECT_EQ(plan.changes, (std::vector<PlannedChange>{{"settings.server_port", "8170", "\"8170\""}}));
-    EXPECT_FALSE(plan.restart);
+    const Plan plan = planOf(form(), wanted, sample());
+    EXPECT_EQ(plan.root, (Dictionary{{"server_port", "8170"}}));
+    EXPECT_EQ(plan.changes,
+              (std::vector<PlannedChange>{{"settings.server_port", "8170", "\"8170\"", "", false, "", ""}}));
+    EXPECT_EQ(plan.changes.front().keyPath, "configuration.server_port");
+    EXPECT_THAT(plan.restart, IsEmpty());
+    EXPECT_FALSE(plan.moves);
 }
 
-TEST(Plan, NewSharedFileSystemSendsEverySettingBecauseOtherFilesAreUsedThen) {
+TEST(Plan, NewSharedFileSystemSendsEveryWantedSettingOfTheFilesThatMoveWithIt) {
     Wanted wanted;
-    wanted.settings = {{"shared_filesystem", "/new"}, {"server_port", 8170}};
-    const Plan plan = planOf(wanted, sample());
+    wanted.settings = {{"shared_filesystem", "/new"},
+                       {"member_uuid", "M-1"},
+                       {"server_port", 8170},
+                       {"nimbo_controller", "grid.example.org"}};
+    const Plan plan = planOf(form(), wanted, sample());
     EXPECT_EQ(plan.changes.size(), 1U);
-    EXPECT_TRUE(plan.restart);
-    EXPECT_EQ(plan.configuration.get("server_port"), Value(8170));
+    EXPECT_THAT(plan.restart, ElementsAre("stopService", "startService"));
+    EXPECT_TRUE(plan.moves);
+    EXPECT_EQ(
+        plan.root,
+        (Dictionary{{"shared_filesystem", "/new"}, {"server_port", 8170}, {"nimbo_controller", "grid.example.org"}}));
+    EXPECT_THAT(plan.notes, ElementsAre(HasSubstr("may not have them: server_host;"),
+                                        HasSubstr("nimbo_client_password: a secret, read from another file then")));
+}
+
+TEST(Plan, NewMemberSendsTheSettingsOfTheMembersFileOnly) {
+    Wanted wanted;
+    wanted.settings = {{"shared_filesystem", "/old"},
+                       {"member_uuid", "M-2"},
+                       {"server_port", 8170},
+                       {"nimbo_controller", "grid.example.org"}};
+    EXPECT_EQ(planOf(form(), wanted, sample()).root, (Dictionary{{"member_uuid", "M-2"}, {"server_port", 8170}}));
+}
+
+TEST(Plan, NameThatTheWriteLooksUpReachesTheNewFileToo) {
+    Dictionary root = sampleRoot();
+    root.set("nimbo_controller", "grid");
+    Wanted wanted;
+    wanted.settings = {{"shared_filesystem", "/new"}, {"nimbo_controller", "grid"}};
+    EXPECT_EQ(planOf(form(), wanted, stateOf(form(), root)).root, wanted.settings);
+    wanted.settings.set("nimbo_controller", "studio.local");
+    EXPECT_EQ(planOf(form(), wanted, stateOf(form(), root)).root, wanted.settings);
 }
 
 TEST(Plan, ControllerNameThatAWriteLooksUpIsOnlyWrittenWhenAskedFor) {
     Wanted wanted;
     wanted.settings = {{"nimbo_controller", "studio.a.local"}};
-    EXPECT_TRUE(planOf(wanted, sample()).changes.empty());
-    EXPECT_EQ(planOf(wanted, sample()).notes.size(), 1U);
-    wanted.lookUpController = true;
-    EXPECT_EQ(planOf(wanted, sample()).changes.size(), 1U);
-    EXPECT_TRUE(isLookedUp("grid"));
-    EXPECT_FALSE(isLookedUp("grid.example.org"));
-    EXPECT_FALSE(isLookedUp("grid.Local")) << "case counts";
-    EXPECT_FALSE(isLookedUp(".local"));
-    EXPECT_FALSE(isLookedUp(""));
+    EXPECT_TRUE(planOf(form(), wanted, sample()).changes.empty());
+    EXPECT_EQ(planOf(form(), wanted, sample()).notes.size(), 1U);
+    wanted.lookUp = true;
+    EXPECT_EQ(planOf(form(), wanted, sample()).changes.size(), 1U);
+    const DescribedKey& controller = *form().setting("nimbo_controller");
+    EXPECT_TRUE(isLookedUp(controller, "grid"));
+    EXPECT_FALSE(isLookedUp(controller, "grid.example.org"));
+    EXPECT_FALSE(isLookedUp(controller, "grid.Local")) << "case counts";
+    EXPECT_FALSE(isLookedUp(controller, ".local"));
+    EXPECT_FALSE(isLookedUp(controller, ""));
+    EXPECT_FALSE(isLookedUp(*form().setting("server_host"), "grid")) << "no other setting";
 }
 
 TEST(Plan, ProtectIsSentOnlyWhenItChanges) {
-    EXPECT_EQ(propertyRecords({"token", std::nullopt, true, false, false}), Value());
-    EXPECT_EQ(propertyRecords({"token", "new", true, false, true}),
+    EXPECT_EQ(propertyRecords(element("token", {{"protect", true}})), Value());
+    EXPECT_EQ(propertyRecords(secretly(element("token", {{"value", "new"}, {"protect", true}}))),
               Value(Array{Dictionary{{"_id_", "4"}, {"value", "new"}}}));
-    EXPECT_EQ(propertyRecords({"token", std::nullopt, false, false, false}),
+    EXPECT_EQ(propertyRecords(element("token", {{"protect", false}})),
               Value(Array{Dictionary{{"_id_", "4"}, {"protect", false}}}));
-    EXPECT_EQ(propertyRecords({"plain", "left", true, false, false}),
+    EXPECT_EQ(propertyRecords(element("plain", {{"value", "left"}, {"protect", true}})),
               Value(Array{Dictionary{{"_id_", "3"}, {"protect", true}}}));
 }
 
 TEST(Plan, NewPropertyIsOneRecordAndNeedsAValue) {
-    EXPECT_EQ(propertyRecords({"fresh", "x", false, false, false}),
+    EXPECT_EQ(propertyRecords(element("fresh", {{"value", "x"}, {"protect", false}})),
               Value(Array{Dictionary{{"_newid_", true}, {"name", "fresh"}, {"value", "x"}}}));
-    EXPECT_THROW(planOfProperty({"fresh", std::nullopt, true, false, false}), Failure);
-    EXPECT_THROW(planOfProperty({"", "x", true, false, false}), Failure);
+    EXPECT_THROW(planOfProperty(element("fresh", {{"protect", true}})), Failure);
+    EXPECT_THROW(planOfProperty(element("", {{"value", "x"}})), Failure);
+}
+
+TEST(Plan, CameraThatTheServiceDoesNotHaveIsRefused) {
+    Wanted wanted;
+    wanted.elements["cameras"].push_back(element("Roof"));
+    EXPECT_THROW((void)planOf(form(), wanted, sample()), Failure);
 }
 
 TEST(Plan, SecretsShowAsSuchOnBothSides) {
-    EXPECT_EQ(planOfProperty({"token", "new", {}, false, true}).changes,
-              (std::vector<PlannedChange>{{"properties.token.value", "(secret)", "(secret)"}}));
-    EXPECT_EQ(planOfProperty({"plain", "next", true, false, false}).changes.front(),
-              (PlannedChange{"properties.plain.value", "\"left\"", "(secret)"}));
-    EXPECT_EQ(planOfProperty({"token", "new", {}, false, false}).notes.size(), 1U) << "a file does not write it again";
+    EXPECT_EQ(planOfProperty(secretly(element("token", {{"value", "new"}}))).changes,
+              (std::vector<PlannedChange>{{"properties.token.value", "(secret)", "(secret)", "", true, "", ""}}));
+    EXPECT_EQ(planOfProperty(element("plain", {{"value", "next"}, {"protect", true}})).changes.front(),
+              (PlannedChange{"properties.plain.value", "\"left\"", "(secret)", "", true, "", ""}));
+    EXPECT_EQ(planOfProperty(element("token", {{"value", "new"}})).notes.size(), 1U)
+        << "a file does not write it again";
 }
 
 TEST(Plan, AccessListTellsUsersFromGroupsOfTheSameName) {
     Wanted wanted;
-    wanted.cameras.push_back({"aaaa-1", {}, std::vector<std::string>{"ben", "ben"}, {}, {}, false});
-    wanted.removePeople = true;
-    const Plan plan = planOf(wanted, sample());
-    EXPECT_EQ(plan.configuration.get("cameras"),
+    WantedElement camera = element("aaaa-1");
+    camera.lists["users"] = {"ben", "ben"};
+    wanted.elements["cameras"].push_back(camera);
+    wanted.removeUnlisted = {"access"};
+    const Plan plan = planOf(form(), wanted, sample());
+    EXPECT_EQ(plan.root.get("cameras"),
               Value(Array{Dictionary{
                   {"_id_", "AAAA-1"},
                   {"allowedUsersAndGroups", Array{Dictionary{{"_newid_", true}, {"type", "user"}, {"shortName", "ben"}},
                                                   Dictionary{{"_obsoleteid_", true}, {"_id_", "U-1"}}}}}}));
+    ASSERT_EQ(plan.changes.size(), 2U);
+    EXPECT_EQ(plan.changes[1].keyPath, "configuration.cameras.0.allowedUsersAndGroups.1");
 }
 
-TEST(Plan, WhatIsStillDifferentAfterwardsDidNotTake) {
+TEST(Outcome, WhatIsStillDifferentAfterwardsWasNotApplied) {
     Wanted wanted;
     wanted.settings = {{"server_port", 1}, {"server_host", "other"}};
-    wanted.cameras.push_back({"Hall", {}, {}, {}, {}, true});
-    const Plan plan = planOf(wanted, sample());
+    WantedElement removed = element("Hall");
+    removed.remove = true;
+    wanted.elements["cameras"].push_back(removed);
+    const Plan plan = planOf(form(), wanted, sample());
     State after = sample();
     after.settings.set("server_port", 1);
-    after.cameras->clear();
-    EXPECT_EQ(changesNotTaken(wanted, plan, sample(), after, true, {}),
-              (std::vector<PlannedChange>{{"settings.server_host", "\"media\"", "\"other\""}}));
-    EXPECT_EQ(changesNotTaken(wanted, plan, sample(), State(), true, {}).size(), plan.changes.size());
+    after.lists["cameras"].clear();
+    const PlanOutcome outcome = outcomeOf(form(), wanted, plan, sample(), after, true,
+                                          done({{"configuration.server_host", "is not writable", "tool 5"}}));
+    EXPECT_EQ(failedOf(outcome),
+              (std::vector<PlannedChange>{{"settings.server_host", "\"media\"", "\"other\"", "", false, "", ""}}));
+    EXPECT_EQ(outcome.failed.front().reason, "is not writable (tool 5)");
+    EXPECT_EQ(outcome.applied.size(), 2U);
+    EXPECT_THAT(outcome.undetermined, IsEmpty());
 }
 
-TEST(Plan, SecretThatTookIsToldFromTheLog) {
+TEST(Outcome, NothingIsKnownOfAStateThatCannotBeRead) {
     Wanted wanted;
-    wanted.properties.push_back({"token", "new", {}, false, true});
-    const Plan plan = planOf(wanted, sample());
-    EXPECT_TRUE(changesNotTaken(wanted, plan, sample(), sample(), true, {}).empty());
-    const std::vector<std::string> log = {"adminhost_lumio: could not update property with id: 4, error: X (1)"};
-    EXPECT_EQ(changesNotTaken(wanted, plan, sample(), sample(), true, log).size(), 1U);
-    const std::vector<std::string> other = {"adminhost_lumio: could not update property with id: 44, error: X (1)"};
-    EXPECT_TRUE(changesNotTaken(wanted, plan, sample(), sample(), true, other).empty());
+    wanted.settings = {{"server_port", 1}};
+    const Plan plan = planOf(form(), wanted, sample());
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), std::nullopt, true, done()).undetermined, plan.changes);
+    wanted.elements["properties"].push_back(element("plain", {{"value", "right"}}));
+    const Plan both = planOf(form(), wanted, sample());
+    State unread = sample();
+    unread.settings.set("server_port", 1);
+    unread.lists.clear();
+    EXPECT_EQ(outcomeOf(form(), wanted, both, sample(), unread, true, done()).undetermined, both.changes);
+}
+
+TEST(Outcome, SecretThatWasAppliedIsToldFromTheReportOfWhatWasNot) {
+    Wanted wanted;
+    wanted.elements["properties"].push_back(secretly(element("token", {{"value", "new"}})));
+    const Plan plan = planOf(form(), wanted, sample());
+    const auto outcome = [&](const RequestReport& report, bool answered = true) {
+        return outcomeOf(form(), wanted, plan, sample(), sample(), answered, report);
+    };
+    EXPECT_EQ(outcome(done()).applied.size(), 1U);
+    for (const char* path : {"configuration.properties.0.value", "configuration.properties.0"}) {
+        EXPECT_EQ(outcome(done({{path, "cannot be enciphered", ""}})).failed.size(), 1U) << path;
+    }
+    for (const char* path : {"configuration.properties.1", "configuration.properties.01", "configuration.proper"}) {
+        EXPECT_EQ(outcome(done({{path, "of another one", ""}})).applied.size(), 1U) << path;
+    }
+    EXPECT_EQ(outcome(done(), false).undetermined.size(), 1U) << "the answer is missing";
+    EXPECT_EQ(outcome({}, true).undetermined.size(), 1U) << "the daemon does not know the request";
+    RequestReport reported = done();
+    reported.changes.push_back({"properties", "4", "token", "value", {}, {}, true});
+    EXPECT_EQ(outcome(reported, false).applied.size(), 1U);
+    reported.changes.front().identity = "5";
+    EXPECT_EQ(outcome(reported, false).undetermined.size(), 1U);
+}
+
+TEST(Outcome, ProtectionThatWasSwitchedOffWithoutItsTextWasNotApplied) {
+    Wanted wanted;
+    wanted.elements["properties"].push_back(element("token", {{"protect", false}}));
+    const Plan plan = planOf(form(), wanted, sample());
+    Dictionary root = sampleRoot();
+    root.find("properties")->array()->back() =
+        Dictionary{{"_id_", "4"}, {"name", "token"}, {"value", "x"}, {"protect", false}};
+    const State after = stateOf(form(), root);
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), after, true, done()).applied.size(), 1U);
+    EXPECT_EQ(
+        outcomeOf(form(), wanted, plan, sample(), after, true, done({{"configuration.properties.0", "no key", ""}}))
+            .failed.size(),
+        1U);
+}
+
+TEST(Outcome, PasswordIsJudgedByWhetherOneIsStored) {
+    Wanted wanted;
+    wanted.secrets["nimbo_client_password"] = "new";
+    const Plan plan = planOf(form(), wanted, sample());
+    State without = sample();
+    without.settings.set("nimbo_client_password_is_set", false);
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), sample(), true, done()).applied.size(), 1U);
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), without, true, done()).failed.size(), 1U);
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), sample(), true,
+                        done({{"configuration.nimbo_client_password", "cannot be enciphered", ""}}))
+                  .failed.size(),
+              1U);
+}
+
+TEST(Outcome, LookedUpNameIsWhateverTheWriteStored) {
+    Wanted wanted;
+    wanted.settings = {{"nimbo_controller", "studio.local"}};
+    wanted.lookUp = true;
+    const Plan plan = planOf(form(), wanted, sample());
+    State found = sample();
+    found.settings.set("nimbo_controller", "host.example.org");
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), found, true, done()).applied.size(), 1U);
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), found, false, done()).applied.size(), 1U);
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), sample(), false, done()).failed.size(), 1U);
 }
 
 TEST(Toml, TextsAndKeysAreQuotedAsTheFormatNeeds) {

@@ -1,0 +1,154 @@
+// Writes whose answer never comes: what was written is determined and reported, and nothing is written a second time.
+
+#include "tests/system/apply/ControlledService.h"
+
+#include <array>
+#include <chrono>
+#include <csignal>
+#include <thread>
+
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace adminhost::test {
+namespace {
+
+using testing::AllOf;
+using testing::HasSubstr;
+using testing::Not;
+
+/// A command line that runs beside the test; output and messages together.
+class RunningCtl {
+  public:
+    RunningCtl(const std::string& socket, const std::vector<std::string>& words) {
+        std::array<int, 2> ends{};
+        EXPECT_EQ(::pipe(ends.data()), 0);
+        _pid = ::fork();
+        if (_pid == 0) {
+            ::dup2(ends[1], STDOUT_FILENO);
+            ::dup2(ends[1], STDERR_FILENO);
+            ::close(ends[0]);
+            ::close(ends[1]);
+            const std::string program = std::string(BINARY_DIR) + "/bin/adminhostctl";
+            std::vector<const char*> arguments{program.c_str(), "--socket", socket.c_str()};
+            for (const std::string& word : words) {
+                arguments.push_back(word.c_str());
+            }
+            arguments.push_back(nullptr);
+            ::execv(program.c_str(), const_cast<char**>(arguments.data()));
+            ::_exit(127);
+        }
+        ::close(ends[1]);
+        _output = ends[0];
+    }
+    ~RunningCtl() { ::close(_output); }
+    RunningCtl(const RunningCtl&) = delete;
+    RunningCtl& operator=(const RunningCtl&) = delete;
+
+    void signal(int number) const { ::kill(_pid, number); }
+    /// Its whole output and its status; 128 + number after a death by signal.
+    ProgramResult wait() {
+        ProgramResult result;
+        std::array<char, 4096> bytes{};
+        for (ssize_t count = 0; (count = ::read(_output, bytes.data(), bytes.size())) > 0;) {
+            result.output.append(bytes.data(), static_cast<std::size_t>(count));
+        }
+        int status = 0;
+        EXPECT_EQ(::waitpid(_pid, &status, 0), _pid);
+        result.status = WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status);
+        return result;
+    }
+
+  private:
+    pid_t _pid = -1;
+    int _output = -1;
+};
+
+class LostAnswers : public ControlledService {
+  protected:
+    explicit LostAnswers(const std::string& configuration = {}) : ControlledService(configuration) {}
+    /// Waits until the daemon runs a write.
+    void waitForWrite() const {
+        for (int i = 0; i < 1000; ++i) {
+            if (daemon.connect().get("/v1/").body.find("writeSettings\",\"since") != std::string::npos ||
+                daemon.connect().get("/v1/").body.find("\"command\":\"writeSettings\"") != std::string::npos) {
+                return;
+            }
+            std::this_thread::sleep_for(std::chrono::milliseconds(10));
+        }
+        FAIL() << "no write runs: " << daemon.connect().get("/v1/").body;
+    }
+    [[nodiscard]] std::size_t writes() const {
+        std::size_t count = 0;
+        for (const ToolCall& call : root.toolCalls()) {
+            count += call.tool.ends_with("setup_lumioserverd_library") ? 1U : 0U;
+        }
+        return count;
+    }
+};
+
+class Deadline : public LostAnswers {
+  protected:
+    Deadline() : LostAnswers("request_deadline_seconds = 2\n") {}
+};
+
+TEST_F(Deadline, ApplyReportsWhatWasWrittenBeforeItAndWhatWasNot) {
+    root.recordToolCalls();
+    root.setSwitch("setup_library.sleep", "30");
+    const std::string desired = file(
+        "desired.toml", "[settings]\nmember_uuid = \"0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1EFF\"\nserver_port = 8180\n");
+    const ProgramResult apply = ctl({"apply", desired});
+    EXPECT_EQ(apply.status, 1);
+    EXPECT_THAT(apply.output, AllOf(HasSubstr("DEADLINE_EXCEEDED"), HasSubstr("has ended; it was not repeated"),
+                                    testing::ContainsRegex("these changes were applied:\nsettings.member_uuid: "),
+                                    testing::ContainsRegex("not applied:\n  settings.server_port: [^\n]* -> 8180")));
+    EXPECT_EQ(writes(), 1U);
+}
+
+TEST_F(Deadline, CommandReportsThatTheRequestHasEnded) {
+    root.setSwitch("setup_library.sleep", "30");
+    const ProgramResult write = ctl({"writeSettings", "configuration.server_port=8180"});
+    EXPECT_EQ(write.status, 1);
+    EXPECT_THAT(write.output, AllOf(HasSubstr("DEADLINE_EXCEEDED"), HasSubstr("has ended; it was not repeated")));
+}
+
+TEST_F(LostAnswers, KilledWorkerIsReportedAndNothingIsWrittenTwice) {
+    root.recordToolCalls();
+    root.setSwitch("setup_library.sleep", "30");
+    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    waitForWrite();
+    ::kill(daemon.workerPid(), SIGKILL);
+    const ProgramResult result = set.wait();
+    EXPECT_EQ(result.status, 1);
+    EXPECT_THAT(result.output, AllOf(HasSubstr("WORKER_FAILED"), HasSubstr("has ended; it was not repeated"),
+                                     HasSubstr("not applied:\n  settings.server_port: 8170 -> 8180")));
+    EXPECT_LE(writes(), 1U);
+}
+
+TEST_F(LostAnswers, DaemonThatIsGoneLeavesItUndetermined) {
+    root.setSwitch("setup_library.sleep", "30");
+    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    waitForWrite();
+    daemon.signal(SIGKILL);
+    const ProgramResult result = set.wait();
+    EXPECT_EQ(result.status, 6);
+    EXPECT_THAT(result.output,
+                AllOf(HasSubstr("the connection to the daemon was lost"), HasSubstr("the daemon cannot be reached"),
+                      HasSubstr("could not be determined whether these changes were applied:\n  settings.server_port: "
+                                "8170 -> 8180")));
+}
+
+TEST_F(LostAnswers, InterruptedWriteIsReportedAndTheProgramEndsByTheSignal) {
+    root.setSwitch("setup_library.sleep", "2");
+    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    waitForWrite();
+    set.signal(SIGINT);
+    const ProgramResult result = set.wait();
+    EXPECT_EQ(result.status, 128 + SIGINT) << result.output;
+    EXPECT_THAT(result.output, AllOf(HasSubstr("interrupted"), HasSubstr("has ended; it was not repeated"),
+                                     HasSubstr("these changes were applied:\nsettings.server_port: 8170 -> 8180\n")));
+    EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8180\n");
+}
+
+}  // namespace
+}  // namespace adminhost::test

@@ -1,0 +1,69 @@
+// A change of the place of the settings files: one apply settles what the plan shows.
+
+#include "tests/system/apply/ControlledService.h"
+
+#include <filesystem>
+
+namespace adminhost::test {
+namespace {
+
+using testing::AllOf;
+using testing::HasSubstr;
+using testing::Not;
+
+class Moving : public ControlledService {
+  protected:
+    void replaceSetting(const std::string& key, const std::string& value) {
+        const std::size_t at = _text.find("\n" + key + " = ") + 1;
+        ASSERT_NE(at, 0U) << key;
+        _text.replace(at, _text.find('\n', at) - at, key + " = " + value);
+    }
+    /// Applies the file; the second time nothing differs, and the exported state is the file.
+    void settlesAtOnce() {
+        const std::string desired = file("desired.toml", _text);
+        const ProgramResult plan = ctl({"plan", desired});
+        EXPECT_EQ(plan.status, 0) << plan.output;
+        const ProgramResult apply = ctl({"apply", desired});
+        EXPECT_EQ(apply.status, 0) << apply.output;
+        EXPECT_THAT(apply.output, Not(HasSubstr("not applied")));
+        EXPECT_EQ(ctl({"apply", desired}).output, "no change\n");
+        EXPECT_EQ(ctl({"export"}).output, _text);
+    }
+
+    std::string _text = ctl({"export"}).output;
+};
+
+TEST_F(Moving, AnotherSharedFileSystemGetsEverySettingOfTheFileInOneApply) {
+    replaceSetting("shared_filesystem", "\"/Library/Moved\"");
+    settlesAtOnce();
+    const std::string cluster = read(root.path() + "/Library/Moved/Server/cluster_preferences.plist");
+    EXPECT_THAT(cluster, AllOf(HasSubstr("nimbo_controller"), HasSubstr("grid1.example.org")));
+}
+
+TEST_F(Moving, AnotherMemberGetsEverySettingOfTheMembersFileInOneApply) {
+    replaceSetting("member_uuid", "\"0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1EFF\"");
+    settlesAtOnce();
+    EXPECT_THAT(read(root.path() + "/Library/SorvaneProducer/Shared/Server/"
+                                   "member_preferences_0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1EFF.plist"),
+                HasSubstr("<integer>8170</integer>"));
+}
+
+TEST_F(Moving, ListsAreChangedTogetherWithTheMove) {
+    replaceSetting("shared_filesystem", "\"/Library/Moved\"");
+    replaceSetting("server_port", "8180");
+    const std::size_t at = _text.find("value = \"de\"");
+    ASSERT_NE(at, std::string::npos);
+    _text.replace(at, 12, "value = \"fr\"");
+    settlesAtOnce();
+    EXPECT_EQ(root.sql("select value from properties where name='default_language'"), "fr\n");
+}
+
+TEST_F(Moving, PlanNamesWhatTheNewFilesNeedNotHave) {
+    const ProgramResult plan = ctl({"plan", file("some.toml", "[settings]\nshared_filesystem = \"/Library/Moved\"\n")});
+    EXPECT_THAT(plan.output, AllOf(HasSubstr("settings: read from other files then, which may not have them: "),
+                                   HasSubstr("server_port"),
+                                   HasSubstr("settings.nimbo_client_password: a secret, read from another file then")));
+}
+
+}  // namespace
+}  // namespace adminhost::test

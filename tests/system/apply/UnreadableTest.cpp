@@ -1,0 +1,42 @@
+// A state that cannot be read in full is never written down as if the rest did not exist.
+
+#include "tests/system/apply/ControlledService.h"
+
+#include <filesystem>
+
+namespace adminhost::test {
+namespace {
+
+namespace fs = std::filesystem;
+using testing::HasSubstr;
+
+class Unreadable : public ControlledService {
+  protected:
+    /// Exporting, to a file and to standard output, fails and writes nothing.
+    void exportFails(const std::string& why) const {
+        const std::string exported = file("state.toml", "the last good one\n");
+        const ProgramResult result = ctl({"export", exported});
+        EXPECT_EQ(result.status, 1) << why;
+        EXPECT_THAT(result.output, HasSubstr(why));
+        EXPECT_EQ(read(exported), "the last good one\n");
+        EXPECT_EQ(ctl({"export"}).output, result.output);
+    }
+};
+
+TEST_F(Unreadable, MissingDatabaseIsNotExported) {
+    fs::remove(root.databasePath());
+    exportFails("the service does not list its properties: its database is missing or cannot be read");
+}
+
+TEST_F(Unreadable, BrokenDatabaseIsNotExported) {
+    std::ofstream(root.databasePath()) << std::string(4096, 'x');
+    exportFails("the service does not list its properties: its database is missing or cannot be read");
+}
+
+TEST_F(Unreadable, MissingTableOfCamerasIsNotExported) {
+    root.sql("alter table cameras rename to gone");
+    exportFails("the service does not list its cameras");
+}
+
+}  // namespace
+}  // namespace adminhost::test
