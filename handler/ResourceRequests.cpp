@@ -140,8 +140,9 @@ Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary& request
 }
 
 Response LumioRequestHandler::setWorkflowACLWithRequest(const Array* changes) {
-    forEachEntry(changes,
-                 [](const Dictionary& entry) { changeAccess(*Workflow::initWithGUID(identifierOf(entry)), entry); });
+    forEachEntry(changes, [](const Dictionary& entry, std::size_t) {
+        changeAccess(*Workflow::initWithGUID(identifierOf(entry)), entry);
+    });
     return nullptr;
 }
 
