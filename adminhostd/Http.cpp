@@ -430,8 +430,8 @@ int HttpServer::access(MHD_Connection* connection, const char* url, const char* 
         } else if (!exchange._refusal) {
             exchange._body.append(data, *size);
         }
-        // It may hold a password, and the library reuses its buffer without clearing it. The buffer is not constant: the
-        // library only promises that it does not look at these bytes again.
+        // It may hold a password, and the library reuses its buffer without clearing it. The buffer is not constant:
+        // the library only promises that it does not look at these bytes again.
         ::explicit_bzero(const_cast<char*>(data), *size);
         *size = 0;
         return exchange._received > discardMaximum ? MHD_NO : MHD_YES;

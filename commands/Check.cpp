@@ -81,6 +81,69 @@ std::string_view nameOf(KeyType type) noexcept {
     return names[static_cast<std::size_t>(type)];
 }
 
+Change changeOf(const Dictionary& values, const EntryDescription& entry) {
+    const auto isSet = [&](std::string_view flag) {
+        const Value& value = values.get(flag);
+        return !flag.empty() && (entry.leadingZeros ? adminhost::flagOf(value) : adminhost::booleanOf(value));
+    };
+    const bool added = isSet(entry.addedBy);
+    const bool removed = isSet(entry.removedBy);
+    if (removed && !(added && entry.addedFirst)) {
+        return changeRemoved;
+    }
+    if (!added) {
+        return entry.otherwise;
+    }
+    const std::string* kind = values.get("type").string();
+    const bool known = entry.addedKinds.empty() ||
+                       (kind != nullptr && std::any_of(entry.addedKinds.begin(), entry.addedKinds.end(),
+                                                       [&](std::string_view k) { return equalWithoutCase(k, *kind); }));
+    return known ? changeAdded : changeNothing;
+}
+
+/// Walks a configuration along its description and collects the key paths that it does not name.
+class UnknownKeys {
+  public:
+    explicit UnknownKeys(std::vector<std::string>& paths) noexcept : _paths(paths) {}
+
+    void value(const Value& value, const KeyDescription& key, const std::string& path) {
+        if (key.children.empty()) {
+            return;
+        }
+        if (const Dictionary* values = value.dictionary()) {
+            dictionary(*values, key, path);
+        } else if (const adminhost::Array* elements = value.array()) {
+            for (std::size_t i = 0; i < elements->size(); ++i) {
+                this->value((*elements)[i], key.children.front(), path + '.' + std::to_string(i));
+            }
+        }
+    }
+
+  private:
+    void dictionary(const Dictionary& values, const KeyDescription& key, const std::string& path) {
+        if (key.entry != nullptr && changeOf(values, *key.entry) == changeNothing) {
+            return;  // it is there to be shown, as reading returned it
+        }
+        for (const adminhost::DictionaryEntry& entry : values) {
+            const std::string at = path + '.' + entry.key;
+            const auto known = std::find_if(key.children.begin(), key.children.end(),
+                                            [&](const KeyDescription& child) { return child.name == entry.key; });
+            if (known != key.children.end()) {
+                value(entry.value, *known, at);
+            } else if (key.entry == nullptr || !isColumn(entry.key, *key.entry)) {
+                _paths.push_back(at);
+            }
+        }
+    }
+
+    /// Whether reading returns the key, so that a client may send it back unchanged.
+    static bool isColumn(std::string_view name, const EntryDescription& entry) {
+        return std::find(entry.columns.begin(), entry.columns.end(), name) != entry.columns.end();
+    }
+
+    std::vector<std::string>& _paths;
+};
+
 /// Walks a request along its description and collects what does not fit.
 class Check {
   public:
@@ -102,27 +165,6 @@ class Check {
     }
 
   private:
-    static Change changeOf(const Dictionary& values, const EntryDescription& entry) {
-        const auto isSet = [&](std::string_view flag) {
-            const Value& value = values.get(flag);
-            return !flag.empty() && (entry.leadingZeros ? adminhost::flagOf(value) : adminhost::booleanOf(value));
-        };
-        const bool added = isSet(entry.addedBy);
-        const bool removed = isSet(entry.removedBy);
-        if (removed && !(added && entry.addedFirst)) {
-            return changeRemoved;
-        }
-        if (!added) {
-            return entry.otherwise;
-        }
-        const std::string* kind = values.get("type").string();
-        const bool known =
-            entry.addedKinds.empty() ||
-            (kind != nullptr && std::any_of(entry.addedKinds.begin(), entry.addedKinds.end(),
-                                            [&](std::string_view k) { return equalWithoutCase(k, *kind); }));
-        return known ? changeAdded : changeNothing;
-    }
-
     static bool isRead(const KeyDescription& key, const Dictionary& values, Change change) {
         if ((key.readFor & change) == 0) {
             return false;
@@ -286,6 +328,22 @@ std::vector<Finding> checkRequest(std::string_view command, const Dictionary& re
         Check(findings).dictionary(request, description->keys, nullptr, {});
     }
     return findings;
+}
+
+std::vector<std::string> unknownKeys(std::string_view command, const Dictionary& request) {
+    constexpr std::string_view configuration = "configuration";
+    std::vector<std::string> paths;
+    const CommandDescription* description = findCommand(command);
+    const Value* given = request.find(configuration);
+    if (description == nullptr || given == nullptr) {
+        return paths;
+    }
+    for (const KeyDescription& key : description->keys) {
+        if (key.name == configuration) {
+            UnknownKeys(paths).value(*given, key, std::string(configuration));
+        }
+    }
+    return paths;
 }
 
 }  // namespace lumio

@@ -9,6 +9,7 @@
 
 #include <cstdint>
 #include <span>
+#include <string>
 #include <string_view>
 #include <vector>
 
@@ -78,6 +79,11 @@ struct CommandDescription {
 /// no description names pass, and so does a missing key: operations answer for those themselves.
 [[nodiscard]] std::vector<adminhost::Finding> checkRequest(std::string_view command,
                                                            const adminhost::Dictionary& request);
+
+/// The key paths within the request's "configuration" that no description names and that are no columns of the table
+/// that an entry changes: operations ignore them. In the request's order. Entries that change nothing are not looked
+/// at.
+[[nodiscard]] std::vector<std::string> unknownKeys(std::string_view command, const adminhost::Dictionary& request);
 
 /// One step of the descriptions' flat form, from which describeCommands() builds them.
 struct DescriptionToken {

@@ -4,6 +4,7 @@
 
 #include "commands/CommandTable.h"
 #include "handler/LumioRequestHandler.h"
+#include "platform/framework/Report.h"
 #include "settings/DatabaseTool.h"
 #include "settings/Revision.h"
 
@@ -82,6 +83,9 @@ class LumioPlugin final : public adminhost::Plugin {
     }
 
     Response perform(std::string_view command, const Dictionary& request) override {
+        for (std::string& keyPath : lumio::unknownKeys(command, request)) {
+            adminhost::reportNotDone({std::move(keyPath), "The key is not known, so it was ignored.", {}});
+        }
         const Operation* operation = operationNamed(command);
         return operation == nullptr ? Response::error("UNKNOWN_COMMAND", "The plug-in does not serve this command.")
                                     : operation->perform(_handler, request);

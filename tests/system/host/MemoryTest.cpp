@@ -55,7 +55,7 @@ class MemoryAfterAnAnswer : public ::testing::Test {
         for (const pid_t pid : {daemon.pid(), daemon.workerPid()}) {
             // The answer is there before the worker has freed it, and the connection's end is noticed in its turn.
             EXPECT_TRUE(eventually([&] { return placesOf(secret, pid).empty(); }))
-                << (pid == daemon.pid() ? "the front" : "the worker") << ": " << placesOf(secret, pid).front();
+                << (pid == daemon.pid() ? "the front" : "the worker") << testing::PrintToString(placesOf(secret, pid));
         }
     }
     [[nodiscard]] std::string request() const {

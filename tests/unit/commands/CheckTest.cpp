@@ -408,4 +408,40 @@ TEST(CheckArguments, AControllerMustFitTheGridToolsArgument) {
     EXPECT_THAT(lumio::checkRequest("validateSettings", {{"nimbo_controller", "grid.example.com"}}), IsEmpty());
 }
 
+std::vector<std::string> unknownIn(Dictionary configuration) {
+    return lumio::unknownKeys("writeSettings", {{"configuration", std::move(configuration)}, {"other", 1}});
+}
+
+TEST(UnknownKeys, OfAConfigurationAreNamedByTheirKeyPaths) {
+    EXPECT_THAT(unknownIn({{"server_port", 4}, {"server_prot", 5}, {"cameras", Array{}}}),
+                ElementsAre("configuration.server_prot"));
+    EXPECT_THAT(
+        unknownIn(
+            {{"cameras",
+              Array{Dictionary{{"_id_", "A"}},
+                    Dictionary{{"_id_", "B"},
+                               {"acces_control_enabled", true},
+                               {"allowedUsersAndGroups",
+                                Array{Dictionary{{"_newid_", true}, {"type", "user"}, {"shortname", "anna"}}}}}}}}),
+        ElementsAre("configuration.cameras.1.acces_control_enabled",
+                    "configuration.cameras.1.allowedUsersAndGroups.0.shortname"));
+}
+
+TEST(UnknownKeys, AreNotThoseThatReadingReturns) {
+    EXPECT_THAT(unknownIn({{"cameras", Array{Dictionary{{"_id_", "A"}, {"name", "Studio"}, {"created_at", "x"}}}}}),
+                IsEmpty());
+}
+
+TEST(UnknownKeys, AreNotLookedForInEntriesThatChangeNothing) {
+    EXPECT_THAT(
+        unknownIn({{"cameras", Array{Dictionary{{"_id_", "A"},
+                                                {"allowedUsersAndGroups", Array{Dictionary{{"longName", "Anna"}}}}}}}}),
+        IsEmpty());
+}
+
+TEST(UnknownKeys, AreNoneWithoutAConfiguration) {
+    EXPECT_THAT(lumio::unknownKeys("writeSettings", {{"other", 1}}), IsEmpty());
+    EXPECT_THAT(lumio::unknownKeys("fly", {{"configuration", Dictionary{{"a", 1}}}}), IsEmpty());
+}
+
 }  // namespace

@@ -2,6 +2,7 @@
 
 #include "adminhostd/PluginFile.h"
 #include "platform/directory/LocalAccounts.h"
+#include "tests/support/CapturedReports.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <filesystem>
@@ -53,6 +54,14 @@ TEST_F(PluginTable, EveryDescribedCommandIsServed) {
     for (const Command& command : commands) {
         EXPECT_NE(errorOf(command.name), "UNKNOWN_COMMAND") << command.name;
     }
+}
+
+TEST_F(PluginTable, UnknownKeyOfAConfigurationIsReportedAsNotDone) {
+    test::CapturedReports reports;
+    static_cast<void>(
+        plugin->perform("writeSettings", {{"configuration", Dictionary{{"server_prot", 4}, {"cameras", Array{}}}}}));
+    EXPECT_THAT(reports.parts, testing::Contains(NotDone{"configuration.server_prot",
+                                                         "The key is not known, so it was ignored.", ""}));
 }
 
 TEST_F(PluginTable, CommandThatIsNotDescribedIsAnError) {
