@@ -1,8 +1,9 @@
-// adminhostd-worker: started by the front, with the conversation as descriptor 3.
+// adminhostd-worker: started by the front, with the conversation as descriptor 3 and the register of tools as 4.
 
 #include "adminhostd/PluginTrial.h"
 #include "adminhostd/ProcessStart.h"
 #include "adminhostd/Worker.h"
+#include "platform/task/ToolRegister.h"
 
 #include <cstdlib>
 #include <exception>
@@ -17,11 +18,14 @@ int main(int count, char** arguments) {
         return adminhost::serveTrial(arguments[2]);
     }
     constexpr int conversation = 3;
+    constexpr int tools = 4;
     struct stat status {};
-    if (::fstat(conversation, &status) != 0 || !S_ISSOCK(status.st_mode)) {
+    auto toolRegister = adminhost::ToolRegister::open(adminhost::FileDescriptor(tools));
+    if (!toolRegister || ::fstat(conversation, &status) != 0 || !S_ISSOCK(status.st_mode)) {
         std::cerr << "adminhostd-worker is started by adminhostd\n";
         return 2;
     }
+    adminhost::setToolRegister(&*toolRegister);
     ::unsetenv("NOTIFY_SOCKET");
     try {
         return adminhost::runWorker(conversation);

@@ -44,7 +44,12 @@ std::unique_ptr<WorkerProcess> WorkerProcess::start(bool outputToStandardError) 
     if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
         return nullptr;
     }
-    std::unique_ptr<WorkerProcess> worker(new WorkerProcess);
+    auto tools = ToolRegister::create();
+    if (!tools) {
+        errno = static_cast<int>(tools.error().code);
+        return nullptr;
+    }
+    std::unique_ptr<WorkerProcess> worker(new WorkerProcess(*std::move(tools)));
     worker->_socket = FileDescriptor(ends[0]);
     const FileDescriptor other(ends[1]);
     ::fcntl(ends[0], F_SETFL, O_NONBLOCK);
@@ -53,7 +58,8 @@ std::unique_ptr<WorkerProcess> WorkerProcess::start(bool outputToStandardError) 
     plan.program = workerProgram();
     plan.arguments = {"adminhostd-worker"};
     plan.environment = processEnvironment();
-    plan.descriptors = {-1, outputToStandardError ? STDERR_FILENO : STDOUT_FILENO, STDERR_FILENO, other.get()};
+    plan.descriptors = {-1, outputToStandardError ? STDERR_FILENO : STDOUT_FILENO, STDERR_FILENO, other.get(),
+                        worker->_tools.descriptor()};
     plan.directory = "/";
     plan.fileModeMask = S_IWGRP | S_IWOTH;
     auto started = startChild(plan);
@@ -152,12 +158,13 @@ const std::optional<std::string>& WorkerProcess::ending() {
     const pid_t waited = ::waitpid(_pid, &status, WNOHANG);
     if (waited < 0 && errno == ECHILD) {
         _ending = "ended, and the system does not know how";
+    } else if (waited == _pid && WIFSIGNALED(status)) {
+        _ending = fmt::format("was killed by signal {} ({})", WTERMSIG(status), ::strsignal(WTERMSIG(status)));
     } else if (waited == _pid) {
-        if (WIFSIGNALED(status)) {
-            _ending = fmt::format("was killed by signal {} ({})", WTERMSIG(status), ::strsignal(WTERMSIG(status)));
-        } else {
-            _ending = fmt::format("ended with status {}", WEXITSTATUS(status));
-        }
+        _ending = fmt::format("ended with status {}", WEXITSTATUS(status));
+    }
+    if (_ending) {
+        _tools.killRemaining();
     }
     return _ending;
 }

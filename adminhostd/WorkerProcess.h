@@ -4,11 +4,13 @@
 
 #include "adminhostd/Frame.h"
 #include "platform/files/FileDescriptor.h"
+#include "platform/task/ToolRegister.h"
 
 #include <memory>
 #include <optional>
 #include <span>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <poll.h>
@@ -45,17 +47,19 @@ class WorkerProcess {
     [[nodiscard]] std::optional<Frame> next() { return _reader.next(); }
     /// Whether the worker has sent bytes that are not a frame.
     [[nodiscard]] bool broken() const noexcept { return _reader.broken(); }
-    /// How the process ended ("was killed by signal 11 (Segmentation fault)"); nullopt while it runs.
+    /// How the process ended ("was killed by signal 11 (Segmentation fault)"); nullopt while it runs. The tools that it
+    /// ran are ended then, but not a service that they have started.
     [[nodiscard]] const std::optional<std::string>& ending();
     void kill() noexcept;
     /// Asks it to end by closing the conversation, and waits for its end, at most for the milliseconds.
     void finish(int milliseconds);
 
   private:
-    WorkerProcess() = default;
+    explicit WorkerProcess(ToolRegister tools) : _tools(std::move(tools)) {}
     void write();
 
     pid_t _pid = -1;
+    ToolRegister _tools;  ///< that it runs
     FileDescriptor _socket;
     FileDescriptor _process;
     FrameReader _reader;

@@ -1,6 +1,7 @@
 #include "platform/task/Child.h"
 
 #include "platform/task/StartChild.h"
+#include "platform/task/ToolRegister.h"
 
 #include <cerrno>
 #include <csignal>
@@ -64,11 +65,21 @@ int Child::start(const std::string& tool, const std::vector<std::string>& argume
     plan.arguments.insert(plan.arguments.end(), arguments.begin(), arguments.end());
     plan.environment = std::move(environment);
     plan.descriptors = {childInput.get(), childOutput.get(), childError.get()};
+    if (ToolRegister* known = toolRegister(); known != nullptr) {
+        plan.registration = known->claim();
+        if (plan.registration == nullptr) {
+            return EAGAIN;
+        }
+    }
     auto started = startChild(plan);
     if (!started) {
+        if (plan.registration != nullptr) {
+            plan.registration->store(0);
+        }
         return static_cast<int>(started.error().code);
     }
     _pid = started->pid;
+    _registration = plan.registration;
     exit = std::move(started->exit);
     return 0;
 }
@@ -81,10 +92,21 @@ void Child::kill() noexcept {
     }
 }
 
+void Child::noteExit() noexcept {
+    _exited = true;
+    if (_registration != nullptr) {
+        std::exchange(_registration, nullptr)->store(0);
+    }
+}
+
 std::int32_t Child::wait() noexcept {
     if (_pid <= 0) {
         return -1;
     }
+    siginfo_t ignored{};
+    while (!_exited && ::waitid(P_PID, static_cast<id_t>(_pid), &ignored, WEXITED | WNOWAIT) != 0 && errno == EINTR) {
+    }
+    noteExit();  // before the child is reaped: then its id may become that of another process
     int status = 0;
     pid_t waited = 0;
     do {

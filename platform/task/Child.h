@@ -1,10 +1,12 @@
 #pragma once
 
-// One running child process with our ends of its pipes. The destructor kills the process group of a child that was not
+// One running child process with our ends of its pipes. While it runs, its id is in the process's register
+// (ToolRegister.h), if there is one. The destructor kills the process group of a child that was not
 // waited for, so that no way out of a launch leaves a zombie or a stray.
 
 #include "platform/files/FileDescriptor.h"
 
+#include <atomic>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -29,8 +31,8 @@ class Child {
     /// daemon that stays.
     void kill() noexcept;
 
-    /// Call when `exit` is readable.
-    void noteExit() noexcept { _exited = true; }
+    /// Call when `exit` is readable: the child is no longer in the process's register (ToolRegister.h).
+    void noteExit() noexcept;
 
     /// Waits for the exit of this very child. Returns its status, 128 + the number of the signal that ended it, or -1
     /// if the system does not know it.
@@ -44,6 +46,7 @@ class Child {
   private:
     pid_t _pid = 0;  ///< 0 when there is nothing to wait for
     bool _exited = false;
+    std::atomic<pid_t>* _registration = nullptr;
 };
 
 }  // namespace adminhost

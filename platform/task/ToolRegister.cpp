@@ -1,0 +1,137 @@
+#include "platform/task/ToolRegister.h"
+
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstring>
+#include <system_error>
+#include <utility>
+
+#include <fcntl.h>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+namespace adminhost {
+namespace {
+
+constexpr std::size_t size = 4096;
+constexpr pid_t claimed = -1;  ///< by a tool that has not entered its id yet
+constexpr int stopTries = 20;  ///< milliseconds
+
+static_assert(sizeof(std::atomic<pid_t>) * ToolRegister::capacity <= size);
+
+std::atomic<ToolRegister*> registerOfProcess = nullptr;
+
+tl::unexpected<Error> failed() {
+    return failure(Error{"posix", errno, std::generic_category().message(errno)});
+}
+
+enum class State { gone, stopped, running };
+
+/// The state of a process from /proc. One that is on its way out counts as gone.
+State stateOf(pid_t pid) noexcept {
+    constexpr unsigned long isExiting = 0x4;  // PF_EXITING of the kernel
+    char path[32];
+    char text[1024];
+    std::snprintf(path, sizeof path, "/proc/%d/stat", pid);
+    const FileDescriptor file(::open(path, O_RDONLY | O_CLOEXEC));
+    const ssize_t length = file.isOpen() ? ::read(file.get(), text, sizeof text - 1) : -1;
+    if (length <= 0) {
+        return State::gone;
+    }
+    text[length] = '\0';
+    // PID (NAME) STATE PPID PGRP SESSION TTY TPGID FLAGS, where NAME may hold anything.
+    const char* rest = std::strrchr(text, ')');
+    char state = 'X';
+    unsigned long flags = 0;
+    if (rest == nullptr || std::sscanf(rest, ") %c %*d %*d %*d %*d %*d %lu", &state, &flags) != 2 || state == 'Z' ||
+        state == 'X' || (flags & isExiting) != 0) {
+        return State::gone;
+    }
+    return state == 'T' || state == 't' ? State::stopped : State::running;
+}
+
+/// Kills the group of a process that has not exited. The process is stopped before: otherwise it could exit between our
+/// look and our signal, which would then hit the service that it has started.
+void killGroup(pid_t pid) noexcept {
+    if (::getpgid(pid) != pid || ::getsid(pid) != ::getsid(0) || stateOf(pid) == State::gone) {
+        return;
+    }
+    ::kill(pid, SIGSTOP);
+    State state = stateOf(pid);
+    for (int tries = 0; state == State::running && tries < stopTries; ++tries) {
+        ::usleep(1000);
+        state = stateOf(pid);
+    }
+    // One that the kernel does not stop, because it waits for a dead mount, does not exit either.
+    if (state != State::gone) {
+        ::kill(-pid, SIGKILL);
+    }
+}
+
+}  // namespace
+
+Result<ToolRegister> ToolRegister::create() {
+    FileDescriptor descriptor(::memfd_create("adminhost-tools", MFD_CLOEXEC | MFD_ALLOW_SEALING));
+    if (!descriptor.isOpen() || ::ftruncate(descriptor.get(), size) != 0 ||
+        ::fcntl(descriptor.get(), F_ADD_SEALS, F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_SEAL) != 0) {
+        return failed();
+    }
+    return open(std::move(descriptor));
+}
+
+Result<ToolRegister> ToolRegister::open(FileDescriptor descriptor) {
+    struct stat status {};
+    if (::fstat(descriptor.get(), &status) != 0) {
+        return failed();
+    }
+    if (status.st_size != static_cast<off_t>(size)) {
+        errno = EINVAL;
+        return failed();
+    }
+    void* memory = ::mmap(nullptr, size, PROT_READ | PROT_WRITE, MAP_SHARED, descriptor.get(), 0);
+    if (memory == MAP_FAILED) {
+        return failed();
+    }
+    return ToolRegister(std::move(descriptor), static_cast<Places*>(memory));
+}
+
+ToolRegister::ToolRegister(ToolRegister&& other) noexcept
+    : _descriptor(std::move(other._descriptor)), _places(std::exchange(other._places, nullptr)) {}
+
+ToolRegister::~ToolRegister() {
+    if (_places != nullptr) {
+        ::munmap(static_cast<void*>(_places), size);
+    }
+}
+
+std::atomic<pid_t>* ToolRegister::claim() noexcept {
+    for (std::atomic<pid_t>& place : *_places) {
+        pid_t free = 0;
+        if (place.compare_exchange_strong(free, claimed)) {
+            return &place;
+        }
+    }
+    return nullptr;
+}
+
+void ToolRegister::killRemaining() noexcept {
+    for (std::atomic<pid_t>& place : *_places) {
+        const pid_t pid = place.exchange(0);
+        if (pid > 1) {
+            killGroup(pid);
+        }
+    }
+}
+
+void setToolRegister(ToolRegister* toolRegister) noexcept {
+    registerOfProcess = toolRegister;
+}
+
+ToolRegister* toolRegister() noexcept {
+    return registerOfProcess;
+}
+
+}  // namespace adminhost
