@@ -4,6 +4,7 @@
 #include "adminhostd/ListeningSocket.h"
 #include "adminhostd/Notify.h"
 #include "adminhostd/PluginSelection.h"
+#include "adminhostd/PrivateDirectory.h"
 #include "adminhostd/RunDirectory.h"
 #include "adminhostd/ToolConfiguration.h"
 #include "adminhostd/WorkerConfiguration.h"
@@ -14,6 +15,7 @@
 #include <optional>
 #include <thread>
 
+#include <fmt/format.h>
 #include <sys/signalfd.h>
 
 namespace adminhost {
@@ -22,7 +24,8 @@ namespace {
 using namespace std::chrono_literals;
 using Clock = std::chrono::steady_clock;
 
-constexpr auto runningBound = 10s;  ///< for the running operation when the daemon is to stop
+constexpr auto runningBound = 10s;  ///< for a running operation that only reads when the daemon is to stop
+constexpr auto extension = 5s;      ///< that the service manager waits longer than a running write may take
 constexpr int logPause = 100;       ///< milliseconds until the next try while the log cannot be written
 constexpr auto logBound = 200ms;    ///< for the log's last events at the end
 constexpr auto sendingBound = 2s;   ///< for its clients to take their answers then
@@ -32,6 +35,7 @@ FileDescriptor stopSignals() {
     ::sigemptyset(&signals);
     ::sigaddset(&signals, SIGTERM);
     ::sigaddset(&signals, SIGINT);
+    ::sigaddset(&signals, SIGHUP);
     ::sigprocmask(SIG_BLOCK, &signals, nullptr);
     static_cast<void>(std::signal(SIGPIPE, SIG_IGN));
     return FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
@@ -51,7 +55,7 @@ class Daemon {
     void run() {
         for (;;) {
             // Clients that come before the first worker is ready wait in the socket's backlog.
-            if (!_server && _front.queue().settled() && !_stopBy) {
+            if (!_server && _front.queue().settled() && !_stopping) {
                 _server.emplace(_socket.take(), _options.clientTimeout,
                                 [this](Exchange& exchange) { return _front.head(exchange); });
                 notify("READY=1");
@@ -96,23 +100,31 @@ class Daemon {
         signalfd_siginfo ignored{};
         while (::read(_signals.get(), &ignored, sizeof ignored) > 0) {
         }
-        if (_stopBy) {
+        if (_stopping) {
             return;
         }
+        _stopping = true;
         notify("STOPPING=1");
-        _stopBy = Clock::now() + runningBound + sendingBound;
         _socket.remove();
         if (_server) {
             _server->quiesce();
         }
         _front.queue().stop(runningBound);
+        if (const auto due = _front.queue().due()) {
+            // A write may take longer than the unit grants for a stop.
+            const auto left =
+                std::chrono::ceil<std::chrono::microseconds>(*due - Clock::now() + sendingBound + extension);
+            notify(fmt::format("EXTEND_TIMEOUT_USEC={}", left.count()));
+        }
     }
 
     bool finished() {
-        if (!_stopBy || !_front.queue().stopped()) {
+        if (!_stopping || !_front.queue().stopped()) {
             return false;
         }
-        _stopBy = std::min(*_stopBy, Clock::now() + sendingBound);
+        if (!_stopBy) {
+            _stopBy = Clock::now() + sendingBound;
+        }
         return !_server || _server->open() == 0 || Clock::now() >= *_stopBy;
     }
 
@@ -121,7 +133,8 @@ class Daemon {
     FileDescriptor _signals;
     Front _front;
     std::optional<HttpServer> _server;
-    std::optional<Clock::time_point> _stopBy;
+    bool _stopping = false;
+    std::optional<Clock::time_point> _stopBy;  ///< the end of the wait for clients, once no operation runs
     std::vector<pollfd> _entries;
 };
 
@@ -130,6 +143,7 @@ class Daemon {
 int runDaemon(const Options& options) {
     setLogSink(options.logToStandardError ? standardErrorSink() : syslogSink());
     ListeningSocket socket(socketPath(options), groupOf(options.socketGroup));
+    removeAbandonedDirectories(privateParent(options));
     const ToolConfiguration tools(privateParent(options));
     const PluginSelection plugins = selectPlugins(options);
     Daemon(options, plugins, tools, socket).run();

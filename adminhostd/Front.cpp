@@ -131,6 +131,8 @@ HttpAnswer answerFor(protocol::Answer& answer) {
                                "The settings have changed since they were read. Read them again.");
         case Outcome::overrun:
             return errorAnswer(504, "DEADLINE_EXCEEDED", "The command did not end in time and was stopped.");
+        case Outcome::locked:
+            return retryLater("WRITE_LOCKED", answer.message);
         case Outcome::broken:
             break;
     }
@@ -419,7 +421,7 @@ void Front::enqueue(Operation operation) {
 }
 
 void Front::operation(Exchange& exchange, const Target& target) {
-    Operation operation{&exchange, _log.add(exchange), {}, {}};
+    Operation operation{&exchange, _log.add(exchange)};
     RequestRecord& record = *operation.record;
     record.plugin = target.plugin;
     record.command = target.command;
@@ -454,6 +456,7 @@ void Front::operation(Exchange& exchange, const Target& target) {
                                     *_hello->databaseTool)));
     }
     operation.deadline = command.deadline;
+    operation.changes = command.access != Access::read;
     operation.order = protocol::Perform{
         .request = record.id,
         .plugin = record.plugin,
@@ -471,7 +474,7 @@ void Front::operation(Exchange& exchange, const Target& target) {
 }
 
 void Front::query(Exchange& exchange, const Target& target) {
-    Operation operation{&exchange, _log.add(exchange), {}, {}};
+    Operation operation{&exchange, _log.add(exchange)};
     operation.record->plugin = target.plugin;
     operation.record->command = target.command;
     for (const char* argument : {"match", "is"}) {

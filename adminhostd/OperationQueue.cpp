@@ -14,6 +14,7 @@ using namespace std::chrono_literals;
 constexpr auto startBound = 30s;
 /// A worker kills its tools at the deadline and reports the overrun; one that does not is killed itself.
 constexpr auto overrunGrace = 2s;
+constexpr auto lockPause = 50ms;  ///< until the lock for changes is tried again
 constexpr auto firstPause = 100ms;
 constexpr auto longestPause = 30s;
 
@@ -163,7 +164,13 @@ bool OperationQueue::take(protocol::Answer answer) {
     }
     _state = State::idle;
     _due.reset();
-    finish(std::move(answer));
+    _changesFrom.reset();
+    if (answer.outcome == protocol::Outcome::locked && _running->changes && !_stopping &&
+        Clock::now() < *_running->until) {
+        waitForLock(std::move(answer));
+    } else {
+        finish(std::move(answer));
+    }
     next();
     return true;
 }
@@ -211,34 +218,66 @@ void OperationQueue::timeUp() {
             endWorker("did not stop in time and was killed");
             break;
         case State::idle:
+            next();
             break;
     }
 }
 
+std::deque<Operation>::iterator OperationQueue::nextToRun() {
+    const bool locked = _changesFrom && Clock::now() < *_changesFrom;
+    return std::find_if(_waiting.begin(), _waiting.end(),
+                        [&](const Operation& operation) { return !locked || !operation.changes; });
+}
+
 void OperationQueue::next() {
     while (_state == State::idle && !_stopping && !_waiting.empty()) {
-        Operation operation = std::move(_waiting.front());
-        _waiting.pop_front();
+        const auto found = nextToRun();
+        if (found == _waiting.end()) {
+            _due = _changesFrom;
+            return;
+        }
+        Operation operation = std::move(*found);
+        _waiting.erase(found);
         if (operation.exchange->clientGone()) {
             _events.finished(operation, Unserved{Unserved::Reason::abandoned, "The client went away before its turn."});
-            continue;
+        } else if (operation.locked && Clock::now() >= *operation.until) {
+            auto answer = *std::move(operation.locked);
+            _events.finished(operation, std::move(answer));
+        } else {
+            begin(std::move(operation));
         }
-        const auto deadline = operation.deadline > 0ms ? operation.deadline : _settings.deadline;
-        if (auto* perform = std::get_if<protocol::Perform>(&operation.order)) {
-            perform->milliseconds = static_cast<std::uint64_t>(deadline.count());
-        }
-        if (!_worker->send(protocol::frameOf(std::exchange(operation.order, {})))) {
-            _events.finished(operation,
-                             Unserved{Unserved::Reason::tooLarge, "The request is too large to be passed on."});
-            continue;
-        }
-        operation.record->state = RequestRecord::State::running;
-        operation.record->since = std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now());
-        operation.record->start = Clock::now();
-        _due = operation.record->start + deadline + overrunGrace;
-        _running = std::move(operation);
-        _state = State::busy;
     }
+}
+
+void OperationQueue::begin(Operation operation) {
+    const auto now = Clock::now();
+    if (!operation.until) {
+        operation.until = now + (operation.deadline > 0ms ? operation.deadline : _settings.deadline);
+    }
+    if (auto* perform = std::get_if<protocol::Perform>(&operation.order)) {
+        const auto left = std::chrono::ceil<std::chrono::milliseconds>(*operation.until - now);
+        perform->milliseconds = static_cast<std::uint64_t>(left.count());
+    }
+    // A change may have to be sent again.
+    auto frame = protocol::frameOf(operation.changes ? operation.order : std::exchange(operation.order, {}));
+    if (!_worker->send(std::move(frame))) {
+        _events.finished(operation, Unserved{Unserved::Reason::tooLarge, "The request is too large to be passed on."});
+        return;
+    }
+    operation.record->state = RequestRecord::State::running;
+    operation.record->since = std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now());
+    operation.record->start = now;
+    _due = *operation.until + overrunGrace;
+    _running = std::move(operation);
+    _state = State::busy;
+}
+
+void OperationQueue::waitForLock(protocol::Answer answer) {
+    Operation operation = *std::exchange(_running, std::nullopt);
+    operation.record->state = RequestRecord::State::waiting;
+    operation.locked = std::move(answer);
+    _changesFrom = std::min(Clock::now() + lockPause, *operation.until);
+    _waiting.push_front(std::move(operation));
 }
 
 void OperationQueue::finish(Ending ending) {
@@ -254,7 +293,9 @@ void OperationQueue::stop(std::chrono::milliseconds bound) {
     _stopping = true;
     failWaiting(Unserved::Reason::stopping, "The daemon is being stopped.");
     if (_state == State::busy) {
-        _due = std::min(*_due, Clock::now() + bound);
+        if (!_running->changes) {
+            _due = std::min(*_due, Clock::now() + bound);
+        }
     } else {
         _due.reset();
     }

@@ -1,6 +1,7 @@
 #pragma once
 
-// The queue of operations and the worker that runs them: one at a time, in the order of their arrival.
+// The queue of operations and the worker that runs them: one at a time, in the order of their arrival. Only while
+// another process holds the lock for changes (WriteLock.h) does what reads overtake what changes.
 //
 // A worker that crashes, overruns the deadline or breaks the protocol costs the operation that it was running; the next
 // worker runs the others. One that does not even start costs all that are waiting, and is started again after a pause
@@ -25,8 +26,12 @@ namespace adminhost {
 struct Operation {
     Exchange* exchange;
     std::shared_ptr<RequestRecord> record;
-    protocol::ToWorker order;              ///< without the time that is left
-    std::chrono::milliseconds deadline{};  ///< its own; zero: the queue's
+    protocol::ToWorker order = {};                ///< without the time that is left
+    std::chrono::milliseconds deadline = {};      ///< its own; zero: the queue's
+    bool changes = false;                         ///< the worker runs it only while it holds the lock for changes
+    std::optional<protocol::Answer> locked = {};  ///< of the last worker that did not get the lock
+    /// The end of its time, from its first start on.
+    std::optional<std::chrono::steady_clock::time_point> until = {};
 };
 
 /// Why an operation ended without an answer of a worker.
@@ -72,7 +77,8 @@ class OperationQueue {
     /// Whether the first worker has said hello, or could not.
     [[nodiscard]] bool settled() const noexcept { return _settled; }
 
-    /// Ends what is waiting; the running operation has the time of the bound. Then no worker is started any more.
+    /// Ends what is waiting. A running operation that changes something has its whole time: half of a change is worse
+    /// than a late end. Another one has the time of the bound. Then no worker is started any more.
     void stop(std::chrono::milliseconds bound);
     [[nodiscard]] bool stopped() const noexcept { return _stopping && !_running; }
 
@@ -99,6 +105,11 @@ class OperationQueue {
     void workerEnded(const std::string& how);
     void timeUp();
     void next();
+    /// The first operation that may run now, or the end: while another process holds the lock for changes, a change and
+    /// those behind it wait, and what only reads goes on.
+    [[nodiscard]] std::deque<Operation>::iterator nextToRun();
+    void begin(Operation operation);
+    void waitForLock(protocol::Answer answer);
     void finish(Ending ending);
     void failWaiting(Unserved::Reason reason, const std::string& message);
 
@@ -109,7 +120,8 @@ class OperationQueue {
     std::vector<std::unique_ptr<WorkerProcess>> _dying;  ///< killed, but the kernel has not ended them yet
     std::deque<Operation> _waiting;
     std::optional<Operation> _running;
-    std::optional<Clock::time_point> _due;  ///< when timeUp() has to act
+    std::optional<Clock::time_point> _changesFrom;  ///< when the lock for changes is to be tried again
+    std::optional<Clock::time_point> _due;          ///< when timeUp() has to act
     std::chrono::milliseconds _pause{0};
     std::string _startProblem;
     unsigned long _starts = 0;  ///< distinguishes one worker from the next

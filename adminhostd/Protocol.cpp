@@ -106,7 +106,7 @@ struct Word {
 constexpr Word<Outcome> outcomeWords[] = {
     {Outcome::nothing, "nothing"}, {Outcome::answered, "answered"}, {Outcome::error, "error"},
     {Outcome::refused, "refused"}, {Outcome::conflict, "conflict"}, {Outcome::overrun, "overrun"},
-    {Outcome::broken, "broken"},
+    {Outcome::locked, "locked"},   {Outcome::broken, "broken"},
 };
 constexpr Word<BodyForm> formWords[] = {{BodyForm::json, "json"}, {BodyForm::propertyList, "propertyList"}};
 constexpr Word<Access> accessWords[] = {

@@ -34,6 +34,7 @@ enum class Outcome {
     refused,   ///< findings, never empty: the plug-in's check refuses the request
     conflict,  ///< none of the revisions holds
     overrun,   ///< the deadline passed
+    locked,    ///< message: another process holds the lock for changes; nothing was done
     broken,    ///< message: the worker could not do it
 };
 

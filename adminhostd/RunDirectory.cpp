@@ -17,7 +17,8 @@ std::string socketPath(const Options& options) {
 }
 
 std::string privateParent(const Options& options) {
-    return options.socket ? std::filesystem::temp_directory_path().string() : diskPath(options.runDirectory).text();
+    return options.socket ? std::filesystem::absolute(options.socket->text()).parent_path().string()
+                          : diskPath(options.runDirectory).text();
 }
 
 }  // namespace adminhost

@@ -1,5 +1,7 @@
 #include "adminhostd/ToolConfiguration.h"
 
+#include "adminhostd/PrivateDirectory.h"
+
 #include <cerrno>
 #include <cstdlib>
 #include <filesystem>
@@ -20,10 +22,8 @@ constexpr const char* startFile =
 
 }  // namespace
 
-ToolConfiguration::ToolConfiguration(const std::string& parent) : _directory(parent + "/adminhostd.XXXXXX") {
-    if (::mkdtemp(_directory.data()) == nullptr) {
-        throw std::system_error(errno, std::generic_category(), "cannot make a private directory in " + parent);
-    }
+ToolConfiguration::ToolConfiguration(const std::string& parent) {
+    _held = createPrivateDirectory(parent, _directory);
     const std::string place = _directory + "/sqlite3";
     std::ofstream file;
     if (::mkdir(place.c_str(), 0700) == 0) {

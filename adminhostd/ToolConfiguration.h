@@ -2,6 +2,8 @@
 
 // Settings for the tools that the worker runs.
 
+#include "platform/files/FileDescriptor.h"
+
 #include <string>
 
 namespace adminhost {
@@ -21,6 +23,7 @@ class ToolConfiguration {
 
   private:
     std::string _directory;
+    FileDescriptor _held;
 };
 
 }  // namespace adminhost

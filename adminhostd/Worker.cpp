@@ -4,8 +4,10 @@
 #include "adminhostd/PluginCall.h"
 #include "adminhostd/PluginFile.h"
 #include "adminhostd/PluginTrial.h"
+#include "adminhostd/PrivateDirectory.h"
 #include "adminhostd/Protocol.h"
 #include "adminhostd/SettingsHistory.h"
+#include "adminhostd/WriteLock.h"
 #include "platform/directory/Entries.h"
 #include "platform/directory/LocalAccounts.h"
 #include "platform/files/Path.h"
@@ -28,6 +30,7 @@
 
 #include <fmt/format.h>
 #include <malloc.h>
+#include <poll.h>
 #include <unistd.h>
 
 namespace adminhost {
@@ -85,12 +88,13 @@ class Worker {
     std::optional<int> serve(protocol::ToWorker message);
     protocol::Hello configure(const protocol::Configure& configuration);
     void load(const DiskPath& file, protocol::Hello& hello);
-    void removeLeftovers() const;
+    /// Once, and only by a worker that holds the lock for changes: what looks left over may be what another is writing.
+    void removeLeftovers();
 
     protocol::Answer answer(const protocol::Perform& order);
     protocol::Answer answer(const protocol::FindAccounts& order);
     protocol::Answer answer(const protocol::ReadHistory& order);
-    static protocol::Answer perform(const LoadedPlugin& loaded, const protocol::Perform& order);
+    protocol::Answer perform(const LoadedPlugin& loaded, const protocol::Perform& order);
     [[nodiscard]] const LoadedPlugin* pluginNamed(std::string_view name) const;
 
     int _descriptor;
@@ -98,6 +102,8 @@ class Worker {
     FrameReader _reader;
     std::vector<std::string> _languages;
     std::vector<LoadedPlugin> _plugins;
+    FileDescriptor _toolConfiguration;  ///< open: the directory stays if the front is killed and another one starts
+    bool _leftoversRemoved = false;
     bool _returnMemory = false;  ///< a large message has been freed
 };
 
@@ -106,6 +112,19 @@ protocol::Answer broken(std::string message) {
     answer.outcome = Outcome::broken;
     answer.message = std::move(message);
     return answer;
+}
+
+/// Whether a command changes something. One that the plug-in does not name is not known to only read.
+bool changes(const LoadedPlugin& loaded, const std::string& name) {
+    const auto command = std::find_if(loaded.commands.begin(), loaded.commands.end(),
+                                      [&](const Command& one) { return one.name == name; });
+    return command == loaded.commands.end() || command->access != Access::read;
+}
+
+/// Whether the other end of a conversation has been closed.
+bool isClosed(int descriptor) {
+    pollfd entry{descriptor, POLLRDHUP, 0};
+    return ::poll(&entry, 1, 0) > 0;
 }
 
 protocol::Answer notLoaded(const std::string& plugin) {
@@ -169,6 +188,10 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
         setDirectoryNodes({localAccounts(HostPath(configuration.accountUuids))});
     }
     setTaskEnvironment(configuration.toolEnvironment);
+    if (const auto found = configuration.toolEnvironment.find("XDG_CONFIG_HOME");
+        found != configuration.toolEnvironment.end()) {
+        _toolConfiguration = holdDirectory(found->second);
+    }
 
     protocol::Hello hello;
     const std::vector<DiskPath> files(configuration.plugins.begin(), configuration.plugins.end());
@@ -187,7 +210,10 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
 }
 
 /// Of workers that were killed in the middle of a write.
-void Worker::removeLeftovers() const {
+void Worker::removeLeftovers() {
+    if (std::exchange(_leftoversRemoved, true)) {
+        return;
+    }
     for (const LoadedPlugin& loaded : _plugins) {
         const auto files = callPlugin([&] { return loaded.plugin->settingsFiles(); });
         const auto others = callPlugin([&] { return loaded.plugin->leftovers(); });
@@ -224,6 +250,21 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
         answer.outcome = Outcome::refused;
         answer.findings = *std::move(findings);
         return answer;
+    }
+    std::optional<WriteLock::Held> held;
+    if (changes(loaded, order.command)) {
+        auto lock = WriteLock::tryToHold();
+        if (!lock) {
+            answer.outcome = lock.error().domain == WriteLock::busy ? Outcome::locked : Outcome::broken;
+            answer.message = textOf(lock.error().description);
+            return answer;
+        }
+        held.emplace(*std::move(lock));
+        // A worker that was stopped may have slept through the end of its front, and later writes of another worker.
+        if (isClosed(_descriptor)) {
+            return broken("The daemon that sent the request has ended.");
+        }
+        removeLeftovers();
     }
     const auto deadline = Clock::now() + std::chrono::milliseconds(order.milliseconds);
     setTaskDeadline(deadline);
@@ -330,8 +371,11 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
             return 1;
         }
         if (!configuration->tryOnly) {
-            // Only now: a shared file system that hangs may hold up requests, but not the start.
-            removeLeftovers();
+            // Only now: a shared file system that hangs may hold up requests, but not the start. If another process
+            // holds the lock, the first write does it.
+            if (const auto lock = WriteLock::tryToHold()) {
+                removeLeftovers();
+            }
         }
         return std::nullopt;
     }

@@ -1,5 +1,6 @@
 #include "tests/support/DaemonProcess.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
@@ -55,6 +56,15 @@ DaemonProcess::DaemonProcess(const Options& options) {
     environment.push_back("TMPDIR=" + (_directory / "tmp").string());
     for (char** variable = environ; *variable != nullptr; ++variable) {
         environment.emplace_back(*variable);  // of two the first counts
+    }
+    if (std::find(arguments.begin(), arguments.end(), "--root") == arguments.end()) {
+        // Nothing of this machine, except for the database tool.
+        std::filesystem::create_directories(_directory / "root/etc");
+        std::ofstream(_directory / "root/etc/passwd") << "root:x:0:0::/root:/bin/sh\n";
+        std::ofstream(_directory / "root/etc/group") << "root:x:0:\n";
+        std::filesystem::create_directories(_directory / "root/usr/bin");
+        std::filesystem::create_symlink("/usr/bin/sqlite3", _directory / "root/usr/bin/sqlite3");
+        arguments.insert(arguments.end(), {"--root", _directory / "root"});
     }
     posix_spawn_file_actions_t actions;
     ::posix_spawn_file_actions_init(&actions);

@@ -18,7 +18,8 @@ namespace adminhost::test {
 class DaemonProcess {
   public:
     struct Options {
-        std::vector<std::string> arguments = {};    ///< beside --socket, --config and --log stderr
+        /// Beside --socket, --config, --log stderr and, if there is none, a --root of its own.
+        std::vector<std::string> arguments = {};
         std::string configuration = {};             ///< text of the configuration file
         std::vector<std::string> environment = {};  ///< "NAME=value", beside the test's own
         bool waitUntilReady = true;                 ///< until it answers its first request

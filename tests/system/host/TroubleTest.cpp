@@ -281,6 +281,15 @@ TEST(Clients, AccountThatIsNeitherRootNorTheDaemonsIsNotPermitted) {
     expectError(daemon.connect().get("/v1/requests/" + id), 404, "UNKNOWN_REQUEST");
 }
 
+/// How many private directories are in a directory.
+int privateDirectories(const std::filesystem::path& directory) {
+    int count = 0;
+    for (const auto& entry : std::filesystem::directory_iterator(directory)) {
+        count += entry.is_directory() && entry.path().filename().string().starts_with("adminhostd.") ? 1 : 0;
+    }
+    return count;
+}
+
 TEST(End, FinishesTheRunningRequestAnswersTheWaitingAndExitsWithZero) {
     DaemonProcess daemon(withFixture());
     const pid_t worker = daemon.workerPid();
@@ -295,6 +304,7 @@ TEST(End, FinishesTheRunningRequestAnswersTheWaitingAndExitsWithZero) {
     EXPECT_EQ(daemon.wait(), 0);
     EXPECT_TRUE(eventually([&] { return ::kill(worker, 0) != 0; })) << "the worker ends with its front";
     EXPECT_TRUE(std::filesystem::is_empty(daemon.directory() / "tmp"));
+    EXPECT_EQ(privateDirectories(daemon.directory()), 0);
 }
 
 TEST(End, SignalToTheWorkerTooLetsTheRunningRequestFinish) {
@@ -307,7 +317,63 @@ TEST(End, SignalToTheWorkerTooLetsTheRunningRequestFinish) {
     EXPECT_EQ(daemon.wait(), 0);
 }
 
-TEST(End, RunningRequestHasTenSecondsAtMost) {
+TEST(End, RunningWriteHasItsWholeTimeAndIsAnswered) {
+    DaemonProcess daemon(withFixture());
+    const std::string begun = daemon.directory() / "begun";
+    const std::string data = daemon.directory() / "data";
+    UnixHttp writer(daemon.socket(), std::chrono::seconds(60));
+    writer.begin("POST", "/v1/fixture/runWrite",
+                 "{\"script\": \"touch " + begun + "; sleep 13; echo whole > " + data + "\"}");
+    ASSERT_TRUE(eventually([&] { return std::filesystem::exists(begun); }));
+    daemon.signal(SIGTERM);
+    EXPECT_EQ(writer.reply().status, 200);
+    EXPECT_EQ(daemon.wait(), 0);
+    std::ifstream file(data);
+    EXPECT_EQ(std::string(std::istreambuf_iterator<char>(file), {}), "whole\n");
+}
+
+TEST(End, RunningWriteIsEndedAtItsDeadline) {
+    DaemonProcess daemon(withFixture("request_deadline_seconds = 1\n"));
+    const std::string begun = daemon.directory() / "begun";
+    UnixHttp writer = daemon.connect();
+    writer.begin("POST", "/v1/fixture/runWrite", "{\"script\": \"touch " + begun + "; sleep 300\"}");
+    ASSERT_TRUE(eventually([&] { return std::filesystem::exists(begun); }));
+    daemon.signal(SIGTERM);
+    expectError(writer.reply(), 504, "DEADLINE_EXCEEDED");
+    EXPECT_EQ(daemon.wait(), 0);
+}
+
+TEST(End, HangupLeavesNothingBehind) {
+    DaemonProcess daemon(withFixture());
+    const pid_t worker = daemon.workerPid();
+    daemon.signal(SIGHUP);
+    EXPECT_EQ(daemon.wait(), 0);
+    EXPECT_TRUE(eventually([&] { return ::kill(worker, 0) != 0; }));
+    EXPECT_FALSE(std::filesystem::exists(daemon.socket()));
+    EXPECT_EQ(privateDirectories(daemon.directory()), 0);
+}
+
+TEST(End, PrivateDirectoryOfAKilledDaemonGoesAtTheNextStart) {
+    DaemonProcess daemon(withFixture());
+    EXPECT_EQ(privateDirectories(daemon.directory()), 1);
+    daemon.signal(SIGKILL);
+    EXPECT_EQ(daemon.wait(), 128 + SIGKILL);
+    EXPECT_EQ(privateDirectories(daemon.directory()), 1);
+    auto options = withFixture();
+    options.socket = daemon.socket();
+    {
+        const DaemonProcess next(options);
+        // The old worker ends by itself; until then it may need the directory.
+        EXPECT_LE(privateDirectories(daemon.directory()), 2);
+    }
+    ASSERT_TRUE(eventually([&] {
+        const DaemonProcess last(options);
+        return privateDirectories(daemon.directory()) == 1;
+    }));
+    EXPECT_TRUE(std::filesystem::is_empty(daemon.directory() / "tmp"));
+}
+
+TEST(End, RunningRequestThatOnlyReadsHasTenSecondsAtMost) {
     DaemonProcess daemon(withFixture());
     UnixHttp sleeper = startSleeping(daemon, 60'000);
     daemon.signal(SIGTERM);
