@@ -108,7 +108,8 @@ DaemonReply Connection::send(const std::string& path, const std::string* body, c
         long number = 0;
         curl_easy_getinfo(_transfer->get(), CURLINFO_OS_ERRNO, &number);
         if (result == CURLE_COULDNT_CONNECT && (number == EACCES || number == EPERM)) {
-            throw Failure(ExitStatus::notPermitted, "you may not talk to the daemon at " + _socketPath);
+            throw Failure(ExitStatus::notPermitted, "permission denied by the daemon's socket " + _socketPath +
+                                                        "; its group and root may use it");
         }
         const std::string why = result == CURLE_COULDNT_CONNECT && number != 0 ? std::strerror(static_cast<int>(number))
                                                                                : curl_easy_strerror(result);

@@ -108,7 +108,7 @@ Value DaemonClient::get(const std::string& path) {
     Error error;
     auto value = parseJson(answer.body, &error);
     if (!value) {
-        throw Failure(ExitStatus::answeredError, "the daemon's answer cannot be read: " + textOf(error));
+        throw Failure(ExitStatus::failed, "the daemon's answer cannot be read: " + textOf(error));
     }
     return std::move(*value);
 }
@@ -118,7 +118,7 @@ void DaemonClient::fail(const DaemonReply& reply) {
     if (reply.status == statusInternal && !reply.requestId.empty()) {
         message += logText(report(reply.requestId).log);
     }
-    throw Failure(reply.status == statusForbidden ? ExitStatus::notPermitted : ExitStatus::answeredError, message);
+    throw Failure(reply.status == statusForbidden ? ExitStatus::notPermitted : ExitStatus::failed, message);
 }
 
 Value DaemonClient::overview() {
@@ -170,7 +170,7 @@ CommandRef DaemonClient::command(const std::string& name) {
         return found.front();
     }
     if (plugins().empty()) {
-        throw Failure(ExitStatus::answeredError, "the daemon has loaded no plug-in; its log says why");
+        throw Failure(ExitStatus::failed, "the daemon has loaded no plug-in; its log says why");
     }
     if (found.empty()) {
         throw usageError("command not found: " + name + "; the commands are " + joined(plugins()));
@@ -215,14 +215,14 @@ CommandAnswer DaemonClient::ask(const CommandRef& command, const Dictionary& req
     }
     if (reply.status != statusOk) {
         if (command.description.changes() && (reply.status == statusInternal || reply.status == statusTimeout)) {
-            throw LostAnswer(ExitStatus::answeredError, messageOf(reply), id);
+            throw LostAnswer(ExitStatus::failed, messageOf(reply), id);
         }
         fail(reply);
     }
     Error error;
     auto value = parseJson(reply.body, &error);
     if (!value) {
-        throw Failure(ExitStatus::answeredError, "the answer cannot be read: " + textOf(error));
+        throw Failure(ExitStatus::failed, "the answer cannot be read: " + textOf(error));
     }
     return {std::move(value), id, reply.revision, reply.notDone};
 }

@@ -1,6 +1,6 @@
 #pragma once
 
-// The daemon, as the verbs use it: its plug-ins and commands, what they answer, and what became of a request.
+// The daemon, as the verbs use it: its plug-ins and commands, their answers, and what became of a request.
 
 #include "adminhostctl/Connection.h"
 #include "adminhostctl/Description.h"
@@ -74,9 +74,9 @@ class LostAnswer : public Failure {
     std::string _requestId;
 };
 
-/// What a command answered, and the request that it answered to.
+/// The answer of a command.
 struct CommandAnswer {
-    std::optional<Value> value;  ///< nothing for an answer of nothing
+    std::optional<Value> value;  ///< absent if the command returns nothing
     std::string requestId;
     std::string revision;  ///< of what was read; empty where the command has none
     bool notDone = false;  ///< parts of the request were not carried out: see report()
@@ -96,9 +96,9 @@ class DaemonClient {
     /// The command that reads, or writes, the state that a file can describe: state is "read" or "write". Throws
     /// Failure(usage) when no plug-in has one, or several have.
     [[nodiscard]] CommandRef stateCommand(std::string_view state);
-    /// The answer; its value is nothing for an answer of nothing. A request that gives a revision fails unless it is
-    /// still current. Throws Failure with the daemon's message, its findings and, after a failure inside the service,
-    /// the log lines of the request. Where the command changes something and its answer is missing: LostAnswer.
+    /// Sends the request once and returns the answer. A request that gives a revision fails unless it is still current.
+    /// Throws Failure with the daemon's message, its findings and, after a failure inside the service, the log lines of
+    /// the request. Where the command changes something and its answer is missing: LostAnswer.
     [[nodiscard]] CommandAnswer ask(const CommandRef& command, const Dictionary& request,
                                     const std::string& revision = {});
     /// What the daemon knows of a request now. A daemon that cannot be asked is a state, not a failure.
@@ -106,7 +106,7 @@ class DaemonClient {
     /// The same, waiting up to ten seconds for a request that is not done, and for a daemon that is not reachable.
     [[nodiscard]] RequestReport settledReport(const std::string& requestId);
 
-    /// What an address of the daemon answers. Throws as perform().
+    /// The JSON value at an address of the daemon. Throws Failure as ask() does.
     [[nodiscard]] Value get(const std::string& path);
 
   private:
@@ -116,7 +116,7 @@ class DaemonClient {
     std::optional<std::vector<PluginInfo>> _plugins;
 };
 
-/// What the answer says of a failure: the keys that the description lists under its errors, unless they are null or the
+/// The failure in an answer: the keys that the description lists under its errors, unless they are null or the
 /// number 0. One sentence; empty when there is no error.
 [[nodiscard]] std::string errorOf(const Description& command, const Dictionary& answer);
 

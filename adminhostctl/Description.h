@@ -24,7 +24,7 @@ struct DescribedKey {
     bool secret = false;
     bool required = false;
     // Of a list's element that is a person or a group.
-    std::vector<std::string> title;  ///< keys of the element; the first that has a text stands for it
+    std::vector<std::string> title;  ///< keys of the element; the first with a text is shown for it
     std::string kind;                ///< key of the element that holds "user", "group", ...
     // What a state that can be written consists of; empty where it does not apply.
     std::string section;               ///< table of a file: of plain values, of a list's elements

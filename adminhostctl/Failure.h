@@ -1,6 +1,6 @@
 #pragma once
 
-// How the command line ends when something does not work out.
+// Failures of the command line, and its exit statuses.
 
 #include <stdexcept>
 #include <string>
@@ -9,9 +9,9 @@ namespace adminhost::ctl {
 
 enum class ExitStatus : int {
     done = 0,
-    answeredError = 1,  ///< the service answered an error
+    failed = 1,  ///< the service returned an error, or something was not applied
     usage = 2,
-    notReachable = 3,  ///< no daemon behind the socket
+    notReachable = 3,  ///< no daemon at the socket
     notPermitted = 4,
     undetermined = 6,  ///< the answer to a write is missing, and whether everything was written cannot be determined
 };

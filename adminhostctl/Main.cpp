@@ -129,12 +129,12 @@ int runMain(int count, char** words) {
 int main(int count, char** words) {
     // Without this a password could be read from the connection's own socket.
     if (!adminhost::openStandardDescriptors()) {
-        return statusOf(ExitStatus::answeredError);
+        return statusOf(ExitStatus::failed);
     }
     try {
         return runMain(count, words);
     } catch (const std::exception& error) {
         std::cerr << "adminhostctl: " << adminhost::ctl::shown(error.what()) << '\n';
-        return statusOf(ExitStatus::answeredError);
+        return statusOf(ExitStatus::failed);
     }
 }

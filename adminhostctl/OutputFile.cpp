@@ -36,7 +36,7 @@ void writeOutput(const std::string& path, std::string_view bytes) {
         file << bytes;
         file.close();
         if (!file) {
-            throw usageError(path + " cannot be written");
+            throw usageError(path + ": cannot be written");
         }
     } else if (const auto error = replaceFile(bytes, placeOf(path), ownersOnly)) {
         throw usageError(error->description.value_or(path + " cannot be written"));

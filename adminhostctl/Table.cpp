@@ -48,7 +48,7 @@ void Table::addRow(std::vector<std::string> cells) {
     _rows.push_back(std::move(cells));
 }
 
-/// Narrows the widest columns until all fit; answers whether they do.
+/// Narrows the widest columns until all fit; returns true if they do.
 bool Table::narrow(std::vector<Column>& columns, std::size_t width, std::size_t indent) {
     const std::size_t gaps = columns.empty() ? 0 : gap * (columns.size() - 1);
     std::size_t total = std::accumulate(columns.begin(), columns.end(), indent + gaps,

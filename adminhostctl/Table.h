@@ -16,7 +16,7 @@ class Table {
   public:
     explicit Table(std::vector<std::string> headings);
 
-    /// One cell for each heading; texts as shown() answers them.
+    /// One cell for each heading; texts as shown() returns them.
     void addRow(std::vector<std::string> cells);
     /// Every line ends in a line feed and begins with so many blanks. Columns that are empty in all rows are left out.
     [[nodiscard]] std::string text(std::size_t width, std::size_t indent) const;

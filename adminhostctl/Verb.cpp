@@ -48,7 +48,7 @@ ExitStatus perform(const Context& context, Words words) {
         answer = context.service.ask(command, request);
     } catch (const LostAnswer& lost) {
         const RequestReport report = reportLost(context, lost);
-        return report.state == RequestReport::State::done ? ExitStatus::answeredError : ExitStatus::undetermined;
+        return report.state == RequestReport::State::done ? ExitStatus::failed : ExitStatus::undetermined;
     }
     ExitStatus status = ExitStatus::done;
     if (!answer.value) {
@@ -59,7 +59,7 @@ ExitStatus perform(const Context& context, Words words) {
         status = reportAnswered(context, dictionary != nullptr ? errorOf(command.description, *dictionary) : "");
     }
     if (answer.notDone) {
-        status = ExitStatus::answeredError;
+        status = ExitStatus::failed;
         printNotDone(context, context.service.report(answer.requestId));
     }
     return status;
@@ -87,8 +87,7 @@ void writeValue(const Context& context, const Value& value, const Description& d
             Error error;
             const auto text = xmlPropertyList(value, &error);
             if (!text) {
-                throw Failure(ExitStatus::answeredError,
-                              "the answer cannot be written as a property list: " + textOf(error));
+                throw Failure(ExitStatus::failed, "the answer cannot be written as a property list: " + textOf(error));
             }
             context.out << shownXml(*text);
             break;
@@ -101,7 +100,7 @@ ExitStatus reportAnswered(const Context& context, const std::string& error) {
         return ExitStatus::done;
     }
     context.err << "adminhostctl: the service returned an error: " << error << '\n';
-    return ExitStatus::answeredError;
+    return ExitStatus::failed;
 }
 
 std::string gapText(const ReportedGap& gap) {

@@ -2,6 +2,7 @@
 
 #include "platform/directory/Entries.h"
 #include "platform/directory/Membership.h"
+#include "platform/framework/Report.h"
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
 #include "platform/value/ValueText.h"
@@ -106,6 +107,8 @@ std::vector<std::string> Resource::uuidsIn(const std::optional<std::vector<Dicti
                                            const std::optional<Error>& error) {
     if (!rows) {
         adminhost::logEvent("getUserAndGroupACLs SQL query returned error: " + textOf(error));
+        // The answer shows an empty list: without a report a client would take it for one.
+        adminhost::reportNotDone({"", "an access list cannot be read", textOf(error)});
         return {};
     }
     std::vector<std::string> uuids;

@@ -24,7 +24,7 @@
 namespace adminhost::ctl {
 
 /// The file of a state. Its plan on that state has no change. What the file cannot carry (a secret, one of several
-/// elements of a name) is a comment. Throws Failure(answeredError) when the service did not list a section: the file
+/// elements of a name) is a comment. Throws Failure(failed) when the service did not list a section: the file
 /// would read as if all of its elements were gone.
 [[nodiscard]] std::string exportOf(const StateForm& form, const State& state);
 

@@ -15,6 +15,7 @@ using Words = std::span<const std::string>;
 
 /// What the file, and the password file, ask for.
 Wanted wantedOf(const Context& context, const std::string& file, const CurrentState& current) {
+    requireWhole(current);
     Wanted wanted = parseDesired(context.sources.read(file), file, current.form, current.state);
     if (!context.options.passwordFile.empty()) {
         if (current.form.secrets().size() != 1) {
@@ -50,7 +51,7 @@ ExitStatus settingsGet(const Context& context, Words arguments) {
     if (command.description.answerKey(form.root() + '.' + key) == nullptr) {
         throw usageError("setting not found: " + key + "; \"adminhostctl settings get\" lists them");
     }
-    throw Failure(ExitStatus::answeredError, key + " is not set");
+    throw Failure(ExitStatus::failed, key + " is not set");
 }
 
 ExitStatus settingsSet(const Context& context, Words arguments) {
@@ -76,6 +77,7 @@ ExitStatus settingsSet(const Context& context, Words arguments) {
 
 ExitStatus exportState(const Context& context, Words arguments) {
     const CurrentState current = readState(context);
+    requireWhole(current);
     const std::string text = exportOf(current.form, current.state);
     if (arguments.empty() || arguments.front() == "-") {
         context.out << text;
@@ -105,13 +107,13 @@ ExitStatus applyFile(const Context& context, Words arguments) {
 }
 
 constexpr std::array table = {
-    Verb{"settings get", "[KEY]", "The settings, or one of them", 0, 1, &settingsGet},
-    Verb{"settings set", "KEY [VALUE|@FILE|@-]", "PlannedChange a setting", 1, 2, &settingsSet},
-    Verb{"export", "[FILE]", "Write the settings, properties and access lists down as TOML", 0, 1, &exportState},
-    Verb{"plan", "FILE [--password-file FILE]", "What applying the file would change", 1, 1, &planFile},
-    Verb{"apply", "FILE [--password-file FILE]", "PlannedChange what differs from the file", 1, 1, &applyFile},
-    Verb{"history", "", "The latest writes of settings: when, who and what changed", 0, 0, &history},
-    Verb{"rollback", "NUMBER", "Restores the settings as they were before a write of the history", 1, 1, &rollback},
+    Verb{"settings get", "[KEY]", "Show the settings, or one of them", 0, 1, &settingsGet},
+    Verb{"settings set", "KEY [VALUE|@FILE|@-]", "Change a setting", 1, 2, &settingsSet},
+    Verb{"export", "[FILE]", "Write settings and lists to a TOML file", 0, 1, &exportState},
+    Verb{"plan", "FILE [--password-file FILE]", "Show what applying the file would change", 1, 1, &planFile},
+    Verb{"apply", "FILE [--password-file FILE]", "Change what differs from the file", 1, 1, &applyFile},
+    Verb{"history", "", "List the latest writes of settings: when, who and what changed", 0, 0, &history},
+    Verb{"rollback", "NUMBER", "Restore the settings as they were before a write", 1, 1, &rollback},
 };
 
 }  // namespace

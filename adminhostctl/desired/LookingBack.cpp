@@ -123,7 +123,7 @@ ExitStatus rollback(const Context& context, std::span<const std::string> argumen
                     << ": not set at that time; it cannot be removed and stays "
                     << settingText(current.state.settings.get(key)) << '\n';
     }
-    return status == ExitStatus::done && !staying.empty() ? ExitStatus::answeredError : status;
+    return status == ExitStatus::done && !staying.empty() ? ExitStatus::failed : status;
 }
 
 }  // namespace adminhost::ctl

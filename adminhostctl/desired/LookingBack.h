@@ -12,7 +12,7 @@ namespace adminhost::ctl {
 
 [[nodiscard]] ExitStatus history(const Context& context, std::span<const std::string> arguments);
 /// Writes the settings of an entry as every verb that changes something does it (Writing.h). What is set now and was
-/// not set then stays, and is named with answeredError; a password stays too, and is said.
+/// not set then stays, and is named with failed; a password stays too, and is said.
 [[nodiscard]] ExitStatus rollback(const Context& context, std::span<const std::string> arguments);
 
 }  // namespace adminhost::ctl

@@ -37,10 +37,10 @@ struct Wanted {
 };
 
 struct PlannedChange {
-    std::string entry;     ///< "settings.server_port", "cameras.\"Main hall\".users.anna"
+    std::string entry;     ///< "SECTION.KEY", "SECTION.\"Main hall\".LIST.anna"
     std::string from;      ///< as TOML writes it, or words in parentheses; "(secret)" for every secret
     std::string to;        ///< the same
-    std::string keyPath;   ///< where in the request it is: "configuration.cameras.0"
+    std::string keyPath;   ///< where in the request it is: "ROOT.LIST.0"
     bool hidden = false;   ///< reading does not show whether it was applied
     std::string identity;  ///< of the element
     std::string key;       ///< of the setting, or of the element
@@ -78,7 +78,7 @@ struct PlanOutcome {
 };
 
 /// What became of the plan's changes. `after` is what reading shows afterwards, nothing when it cannot be read.
-/// `answered` says that the writing command answered without an error. Reading decides; the daemon's report of what was
+/// `answered`: the writing command returned no error. Reading decides; the daemon's report of what was
 /// not carried out decides on what reading does not show.
 [[nodiscard]] PlanOutcome outcomeOf(const StateForm& form, const Wanted& wanted, const Plan& plan, const State& before,
                                     const std::optional<State>& after, bool answered, const RequestReport& report);

@@ -80,7 +80,7 @@ bool isSecret(const FieldForm& field, const Element& element) {
 const std::vector<Element>& elementsOf(const State& state, const ListForm& list) {
     const auto found = state.lists.find(list.section);
     if (found == state.lists.end()) {
-        throw Failure(ExitStatus::answeredError,
+        throw Failure(ExitStatus::failed,
                       "the service does not list its " + list.section + ": its database is missing or cannot be read");
     }
     return found->second;

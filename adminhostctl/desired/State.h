@@ -1,6 +1,6 @@
 #pragma once
 
-// A state as the service answers it, in the form that changes are derived from.
+// A state as the service returns it, in the form that changes are derived from.
 
 #include "adminhostctl/desired/StateForm.h"
 #include "platform/value/Value.h"
@@ -40,11 +40,11 @@ struct State {
 /// Whether the text of the field is a secret of this element.
 [[nodiscard]] bool isSecret(const FieldForm& field, const Element& element);
 
-/// The elements of a section. Throws Failure(answeredError) when the service listed none.
+/// The elements of a section. Throws Failure(failed) when the service listed none.
 [[nodiscard]] const std::vector<Element>& elementsOf(const State& state, const ListForm& list);
 
 /// The element with the identity, in any case (where people may use it), or else with the label; null if there is none.
-/// Throws Failure: several have the label (usage), the section is not listed (answeredError).
+/// Throws Failure: several have the label (usage), the section is not listed (failed).
 [[nodiscard]] const Element* findElement(const State& state, const ListForm& list, const std::string& name);
 
 }  // namespace adminhost::ctl

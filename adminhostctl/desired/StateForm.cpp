@@ -40,7 +40,7 @@ StateForm::StateForm(const Description& write) : _command(write.name()) {
         }
     }
     if (_root.empty()) {
-        throw Failure(ExitStatus::answeredError, _command + " does not describe which of its keys are settings");
+        throw Failure(ExitStatus::failed, _command + " does not describe which of its keys are settings");
     }
     for (const DescribedKey& key : write.keys()) {
         if (!key.file.empty() && !keyBelow(key.path, _root).empty()) {
@@ -87,7 +87,7 @@ const DescribedKey* StateForm::secret(std::string_view name) const noexcept {
 const ListForm& StateForm::list(std::string_view section) const {
     const ListForm* found = findIn(_lists, [&](const ListForm& list) { return list.section == section; });
     if (found == nullptr) {
-        throw Failure(ExitStatus::answeredError, _command + " does not describe a section " + std::string(section));
+        throw Failure(ExitStatus::failed, _command + " does not describe a section " + std::string(section));
     }
     return *found;
 }

@@ -52,10 +52,10 @@ struct ListForm {
 
 class StateForm {
   public:
-    /// Throws Failure(answeredError) when the description names no section of plain values.
+    /// Throws Failure(failed) when the description names no section of plain values.
     explicit StateForm(const Description& write);
 
-    /// The key of request and answer that holds the state: "configuration".
+    /// The key of request and answer that holds the state.
     [[nodiscard]] const std::string& root() const noexcept { return _root; }
     /// Name of the table of the plain values.
     [[nodiscard]] const std::string& settingsSection() const noexcept { return _settingsSection; }
@@ -70,7 +70,7 @@ class StateForm {
     /// The setting, or the secret one, of the name; null if there is none.
     [[nodiscard]] const DescribedKey* setting(std::string_view name) const noexcept;
     [[nodiscard]] const DescribedKey* secret(std::string_view name) const noexcept;
-    /// The list with the section's name; throws Failure(answeredError) if there is none.
+    /// The list with the section's name; throws Failure(failed) if there is none.
     [[nodiscard]] const ListForm& list(std::string_view section) const;
     /// Names of the switches that remove what a file does not list.
     [[nodiscard]] std::vector<std::string> switches() const;

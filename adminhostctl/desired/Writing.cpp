@@ -7,10 +7,10 @@
 namespace adminhost::ctl {
 namespace {
 
-/// The dictionary of an answer that has to be one.
+/// The dictionary of an answer. Throws Failure if it is something else.
 const Dictionary& dictionaryOf(const std::optional<Value>& answer) {
     if (!answer || answer->dictionary() == nullptr) {
-        throw Failure(ExitStatus::answeredError, "the service did not return a dictionary");
+        throw Failure(ExitStatus::failed, "the service did not return a dictionary");
     }
     return *answer->dictionary();
 }
@@ -98,8 +98,7 @@ class PlannedWrite {
         for (const std::string& line : report.log) {
             _context.err << "  " << shown(line) << '\n';
         }
-        return status == ExitStatus::done && outcome.failed.empty() ? ExitStatus::undetermined
-                                                                    : ExitStatus::answeredError;
+        return status == ExitStatus::done && outcome.failed.empty() ? ExitStatus::undetermined : ExitStatus::failed;
     }
 
   private:
@@ -127,7 +126,7 @@ class PlannedWrite {
         showFailed(_context.err, outcome.failed);
         showLines(_context.err, "it could not be determined whether these changes were applied:", outcome.undetermined);
         return !outcome.undetermined.empty()               ? ExitStatus::undetermined
-               : !outcome.failed.empty()                   ? ExitStatus::answeredError
+               : !outcome.failed.empty()                   ? ExitStatus::failed
                : lost.status() == ExitStatus::undetermined ? ExitStatus::done
                                                            : lost.status();
     }
@@ -147,17 +146,24 @@ CurrentState readState(const Context& context, const std::string& section) {
     const CommandAnswer answer = context.service.ask(command, command.description.partOf(section));
     const Dictionary* root = dictionaryOf(answer.value).get(form.root()).dictionary();
     if (root == nullptr) {
-        throw Failure(ExitStatus::answeredError, "the service did not return its " + form.root());
-    }
-    if (answer.notDone) {
-        std::string reasons;
-        for (const ReportedGap& gap : context.service.report(answer.requestId).notDone) {
-            reasons += "\n  " + gapText(gap);
-        }
-        throw Failure(ExitStatus::answeredError, "parts of the state could not be read:" + reasons);
+        throw Failure(ExitStatus::failed, "the service did not return its " + form.root());
     }
     State state = stateOf(form, *root);
-    return {std::move(form), std::move(state), answer.revision};
+    std::vector<ReportedGap> unread;
+    if (answer.notDone) {
+        unread = context.service.report(answer.requestId).notDone;
+    }
+    return {std::move(form), std::move(state), answer.revision, std::move(unread)};
+}
+
+void requireWhole(const CurrentState& current) {
+    std::string reasons;
+    for (const ReportedGap& gap : current.unread) {
+        reasons += "\n  " + gapText(gap);
+    }
+    if (!reasons.empty()) {
+        throw Failure(ExitStatus::failed, "parts of the state could not be read:" + reasons);
+    }
 }
 
 void showPlan(const Context& context, const Plan& plan) {

@@ -15,7 +15,7 @@ using Words = std::span<const std::string>;
 constexpr const char* cameras = "cameras";
 constexpr const char* properties = "properties";
 
-/// The list under the key of the command's answer. Throws Failure when the command answers an error.
+/// The list under the key of the command's answer. Throws Failure when the command returns an error.
 Array listOf(const Context& context, const CommandRef& command, const std::string& key) {
     const CommandAnswer answer = context.service.ask(command, {});
     const Dictionary* said = answer.value ? answer.value->dictionary() : nullptr;
@@ -24,7 +24,7 @@ Array listOf(const Context& context, const CommandRef& command, const std::strin
         error = key + " is missing";
     }
     if (!error.empty()) {
-        throw Failure(ExitStatus::answeredError, "the service returned an error: " + error);
+        throw Failure(ExitStatus::failed, "the service returned an error: " + error);
     }
     return *said->get(key).array();
 }
@@ -75,6 +75,7 @@ ExitStatus cameraShow(const Context& context, Words words) {
 /// Changes one camera, which has to be there.
 ExitStatus changeCamera(const Context& context, WantedElement camera) {
     const CurrentState current = readState(context);
+    requireWhole(current);
     if (findElement(current.state, current.form.list(cameras), camera.name) == nullptr) {
         throw notFound("camera", camera.name);
     }
@@ -156,13 +157,15 @@ ExitStatus propertyRemove(const Context& context, Words arguments) {
 }
 
 constexpr std::array table = {
-    Verb{"camera list", "[--names]", "The cameras and who may use them", 0, 0, &cameraList},
-    Verb{"camera show", "NAME|UUID", "Everything about one camera", 1, 1, &cameraShow},
-    Verb{"camera allow", "CAMERA NAME... [--group]", "Let users, or groups, use a camera", 2, 1000, &cameraAllow},
-    Verb{"camera deny", "CAMERA NAME... [--group]", "Take users and groups from a camera's list", 2, 1000, &cameraDeny},
-    Verb{"camera access", "CAMERA on|off", "Whether only those of its list may use a camera", 2, 2, &cameraAccess},
+    Verb{"camera list", "[--names]", "List the cameras and who may use them", 0, 0, &cameraList},
+    Verb{"camera show", "NAME|UUID", "Show everything about a camera", 1, 1, &cameraShow},
+    Verb{"camera allow", "CAMERA NAME... [--group]", "Allow users, or groups, to use a camera", 2, 1000, &cameraAllow},
+    Verb{"camera deny", "CAMERA NAME... [--group]", "Remove users and groups from a camera's list", 2, 1000,
+         &cameraDeny},
+    Verb{"camera access", "CAMERA on|off", "Restrict a camera to its list, or open it to everyone", 2, 2,
+         &cameraAccess},
     Verb{"camera remove", "CAMERA", "Remove a camera from the service", 1, 1, &cameraRemove},
-    Verb{"property list", "[--names]", "The workflow properties", 0, 0, &propertyList},
+    Verb{"property list", "[--names]", "List the workflow properties", 0, 0, &propertyList},
     Verb{"property set", "NAME [VALUE|@FILE|@-] [--protect|--no-protect]", "Add or change a property", 1, 2,
          &propertySet},
     Verb{"property remove", "NAME", "Remove a property", 1, 1, &propertyRemove},

@@ -166,6 +166,33 @@ TEST_F(Ctl, AnAnswerOfNothingIsDone) {
     EXPECT_EQ(run({"--format", "json", "nothing"}).out, "");
 }
 
+TEST_F(Ctl, NothingReachesTheTerminalThatItWouldActOn) {
+    const std::string acting = "\x1b[31m\xC2\x9B\xE2\x80\xAE";
+    for (const std::vector<std::string>& words : {std::vector<std::string>{acting},
+                                                  {"help", acting},
+                                                  {"echoTyped", acting},
+                                                  {"echoTyped", "count=" + acting},
+                                                  {"echoTyped", acting + "=1"},
+                                                  {"echoTyped", "name@" + acting},
+                                                  {"--" + acting},
+                                                  {"--format", acting},
+                                                  {"camera", acting},
+                                                  {"whois", acting},
+                                                  {"echoTyped", "--file", acting},
+                                                  {"rollback", acting}}) {
+        const Result result = run(words);
+        EXPECT_EQ(result.status, 2) << testing::PrintToString(words);
+        EXPECT_FALSE(result.err.empty());
+        for (const char* raw : {"\x1b", "\xC2\x9B", "\xE2\x80\xAE"}) {
+            EXPECT_THAT(result.err + result.out, Not(HasSubstr(raw))) << testing::PrintToString(words);
+        }
+    }
+    EXPECT_EQ(run({"--format", "json", "echoTyped", "name=" + acting}).out,
+              "{\n  \"name\": \"\\u001b[31m\\u009b\\u202e\"\n}\n");
+    EXPECT_THAT(run({"--format", "plist", "echoTyped", "name=\xC2\x9B\xE2\x80\xAE"}).out,
+                HasSubstr("<string>&#x9b;&#x202e;</string>"));
+}
+
 TEST_F(Ctl, AnUnknownCommandIsUsageAndTheKnownOnesAreListed) {
     const Result result = run({"ecoTyped"});
     EXPECT_EQ(result.status, 2);

@@ -176,7 +176,7 @@ TEST(Export, FailsWhenTheServiceDoesNotListASection) {
             (void)exported(root);
             ADD_FAILURE() << list;
         } catch (const Failure& failure) {
-            EXPECT_EQ(failure.status(), ExitStatus::answeredError);
+            EXPECT_EQ(failure.status(), ExitStatus::failed);
             EXPECT_THAT(failure.what(), HasSubstr(std::string("does not list its ") + list));
         }
     }
