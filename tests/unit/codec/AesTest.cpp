@@ -1,5 +1,6 @@
 #include "codec/LumioAESCategories.h"
 
+#include <algorithm>
 #include <deque>
 
 #include <gtest/gtest.h>
@@ -176,6 +177,56 @@ TEST(AesTransform, BadPaddingDoesNotDecrypt) {
         cipher[cipher.size() - 17] ^= 0x40U;
         EXPECT_EQ(aes128cbcDecryptDataWithKey(cipher, key), std::nullopt) << length;
     }
+}
+
+/// One block whose plain text is these sixteen bytes: no padding of its own.
+Data cipherOfLastBlock(const Data& block) {
+    // Encrypting pads by a block of its own; without it the text's last block is what the padding is read from.
+    Data cipher = *aes128cbcEncryptDataWithKey(block, key);
+    cipher.resize(16);
+    return cipher;
+}
+
+TEST(AesTransform, EveryLastBlockIsDecryptedExactlyWhenItsPaddingIsValid) {
+    for (unsigned last = 0; last < 256; ++last) {
+        // A whole padding of that length: only 1 to 16 are one.
+        Data block(16, 0xAB);
+        std::fill(block.end() - static_cast<std::ptrdiff_t>(std::min(last, 16U)), block.end(), last);
+        block.back() = static_cast<std::uint8_t>(last);
+        const auto text = aes128cbcDecryptDataWithKey(cipherOfLastBlock(block), key);
+        if (last >= 1 && last <= 16) {
+            EXPECT_EQ(text, Data(16 - last, 0xAB)) << last;
+        } else {
+            EXPECT_EQ(text, std::nullopt) << last;
+        }
+    }
+}
+
+TEST(AesTransform, PaddingOfUnequalBytesDoesNotDecrypt) {
+    for (unsigned last = 2; last <= 16; ++last) {
+        for (unsigned wrong = 2; wrong <= last; ++wrong) {
+            Data block(16, 0xAB);
+            std::fill(block.end() - static_cast<std::ptrdiff_t>(last), block.end(), last);
+            block[16 - wrong] ^= 0x01U;
+            EXPECT_EQ(aes128cbcDecryptDataWithKey(cipherOfLastBlock(block), key), std::nullopt)
+                << last << " bytes, byte " << wrong << " from the end changed";
+        }
+    }
+}
+
+TEST(AesTransform, BlockOfZerosIsNoPadding) {
+    EXPECT_EQ(aes128cbcDecryptDataWithKey(cipherOfLastBlock(Data(16, 0)), key), std::nullopt);
+}
+
+TEST(AesTransform, KeyOfTenBytesDoesNotDecryptWhatAGoodKeyEncrypted) {
+    const Data cipher = *aes128cbcEncryptDataWithKey(plain(20), key);
+    EXPECT_EQ(aes128cbcDecryptDataWithKey(cipher, Data(key.begin(), key.begin() + 10)), std::nullopt);
+    calls.clear();
+    EXPECT_EQ(cryptedData(adminhost::kCCDecrypt, cipher, Data(key.begin(), key.begin() + 10), initialisationVector(),
+                          countedCrypt),
+              std::nullopt);
+    ASSERT_EQ(calls.size(), 1U);
+    EXPECT_EQ(calls[0].status, adminhost::kCCParamError) << "the library refuses the key, not the padding";
 }
 
 TEST(AesTransform, ChangedBitNeverGivesTheTextBack) {

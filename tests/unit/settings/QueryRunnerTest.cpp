@@ -59,6 +59,13 @@ TEST(LineOutput, ColumnNameWithASpaceIsStoredUnderItsLastWord) {
     EXPECT_EQ(recordsOfLineOutput("full name = x\n"), (Records{{{"name", "x"}}}));
 }
 
+TEST(LineOutput, OnlyBlanksEndTheSearchForAKeysBeginning) {
+    // A tab is part of the key; so is everything before it up to the last blank.
+    EXPECT_EQ(recordsOfLineOutput("\tname = x\n  a\tb = y\n\t = z\n"),
+              (Records{{{"\tname", "x"}, {"a\tb", "y"}, {"\t", "z"}}}));
+    EXPECT_EQ(recordsOfLineOutput("name\t=\tx\n"), (Records{{{"name\t=\tx", "name\t=\tx"}}}));
+}
+
 TEST(LineOutput, LaterLineWithTheSameKeyReplacesTheValue) {
     EXPECT_EQ(recordsOfLineOutput("a = 1\na = 2\n"), (Records{{{"a", "2"}}}));
 }
@@ -178,6 +185,20 @@ TEST_F(QueryRunner, AMegabyteOnEachStreamIsCaptured) {
     EXPECT_EQ(run("x"), std::nullopt);
     EXPECT_EQ(error->code, 3);
     EXPECT_GE(error->description->size(), 1000000U);
+}
+
+TEST_F(QueryRunner, MissingDatabaseIsTheToolsFailureWithCode1) {
+    std::filesystem::remove(root.path(database));
+    EXPECT_EQ(run("select * from t"), std::nullopt);
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->domain, "sqliteQuery");
+    EXPECT_EQ(error->code, 1);
+    error.reset();
+    std::filesystem::remove_all(root.path(database).parent_path());
+    EXPECT_EQ(run("select * from t"), std::nullopt);
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->code, 1);
+    EXPECT_NE(error->description->find("unable to open database"), std::string::npos) << *error->description;
 }
 
 TEST_F(QueryRunner, CorruptDatabaseIsAnError) {
