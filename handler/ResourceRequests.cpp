@@ -88,7 +88,7 @@ Response LumioRequestHandler::getCamerasWithRequest(const Dictionary&) {
     Array list;
     list.reserve(cameras->size());
     for (const auto& camera : *cameras) {
-        list.emplace_back(*camera->dictionary());
+        list.emplace_back(*std::move(*camera).takeDictionary());
     }
     return listing("getCameras", "cameras", std::move(list));
 }

@@ -85,13 +85,14 @@ bool Resource::aclEnabled() {
 }
 
 void Resource::setACLEnabled(bool enabled) {
-    if (!guid()) {
+    const std::optional<std::string> uuid = statementGuid();
+    if (!uuid) {
         return;
     }
     std::optional<Error> error;
     (void)querySorvaneDatabase<Dictionary>(std::string("update ").append(resourceType()) +
                                                "s set access_control_enabled=\"" + (enabled ? "t" : "f") +
-                                               "\" where uuid=\"" + *guid() + "\"",
+                                               "\" where uuid=\"" + *uuid + "\"",
                                            error);
     if (!error) {
         _aclEnabled = enabled;
@@ -100,11 +101,12 @@ void Resource::setACLEnabled(bool enabled) {
 
 std::string Resource::accessListStatement() const {
     return "select record_uuid from access_control_entries where resource_type = '" + capitalised(resourceType()) +
-           "' and resource_id = '" + textOf(_data ? _data->get("id") : Value()) + "'";
+           "' and resource_id = '" + adminhost::textOf(rowId()) + "'";
 }
 
 std::vector<std::string> Resource::uuidsIn(const std::optional<std::vector<Dictionary>>& rows,
-                                           const std::optional<Error>& error) {
+                                           const std::optional<Error>& error) const {
+    logUnusableId();
     if (!rows) {
         adminhost::logEvent("getUserAndGroupACLs SQL query returned error: " + textOf(error));
         // The answer shows an empty list: without a report a client would take it for one.
@@ -179,7 +181,7 @@ void Resource::expandAll(const std::vector<Resource*>& resources) {
         resource->expandColumns();
         std::optional<Error> error;
         const auto rows = batch.next(error);
-        resource->expandList(uuidsIn(rows, error));
+        resource->expandList(resource->uuidsIn(rows, error));
     }
 }
 
@@ -239,14 +241,15 @@ void Resource::changeACLsWithRequest(const Array* entries) {
             appendNameOf(entry->get("_id_"), toRemove);
         }
     }
-    if (!guid()) {
+    const std::optional<std::string> uuid = statementGuid();
+    if (!uuid) {
         return;
     }
     const std::string_view type = resourceType();
-    _executeLumioConfigWithCommand("--add_access", type, *guid(), "user", toAdd.users);
-    _executeLumioConfigWithCommand("--add_access", type, *guid(), "group", toAdd.groups);
-    _executeLumioConfigWithCommand("--remove_access", type, *guid(), "user", toRemove.users);
-    _executeLumioConfigWithCommand("--remove_access", type, *guid(), "group", toRemove.groups);
+    _executeLumioConfigWithCommand("--add_access", type, *uuid, "user", toAdd.users);
+    _executeLumioConfigWithCommand("--add_access", type, *uuid, "group", toAdd.groups);
+    _executeLumioConfigWithCommand("--remove_access", type, *uuid, "user", toRemove.users);
+    _executeLumioConfigWithCommand("--remove_access", type, *uuid, "group", toRemove.groups);
 }
 
 void Resource::_executeLumioConfigWithCommand(std::string_view command, std::string_view resourceType,

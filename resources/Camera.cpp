@@ -3,6 +3,7 @@
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
 #include "platform/value/ValueText.h"
+#include "settings/SettingsStore.h"
 
 #include <cstdlib>
 
@@ -26,19 +27,42 @@ std::uint64_t count(const std::string& statement, std::string_view what) {
     return number == nullptr ? 0 : static_cast<std::uint64_t>(std::strtoll(number->c_str(), nullptr, 10));
 }
 
+std::string joined(const std::vector<std::string>& words) {
+    std::string text;
+    for (const std::string& word : words) {
+        text += (text.empty() ? "" : ",") + word;
+    }
+    return text;
+}
+
 }  // namespace
 
 std::optional<std::vector<std::unique_ptr<Camera>>> Camera::allCamerasWithError(std::optional<Error>& error) {
-    return querySorvaneDatabase(
-        "select id,name,uuid,create_user_uuid,created_at,update_user_uuid,updated_at,last_recording_uuid,use_user_uuid,"
-        "used_at,recording_status,access_control_enabled from cameras where (disabled != 't' OR disabled is NULL)",
-        error);
+    static const std::vector<std::string> columns{"id",
+                                                  "name",
+                                                  "uuid",
+                                                  "create_user_uuid",
+                                                  "created_at",
+                                                  "update_user_uuid",
+                                                  "updated_at",
+                                                  "last_recording_uuid",
+                                                  "use_user_uuid",
+                                                  "used_at",
+                                                  "recording_status",
+                                                  "access_control_enabled"};
+    if (!SettingsStore::dbPathExists()) {
+        error = missingDatabase();
+        return std::nullopt;
+    }
+    return resourcesOf<Camera>(
+        "select " + joined(columns) + " from cameras where (disabled != 't' OR disabled is NULL)", columns, error);
 }
 
 std::optional<Error> Camera::delete_() {
     static const adminhost::HostPath tool("/usr/bin/lumioconfig");
+    const std::optional<std::string> uuid = statementGuid();
     const std::int32_t status =
-        guid() ? adminhost::launch_task(adminhost::diskPath(tool), {"--remove_camera", *guid()}, nullptr, nullptr) : -1;
+        uuid ? adminhost::launch_task(adminhost::diskPath(tool), {"--remove_camera", *uuid}, nullptr, nullptr) : -1;
     if (status != 0) {
         return Error{"adminhost_lumio", status, std::nullopt};
     }

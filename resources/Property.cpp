@@ -6,8 +6,11 @@
 #include "platform/framework/Report.h"
 #include "platform/log/Log.h"
 #include "platform/text/LocalDate.h"
+#include "platform/text/Utf8.h"
 #include "platform/value/ValueText.h"
-#include "resources/WrappedRows.h"
+#include "resources/PropertyRows.h"
+#include "resources/StatementText.h"
+#include "settings/SettingsStore.h"
 
 #include <algorithm>
 #include <chrono>
@@ -36,13 +39,29 @@ void cleanseValue(Dictionary& values) noexcept {
     }
 }
 
-/// The rows of a statement on the properties table, each whole.
-std::optional<std::vector<Dictionary>> propertyRows(const std::string& statement, std::optional<Error>& error) {
-    auto records = Property::querySorvaneDatabase<Dictionary>(statement, error);
-    return records ? std::optional(wholePropertyRows(std::move(*records))) : std::nullopt;
+/// Wipes the text under "value" when the scope ends.
+class ScopedValueCleanse {
+  public:
+    explicit ScopedValueCleanse(Dictionary& values) noexcept : _values(values) {}
+    ScopedValueCleanse(const ScopedValueCleanse&) = delete;
+    ScopedValueCleanse& operator=(const ScopedValueCleanse&) = delete;
+    ~ScopedValueCleanse() { cleanseValue(_values); }
+
+  private:
+    Dictionary& _values;
+};
+
+/// A text as answers can carry it.
+void makeUtf8(Dictionary& row) {
+    for (const std::string& column : Property::tableColumnNames()) {
+        Value* value = row.find(column);
+        if (value != nullptr && value->string() != nullptr && !adminhost::isUtf8(*value->string())) {
+            *value = adminhost::utf8Of(*value->string());
+        }
+    }
 }
 
-std::string updateStatement(const Dictionary& working, const Value& id) {
+std::string updateStatement(const Dictionary& working, const std::optional<std::string>& id) {
     const std::vector<std::string>& columns = Property::tableColumnNames();
     std::string statement = "update properties set ";
     for (const DictionaryEntry& entry : working) {
@@ -51,7 +70,7 @@ std::string updateStatement(const Dictionary& working, const Value& id) {
         }
     }
     statement.resize(statement.size() - 2);
-    // Without a record the id's text is (null), which no row has.
+    // Without an id its text is (null), which no row has.
     return statement + " where id=" + textOf(id);
 }
 
@@ -112,9 +131,10 @@ std::unique_ptr<Property> Property::initWithChangeRequest(const Dictionary& requ
     const Value& id = request.get("_id_");
     if (!id.isNull()) {
         property->_changeValues->remove("_id");
-        std::optional<Error> error;
-        auto rows = propertyRows("select * from properties where id = " + textOf(id) + ";", error);
-        if (rows && !rows->empty()) {
+        auto rows = propertyRows("*", " from properties where id = " + textOf(id) + ";", RowCount::atMostOne);
+        if (!rows) {
+            property->_loadError = std::move(rows.error());
+        } else if (!rows->empty()) {
             property->_data = std::move(rows->front());
         }
     }
@@ -122,14 +142,18 @@ std::unique_ptr<Property> Property::initWithChangeRequest(const Dictionary& requ
 }
 
 std::optional<std::vector<std::unique_ptr<Property>>> Property::allPropertiesWithError(std::optional<Error>& error) {
-    auto rows = propertyRows("select * from properties;", error);
+    // The tool would create a missing database as an empty file.
+    auto rows =
+        SettingsStore::dbPathExists() ? propertyRows("*", " from properties;") : adminhost::failure(missingDatabase());
     if (!rows) {
+        error = std::move(rows.error());
         logEvent("Error getting Sorvane workflow properties: " + textOf(error));
         return std::nullopt;
     }
     std::vector<std::unique_ptr<Property>> properties;
     properties.reserve(rows->size());
     for (Dictionary& row : *rows) {
+        makeUtf8(row);
         properties.push_back(initWithDictionary(std::move(row)));
     }
     return properties;
@@ -171,11 +195,12 @@ std::optional<Error> Property::deletePropertyWithID(const Value& id) {
 
 std::optional<Error> Property::delete_() {
     std::optional<Error> error;
-    const Value& id = stored("id");
-    if (id.isNull()) {
+    const std::optional<std::string> id = rowId();
+    if (!id) {
+        logUnusableId();
         return error;
     }
-    static_cast<void>(querySorvaneDatabase("delete from properties where id=\"" + textOf(id) + "\"", error));
+    static_cast<void>(querySorvaneDatabase("delete from properties where id=\"" + *id + "\"", error));
     if (error) {
         logEvent("error deleting property:\n" + recordText(booleanOf(stored("protect"))) +
                  "\n  error:: " + textOf(error));
@@ -184,9 +209,16 @@ std::optional<Error> Property::delete_() {
 }
 
 std::optional<Error> Property::write() {
+    if (_loadError) {
+        // The update could match no row, and its arguments would show the value.
+        logWriteError(*_loadError, false);
+        return _loadError;
+    }
     const bool isUpdate = _changeValues.has_value();
-    const Value id = stored("id");
+    const std::optional<std::string> id = rowId();
+    logUnusableId();
     Dictionary working = isUpdate ? *_changeValues : _data.value_or(Dictionary());
+    const ScopedValueCleanse wipeWorking(working);
     // One error for the name check and the write: a name check that failed is reported even when the write succeeds.
     std::optional<Error> error;
     if (const Value* name = working.find("name")) {
@@ -203,17 +235,9 @@ std::optional<Error> Property::write() {
         isProtected = booleanOf(*protect);
         working.set("protect", isProtected ? "t" : "f");
         if (isUpdate && !working.contains("value")) {
-            if (isProtected) {
-                // Clients send "protect" only when it changes: a value that is protected already is protected twice.
-                working.set("value", stored("value"));
-            } else if (std::optional<std::string> plain = decryptValue(stored("value"))) {
-                working.set("value", std::move(*plain));
-                deciphered = true;
-            } else {
-                adminhost::reportNotDone({"configuration.properties",
-                                          "the protected value of " + textOf(stored("name")) +
-                                              " cannot be deciphered; it stays as it is stored",
-                                          ""});
+            if (std::optional<Error> unfit = takeStoredValue(working, isProtected, deciphered)) {
+                logWriteError(*unfit, true);
+                return unfit;
             }
         }
     }
@@ -234,32 +258,70 @@ std::optional<Error> Property::write() {
     } else {
         working.set("created_at", now);
     }
+    if (isUpdate && !id) {
+        // No row matches, and arguments are open to everyone on the machine.
+        cleanseValue(working);
+        working.remove("value");
+    }
+    std::string statement = isUpdate ? updateStatement(working, id) : insertStatement(working);
+    const adminhost::ScopedCleanse wipeStatement(statement);
     std::optional<Error> failure;
-    static_cast<void>(
-        querySorvaneDatabase(isUpdate ? updateStatement(working, id) : insertStatement(working), failure));
+    static_cast<void>(querySorvaneDatabase(statement, failure));
     if (failure) {
         if (deciphered) {
             // The tool quotes the statement, and with it a value that stays protected now.
-            failure->description = "Can't execute sqlite3 query: (secret)";
+            failure->description = withoutSecret(*failure->description, textOf(working.get("value")), statement);
         }
         error = std::move(failure);
     }
     if (error) {
-        logEvent("error writing property:\n" + recordText(isProtected || wasProtected) +
-                 "\n   error: " + textOf(error));
+        logWriteError(*error, isProtected || wasProtected);
     }
     return error;
 }
 
-std::optional<Error> Property::nameError(const Value& name, std::optional<Error>& toolError) const {
-    const Value& id = stored("id");
-    const std::string condition = id.isNull() ? ";" : " and not id=" + textOf(id) + ";";
-    const auto rows =
-        propertyRows("select id,name,value from properties where name=\"" + textOf(name) + "\"" + condition, toolError);
-    if (!rows || rows->empty()) {
+std::optional<Error> Property::takeStoredValue(Dictionary& working, bool isProtected, bool& deciphered) const {
+    if (isProtected) {
+        // Clients send "protect" only when it changes: a value that is protected already is protected twice.
+        working.set("value", stored("value"));
         return std::nullopt;
     }
-    const Dictionary& other = rows->back();
+    std::optional<std::string> plain = decryptValue(stored("value"));
+    if (!plain) {
+        adminhost::reportNotDone(
+            {"configuration.properties",
+             "the protected value of " + textOf(stored("name")) + " cannot be deciphered; it stays as it is stored",
+             ""});
+        return std::nullopt;
+    }
+    const adminhost::ScopedCleanse wipePlain(*plain);
+    if (const std::optional<std::string> why = whyUnfitForStatement(*plain)) {
+        return Error{
+            "sqliteQuery", 1,
+            "Can't execute sqlite3 query: Error: the deciphered value " + *why + "; the property stays protected"};
+    }
+    working.set("value", *plain);
+    deciphered = true;
+    return std::nullopt;
+}
+
+void Property::logWriteError(const Error& error, bool hideValue) const {
+    logEvent("error writing property:\n" + recordText(hideValue) + "\n   error: " + textOf(error));
+}
+
+std::optional<Error> Property::nameError(const Value& name, std::optional<Error>& toolError) const {
+    const std::optional<std::string> id = rowId();
+    const std::string condition = id ? " and not id=" + *id + ";" : ";";
+    auto rows = propertyRows("id,name,value", " from properties where name=\"" + textOf(name) + "\"" + condition);
+    if (!rows) {
+        toolError = std::move(rows.error());
+        return std::nullopt;
+    }
+    if (rows->empty()) {
+        return std::nullopt;
+    }
+    Dictionary& other = rows->back();
+    makeUtf8(other);
     return Error{"sqliteQuery", 2,
                  "Property name '" + textOf(other.get("name")) + "' already exists with value '" +
                      textOf(other.get("value")) + "'"};

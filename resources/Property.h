@@ -21,11 +21,13 @@ class Property final : public ResourceClass<Property> {
     /// A property to insert: the request's entries for the table's columns, "id" included; "protect" false if it is not
     /// given.
     [[nodiscard]] static std::unique_ptr<Property> initNewPropertyWithDictionary(const adminhost::Dictionary& request);
-    /// A property to change: the record is the row whose id is the request's "_id_", raw. A row that does not exist or
-    /// cannot be read leaves the record null, and write() then changes nothing and reports no error.
+    /// A property to change: the record is the row whose id is the request's "_id_", raw. A row that does not exist
+    /// leaves the record null, and write() then changes nothing and returns no error; a row that cannot be read is
+    /// write()'s error.
     [[nodiscard]] static std::unique_ptr<Property> initWithChangeRequest(const adminhost::Dictionary& request);
 
-    /// Every property, as administrators see it; nothing, with the error and a log line, on failure. "protect" is a
+    /// Every property, as administrators see it; null, with the error and a log line, on failure, which a missing
+    /// database is too. "protect" is a
     /// boolean, a protected "value" is absent, "_id_" repeats "id".
     [[nodiscard]] static std::optional<std::vector<std::unique_ptr<Property>>> allPropertiesWithError(
         std::optional<adminhost::Error>& error);
@@ -45,10 +47,11 @@ class Property final : public ResourceClass<Property> {
     [[nodiscard]] static std::optional<std::string> decryptValue(const adminhost::Value& value);
     [[nodiscard]] static std::optional<std::string> cryptedValue(const adminhost::Value& value, bool encrypt);
 
-    /// Inserts or updates the row. Refused, and nothing written: a name that another property has, and a value that is
-    /// to be protected but cannot be. Protection switched on without a new value protects the stored one, one that is
-    /// protected already too; switched off without a new value it stores the plain text, if the stored one can be
-    /// deciphered. The name check's failure in the tool does not stop the write but is what is reported then.
+    /// Inserts or updates the row. An error, and nothing written: a row that could not be read, a name that another
+    /// property has, a value that is to be protected but cannot be, and a plain text that no statement can carry.
+    /// Protection switched on without a new value protects the stored one, one that is protected already too; switched
+    /// off without a new value it stores the plain text, if the stored one can be deciphered. The name check's failure
+    /// in the tool does not stop the write but is what is reported then.
     [[nodiscard]] std::optional<adminhost::Error> write();
     /// Deletes the record's row; without an id nothing.
     [[nodiscard]] std::optional<adminhost::Error> delete_() override;
@@ -82,12 +85,18 @@ class Property final : public ResourceClass<Property> {
   private:
     [[nodiscard]] std::optional<adminhost::Error> nameError(const adminhost::Value& name,
                                                             std::optional<adminhost::Error>& toolError) const;
+    /// Puts the stored value into the changes, as protection that is switched on or off needs it. The error if the
+    /// deciphered one cannot be stored.
+    [[nodiscard]] std::optional<adminhost::Error> takeStoredValue(adminhost::Dictionary& working, bool isProtected,
+                                                                  bool& deciphered) const;
+    void logWriteError(const adminhost::Error& error, bool hideValue) const;
     /// The record's value under the key; null without a record.
     [[nodiscard]] const adminhost::Value& stored(std::string_view key) const noexcept;
     /// The record's text for the log, its value hidden on demand.
     [[nodiscard]] std::string recordText(bool hideValue) const;
 
     std::optional<adminhost::Dictionary> _changeValues;
+    std::optional<adminhost::Error> _loadError;  ///< why the row to change could not be read
 };
 
 }  // namespace lumio

@@ -1,13 +1,35 @@
 #include "resources/Resource.h"
 
 #include "platform/bundle/Bundle.h"
+#include "platform/log/Log.h"
 #include "platform/text/LocalDate.h"
 #include "platform/value/ValueText.h"
+#include "settings/LineRows.h"
+
+#include <algorithm>
 
 namespace lumio {
 
 using adminhost::Dictionary;
 using adminhost::Value;
+
+namespace {
+
+bool isDigit(char c) noexcept {
+    return c >= '0' && c <= '9';
+}
+
+bool isNumber(std::string_view text) noexcept {
+    return !text.empty() && std::all_of(text.begin(), text.end(), isDigit);
+}
+
+bool isIdentifier(std::string_view text) noexcept {
+    return !text.empty() && text.front() != '-' && std::all_of(text.begin(), text.end(), [](char c) {
+        return isDigit(c) || c == '-' || (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z');
+    });
+}
+
+}  // namespace
 
 std::unique_ptr<Resource> Resource::initWithGUID(std::optional<std::string> guid) {
     auto resource = init();
@@ -54,17 +76,22 @@ void Resource::readRow(Dictionary row) {
 const std::optional<std::string>& Resource::guid() {
     if (!_guid && _data && _data->contains("uuid")) {
         _guid = textOf(_data->get("uuid"));
+        _guidIsTheRecords = true;
     }
     return _guid;
 }
 
 const Dictionary* Resource::data() {
-    if (!_data && guid()) {
+    if (_data) {
+        return &*_data;
+    }
+    if (const std::optional<std::string> uuid = statementGuid()) {
         std::optional<adminhost::Error> error;
-        auto rows = querySorvaneDatabase<Dictionary>(
-            std::string("select * from ").append(resourceType()) + "s where uuid=\"" + *guid() + "\"", error);
-        if (rows && rows->size() == 1) {
-            _data = std::move(rows->front());
+        auto rows = rowsWithIdentities(
+            std::string("select * from ").append(resourceType()) + "s where uuid=\"" + *uuid + "\"", {}, error);
+        if (rows.records && rows.records->size() == 1) {
+            _data = std::move(rows.records->front());
+            _rawIdentity = std::move(rows.identities.front());
         }
     }
     return _data ? &*_data : nullptr;
@@ -75,6 +102,72 @@ const Dictionary* Resource::dictionary() {
         expandACLs();
     }
     return _data ? &*_data : nullptr;
+}
+
+std::optional<Dictionary> Resource::takeDictionary() && {
+    static_cast<void>(dictionary());
+    return std::move(_data);
+}
+
+std::optional<std::string> Resource::rowId() const {
+    const Value& shown = _data ? _data->get("id") : Value();
+    if (shown.isNull()) {
+        return std::nullopt;
+    }
+    std::optional<std::string> id = _rawIdentity ? _rawIdentity->id : textOf(shown);
+    return id && isNumber(*id) ? id : std::nullopt;
+}
+
+void Resource::logUnusableId() const {
+    if (_data && _data->contains("id") && !rowId()) {
+        adminhost::logEvent(std::string(resourceType()) +
+                            ": the record's id is not a number; it counts as a record without an id");
+    }
+}
+
+std::optional<std::string> Resource::statementGuid() {
+    if (!guid() || !_guidIsTheRecords) {
+        return _guid;
+    }
+    std::optional<std::string> uuid = _rawIdentity ? _rawIdentity->uuid : _guid;
+    if (uuid && isIdentifier(*uuid)) {
+        return uuid;
+    }
+    adminhost::logEvent(std::string(resourceType()) +
+                        ": the record's uuid is not an identifier; it counts as a record without a uuid");
+    return std::nullopt;
+}
+
+Resource::RowsWithIdentities Resource::rowsWithIdentities(const std::string& statement,
+                                                          std::span<const std::string> columns,
+                                                          std::optional<adminhost::Error>& error) {
+    auto output = statementOutput(statement);
+    if (!output) {
+        error = std::move(output.error());
+        return {};
+    }
+    RowsWithIdentities rows{recordsOfLineOutput(*output), {}};
+    rows.identities.resize(rows.records->size());
+    std::vector<std::string> inferred;
+    if (columns.empty()) {
+        inferred = lineColumns(*output);
+        columns = inferred;
+    }
+    const auto indexOf = [&](std::string_view name) {
+        return static_cast<std::size_t>(std::find(columns.begin(), columns.end(), name) - columns.begin());
+    };
+    const std::size_t id = indexOf("id");
+    const std::size_t uuid = indexOf("uuid");
+    const auto raw = rowsOfRecords(*output, columns);
+    for (std::size_t i = 0; i < std::min(raw.size(), rows.identities.size()); ++i) {
+        if (raw[i] && id < columns.size()) {
+            rows.identities[i].id = raw[i]->values[id];
+        }
+        if (raw[i] && uuid < columns.size()) {
+            rows.identities[i].uuid = raw[i]->values[uuid];
+        }
+    }
+    return rows;
 }
 
 std::string Resource::description() const {

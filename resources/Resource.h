@@ -6,13 +6,14 @@
 // its UUID, from the database on the first use of data(). Changes go to the database or the configuration tool at once
 // and are not reflected in the record. Operations named init... answer a new object that the caller owns.
 
-#include "platform/value/Error.h"
+#include "platform/value/Result.h"
 #include "platform/value/Value.h"
 #include "settings/QueryRunner.h"
 
 #include <concepts>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -44,22 +45,14 @@ class Resource {
         std::string_view name, const adminhost::Bundle& bundle, const std::vector<std::string>& preferredLanguages);
 
     /// Runs a statement; each row becomes an object of the result class: Dictionary, or a class with
-    /// initWithDictionary. Nothing, and only then an error, when the tool fails (QueryRunner.h).
+    /// initWithDictionary. Null, and only then an error, when the tool fails (QueryRunner.h).
     template <class ResultClass>
     [[nodiscard]] static auto querySorvaneDatabase(const std::string& statement,
                                                    std::optional<adminhost::Error>& error) {
-        std::optional<std::vector<adminhost::Dictionary>> rows = runStatement(statement, error);
         if constexpr (std::same_as<ResultClass, adminhost::Dictionary>) {
-            return rows;
+            return runStatement(statement, error);
         } else {
-            std::optional<std::vector<std::unique_ptr<ResultClass>>> results;
-            if (rows) {
-                results.emplace().reserve(rows->size());
-                for (adminhost::Dictionary& row : *rows) {
-                    results->push_back(ResultClass::initWithDictionary(std::move(row)));
-                }
-            }
-            return results;
+            return resourcesOf<ResultClass>(statement, {}, error);
         }
     }
 
@@ -71,12 +64,18 @@ class Resource {
 
     /// The UUID that the resource was made with, else the record's "uuid".
     [[nodiscard]] const std::optional<std::string>& guid();
-    void setGuid(std::optional<std::string> guid) { _guid = std::move(guid); }
+    void setGuid(std::optional<std::string> guid) {
+        _guid = std::move(guid);
+        _guidIsTheRecords = false;
+    }
     /// The record; if there is none yet, the row of the UUID, raw (dates as text, no "_id_"), when the database has
     /// exactly one. Null otherwise; the next call tries again.
     [[nodiscard]] const adminhost::Dictionary* data();
     /// Replaces the record; nothing clears it.
-    void setData(std::optional<adminhost::Dictionary> data) { _data = std::move(data); }
+    void setData(std::optional<adminhost::Dictionary> data) {
+        _data = std::move(data);
+        _rawIdentity.reset();
+    }
     /// The record as administrators see it, or null: with its access list expanded, which happens once. A missing
     /// record is not loaded for it.
     [[nodiscard]] virtual const adminhost::Dictionary* dictionary();
@@ -92,6 +91,8 @@ class Resource {
         }
         expandAll(all);
     }
+    /// The same without a copy, for a resource that is not needed any more.
+    [[nodiscard]] std::optional<adminhost::Dictionary> takeDictionary() &&;
     /// "CLASS - guid: UUID, " and the record from the next line on: the fields as they stand, nothing is loaded.
     [[nodiscard]] std::string description() const;
 
@@ -133,8 +134,8 @@ class Resource {
     // Its steps, with the statement that is run between them.
     void expandColumns();
     [[nodiscard]] std::string accessListStatement() const;
-    [[nodiscard]] static std::vector<std::string> uuidsIn(const std::optional<std::vector<adminhost::Dictionary>>& rows,
-                                                          const std::optional<adminhost::Error>& error);
+    [[nodiscard]] std::vector<std::string> uuidsIn(const std::optional<std::vector<adminhost::Dictionary>>& rows,
+                                                   const std::optional<adminhost::Error>& error) const;
     void expandList(const std::vector<std::string>& uuids);
     /// The directory's entries for the UUIDs, of one record type or of people and groups. A failing directory is told
     /// on standard output and gives an empty list.
@@ -151,8 +152,52 @@ class Resource {
     /// What initWithDictionary does with the row.
     virtual void readRow(adminhost::Dictionary row);
 
+    // What a database row says about itself is no more trustworthy than the names in it: only these go into statements
+    // and tool arguments.
+
+    /// The record's "id" if it is decimal digits, as the raw text of the tool's output has it.
+    [[nodiscard]] std::optional<std::string> rowId() const;
+    /// Logs a record whose id is not a number.
+    void logUnusableId() const;
+    /// The UUID: one that was given as it is, the record's if it is an identifier (letters, digits, hyphens); else null
+    /// after a log line.
+    [[nodiscard]] std::optional<std::string> statementGuid();
+
+    /// The objects of a statement's rows. The columns, in the statement's order, tell the rows' identities from what
+    /// their values look like; without them they are inferred from the output.
+    template <class ResultClass>
+    [[nodiscard]] static std::optional<std::vector<std::unique_ptr<ResultClass>>> resourcesOf(
+        const std::string& statement, std::span<const std::string> columns, std::optional<adminhost::Error>& error) {
+        RowsWithIdentities rows = rowsWithIdentities(statement, columns, error);
+        if (!rows.records) {
+            return std::nullopt;
+        }
+        std::vector<std::unique_ptr<ResultClass>> results;
+        results.reserve(rows.records->size());
+        for (std::size_t i = 0; i < rows.records->size(); ++i) {
+            results.push_back(ResultClass::initWithDictionary(std::move((*rows.records)[i])));
+            static_cast<Resource&>(*results.back())._rawIdentity = std::move(rows.identities[i]);
+        }
+        return results;
+    }
+
+    /// "id" and "uuid" as the raw text of the tool's output has them; null where they are not known.
+    struct RawIdentity {
+        std::optional<std::string> id;
+        std::optional<std::string> uuid;
+    };
+    struct RowsWithIdentities {
+        std::optional<std::vector<adminhost::Dictionary>> records;
+        std::vector<RawIdentity> identities;  ///< one for each record
+    };
+    [[nodiscard]] static RowsWithIdentities rowsWithIdentities(const std::string& statement,
+                                                               std::span<const std::string> columns,
+                                                               std::optional<adminhost::Error>& error);
+
     std::optional<adminhost::Dictionary> _data;
     std::optional<std::string> _guid;
+    bool _guidIsTheRecords = false;
+    std::optional<RawIdentity> _rawIdentity;  ///< null for a record that did not come from the tool's output
     bool _aclsAreExpanded = false;
     bool _aclEnabled = false;
 };

@@ -9,6 +9,7 @@ using adminhost::Error;
 
 namespace {
 
+constexpr const char* failed = "Can't execute sqlite3 query: ";
 constexpr std::string_view separator = " = ";
 
 /// Where the first separator begins. Searched by its middle: lines begin with blanks.
@@ -19,6 +20,17 @@ std::size_t separatorIn(std::string_view line) noexcept {
         }
     }
     return std::string_view::npos;
+}
+
+/// The tool would take such a path for one of its options, and one of those runs commands.
+bool beginsWithHyphen(const adminhost::HostPath& database) noexcept {
+    return database.text().starts_with('-');
+}
+
+adminhost::TaskPlan planFor(const adminhost::HostPath& database, const std::string& statement) {
+    static const adminhost::HostPath tool("/usr/bin/sqlite3");
+    const std::string file = adminhost::diskPath(database).text();
+    return {adminhost::diskPath(tool), {"-line", (file.starts_with('-') ? "./" : "") + file, statement}};
 }
 
 }  // namespace
@@ -55,21 +67,48 @@ std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
 }
 
 adminhost::TaskPlan planOf(const std::string& statement) {
-    static const adminhost::HostPath tool("/usr/bin/sqlite3");
-    return {adminhost::diskPath(tool), {"-line", adminhost::diskPath(SettingsStore::dbPath()).text(), statement}};
+    return planFor(SettingsStore::dbPath(), statement);
+}
+
+static adminhost::Result<std::string> outputOf(adminhost::TaskResult result) {
+    if (result.status != 0) {
+        return adminhost::failure(Error{"sqliteQuery", result.status, failed + result.error});
+    }
+    return std::move(result.output);
 }
 
 std::optional<std::vector<Dictionary>> rowsOf(const adminhost::TaskResult& result, std::optional<Error>& error) {
-    if (result.status != 0) {
-        error = Error{"sqliteQuery", result.status, "Can't execute sqlite3 query: " + result.error};
+    const auto output = outputOf(result);
+    if (!output) {
+        error = output.error();
         return std::nullopt;
     }
-    return recordsOfLineOutput(result.output);
+    return recordsOfLineOutput(*output);
+}
+
+adminhost::Result<std::string> statementOutput(const std::string& statement) {
+    const adminhost::HostPath database = SettingsStore::dbPath();
+    if (beginsWithHyphen(database)) {
+        return adminhost::failure(
+            Error{"sqliteQuery", 1, failed + ("Error: the database path begins with a hyphen: " + database.text())});
+    }
+    adminhost::TaskGroup tool;
+    return outputOf(tool.collect(tool.start(planFor(database, statement))));
+}
+
+Error missingDatabase() {
+    return {"sqliteQuery", 1,
+            failed + ("Error: unable to open database \"" + SettingsStore::dbPath().text() +
+                      "\": unable to open database file\n")};
 }
 
 std::optional<std::vector<Dictionary>> runStatement(const std::string& statement, std::optional<Error>& error) {
-    adminhost::TaskGroup tool;
-    return rowsOf(tool.collect(tool.start(planOf(statement))), error);
+    adminhost::Result<std::string> output = statementOutput(statement);
+    if (!output) {
+        error = std::move(output.error());
+        return std::nullopt;
+    }
+    return recordsOfLineOutput(*output);
 }
 
 }  // namespace lumio

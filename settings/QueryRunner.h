@@ -6,7 +6,7 @@
 // the service's contract: nothing is escaped, quoted otherwise or bound here.
 
 #include "platform/task/TaskGroup.h"
-#include "platform/value/Error.h"
+#include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
 #include <optional>
@@ -16,10 +16,14 @@
 
 namespace lumio {
 
-/// Runs the statement on the database at SettingsStore::dbPath(). The rows in output order, each a dictionary of texts
-/// by column name (NULL is the empty text); empty for a statement that prints nothing. Nothing when the tool fails, and
-/// only then the error is written: domain "sqliteQuery", the tool's exit status (-1 if it could not be started) and its
-/// error text. Rows printed before a failure are dropped.
+/// Runs the statement on the database at SettingsStore::dbPath() and returns what the tool printed, or the error:
+/// domain "sqliteQuery", the tool's exit status (-1 if it could not be started) and its error text. A database path
+/// that begins with a hyphen is a failure with code 1 and runs no tool, which would read it as an option.
+[[nodiscard]] adminhost::Result<std::string> statementOutput(const std::string& statement);
+
+/// Runs the statement likewise. The rows in output order, each a dictionary of texts
+/// by column name (NULL is the empty text); empty for a statement that prints nothing. Null when the tool fails, and
+/// only then the error is written. Rows printed before a failure are dropped.
 [[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> runStatement(const std::string& statement,
                                                                              std::optional<adminhost::Error>& error);
 
@@ -28,6 +32,8 @@ namespace lumio {
 /// What runStatement() returns for the result of that run.
 [[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> rowsOf(const adminhost::TaskResult& result,
                                                                        std::optional<adminhost::Error>& error);
+/// The failure of a listing whose database does not exist. Listings look first: the tool would create an empty file.
+[[nodiscard]] adminhost::Error missingDatabase();
 
 /// The rows in the tool's line output.
 [[nodiscard]] std::vector<adminhost::Dictionary> recordsOfLineOutput(std::string_view output);

@@ -96,5 +96,24 @@ TEST_F(CleansedMemory, WritingAProtectedPropertyLeavesNeitherBehind) {
     EXPECT_EQ(Property::decryptValue(storedValue()), plainText);
 }
 
+TEST_F(CleansedMemory, WritingThatEndsEarlyLeavesNeitherBehind) {
+    ASSERT_EQ(insert({{"name", "taken"}, {"value", "v"}}), std::nullopt);
+    Dictionary request{{"name", "taken"}, {"value", plainText}, {"protect", true}};
+    EXPECT_EQ(seenWhile([&] { EXPECT_TRUE(insert(request)) << "another property has the name"; }), 0);
+    useSecret("dG9vIHNob3J0");
+    request.set("name", "free");
+    EXPECT_EQ(seenWhile([&] { EXPECT_TRUE(insert(request)) << "the key cannot be used"; }), 0);
+    request.set("_id_", "1");
+    EXPECT_EQ(seenWhile([&] { EXPECT_TRUE(change(request)); }), 0);
+    request.set("_id_", "77");
+    EXPECT_EQ(seenWhile([&] { EXPECT_TRUE(change(request)); }), 0);
+}
+
+TEST_F(CleansedMemory, PlainTextThatCannotBeStoredIsNotLeftBehind) {
+    const std::string quoted = std::string(plainText) + '"';
+    ASSERT_EQ(insert({{"name", "n"}, {"value", quoted}, {"protect", true}}), std::nullopt);
+    EXPECT_EQ(seenWhile([&] { EXPECT_TRUE(change({{"_id_", "1"}, {"protect", false}})); }), 0);
+}
+
 }  // namespace
 }  // namespace lumio

@@ -2,7 +2,7 @@
 
 #include "codec/LumioCategories.h"
 #include "handler/LumioRequestHandler.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "tests/support/Environment.h"
 #include "tests/support/RecordedStatements.h"
 #include "tests/unit/resources/PropertyFixture.h"

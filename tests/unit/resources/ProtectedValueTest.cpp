@@ -1,4 +1,3 @@
-#include "resources/WrappedRows.h"
 #include "tests/unit/resources/PropertyFixture.h"
 
 #include <algorithm>
@@ -116,19 +115,6 @@ TEST_F(ProtectedValue, PlainValueOfSeveralLinesIsOneValueAndIsProtectedWhole) {
         ASSERT_EQ(change({{"_id_", "1"}, {"protect", false}}), std::nullopt);
         EXPECT_EQ(storedValue(), text);
     }
-}
-
-TEST(WholePropertyRows, StrayLinesOfAProtectedValueAreDroppedAndOfAPlainOneKept) {
-    const auto rows = [](const char* protect) {
-        return wholePropertyRows(
-            {{{"id", "1"}, {"value", "a"}, {"c", "b c"}, {"key", "stray"}, {"protect", protect}, {"extra", "kept"}}});
-    };
-    EXPECT_EQ(rows("t"),
-              (std::vector<Dictionary>{{{"id", "1"}, {"value", "a\nb c"}, {"protect", "t"}, {"extra", "kept"}}}));
-    EXPECT_EQ(rows("f"),
-              (std::vector<Dictionary>{
-                  {{"id", "1"}, {"value", "a\nb c"}, {"key", "stray"}, {"protect", "f"}, {"extra", "kept"}}}));
-    EXPECT_TRUE(wholePropertyRows({}).empty());
 }
 
 TEST_F(ProtectedValue, WhatWasEncryptedIsDecryptedUnderTheSameKeyFile) {

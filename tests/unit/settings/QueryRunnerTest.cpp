@@ -187,6 +187,17 @@ TEST_F(QueryRunner, AMegabyteOnEachStreamIsCaptured) {
     EXPECT_GE(error->description->size(), 1000000U);
 }
 
+TEST_F(QueryRunner, DatabaseThatBeginsWithAHyphenIsAFailureAndNoOptionOfTheTool) {
+    root.write("/var/lumio/server/database.yml", "production:\n  database: -cmd\n");
+    root.writeTool("/usr/bin/sqlite3", "#!/bin/sh\ntouch '" + root.path("/ran").string() + "'\n");
+    EXPECT_EQ(run(".shell true"), std::nullopt);
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->domain, "sqliteQuery");
+    EXPECT_EQ(error->code, 1);
+    EXPECT_NE(error->description->find("hyphen"), std::string::npos) << *error->description;
+    EXPECT_FALSE(std::filesystem::exists(root.path("/ran")));
+}
+
 TEST_F(QueryRunner, MissingDatabaseIsTheToolsFailureWithCode1) {
     std::filesystem::remove(root.path(database));
     EXPECT_EQ(run("select * from t"), std::nullopt);

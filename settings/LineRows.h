@@ -1,0 +1,47 @@
+#pragma once
+
+// Rows read from the raw text of the sqlite3 tool's line output, by the names of the columns.
+//
+// The tool prints each column's name on the left, padded to the longest one (at least five characters), then " = " and
+// the value, whose line feeds come as they are. A line therefore begins a column only if it is exactly the padded name
+// of the next column; anything else belongs to the value before it. A row begins at the first line, and at the padded
+// name of the first column behind an empty line.
+//
+// A value may hold lines that look exactly like a column. A row whose lines can be divided among the columns in more
+// than one way, or in none, is returned without values: what it says is not known. A value that spells out the rest of
+// its row and whole rows after it cannot be told from those rows by their text.
+
+#include <cstddef>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace lumio {
+
+struct LineRow {
+    std::size_t line = 0;                  ///< index of the row's first line in the output
+    std::size_t end = 0;                   ///< index of the line behind its last one
+    std::vector<std::string_view> values;  ///< in the columns' order, part of the output; empty if not known
+
+    friend bool operator==(const LineRow&, const LineRow&) = default;
+};
+
+/// The rows of an output whose columns have these names, in this order. An output that does not end in a line feed was
+/// cut off; its last row is left out.
+[[nodiscard]] std::vector<LineRow> readLineRows(std::string_view output, std::span<const std::string> columns);
+
+/// The names on all lines that look like columns, each once, in the order of their first lines. Lines of values may be
+/// among them.
+[[nodiscard]] std::vector<std::string> lineColumns(std::string_view output);
+
+/// Those of them that every one of the rows has.
+[[nodiscard]] std::vector<std::string> lineColumnsOfEvery(std::string_view output, std::span<const LineRow> rows);
+
+/// For each record that recordsOfLineOutput reads, the row that begins at the same line and is known; none for a record
+/// that is only a piece of a row, and for rows whose first column occurs twice.
+[[nodiscard]] std::vector<std::optional<LineRow>> rowsOfRecords(std::string_view output,
+                                                                std::span<const std::string> columns);
+
+}  // namespace lumio
