@@ -28,7 +28,7 @@ constexpr auto runningBound = 10s;  ///< for a running operation that only reads
 constexpr auto extension = 5s;      ///< that the service manager waits longer than a running write may take
 constexpr int logPause = 100;       ///< milliseconds until the next try while the log cannot be written
 constexpr auto logBound = 200ms;    ///< for the log's last events at the end
-constexpr auto sendingBound = 2s;   ///< for its clients to take their answers then
+constexpr auto sendingBound = 2s;   ///< for its clients to read their answers then
 
 FileDescriptor stopSignals() {
     sigset_t signals;

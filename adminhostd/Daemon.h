@@ -6,7 +6,7 @@
 
 namespace adminhost {
 
-/// Serves until SIGTERM or SIGINT, then finishes the running operation within ten seconds. Answers the exit status.
+/// Serves until SIGTERM or SIGINT, then finishes the running operation within ten seconds. Returns the exit status.
 [[nodiscard]] int runDaemon(const Options& options);
 
 }  // namespace adminhost

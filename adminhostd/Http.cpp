@@ -109,7 +109,7 @@ std::vector<std::string_view> headersOf(MHD_Connection* connection, const char* 
     return std::move(found.values);
 }
 
-/// What is wrong with the head of a request that the library lets pass.
+/// Rejects what is wrong in the head of a request and what the library accepts all the same.
 std::optional<HttpAnswer> headRefusal(MHD_Connection* connection, std::string_view version) {
     if (version == MHD_HTTP_VERSION_1_1 && !headerOf(connection, MHD_HTTP_HEADER_HOST)) {
         return malformed("The Host header is missing; send one, with any value.");
@@ -288,7 +288,7 @@ void HttpServer::run() {
     accept();
     ::MHD_run(_daemon);
     if (_returnMemory) {
-        // The allocator keeps what lies below anything still in use, which after large answers may be most of them.
+        // The allocator keeps freed memory below anything that is still in use: after large answers, most of it.
         ::malloc_trim(0);
         _returnMemory = false;
     }
@@ -410,7 +410,7 @@ int HttpServer::begin(MHD_Connection* connection, const char* url, const char* m
     }
     const bool waits = headerOf(connection, MHD_HTTP_HEADER_EXPECT).has_value();
     if (begun._refusal && (tooLarge || waits || begun._refusal->status == 403)) {
-        begun._answer = std::move(begun._refusal);  // at once, without taking the body
+        begun._answer = std::move(begun._refusal);  // at once, without reading the body
         return send(begun);
     }
     return MHD_YES;

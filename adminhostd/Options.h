@@ -28,7 +28,7 @@ struct Options {
     bool check = false;
 };
 
-/// Reads both; the command line wins. Sets the system root. A relative root or plug-in lies below the current
+/// Reads both; the command line wins. Sets the system root. A relative root or plug-in is below the current
 /// directory. Returns nullopt when the daemon must exit at once, because help or a mistake was printed; then status is
 /// the exit status.
 [[nodiscard]] std::optional<Options> readOptions(int count, const char* const* arguments, int& status);

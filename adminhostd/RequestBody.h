@@ -18,19 +18,19 @@ constexpr std::size_t bodyValuesMaximum = 100'000;
 
 enum class BodyForm { json, propertyList };
 
-/// The form that a Content-Type names; JSON for none. Nothing for a type or a character set that is not understood.
+/// The form that a Content-Type names; JSON for none. Returns nullopt for an unknown type or character set.
 [[nodiscard]] std::optional<BodyForm> bodyFormOf(std::string_view contentType);
 
 struct BodyProblem {
-    bool tooManyValues = false;  ///< else malformed, or no dictionary
+    bool tooManyValues = false;  ///< else malformed, or not a dictionary
     std::string text;            ///< with line and column
 };
 
-/// The request dictionary of a body; an empty one for an empty body. Nothing, with the problem, when there is none.
+/// The request dictionary of a body; an empty one for an empty body. Returns nullopt, with the problem, when the body
+/// is not a dictionary.
 [[nodiscard]] std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem);
 
-/// Whether an Accept header asks for a property list rather than for JSON: by its higher weight, or by being named
-/// first.
+/// Returns true when an Accept header prefers a property list to JSON, by a higher weight or by naming it first.
 [[nodiscard]] bool prefersPropertyList(std::string_view accept);
 
 /// The revisions that an If-Match header lists; an empty list for "*". Returns nullopt when the header is malformed, or

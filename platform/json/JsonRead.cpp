@@ -14,7 +14,7 @@
 namespace adminhost {
 namespace {
 
-/// Walks the text and tells how far the parser has read, which its events do not say.
+/// Walks the text and remembers how far the parser has read, which its events do not report.
 class CountingIterator {
   public:
     using iterator_category = std::input_iterator_tag;
@@ -37,7 +37,7 @@ class CountingIterator {
     const char** _reached;
 };
 
-/// Takes the parser's events and builds the value. Every event answers whether to go on.
+/// Takes the parser's events and builds the value. Every event returns whether to go on.
 class Builder {
   public:
     using Json = nlohmann::json;
@@ -67,9 +67,9 @@ class Builder {
     struct Level {
         Value container;
         std::string key;
-        std::string form;                ///< "$date" and its like: the object stands for one such value
+        std::string form;                ///< "$date" and its like: the object is one such value
         Value formed;                    ///< that value
-        std::set<std::string> nullKeys;  ///< they leave no trace in the dictionary, but may not stand twice
+        std::set<std::string> nullKeys;  ///< they leave no trace in the dictionary, but must not occur twice
     };
 
     bool fail(std::string problem) {
@@ -94,7 +94,7 @@ bool Builder::open(Value container) {
         return fail(fmt::format("lists and dictionaries are nested more than {} deep", jsonMaximumDepth));
     }
     if (!_levels.empty() && !_levels.back().form.empty()) {
-        return fail(fmt::format("\"{}\" takes a text", _levels.back().form));
+        return fail(fmt::format("\"{}\" must be a text", _levels.back().form));
     }
     _levels.push_back({std::move(container), {}, {}, {}, {}});
     return true;
@@ -120,7 +120,7 @@ bool Builder::add(Value value) {
     }
     Level& level = _levels.back();
     if (!level.form.empty()) {
-        return fail(fmt::format("\"{}\" takes a text", level.form));
+        return fail(fmt::format("\"{}\" must be a text", level.form));
     }
     if (Array* array = level.container.array()) {
         array->push_back(std::move(value));
@@ -136,10 +136,10 @@ bool Builder::null() {
     }
     Level& level = _levels.back();
     if (level.container.array() != nullptr) {
-        return fail("null cannot stand in a list");
+        return fail("null is not allowed in a list");
     }
     if (!level.form.empty()) {
-        return fail(fmt::format("\"{}\" takes a text", level.form));
+        return fail(fmt::format("\"{}\" must be a text", level.form));
     }
     level.nullKeys.insert(level.key);
     return count();
@@ -174,7 +174,7 @@ bool Builder::string(const std::string& value) {
     } else if (value == "infinity" || value == "-infinity") {
         level.formed = std::numeric_limits<double>::infinity() * (value.front() == '-' ? -1 : 1);
     } else {
-        return fail("\"$real\" takes nan, infinity or -infinity");
+        return fail("\"$real\" must be nan, infinity or -infinity");
     }
     return true;
 }
@@ -197,7 +197,7 @@ bool Builder::key(const std::string& key) {
     }
     level.key = key.starts_with('$') ? key.substr(1) : key;
     if (level.container.dictionary()->contains(level.key) || level.nullKeys.contains(level.key)) {
-        return fail(fmt::format("the key \"{}\" stands twice", key));
+        return fail(fmt::format("the key \"{}\" occurs twice", key));
     }
     return true;
 }

@@ -306,7 +306,7 @@ class BinaryReader {
             }
             dictionary.set(*key->string(), std::move(*value));
             if (dictionary.size() != i + 1) {
-                return fail(at, "a key that stands twice");
+                return fail(at, "a key that occurs twice");
             }
         }
         return Value(std::move(dictionary));

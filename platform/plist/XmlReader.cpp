@@ -348,7 +348,7 @@ class XmlReader {
         parent.dictionary.set(parent.key, std::move(value));
         parent.hasKey = false;
         if (parent.dictionary.size() == before) {
-            fail(fmt::format("the key \"{}\" stands twice", shortened(parent.key)));
+            fail(fmt::format("the key \"{}\" occurs twice", shortened(parent.key)));
         }
     }
 

@@ -85,15 +85,15 @@ TEST(ParseJson, NullInADictionaryMeansThatTheKeyIsAbsent) {
 }
 
 TEST(ParseJson, NullInAListIsRefused) {
-    EXPECT_EQ(problemOf("[1,null]"), "line 1, column 7: null cannot stand in a list");
+    EXPECT_EQ(problemOf("[1,null]"), "line 1, column 7: null is not allowed in a list");
 }
 
 TEST(ParseJson, KeyThatStandsTwiceIsRefused) {
-    EXPECT_EQ(problemOf("{\"a\":1,\n \"a\":2}"), "line 2, column 4: the key \"a\" stands twice");
-    EXPECT_EQ(problemOf(R"({"a":null,"a":2})"), "line 1, column 13: the key \"a\" stands twice");
-    EXPECT_EQ(problemOf(R"({"a":2,"a":null})"), "line 1, column 10: the key \"a\" stands twice");
-    EXPECT_EQ(problemOf(R"({"$$a":2,"$$a":1})"), "line 1, column 14: the key \"$$a\" stands twice");
-    EXPECT_EQ(problemOf(R"({"a":2,"\u0061":1})"), "line 1, column 15: the key \"a\" stands twice");
+    EXPECT_EQ(problemOf("{\"a\":1,\n \"a\":2}"), "line 2, column 4: the key \"a\" occurs twice");
+    EXPECT_EQ(problemOf(R"({"a":null,"a":2})"), "line 1, column 13: the key \"a\" occurs twice");
+    EXPECT_EQ(problemOf(R"({"a":2,"a":null})"), "line 1, column 10: the key \"a\" occurs twice");
+    EXPECT_EQ(problemOf(R"({"$$a":2,"$$a":1})"), "line 1, column 14: the key \"$$a\" occurs twice");
+    EXPECT_EQ(problemOf(R"({"a":2,"\u0061":1})"), "line 1, column 15: the key \"a\" occurs twice");
 }
 
 TEST(ParseJson, IntegersCoverTheWhole64BitRange) {
@@ -132,9 +132,9 @@ TEST(ParseJson, DataMustBeCanonicalBase64) {
 }
 
 TEST(ParseJson, WrappedFormsTakeOneTextAndStandAlone) {
-    EXPECT_NE(problemOf(R"({"$date":1})").find("takes a text"), std::string::npos);
-    EXPECT_NE(problemOf(R"({"$date":null})").find("takes a text"), std::string::npos);
-    EXPECT_NE(problemOf(R"({"$date":{}})").find("takes a text"), std::string::npos);
+    EXPECT_NE(problemOf(R"({"$date":1})").find("must be a text"), std::string::npos);
+    EXPECT_NE(problemOf(R"({"$date":null})").find("must be a text"), std::string::npos);
+    EXPECT_NE(problemOf(R"({"$date":{}})").find("must be a text"), std::string::npos);
     EXPECT_NE(problemOf(R"({"$data":"","a":1})").find("only key"), std::string::npos);
     EXPECT_NE(problemOf(R"({"a":1,"$data":""})").find("only key"), std::string::npos);
     EXPECT_NE(problemOf(R"({"a":null,"$data":""})").find("only key"), std::string::npos);

@@ -266,7 +266,7 @@ TEST(BinaryReader, ReferencesAndOffsetsToNothingAreRefused) {
 
 TEST(BinaryReader, KeysAreTextsThatStandOnce) {
     EXPECT_EQ(errorOf(binary({"\xD1\x01\x01"s, "\x10\x01"s})), "byte 8: a key that is no text");
-    EXPECT_EQ(errorOf(binary({"\xD2\x01\x01\x01\x01"s, "\x51k"s})), "byte 8: a key that stands twice");
+    EXPECT_EQ(errorOf(binary({"\xD2\x01\x01\x01\x01"s, "\x51k"s})), "byte 8: a key that occurs twice");
 }
 
 TEST(BinaryReader, WideReferencesAreRead) {

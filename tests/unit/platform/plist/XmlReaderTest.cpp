@@ -243,14 +243,14 @@ TEST(XmlReader, DictionaryIsKeysWithValuesInTurn) {
 
 TEST(XmlReader, KeyThatStandsTwiceIsRefused) {
     EXPECT_EQ(errorOf("<plist><dict><key>a</key><true/>\n<key>a</key><true/></dict></plist>"),
-              "line 2, column 20: the key \"a\" stands twice");
+              "line 2, column 20: the key \"a\" occurs twice");
     std::string many;
     for (int i = 0; i < 100; ++i) {
         many += "<key>k" + std::to_string(i) + "</key><true/>";
     }
     EXPECT_EQ(valueOf(plist("<dict>" + many + "</dict>")).dictionary()->size(), 100U);
     EXPECT_THAT(errorOf(plist("<dict>" + many + "<key>k50</key><true/></dict>")),
-                testing::EndsWith("the key \"k50\" stands twice"));
+                testing::EndsWith("the key \"k50\" occurs twice"));
 }
 
 TEST(XmlReader, ElementsInsideTextsAreRefused) {
