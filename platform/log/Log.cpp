@@ -5,15 +5,22 @@
 #include "platform/log/SystemLog.h"
 
 #include <atomic>
+#include <utility>
 
 namespace adminhost {
 namespace {
 
-/// Never destroyed: events may come from destructors at the very end of the process.
-QueuedSink& theStandardErrorSink() noexcept {
-    static auto& sink = *new QueuedSink(writeToStandardError);
-    return sink;
-}
+/// Holds an object that is never destroyed: events may come from destructors at the very end of the process.
+template <class T>
+union Lasting {
+    template <class... Arguments>
+    explicit Lasting(Arguments&&... arguments) : object(std::forward<Arguments>(arguments)...) {}
+    Lasting(const Lasting&) = delete;
+    Lasting& operator=(const Lasting&) = delete;
+    ~Lasting() {}  // NOLINT(modernize-use-equals-default): a default one would be deleted
+
+    T object;
+};
 
 std::atomic<LogSink*> currentSink = nullptr;
 
@@ -25,12 +32,13 @@ LogSink& current() noexcept {
 }  // namespace
 
 LogSink& syslogSink() noexcept {
-    static auto& socket = *new SystemLog("/dev/log");
-    static auto& sink = *new QueuedSink([](std::string_view line) { return socket.write(line); });
-    return sink;
+    static Lasting<SystemLog> socket("/dev/log");
+    static Lasting<QueuedSink> sink([](std::string_view text) { return socket.object.write(text); });
+    return sink.object;
 }
 LogSink& standardErrorSink() noexcept {
-    return theStandardErrorSink();
+    static Lasting<QueuedSink> sink(writeToStandardError);
+    return sink.object;
 }
 void setLogSink(LogSink& sink) noexcept {
     currentSink = &sink;
