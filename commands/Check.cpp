@@ -215,6 +215,9 @@ class Check {
         if ((key.rules & ruleArgument) != 0) {
             argument(*text, path);
         }
+        if ((key.rules & ruleAbsolutePath) != 0) {
+            absolutePath(*text, path);
+        }
         if ((key.rules & ruleNotAColumn) != 0 && entry != nullptr) {
             notAColumn(*text, *entry, path);
         }
@@ -257,6 +260,14 @@ class Check {
         }
         withoutNul(text, path);
         length(text, path);
+    }
+
+    void absolutePath(const std::string& text, const std::string& path) {
+        if (!text.starts_with('/')) {
+            add(path, "must be an absolute path: the service and its tools do not share a current directory",
+                "begin it with a slash");
+        }
+        withoutNul(text, path);
     }
 
     void notAColumn(const std::string& text, const EntryDescription& entry, const std::string& path) {

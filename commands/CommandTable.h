@@ -21,12 +21,13 @@ enum class KeyType : std::uint8_t { any, scalar, text, integer, real, boolean, d
 
 /// What a statement or an argument that carries the value demands of it. Bits.
 enum Rule : std::uint8_t {
-    ruleStatement = 1U,    ///< stands between double quotes in a statement
-    ruleNotAColumn = 2U,   ///< is not the name of a column: the database would read the column instead
-    ruleRowNumber = 4U,    ///< a whole number in decimal
-    ruleIdentifier = 8U,   ///< letters, digits and hyphens
-    ruleArgument = 16U,    ///< stands in a tool's argument of its own
-    ruleShortNames = 32U,  ///< the "shortName" entries of the list stand together in one tool's arguments
+    ruleStatement = 1U,      ///< stands between double quotes in a statement
+    ruleNotAColumn = 2U,     ///< is not the name of a column: the database would read the column instead
+    ruleRowNumber = 4U,      ///< a whole number in decimal
+    ruleIdentifier = 8U,     ///< letters, digits and hyphens
+    ruleArgument = 16U,      ///< stands in a tool's argument of its own
+    ruleAbsolutePath = 64U,  ///< begins with a slash
+    ruleShortNames = 32U,    ///< the "shortName" entries of the list stand together in one tool's arguments
 };
 
 /// What a change entry does. Bits, so that a key can name those for which it is read.

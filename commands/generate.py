@@ -23,6 +23,7 @@ RULES = {
     "row_number": "ruleRowNumber",
     "identifier": "ruleIdentifier",
     "argument": "ruleArgument",
+    "absolute_path": "ruleAbsolutePath",
     "short_names": "ruleShortNames",
 }
 RULE_TEXTS = {
@@ -31,6 +32,7 @@ RULE_TEXTS = {
     "row_number": "a decimal number",
     "identifier": "letters, digits and hyphens, not beginning with a hyphen",
     "argument": "no NUL, not beginning with a hyphen; at most 95 kB",
+    "absolute_path": "begins with a slash, no NUL",
     "short_names": "all names together at most 1.5 MB",
 }
 CHANGES = {"added": "changeAdded", "removed": "changeRemoved", "changed": "changeChanged", "ignored": "changeNothing"}

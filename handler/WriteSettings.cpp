@@ -32,16 +32,26 @@ std::int32_t runSetupScript(std::string_view name) {
     return adminhost::launch_task_with_input(adminhost::diskPath(script), {}, std::nullopt, nullptr, nullptr);
 }
 
-/// What is stored, or nothing to begin with. A file that stands there and was not loaded is going to be replaced; what
-/// it holds is the administrator's to look at, so it is kept beside its place first.
-Dictionary storedOrKept(std::optional<Dictionary> stored, const HostPath& path) {
-    if (!stored && adminhost::exists(adminhost::diskPath(path))) {
-        Error error;
-        const auto kept = adminhost::keepUnreadable(path, &error);
-        adminhost::logEvent("adminhost_lumio: " + path.text() + " cannot be loaded" +
-                            (kept ? "; it is kept as " + kept->text() : " or kept: " + textOf(error)));
+/// Keeps a file that exists but cannot be loaded beside its place, because it is going to be replaced: what it holds
+/// is the administrator's to look at.
+void keepBeside(const HostPath& path) {
+    Error error;
+    const auto kept = adminhost::keepUnreadable(path, &error);
+    adminhost::logEvent("adminhost_lumio: " + path.text() + " cannot be loaded" +
+                        (kept ? "; it is kept as " + kept->text() : " or kept: " + textOf(error)));
+}
+
+/// What a write begins with: the stored preferences, else the cached copy, else none.
+Dictionary startAt(const HostPath& path, const HostPath& cached) {
+    auto stored = SettingsStore::stored(path);
+    if (!stored) {
+        keepBeside(path);
+        return {};
     }
-    return stored ? *std::move(stored) : Dictionary();
+    if (!*stored) {
+        stored = SettingsStore::stored(cached);
+    }
+    return stored && *stored ? **std::move(stored) : Dictionary();
 }
 
 std::optional<SettingsWriteError> writeSettingsFile(const Dictionary& prefs, const HostPath& path) {
@@ -125,7 +135,11 @@ Response LumioRequestHandler::writeSettingsWithRequest(const Dictionary& request
 }
 
 std::int32_t LumioRequestHandler::setIdentityPreferencesFromConfig(Dictionary& config, Dictionary& result) {
-    Dictionary prefs = storedOrKept(identityPreferences(), identityPreferencesPath());
+    auto stored = storedIdentity();
+    if (!stored) {
+        keepBeside(identityPreferencesPath());
+    }
+    Dictionary prefs = stored && *stored ? **std::move(stored) : Dictionary();
     if (changes(config, "shared_filesystem", prefs)) {
         result.set("needsRecycleOrRestart", true);
     }
@@ -134,13 +148,25 @@ std::int32_t LumioRequestHandler::setIdentityPreferencesFromConfig(Dictionary& c
 }
 
 std::int32_t LumioRequestHandler::setMemberPreferencesFromConfig(Dictionary& config, Dictionary& result) {
-    Dictionary prefs = storedOrKept(memberPreferences(), memberPreferencesPath());
+    // Identity preferences that cannot be read say nothing about where the file belongs: nothing is written then, least
+    // of all below the default shared file system.
+    const auto identity = storedIdentity();
+    if (!identity) {
+        return statusOf(SettingsWriteError{"", 400, identity.error()}, result);
+    }
+    const HostPath path = memberPreferencesPath(*identity);
+    Dictionary prefs = startAt(path, cachedMemberPreferencesPath());
     copyKeys(memberPreferencesKeysToCopy(), config, prefs);
-    return statusOf(writeMemberPreferences(prefs), result);
+    return statusOf(writeSettingsFile(prefs, path), result);
 }
 
 std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& config, Dictionary& result) {
-    Dictionary prefs = storedOrKept(clusterPreferences(), clusterPreferencesPath());
+    const auto identity = storedIdentity();
+    if (!identity) {
+        return statusOf(SettingsWriteError{"", 400, identity.error()}, result);
+    }
+    const HostPath path = clusterPreferencesPath(*identity);
+    Dictionary prefs = startAt(path, cachedClusterPreferencesPath());
     if (changes(config, "nimbo_client_username", prefs)) {
         result.set("needsRecycleOrRestart", true);
     }
@@ -164,7 +190,7 @@ std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& co
             prefs.set(controllerKey, *std::move(host));
         }
     }
-    return statusOf(writeClusterPreferences(prefs), result);
+    return statusOf(writeSettingsFile(prefs, path), result);
 }
 
 std::optional<SettingsWriteError> LumioRequestHandler::writeIdentityPreferences(const Dictionary& prefs) {

@@ -5,6 +5,10 @@
 #include "platform/text/Utf8.h"
 #include "platform/value/ValueText.h"
 
+#include <cerrno>
+#include <chrono>
+#include <thread>
+
 #include <unicode/uchar.h>
 #include <unicode/utf8.h>
 
@@ -26,20 +30,20 @@ std::optional<Dictionary> load(const HostPath& path) {
     return std::move(*value->dictionary());
 }
 
-std::optional<Dictionary> loadOrCached(const HostPath& path, std::string_view cachedName) {
+std::optional<Dictionary> loadOrCached(const HostPath& path, const HostPath& cached) {
     // An entry that exists but cannot be loaded does not fall back to the cached copy.
-    if (adminhost::exists(adminhost::diskPath(path))) {
-        return load(path);
-    }
-    return load(HostPath(std::string(SettingsStore::stateDirectory).append(cachedName)));
+    return load(adminhost::exists(adminhost::diskPath(path)) ? path : cached);
 }
 
-std::optional<std::string> identityText(std::string_view key) {
-    const std::optional<Dictionary> identity = SettingsStore::identityPreferences();
+std::optional<std::string> identityText(const std::optional<Dictionary>& identity, std::string_view key) {
     if (!identity || !identity->contains(key)) {
         return std::nullopt;
     }
     return textOf(identity->get(key));
+}
+
+std::string sharedFilesystemOf(const std::optional<Dictionary>& identity) {
+    return identityText(identity, "shared_filesystem").value_or(std::string(SettingsStore::defaultSharedFilesystem));
 }
 
 bool separates(UChar32 character) noexcept {
@@ -105,11 +109,11 @@ std::optional<std::string_view> productionDatabase(std::string_view text) {
 }  // namespace
 
 std::string SettingsStore::sharedFilesystemPath() {
-    return identityText("shared_filesystem").value_or(std::string(defaultSharedFilesystem));
+    return sharedFilesystemOf(identityPreferences());
 }
 
 std::optional<std::string> SettingsStore::memberUUID() {
-    return identityText("member_uuid");
+    return identityText(identityPreferences(), "member_uuid");
 }
 
 HostPath SettingsStore::identityPreferencesPath() {
@@ -121,13 +125,54 @@ HostPath SettingsStore::libraryInformationPath() {
 }
 
 HostPath SettingsStore::memberPreferencesPath() {
+    return memberPreferencesPath(identityPreferences());
+}
+
+HostPath SettingsStore::memberPreferencesPath(const std::optional<Dictionary>& identity) {
     // Without a member UUID the name holds "(null)", and no such file is normally found.
-    return HostPath(sharedFilesystemPath() + "/Server/member_preferences_" + adminhost::textOf(memberUUID()) +
-                    ".plist");
+    return HostPath(sharedFilesystemOf(identity) + "/Server/member_preferences_" +
+                    adminhost::textOf(identityText(identity, "member_uuid")) + ".plist");
 }
 
 HostPath SettingsStore::clusterPreferencesPath() {
-    return HostPath(sharedFilesystemPath() + "/Server/cluster_preferences.plist");
+    return clusterPreferencesPath(identityPreferences());
+}
+
+HostPath SettingsStore::clusterPreferencesPath(const std::optional<Dictionary>& identity) {
+    return HostPath(sharedFilesystemOf(identity) + "/Server/cluster_preferences.plist");
+}
+
+HostPath SettingsStore::cachedMemberPreferencesPath() {
+    return HostPath(std::string(stateDirectory) + "/cached_member_preferences.plist");
+}
+
+HostPath SettingsStore::cachedClusterPreferencesPath() {
+    return HostPath(std::string(stateDirectory) + "/cached_cluster_preferences.plist");
+}
+
+adminhost::Result<std::optional<Dictionary>> SettingsStore::stored(const HostPath& path) {
+    adminhost::Error error;
+    std::optional<Value> value = adminhost::readPropertyList(adminhost::diskPath(path), &error);
+    if (value && value->dictionary() != nullptr) {
+        return std::move(*value->dictionary());
+    }
+    if (value) {
+        return adminhost::failure({"posix", EINVAL, "cannot read " + path.text() + ": not a dictionary"});
+    }
+    if (error.domain == "posix" && (error.code == ENOENT || error.code == ENOTDIR)) {
+        return std::nullopt;
+    }
+    return adminhost::failure(std::move(error));
+}
+
+adminhost::Result<std::optional<Dictionary>> SettingsStore::storedIdentity() {
+    constexpr int looks = 3;
+    auto identity = stored(identityPreferencesPath());
+    for (int look = 1; !identity && look < looks; ++look) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        identity = stored(identityPreferencesPath());
+    }
+    return identity;
 }
 
 std::optional<Dictionary> SettingsStore::identityPreferences() {
@@ -139,11 +184,11 @@ std::optional<Dictionary> SettingsStore::libraryInformation() {
 }
 
 std::optional<Dictionary> SettingsStore::memberPreferences() {
-    return loadOrCached(memberPreferencesPath(), "/cached_member_preferences.plist");
+    return loadOrCached(memberPreferencesPath(), cachedMemberPreferencesPath());
 }
 
 std::optional<Dictionary> SettingsStore::clusterPreferences() {
-    return loadOrCached(clusterPreferencesPath(), "/cached_cluster_preferences.plist");
+    return loadOrCached(clusterPreferencesPath(), cachedClusterPreferencesPath());
 }
 
 HostPath SettingsStore::dbPath() {

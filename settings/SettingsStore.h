@@ -6,6 +6,7 @@
 // parsed, or whose top level is no dictionary, counts as missing, and the database path always has an answer.
 
 #include "platform/files/Path.h"
+#include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
 #include <optional>
@@ -37,8 +38,25 @@ class SettingsStore {
     /// As memberPreferences.
     [[nodiscard]] static std::optional<adminhost::Dictionary> clusterPreferences();
 
+    // For a write, which must not take a file that could not be read for one that does not exist.
+
+    /// Loads a settings file. Returns nullopt if it does not exist; fails, with the reason, if it exists but cannot be
+    /// read or parsed, or is not a dictionary.
+    [[nodiscard]] static adminhost::Result<std::optional<adminhost::Dictionary>> stored(
+        const adminhost::HostPath& path);
+    /// The same for the identity preferences, which the service may be rewriting at this moment: looks a second and a
+    /// third time, 50 ms apart, before it fails.
+    [[nodiscard]] static adminhost::Result<std::optional<adminhost::Dictionary>> storedIdentity();
+    // The places that these identity preferences name, so that one reading decides on all of a write.
+    [[nodiscard]] static adminhost::HostPath memberPreferencesPath(
+        const std::optional<adminhost::Dictionary>& identity);
+    [[nodiscard]] static adminhost::HostPath clusterPreferencesPath(
+        const std::optional<adminhost::Dictionary>& identity);
+    [[nodiscard]] static adminhost::HostPath cachedMemberPreferencesPath();
+    [[nodiscard]] static adminhost::HostPath cachedClusterPreferencesPath();
+
     /// The service's database file: the production entry of the location file, else "Server/db.sqlite3" on the shared
-    /// file system. A relative path is answered as it stands. A location file above 1 MiB counts as unreadable.
+    /// file system. A relative path is returned as it stands. A location file above 1 MiB counts as unreadable.
     [[nodiscard]] static adminhost::HostPath dbPath();
     /// Whether a file system entry exists at dbPath.
     [[nodiscard]] static bool dbPathExists();

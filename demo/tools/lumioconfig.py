@@ -3,6 +3,7 @@
 Statuses: 0 done, 2 no such resource or person (nothing is changed), 64 usage, 74 database trouble.
 """
 
+import os
 import sqlite3
 import sys
 
@@ -24,7 +25,7 @@ def database_path(root):
     tokens = open(root + "/var/lumio/server/database.yml", encoding="utf-8").read().split()
     after = tokens[tokens.index("production:"):]
     path = after[after.index("database:") + 1].strip('"')
-    return root + path if path.startswith("/") else path
+    return root + os.path.normpath("/" + path)
 
 
 def is_account(root, record_type, name):

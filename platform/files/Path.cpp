@@ -1,11 +1,37 @@
 #include "platform/files/Path.h"
 
+#include <algorithm>
+#include <string_view>
+
 #include <sys/stat.h>
 
 namespace adminhost {
 namespace {
 
 std::string root = "/";
+
+/// The path without those steps "..", counted along its text, that would lead above its beginning. All else stays, so
+/// that a link on the way means what it means to the system.
+std::string withinRoot(std::string_view path) {
+    std::string kept;
+    std::size_t depth = 0;
+    while (!path.empty()) {
+        const std::size_t begin = std::min(path.find_first_not_of('/'), path.size());
+        const std::size_t end = std::min(path.find('/', begin), path.size());
+        const std::string_view step = path.substr(begin, end - begin);
+        const bool up = step == "..";
+        if (!up || depth > 0) {
+            kept += path.substr(0, end);
+        }
+        if (up) {
+            depth -= depth > 0 ? 1U : 0U;
+        } else if (!step.empty() && step != ".") {
+            ++depth;
+        }
+        path.remove_prefix(end);
+    }
+    return kept;
+}
 
 }  // namespace
 
@@ -21,10 +47,11 @@ const std::string& systemRoot() noexcept {
 }
 
 DiskPath diskPath(const HostPath& path) {
-    if (root == "/" || !path.text().starts_with('/')) {
+    if (root == "/" || path.text().empty()) {
         return DiskPath(path.text());
     }
-    return DiskPath(root + path.text());
+    std::string within = withinRoot(path.text());
+    return DiskPath(root + (within.starts_with('/') ? "" : "/") + within);
 }
 
 HostPath hostPath(const DiskPath& path) {

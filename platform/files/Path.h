@@ -39,7 +39,9 @@ class DiskPath {
 void setSystemRoot(std::string directory);
 [[nodiscard]] const std::string& systemRoot() noexcept;
 
-/// The host path below the system root. A relative path stays as it is: relative to the current directory.
+/// The host path below the system root. While that is "/" a path stays as it is, and a relative one is relative to the
+/// current directory. Below any other root a relative path begins at the root, and no step ".." of the text leads above
+/// it: whatever the path, nothing outside the root is touched, unless a link inside leads there.
 [[nodiscard]] DiskPath diskPath(const HostPath& path);
 
 /// The way back, for texts that people read: the host path of a place below the system root; any other path as it is.

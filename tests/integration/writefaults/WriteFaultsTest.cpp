@@ -202,6 +202,24 @@ TEST_F(WriteFaults, ProcessKilledAtEachCallLeavesEveryFileOldOrNewAndWhole) {
     EXPECT_GT(count.fresh, 0);
 }
 
+TEST_F(WriteFaults, OneFailedReadOfTheIdentityPreferencesMovesAndMisplacesNothing) {
+    int reads = 0;
+    for (const Call& call : callsOfTheWay()) {
+        if (call.name != "openat" || call.changes || call.line.find(identityFile) == std::string::npos) {
+            continue;
+        }
+        ++reads;
+        service.makeOld();
+        SCOPED_TRACE(call.line);
+        EXPECT_EQ(write({"-e", "trace=openat", "-e", "inject=openat:error=EIO:when=" + std::to_string(call.number)}),
+                  written)
+            << service.said();
+        EXPECT_EQ(service.contents(), after);
+        EXPECT_THAT(service.others(), IsEmpty());
+    }
+    EXPECT_GE(reads, 3);
+}
+
 TEST_F(WriteFaults, WriteThatTakesNoBytesIsAFailureAndNotALoop) {
     for (const Call& call : callsOfTheWay()) {
         if (call.name != "write") {

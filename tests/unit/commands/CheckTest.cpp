@@ -444,4 +444,20 @@ TEST(UnknownKeys, AreNoneWithoutAConfiguration) {
     EXPECT_THAT(lumio::unknownKeys("fly", {{"configuration", Dictionary{{"a", 1}}}}), IsEmpty());
 }
 
+TEST(CheckSettings, SharedFilesystemMustBeAnAbsolutePath) {
+    const auto written = [](const char* path) {
+        return lumio::checkRequest("writeSettings",
+                                   {{"configuration", Dictionary{{"shared_filesystem", Value(path)}}}});
+    };
+    EXPECT_THAT(written("/srv/media"), IsEmpty());
+    for (const char* path : {"srv/media", "./media", "../media", "", " /srv"}) {
+        EXPECT_THAT(written(path), only("configuration.shared_filesystem", "must be an absolute path")) << path;
+        EXPECT_THAT(lumio::checkRequest("validateSettings", {{"shared_filesystem", Value(path)}}),
+                    only("shared_filesystem", "must be an absolute path"));
+    }
+    EXPECT_THAT(lumio::checkRequest("writeSettings",
+                                    {{"configuration", Dictionary{{"shared_filesystem", std::string("/a\0b", 4)}}}}),
+                only("configuration.shared_filesystem", "NUL"));
+}
+
 }  // namespace

@@ -2,6 +2,8 @@
 #include "platform/value/ValueText.h"
 #include "tests/unit/handler/WriteSettingsFixture.h"
 
+#include <thread>
+
 namespace lumio {
 namespace {
 
@@ -159,6 +161,44 @@ TEST_F(WriteSettingsFailures, SharedFilesystemThatIsNoDirectoryIsAFailedWriteTha
     const Dictionary answer = write({{"shared_filesystem", "/flat"}});
     EXPECT_EQ(answer.get("writeStatus"), Value(400));
     EXPECT_THAT(*answer.get("errorDescription").string(), HasSubstr("/flat/Server/cluster_preferences.plist"));
+}
+
+/// The state that one failed read of the identity preferences in the middle of a write leaves a set operation in.
+TEST_F(WriteSettingsFailures, UnreadableIdentityPreferencesStopAClusterOrMemberWriteBeforeItTouchesAFile) {
+    for (const std::string_view file : {clusterFile, memberFile}) {
+        root.write("/Library/SorvaneProducer/Shared" + std::string(file).substr(7), root.read(file));
+    }
+    root.write(identityFile, "<plist version=\"1.0\"><dict><key>shared_files");
+    const std::string cluster = root.read(clusterFile);
+    const std::string member = root.read(memberFile);
+    Dictionary config{{"server_port", 1}, {"nimbo_grid_id", 1}};
+    Dictionary result;
+    EXPECT_EQ(handler.setClusterPreferencesFromConfig(config, result), 400);
+    EXPECT_THAT(*result.get("errorDescription").string(), HasSubstr(std::string(identityFile)));
+    EXPECT_EQ(handler.setMemberPreferencesFromConfig(config, result), 400);
+    for (const char* place : {"/shared", "/Library/SorvaneProducer/Shared"}) {
+        EXPECT_EQ(root.read(place + std::string(clusterFile).substr(7)), cluster) << place;
+        EXPECT_EQ(root.read(place + std::string(memberFile).substr(7)), member) << place;
+        EXPECT_EQ(std::distance(fs::directory_iterator(root.path(place + std::string("/Server"))), {}),
+                  place == std::string("/shared") ? 3 : 2)
+            << "nothing is kept beside them";
+    }
+    EXPECT_THAT(log.lines, IsEmpty());
+}
+
+TEST_F(WriteSettingsFailures, IdentityPreferencesThatAreBeingRewrittenAreLookedAtAgain) {
+    const std::string whole = root.read(identityFile);
+    root.write(identityFile, whole.substr(0, whole.size() / 2));
+    std::thread service([&] {
+        std::this_thread::sleep_for(std::chrono::milliseconds(20));
+        root.write("/whole.plist", whole);
+        fs::rename(root.path("/whole.plist"), root.path(identityFile));
+    });
+    EXPECT_EQ(write({{"server_port", 1}}).get("writeStatus"), Value(0));
+    service.join();
+    EXPECT_EQ(file(memberFile), (Dictionary{{"server_port", 1}, {"kept", "member"}}));
+    EXPECT_EQ(file(identityFile).get("kept"), Value("identity"));
+    EXPECT_THAT(log.lines, IsEmpty());
 }
 
 }  // namespace

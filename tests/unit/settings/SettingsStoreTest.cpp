@@ -130,13 +130,13 @@ TEST_F(SettingsStoreTest, TopLevelThatIsNoDictionaryLoadsAsNull) {
     EXPECT_EQ(SettingsStore::identityPreferences(), std::nullopt);
 }
 
-TEST_F(SettingsStoreTest, RelativeDatabaseValueIsAnsweredAsItStandsAndTestedAgainstTheCurrentDirectory) {
+TEST_F(SettingsStoreTest, RelativeDatabaseValueIsReturnedAsItStandsAndLookedForBelowTheSystemRoot) {
     EXPECT_EQ(databaseFor("production:\n  database: db/prod.sqlite3\n"), "db/prod.sqlite3");
     const std::filesystem::path before = std::filesystem::current_path();
-    std::filesystem::create_directories(root.path("/here/db"));
-    std::filesystem::current_path(root.path("/here"));
-    EXPECT_FALSE(SettingsStore::dbPathExists());
     root.write("/here/db/prod.sqlite3", "");
+    std::filesystem::current_path(root.path("/here"));
+    EXPECT_FALSE(SettingsStore::dbPathExists()) << "outside the root the current directory would count";
+    root.write("/db/prod.sqlite3", "");
     EXPECT_TRUE(SettingsStore::dbPathExists());
     std::filesystem::current_path(before);
 }

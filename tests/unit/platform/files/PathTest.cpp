@@ -28,10 +28,23 @@ TEST_F(Path, AbsoluteHostPathLiesBelowTheRoot) {
     EXPECT_EQ(diskPath(HostPath("/")).text(), "/srv/root/");
 }
 
-TEST_F(Path, RelativeHostPathStaysAsItIs) {
-    setSystemRoot("/srv/root");
+TEST_F(Path, RelativeHostPathStaysAsItIsOnlyWhileTheRootIsTheDisks) {
     EXPECT_EQ(diskPath(HostPath("db/prod.sqlite3")).text(), "db/prod.sqlite3");
+    EXPECT_EQ(diskPath(HostPath("../x")).text(), "../x");
+    setSystemRoot("/srv/root");
+    EXPECT_EQ(diskPath(HostPath("db/prod.sqlite3")).text(), "/srv/root/db/prod.sqlite3");
     EXPECT_EQ(diskPath(HostPath("")).text(), "");
+}
+
+TEST_F(Path, NoStepLeadsAboveTheRoot) {
+    setSystemRoot("/srv/root");
+    const auto on = [](const char* path) { return diskPath(HostPath(path)).text(); };
+    EXPECT_EQ(on("/../etc/passwd"), "/srv/root/etc/passwd");
+    EXPECT_EQ(on("../../etc"), "/srv/root/etc");
+    EXPECT_EQ(on("/a/../../etc"), "/srv/root/a/../etc");
+    EXPECT_EQ(on("a/./../../.."), "/srv/root/a/./..");
+    EXPECT_EQ(on(".."), "/srv/root/");
+    EXPECT_EQ(on("/..a/...//x"), "/srv/root/..a/...//x");
 }
 
 TEST_F(Path, TrailingSlashesOfTheRootAreDropped) {
