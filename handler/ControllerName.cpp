@@ -13,20 +13,28 @@ namespace lumio {
 using adminhost::Dictionary;
 using adminhost::NetService;
 
-std::optional<std::string> LumioRequestHandler::hostNameOfController(const std::string& name) {
+adminhost::Result<std::string> LumioRequestHandler::hostNameOfController(const std::string& name) {
     adminhost::EventLoop loop;
     NetService service(loop, "local", "_nimbo._tcp", name);
     service.setDelegate({[this](NetService& from, const Dictionary& error) { netService(from, error); },
                          [this](NetService& from) { netServiceDidStop(from); }});
     mBJError.reset();
     waitForAddress(service, loop, [this] { return mBJError.has_value(); });
-    std::optional<std::string> host;
+    adminhost::Result<std::string> host = adminhost::failure({"adminhost_lumio", 0, "no answer within ten seconds"});
     if (!service.addresses().empty()) {
         adminhost::HostName found = adminhost::hostNameOf(service.addresses().front());
         if (found.error != 0) {
-            adminhost::logEvent("adminhost_lumio: unable to resolve host: error = " + std::to_string(found.error));
+            const std::string words = "unable to resolve host: error = " + std::to_string(found.error);
+            adminhost::logEvent("adminhost_lumio: " + words);
+            host = adminhost::failure({"adminhost_lumio", found.error, words});
+        } else if (found.name) {
+            host = *std::move(found.name);
+        } else {
+            host = adminhost::failure({"adminhost_lumio", 0, "the host's address has no name"});
         }
-        host = std::move(found.name);
+    } else if (mBJError) {
+        host = adminhost::failure({"adminhost_lumio", mBJError->get("errorCode").integer().value_or(std::int64_t{0}),
+                                   textOf(mBJError->get("errorDescription"))});
     }
     service.stop();
     return host;

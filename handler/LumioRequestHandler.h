@@ -8,6 +8,7 @@
 
 #include "platform/framework/PluginRequestHandler.h"
 #include "platform/value/Error.h"
+#include "platform/value/Result.h"
 #include "platform/value/Value.h"
 #include "settings/SettingsStore.h"
 
@@ -105,9 +106,9 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     void markSetupDone();
     /// Whether the setup-done marker exists.
     [[nodiscard]] bool checkSetupDone() const;
-    /// Resolves the grid controller's DNS-SD name to the host name of its first address (ControllerName.cpp). Nothing
-    /// when it cannot be resolved, which is logged, within about ten seconds.
-    [[nodiscard]] std::optional<std::string> hostNameOfController(const std::string& name);
+    /// Resolves the grid controller's DNS-SD name to the host name of its first address (ControllerName.cpp), within
+    /// about ten seconds. A failure is logged where the resolver or the lookup reported it; the error says why.
+    [[nodiscard]] adminhost::Result<std::string> hostNameOfController(const std::string& name);
     // The resolver's callbacks, made on the calling thread while hostNameOfController waits.
     void netService(const adminhost::NetService& service, const Dictionary& didNotResolve);
     void netServiceDidStop(const adminhost::NetService& service);
@@ -116,6 +117,9 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     [[nodiscard]] static std::vector<std::string_view> listOfResourceDateKeys();
 
   private:
+    /// Runs the setup scripts and writes the three files, up to the first step that fails. Its status.
+    [[nodiscard]] std::int32_t writeSettingsFiles(Dictionary& config, Dictionary& result);
+
     /// What the resolver said in its most recent did-not-resolve callback.
     std::optional<Dictionary> mBJError;
 };

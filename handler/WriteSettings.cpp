@@ -1,4 +1,5 @@
 #include "handler/LumioRequestHandler.h"
+#include "handler/SettingsReports.h"
 #include "platform/crypto/Crypt.h"
 #include "platform/files/Make.h"
 #include "platform/files/ReplaceFile.h"
@@ -8,6 +9,9 @@
 #include "platform/value/ValueText.h"
 #include "resources/Property.h"
 
+#include <algorithm>
+#include <array>
+#include <initializer_list>
 #include <string>
 
 namespace lumio {
@@ -27,9 +31,70 @@ constexpr std::string_view localSuffix = ".local";
 /// Domain of the errors that the framework itself makes up, whose underlying error tells the story.
 constexpr std::string_view generalErrorDomain = "adminhost";
 
-std::int32_t runSetupScript(std::string_view name) {
+struct ScriptRun {
+    std::int32_t status;
+    std::string words;  ///< its error text
+};
+
+ScriptRun runSetupScript(std::string_view name) {
     const HostPath script(std::string("/usr/share/sorvaneproducer/lumioserverd/script/").append(name));
-    return adminhost::launch_task_with_input(adminhost::diskPath(script), {}, std::nullopt, nullptr, nullptr);
+    ScriptRun run{};
+    run.status = adminhost::launch_task_with_input(adminhost::diskPath(script), {}, std::nullopt, nullptr, &run.words);
+    run.words.erase(run.words.find_last_not_of(" \t\r\n") + 1);
+    return run;
+}
+
+constexpr std::string_view preferencesScript = "setup_lumioserverd_preferences";
+constexpr std::string_view libraryScript = "setup_lumioserverd_library";
+constexpr std::string_view resolveKey = "nimbo_controller_resolve_name";
+constexpr std::array<std::string_view, 3> resourceKeys = {"workflows", "cameras", "properties"};
+/// What reading adds to the settings, beside the library's own keys.
+constexpr std::array<std::string_view, 4> derivedKeys = {"default_shared_filesystem", "nimbo_client_password_is_set",
+                                                         "web_app_url", "catalog_url"};
+
+/// The keys of the cluster file, with the one that is never read.
+SettingKeys clusterKeys() {
+    SettingKeys keys = LumioRequestHandler::clusterPreferencesKeysToCopy();
+    keys.push_back(passwordKey);
+    return keys;
+}
+
+/// Reports the settings that a failed step kept from being written.
+void reportSkipped(std::initializer_list<SettingKeys> files, const Dictionary& config, const std::string& reason,
+                   const std::string& words) {
+    bool any = false;
+    for (const SettingKeys& keys : files) {
+        reportSettingsNotDone(keys, config, reason, words);
+        any = any || std::any_of(keys.begin(), keys.end(), [&](std::string_view key) { return config.contains(key); });
+    }
+    if (!any) {
+        reportSettingNotDone({}, reason, words);
+    }
+}
+
+void reportIgnored(const Dictionary& config) {
+    SettingKeys known = clusterKeys();
+    for (const SettingKeys& keys :
+         {LumioRequestHandler::identityPreferencesKeysToCopy(), LumioRequestHandler::memberPreferencesKeysToCopy()}) {
+        known.insert(known.end(), keys.begin(), keys.end());
+    }
+    known.insert(known.end(), resourceKeys.begin(), resourceKeys.end());
+    known.push_back(resolveKey);
+    SettingKeys readOnly = LumioRequestHandler::libraryInformationKeysToCopy();
+    readOnly.insert(readOnly.end(), derivedKeys.begin(), derivedKeys.end());
+    reportIgnoredKeys(config, known, readOnly);
+    if (config.contains(resolveKey) && !config.contains(controllerKey)) {
+        reportSettingNotDone(resolveKey, "It says how \"nimbo_controller\" is looked up, which is not given.");
+    }
+}
+
+/// Why a value could not be protected: the system's words on the key file.
+std::string keyFileWords() {
+    const HostPath file(SettingsStore::sharedFilesystemPath() + "/Server/Secrets/kek.plist");
+    const auto keys = SettingsStore::stored(file);
+    return !keys   ? keys.error().description.value_or("")
+           : *keys ? file.text() + " does not hold a usable key"
+                   : file.text() + " does not exist";
 }
 
 /// Keeps a file that exists but cannot be loaded beside its place, because it is going to be replaced: what it holds
@@ -99,29 +164,17 @@ Response LumioRequestHandler::writeSettingsWithRequest(const Dictionary& request
     const Dictionary* given = request.get("configuration").dictionary();
     Dictionary config = given == nullptr ? Dictionary() : *given;
 
-    // The identity preferences come first: the library script and the later files already see a new shared file system.
-    std::int32_t status = setupPreferences();
-    if (status == 0) {
-        status = setIdentityPreferencesFromConfig(config, result);
-    }
-    if (status == 0) {
-        status = setupLibrary();
-    }
-    if (status == 0) {
-        status = setClusterPreferencesFromConfig(config, result);
-    }
-    if (status == 0) {
-        status = setMemberPreferencesFromConfig(config, result);
-    }
-    if (status == 0) {
-        markSetupDone();
-    }
+    reportIgnored(config);
+    const std::int32_t status = writeSettingsFiles(config, result);
 
     // Resources are changed whatever became of the settings files.
-    setWorkflowACLWithRequest(config.get("workflows").array());
+    if (setWorkflowACLWithRequest(config.get("workflows").array()).kind() == Response::Kind::error &&
+        config.contains("workflows")) {
+        reportSettingNotDone("workflows", "This release does not change workflows.");
+    }
     processCameraChangesWithRequest(config.get("cameras").array());
     processPropertyChangesWithRequest(config.get("properties").array());
-    for (const std::string_view key : {"workflows", "cameras", "properties"}) {
+    for (const std::string_view key : resourceKeys) {
         config.remove(key);
     }
 
@@ -134,43 +187,103 @@ Response LumioRequestHandler::writeSettingsWithRequest(const Dictionary& request
     return result;
 }
 
+std::int32_t LumioRequestHandler::writeSettingsFiles(Dictionary& config, Dictionary& result) {
+    const SettingKeys identity = identityPreferencesKeysToCopy();
+    const SettingKeys member = memberPreferencesKeysToCopy();
+    // The identity preferences come first: the library script and the later files already see a new shared file system.
+    if (const ScriptRun run = runSetupScript(preferencesScript); run.status != 0) {
+        reportSkipped({identity, clusterKeys(), member}, config,
+                      "The preferences setup script failed with status " + std::to_string(run.status) + ".", run.words);
+        return run.status;
+    }
+    if (const std::int32_t status = setIdentityPreferencesFromConfig(config, result); status != 0) {
+        reportSettingsNotDone(clusterKeys(), config, "The identity preferences could not be written.",
+                              textOf(result.get("errorDescription")));
+        reportSettingsNotDone(member, config, "The identity preferences could not be written.",
+                              textOf(result.get("errorDescription")));
+        return status;
+    }
+    if (const ScriptRun run = runSetupScript(libraryScript); run.status != 0) {
+        reportSkipped({clusterKeys(), member}, config,
+                      "The library setup script failed with status " + std::to_string(run.status) + ".", run.words);
+        return run.status;
+    }
+    if (const std::int32_t status = setClusterPreferencesFromConfig(config, result); status != 0) {
+        reportSettingsNotDone(member, config, "The cluster preferences could not be written.",
+                              textOf(result.get("errorDescription")));
+        return status;
+    }
+    if (const std::int32_t status = setMemberPreferencesFromConfig(config, result); status != 0) {
+        return status;
+    }
+    markSetupDone();
+    return 0;
+}
+
+namespace {
+
+/// Writes the file of one set operation; reports what became of its keys.
+std::int32_t writeAndReport(const SettingKeys& keys, const Dictionary& config, const Dictionary& before,
+                            const Dictionary& after, const HostPath& path, Dictionary& result) {
+    const std::int32_t status = statusOf(writeSettingsFile(after, path), result);
+    if (status == 0) {
+        reportSettingChanges(keys, before, after);
+    } else {
+        reportSettingsNotDone(keys, config, "The file could not be written.", textOf(result.get("errorDescription")));
+    }
+    return status;
+}
+
+/// The status where the identity preferences cannot be read. They say nothing then about where a file belongs: nothing
+/// is written, least of all below the default shared file system.
+std::int32_t unknownPlace(const SettingKeys& keys, const Dictionary& config, const Error& error, Dictionary& result) {
+    reportSettingsNotDone(keys, config, "The identity preferences, which name the file's place, cannot be read.",
+                          error.description.value_or(""));
+    return statusOf(SettingsWriteError{"", 400, error}, result);
+}
+
+}  // namespace
+
 std::int32_t LumioRequestHandler::setIdentityPreferencesFromConfig(Dictionary& config, Dictionary& result) {
     auto stored = storedIdentity();
     if (!stored) {
         keepBeside(identityPreferencesPath());
     }
-    Dictionary prefs = stored && *stored ? **std::move(stored) : Dictionary();
+    const Dictionary before = stored && *stored ? **std::move(stored) : Dictionary();
+    Dictionary prefs = before;
     if (changes(config, "shared_filesystem", prefs)) {
         result.set("needsRecycleOrRestart", true);
     }
     copyKeys(identityPreferencesKeysToCopy(), config, prefs);
-    return statusOf(writeIdentityPreferences(prefs), result);
+    return writeAndReport(identityPreferencesKeysToCopy(), config, before, prefs, identityPreferencesPath(), result);
 }
 
 std::int32_t LumioRequestHandler::setMemberPreferencesFromConfig(Dictionary& config, Dictionary& result) {
-    // Identity preferences that cannot be read say nothing about where the file belongs: nothing is written then, least
-    // of all below the default shared file system.
     const auto identity = storedIdentity();
     if (!identity) {
-        return statusOf(SettingsWriteError{"", 400, identity.error()}, result);
+        return unknownPlace(memberPreferencesKeysToCopy(), config, identity.error(), result);
     }
     const HostPath path = memberPreferencesPath(*identity);
-    Dictionary prefs = startAt(path, cachedMemberPreferencesPath());
+    const Dictionary before = startAt(path, cachedMemberPreferencesPath());
+    Dictionary prefs = before;
     copyKeys(memberPreferencesKeysToCopy(), config, prefs);
-    return statusOf(writeSettingsFile(prefs, path), result);
+    return writeAndReport(memberPreferencesKeysToCopy(), config, before, prefs, path, result);
 }
 
 std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& config, Dictionary& result) {
     const auto identity = storedIdentity();
     if (!identity) {
-        return statusOf(SettingsWriteError{"", 400, identity.error()}, result);
+        return unknownPlace(clusterKeys(), config, identity.error(), result);
     }
     const HostPath path = clusterPreferencesPath(*identity);
-    Dictionary prefs = startAt(path, cachedClusterPreferencesPath());
+    const Dictionary before = startAt(path, cachedClusterPreferencesPath());
+    Dictionary prefs = before;
     if (changes(config, "nimbo_client_username", prefs)) {
         result.set("needsRecycleOrRestart", true);
     }
-    if (config.contains(passwordKey)) {
+    const bool passwordGiven = config.contains(passwordKey);
+    bool passwordProtected = true;
+    if (passwordGiven) {
         std::string password = textOf(config.get(passwordKey));
         const adminhost::ScopedCleanse<std::string> wiped(password);
         config.remove(passwordKey);
@@ -180,17 +293,33 @@ std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& co
             if (auto encrypted = Property::encryptValue(password)) {
                 prefs.set(passwordKey, *std::move(encrypted));
             } else {
+                passwordProtected = false;
                 adminhost::logEvent("adminhost_lumio: nimbo_client_password encryption failed");
+                reportSettingNotDone(passwordKey, "The password could not be encrypted; the stored one is unchanged.",
+                                     keyFileWords());
             }
         }
     }
     copyKeys(clusterPreferencesKeysToCopy(), config, prefs);
+    std::string unresolved;
     if (const auto name = nameToResolve(config)) {
         if (auto host = hostNameOfController(*name)) {
             prefs.set(controllerKey, *std::move(host));
+        } else {
+            unresolved = host.error().description.value_or("not found");
         }
     }
-    return statusOf(writeSettingsFile(prefs, path), result);
+    const std::int32_t status = writeAndReport(clusterPreferencesKeysToCopy(), config, before, prefs, path, result);
+    if (status == 0) {
+        reportSecretChange(passwordKey, before, prefs);
+        if (!unresolved.empty()) {
+            reportSettingNotDone(controllerKey, "The name could not be resolved; it is stored as it was given.",
+                                 unresolved);
+        }
+    } else if (passwordGiven && passwordProtected) {
+        reportSettingNotDone(passwordKey, "The file could not be written.", textOf(result.get("errorDescription")));
+    }
+    return status;
 }
 
 std::optional<SettingsWriteError> LumioRequestHandler::writeIdentityPreferences(const Dictionary& prefs) {
@@ -206,11 +335,11 @@ std::optional<SettingsWriteError> LumioRequestHandler::writeMemberPreferences(co
 }
 
 std::int32_t LumioRequestHandler::setupPreferences() const {
-    return runSetupScript("setup_lumioserverd_preferences");
+    return runSetupScript(preferencesScript).status;
 }
 
 std::int32_t LumioRequestHandler::setupLibrary() const {
-    return runSetupScript("setup_lumioserverd_library");
+    return runSetupScript(libraryScript).status;
 }
 
 void LumioRequestHandler::markSetupDone() {
@@ -224,8 +353,10 @@ void LumioRequestHandler::markSetupDone() {
                             ", error: " + textOf(*error));
     }
     const HostPath marker{std::string(setupDoneMarker)};
-    if (adminhost::makeEmptyFile(adminhost::diskPath(marker))) {
+    if (const auto error = adminhost::makeEmptyFile(adminhost::diskPath(marker))) {
         adminhost::logEvent("adminhost_lumio: failed to create file at path: " + marker.text());
+        reportSettingNotDone({}, "The mark that the service is configured, " + marker.text() + ", was not created.",
+                             error->description.value_or(""));
     }
 }
 
