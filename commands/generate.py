@@ -50,8 +50,10 @@ COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline
 # What programs that compare and write a desired state have to know of a key (README.md).
 STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_file", "kind", "kinds", "secret_if", "file",
                "locates", "restart", "looked_up", "shown_by"}
-KEY_WORDS = {"type", "entered_as", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"} | STATE_WORDS
-ANSWER_WORDS = {"type", "unit", "secret", "column", "help", "title", "kind"}
+# What a setting's number means and may sensibly be; described where the setting is read.
+RANGE_WORDS = {"unit", "minimum", "maximum"}
+KEY_WORDS = {"type", "entered_as", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"} | STATE_WORDS | RANGE_WORDS
+ANSWER_WORDS = {"type", "secret", "column", "help", "title", "kind"} | RANGE_WORDS
 ENTRY_WORDS = {"added_by", "removed_by", "first", "leading_zeros", "otherwise", "added_kinds", "columns", "together"}
 
 
@@ -82,6 +84,8 @@ def check_keys(keys, words, what, names):
         need(set(key.get("rules", [])) <= set(RULES), f"{where}: unknown rule")
         need(set(key.get("for", [])) <= set(CHANGES), f"{where}: unknown change")
         need(key.get("unit", "bytes") in UNITS, f"{where}: unknown unit")
+        need(all(isinstance(key.get(word, 0), int) for word in ("minimum", "maximum")), f"{where}: not a whole number")
+        need(key.get("minimum", 0) <= key.get("maximum", key.get("minimum", 0)), f"{where}: minimum is above maximum")
         need(set(key.get("entry", {})) <= ENTRY_WORDS, f"{where}: unknown word in entry")
         need(key.get("help", "").strip(), f"{where}: help is missing")
         for word in ("identity", "kind"):  # of a list's element: keys of it
@@ -134,19 +138,30 @@ def from_json(pairs):
     return value
 
 
-def included(commands, answer, includes, seen):
-    """The answer keys with those taken over from other commands' answers."""
-    answer = dict(answer)
-    for under, source in includes.items():
-        name, _, path = source.partition(":")
-        need(name in commands and name not in seen, f"include: no command {name}")
-        other = commands[name]
-        keys = included(commands, other.get("answer", {}), other.get("include", {}), seen | {name})
-        need(not path or path in keys, f"include: {source} is not described")
-        for key, description in keys.items():
+def taken_over(commands, own, what, name, seen):
+    """The keys of a command with those that it takes over from others: what is "keys" or "answer"."""
+    keys = dict(own)
+    for under, source in commands[name].get("include", {}).get(what, {}).items():
+        other, _, path = source.partition(":")
+        need(other in commands, f"include: no command {other}")
+        need((other, what) not in seen or other == name and what == "keys", f"include: {source} goes round in a circle")
+        theirs = dict(own) if other == name else taken_over(commands, commands[other].get(what, {}), what, other,
+                                                            seen | {(name, what)})
+        need(not path or path in theirs, f"include: {source} is not described")
+        for key, description in theirs.items():
             if key == path or not path or key.startswith((path + ".", path + "[]")):
-                answer.setdefault((under + key[len(path):]).strip("."), description)
-    return answer
+                keys.setdefault((under + key[len(path):]).strip("."), description)
+    return keys
+
+
+def in_tree_order(keys, under=""):
+    """Each key right behind its parent, so that what was taken over stands where it belongs."""
+    ordered = {}
+    for path, key in keys.items():
+        if parent(path) == under:
+            ordered[path] = key
+            ordered |= in_tree_order(keys, path)
+    return ordered
 
 
 def load(directory):
@@ -165,11 +180,16 @@ def load(directory):
             need(isinstance(command.get("deadline_seconds", 1), int) and command.get("deadline_seconds", 1) > 0,
                  "deadline_seconds must be a whole number above 0")
             need(all(isinstance(name, str) and name for name in command.get("needs", [])), "needs must be a list of names")
-            command["all_answers"] = included(commands, command.get("answer", {}), command.get("include", {}), {name})
-            keys = command.setdefault("keys", {})
+            need(set(command.get("include", {})) <= {"keys", "answer"}, "include has the tables keys and answer")
+            command["all_answers"] = taken_over(commands, command.get("answer", {}), "answer", name, {(name, "answer")})
+            keys = {path: dict(key) for path, key in
+                    taken_over(commands, command.get("keys", {}), "keys", name, {(name, "keys")}).items()}
             for path, key in keys.items():  # a setting is described once, where it is read
-                key.setdefault("help", command["all_answers"].get(path, {}).get("help", ""))
+                for word in {"help"} | RANGE_WORDS:
+                    if word in command["all_answers"].get(path, {}):
+                        key.setdefault(word, command["all_answers"][path][word])
             check_keys(keys, KEY_WORDS, "key", set(commands))
+            command["all_keys"] = in_tree_order(keys)
             check_keys(command["all_answers"], ANSWER_WORDS, "answer", set(commands))
             for error in command.get("errors", []):
                 need(set(error) in ({"key", "meaning"}, {"code", "meaning"}), "an error has key or code, and meaning")
@@ -188,8 +208,10 @@ def load(directory):
     for word in ("read", "write"):
         need(sum(command.get("state") == word for command in commands.values()) <= 1, f"two commands have state = {word}")
     need(all(command.get("state", "read") in ("read", "write") for command in commands.values()), "state is read or write")
-    orders = [command["order"] for command in commands.values()]
-    need(len(set(orders)) == len(orders), "two commands have the same order")
+    by_order = {}
+    for name, command in commands.items():
+        other = by_order.setdefault(command["order"], name)
+        need(other == name, f"{other}.toml and {name}.toml have the same order, {command['order']}")
     return dict(sorted(commands.items(), key=lambda item: item[1]["order"]))
 
 
@@ -205,8 +227,8 @@ def key_description(path, key):
     for word in ("allowed", "rules"):
         if key.get(word):
             described[word] = key[word]
-    for word in ("unit", "column", "title"):
-        if key.get(word):
+    for word in ("unit", "minimum", "maximum", "column", "title"):
+        if word in key:
             described[word] = key[word]
     for word in sorted(STATE_WORDS):
         if key.get(word):
@@ -228,7 +250,7 @@ def describe(name, command):
         "summary": command["summary"].strip(),
         "description": " ".join(command.get("description", command["summary"]).split()),
         **{word: command[word] for word in ("state", "parts") if word in command},
-        "keys": [key_description(path, key) for path, key in command["keys"].items()],
+        "keys": [key_description(path, key) for path, key in command["all_keys"].items()],
         "answer": [key_description(path, key) for path, key in command["all_answers"].items()],
         "errors": command.get("errors", []),
         "example": command["example"],
@@ -303,7 +325,7 @@ class Table:
             flags = ", ".join("true" if command.get(flag) else "false" for flag in ("shows_revision", "takes_revision"))
             rows.append(f"{{{quoted(name)}, {quoted(described['summary'])}, adminhost::Access::{command['access']}, {flags}, "
                         f"{self.texts(command.get('needs'))}, {command.get('deadline_seconds', 0)}, "
-                        f"{self.keys(command['keys'], '')}}}")
+                        f"{self.keys(command['all_keys'], '')}}}")
         self.lines.append("constexpr CommandDescription table[] = {\n    " + ",\n    ".join(rows) + ",\n};")
 
     def tokens(self, value, key=""):
@@ -359,6 +381,9 @@ def key_rows(keys):
             notes.append("Secret.")
         for rule in key.get("rules", []):
             notes.append(f"Check: {RULE_TEXTS[rule]}.")
+        if "minimum" in key:
+            notes.append(f"Sensible: {key['minimum']} to {key['maximum']}." if "maximum" in key
+                         else f"Sensible: {key['minimum']} or more.")
         kind = TYPE_TEXTS.get(key["type"], key["type"])
         if key.get("unit") and key["unit"] != "people":
             kind += f", {key['unit']}"

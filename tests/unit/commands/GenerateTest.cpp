@@ -4,6 +4,7 @@
 
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <string>
 
 #include <gmock/gmock.h>
@@ -77,6 +78,33 @@ TEST_F(Generate, RefusesWhatIsNotRightAndNamesTheFile) {
     EXPECT_THAT(with("order = 1", "order = 1\nneeds = [1]"), HasSubstr("needs must be a list of names"));
 }
 
+TEST_F(Generate, RangeOfANumberMustBeOne) {
+    EXPECT_THAT(with("help", "minimum = 1\nmaximum = 9\nunit = \"minutes\"\nhelp"), HasSubstr("status 0"));
+    EXPECT_THAT(with("help", "minimum = 2\nmaximum = 1\nhelp"), HasSubstr("key a: minimum is above maximum"));
+    EXPECT_THAT(with("help", "maximum = \"9\"\nhelp"), HasSubstr("key a: not a whole number"));
+}
+
+TEST_F(Generate, RequestKeysAreTakenOverFromOtherCommandsAndFromTheSameOne) {
+    write("doIt.toml", sound);
+    std::string text = sound;
+    text.replace(0, 9, "order = 2");
+    write("doThat.toml", text +
+                             "[keys.b]\ntype = \"dictionary\"\nhelp = \"A B.\"\n"
+                             "[include.keys]\n\"b.c\" = \"doIt:a\"\n\"b.d\" = \"doThat:a\"\n");
+    EXPECT_EQ(table(), "status 0");
+    std::ifstream file(_directory / "table.cpp");
+    const std::string made(std::istreambuf_iterator<char>(file), {});
+    EXPECT_THAT(made, HasSubstr("\"b.c\""));
+    EXPECT_THAT(made, HasSubstr("\"b.d\""));
+    write("doThat.toml", text + "[include.keys]\n\"b\" = \"doIt:z\"\n");
+    EXPECT_THAT(table(), HasSubstr("doThat.toml: include: doIt:z is not described"));
+    write("doThat.toml", text + "[include.keys]\n\"b\" = \"doNothing:a\"\n");
+    EXPECT_THAT(table(), HasSubstr("no command doNothing"));
+    write("doIt.toml", std::string(sound) + "[include.keys]\n\"x\" = \"doThat:a\"\n");
+    write("doThat.toml", text + "[include.keys]\n\"y\" = \"doIt:a\"\n");
+    EXPECT_THAT(table(), HasSubstr("goes round in a circle"));
+}
+
 TEST_F(Generate, RefusesWordsOfTheDesiredStateThatNameNothing) {
     EXPECT_THAT(with("order = 1", "order = 1\nstate = \"change\""), HasSubstr("state is read or write"));
     EXPECT_THAT(with("help", "identity = \"_id_\"\nhelp"), HasSubstr("key a: identity is not described"));
@@ -94,7 +122,7 @@ TEST_F(Generate, RefusesWordsOfTheDesiredStateThatNameNothing) {
 TEST_F(Generate, RefusesTwoCommandsOfTheSameOrder) {
     write("doIt.toml", sound);
     write("doThat.toml", sound);
-    EXPECT_THAT(table(), HasSubstr("two commands have the same order"));
+    EXPECT_THAT(table(), HasSubstr("doIt.toml and doThat.toml have the same order, 1"));
 }
 
 TEST_F(Generate, NoticesAStalePage) {
