@@ -87,6 +87,9 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     [[nodiscard]] static std::vector<std::string_view> memberPreferencesKeysToCopy();
     [[nodiscard]] static std::vector<std::string_view> clusterPreferencesKeysToCopy();
 
+    /// The library's keys and those that reading adds: a write ignores them.
+    [[nodiscard]] static std::vector<std::string_view> keysThatAreOnlyRead();
+
     // Pieces of writing settings
 
     // Each runs the service's setup script of that name; its output is dropped. Its exit status, 0 on success.

@@ -138,6 +138,13 @@ std::vector<std::string_view> LumioRequestHandler::libraryInformationKeysToCopy(
     return {"library_version", "server_uuid"};
 }
 
+std::vector<std::string_view> LumioRequestHandler::keysThatAreOnlyRead() {
+    std::vector<std::string_view> keys = libraryInformationKeysToCopy();
+    keys.insert(keys.end(),
+                {"default_shared_filesystem", "nimbo_client_password_is_set", "web_app_url", "catalog_url"});
+    return keys;
+}
+
 std::vector<std::string_view> LumioRequestHandler::memberPreferencesKeysToCopy() {
     return {"server_host",
             "server_port",

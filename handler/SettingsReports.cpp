@@ -2,7 +2,6 @@
 
 #include "platform/framework/Report.h"
 
-#include <algorithm>
 #include <utility>
 
 namespace lumio {
@@ -68,19 +67,6 @@ void reportSettingsNotDone(const SettingKeys& keys, const Dictionary& config, co
     for (const std::string_view key : keys) {
         if (config.contains(key)) {
             reportSettingNotDone(key, reason, words);
-        }
-    }
-}
-
-void reportIgnoredKeys(const Dictionary& config, const SettingKeys& known, const SettingKeys& readOnly) {
-    const auto isIn = [](const SettingKeys& keys, std::string_view key) {
-        return std::find(keys.begin(), keys.end(), key) != keys.end();
-    };
-    for (const adminhost::DictionaryEntry& entry : config) {
-        if (isIn(readOnly, entry.key)) {
-            reportSettingNotDone(entry.key, "This key can only be read; it was ignored.");
-        } else if (!isIn(known, entry.key)) {
-            reportSettingNotDone(entry.key, "No setting has this name; it was ignored.");
         }
     }
 }

@@ -23,7 +23,5 @@ void reportSettingNotDone(std::string_view key, std::string reason, std::string 
 /// Reports each of the keys that the configuration holds.
 void reportSettingsNotDone(const SettingKeys& keys, const adminhost::Dictionary& config, const std::string& reason,
                            const std::string& words);
-/// Reports the keys of the configuration that are ignored: unknown ones, and those that can only be read.
-void reportIgnoredKeys(const adminhost::Dictionary& config, const SettingKeys& known, const SettingKeys& readOnly);
 
 }  // namespace lumio

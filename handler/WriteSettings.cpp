@@ -48,10 +48,6 @@ constexpr std::string_view preferencesScript = "setup_lumioserverd_preferences";
 constexpr std::string_view libraryScript = "setup_lumioserverd_library";
 constexpr std::string_view resolveKey = "nimbo_controller_resolve_name";
 constexpr std::array<std::string_view, 3> resourceKeys = {"workflows", "cameras", "properties"};
-/// What reading adds to the settings, beside the library's own keys.
-constexpr std::array<std::string_view, 4> derivedKeys = {"default_shared_filesystem", "nimbo_client_password_is_set",
-                                                         "web_app_url", "catalog_url"};
-
 /// The keys of the cluster file, with the one that is never read.
 SettingKeys clusterKeys() {
     SettingKeys keys = LumioRequestHandler::clusterPreferencesKeysToCopy();
@@ -69,22 +65,6 @@ void reportSkipped(std::initializer_list<SettingKeys> files, const Dictionary& c
     }
     if (!any) {
         reportSettingNotDone({}, reason, words);
-    }
-}
-
-void reportIgnored(const Dictionary& config) {
-    SettingKeys known = clusterKeys();
-    for (const SettingKeys& keys :
-         {LumioRequestHandler::identityPreferencesKeysToCopy(), LumioRequestHandler::memberPreferencesKeysToCopy()}) {
-        known.insert(known.end(), keys.begin(), keys.end());
-    }
-    known.insert(known.end(), resourceKeys.begin(), resourceKeys.end());
-    known.push_back(resolveKey);
-    SettingKeys readOnly = LumioRequestHandler::libraryInformationKeysToCopy();
-    readOnly.insert(readOnly.end(), derivedKeys.begin(), derivedKeys.end());
-    reportIgnoredKeys(config, known, readOnly);
-    if (config.contains(resolveKey) && !config.contains(controllerKey)) {
-        reportSettingNotDone(resolveKey, "It says how \"nimbo_controller\" is looked up, which is not given.");
     }
 }
 
@@ -164,7 +144,9 @@ Response LumioRequestHandler::writeSettingsWithRequest(const Dictionary& request
     const Dictionary* given = request.get("configuration").dictionary();
     Dictionary config = given == nullptr ? Dictionary() : *given;
 
-    reportIgnored(config);
+    if (config.contains(resolveKey) && !config.contains(controllerKey)) {
+        reportSettingNotDone(resolveKey, "It says how \"nimbo_controller\" is looked up, which is not given.");
+    }
     const std::int32_t status = writeSettingsFiles(config, result);
 
     // Resources are changed whatever became of the settings files.

@@ -52,6 +52,13 @@ const Operation* operationNamed(std::string_view command) noexcept {
     return found == std::end(operations) ? nullptr : found;
 }
 
+bool isOnlyRead(std::string_view keyPath) {
+    constexpr std::string_view configuration = "configuration.";
+    const auto keys = LumioRequestHandler::keysThatAreOnlyRead();
+    return keyPath.starts_with(configuration) &&
+           std::find(keys.begin(), keys.end(), keyPath.substr(configuration.size())) != keys.end();
+}
+
 class LumioPlugin final : public adminhost::Plugin {
   public:
     std::string_view name() override { return "lumio"; }
@@ -83,8 +90,11 @@ class LumioPlugin final : public adminhost::Plugin {
     }
 
     Response perform(std::string_view command, const Dictionary& request) override {
-        for (std::string& keyPath : lumio::unknownKeys(command, request)) {
-            adminhost::reportNotDone({std::move(keyPath), "The key is not known, so it was ignored.", {}});
+        for (const std::string& keyPath : lumio::unknownKeys(command, request)) {
+            adminhost::reportNotDone({keyPath,
+                                      isOnlyRead(keyPath) ? "This key can only be read, so it was ignored."
+                                                          : "The key is not known, so it was ignored.",
+                                      {}});
         }
         const Operation* operation = operationNamed(command);
         return operation == nullptr ? Response::error("UNKNOWN_COMMAND", "The plug-in does not serve this command.")

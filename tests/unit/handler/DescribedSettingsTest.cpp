@@ -68,7 +68,7 @@ TEST(DescribedSettings, ReadKeysAreThoseOfTheCodeAndWhatReadingDerives) {
                   "properties"};
     for (const auto& table :
          {LumioRequestHandler::identityPreferencesKeysToCopy(), LumioRequestHandler::memberPreferencesKeysToCopy(),
-          LumioRequestHandler::clusterPreferencesKeysToCopy(), LumioRequestHandler::libraryInformationKeysToCopy()}) {
+          LumioRequestHandler::clusterPreferencesKeysToCopy(), LumioRequestHandler::keysThatAreOnlyRead()}) {
         expected.insert(table.begin(), table.end());
     }
     Keys read;
