@@ -90,6 +90,10 @@ std::string messageOf(const DaemonReply& reply) {
            findingsText(said->get("findings"));
 }
 
+Failure noPlugin() {
+    return {ExitStatus::failed, "the daemon has loaded no plug-in; adminhostd --check shows why"};
+}
+
 /// Whether a value under a status or error key means failure.
 bool isSet(const Value& value) {
     if (const auto number = value.integer()) {
@@ -170,7 +174,7 @@ CommandRef DaemonClient::command(const std::string& name) {
         return found.front();
     }
     if (plugins().empty()) {
-        throw Failure(ExitStatus::failed, "the daemon has loaded no plug-in; its log says why");
+        throw noPlugin();
     }
     if (found.empty()) {
         throw usageError("command not found: " + name + "; the commands are " + joined(plugins()));
@@ -189,6 +193,9 @@ CommandRef DaemonClient::stateCommand(std::string_view state) {
     }
     if (found.size() == 1) {
         return found.front();
+    }
+    if (plugins().empty()) {
+        throw noPlugin();
     }
     throw usageError(found.empty() ? "no plug-in of the daemon has a state that can be compared and written"
                                    : "several plug-ins have a state that can be written; use their commands");

@@ -40,7 +40,7 @@ struct ReportedChange {
 
 /// A part of a request that was not carried out, or was ignored.
 struct ReportedGap {
-    std::string keyPath;  ///< "configuration.cameras.0.name"
+    std::string keyPath;  ///< "list.0.name"
     std::string reason;
     std::string toolMessage;
 };

@@ -14,7 +14,7 @@ namespace adminhost::ctl {
 
 /// One key of a request or an answer.
 struct DescribedKey {
-    std::string path;  ///< "configuration.properties[].name"
+    std::string path;  ///< "list[].name"
     std::string type;  ///< "text", "integer", "boolean", "list", "dictionary", "scalar", ...
     std::string enteredAs;
     std::string unit;

@@ -69,7 +69,7 @@ std::optional<std::size_t> indexOf(const std::string& segment) {
     return result.ec == std::errc() && result.ptr == end ? std::optional(index) : std::nullopt;
 }
 
-/// The path as descriptions write it ("configuration.properties.0.name" is "configuration.properties[].name"); marks
+/// The path as descriptions write it ("list.0.name" is "list[].name"); marks
 /// the steps that are elements of a list.
 std::string describedPath(const Description& command, std::vector<Step>& steps) {
     std::string path;

@@ -57,7 +57,7 @@ void writeValue(const Context& context, const Value& value, const Description& d
 /// Prints the error of an answer (errorOf()) on standard error; done if there is none.
 [[nodiscard]] ExitStatus reportAnswered(const Context& context, const std::string& error);
 
-/// "configuration.cameras.0: reason (words of the tool)".
+/// "list.0: reason (words of the tool)".
 [[nodiscard]] std::string gapText(const ReportedGap& gap);
 
 /// Prints on standard error why the answer to a request is missing and what became of it, without repeating it: what

@@ -11,8 +11,8 @@ namespace adminhost::ctl {
                                                       const std::vector<std::string>& keys);
 
 [[nodiscard]] ExitStatus history(const Context& context, std::span<const std::string> arguments);
-/// Writes the settings of an entry as every verb that changes something does it (Writing.h). What is set now and was
-/// not set then stays, and is named with failed; a password stays too, and is said.
+/// Writes the settings of an entry as every verb that changes something does it (Writing.h). A setting that is set now
+/// and was not set then stays: it is named, and the status is failed. A secret stays too, with a note.
 [[nodiscard]] ExitStatus rollback(const Context& context, std::span<const std::string> arguments);
 
 }  // namespace adminhost::ctl
