@@ -5,6 +5,7 @@
 #include "platform/text/Utf8.h"
 
 #include <algorithm>
+#include <array>
 #include <charconv>
 #include <cmath>
 #include <utility>
@@ -58,7 +59,23 @@ void Writer::writeReal(double real) {
     }
 }
 
+/// Bytes of ASCII that stand for themselves in a text, which most texts consist of.
+constexpr std::array<bool, 256> standForThemselves = [] {
+    std::array<bool, 256> plain{};
+    for (std::size_t byte = 0x20; byte < 0x7f; ++byte) {
+        plain[byte] = byte != '"' && byte != '\\';
+    }
+    return plain;
+}();
+
 void Writer::writeString(std::string_view bytes) {
+    if (std::all_of(bytes.begin(), bytes.end(),
+                    [](char c) { return standForThemselves[static_cast<unsigned char>(c)]; })) {
+        _text += '"';
+        _text += bytes;
+        _text += '"';
+        return;
+    }
     if (!isUtf8(bytes)) {
         writeString(utf8Of(bytes));
         return;
@@ -145,7 +162,11 @@ void Writer::write(const Value& value, std::size_t level) {
             for (const DictionaryEntry& entry : *value.dictionary()) {
                 _text += std::exchange(separator, ",");
                 newLine(level + 1);
-                writeString(entry.key.starts_with('$') ? '$' + entry.key : entry.key);
+                if (entry.key.starts_with('$')) {
+                    writeString('$' + entry.key);
+                } else {
+                    writeString(entry.key);
+                }
                 _text += _pretty ? ": " : ":";
                 write(entry.value, level + 1);
             }

@@ -8,30 +8,36 @@
 
 namespace adminhost {
 std::string isoTextOf(std::chrono::sys_seconds date) {
+    using namespace std::chrono;
+    // The C library looks at the zone file even for UTC, and can do nothing that this does not for these years.
+    constexpr sys_days firstDay = year(0) / January / 1;
+    constexpr sys_days lastDay = year(9999) / December / 31;
+    if (date >= firstDay && date < lastDay + days(1)) {
+        const auto day = floor<days>(date);
+        const year_month_day calendar(day);
+        const hh_mm_ss time(date - day);
+        std::string text = "0000-00-00T00:00:00Z";
+        const auto put = [&](std::size_t at, long number) {
+            text[at] = static_cast<char>('0' + number / 10);
+            text[at + 1] = static_cast<char>('0' + number % 10);
+        };
+        put(0, static_cast<int>(calendar.year()) / 100);
+        put(2, static_cast<int>(calendar.year()) % 100);
+        put(5, static_cast<long>(static_cast<unsigned>(calendar.month())));
+        put(8, static_cast<long>(static_cast<unsigned>(calendar.day())));
+        put(11, time.hours().count());
+        put(14, time.minutes().count());
+        put(17, time.seconds().count());
+        return text;
+    }
     const std::time_t seconds = date.time_since_epoch().count();
     std::tm parts{};
     if (::gmtime_r(&seconds, &parts) == nullptr) {
         // A year that no int can hold: no calendar text exists.
         return fmt::format("{}", seconds);
     }
-    const std::int64_t year = std::int64_t{parts.tm_year} + 1900;
-    const bool common = year >= 0 && year <= 9999;
-    std::string text = common ? "0000-00-00T00:00:00Z" : fmt::format("{:+07}-00-00T00:00:00Z", year);
-    // Long lists hold many dates, and the library's formatting takes longer than all the rest of writing them.
-    const auto put = [&](std::size_t fromEnd, int number) {
-        text[text.size() - fromEnd] = static_cast<char>('0' + number / 10);
-        text[text.size() - fromEnd + 1] = static_cast<char>('0' + number % 10);
-    };
-    if (common) {
-        put(20, static_cast<int>(year / 100));
-        put(18, static_cast<int>(year % 100));
-    }
-    put(15, parts.tm_mon + 1);
-    put(12, parts.tm_mday);
-    put(9, parts.tm_hour);
-    put(6, parts.tm_min);
-    put(3, parts.tm_sec);
-    return text;
+    return fmt::format("{:+07}-{:02}-{:02}T{:02}:{:02}:{:02}Z", std::int64_t{parts.tm_year} + 1900, parts.tm_mon + 1,
+                       parts.tm_mday, parts.tm_hour, parts.tm_min, parts.tm_sec);
 }
 
 std::optional<std::chrono::sys_seconds> isoDateOf(std::string_view text) {
