@@ -124,6 +124,8 @@ HttpAnswer answerFor(protocol::Answer& answer) {
             return textAnswer(200, answer);
         case Outcome::error:
             return textAnswer(500, answer);
+        case Outcome::later:
+            return retryLater(answer.error, answer.message);
         case Outcome::refused:
             return findingsAnswer(answer.findings);
         case Outcome::conflict:
@@ -200,9 +202,6 @@ void Front::welcome(protocol::Hello hello) {
     _hello = std::move(hello);
     for (const protocol::RefusedPlugin& plugin : refusedPlugins()) {
         logEvent(fmt::format("adminhostd: a plug-in is refused: {}", plugin.reason));
-    }
-    if (_hello->databaseTool) {
-        logEvent(fmt::format("adminhostd: commands that need the database are refused: {}", *_hello->databaseTool));
     }
     logEvent(
         fmt::format("adminhostd: release " ADMINHOST_RELEASE " serves with the plug-ins {}", namesIn(_hello->plugins)));
@@ -383,9 +382,6 @@ HttpAnswer Front::overview() const {
     }
     Dictionary text{{"release", ADMINHOST_RELEASE}, {"plugins", std::move(plugins)}};
     text.set("refusedPlugins", refused.empty() ? Value() : Value(std::move(refused)));
-    if (_hello && _hello->databaseTool) {
-        text.set("databaseToolProblem", *_hello->databaseTool);
-    }
     if (const Operation* running = _queue.running()) {
         Dictionary description = running->record->describe(false);
         description.remove("log");
@@ -448,12 +444,6 @@ void Front::operation(Exchange& exchange, const Target& target) {
         return refuse(errorAnswer(400, "PRECONDITION_NOT_UNDERSTOOD",
                                   "If-Match must list quoted revisions, and is for commands that depend on the "
                                   "revision only."));
-    }
-    if (_hello->databaseTool && std::count(command.needs.begin(), command.needs.end(), "database") > 0) {
-        return refuse(
-            errorAnswer(500, "SQLITE_TOOL_UNUSABLE",
-                        fmt::format("The command needs the database tool, and {}. The daemon tries it when it starts.",
-                                    *_hello->databaseTool)));
     }
     operation.deadline = command.deadline;
     operation.changes = command.access != Access::read;

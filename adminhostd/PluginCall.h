@@ -10,9 +10,19 @@
 
 namespace adminhost {
 
-/// Calls a function that runs code of a plug-in. What it throws becomes an error with the exception's text.
+template <class T>
+struct ResultOf {
+    using Type = Result<T>;
+};
+template <class T>
+struct ResultOf<Result<T>> {
+    using Type = Result<T>;
+};
+
+/// Calls a function that runs code of a plug-in, and returns its result. What it throws becomes an error with the
+/// exception's text.
 template <class Function>
-[[nodiscard]] auto callPlugin(Function&& function) -> Result<std::invoke_result_t<Function>> {
+[[nodiscard]] auto callPlugin(Function&& function) -> typename ResultOf<std::invoke_result_t<Function>>::Type {
     try {
         if constexpr (std::is_void_v<std::invoke_result_t<Function>>) {
             std::forward<Function>(function)();

@@ -70,7 +70,7 @@ constexpr auto members<RefusedPlugin> = std::tuple(member("refused.file", &Refus
 template <>
 constexpr auto members<Hello> = std::tuple(member("hello.plugins", &Hello::plugins),
                                            member("hello.refused", &Hello::refused),
-                                           member("hello.databaseTool", &Hello::databaseTool));
+                                           member("hello.problems", &Hello::problems));
 template <>
 constexpr auto members<Log> = std::tuple(member("log.event", &Log::event));
 template <>
@@ -106,7 +106,7 @@ struct Word {
 constexpr Word<Outcome> outcomeWords[] = {
     {Outcome::nothing, "nothing"}, {Outcome::answered, "answered"}, {Outcome::error, "error"},
     {Outcome::refused, "refused"}, {Outcome::conflict, "conflict"}, {Outcome::overrun, "overrun"},
-    {Outcome::locked, "locked"},   {Outcome::broken, "broken"},
+    {Outcome::locked, "locked"},   {Outcome::broken, "broken"},     {Outcome::later, "later"},
 };
 constexpr Word<BodyForm> formWords[] = {{BodyForm::json, "json"}, {BodyForm::propertyList, "propertyList"}};
 constexpr Word<Access> accessWords[] = {
@@ -145,9 +145,6 @@ Value encoded(Date date) {
 }
 Value encoded(std::chrono::seconds duration) {
     return duration.count();
-}
-Value encoded(std::optional<std::string> text) {
-    return text ? Value(std::move(*text)) : Value();
 }
 Value encoded(std::map<std::string, std::string> texts) {
     Dictionary dictionary;
@@ -202,9 +199,6 @@ class Decoder {
             into = std::move(*found);
         }
         return true;
-    }
-    bool read(Value* found, std::optional<std::string>& into) {
-        return found == nullptr || read(found, into.emplace());
     }
     bool read(Value* found, Date& into) {
         const auto date = found == nullptr ? std::nullopt : found->date();

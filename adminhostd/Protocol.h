@@ -31,6 +31,7 @@ enum class Outcome {
     nothing,   ///< the operation returned nothing
     answered,  ///< bytes: the answer
     error,     ///< error, message; bytes: the error response
+    later,     ///< error, message: it was not possible to run it now; the same request may be sent again
     refused,   ///< findings, never empty: the plug-in's check refuses the request
     conflict,  ///< none of the revisions holds
     overrun,   ///< the deadline passed
@@ -111,7 +112,7 @@ struct RefusedPlugin {
 struct Hello {
     std::vector<OfferedPlugin> plugins;
     std::vector<RefusedPlugin> refused;
-    std::optional<std::string> databaseTool;  ///< why commands that need it are refused
+    std::vector<std::string> problems;  ///< only if tryOnly: what commands need and is not usable
     bool operator==(const Hello&) const = default;
 };
 

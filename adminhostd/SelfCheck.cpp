@@ -88,9 +88,7 @@ int check(const Options& options) {
                 problems.push_back(plugin.reason);
             }
         }
-        if (hello.databaseTool) {
-            problems.push_back("Commands that need the database will be refused: " + *hello.databaseTool);
-        }
+        problems.insert(problems.end(), hello.problems.begin(), hello.problems.end());
         for (const protocol::OfferedPlugin& plugin : hello.plugins) {
             loaded += fmt::format(" {} {}", plugin.name, plugin.version);
         }

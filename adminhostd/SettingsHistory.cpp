@@ -147,7 +147,14 @@ Array readHistory(const HostPath& directory, const std::vector<std::string>& key
             continue;
         }
         Dictionary settings;
-        const Array* files = about->dictionary()->get("files").array();
+        // Entries of earlier releases have only the files.
+        const Dictionary* values = about->dictionary()->get("settings").dictionary();
+        for (const std::string& key : keys) {
+            if (const Value* value = values == nullptr ? nullptr : values->find(key)) {
+                settings.set(key, *value);
+            }
+        }
+        const Array* files = values != nullptr ? nullptr : about->dictionary()->get("files").array();
         for (std::size_t i = 0; files != nullptr && i < files->size(); ++i) {
             const Dictionary* file = (*files)[i].dictionary();
             const std::string* name = file == nullptr ? nullptr : file->get("name").string();

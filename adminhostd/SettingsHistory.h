@@ -22,7 +22,8 @@ constexpr std::size_t historyMaximum = 50;  ///< entries
 /// Where the entries of a plug-in lie.
 [[nodiscard]] HostPath historyDirectory(std::string_view plugin);
 
-/// Adds an entry: copies of the files that exist, and `about` ("when", "who", ...). Entries beyond the maximum are
+/// Adds an entry: copies of the files that exist, and `about` ("when", "who", "settings": their values, secrets
+/// replaced, ...). Entries beyond the maximum are
 /// removed, the oldest first. On failure there is no new entry, and the error says which step failed and why.
 [[nodiscard]] std::optional<Error> keepHistory(const HostPath& directory, const std::vector<HostPath>& files,
                                                const Dictionary& about);
@@ -31,9 +32,9 @@ constexpr std::size_t historyMaximum = 50;  ///< entries
 /// process may be in the making.
 void removeUnfinishedHistory(const HostPath& directory);
 
-/// The entries, oldest first: `about` with "number" (an integer) and "settings", the top-level keys of the entry's
-/// files in one dictionary. Of these only the named ones are answered; a secret's value is the text "(secret)".
-/// What cannot be read of an entry is left out.
+/// The entries, oldest first: `about` with "number" (an integer) and "settings"; in an entry of an earlier release
+/// these are the top-level keys of the entry's files in one dictionary. Of these only the named ones are answered; a
+/// secret's value is the text "(secret)". What cannot be read of an entry is left out.
 [[nodiscard]] Array readHistory(const HostPath& directory, const std::vector<std::string>& keys,
                                 const std::vector<std::string>& secrets);
 

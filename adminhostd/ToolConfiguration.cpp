@@ -2,46 +2,48 @@
 
 #include "adminhostd/PrivateDirectory.h"
 
+#include <algorithm>
 #include <cerrno>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <system_error>
 
-#include <sys/stat.h>
-
 namespace adminhost {
-namespace {
 
-// The answers of the settings themselves must not end up among the rows.
-constexpr const char* startFile =
-    ".output /dev/null\n"
-    ".dbconfig dqs_dml on\n"
-    ".dbconfig dqs_ddl on\n"
-    ".output\n";
-
-}  // namespace
+namespace fs = std::filesystem;
 
 ToolConfiguration::ToolConfiguration(const std::string& parent) {
     _held = createPrivateDirectory(parent, _directory);
-    const std::string place = _directory + "/sqlite3";
-    std::ofstream file;
-    if (::mkdir(place.c_str(), 0700) == 0) {
-        file.open(place + "/sqliterc");
-        file << startFile;
-        file.close();
-    }
-    if (!file) {
-        const int failure = errno;
-        std::error_code ignored;
-        std::filesystem::remove_all(_directory, ignored);
-        throw std::system_error(failure, std::generic_category(), "cannot write in " + _directory);
-    }
 }
 
 ToolConfiguration::~ToolConfiguration() {
     std::error_code ignored;
-    std::filesystem::remove_all(_directory, ignored);
+    fs::remove_all(_directory, ignored);
+}
+
+std::optional<Error> writeToolFiles(const std::string& directory, const std::vector<ToolFile>& files) {
+    const auto failed = [](const std::string& path, const std::string& reason) {
+        return Error{"posix", errno, path + ": " + reason};
+    };
+    std::error_code error;
+    fs::create_directories(directory, error);
+    fs::permissions(directory, fs::perms::owner_all, error);
+    for (const ToolFile& file : files) {
+        const fs::path relative(file.path);
+        if (relative.empty() || relative.is_absolute() ||
+            std::any_of(relative.begin(), relative.end(), [](const fs::path& part) { return part == ".."; })) {
+            return failed(file.path, "is not a path below the directory");
+        }
+        const fs::path path = directory / relative;
+        fs::create_directories(path.parent_path(), error);
+        std::ofstream stream(path, std::ios::binary);
+        stream << file.text;
+        stream.close();
+        if (!stream) {
+            return failed(path, error ? error.message() : std::generic_category().message(errno));
+        }
+    }
+    return std::nullopt;
 }
 
 }  // namespace adminhost

@@ -1,19 +1,25 @@
 #pragma once
 
-// Settings for the tools that the worker runs.
+// Configuration files for the tools that plug-ins run.
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/framework/Plugin.h"
+#include "platform/value/Error.h"
 
+#include <optional>
 #include <string>
+#include <vector>
 
 namespace adminhost {
 
-/// The directory that XDG_CONFIG_HOME names for the tools: a private one, made in the given directory, that holds the
-/// database tool's start file. It lets releases that refuse double-quoted text accept it, and stands in for a start
-/// file of the account, which could change what the tool prints. Removed with its owner.
+/// Names the directory for the tools. Each plug-in's tools get a subdirectory of it.
+constexpr const char* toolConfigurationVariable = "XDG_CONFIG_HOME";
+
+/// A private directory below the given one, in place of the account's: what an account keeps there could change what
+/// tools print. Removed with this object.
 class ToolConfiguration {
   public:
-    /// Throws std::system_error when the directory cannot be made.
+    /// Throws std::system_error if the directory cannot be created.
     explicit ToolConfiguration(const std::string& parent);
     ToolConfiguration(const ToolConfiguration&) = delete;
     ToolConfiguration& operator=(const ToolConfiguration&) = delete;
@@ -25,5 +31,9 @@ class ToolConfiguration {
     std::string _directory;
     FileDescriptor _held;
 };
+
+/// Creates the directory and writes the files in it, replacing those of an earlier worker. Fails if a path is not below
+/// the directory, or cannot be written.
+[[nodiscard]] std::optional<Error> writeToolFiles(const std::string& directory, const std::vector<ToolFile>& files);
 
 }  // namespace adminhost

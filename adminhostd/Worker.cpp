@@ -1,12 +1,12 @@
 #include "adminhostd/Worker.h"
 
-#include "adminhostd/DatabaseTool.h"
 #include "adminhostd/PluginCall.h"
 #include "adminhostd/PluginFile.h"
 #include "adminhostd/PluginTrial.h"
 #include "adminhostd/PrivateDirectory.h"
 #include "adminhostd/Protocol.h"
 #include "adminhostd/SettingsHistory.h"
+#include "adminhostd/ToolConfiguration.h"
 #include "adminhostd/WriteLock.h"
 #include "platform/directory/Entries.h"
 #include "platform/directory/LocalAccounts.h"
@@ -23,7 +23,9 @@
 #include <chrono>
 #include <csignal>
 #include <exception>
+#include <map>
 #include <optional>
+#include <set>
 #include <string>
 #include <utility>
 #include <vector>
@@ -41,6 +43,7 @@ using protocol::Outcome;
 
 /// Bytes of a message after which freed memory is returned to the system.
 constexpr std::size_t largeMessage = std::size_t{1} << 20U;
+constexpr auto probeBound = std::chrono::seconds(5);
 
 bool send(int descriptor, protocol::ToFront message) {
     return writeFrame(descriptor, protocol::frameOf(std::move(message)));
@@ -95,12 +98,19 @@ class Worker {
     protocol::Answer answer(const protocol::FindAccounts& order);
     protocol::Answer answer(const protocol::ReadHistory& order);
     protocol::Answer perform(const LoadedPlugin& loaded, const protocol::Perform& order);
+    static std::optional<Error> keepSettings(const LoadedPlugin& loaded, const protocol::Perform& order);
+    void tryNeeds(const LoadedPlugin& loaded, std::vector<std::string>& problems) const;
+    void enter(const LoadedPlugin& loaded) const;
+    [[nodiscard]] Probe ask(const LoadedPlugin& loaded, const std::string& need, Clock::duration bound) const;
+    [[nodiscard]] std::optional<protocol::Answer> unmetNeed(const LoadedPlugin& loaded,
+                                                            const protocol::Perform& order) const;
     [[nodiscard]] const LoadedPlugin* pluginNamed(std::string_view name) const;
 
     int _descriptor;
     ForwardingSink _sink;
     FrameReader _reader;
     std::vector<std::string> _languages;
+    std::map<std::string, std::string> _toolEnvironment;
     std::vector<LoadedPlugin> _plugins;
     FileDescriptor _toolConfiguration;  ///< open: the directory stays if the front is killed and another one starts
     bool _leftoversRemoved = false;
@@ -167,6 +177,16 @@ void Worker::load(const DiskPath& file, protocol::Hello& hello) {
                                   textOf(configured.error().description));
         }
     }
+    if (loaded && problem.empty()) {
+        const auto files = callPlugin([&] { return loaded->plugin->toolFiles(); });
+        const auto error =
+            files ? writeToolFiles(_toolEnvironment[toolConfigurationVariable] + "/" + loaded->name, *files)
+                  : files.error();
+        if (error) {
+            problem = fmt::format("{}: the files of its tools cannot be written: {}", file.text(),
+                                  textOf(error->description));
+        }
+    }
     if (!problem.empty()) {
         hello.refused.push_back({file.text(), problem});
         return;
@@ -187,8 +207,8 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
     if (!configuration.accountUuids.empty()) {
         setDirectoryNodes({localAccounts(HostPath(configuration.accountUuids))});
     }
-    setTaskEnvironment(configuration.toolEnvironment);
-    if (const auto found = configuration.toolEnvironment.find("XDG_CONFIG_HOME");
+    _toolEnvironment = configuration.toolEnvironment;
+    if (const auto found = configuration.toolEnvironment.find(toolConfigurationVariable);
         found != configuration.toolEnvironment.end()) {
         _toolConfiguration = holdDirectory(found->second);
     }
@@ -203,10 +223,69 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
             load(files[i], hello);
         }
     }
-    setTaskDeadline(Clock::now() + std::chrono::seconds(5));
-    hello.databaseTool = databaseToolProblem();
-    setTaskDeadline(std::nullopt);
+    if (configuration.tryOnly) {
+        for (const LoadedPlugin& loaded : _plugins) {
+            tryNeeds(loaded, hello.problems);
+        }
+    }
     return hello;
+}
+
+/// Asks the plug-in about everything that its commands need.
+void Worker::tryNeeds(const LoadedPlugin& loaded, std::vector<std::string>& problems) const {
+    std::set<std::string> needs;
+    for (const Command& command : loaded.commands) {
+        needs.insert(command.needs.begin(), command.needs.end());
+    }
+    for (const std::string& need : needs) {
+        if (const Probe probe = ask(loaded, need, probeBound); probe.state != Probe::State::usable) {
+            problems.push_back(fmt::format("{}: commands that need \"{}\" are refused: {}; {}", loaded.name, need,
+                                           probe.reason, probe.fix));
+        }
+    }
+}
+
+/// Sets what the tools find that the plug-in runs.
+void Worker::enter(const LoadedPlugin& loaded) const {
+    auto environment = _toolEnvironment;
+    environment[toolConfigurationVariable] += "/" + loaded.name;
+    setTaskEnvironment(std::move(environment));
+}
+
+Probe Worker::ask(const LoadedPlugin& loaded, const std::string& need, Clock::duration bound) const {
+    enter(loaded);
+    setTaskDeadline(Clock::now() + std::min<Clock::duration>(bound, probeBound));
+    auto probe = callPlugin([&] { return loaded.plugin->probe(need); });
+    return probe ? *std::move(probe)
+                 : Probe{Probe::State::unknown, "the plug-in failed: " + textOf(probe.error().description),
+                         "see the daemon's log"};
+}
+
+/// The answer to a command if something that it needs is not usable, or not known to be.
+std::optional<protocol::Answer> Worker::unmetNeed(const LoadedPlugin& loaded, const protocol::Perform& order) const {
+    const auto command = std::find_if(loaded.commands.begin(), loaded.commands.end(),
+                                      [&](const Command& one) { return one.name == order.command; });
+    if (command == loaded.commands.end()) {
+        return std::nullopt;
+    }
+    for (const std::string& need : command->needs) {
+        const Probe probe = ask(loaded, need, std::chrono::milliseconds(order.milliseconds));
+        if (probe.state == Probe::State::usable) {
+            continue;
+        }
+        const std::string why = fmt::format("{}; {}", probe.reason, probe.fix);
+        logEvent(fmt::format("adminhostd: {}/{} needs \"{}\": {}", loaded.name, order.command, need, why));
+        const std::string message = fmt::format("The command needs \"{}\": {}.", need, why);
+        if (probe.state == Probe::State::unusable) {
+            return errorAnswer("REQUIREMENT_NOT_MET", message, order.form);
+        }
+        protocol::Answer later;
+        later.outcome = Outcome::later;
+        later.error = "REQUIREMENT_UNKNOWN";
+        later.message = message;
+        return later;
+    }
+    return std::nullopt;
 }
 
 /// Of workers that were killed in the middle of a write.
@@ -232,6 +311,34 @@ void Worker::removeLeftovers() {
     }
 }
 
+/// Adds what the settings are now to their history.
+std::optional<Error> Worker::keepSettings(const LoadedPlugin& loaded, const protocol::Perform& order) {
+    const auto files = callPlugin([&] { return loaded.plugin->settingsFiles(); });
+    if (!files) {
+        return files.error();
+    }
+    const auto keys = callPlugin([&] { return loaded.plugin->settingKeys(); });
+    if (!keys) {
+        return keys.error();
+    }
+    const auto values = callPlugin([&] { return loaded.plugin->settings(); });
+    if (!values) {
+        return values.error();
+    }
+    Dictionary settings;
+    for (const Setting& setting : *keys) {
+        if (const Value* value = values->find(setting.key)) {
+            settings.set(setting.key, setting.secret ? Value("(secret)") : *value);
+        }
+    }
+    Dictionary about{{"when", order.received},
+                     {"who", fmt::format("uid {}", order.caller.uid)},
+                     {"command", order.command},
+                     {"request", order.request}};
+    about.set("settings", std::move(settings));
+    return keepHistory(historyDirectory(loaded.name), *files, about);
+}
+
 protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Perform& order) {
     Plugin& plugin = *loaded.plugin;
     const auto failed = [&](const Error& error) {
@@ -251,6 +358,10 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
         answer.findings = *std::move(findings);
         return answer;
     }
+    const auto deadline = Clock::now() + std::chrono::milliseconds(order.milliseconds);
+    if (auto unmet = unmetNeed(loaded, order)) {
+        return *std::move(unmet);
+    }
     std::optional<WriteLock::Held> held;
     if (changes(loaded, order.command)) {
         auto lock = WriteLock::tryToHold();
@@ -266,7 +377,7 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
         }
         removeLeftovers();
     }
-    const auto deadline = Clock::now() + std::chrono::milliseconds(order.milliseconds);
+    enter(loaded);
     setTaskDeadline(deadline);
     if (!order.revisions.empty()) {
         const auto revision = callPlugin([&] { return plugin.revision(); });
@@ -280,13 +391,7 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
     }
     if (order.keepsHistory) {
         // A full disk must not keep an administrator from settings that may fix it: the write goes on.
-        const auto files = callPlugin([&] { return plugin.settingsFiles(); });
-        const Dictionary about{{"when", order.received},
-                               {"who", fmt::format("uid {}", order.caller.uid)},
-                               {"command", order.command},
-                               {"request", order.request}};
-        const auto error = files ? keepHistory(historyDirectory(loaded.name), *files, about) : files.error();
-        if (error) {
+        if (const auto error = keepSettings(loaded, order)) {
             logEvent("adminhostd: the settings before this write could not be kept: " + textOf(*error));
         }
     }

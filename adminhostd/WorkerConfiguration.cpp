@@ -1,5 +1,6 @@
 #include "adminhostd/WorkerConfiguration.h"
 
+#include "adminhostd/ToolConfiguration.h"
 #include "platform/framework/BuildNote.h"
 
 #include <vector>
@@ -29,7 +30,7 @@ protocol::Configure workerConfiguration(const Options& options, const PluginSele
     }
     configuration.languages = textsOf(options.languages ? *options.languages : languagesOfEnvironment());
     configuration.accountUuids = options.accountUuids;
-    configuration.toolEnvironment = {{"XDG_CONFIG_HOME", toolConfiguration}};
+    configuration.toolEnvironment = {{toolConfigurationVariable, toolConfiguration}};
     return configuration;
 }
 

@@ -78,7 +78,7 @@ struct Setting {
 
 /// A log file of the service.
 struct LogFile {
-    std::string name;  ///< "startup_log"
+    std::string name;  ///< "access"
     HostPath path;
 };
 

@@ -53,7 +53,7 @@ class Dictionary {
     /// The text of the string under the key; empty if there is no value under it or one of another type. Converts
     /// nothing. Refers to the value in the dictionary, so it is valid only as long as a pointer from find() is.
     [[nodiscard]] std::string_view text(std::string_view key) const noexcept;
-    /// Follows a key path ("optionalArguments.variant") through nested dictionaries; a null Value where it ends early.
+    /// Follows a key path ("outer.inner") through nested dictionaries; a null Value where it ends early.
     [[nodiscard]] const Value& at(std::string_view keyPath) const noexcept;
 
     /// Stores the value; an existing key keeps its place. A null value removes the key.

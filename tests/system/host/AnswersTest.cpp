@@ -2,6 +2,9 @@
 
 #include "tests/system/host/Host.h"
 
+#include <fstream>
+#include <iterator>
+
 namespace adminhost::test {
 namespace {
 
@@ -377,13 +380,14 @@ TEST_F(Answers, StandardOutputOfAnOperationDisturbsNothing) {
     EXPECT_EQ(client.post("/v1/fixture/nothing").status, 204);
 }
 
-TEST_F(Answers, ToolsFindAPrivateConfigurationDirectory) {
+TEST_F(Answers, ToolsFindAPrivateDirectoryWithTheFilesThatThePluginGives) {
     const std::string text = textAt(dictionaryOf(client.post("/v1/fixture/environment")), "output");
     const std::size_t at = text.find("XDG_CONFIG_HOME=");
     ASSERT_NE(at, std::string::npos) << text;
     const std::filesystem::path directory = text.substr(at + 16, text.find('\n', at) - at - 16);
     EXPECT_EQ(std::filesystem::status(directory).permissions(), std::filesystem::perms::owner_all);
-    EXPECT_TRUE(std::filesystem::exists(directory / "sqlite3" / "sqliterc"));
+    std::ifstream file(directory / "tool" / "rc");
+    EXPECT_EQ(std::string(std::istreambuf_iterator<char>(file), {}), "of the plug-in\n");
     daemon.signal(SIGTERM);
     EXPECT_EQ(daemon.wait(), 0);
     EXPECT_FALSE(std::filesystem::exists(directory));

@@ -188,15 +188,17 @@ TEST_P(ThrowingFunction, CostsItsOwnCallAndIsLogged) {
 
 INSTANTIATE_TEST_SUITE_P(
     EachOne, ThrowingFunction,
-    ::testing::Values(Throwing{"constructor", 404, "a plug-in is refused"},
-                      Throwing{"name", 404, "a plug-in is refused"}, Throwing{"version", 404, "a plug-in is refused"},
-                      Throwing{"commands", 404, "a plug-in is refused"},
-                      Throwing{"configure", 404, "a plug-in is refused"},
-                      Throwing{"check", 500, "adminhostd: throwing/work failed: "},
-                      Throwing{"perform", 500, "adminhostd: throwing/work failed: "},
-                      Throwing{"revision", 200, "adminhostd: throwing failed to give its revision: "},
-                      Throwing{"settingsFiles", 200, "could not be kept: "},
-                      Throwing{"leftovers", 200, "failed to name what interrupted operations left: "}),
+    ::testing::Values(
+        Throwing{"constructor", 404, "a plug-in is refused"}, Throwing{"name", 404, "a plug-in is refused"},
+        Throwing{"version", 404, "a plug-in is refused"}, Throwing{"commands", 404, "a plug-in is refused"},
+        Throwing{"configure", 404, "a plug-in is refused"}, Throwing{"toolFiles", 404, "a plug-in is refused"},
+        Throwing{"probe", 503, "adminhostd: throwing/work needs \"thing\": the plug-in failed: "},
+        Throwing{"check", 500, "adminhostd: throwing/work failed: "},
+        Throwing{"perform", 500, "adminhostd: throwing/work failed: "},
+        Throwing{"revision", 200, "adminhostd: throwing failed to give its revision: "},
+        Throwing{"settingsFiles", 200, "could not be kept: "}, Throwing{"settingKeys", 200, "could not be kept: "},
+        Throwing{"settings", 200, "could not be kept: "},
+        Throwing{"leftovers", 200, "failed to name what interrupted operations left: "}),
     [](const auto& about) { return about.param.function; });
 
 }  // namespace

@@ -3,10 +3,12 @@
 #include "adminhostd/PluginFile.h"
 #include "platform/json/Json.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 
 #include <csignal>
 #include <cstdlib>
+#include <filesystem>
 #include <functional>
 #include <set>
 
@@ -152,6 +154,17 @@ TEST_P(EveryPlugin, RevisionForACommandThatTakesNoneIs400) {
     EXPECT_THAT(reply.body, HasSubstr("PRECONDITION_NOT_UNDERSTOOD"));
 }
 
+TEST_P(EveryPlugin, HistoryHasTheValuesBeforeAWriteAndNoSecret) {
+    ASSERT_EQ(post(GetParam().write, GetParam().firstRequest).status, 200);
+    ASSERT_EQ(post(GetParam().write, GetParam().secondRequest).status, 200);
+    const HttpReply reply = get("/history");
+    ASSERT_EQ(reply.status, 200) << reply.body;
+    EXPECT_THAT(reply.body, HasSubstr(GetParam().firstValue));
+    EXPECT_THAT(reply.body, HasSubstr("(secret)"));
+    EXPECT_THAT(reply.body, Not(HasSubstr(GetParam().secret)));
+    EXPECT_THAT(daemon.log(), Not(HasSubstr(GetParam().secret)));
+}
+
 TEST_P(EveryPlugin, LeftoverOfAnInterruptedOperationIsRemovedByTheNextWorker) {
     root.write(GetParam().leftover, "half");
     ASSERT_EQ(::kill(daemon.workerPid(), SIGKILL), 0);
@@ -162,6 +175,114 @@ TEST_P(EveryPlugin, LeftoverOfAnInterruptedOperationIsRemovedByTheNextWorker) {
 
 INSTANTIATE_TEST_SUITE_P(Plugins, EveryPlugin, ::testing::ValuesIn(subjects()),
                          [](const auto& about) { return about.param.name; });
+
+class Needs : public ::testing::Test {
+  protected:
+    [[nodiscard]] HttpReply flash() const { return daemon.connect().post("/v1/small/flash", "{}"); }
+
+    const SampleRoot root;
+    const DaemonProcess daemon{{{"--root", root.path(), "--plugin", smallPlugin()}, "", {}}};
+};
+
+TEST_F(Needs, CommandRunsIfWhatItNeedsIsUsable) {
+    EXPECT_EQ(flash().status, 204);
+}
+
+TEST_F(Needs, CommandIsRefusedWithReasonAndFixWhileWhatItNeedsIsUnusable) {
+    root.write("/etc/beacon.broken", "");
+    const HttpReply reply = flash();
+    EXPECT_EQ(reply.status, 500);
+    EXPECT_EQ(
+        reply.body,
+        R"({"error":"REQUIREMENT_NOT_MET","message":"The command needs \"lamp\": the lamp is broken; replace it."})"
+        "\n");
+    EXPECT_TRUE(daemon.waitForLog("adminhostd: small/flash needs \"lamp\": the lamp is broken; replace it\n"));
+    EXPECT_EQ(daemon.connect().post("/v1/small/show", "{}").status, 200) << "other commands are served";
+    root.remove("/etc/beacon.broken");
+    EXPECT_EQ(flash().status, 204);
+}
+
+TEST_F(Needs, CommandIsToBeSentAgainWhileItIsUnknownWhetherWhatItNeedsIsUsable) {
+    root.write("/etc/beacon.dark", "");
+    const HttpReply reply = flash();
+    EXPECT_EQ(reply.status, 503);
+    EXPECT_TRUE(reply.headers.contains("retry-after"));
+    EXPECT_THAT(reply.body, HasSubstr("\"REQUIREMENT_UNKNOWN\""));
+    EXPECT_THAT(reply.body, HasSubstr("it is too dark to see the lamp; wait for the morning."));
+    root.remove("/etc/beacon.dark");
+    EXPECT_EQ(flash().status, 204);
+}
+
+TEST_F(Needs, CheckNamesWhatIsNotUsable) {
+    root.write("/etc/beacon.broken", "");
+    const ProgramResult result =
+        runProgram({std::string(BINARY_DIR) + "/bin/adminhostd", "--check", "--root", root.path(), "--plugin",
+                    smallPlugin(), "--socket", root.directory() + "/socket"},
+                   Errors::merge);
+    EXPECT_EQ(result.status, 1);
+    EXPECT_EQ(result.output, "small: commands that need \"lamp\" are refused: the lamp is broken; replace it\n");
+}
+
+/// The service's own plug-in, whose need is a tool.
+class DatabaseNeed : public ::testing::Test {
+  protected:
+    [[nodiscard]] DaemonProcess::Options options() const {
+        return {{"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"}, "", {}};
+    }
+    static HttpReply read(const DaemonProcess& daemon) { return daemon.connect().post("/v1/lumio/getCameras", "{}"); }
+
+    const SampleRoot root;
+};
+
+TEST_F(DatabaseNeed, ToolThatIsMissingRefusesCommandsThatNeedItUntilItIsThere) {
+    root.remove("/usr/bin/sqlite3");
+    const DaemonProcess daemon(options());
+    const HttpReply reply = read(daemon);
+    EXPECT_EQ(reply.status, 500);
+    EXPECT_THAT(reply.body, HasSubstr("REQUIREMENT_NOT_MET"));
+    EXPECT_THAT(reply.body, HasSubstr("/usr/bin/sqlite3 cannot be run ("));
+    EXPECT_THAT(reply.body, HasSubstr("install the package sqlite3."));
+    EXPECT_EQ(daemon.connect().post("/v1/lumio/recycleService", "{}").status, 204) << "the others are served";
+    std::filesystem::create_symlink("/usr/bin/sqlite3", root.disk("/usr/bin/sqlite3"));
+    EXPECT_EQ(read(daemon).status, 200) << "without a restart";
+}
+
+TEST_F(DatabaseNeed, ToolThatDoesNotFinishOnceIsTriedAgain) {
+    root.remove("/usr/bin/sqlite3");
+    root.write("/usr/bin/sqlite3",
+               "#!/bin/sh\n[ -e '" + root.disk("/slow") + "' ] && exec sleep 60\nexec /usr/bin/sqlite3 \"$@\"\n");
+    std::filesystem::permissions(root.disk("/usr/bin/sqlite3"), std::filesystem::perms::owner_all);
+    root.write("/slow", "");
+    const DaemonProcess daemon(options());
+    const HttpReply reply = read(daemon);
+    EXPECT_EQ(reply.status, 503) << reply.body;
+    EXPECT_THAT(reply.body, HasSubstr("REQUIREMENT_UNKNOWN"));
+    root.remove("/slow");
+    EXPECT_EQ(read(daemon).status, 200);
+}
+
+TEST_F(DatabaseNeed, MissingDatabaseRefusesNothing) {
+    root.remove("/usr/bin/sqlite3");
+    std::filesystem::remove(root.databasePath());
+    const DaemonProcess daemon(options());
+    EXPECT_EQ(daemon.connect().post("/v1/lumio/readSettings", "{}").status, 200);
+}
+
+TEST_F(DatabaseNeed, StartFileInTheHomeDirectoryOfTheAccountIsNamedBeforeEachRequest) {
+    // The account database of a mount namespace has another home directory for the account.
+    const std::string home = root.disk("/home-of-account");
+    const std::string accounts = root.disk("/passwd");
+    root.write("/passwd", "root:x:0:0::" + home + ":/bin/sh\n");
+    root.write("/home-of-account/.sqliterc", ".nullvalue NULL\n");
+    const std::string command = "mount --bind '" + accounts + "' /etc/passwd && exec '" + BINARY_DIR +
+                                "/bin/adminhostd' --check --root '" + root.path() + "' --plugin '" + BINARY_DIR +
+                                "/lib/adminhost_lumio.so' --socket '" + root.directory() + "/socket'";
+    const ProgramResult result =
+        runProgram({"/usr/bin/unshare", "--map-root-user", "--mount", "/bin/sh", "-c", command}, Errors::merge);
+    EXPECT_EQ(result.output,
+              "lumio: commands that need \"database\" are refused: " + home +
+                  "/.sqliterc can change what /usr/bin/sqlite3 prints; remove the file, or move it away\n");
+}
 
 }  // namespace
 }  // namespace adminhost::test

@@ -1,0 +1,118 @@
+#!/usr/bin/python3
+"""Fails if the host or the generic client names something that only a plug-in knows.
+
+usage: plugin_words.py [ROOT]   (the project's root: by default the directory above this script's)
+
+The words are not listed here: they are the commands, keys, words and columns in the descriptions (commands/*.toml), and the
+tools, tables and names of several words that the plug-in's own rooms have in literals. A word that nobody writes by chance
+("server_port", "getCameras") is looked for everywhere. Of the plain ones only the names of lists and dictionaries ("cameras")
+are looked for, as whole string literals: that of a single value ("name") is anybody's.
+
+The plug-in also uses words of others, which are free: those that the daemon's own documentation defines (docs/http.md, and
+the form of a description in commands/README.md), as far as they are plain; and a key that a room of platform/ documents in a
+header and writes in its source.
+"""
+
+import pathlib
+import re
+import sys
+import tomllib
+
+HOST = ["adminhostd", "platform", "adminhostctl"]
+# The verbs of this one service, and the program that puts them together.
+NOT_HOST = ["adminhostctl/lumio", "adminhostctl/desired", "adminhostctl/Main.cpp"]
+PLUGIN = ["plugin", "handler", "resources", "settings", "commands"]
+SOURCES = {".cpp", ".h"}
+TEXT = re.compile(r'"((?:[^"\\\n]|\\.)*)"')
+TABLE = re.compile(r"\b(?:from|into|update|join|table) +([a-z_]+)", re.IGNORECASE)
+TOOL = re.compile(r"^/(?:usr/)?s?bin/([^/ ]+)$")
+IDENTIFIER = re.compile(r"^[a-z_][A-Za-z0-9_]*$")
+# Made of several words: nobody writes it by chance.
+COMPOUND = re.compile(r"[a-z]+[A-Z]|[A-Za-z]_[A-Za-z]|[A-Za-z][0-9]$")
+
+
+def read(path):
+    return path.read_text(encoding="utf-8")
+
+
+def described(root):
+    """The words of the descriptions, and those of them that name lists and dictionaries."""
+    words = set()
+    containers = set()
+    for path in sorted((root / "commands").glob("*.toml")):
+        command = tomllib.loads(read(path))
+        words.add(path.stem)
+        for section in ("keys", "answer"):
+            for key, description in command.get(section, {}).items():
+                steps = [step for step in re.split(r"\[\]|\.", key) if step]
+                words |= set(steps)
+                if description["type"] in ("list", "dictionary"):
+                    containers.add(steps[-1])
+                words |= set(description.get("allowed", []))
+                words |= set(description.get("entry", {}).get("columns", []))
+    return words, containers
+
+
+def named(root):
+    """Tools, tables and other names in the literals of the plug-in's own sources."""
+    words = set()
+    for room in PLUGIN:
+        for path in sorted((root / room).rglob("*")):
+            if path.suffix not in SOURCES:
+                continue
+            for text in TEXT.findall(read(path)):
+                if tool := TOOL.match(text):
+                    words.add(tool[1])
+                if IDENTIFIER.match(text) and COMPOUND.search(text):
+                    words.add(text)
+                if text.lower().startswith(("select ", "insert ", "update ", "delete ")):
+                    words |= set(TABLE.findall(text))
+    return words
+
+
+def documented(root):
+    """Words that the daemon's own documentation defines."""
+    form = read(root / "commands/README.md").partition("## The form that clients get")[2]
+    spans = re.findall(r"`([A-Za-z_]+)`", read(root / "docs/http.md"))
+    return set(spans) | set(re.findall(r"[A-Za-z_]+", form))
+
+
+def of_the_platform(root):
+    """Keys that a room of the platform documents in a header and writes in its source."""
+    keys = set()
+    for room in (root / "platform").iterdir():
+        def literals(suffix):
+            return {text for path in room.glob("*" + suffix) for text in TEXT.findall(read(path))}
+        keys |= literals(".h") & literals(".cpp")
+    return keys
+
+
+def findings(root):
+    words, containers = described(root)
+    words |= named(root)
+    rare = {word for word in words if COMPOUND.search(word)} - of_the_platform(root)
+    plain = containers - rare - documented(root) - of_the_platform(root)
+    if len(rare) < 20:
+        yield f"only {len(rare)} words are known: the descriptions are not where they were"
+        return
+    anywhere = re.compile(r"(?<![A-Za-z0-9_])(" + "|".join(sorted(map(re.escape, rare))) + r")(?![A-Za-z0-9_])")
+    for room in HOST:
+        for path in sorted((root / room).rglob("*")):
+            name = path.relative_to(root).as_posix()
+            if path.suffix not in SOURCES or any((name + "/").startswith(other + "/") for other in NOT_HOST):
+                continue
+            for number, line in enumerate(read(path).splitlines(), 1):
+                code = line.partition("//")[0]
+                for word in anywhere.findall(line) + [text for text in TEXT.findall(code) if text in plain]:
+                    yield f"{name}:{number}: names \"{word}\", which only the plug-in knows"
+
+
+def main():
+    root = pathlib.Path(sys.argv[1]) if len(sys.argv) > 1 else pathlib.Path(__file__).resolve().parent.parent
+    found = list(findings(root))
+    for finding in found:
+        print(finding)
+    sys.exit(1 if found else 0)
+
+
+main()

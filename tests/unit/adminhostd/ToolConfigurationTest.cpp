@@ -1,0 +1,61 @@
+#include "adminhostd/ToolConfiguration.h"
+
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <optional>
+#include <string>
+
+#include <gtest/gtest.h>
+
+namespace adminhost {
+namespace {
+
+namespace fs = std::filesystem;
+
+std::string contentOf(const fs::path& path) {
+    std::ifstream file(path);
+    return {std::istreambuf_iterator<char>(file), {}};
+}
+
+TEST(ToolConfiguration, DirectoryIsPrivateAndRemovedWithTheObject) {
+    std::optional<ToolConfiguration> tools(std::in_place, fs::temp_directory_path().string());
+    const fs::path directory = tools->directory();
+    EXPECT_EQ(fs::status(directory).permissions(), fs::perms::owner_all);
+    ASSERT_FALSE(writeToolFiles(directory / "plugin", {{"tool/rc", "text\n"}}));
+    tools.reset();
+    EXPECT_FALSE(fs::exists(directory));
+}
+
+TEST(ToolConfiguration, FilesOfAnEarlierWorkerAreReplaced) {
+    const ToolConfiguration tools(fs::temp_directory_path().string());
+    const fs::path directory = fs::path(tools.directory()) / "plugin";
+    ASSERT_FALSE(writeToolFiles(directory, {{"tool/rc", "a longer text\n"}, {"other", "x"}}));
+    ASSERT_FALSE(writeToolFiles(directory, {{"tool/rc", "short\n"}}));
+    EXPECT_EQ(contentOf(directory / "tool/rc"), "short\n");
+    EXPECT_EQ(contentOf(directory / "other"), "x");
+    EXPECT_EQ(fs::status(directory).permissions(), fs::perms::owner_all);
+}
+
+TEST(ToolConfiguration, PathOutsideTheDirectoryIsAnError) {
+    const ToolConfiguration tools(fs::temp_directory_path().string());
+    const fs::path directory = fs::path(tools.directory()) / "plugin";
+    for (const char* const path : {"", "/etc/rc", "../rc", "tool/../../rc"}) {
+        const auto error = writeToolFiles(directory, {{path, "text"}});
+        ASSERT_TRUE(error) << path;
+        EXPECT_EQ(error->description, std::string(path) + ": is not a path below the directory");
+    }
+    EXPECT_FALSE(fs::exists(fs::path(tools.directory()) / "rc"));
+}
+
+TEST(ToolConfiguration, FileThatCannotBeWrittenIsAnErrorThatNamesIt) {
+    const ToolConfiguration tools(fs::temp_directory_path().string());
+    const fs::path directory = fs::path(tools.directory()) / "plugin";
+    fs::create_directories(directory / "rc");
+    const auto error = writeToolFiles(directory, {{"rc", "text"}});
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->description, (directory / "rc").string() + ": Is a directory");
+}
+
+}  // namespace
+}  // namespace adminhost
