@@ -1,9 +1,10 @@
 #include "adminhostd/ListeningSocket.h"
 
+#include "adminhostd/PrivateDirectory.h"
+
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <cstdlib>
 #include <cstring>
 #include <stdexcept>
 #include <thread>
@@ -109,18 +110,13 @@ class StartLock {
     FileDescriptor _file;
 };
 
-/// The directory in which the socket is created.
-class PrivateDirectory {
+/// The private directory in which the socket is created.
+class SocketDirectory {
   public:
-    explicit PrivateDirectory(const std::string& parent) : _path(parent + "/.adminhostd.XXXXXX") {
-        if (::mkdtemp(_path.data()) == nullptr) {
-            failWithErrno("cannot write in " + parent);
-        }
-        _directory = FileDescriptor(::open(_path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-    }
-    PrivateDirectory(const PrivateDirectory&) = delete;
-    PrivateDirectory& operator=(const PrivateDirectory&) = delete;
-    ~PrivateDirectory() {
+    explicit SocketDirectory(const std::string& parent) : _directory(createPrivateDirectory(parent, _path)) {}
+    SocketDirectory(const SocketDirectory&) = delete;
+    SocketDirectory& operator=(const SocketDirectory&) = delete;
+    ~SocketDirectory() {
         ::unlink(socketPath().c_str());
         ::rmdir(_path.c_str());
     }
@@ -156,7 +152,7 @@ ListeningSocket::ListeningSocket(std::string path, gid_t group) : _path(std::mov
     const StartLock lock(_path);
     refuseLivingDaemon(_path, addressOf(_path));
 
-    const PrivateDirectory directory(parent);
+    const SocketDirectory directory(parent);
     const std::string place = directory.socketPath();
     const sockaddr_un placeAddress = addressOf(directory.shortPath());
     _socket = newSocket();
