@@ -259,8 +259,8 @@ void OperationQueue::begin(Operation operation) {
         perform->milliseconds = static_cast<std::uint64_t>(left.count());
     }
     // A change may have to be sent again.
-    auto frame = protocol::frameOf(operation.changes ? operation.order : std::exchange(operation.order, {}));
-    if (!_worker->send(std::move(frame))) {
+    const auto frame = protocol::frameOf(operation.changes ? operation.order : std::exchange(operation.order, {}));
+    if (!_worker->send(frame)) {
         _events.finished(operation, Unserved{Unserved::Reason::tooLarge, "The request is too large to be passed on."});
         return;
     }

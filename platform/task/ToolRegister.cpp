@@ -1,9 +1,10 @@
 #include "platform/task/ToolRegister.h"
 
+#include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <csignal>
-#include <cstdio>
-#include <cstring>
+#include <string_view>
 #include <system_error>
 #include <utility>
 
@@ -33,21 +34,27 @@ enum class State { gone, stopped, running };
 /// The state of a process from /proc. One that is on its way out counts as gone.
 State stateOf(pid_t pid) noexcept {
     constexpr unsigned long isExiting = 0x4;  // PF_EXITING of the kernel
-    char path[32];
-    char text[1024];
-    std::snprintf(path, sizeof path, "/proc/%d/stat", pid);
-    const FileDescriptor file(::open(path, O_RDONLY | O_CLOEXEC));
-    const ssize_t length = file.isOpen() ? ::read(file.get(), text, sizeof text - 1) : -1;
+    constexpr int flagsAfterState = 7;
+    std::array<char, 32> path{"/proc/"};
+    char* const number = path.data() + std::string_view("/proc/").size();
+    char* const end = std::to_chars(number, path.data() + path.size(), pid).ptr;
+    std::string_view("/stat").copy(end, 5);
+    const FileDescriptor file(::open(path.data(), O_RDONLY | O_CLOEXEC));
+    std::array<char, 1024> buffer{};
+    const ssize_t length = file.isOpen() ? ::read(file.get(), buffer.data(), buffer.size()) : -1;
     if (length <= 0) {
         return State::gone;
     }
-    text[length] = '\0';
     // PID (NAME) STATE PPID PGRP SESSION TTY TPGID FLAGS, where NAME may hold anything.
-    const char* rest = std::strrchr(text, ')');
-    char state = 'X';
-    unsigned long flags = 0;
-    if (rest == nullptr || std::sscanf(rest, ") %c %*d %*d %*d %*d %*d %lu", &state, &flags) != 2 || state == 'Z' ||
-        state == 'X' || (flags & isExiting) != 0) {
+    std::string_view rest(buffer.data(), static_cast<std::size_t>(length));
+    rest.remove_prefix(std::min(rest.size(), rest.rfind(')') + 2));
+    const char state = rest.empty() ? 'X' : rest.front();
+    for (int field = 1; field < flagsAfterState; ++field) {
+        rest.remove_prefix(std::min(rest.size(), rest.find(' ') + 1));
+    }
+    unsigned long flags = isExiting;
+    std::from_chars(rest.data(), rest.data() + rest.size(), flags);
+    if (state == 'Z' || state == 'X' || (flags & isExiting) != 0) {
         return State::gone;
     }
     return state == 'T' || state == 't' ? State::stopped : State::running;

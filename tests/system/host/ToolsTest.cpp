@@ -1,11 +1,13 @@
 // What becomes of the tools of a worker that is killed, and of the services that they have started.
 
+#include "tests/support/SampleRoot.h"
 #include "tests/system/host/Host.h"
 
 #include <csignal>
 #include <filesystem>
 #include <fstream>
 
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace adminhost::test {
@@ -116,6 +118,51 @@ TEST_F(Tools, ServiceStaysWhenTheWorkerIsKilledBeforeItCouldSeeThatTheStarterHas
     killWorker(worker);
     std::this_thread::sleep_for(std::chrono::milliseconds(300));
     EXPECT_FALSE(hasEnded(service));
+}
+
+/// The sample service, whose control tool starts it without a session of its own.
+class SampleService : public Tools {
+  protected:
+    SampleService() {
+        std::string tool = _sample.read("/usr/sbin/lumioctl");
+        const std::string setsid = "/usr/bin/setsid ";
+        const std::size_t at = tool.find(setsid);
+        EXPECT_NE(at, std::string::npos);
+        tool.erase(at, setsid.size());
+        _sample.write("/usr/sbin/lumioctl", tool);
+        EXPECT_EQ(::chmod(_sample.disk("/usr/sbin/lumioctl").c_str(), 0755), 0);
+    }
+    [[nodiscard]] std::string start() const { return _sample.disk("/usr/sbin/lumioctl") + " server start"; }
+    /// The service's process, 0 if it does not run.
+    [[nodiscard]] pid_t service() const {
+        std::ifstream file(_sample.disk("/var/run/lumioserverd.pid"));
+        pid_t pid = 0;
+        return file >> pid && !hasEnded(pid) ? pid : 0;
+    }
+
+    SampleRoot _sample;
+};
+
+TEST_F(SampleService, WorkerKilledInsideItsStartEndsTheStart) {
+    _sample.setSwitch("lumioctl.sleep", "300");
+    UnixHttp client = run("mark tool; exec " + start());
+    const pid_t tool = marked("tool");
+    killWorker(_daemon.workerPid());
+    expectError(client.reply(), 500, "WORKER_FAILED");
+    EXPECT_TRUE(eventually([&] { return hasEnded(tool); }));
+    EXPECT_EQ(service(), 0);
+}
+
+TEST_F(SampleService, WorkerKilledAfterItsStartLeavesItRunning) {
+    UnixHttp client = run(start());
+    EXPECT_EQ(client.reply().status, 200);
+    const pid_t started = service();
+    ASSERT_NE(started, 0);
+    EXPECT_EQ(::getsid(started), ::getsid(_daemon.pid())) << "it has not called setsid";
+    killWorker(_daemon.workerPid());
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    EXPECT_EQ(service(), started);
+    ::kill(started, SIGKILL);
 }
 
 TEST_F(Tools, ToolsOfAWorkerThatOverrunsItsDeadlineEndWithIt) {
