@@ -1,0 +1,169 @@
+// The connection against a server that a test plays: what is sent, and what happens when no answer comes.
+
+#include "adminhostctl/Connection.h"
+#include "adminhostctl/Interrupt.h"
+
+#include <atomic>
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <functional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+namespace {
+
+using adminhost::ctl::Connection;
+using adminhost::ctl::DaemonReply;
+using adminhost::ctl::ExitStatus;
+using adminhost::ctl::Failure;
+using adminhost::ctl::LostConnection;
+using testing::HasSubstr;
+using testing::Not;
+
+/// Answers each request that a function has an answer for; closes the connection without one where it has none.
+class PlayedServer {
+  public:
+    explicit PlayedServer(std::function<std::string(const std::string&)> answer) : _answer(std::move(answer)) {
+        std::string pattern = (std::filesystem::temp_directory_path() / "played.XXXXXX").string();
+        _directory = ::mkdtemp(pattern.data());
+        _listener = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        path().copy(address.sun_path, sizeof address.sun_path - 1);
+        EXPECT_EQ(::bind(_listener, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+        EXPECT_EQ(::listen(_listener, 8), 0);
+        _thread = std::thread([this] { serve(); });
+    }
+    ~PlayedServer() {
+        _ended = true;
+        _thread.join();
+        ::close(_listener);
+        std::filesystem::remove_all(_directory);
+    }
+    PlayedServer(const PlayedServer&) = delete;
+    PlayedServer& operator=(const PlayedServer&) = delete;
+
+    [[nodiscard]] std::string path() const { return _directory + "/socket"; }
+    /// The requests so far; only after the client has its answer, or its failure.
+    [[nodiscard]] std::vector<std::string> requests() const { return _requests; }
+
+  private:
+    void serve() {
+        int client = -1;
+        while (!_ended) {
+            pollfd entries[2] = {{_listener, POLLIN, 0}, {client, POLLIN, 0}};
+            if (::poll(entries, client < 0 ? 1 : 2, 20) <= 0) {
+                continue;
+            }
+            if ((entries[0].revents & POLLIN) != 0) {
+                ::close(client);
+                client = ::accept4(_listener, nullptr, nullptr, SOCK_CLOEXEC);
+                continue;
+            }
+            std::string request;
+            char bytes[4096];
+            const ssize_t count = ::read(client, bytes, sizeof bytes);
+            if (count > 0) {
+                request.assign(bytes, static_cast<std::size_t>(count));
+                _requests.push_back(request);
+            }
+            const std::string answer = count > 0 ? _answer(request) : "";
+            if (answer.empty() || ::send(client, answer.data(), answer.size(), MSG_NOSIGNAL) < 0) {
+                ::close(client);
+                client = -1;
+            }
+        }
+        ::close(client);
+    }
+
+    std::function<std::string(const std::string&)> _answer;
+    std::string _directory;
+    int _listener = -1;
+    std::atomic<bool> _ended = false;
+    std::vector<std::string> _requests;
+    std::thread _thread;
+};
+
+std::string ok(const std::string& headers = {}) {
+    return "HTTP/1.1 200 OK\r\n" + headers + "Content-Length: 2\r\n\r\n{}";
+}
+
+TEST(Connection, SendsIdAndRevisionAndReadsTheHeadersOfTheAnswer) {
+    const PlayedServer server(
+        [](const std::string&) { return ok("ETag: \"r2\"\r\nRequest-Id: X\r\nAdminhost-Not-Done: 1\r\n"); });
+    Connection connection(server.path());
+    const DaemonReply reply = connection.post("/v1/p/c", "{}", {"THE-ID", "\"r1\""});
+    EXPECT_EQ(reply.status, 200);
+    EXPECT_EQ(reply.revision, "\"r2\"");
+    EXPECT_EQ(reply.requestId, "X");
+    EXPECT_TRUE(reply.notDone);
+    ASSERT_EQ(server.requests().size(), 1U);
+    EXPECT_THAT(server.requests()[0], HasSubstr("\r\nRequest-Id: THE-ID\r\n"));
+    EXPECT_THAT(server.requests()[0], HasSubstr("\r\nIf-Match: \"r1\"\r\n"));
+    EXPECT_FALSE(connection.get("/").revision.empty());
+}
+
+TEST(Connection, RequestWhoseConnectionIsLostIsNotSentAgain) {
+    const PlayedServer server(
+        [](const std::string& request) { return request.starts_with("GET") ? ok() : std::string(); });
+    Connection connection(server.path());
+    EXPECT_EQ(connection.get("/v1/").status, 200) << "a connection that is kept open";
+    try {
+        static_cast<void>(connection.post("/v1/p/c", "{}", {"THE-ID", ""}));
+        ADD_FAILURE();
+    } catch (const LostConnection& lost) {
+        EXPECT_EQ(lost.status(), ExitStatus::undetermined);
+        EXPECT_THAT(lost.what(), HasSubstr("the connection to the daemon was lost"));
+    }
+    std::size_t posts = 0;
+    for (const std::string& request : server.requests()) {
+        posts += request.starts_with("POST") ? 1U : 0U;
+    }
+    EXPECT_EQ(posts, 1U);
+}
+
+TEST(Connection, ServerThatIsNotThereWasSentNothing) {
+    Connection connection("/nowhere/socket");
+    try {
+        static_cast<void>(connection.post("/v1/p/c", "{}", {"THE-ID", ""}));
+        ADD_FAILURE();
+    } catch (const LostConnection&) {
+        ADD_FAILURE() << "nothing was sent";
+    } catch (const Failure& failure) {
+        EXPECT_EQ(failure.status(), ExitStatus::notReachable);
+    }
+}
+
+TEST(Connection, SignalEndsTheWaitOnlyWhileItIsGuarded) {
+    const PlayedServer server([](const std::string& request) {
+        if (request.starts_with("POST")) {
+            static_cast<void>(std::raise(SIGTERM));  // in the server's thread: the handler is the process's
+            std::this_thread::sleep_for(std::chrono::milliseconds(2500));
+        }
+        return ok();
+    });
+    Connection connection(server.path());
+    {
+        const adminhost::ctl::InterruptGuard guard;
+        try {
+            static_cast<void>(connection.post("/v1/p/c", "{}", {"THE-ID", ""}));
+            ADD_FAILURE();
+        } catch (const LostConnection& lost) {
+            EXPECT_STREQ(lost.what(), "interrupted");
+        }
+        EXPECT_TRUE(adminhost::ctl::isInterrupted());
+    }
+    EXPECT_FALSE(adminhost::ctl::isInterrupted());
+    EXPECT_EQ(connection.get("/v1/").status, 200) << "looking the request up goes on";
+}
+
+}  // namespace
