@@ -119,6 +119,9 @@ DaemonReply Connection::send(const std::string& path, const std::string* body, c
             throw LostConnection(ExitStatus::undetermined,
                                  isInterrupted() ? "interrupted" : "the connection to the daemon was lost: " + why);
         }
+        if (isInterrupted()) {
+            throw Failure(ExitStatus::failed, "interrupted; nothing was sent");
+        }
         throw Failure(ExitStatus::notReachable, "the daemon cannot be reached at " + _socketPath + ": " + why);
     }
     curl_easy_getinfo(_transfer->get(), CURLINFO_RESPONSE_CODE, &answer.status);
