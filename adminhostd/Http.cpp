@@ -285,8 +285,8 @@ void HttpServer::run() {
     if (_acceptAfter && Clock::now() >= *_acceptAfter) {
         _acceptAfter.reset();
     }
-    accept();
     ::MHD_run(_daemon);
+    accept();
     if (_returnMemory) {
         // The allocator keeps freed memory below anything that is still in use: after large answers, most of it.
         ::malloc_trim(0);
@@ -320,8 +320,12 @@ bool HttpServer::acceptOne() {
         return true;  // without them nothing may be served: closes the connection
     }
     if (!_limits.add(credentials.uid)) {
-        refuse(socket.get(), credentials.uid);
-        return true;
+        // Connections that the client has just closed must not count: only the library can notice that.
+        ::MHD_run(_daemon);
+        if (!_limits.add(credentials.uid)) {
+            refuse(socket.get(), credentials.uid);
+            return true;
+        }
     }
     try {
         _clients.push_back({socket.get(), {credentials.uid, credentials.gid, credentials.pid}, true, Clock::now()});
