@@ -1,7 +1,7 @@
 #include "adminhostd/SettingsHistory.h"
 
+#include "platform/files/CreateMissing.h"
 #include "platform/files/File.h"
-#include "platform/files/Make.h"
 #include "platform/plist/PropertyList.h"
 
 #include <algorithm>
@@ -97,15 +97,15 @@ HostPath historyDirectory(std::string_view plugin) {
 
 std::optional<Error> keepHistory(const HostPath& directory, const std::vector<HostPath>& files,
                                  const Dictionary& about) {
-    const DirectoryAttributes mine{::geteuid(), ::getegid(), 0700};
-    if (auto error = makeDirectories(diskPath(directory), mine)) {
+    const OwnerAndMode mine{::geteuid(), ::getegid(), 0700};
+    if (auto error = createDirectories(diskPath(directory), mine)) {
         return error;
     }
     removeUnfinishedHistory(directory);
     std::vector<std::uint64_t> numbers = numbersIn(directory);
     const std::uint64_t number = numbers.empty() ? 1 : numbers.back() + 1;
     const HostPath making = below(directory, std::string(unfinished) + std::to_string(number));
-    if (auto failed = makeDirectories(diskPath(making), mine)) {
+    if (auto failed = createDirectories(diskPath(making), mine)) {
         return failed;
     }
     std::optional<Error> failed = fill(making, files, about);

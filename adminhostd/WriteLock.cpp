@@ -1,6 +1,6 @@
 #include "adminhostd/WriteLock.h"
 
-#include "platform/files/Make.h"
+#include "platform/files/CreateMissing.h"
 #include "platform/files/Path.h"
 
 #include <array>
@@ -35,11 +35,11 @@ tl::unexpected<Error> unusable() {
 
 /// The directory, which is created if it is missing, and closed to other accounts.
 Result<FileDescriptor> privateDirectory() {
-    const DirectoryAttributes forAll{::geteuid(), ::getegid(), 0755};
-    const DirectoryAttributes forUs{::geteuid(), ::getegid(), 0700};
+    const OwnerAndMode forAll{::geteuid(), ::getegid(), 0755};
+    const OwnerAndMode forUs{::geteuid(), ::getegid(), 0700};
     const DiskPath path = diskPath(HostPath(lockDirectory));
     for (const auto& error :
-         {makeDirectories(diskPath(HostPath(runDirectory)), forAll), makeDirectories(path, forUs)}) {
+         {createDirectories(diskPath(HostPath(runDirectory)), forAll), createDirectories(path, forUs)}) {
         if (error) {
             errno = static_cast<int>(error->code);
             return unusable(error->description.value_or(""));

@@ -1,7 +1,7 @@
 #include "handler/LumioRequestHandler.h"
 #include "handler/SettingsReports.h"
 #include "platform/crypto/Crypt.h"
-#include "platform/files/Make.h"
+#include "platform/files/CreateMissing.h"
 #include "platform/files/ReplaceFile.h"
 #include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
@@ -329,13 +329,13 @@ void LumioRequestHandler::markSetupDone() {
         return;
     }
     const HostPath directory{std::string(stateDirectory)};
-    const adminhost::DirectoryAttributes attributes{0, adminhost::groupIdOf("wheel").value_or(0), 0755};
-    if (const auto error = adminhost::makeDirectories(adminhost::diskPath(directory), attributes)) {
+    const adminhost::OwnerAndMode attributes{0, adminhost::groupIdOf("wheel").value_or(0), 0755};
+    if (const auto error = adminhost::createDirectories(adminhost::diskPath(directory), attributes)) {
         adminhost::logEvent("adminhost_lumio: failed to create directory at path: " + directory.text() +
                             ", error: " + textOf(*error));
     }
     const HostPath marker{std::string(setupDoneMarker)};
-    if (const auto error = adminhost::makeEmptyFile(adminhost::diskPath(marker))) {
+    if (const auto error = adminhost::createEmptyFile(adminhost::diskPath(marker))) {
         adminhost::logEvent("adminhost_lumio: failed to create file at path: " + marker.text());
         reportSettingNotDone({}, "The mark that the service is configured, " + marker.text() + ", was not created.",
                              error->description.value_or(""));

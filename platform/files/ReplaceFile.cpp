@@ -1,6 +1,6 @@
 #include "platform/files/ReplaceFile.h"
 
-#include "platform/files/Directory.h"
+#include "platform/files/FilePlace.h"
 #include "platform/text/Hex.h"
 
 #include <algorithm>

@@ -1,4 +1,4 @@
-#include "platform/files/Directory.h"
+#include "platform/files/FilePlace.h"
 #include "platform/files/ReplaceFile.h"
 
 #include <atomic>

@@ -1,4 +1,4 @@
-#include "platform/files/Make.h"
+#include "platform/files/CreateMissing.h"
 
 #include <cerrno>
 #include <filesystem>
@@ -38,12 +38,12 @@ class Make : public testing::Test {
     }
 
     fs::path _directory;
-    const DirectoryAttributes _mine{::geteuid(), ::getegid(), 0751};
+    const OwnerAndMode _mine{::geteuid(), ::getegid(), 0751};
 };
 
 TEST_F(Make, EveryMissingDirectoryGetsTheAttributesWhateverTheUmask) {
     const mode_t before = ::umask(0077);
-    const auto error = makeDirectories(path("a/b/c"), _mine);
+    const auto error = createDirectories(path("a/b/c"), _mine);
     ::umask(before);
     EXPECT_EQ(error, std::nullopt);
     for (const char* name : {"a", "a/b", "a/b/c"}) {
@@ -54,16 +54,16 @@ TEST_F(Make, EveryMissingDirectoryGetsTheAttributesWhateverTheUmask) {
 TEST_F(Make, DirectoryThatExistsKeepsItsOwn) {
     fs::create_directory(_directory / "a");
     fs::permissions(_directory / "a", fs::perms(0700));
-    EXPECT_EQ(makeDirectories(path("a/b"), _mine), std::nullopt);
-    EXPECT_EQ(makeDirectories(path("a/b"), {::geteuid(), ::getegid(), 0700}), std::nullopt);
+    EXPECT_EQ(createDirectories(path("a/b"), _mine), std::nullopt);
+    EXPECT_EQ(createDirectories(path("a/b"), {::geteuid(), ::getegid(), 0700}), std::nullopt);
     EXPECT_EQ(modeOf("a"), fs::perms(0700));
     EXPECT_EQ(modeOf("a/b"), fs::perms(0751));
 }
 
 TEST_F(Make, FileInTheWayIsAnErrorWithTheSystemsText) {
-    ASSERT_EQ(makeEmptyFile(path("file")), std::nullopt);
+    ASSERT_EQ(createEmptyFile(path("file")), std::nullopt);
     for (const char* name : {"file", "file/below"}) {
-        const auto error = makeDirectories(path(name), _mine);
+        const auto error = createDirectories(path(name), _mine);
         ASSERT_TRUE(error) << name;
         EXPECT_EQ(error->code, ENOTDIR);
         EXPECT_EQ(error->description, "cannot make the directory: Not a directory");
@@ -71,7 +71,7 @@ TEST_F(Make, FileInTheWayIsAnErrorWithTheSystemsText) {
 }
 
 TEST_F(Make, OwnerIsSetByTheSuperuserAndForOthersAnErrorThatLeavesTheDirectory) {
-    const auto error = makeDirectories(path("a"), {4711, 4712, 0755});
+    const auto error = createDirectories(path("a"), {4711, 4712, 0755});
     EXPECT_EQ(modeOf("a"), fs::perms(0755));
     struct stat status {};
     ASSERT_EQ(::stat(path("a").c_str(), &status), 0);
@@ -87,15 +87,15 @@ TEST_F(Make, OwnerIsSetByTheSuperuserAndForOthersAnErrorThatLeavesTheDirectory) 
 }
 
 TEST_F(Make, EmptyFileIsMadeOnceAndNeverThroughALink) {
-    EXPECT_EQ(makeEmptyFile(path("file")), std::nullopt);
+    EXPECT_EQ(createEmptyFile(path("file")), std::nullopt);
     EXPECT_EQ(fs::file_size(_directory / "file"), 0U);
     std::ofstream(_directory / "file") << "text";
-    EXPECT_EQ(makeEmptyFile(path("file"))->code, EEXIST);
+    EXPECT_EQ(createEmptyFile(path("file"))->code, EEXIST);
     EXPECT_EQ(fs::file_size(_directory / "file"), 4U);
     fs::create_symlink("elsewhere", _directory / "link");
-    EXPECT_EQ(makeEmptyFile(path("link"))->code, EEXIST);
+    EXPECT_EQ(createEmptyFile(path("link"))->code, EEXIST);
     EXPECT_FALSE(fs::exists(_directory / "elsewhere"));
-    EXPECT_THAT(*makeEmptyFile(path("none/file"))->description, HasSubstr("No such file or directory"));
+    EXPECT_THAT(*createEmptyFile(path("none/file"))->description, HasSubstr("No such file or directory"));
 }
 
 TEST_F(Make, GroupIsFoundInTheAccountFilesBelowTheRoot) {

@@ -1,4 +1,4 @@
-#include "platform/files/Make.h"
+#include "platform/files/CreateMissing.h"
 
 #include "platform/files/FileDescriptor.h"
 
@@ -23,17 +23,17 @@ Error failure(const char* step, int number) {
     return Error{"posix", number, std::string(step) + ": " + std::generic_category().message(number)};
 }
 
-/// Sets the attributes through a descriptor, so that a link put in the directory's place is never followed.
-std::optional<Error> setAttributes(const std::string& path, const DirectoryAttributes& attributes) {
+/// Sets them through a descriptor, so that a link put in the directory's place is never followed.
+std::optional<Error> setOwnerAndMode(const std::string& path, const OwnerAndMode& ownerAndMode) {
     const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
     if (!directory.isOpen()) {
         return failure("cannot open the new directory", errno);
     }
     std::optional<Error> error;
-    if (::fchmod(directory.get(), attributes.mode) != 0) {
+    if (::fchmod(directory.get(), ownerAndMode.mode) != 0) {
         error = failure("cannot set the mode", errno);
     }
-    if (::fchown(directory.get(), attributes.owner, attributes.group) != 0) {
+    if (::fchown(directory.get(), ownerAndMode.owner, ownerAndMode.group) != 0) {
         error = failure("cannot set the owner", errno);
     }
     return error;
@@ -41,17 +41,17 @@ std::optional<Error> setAttributes(const std::string& path, const DirectoryAttri
 
 }  // namespace
 
-std::optional<Error> makeDirectories(const DiskPath& path, const DirectoryAttributes& attributes) {
+std::optional<Error> createDirectories(const DiskPath& path, const OwnerAndMode& ownerAndMode) {
     std::optional<Error> error;
     const std::string& whole = path.text();
     for (std::size_t end = whole.find('/', 1); !whole.empty(); end = whole.find('/', end + 1)) {
         const std::string part = whole.substr(0, end);
         if (::mkdir(part.c_str(), 0700) == 0) {
-            if (auto failed = setAttributes(part, attributes)) {
+            if (auto failed = setOwnerAndMode(part, ownerAndMode)) {
                 error = std::move(failed);
             }
         } else if (errno != EEXIST) {
-            return failure("cannot make the directory", errno);
+            return failure("cannot create the directory", errno);
         }
         if (end == std::string::npos) {
             break;
@@ -59,18 +59,18 @@ std::optional<Error> makeDirectories(const DiskPath& path, const DirectoryAttrib
     }
     struct stat status {};
     if (!error && (::stat(whole.c_str(), &status) != 0 || !S_ISDIR(status.st_mode))) {
-        error = failure("cannot make the directory", ENOTDIR);
+        error = failure("cannot create the directory", ENOTDIR);
     }
     return error;
 }
 
-std::optional<Error> makeEmptyFile(const DiskPath& path) {
+std::optional<Error> createEmptyFile(const DiskPath& path) {
     FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644));
     if (!file.isOpen() || ::fsync(file.get()) != 0) {
-        return failure("cannot make the file", errno);
+        return failure("cannot create the file", errno);
     }
     const int number = file.close();
-    return number == 0 ? std::nullopt : std::optional(failure("cannot make the file", number));
+    return number == 0 ? std::nullopt : std::optional(failure("cannot create the file", number));
 }
 
 std::optional<gid_t> groupIdOf(const char* name) {
@@ -86,7 +86,7 @@ std::optional<gid_t> groupIdOf(const char* name) {
     for (;;) {
         const int status = ::fgetgrent_r(file.get(), &entry, buffer.data(), buffer.size(), &found);
         if (status == ERANGE && buffer.size() < maximumLine) {
-            buffer.resize(buffer.size() * 2);  // the reader stands at the line's beginning again
+            buffer.resize(buffer.size() * 2);  // the reader is at the line's beginning again
         } else if (status != 0) {
             return std::nullopt;
         } else if (std::string_view(entry.gr_name) == name) {

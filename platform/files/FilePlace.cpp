@@ -1,4 +1,4 @@
-#include "platform/files/Directory.h"
+#include "platform/files/FilePlace.h"
 
 #include <array>
 #include <cerrno>
