@@ -15,7 +15,7 @@ namespace {
 namespace fs = std::filesystem;
 using testing::HasSubstr;
 
-class Make : public testing::Test {
+class CreateMissing : public testing::Test {
   protected:
     void SetUp() override {
         std::string pattern = fs::temp_directory_path() / "make-XXXXXX";
@@ -41,7 +41,7 @@ class Make : public testing::Test {
     const OwnerAndMode _mine{::geteuid(), ::getegid(), 0751};
 };
 
-TEST_F(Make, EveryMissingDirectoryGetsTheAttributesWhateverTheUmask) {
+TEST_F(CreateMissing, EveryMissingDirectoryGetsTheAttributesWhateverTheUmask) {
     const mode_t before = ::umask(0077);
     const auto error = createDirectories(path("a/b/c"), _mine);
     ::umask(before);
@@ -51,7 +51,7 @@ TEST_F(Make, EveryMissingDirectoryGetsTheAttributesWhateverTheUmask) {
     }
 }
 
-TEST_F(Make, DirectoryThatExistsKeepsItsOwn) {
+TEST_F(CreateMissing, DirectoryThatExistsKeepsItsOwn) {
     fs::create_directory(_directory / "a");
     fs::permissions(_directory / "a", fs::perms(0700));
     EXPECT_EQ(createDirectories(path("a/b"), _mine), std::nullopt);
@@ -60,17 +60,17 @@ TEST_F(Make, DirectoryThatExistsKeepsItsOwn) {
     EXPECT_EQ(modeOf("a/b"), fs::perms(0751));
 }
 
-TEST_F(Make, FileInTheWayIsAnErrorWithTheSystemsText) {
+TEST_F(CreateMissing, FileInTheWayIsAnErrorWithTheSystemsText) {
     ASSERT_EQ(createEmptyFile(path("file")), std::nullopt);
     for (const char* name : {"file", "file/below"}) {
         const auto error = createDirectories(path(name), _mine);
         ASSERT_TRUE(error) << name;
         EXPECT_EQ(error->code, ENOTDIR);
-        EXPECT_EQ(error->description, "cannot make the directory: Not a directory");
+        EXPECT_EQ(error->description, "cannot create the directory: Not a directory");
     }
 }
 
-TEST_F(Make, OwnerIsSetByTheSuperuserAndForOthersAnErrorThatLeavesTheDirectory) {
+TEST_F(CreateMissing, OwnerIsSetByTheSuperuserAndForOthersAnErrorThatLeavesTheDirectory) {
     const auto error = createDirectories(path("a"), {4711, 4712, 0755});
     EXPECT_EQ(modeOf("a"), fs::perms(0755));
     struct stat status {};
@@ -86,7 +86,7 @@ TEST_F(Make, OwnerIsSetByTheSuperuserAndForOthersAnErrorThatLeavesTheDirectory) 
     }
 }
 
-TEST_F(Make, EmptyFileIsMadeOnceAndNeverThroughALink) {
+TEST_F(CreateMissing, EmptyFileIsCreatedOnceAndNeverThroughALink) {
     EXPECT_EQ(createEmptyFile(path("file")), std::nullopt);
     EXPECT_EQ(fs::file_size(_directory / "file"), 0U);
     std::ofstream(_directory / "file") << "text";
@@ -98,7 +98,7 @@ TEST_F(Make, EmptyFileIsMadeOnceAndNeverThroughALink) {
     EXPECT_THAT(*createEmptyFile(path("none/file"))->description, HasSubstr("No such file or directory"));
 }
 
-TEST_F(Make, GroupIsFoundInTheAccountFilesBelowTheRoot) {
+TEST_F(CreateMissing, GroupIsFoundInTheAccountFilesBelowTheRoot) {
     EXPECT_EQ(groupIdOf("wheel"), std::nullopt) << "no file";
     writeGroups("root:x:0:\nbroken line\nwheelers:x:7:wheel\n");
     EXPECT_EQ(groupIdOf("wheel"), std::nullopt);
@@ -106,7 +106,7 @@ TEST_F(Make, GroupIsFoundInTheAccountFilesBelowTheRoot) {
     EXPECT_EQ(groupIdOf("wheel"), 4711U);
 }
 
-TEST_F(Make, GroupBehindOneOfManyMembersIsFound) {
+TEST_F(CreateMissing, GroupBehindOneOfManyMembersIsFound) {
     std::string members;
     for (int i = 0; i < 50'000; ++i) {
         members += (i == 0 ? "member" : ",member") + std::to_string(i);
