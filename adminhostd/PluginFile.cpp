@@ -100,7 +100,7 @@ tl::unexpected<Error> refused(std::string reason) {
 std::optional<std::string> distrust(const DiskPath& path) {
     struct stat status {};
     if (::stat(path.c_str(), &status) != 0) {
-        return fmt::format("{}: {}; make it or choose another place", path.text(), std::strerror(errno));
+        return fmt::format("{}: {}; create it or choose another place", path.text(), std::strerror(errno));
     }
     if (status.st_uid != 0 && status.st_uid != ::geteuid()) {
         return fmt::format("{} belongs to uid {}; chown it to root", path.text(), status.st_uid);

@@ -1,6 +1,6 @@
 #pragma once
 
-// Plug-in files: which may be loaded, which build they are of, and loading them.
+// Plug-in files: whether they can be trusted, for which interface they are built, and loading them.
 
 #include "platform/files/Path.h"
 #include "platform/framework/Plugin.h"
@@ -11,14 +11,14 @@
 
 namespace adminhost {
 
-/// Why whoever may write there could give the daemon code to run: the directory or file must belong to root (or to the
-/// daemon's own account) and must not be writable by group or others. With the mend; nothing when all is well.
+/// Returns why the directory or file is not trusted, with a suggested fix: it must belong to root (or to the daemon's
+/// own account) and must not be writable by group or others. nullopt if it is trusted.
 [[nodiscard]] std::optional<std::string> distrust(const DiskPath& path);
 
-/// Why everybody could change the file, with the mend; nothing when not, or when there is no such file.
+/// Returns that everybody may write to the file, with a suggested fix; nullopt if not, or if the file does not exist.
 [[nodiscard]] std::optional<std::string> openToEverybody(const DiskPath& path);
 
-/// The plug-ins (*.so) of a directory in the order of their names. Nothing if it cannot be read; errno says why.
+/// The plug-ins (*.so) of a directory in the order of their names; nullopt, with errno, if it cannot be read.
 [[nodiscard]] std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory);
 
 /// The build identity in the file's note, read without running any of its code. The error names the file: it is not a

@@ -120,6 +120,7 @@ std::vector<std::optional<std::string>> tryPlugins(const std::vector<DiskPath>& 
     }
     const auto until = Clock::now() + bound;
     std::vector<std::optional<std::string>> reasons;
+    reasons.reserve(trials.size());
     for (Trial& trial : trials) {
         reasons.push_back(trial.finish(until));
     }
