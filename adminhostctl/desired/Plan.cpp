@@ -303,12 +303,10 @@ std::string reasonOf(const ReportedGap& gap) {
     return gap.reason + (gap.toolMessage.empty() ? "" : " (" + gap.toolMessage + ")");
 }
 
-/// The report on a part of the request that has to do with the change; null if there is none. `exact`: on the change
-/// itself or a part of it, not on what it is a part of.
-const ReportedGap* gapOf(const PlannedChange& change, const RequestReport& report, bool exact) {
+/// The report on the change, on a part of it or on what it is a part of; null if there is none.
+const ReportedGap* gapOf(const PlannedChange& change, const RequestReport& report) {
     for (const ReportedGap& gap : report.notDone) {
-        if (isBelow(gap.keyPath, change.keyPath) ||
-            (!exact && !gap.keyPath.empty() && isBelow(change.keyPath, gap.keyPath))) {
+        if (!gap.keyPath.empty() && (isBelow(gap.keyPath, change.keyPath) || isBelow(change.keyPath, gap.keyPath))) {
             return &gap;
         }
     }
@@ -405,15 +403,14 @@ PlanOutcome outcomeOf(const StateForm& form, const Wanted& wanted, const Plan& p
     for (const PlannedChange& change : plan.changes) {
         const auto still = std::find_if(remaining.begin(), remaining.end(),
                                         [&](const PlannedChange& one) { return one.entry == change.entry; });
-        const ReportedGap* gap = gapOf(change, report, !change.hidden);
+        const ReportedGap* gap = gapOf(change, report);
         const DescribedKey* secret = change.identity.empty() ? form.secret(change.key) : nullptr;
         const auto fail = [&](const PlannedChange& what) {
-            const ReportedGap* reason = gapOf(change, report, false);
-            outcome.failed.push_back({what, reason != nullptr ? reasonOf(*reason) : ""});
+            outcome.failed.push_back({what, gap != nullptr ? reasonOf(*gap) : ""});
         };
         if (still != remaining.end()) {
             fail(*still);
-        } else if (gap != nullptr) {
+        } else if (change.hidden && gap != nullptr) {
             fail(change);
         } else if (!isReadable) {
             outcome.undetermined.push_back(change);

@@ -300,6 +300,13 @@ TEST(Outcome, LookedUpNameIsWhateverTheWriteStored) {
     EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), found, true, done()).applied.size(), 1U);
     EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), found, false, done()).applied.size(), 1U);
     EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), sample(), false, done()).failed.size(), 1U);
+    State asWritten = sample();
+    asWritten.settings.set("nimbo_controller", "studio.local");
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), asWritten, true,
+                        done({{"configuration.nimbo_controller", "the name was not resolved", ""}}))
+                  .applied.size(),
+              1U)
+        << "it is stored, which is what was asked for";
 }
 
 TEST(Toml, TextsAndKeysAreQuotedAsTheFormatNeeds) {
