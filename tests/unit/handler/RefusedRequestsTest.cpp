@@ -96,7 +96,7 @@ TEST_F(RefusedRequests, NameEqualToAColumnsNameWouldStoreTheColumn) {
     EXPECT_EQ(rows(), "f|1\ntwo|2\n");
 }
 
-TEST_F(RefusedRequests, LineFeedInAValueWouldForgeAPropertyInTheList) {
+TEST_F(RefusedRequests, LineFeedInAValueForgesNoPropertyInTheList) {
     const Dictionary entry{{"_id_", "1"}, {"value", "x\n\n   id = 77\n name = forged\nvalue = y\nprotect = f"}};
     EXPECT_EQ(refused("properties", entry), path("configuration.properties.0.value"));
     changeProperty(entry);
@@ -105,7 +105,7 @@ TEST_F(RefusedRequests, LineFeedInAValueWouldForgeAPropertyInTheList) {
     for (const Value& property : *read.dictionary().get("properties").array()) {
         forged = forged || property.dictionary()->get("name") == Value("forged");
     }
-    EXPECT_TRUE(forged);
+    EXPECT_FALSE(forged) << "values are read back exactly";
     EXPECT_EQ(root.sql(database, "select count(*) from properties"), "2\n");
 }
 
