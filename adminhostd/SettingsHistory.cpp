@@ -1,8 +1,12 @@
 #include "adminhostd/SettingsHistory.h"
 
+#include "platform/crypto/Digest.h"
 #include "platform/files/CreateMissing.h"
 #include "platform/files/File.h"
+#include "platform/files/ReplaceFile.h"
+#include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
+#include "platform/value/Text.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -12,7 +16,7 @@
 #include <string>
 
 #include <fmt/format.h>
-#include <sys/stat.h>
+#include <sys/random.h>
 #include <unistd.h>
 
 namespace adminhost {
@@ -22,12 +26,26 @@ namespace fs = std::filesystem;
 
 constexpr std::string_view aboutName = "about.plist";
 constexpr std::string_view unfinished = "unfinished-";
+constexpr std::string_view hidden = "(secret)";
+constexpr std::string_view hiddenChange = "(secret) changed";
 
 HostPath below(const HostPath& directory, std::string_view name) {
     return HostPath(directory.text() + '/' + std::string(name));
 }
 
-/// The numbers of the entries, in order. What else lies in the directory is none.
+HostPath entryOf(const HostPath& directory, std::uint64_t number) {
+    return below(directory, fmt::format("{:08}", number));
+}
+
+HostPath resourceEntryOf(const HostPath& directory, std::uint64_t number) {
+    return below(directory, fmt::format("{:08}.plist", number));
+}
+
+OwnerAndMode mine() {
+    return {::geteuid(), ::getegid(), 0700};
+}
+
+/// The numbers of the entries, in order; what stands in the directory beside them has none.
 std::vector<std::uint64_t> numbersIn(const HostPath& directory) {
     std::vector<std::uint64_t> numbers;
     std::error_code error;
@@ -35,7 +53,8 @@ std::vector<std::uint64_t> numbersIn(const HostPath& directory) {
         const std::string name = at->path().filename();
         std::uint64_t number = 0;
         const auto [rest, failure] = std::from_chars(name.data(), name.data() + name.size(), number);
-        if (failure == std::errc() && rest == name.data() + name.size()) {
+        const std::string_view behind(rest, static_cast<std::size_t>(name.data() + name.size() - rest));
+        if (failure == std::errc() && (behind.empty() || behind == ".plist")) {
             numbers.push_back(number);
         }
     }
@@ -43,139 +62,429 @@ std::vector<std::uint64_t> numbersIn(const HostPath& directory) {
     return numbers;
 }
 
+std::uint64_t nextAfter(const std::vector<std::uint64_t>& numbers) {
+    return numbers.empty() ? 1 : numbers.back() + 1;
+}
+
 void removeAll(const HostPath& path) {
     std::error_code ignored;
     fs::remove_all(diskPath(path).text(), ignored);
 }
 
-Error failure(const char* step, const std::error_code& code) {
+Error failed(const char* step, const std::error_code& code) {
     return Error{"posix", code.value(), std::string(step) + ": " + code.message()};
 }
 
 /// Writes a file of a new entry. It is not flushed: an entry that a power cut spoils is left out when it is read, and
 /// no administrator waits for the disk.
 std::optional<Error> writePlainly(std::string_view bytes, const HostPath& path) {
+    errno = 0;
     std::ofstream file(diskPath(path).text(), std::ios::binary);
     file << bytes;
     file.close();
     if (!file) {
-        return failure("cannot write the entry", std::error_code(errno, std::generic_category()));
+        return failed("cannot write the entry", std::error_code(errno, std::generic_category()));
     }
     return std::nullopt;
 }
 
-/// Copies the files and writes what is known about the entry.
-std::optional<Error> fill(const HostPath& entry, const std::vector<HostPath>& files, Dictionary about) {
-    Array kept;
+std::optional<Error> writePlainly(const Dictionary& dictionary, const HostPath& path) {
+    Error error;
+    const auto text = xmlPropertyList(dictionary, &error);
+    return text ? writePlainly(*text, path) : error;
+}
+
+/// Replaces a file of an entry, which is either the old one or the new one then.
+std::optional<Error> replacePlainly(const Dictionary& dictionary, const HostPath& path) {
+    const HostPath fresh(path.text() + ".new");
+    if (auto error = writePlainly(dictionary, fresh)) {
+        return error;
+    }
+    std::error_code error;
+    fs::rename(diskPath(fresh).text(), diskPath(path).text(), error);
+    return error ? std::optional(failed("cannot replace the entry", error)) : std::nullopt;
+}
+
+std::optional<Dictionary> readDictionary(const HostPath& path) {
+    auto value = readPropertyList(diskPath(path));
+    return value && value->dictionary() != nullptr ? std::optional(std::move(*value->dictionary())) : std::nullopt;
+}
+
+std::int64_t formatOf(const Dictionary& about) {
+    return about.get("format").integer().value_or(std::int64_t{1});
+}
+
+const Dictionary& dictionaryAt(const Dictionary& from, std::string_view key) {
+    static const Dictionary empty;
+    const Dictionary* found = from.get(key).dictionary();
+    return found == nullptr ? empty : *found;
+}
+
+/// What became of each setting between two snapshots.
+Array changesBetween(const Dictionary& before, const Dictionary& after, const std::vector<Setting>& settings) {
+    Array changes;
+    for (const Setting& setting : settings) {
+        const std::string_view part = setting.secret ? "digests" : "settings";
+        const Value& from = dictionaryAt(before, part).get(setting.key);
+        const Value& to = dictionaryAt(after, part).get(setting.key);
+        if (from == to) {
+            continue;
+        }
+        Dictionary change{{"key", setting.key}};
+        if (setting.secret) {
+            change.set("secret", true);
+        }
+        if (!from.isNull()) {
+            change.set("from", setting.secret ? Value(hidden) : from);
+        }
+        if (!to.isNull()) {
+            change.set("to", setting.secret ? Value(hiddenChange) : to);
+        }
+        changes.emplace_back(std::move(change));
+    }
+    return changes;
+}
+
+/// Copies the files that exist and can be read.
+std::optional<Error> copy(const std::vector<HostPath>& files, const HostPath& entry, Array& kept) {
     for (std::size_t i = 0; i < files.size(); ++i) {
         if (!exists(diskPath(files[i]))) {
             continue;
         }
-        Error error;
-        const auto bytes = readFile(diskPath(files[i]), plistMaximumSize, &error);
+        const auto bytes = readFile(diskPath(files[i]), plistMaximumSize);
         if (!bytes) {
-            // What nobody can read is kept by whoever replaces it; the other files still have their entry.
+            // What cannot be read is kept by the operation that replaces it; the other files still have their entry.
             continue;
         }
         const std::string name = std::to_string(i) + ".plist";
-        if (auto failed = writePlainly(*bytes, below(entry, name))) {
-            return failed;
+        if (auto error = writePlainly(*bytes, below(entry, name))) {
+            return error;
         }
         kept.emplace_back(Dictionary{{"path", files[i].text()}, {"name", name}});
-    }
-    about.set("files", std::move(kept));
-    Error error;
-    const auto text = xmlPropertyList(about, &error);
-    return text ? writePlainly(*text, below(entry, aboutName)) : error;
-}
-
-}  // namespace
-
-HostPath historyDirectory(std::string_view plugin) {
-    return HostPath("/var/lib/adminhostd/history/" + std::string(plugin));
-}
-
-std::optional<Error> keepHistory(const HostPath& directory, const std::vector<HostPath>& files,
-                                 const Dictionary& about) {
-    const OwnerAndMode mine{::geteuid(), ::getegid(), 0700};
-    if (auto error = createDirectories(diskPath(directory), mine)) {
-        return error;
-    }
-    removeUnfinishedHistory(directory);
-    std::vector<std::uint64_t> numbers = numbersIn(directory);
-    const std::uint64_t number = numbers.empty() ? 1 : numbers.back() + 1;
-    const HostPath making = below(directory, std::string(unfinished) + std::to_string(number));
-    if (auto failed = createDirectories(diskPath(making), mine)) {
-        return failed;
-    }
-    std::optional<Error> failed = fill(making, files, about);
-    if (!failed) {
-        std::error_code error;
-        fs::rename(diskPath(making).text(), diskPath(below(directory, fmt::format("{:08}", number))).text(), error);
-        if (error) {
-            failed = failure("cannot name the entry", error);
-        }
-    }
-    if (failed) {
-        removeAll(making);
-        return failed;
-    }
-    numbers.push_back(number);
-    for (std::size_t i = 0; i + historyMaximum < numbers.size(); ++i) {
-        removeAll(below(directory, fmt::format("{:08}", numbers[i])));
     }
     return std::nullopt;
 }
 
-void removeUnfinishedHistory(const HostPath& directory) {
-    std::error_code error;
-    for (fs::directory_iterator at(diskPath(directory).text(), error), end; !error && at != end; at.increment(error)) {
-        const std::string name = at->path().filename();
-        if (name.starts_with(unfinished)) {
-            removeAll(below(directory, name));
+/// An entry's description, if the entry is whole.
+std::optional<Dictionary> wholeEntry(const HostPath& entry) {
+    auto about = readDictionary(below(entry, aboutName));
+    const Array* files = about ? about->get("files").array() : nullptr;
+    for (std::size_t i = 0; files != nullptr && i < files->size(); ++i) {
+        const Dictionary* file = (*files)[i].dictionary();
+        const std::string* name = file == nullptr ? nullptr : file->get("name").string();
+        if (name == nullptr || !exists(diskPath(below(entry, *name)))) {
+            return std::nullopt;
         }
+    }
+    return about;
+}
+
+/// The settings of an entry of the first format, which had them only in the files.
+Dictionary settingsOfFiles(const HostPath& entry, const Dictionary& about, const std::vector<Setting>& settings) {
+    Dictionary values;
+    const Array* files = about.get("files").array();
+    for (std::size_t i = 0; files != nullptr && i < files->size(); ++i) {
+        const auto content = readDictionary(below(entry, *(*files)[i].dictionary()->get("name").string()));
+        for (const Setting& setting : settings) {
+            if (content && content->contains(setting.key)) {
+                values.set(setting.key, setting.secret ? Value(hidden) : content->get(setting.key));
+            }
+        }
+    }
+    return values;
+}
+
+void logNewer(std::size_t count) {
+    if (count > 0) {
+        logEvent(fmt::format(
+            "adminhostd: {} entries of the history were written by a newer release; they are not shown", count));
     }
 }
 
-Array readHistory(const HostPath& directory, const std::vector<std::string>& keys,
-                  const std::vector<std::string>& secrets) {
+bool sameThing(const Dictionary& kept, const Change& change) {
+    return kept.get("section") == Value(change.section) && kept.get("identity") == Value(change.identity) &&
+           kept.get("key") == Value(change.key);
+}
+
+Dictionary dictionaryOf(const Change& change) {
+    Dictionary kept{
+        {"section", change.section}, {"identity", change.identity}, {"name", change.name}, {"key", change.key}};
+    for (const auto& [key, value] : {std::pair{"from", &change.from}, {"to", &change.to}, {"undo", &change.undo}}) {
+        if (!value->isNull()) {
+            kept.set(key, *value);
+        }
+    }
+    kept.set("secret", change.secret);
+    return kept;
+}
+
+}  // namespace
+
+SettingsHistory::SettingsHistory(std::string_view plugin, std::vector<Setting> settings)
+    : _directory("/var/lib/adminhostd/history/" + std::string(plugin)),
+      _resources(below(_directory, "resources")),
+      _settings(std::move(settings)) {}
+
+Result<std::string> SettingsHistory::digestKey() const {
+    constexpr std::size_t size = 32;
+    const HostPath file = below(_directory, "digest.key");
+    if (auto key = readFile(diskPath(file), size); key && key->size() == size) {
+        return *std::move(key);
+    }
+    std::string key(size, '\0');
+    if (::getrandom(key.data(), key.size(), 0) != static_cast<ssize_t>(size)) {
+        return failure(failed("no random bytes", std::error_code(errno, std::generic_category())));
+    }
+    if (auto error = replaceFile(key, file, 0600)) {
+        return failure(*std::move(error));
+    }
+    return key;
+}
+
+Result<Dictionary> SettingsHistory::snapshotOf(const Dictionary& values) const {
+    Dictionary settings;
+    Dictionary digests;
+    for (const Setting& setting : _settings) {
+        const Value* value = values.find(setting.key);
+        if (value == nullptr) {
+            continue;
+        }
+        settings.set(setting.key, setting.secret ? Value(hidden) : *value);
+        if (setting.secret) {
+            const auto key = digestKey();
+            if (!key) {
+                return failure(key.error());
+            }
+            digests.set(setting.key, keyedDigestOf(*key, textOf(*value)));
+        }
+    }
+    return Dictionary{{"settings", std::move(settings)}, {"digests", std::move(digests)}};
+}
+
+std::optional<Error> SettingsHistory::add(const std::vector<HostPath>& files, Dictionary about,
+                                          std::uint64_t& number) const {
+    std::vector<std::uint64_t> numbers = numbersIn(_directory);
+    number = nextAfter(numbers);
+    const HostPath making = below(_directory, std::string(unfinished) + std::to_string(number));
+    if (auto error = createDirectories(diskPath(making), mine())) {
+        return error;
+    }
+    Array kept;
+    std::optional<Error> error = copy(files, making, kept);
+    about.set("format", format);
+    about.set("files", std::move(kept));
+    if (!error) {
+        error = writePlainly(about, below(making, aboutName));
+    }
+    if (!error) {
+        std::error_code code;
+        fs::rename(diskPath(making).text(), diskPath(entryOf(_directory, number)).text(), code);
+        if (code) {
+            error = failed("cannot name the entry", code);
+        }
+    }
+    if (error) {
+        removeAll(making);
+        return error;
+    }
+    numbers.push_back(number);
+    for (std::size_t i = 0; i + settingsMaximum < numbers.size(); ++i) {
+        removeAll(entryOf(_directory, numbers[i]));
+    }
+    return std::nullopt;
+}
+
+std::optional<Error> SettingsHistory::keepOutsideEdit(const Dictionary& snapshot, const Dictionary& about) const {
+    const std::vector<std::uint64_t> numbers = numbersIn(_directory);
+    const auto last =
+        numbers.empty() ? std::nullopt : readDictionary(below(entryOf(_directory, numbers.back()), aboutName));
+    if (!last || formatOf(*last) != format || last->get("after").dictionary() == nullptr) {
+        return std::nullopt;
+    }
+    const Dictionary& after = dictionaryAt(*last, "after");
+    Array changes = changesBetween(after, snapshot, _settings);
+    if (changes.empty()) {
+        return std::nullopt;
+    }
+    Dictionary edit{{"when", about.get("when")}, {"who", "outside the daemon"}, {"outside", true}};
+    edit.set("settings", after.get("settings"));
+    edit.set("digests", after.get("digests"));
+    edit.set("after", snapshot);
+    edit.set("changes", std::move(changes));
+    std::uint64_t number = 0;
+    return add({}, std::move(edit), number);
+}
+
+Result<std::uint64_t> SettingsHistory::keep(const std::vector<HostPath>& files, const Dictionary& values,
+                                            const Dictionary& about) const {
+    if (auto error = createDirectories(diskPath(_directory), mine())) {
+        return failure(*std::move(error));
+    }
+    removeUnfinished();
+    const auto snapshot = snapshotOf(values);
+    if (!snapshot) {
+        return failure(snapshot.error());
+    }
+    if (auto error = keepOutsideEdit(*snapshot, about)) {
+        return failure(*std::move(error));
+    }
+    Dictionary entry = about;
+    for (const DictionaryEntry& part : *snapshot) {
+        entry.set(part.key, part.value);
+    }
+    std::uint64_t number = 0;
+    if (auto error = add(files, std::move(entry), number)) {
+        return failure(*std::move(error));
+    }
+    return number;
+}
+
+std::optional<Error> SettingsHistory::complete(std::uint64_t number, const Dictionary& values) const {
+    const HostPath file = below(entryOf(_directory, number), aboutName);
+    auto about = readDictionary(file);
+    auto snapshot = snapshotOf(values);
+    if (!about || !snapshot) {
+        return snapshot ? failed("the entry cannot be read", std::make_error_code(std::errc::io_error))
+                        : snapshot.error();
+    }
+    Array changes = changesBetween(*about, *snapshot, _settings);
+    if (changes.empty()) {
+        removeAll(entryOf(_directory, number));
+        return std::nullopt;
+    }
+    about->set("changes", std::move(changes));
+    about->set("after", *std::move(snapshot));
+    return replacePlainly(*about, file);
+}
+
+std::optional<Error> SettingsHistory::hideFormerValues(const std::vector<Change>& changes) const {
+    std::vector<const Change*> secret;
+    for (const Change& change : changes) {
+        if (change.secret && !change.identity.empty()) {
+            secret.push_back(&change);
+        }
+    }
+    if (secret.empty()) {
+        return std::nullopt;
+    }
+    for (const std::uint64_t number : numbersIn(_resources)) {
+        const HostPath file = resourceEntryOf(_resources, number);
+        auto entry = readDictionary(file);
+        Value* list = entry ? entry->find("changes") : nullptr;
+        bool hid = false;
+        for (std::size_t i = 0; list != nullptr && list->array() != nullptr && i < list->array()->size(); ++i) {
+            Dictionary* kept = (*list->array())[i].dictionary();
+            if (kept == nullptr || kept->get("secret") == Value(true) ||
+                std::none_of(secret.begin(), secret.end(), [&](const Change* one) { return sameThing(*kept, *one); })) {
+                continue;
+            }
+            for (const std::string_view key : {"from", "to"}) {
+                if (kept->contains(key)) {
+                    kept->set(key, hidden);
+                }
+            }
+            kept->remove("undo");
+            kept->set("secret", true);
+            hid = true;
+        }
+        if (hid) {
+            if (auto error = replacePlainly(*entry, file)) {
+                return error;
+            }
+        }
+    }
+    return std::nullopt;
+}
+
+std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& changes, const Dictionary& about) const {
+    if (auto error = hideFormerValues(changes)) {
+        return error;
+    }
+    Array kept;
+    for (const Change& change : changes) {
+        if (change.section != "settings") {
+            kept.emplace_back(dictionaryOf(change));
+        }
+    }
+    if (kept.empty()) {
+        return std::nullopt;
+    }
+    for (const HostPath& directory : {_directory, _resources}) {
+        if (auto error = createDirectories(diskPath(directory), mine())) {
+            return error;
+        }
+    }
+    std::vector<std::uint64_t> numbers = numbersIn(_resources);
+    const std::uint64_t number = nextAfter(numbers);
+    Dictionary entry = about;
+    entry.set("format", format);
+    entry.set("changes", std::move(kept));
+    if (auto error = replacePlainly(entry, resourceEntryOf(_resources, number))) {
+        return error;
+    }
+    numbers.push_back(number);
+    for (std::size_t i = 0; i + resourcesMaximum < numbers.size(); ++i) {
+        removeAll(resourceEntryOf(_resources, numbers[i]));
+    }
+    return std::nullopt;
+}
+
+Array SettingsHistory::settingsEntries() const {
     Array entries;
-    for (const std::uint64_t number : numbersIn(directory)) {
-        const HostPath entry = below(directory, fmt::format("{:08}", number));
-        const auto about = readPropertyList(diskPath(below(entry, aboutName)));
-        if (!about || about->dictionary() == nullptr) {
+    std::size_t newer = 0;
+    for (const std::uint64_t number : numbersIn(_directory)) {
+        const HostPath entry = entryOf(_directory, number);
+        auto about = wholeEntry(entry);
+        if (!about || formatOf(*about) > format) {
+            newer += about ? 1U : 0U;
             continue;
         }
         Dictionary settings;
-        // Entries of earlier releases have only the files.
-        const Dictionary* values = about->dictionary()->get("settings").dictionary();
-        for (const std::string& key : keys) {
-            if (const Value* value = values == nullptr ? nullptr : values->find(key)) {
-                settings.set(key, *value);
-            }
-        }
-        const Array* files = values != nullptr ? nullptr : about->dictionary()->get("files").array();
-        for (std::size_t i = 0; files != nullptr && i < files->size(); ++i) {
-            const Dictionary* file = (*files)[i].dictionary();
-            const std::string* name = file == nullptr ? nullptr : file->get("name").string();
-            const auto content = name == nullptr ? std::nullopt : readPropertyList(diskPath(below(entry, *name)));
-            if (!content || content->dictionary() == nullptr) {
-                continue;
-            }
-            for (const std::string& key : keys) {
-                if (const Value* value = content->dictionary()->find(key)) {
-                    const bool secret = std::find(secrets.begin(), secrets.end(), key) != secrets.end();
-                    settings.set(key, secret ? Value("(secret)") : *value);
+        if (formatOf(*about) == 1 && about->get("settings").dictionary() == nullptr) {
+            settings = settingsOfFiles(entry, *about, _settings);
+        } else {
+            for (const Setting& setting : _settings) {
+                if (const Value* value = dictionaryAt(*about, "settings").find(setting.key)) {
+                    settings.set(setting.key, *value);
                 }
             }
         }
-        Dictionary shown = *about->dictionary();
-        shown.remove("files");
-        shown.set("number", number);
-        shown.set("settings", std::move(settings));
-        entries.emplace_back(std::move(shown));
+        for (const std::string_view key : {"files", "format", "digests", "after", "settings"}) {
+            about->remove(key);
+        }
+        about->set("number", number);
+        about->set("settings", std::move(settings));
+        entries.emplace_back(*std::move(about));
     }
+    logNewer(newer);
     return entries;
+}
+
+Array SettingsHistory::resourceEntries() const {
+    Array entries;
+    std::size_t newer = 0;
+    for (const std::uint64_t number : numbersIn(_resources)) {
+        auto entry = readDictionary(resourceEntryOf(_resources, number));
+        if (!entry || formatOf(*entry) > format) {
+            newer += entry ? 1U : 0U;
+            continue;
+        }
+        entry->remove("format");
+        entry->set("number", number);
+        entries.emplace_back(*std::move(entry));
+    }
+    logNewer(newer);
+    return entries;
+}
+
+void SettingsHistory::removeUnfinished() const {
+    std::error_code error;
+    for (fs::directory_iterator at(diskPath(_directory).text(), error), end; !error && at != end; at.increment(error)) {
+        const std::string name = at->path().filename();
+        if (name.starts_with(unfinished)) {
+            removeAll(below(_directory, name));
+        }
+    }
 }
 
 }  // namespace adminhost

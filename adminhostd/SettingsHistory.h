@@ -1,41 +1,74 @@
 #pragma once
 
-// The history of settings: what the settings files held before each write, for an administrator who wants to look or go
-// back.
+// The history of a plug-in's settings and resources, for an administrator who wants to look or go back.
 //
-// Entries are numbered from 1 and never renumbered; the last 50 are kept, in a directory that only root can enter. Each
-// holds the files byte for byte, and who wrote when. It is kept before the write; a write that then failed has its
-// entry too.
+// An entry of the settings holds their values before a write, who wrote when, the settings files byte for byte and,
+// once the write is over, what it changed. It is kept before the write, so that one that is killed has its entry too; a
+// write that changed no setting has none. An edit that was made outside the daemon since the last write gets an entry
+// of its own. An entry of the resources holds the changes that one request reported.
+//
+// Entries are numbered from 1 and never renumbered. The directory can be entered by root alone. Secrets are kept as
+// keyed digests, which show that they changed; their values appear only in the copies of the files, as the service
+// stores them. Each entry names the format it is written in: older ones are read, newer ones are skipped.
 
 #include "platform/files/Path.h"
+#include "platform/framework/Plugin.h"
+#include "platform/framework/Report.h"
 #include "platform/value/Error.h"
+#include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
 #include <cstddef>
+#include <cstdint>
 #include <optional>
+#include <string_view>
 #include <vector>
 
 namespace adminhost {
 
-constexpr std::size_t historyMaximum = 50;  ///< entries
+class SettingsHistory {
+  public:
+    static constexpr std::size_t settingsMaximum = 50;    ///< entries
+    static constexpr std::size_t resourcesMaximum = 500;  ///< entries
+    static constexpr std::int64_t format = 2;             ///< that is written here
 
-/// Where the entries of a plug-in lie.
-[[nodiscard]] HostPath historyDirectory(std::string_view plugin);
+    /// `settings` are the keys that entries hold, secret ones marked.
+    SettingsHistory(std::string_view plugin, std::vector<Setting> settings);
 
-/// Adds an entry: copies of the files that exist, and `about` ("when", "who", "settings": their values, secrets
-/// replaced, ...). Entries beyond the maximum are
-/// removed, the oldest first. On failure there is no new entry, and the error says which step failed and why.
-[[nodiscard]] std::optional<Error> keepHistory(const HostPath& directory, const std::vector<HostPath>& files,
-                                               const Dictionary& about);
+    /// Adds an entry before a write: the settings' values now, copies of the files that exist, and `about` ("when",
+    /// "who", ...). Returns its number. On failure there is no new entry.
+    [[nodiscard]] Result<std::uint64_t> keep(const std::vector<HostPath>& files, const Dictionary& values,
+                                             const Dictionary& about) const;
+    /// Adds to the entry what the write changed; removes it if that is nothing.
+    [[nodiscard]] std::optional<Error> complete(std::uint64_t number, const Dictionary& values) const;
+    /// Adds an entry of the resources with these changes; those of the section "settings" are left out, and without
+    /// others there is no entry. First, a value that has become secret is replaced by "(secret)" in all kept entries.
+    [[nodiscard]] std::optional<Error> keepResources(const std::vector<Change>& changes, const Dictionary& about) const;
 
-/// Removes what a process that was killed while it added an entry left; keepHistory() does so too. No entry of another
-/// process may be in the making.
-void removeUnfinishedHistory(const HostPath& directory);
+    /// The entries, oldest first: `about` with "number", "settings" (a secret's value is "(secret)") and, for a write
+    /// that has ended, "changes" ({"key", "from", "to"}; a secret's have "secret" and, in place of values, "(secret)"
+    /// and "(secret) changed"). An entry of an edit outside has "outside": true. An entry that lacks one of its files
+    /// or cannot be read is left out. Entries of a newer format are counted in one log line.
+    [[nodiscard]] Array settingsEntries() const;
+    /// The same for the resources: `about` with "number" and "changes", as requests report them.
+    [[nodiscard]] Array resourceEntries() const;
 
-/// The entries, oldest first: `about` with "number" (an integer) and "settings"; in an entry of an earlier release
-/// these are the top-level keys of the entry's files in one dictionary. Of these only the named ones are answered; a
-/// secret's value is the text "(secret)". What cannot be read of an entry is left out.
-[[nodiscard]] Array readHistory(const HostPath& directory, const std::vector<std::string>& keys,
-                                const std::vector<std::string>& secrets);
+    /// Removes what a process that was killed while it added an entry left; keep() does so too. No entry of another
+    /// process may be in the making.
+    void removeUnfinished() const;
+
+  private:
+    /// The values as they are kept: "settings", and "digests" of the secret ones.
+    [[nodiscard]] Result<Dictionary> snapshotOf(const Dictionary& values) const;
+    [[nodiscard]] Result<std::string> digestKey() const;
+    [[nodiscard]] std::optional<Error> keepOutsideEdit(const Dictionary& snapshot, const Dictionary& about) const;
+    [[nodiscard]] std::optional<Error> add(const std::vector<HostPath>& files, Dictionary about,
+                                           std::uint64_t& number) const;
+    [[nodiscard]] std::optional<Error> hideFormerValues(const std::vector<Change>& changes) const;
+
+    HostPath _directory;
+    HostPath _resources;
+    std::vector<Setting> _settings;
+};
 
 }  // namespace adminhost

@@ -1,5 +1,6 @@
 #include "adminhostd/Worker.h"
 
+#include "adminhostd/Login.h"
 #include "adminhostd/PluginCall.h"
 #include "adminhostd/PluginFile.h"
 #include "adminhostd/PluginTrial.h"
@@ -71,11 +72,22 @@ class ForwardingSink final : public LogSink, public ReportSink {
             return;
         }
     }
-    void changed(Change change) override { static_cast<void>(send(_descriptor, std::move(change))); }
+    void changed(Change change) override {
+        if (_changes.size() < changesMaximum) {
+            _changes.push_back(change);
+        }
+        static_cast<void>(send(_descriptor, std::move(change)));
+    }
     void notDone(NotDone part) override { static_cast<void>(send(_descriptor, std::move(part))); }
 
+    /// The changes that were reported since the last call, at most as many as a request's record keeps.
+    [[nodiscard]] std::vector<Change> takeChanges() { return std::exchange(_changes, {}); }
+
   private:
+    static constexpr std::size_t changesMaximum = 1000;
+
     int _descriptor;
+    std::vector<Change> _changes;
 };
 
 class Worker {
@@ -98,12 +110,14 @@ class Worker {
     protocol::Answer answer(const protocol::FindAccounts& order);
     protocol::Answer answer(const protocol::ReadHistory& order);
     protocol::Answer perform(const LoadedPlugin& loaded, const protocol::Perform& order);
-    static std::optional<Error> keepSettings(const LoadedPlugin& loaded, const protocol::Perform& order);
     void tryNeeds(const LoadedPlugin& loaded, std::vector<std::string>& problems) const;
     void enter(const LoadedPlugin& loaded) const;
     [[nodiscard]] Probe ask(const LoadedPlugin& loaded, const std::string& need, Clock::duration bound) const;
     [[nodiscard]] std::optional<protocol::Answer> unmetNeed(const LoadedPlugin& loaded,
                                                             const protocol::Perform& order) const;
+    /// The entry of the history that a write begins with; nullopt, with a report, if there is none.
+    [[nodiscard]] static std::optional<std::uint64_t> keepHistory(const LoadedPlugin& loaded, const Dictionary& about);
+    void completeHistory(const LoadedPlugin& loaded, std::optional<std::uint64_t> entry, const Dictionary& about);
     [[nodiscard]] const LoadedPlugin* pluginNamed(std::string_view name) const;
 
     int _descriptor;
@@ -288,6 +302,13 @@ std::optional<protocol::Answer> Worker::unmetNeed(const LoadedPlugin& loaded, co
     return std::nullopt;
 }
 
+/// The history of the settings that the plug-in names.
+Result<SettingsHistory> historyOf(const LoadedPlugin& loaded) {
+    auto settings = callPlugin([&] { return loaded.plugin->settingKeys(); });
+    return settings ? Result<SettingsHistory>(SettingsHistory(loaded.name, *std::move(settings)))
+                    : failure(settings.error());
+}
+
 /// Of workers that were killed in the middle of a write.
 void Worker::removeLeftovers() {
     if (std::exchange(_leftoversRemoved, true)) {
@@ -307,36 +328,58 @@ void Worker::removeLeftovers() {
         for (const HostPath& file : *others) {
             static_cast<void>(::unlink(diskPath(file).c_str()));
         }
-        removeUnfinishedHistory(historyDirectory(loaded.name));
+        SettingsHistory(loaded.name, {}).removeUnfinished();
     }
 }
 
-/// Adds what the settings are now to their history.
-std::optional<Error> Worker::keepSettings(const LoadedPlugin& loaded, const protocol::Perform& order) {
+/// A full or read-only disk does not stop a write: on a full disk, this write may be what fixes it.
+void reportNoEntry(const Error& error) {
+    logEvent("adminhostd: the settings before this write could not be kept: " + textOf(error));
+    reportNotDone({"", "The write has no entry in the history.", textOf(error.description)});
+}
+
+Result<Dictionary> settingsOf(const LoadedPlugin& loaded) {
+    return callPlugin([&] { return loaded.plugin->settings(); });
+}
+
+std::optional<std::uint64_t> Worker::keepHistory(const LoadedPlugin& loaded, const Dictionary& about) {
+    const auto history = historyOf(loaded);
     const auto files = callPlugin([&] { return loaded.plugin->settingsFiles(); });
-    if (!files) {
-        return files.error();
+    const auto settings = settingsOf(loaded);
+    if (!history || !files || !settings) {
+        reportNoEntry(!history ? history.error() : !files ? files.error() : settings.error());
+        return std::nullopt;
     }
-    const auto keys = callPlugin([&] { return loaded.plugin->settingKeys(); });
-    if (!keys) {
-        return keys.error();
+    const auto entry = history->keep(*files, *settings, about);
+    if (!entry) {
+        reportNoEntry(entry.error());
+        return std::nullopt;
     }
-    const auto values = callPlugin([&] { return loaded.plugin->settings(); });
-    if (!values) {
-        return values.error();
+    return *entry;
+}
+
+void Worker::completeHistory(const LoadedPlugin& loaded, std::optional<std::uint64_t> entry, const Dictionary& about) {
+    const std::vector<Change> changes = _sink.takeChanges();
+    if (!entry && changes.empty()) {
+        return;
     }
-    Dictionary settings;
-    for (const Setting& setting : *keys) {
-        if (const Value* value = values->find(setting.key)) {
-            settings.set(setting.key, setting.secret ? Value("(secret)") : *value);
-        }
+    const auto history = historyOf(loaded);
+    if (!history) {
+        reportNoEntry(history.error());
+        return;
     }
-    Dictionary about{{"when", order.received},
-                     {"who", fmt::format("uid {}", order.caller.uid)},
-                     {"command", order.command},
-                     {"request", order.request}};
-    about.set("settings", std::move(settings));
-    return keepHistory(historyDirectory(loaded.name), *files, about);
+    if (const auto error = history->keepResources(changes, about)) {
+        reportNoEntry(*error);
+    }
+    if (!entry) {
+        return;
+    }
+    const auto settings = settingsOf(loaded);
+    const auto error = settings ? history->complete(*entry, *settings) : settings.error();
+    if (error) {
+        logEvent("adminhostd: what this write changed could not be added to its entry of the history: " +
+                 textOf(*error));
+    }
 }
 
 protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Perform& order) {
@@ -389,13 +432,15 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
             return answer;
         }
     }
-    if (order.keepsHistory) {
-        // A full disk must not keep an administrator from settings that may fix it: the write goes on.
-        if (const auto error = keepSettings(loaded, order)) {
-            logEvent("adminhostd: the settings before this write could not be kept: " + textOf(*error));
-        }
-    }
+    const Dictionary about{{"when", order.received},
+                           {"who", loginText(order.caller.uid, order.caller.pid)},
+                           {"uid", std::uint64_t{order.caller.uid}},
+                           {"command", order.command},
+                           {"request", order.request}};
+    const std::optional<std::uint64_t> entry = order.keepsHistory ? keepHistory(loaded, about) : std::nullopt;
+    static_cast<void>(_sink.takeChanges());
     auto response = callPlugin([&] { return plugin.perform(order.command, order.arguments); });
+    completeHistory(loaded, entry, about);
     if (!response) {
         return failed(response.error());
     }
@@ -433,25 +478,18 @@ protocol::Answer Worker::answer(const protocol::Perform& order) {
     return found == nullptr ? notLoaded(order.plugin) : perform(*found, order);
 }
 
-/// The settings' history, narrowed to the keys that the plug-in names.
 protocol::Answer Worker::answer(const protocol::ReadHistory& order) {
     const LoadedPlugin* found = pluginNamed(order.plugin);
     if (found == nullptr) {
         return notLoaded(order.plugin);
     }
-    const auto settings = callPlugin([&] { return found->plugin->settingKeys(); });
-    if (!settings) {
-        return broken(textOf(settings.error().description));
+    const auto history = historyOf(*found);
+    if (!history) {
+        return broken(textOf(history.error().description));
     }
-    std::vector<std::string> keys;
-    std::vector<std::string> secrets;
-    for (const Setting& setting : *settings) {
-        keys.push_back(setting.key);
-        if (setting.secret) {
-            secrets.push_back(setting.key);
-        }
-    }
-    Dictionary response{{"history", readHistory(historyDirectory(found->name), keys, secrets)}};
+    Dictionary response;
+    response.set("history", history->settingsEntries());
+    response.set("resources", history->resourceEntries());
     return written(Outcome::answered, std::move(response), order.form);
 }
 

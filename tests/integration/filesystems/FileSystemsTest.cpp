@@ -267,20 +267,20 @@ TEST_F(FileSystems, MarkerOnAReadOnlyFileSystemIsLoggedAndTheSettingsAreWritten)
 TEST_F(FileSystems, HistoryWithoutRoomIsAnErrorThatLeavesNoHalfEntry) {
     const Mount state(root, "/var/lib/adminhostd");
     root.write(identityFile, std::string(40'000, 'x'));
-    const HostPath directory = adminhost::historyDirectory("lumio");
+    const adminhost::SettingsHistory history("lumio", {{"a", false}});
     const std::vector<HostPath> files{HostPath(std::string(identityFile))};
-    ASSERT_FALSE(adminhost::keepHistory(directory, files, {}));
+    ASSERT_TRUE(history.keep(files, {}, {}));
     const auto before = below("/var/lib/adminhostd");
-    const auto error = adminhost::keepHistory(directory, files, {});
-    ASSERT_TRUE(error);
-    EXPECT_THAT(*error->description, HasSubstr("No space left on device"));
+    const auto full = history.keep(files, {}, {});
+    ASSERT_FALSE(full);
+    EXPECT_THAT(*full.error().description, HasSubstr("No space left on device"));
     EXPECT_EQ(below("/var/lib/adminhostd"), before);
-    EXPECT_EQ(adminhost::readHistory(directory, {}, {}).size(), 1U);
+    EXPECT_EQ(history.settingsEntries().size(), 1U);
 
     state.makeReadOnly();
-    const auto refused = adminhost::keepHistory(directory, files, {});
-    ASSERT_TRUE(refused);
-    EXPECT_THAT(*refused->description, HasSubstr("Read-only file system"));
+    const auto refused = history.keep(files, {}, {});
+    ASSERT_FALSE(refused);
+    EXPECT_THAT(*refused.error().description, HasSubstr("Read-only file system"));
 }
 
 /// Runs this program again as the superuser of a user namespace, with mounts of its own; returns when it runs there.

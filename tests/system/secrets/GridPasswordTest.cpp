@@ -176,12 +176,13 @@ TEST_F(GridPassword, AcceptedOneIsStoredOnlyInItsProtectedFormAndHistoryHoldsNoO
     EXPECT_THAT(after, HasSubstr("nimbo_client_password"));
 
     // Again, as the same, so that the history's newest entry was made with the password stored; and as a property list.
-    EXPECT_EQ(post(bodyWith()).status, 200);
+    EXPECT_EQ(post(bodyWith(R"(,"server_port":8172)")).status, 200);
     EXPECT_EQ(bytesOf(root.clusterPreferencesPath()), after);
-    const HttpReply list = post(std::string("<plist><dict><key>configuration</key><dict><key>nimbo_client_password"
-                                            "</key><string>") +
-                                    planted + "</string></dict></dict></plist>",
-                                {"Content-Type: application/x-plist", "Accept: application/x-plist"});
+    const HttpReply list =
+        post(std::string("<plist><dict><key>configuration</key><dict><key>nimbo_client_password"
+                         "</key><string>") +
+                 planted + "</string><key>server_port</key><integer>8173</integer></dict></dict></plist>",
+             {"Content-Type: application/x-plist", "Accept: application/x-plist"});
     EXPECT_EQ(list.status, 200);
     std::size_t entries = 0;
     for (const auto& entry : fs::directory_iterator(root.disk("/var/lib/adminhostd/history/lumio"))) {

@@ -3,6 +3,7 @@
 
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
+#include "platform/value/Text.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
@@ -257,6 +258,41 @@ TEST_F(Settings, SetupScriptThatLeavesADaemonHoldingItsPipesDoesNotHoldTheAnswer
     root.setSwitch("setup_preferences.daemon", "30");
     EXPECT_EQ(post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})").status, 200);
     EXPECT_TRUE(root.daemonLeftBy("setup_preferences")) << "the process that the script left lives on";
+}
+
+TEST_F(Settings, WriteThatCanHaveNoEntryInTheHistoryIsCarriedOutAndReportsIt) {
+    root.write("/var/lib/adminhostd/history", "a file where the directory belongs");
+    const HttpReply reply = post("writeSettings", R"({"configuration":{"server_port":9001}})");
+    EXPECT_EQ(reply.status, 200);
+    EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "9001\n");
+    const Value record = valueOf(daemon.connect().get("/v1/requests/" + reply.headers.at("request-id")));
+    const Array* parts = record.dictionary()->get("notDone").array();
+    ASSERT_TRUE(parts != nullptr && parts->size() == 1U) << textOf(record);
+    EXPECT_EQ(parts->front().dictionary()->get("reason"), Value("The write has no entry in the history."));
+    EXPECT_NE(parts->front().dictionary()->get("toolMessage"), Value(""));
+}
+
+TEST_F(Settings, HistoryTellsWhatEachWriteChangedFromWhatWasEditedOutside) {
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
+    const std::string file = "/Library/SorvaneProducer/Shared/Server/member_preferences_" +
+                             test::SampleRoot::uuidOf("member", "media1") + ".plist";
+    std::string text = root.read(file);
+    ASSERT_NE(text.find("9001"), std::string::npos);
+    root.write(file, text.replace(text.find("9001"), 4, "9002"));
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"nimbo_client_password":"another one"}})").status, 200);
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"properties":[]}})").status, 200);
+    const Value answer = valueOf(daemon.connect().get("/v1/lumio/history"));
+    const Array& entries = *answer.dictionary()->get("history").array();
+    ASSERT_EQ(entries.size(), 3U) << textOf(answer);
+    const auto changesOf = [&](std::size_t i) { return entries[i].dictionary()->get("changes"); };
+    EXPECT_EQ(changesOf(0).array()->front().dictionary()->get("to"), Value(9001));
+    EXPECT_EQ(entries[1].dictionary()->get("who"), Value("outside the daemon"));
+    EXPECT_EQ(changesOf(1), Value(Array{Dictionary{{"key", "server_port"}, {"from", 9001}, {"to", 9002}}}));
+    EXPECT_EQ(
+        changesOf(2),
+        Value(Array{Dictionary{
+            {"key", "nimbo_client_password"}, {"secret", true}, {"from", "(secret)"}, {"to", "(secret) changed"}}}));
+    EXPECT_THAT(*entries[2].dictionary()->get("who").string(), HasSubstr("uid "));
 }
 
 TEST_F(Settings, UnknownPluginHasNoHistory) {

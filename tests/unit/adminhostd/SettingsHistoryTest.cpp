@@ -1,104 +1,240 @@
+#include "adminhostd/Login.h"
 #include "adminhostd/SettingsHistory.h"
+#include "tests/support/CapturedLog.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <filesystem>
+#include <string>
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
 
 namespace fs = std::filesystem;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::MatchesRegex;
 
-class History : public testing::Test {
+constexpr const char* directory = "/var/lib/adminhostd/history/lumio";
+
+class HistoryTest : public testing::Test {
   protected:
-    [[nodiscard]] Array read() const { return readHistory(directory, {"a", "b", "password"}, {"password"}); }
-    void keep(std::string_view who = "uid 0") const {
-        const auto error = keepHistory(directory, files, Dictionary{{"who", who}});
-        EXPECT_FALSE(error) << *error->description;
+    /// A write from one state of the settings to another. The entry's number.
+    std::uint64_t write(const Dictionary& before, const std::optional<Dictionary>& after, const char* who = "anna") {
+        const auto number = history.keep(files, before, Dictionary{{"who", who}});
+        EXPECT_TRUE(number) << *number.error().description;
+        if (number && after) {
+            EXPECT_FALSE(history.complete(*number, *after));
+        }
+        return number ? *number : 0;
+    }
+    [[nodiscard]] Dictionary entry(std::size_t index) const {
+        const Array entries = history.settingsEntries();
+        EXPECT_LT(index, entries.size());
+        return index < entries.size() ? *entries[index].dictionary() : Dictionary();
+    }
+    [[nodiscard]] static Change resourceChange(const char* key, Value from, Value to, bool secret = false) {
+        Change change;
+        change.section = "properties";
+        change.identity = "3";
+        change.name = "watermark";
+        change.key = key;
+        change.from = std::move(from);
+        change.to = std::move(to);
+        change.secret = secret;
+        if (!secret) {
+            change.undo = Dictionary{{key, change.from}};
+        }
+        return change;
     }
 
     test::TemporaryRoot root;
-    const HostPath directory = historyDirectory("lumio");
+    test::CapturedLog log;
+    const SettingsHistory history{"lumio", {{"a", false}, {"b", false}, {"password", true}}};
     const std::vector<HostPath> files = {HostPath("/one.plist"), HostPath("/two.plist")};
 };
 
-TEST_F(History, WithoutEntriesIsEmpty) {
-    EXPECT_EQ(read(), Array{});
+TEST_F(HistoryTest, WithoutEntriesIsEmpty) {
+    EXPECT_EQ(history.settingsEntries(), Array{});
+    EXPECT_EQ(history.resourceEntries(), Array{});
 }
 
-TEST_F(History, EntryHoldsTheSettingsAsTheyWereWithWhoWroteThem) {
-    root.writePropertyList("/one.plist", "<key>a</key><integer>1</integer><key>unknown</key><true/>");
-    root.writePropertyList("/two.plist", "<key>b</key><string>x</string>");
-    keep("uid 7");
-    root.writePropertyList("/one.plist", "<key>a</key><integer>2</integer>");
-    keep();
-    EXPECT_EQ(
-        read(),
-        (Array{Value(Dictionary{{"who", "uid 7"}, {"number", 1}, {"settings", Dictionary{{"a", 1}, {"b", "x"}}}}),
-               Value(Dictionary{{"who", "uid 0"}, {"number", 2}, {"settings", Dictionary{{"a", 2}, {"b", "x"}}}})}));
+TEST_F(HistoryTest, EntryHoldsTheSettingsAsTheyWereWhoWroteAndWhatChanged) {
+    write({{"a", 1}, {"b", "x"}}, Dictionary{{"a", 2}});
+    EXPECT_EQ(entry(0), (Dictionary{{"who", "anna"},
+                                    {"changes", Array{Dictionary{{"key", "a"}, {"from", 1}, {"to", 2}},
+                                                      Dictionary{{"key", "b"}, {"from", "x"}}}},
+                                    {"number", 1},
+                                    {"settings", Dictionary{{"a", 1}, {"b", "x"}}}}));
 }
 
-TEST_F(History, SecretsAreKeptButNeverAnswered) {
-    root.writePropertyList("/one.plist", "<key>password</key><string>cipher text</string>");
-    keep();
-    EXPECT_EQ(*read()[0].dictionary()->get("settings").dictionary(), (Dictionary{{"password", "(secret)"}}));
-    EXPECT_NE(root.read("/var/lib/adminhostd/history/lumio/00000001/0.plist").find("cipher text"), std::string::npos);
+TEST_F(HistoryTest, OnlyTheSettingsThatThePluginNamesAreKeptWhateverTheFilesHold) {
+    root.writePropertyList("/one.plist", "<key>a</key><string>of another file's table</string>");
+    write({{"b", "x"}, {"unknown", 1}}, Dictionary{{"b", "y"}});
+    EXPECT_EQ(entry(0).get("settings"), Value(Dictionary{{"b", "x"}}));
 }
 
-TEST_F(History, OnlyItsOwnerCanEnterTheDirectory) {
-    keep();
-    for (const char* path : {"/var/lib/adminhostd/history/lumio", "/var/lib/adminhostd/history/lumio/00000001"}) {
-        EXPECT_EQ(fs::status(root.path(path)).permissions(), fs::perms(0700)) << path;
-    }
+TEST_F(HistoryTest, WriteThatChangedNoSettingHasNoEntry) {
+    write({{"a", 1}}, Dictionary{{"a", 1}});
+    EXPECT_EQ(history.settingsEntries(), Array{});
 }
 
-TEST_F(History, MissingAndUnreadableFilesLeaveTheOthersTheirEntry) {
+TEST_F(HistoryTest, WriteThatWasKilledHasItsEntry) {
+    write({{"a", 1}}, std::nullopt);
+    EXPECT_FALSE(entry(0).contains("changes"));
+    EXPECT_EQ(entry(0).get("settings"), Value(Dictionary{{"a", 1}}));
+}
+
+TEST_F(HistoryTest, EditOutsideTheDaemonIsARowOfItsOwnAndNotTheNextWriters) {
+    write({{"a", 1}}, Dictionary{{"a", 2}});
+    write({{"a", 5}, {"b", "edited"}}, Dictionary{{"a", 5}, {"b", "written"}}, "berta");
+    ASSERT_EQ(history.settingsEntries().size(), 3U);
+    const Dictionary outside = entry(1);
+    EXPECT_EQ(outside.get("who"), Value("outside the daemon"));
+    EXPECT_EQ(outside.get("outside"), Value(true));
+    EXPECT_EQ(outside.get("settings"), Value(Dictionary{{"a", 2}}));
+    EXPECT_EQ(outside.get("changes"), Value(Array{Dictionary{{"key", "a"}, {"from", 2}, {"to", 5}},
+                                                  Dictionary{{"key", "b"}, {"to", "edited"}}}));
+    EXPECT_EQ(entry(2).get("who"), Value("berta"));
+    EXPECT_EQ(entry(2).get("changes"), Value(Array{Dictionary{{"key", "b"}, {"from", "edited"}, {"to", "written"}}}));
+}
+
+TEST_F(HistoryTest, SecretShowsThatItChangedAndNeverItsValue) {
+    write({{"password", "cipher one"}}, Dictionary{{"password", "cipher two"}});
+    EXPECT_EQ(entry(0).get("settings"), Value(Dictionary{{"password", "(secret)"}}));
+    EXPECT_EQ(entry(0).get("changes"),
+              Value(Array{Dictionary{
+                  {"key", "password"}, {"secret", true}, {"from", "(secret)"}, {"to", "(secret) changed"}}}));
+    const std::string about = root.read(std::string(directory) + "/00000001/about.plist");
+    EXPECT_EQ(about.find("cipher"), std::string::npos);
+    write({{"password", "cipher two"}}, Dictionary{{"password", "cipher two"}});
+    EXPECT_EQ(history.settingsEntries().size(), 1U) << "the same secret is no change";
+    struct stat status {};
+    ASSERT_EQ(::stat(root.path(std::string(directory) + "/digest.key").c_str(), &status), 0);
+    EXPECT_EQ(status.st_mode & 0777U, 0600U);
+}
+
+TEST_F(HistoryTest, FilesAreKeptByteForByteAndMissingOrUnreadableOnesLeaveTheOthersTheirEntry) {
     fs::create_directories(root.path("/one.plist"));
-    root.writePropertyList("/two.plist", "<key>b</key><string>x</string>");
-    keep();
-    EXPECT_EQ(*read()[0].dictionary()->get("settings").dictionary(), (Dictionary{{"b", "x"}}));
+    root.write("/two.plist", "not a property list");
+    write({{"a", 1}}, Dictionary{{"a", 2}});
+    EXPECT_EQ(root.read(std::string(directory) + "/00000001/1.plist"), "not a property list");
+    EXPECT_EQ(history.settingsEntries().size(), 1U);
 }
 
-TEST_F(History, FileThatIsNoPropertyListIsKeptByteForByteAndAnswersNothing) {
-    root.write("/one.plist", "not a property list");
-    keep();
-    EXPECT_EQ(root.read("/var/lib/adminhostd/history/lumio/00000001/0.plist"), "not a property list");
-    EXPECT_EQ(*read()[0].dictionary()->get("settings").dictionary(), Dictionary{});
+TEST_F(HistoryTest, EntryThatLacksOneOfItsFilesIsNotListed) {
+    root.write("/two.plist", "text");
+    write({{"a", 1}}, Dictionary{{"a", 2}});
+    write({{"a", 2}}, Dictionary{{"a", 3}});
+    fs::remove(root.path(std::string(directory) + "/00000001/1.plist"));
+    ASSERT_EQ(history.settingsEntries().size(), 1U);
+    EXPECT_EQ(entry(0).get("number"), Value(2));
 }
 
-TEST_F(History, KeepsTheLastFiftyAndNeverRenumbers) {
-    for (int i = 0; i < 53; ++i) {
-        keep();
+TEST_F(HistoryTest, OnlyItsOwnerCanEnterTheDirectory) {
+    write({{"a", 1}}, Dictionary{{"a", 2}});
+    for (const char* path : {"", "/00000001"}) {
+        EXPECT_EQ(fs::status(root.path(std::string(directory) + path)).permissions(), fs::perms(0700)) << path;
     }
-    const Array entries = read();
-    ASSERT_EQ(entries.size(), 50U);
-    EXPECT_EQ(entries.front().dictionary()->get("number"), Value(4));
-    EXPECT_EQ(entries.back().dictionary()->get("number"), Value(53));
 }
 
-TEST_F(History, UnfinishedEntryOfAKilledProcessIsRemovedAndNoEntry) {
-    root.write("/var/lib/adminhostd/history/lumio/unfinished-1/0.plist", "half");
-    EXPECT_EQ(read(), Array{});
-    keep();
-    EXPECT_EQ(read().size(), 1U);
-    EXPECT_FALSE(fs::exists(root.path("/var/lib/adminhostd/history/lumio/unfinished-1")));
+TEST_F(HistoryTest, SettingsAndResourcesHaveBoundsOfTheirOwnAndAreNeverRenumbered) {
+    for (int i = 0; i < 53; ++i) {
+        write({{"a", i}}, Dictionary{{"a", i + 1}});
+    }
+    for (int i = 0; i < 503; ++i) {
+        ASSERT_FALSE(history.keepResources({resourceChange("value", i, i + 1)}, {}));
+    }
+    const Array settings = history.settingsEntries();
+    const Array resources = history.resourceEntries();
+    ASSERT_EQ(settings.size(), 50U);
+    EXPECT_EQ(settings.front().dictionary()->get("number"), Value(4));
+    EXPECT_EQ(settings.back().dictionary()->get("number"), Value(53));
+    ASSERT_EQ(resources.size(), 500U);
+    EXPECT_EQ(resources.front().dictionary()->get("number"), Value(4));
+    EXPECT_EQ(resources.back().dictionary()->get("number"), Value(503));
 }
 
-TEST_F(History, UnfinishedEntryIsRemovedWithoutANewOneToo) {
-    keep();
-    root.write("/var/lib/adminhostd/history/lumio/unfinished-2/0.plist", "half");
-    removeUnfinishedHistory(directory);
-    EXPECT_FALSE(fs::exists(root.path("/var/lib/adminhostd/history/lumio/unfinished-2")));
-    EXPECT_EQ(read().size(), 1U);
+TEST_F(HistoryTest, ResourceEntryHoldsTheReportedChangesAndNoneOfTheSettings) {
+    Change setting = resourceChange("server_port", 1, 2);
+    setting.section = "settings";
+    ASSERT_FALSE(history.keepResources({setting}, {}));
+    EXPECT_EQ(history.resourceEntries(), Array{});
+    ASSERT_FALSE(history.keepResources({setting, resourceChange("value", "left", "right")}, {{"who", "anna"}}));
+    const Array expected{Dictionary{{"section", "properties"},
+                                    {"identity", "3"},
+                                    {"name", "watermark"},
+                                    {"key", "value"},
+                                    {"from", "left"},
+                                    {"to", "right"},
+                                    {"undo", Dictionary{{"value", "left"}}},
+                                    {"secret", false}}};
+    const Array entries = history.resourceEntries();
+    ASSERT_EQ(entries.size(), 1U);
+    EXPECT_EQ(entries[0].dictionary()->get("who"), Value("anna"));
+    EXPECT_EQ(entries[0].dictionary()->get("changes"), Value(expected));
 }
 
-TEST_F(History, DirectoryThatCannotBeMadeIsAnErrorThatSaysWhy) {
+TEST_F(HistoryTest, ValueThatBecomesSecretIsReplacedInAllKeptEntries) {
+    ASSERT_FALSE(history.keepResources({resourceChange("value", "first plain", "second plain")}, {}));
+    Change other = resourceChange("value", "of another", "one");
+    other.identity = "4";
+    ASSERT_FALSE(history.keepResources({other}, {}));
+    ASSERT_FALSE(history.keepResources({resourceChange("value", nullptr, nullptr, true)}, {}));
+    for (const auto& file : fs::directory_iterator(root.path(std::string(directory) + "/resources"))) {
+        const std::string text = root.read(std::string(directory) + "/resources/" + file.path().filename().string());
+        EXPECT_EQ(text.find("plain"), std::string::npos) << file.path();
+    }
+    const Array entries = history.resourceEntries();
+    const Dictionary& hidden = *entries[0].dictionary()->get("changes").array()->front().dictionary();
+    EXPECT_EQ(hidden.get("from"), Value("(secret)"));
+    EXPECT_EQ(hidden.get("to"), Value("(secret)"));
+    EXPECT_FALSE(hidden.contains("undo"));
+    EXPECT_EQ(entries[1].dictionary()->get("changes").array()->front().dictionary()->get("from"), Value("of another"));
+}
+
+TEST_F(HistoryTest, EntriesOfTheFirstFormatAreReadAndThoseOfANewerOneAreSkippedWithOneLine) {
+    const std::string place = directory;
+    root.writePropertyList(place + "/00000001/0.plist",
+                           "<key>a</key><integer>1</integer><key>password</key><string>cipher</string>"
+                           "<key>unknown</key><true/>");
+    root.writePropertyList(place + "/00000001/about.plist",
+                           "<key>who</key><string>uid 7</string><key>files</key><array><dict><key>path</key>"
+                           "<string>/one.plist</string><key>name</key><string>0.plist</string></dict></array>");
+    root.writePropertyList(place + "/00000002/about.plist", "<key>format</key><integer>3</integer>");
+    root.writePropertyList(place + "/00000003/about.plist", "<key>format</key><integer>4</integer>");
+    EXPECT_EQ(history.settingsEntries(),
+              (Array{Value(Dictionary{
+                  {"who", "uid 7"}, {"number", 1}, {"settings", Dictionary{{"a", 1}, {"password", "(secret)"}}}})}));
+    EXPECT_THAT(log.lines, ElementsAre(HasSubstr("2 entries of the history were written by a newer release")));
+}
+
+TEST_F(HistoryTest, UnfinishedEntryOfAKilledProcessIsRemovedAndNoEntry) {
+    root.write(std::string(directory) + "/unfinished-1/0.plist", "half");
+    EXPECT_EQ(history.settingsEntries(), Array{});
+    write({{"a", 1}}, Dictionary{{"a", 2}});
+    EXPECT_EQ(history.settingsEntries().size(), 1U);
+    EXPECT_FALSE(fs::exists(root.path(std::string(directory) + "/unfinished-1")));
+    root.write(std::string(directory) + "/unfinished-2/0.plist", "half");
+    history.removeUnfinished();
+    EXPECT_FALSE(fs::exists(root.path(std::string(directory) + "/unfinished-2")));
+}
+
+TEST_F(HistoryTest, DirectoryThatCannotBeMadeIsAnErrorThatSaysWhy) {
     root.write("/var/lib", "a file where the directory belongs");
-    const auto error = keepHistory(directory, files, {});
-    ASSERT_TRUE(error);
-    EXPECT_FALSE(error->description->empty());
+    const auto number = history.keep(files, {}, {});
+    ASSERT_FALSE(number);
+    EXPECT_FALSE(number.error().description->empty());
+    EXPECT_TRUE(history.keepResources({resourceChange("value", 1, 2)}, {}));
+}
+
+TEST(Login, NamesTheAccountAndItsNumber) {
+    EXPECT_THAT(loginText(0, ::getpid()), MatchesRegex(".*root \\(uid 0\\)"));
+    EXPECT_EQ(loginText(4123456789U, -1), "uid 4123456789");
 }
 
 }  // namespace
