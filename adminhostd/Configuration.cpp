@@ -97,12 +97,11 @@ void apply(const Entry& entry, Options& options) {
 }  // namespace
 
 void readConfiguration(const std::string& file, Options& options) {
-    Error unreadable;
     // The parser would read a directory, or what fails while it is read, as an empty file.
-    const auto text = readFile(DiskPath(file), configurationMaximum, &unreadable);
+    const auto text = readFile(DiskPath(file), configurationMaximum);
     if (!text) {
         throw std::runtime_error(fmt::format("{}: {}; the configuration must be a readable file", file,
-                                             std::generic_category().message(static_cast<int>(unreadable.code))));
+                                             std::generic_category().message(static_cast<int>(text.error().code))));
     }
     toml::table table;
     try {

@@ -81,10 +81,9 @@ bool writeEntries(std::string& out, const Dictionary& dictionary, int depth) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-    Error error;
-    const auto table = parseStringsTable({reinterpret_cast<const char*>(data), size}, &error);
+    const auto table = parseStringsTable({reinterpret_cast<const char*>(data), size});
     if (!table) {
-        if (!error.description || error.description->empty()) {
+        if (table.error().description.value_or("").empty()) {
             std::abort();
         }
         return 0;

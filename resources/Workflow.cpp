@@ -2,7 +2,7 @@
 
 #include "platform/files/File.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "settings/SettingsStore.h"
 
 #include <filesystem>
@@ -58,8 +58,12 @@ std::optional<Dictionary> Workflow::uncachedInfoDictionary() {
         return std::nullopt;
     }
     const DiskPath file = diskPath(HostPath(opened->path().text() + "/Contents/Info.plist"));
-    const auto bytes = isBelowRoot(file) ? adminhost::readFile(file, informationMaximumSize) : std::nullopt;
-    auto value = bytes ? adminhost::parsePropertyList(*bytes) : std::nullopt;
+    std::optional<Value> value;
+    if (isBelowRoot(file)) {
+        if (const auto bytes = adminhost::readFile(file, informationMaximumSize)) {
+            value = adminhost::parsePropertyList(*bytes);
+        }
+    }
     Dictionary* information = value ? value->dictionary() : nullptr;
     return information == nullptr ? std::nullopt : std::optional(std::move(*information));
 }

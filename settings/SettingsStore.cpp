@@ -193,7 +193,7 @@ std::optional<Dictionary> SettingsStore::clusterPreferences() {
 
 HostPath SettingsStore::dbPath() {
     const HostPath location(std::string(stateDirectory).append("/database.yml"));
-    const std::optional<std::string> text = adminhost::readFile(adminhost::diskPath(location), locationFileMaximum);
+    const auto text = adminhost::readFile(adminhost::diskPath(location), locationFileMaximum);
     if (text && adminhost::isUtf8(*text)) {
         std::string_view value = productionDatabase(*text).value_or("");
         if (value.size() > 1 && value.front() == '"' && value.back() == '"') {

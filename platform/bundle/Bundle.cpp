@@ -15,6 +15,11 @@ namespace fs = std::filesystem;
 /// More entries than any bundle has; a directory that others fill does not hold a request up.
 constexpr std::size_t maximumEntries = 4096;
 
+/// Drops the error: a table is an addition to what is shown, which goes without it.
+std::optional<Dictionary> valueOf(Result<Dictionary> table) {
+    return table ? std::optional(std::move(*table)) : std::nullopt;
+}
+
 bool isDirectory(const fs::path& path) {
     std::error_code error;
     return fs::is_directory(path, error);
@@ -69,9 +74,10 @@ std::optional<DiskPath> Bundle::stringsTable(std::string_view table, std::string
     return std::nullopt;
 }
 
-std::optional<Dictionary> readStringsTable(const DiskPath& path, Error* error) {
-    const std::optional<std::string> bytes = readFile(path, stringsTableMaximumSize, error);
-    return bytes ? parseStringsTable(*bytes, error) : std::nullopt;
+Result<Dictionary> readStringsTable(const DiskPath& path) {
+    return readFile(path, stringsTableMaximumSize).and_then([](const std::string& bytes) {
+        return parseStringsTable(bytes);
+    });
 }
 
 std::optional<Dictionary> localizedTable(const Bundle& bundle, std::string_view table,
@@ -79,12 +85,12 @@ std::optional<Dictionary> localizedTable(const Bundle& bundle, std::string_view 
     const std::vector<std::string> localizations = bundle.localizations();
     for (const std::string& localization : matchingLocalizations(localizations, preferredLanguages)) {
         if (const auto path = bundle.stringsTable(table, localization)) {
-            return readStringsTable(*path);
+            return valueOf(readStringsTable(*path));
         }
     }
     for (const std::string& localization : equivalentLocalizations(localizations, "English")) {
         if (const auto path = bundle.stringsTable(table, localization)) {
-            return readStringsTable(*path);
+            return valueOf(readStringsTable(*path));
         }
     }
     return std::nullopt;

@@ -4,7 +4,7 @@
 //
 // A bundle's localizations are the subdirectories of its "Contents/Resources", of its "Resources" and of itself that
 // are named after a language (Language.h), with or without an extension. A strings table is a file TABLE.strings in one
-// of them. A bundle may lie on a file system that others write to: what is read is bounded, and nothing waits for a
+// of them. A bundle may be on a file system that others write to: what is read is bounded, and nothing waits for a
 // pipe.
 
 #include "platform/bundle/StringsTable.h"
@@ -21,13 +21,13 @@ namespace adminhost {
 
 class Bundle {
   public:
-    /// Nothing if no directory is there.
+    /// Returns nullopt if the path is not a directory.
     [[nodiscard]] static std::optional<Bundle> open(const HostPath& path);
 
     [[nodiscard]] const HostPath& path() const noexcept { return _path; }
     /// The localizations' names as they are spelled, without extension; each once, in alphabetical order.
     [[nodiscard]] std::vector<std::string> localizations() const;
-    /// Where the table of that localization (spelled as localizations() does) lies; nothing if it has none.
+    /// The file with the table of that localization (spelled as localizations() does); nullopt if it has none.
     [[nodiscard]] std::optional<DiskPath> stringsTable(std::string_view table, std::string_view localization) const;
 
   private:
@@ -42,12 +42,12 @@ class Bundle {
     std::vector<Localization> _localizations;  ///< by name, then in the order in which they are looked into
 };
 
-/// Reads a strings table of any form: XML, binary or quoted text. Nothing if it cannot be read, is no dictionary or is
+/// Reads a strings table of any form: XML, binary or quoted text. Fails if it cannot be read, is not a dictionary or is
 /// larger than stringsTableMaximumSize.
-[[nodiscard]] std::optional<Dictionary> readStringsTable(const DiskPath& path, Error* error = nullptr);
+[[nodiscard]] Result<Dictionary> readStringsTable(const DiskPath& path);
 
 /// The table in the best of the preferred languages (names or codes, most preferred first) that has it, else in
-/// "English". The first one found is answered: if it cannot be read, nothing is.
+/// "English". Returns nullopt if there is none, and also if the first one found cannot be read.
 [[nodiscard]] std::optional<Dictionary> localizedTable(const Bundle& bundle, std::string_view table,
                                                        const std::vector<std::string>& preferredLanguages);
 

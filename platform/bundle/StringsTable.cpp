@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <optional>
 #include <string>
 
 #include <fmt/format.h>
@@ -16,10 +17,8 @@ namespace {
 
 constexpr std::string_view byteOrderMark = "\xEF\xBB\xBF";
 
-void setError(Error* error, std::string description) {
-    if (error != nullptr) {
-        *error = Error{"stringsTable", 1, std::move(description)};
-    }
+auto failed(std::string description) {
+    return failure(Error{"stringsTable", 1, std::move(description)});
 }
 
 bool isHighSurrogate(char32_t unit) noexcept {
@@ -323,44 +322,42 @@ class Parser {
     const char* _problem = "";
 };
 
-std::optional<Dictionary> parseAsPropertyList(std::string_view bytes, Error* error) {
-    std::optional<Value> value = parsePropertyList(bytes, error);
+Result<Dictionary> parseAsPropertyList(std::string_view bytes) {
+    Error error;
+    std::optional<Value> value = parsePropertyList(bytes, &error);
     if (!value) {
-        return std::nullopt;
+        return failure(std::move(error));
     }
     if (value->dictionary() == nullptr) {
-        setError(error,
-                 fmt::format("a strings table is a dictionary, this property list is a {}", nameOf(value->type())));
-        return std::nullopt;
+        return failed(
+            fmt::format("a strings table is a dictionary, this property list is a {}", nameOf(value->type())));
     }
     return std::move(*value->dictionary());
 }
 
 }  // namespace
 
-std::optional<Dictionary> parseStringsTable(std::string_view bytes, Error* error) {
+Result<Dictionary> parseStringsTable(std::string_view bytes) {
     if (bytes.size() > stringsTableMaximumSize) {
-        setError(error, fmt::format("a strings table of more than {} bytes is not read", stringsTableMaximumSize));
-        return std::nullopt;
+        return failed(fmt::format("a strings table of more than {} bytes is not read", stringsTableMaximumSize));
     }
     if (bytes.starts_with("bplist")) {
-        return parseAsPropertyList(bytes, error);
+        return parseAsPropertyList(bytes);
     }
     const std::optional<std::string> text = textOfTable(bytes);
     if (!text) {
-        setError(error, "a strings table is in UTF-8 or UTF-16, this one is in neither");
-        return std::nullopt;
+        return failed("a strings table is in UTF-8 or UTF-16, this one is in neither");
     }
     const auto first = std::find_if_not(text->begin(), text->end(), isBlank);
     if (first != text->end() && *first == '<') {
-        return parseAsPropertyList(bytes, error);
+        return parseAsPropertyList(bytes);
     }
     Parser parser(*text);
     std::optional<Dictionary> table = parser.table();
     if (!table) {
-        setError(error, parser.problem());
+        return failed(parser.problem());
     }
-    return table;
+    return std::move(*table);
 }
 
 }  // namespace adminhost

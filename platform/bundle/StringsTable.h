@@ -9,11 +9,10 @@
 // character beyond U+FFFF), and a backslash before any other character for that character. An octal escape names the
 // character U+0000 to U+00FF. Encodings: UTF-8 and UTF-16, with or without a byte-order mark.
 
-#include "platform/value/Error.h"
+#include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
 #include <cstddef>
-#include <optional>
 #include <string_view>
 
 namespace adminhost {
@@ -22,9 +21,8 @@ constexpr std::size_t stringsTableMaximumSize = std::size_t{16} << 20U;  ///< by
 constexpr int stringsTableMaximumDepth = 64;                             ///< nested lists and dictionaries
 
 /// Parses a strings table in quoted-text form, or an XML or binary property list that is a dictionary. Of equal keys
-/// the last one stands. Nothing on failure; then, if error is given, it says what is wrong and where (line and column
-/// from 1, counted in characters). Refused: the character NUL, invalid UTF-8 and UTF-16, sizes and depths above the
-/// maximum.
-[[nodiscard]] std::optional<Dictionary> parseStringsTable(std::string_view bytes, Error* error = nullptr);
+/// the last one counts. The error says what is wrong and where (line and column from 1, counted in characters).
+/// Refused: the character NUL, invalid UTF-8 and UTF-16, sizes and depths above the maximum.
+[[nodiscard]] Result<Dictionary> parseStringsTable(std::string_view bytes);
 
 }  // namespace adminhost

@@ -290,8 +290,11 @@ std::shared_ptr<const AccountTable> AccountFiles::table(AccountKind kind, Error*
             _tables[1].reset();
             _keptUuids = {path.text(),
                           identityOf(path)};  // before reading: a change meanwhile shows at the next look-up
-            const auto text = readFile(path, maximumFileSize, error);
+            const auto text = readFile(path, maximumFileSize);
             if (!text) {
+                if (error != nullptr) {
+                    *error = text.error();
+                }
                 return nullptr;
             }
             _given = std::make_shared<const GivenUuids>(givenUuidsIn(*text));
@@ -301,8 +304,11 @@ std::shared_ptr<const AccountTable> AccountFiles::table(AccountKind kind, Error*
     if (!_tables[slot] || !unchanged(_keptAccounts[slot], path)) {
         _tables[slot].reset();
         _keptAccounts[slot] = {path.text(), identityOf(path)};
-        auto text = readFile(path, maximumFileSize, error);
+        auto text = readFile(path, maximumFileSize);
         if (!text) {
+            if (error != nullptr) {
+                *error = text.error();
+            }
             return nullptr;
         }
         ++_passes;

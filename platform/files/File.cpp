@@ -12,33 +12,30 @@
 namespace adminhost {
 namespace {
 
-std::nullopt_t fail(const DiskPath& path, int number, Error* error) {
-    if (error != nullptr) {
-        *error = Error{"posix", number,
-                       "cannot read " + hostPath(path).text() + ": " + std::generic_category().message(number)};
-    }
-    return std::nullopt;
+auto failed(const DiskPath& path, int number) {
+    return failure(Error{"posix", number,
+                         "cannot read " + hostPath(path).text() + ": " + std::generic_category().message(number)});
 }
 
 }  // namespace
 
-std::optional<std::string> readFile(const DiskPath& path, std::size_t maximum, Error* error) {
-    if (path.text().find('\0') != std::string::npos) {  // the system would open what stands before it
-        return fail(path, EINVAL, error);
+Result<std::string> readFile(const DiskPath& path, std::size_t maximum) {
+    if (path.text().find('\0') != std::string::npos) {  // the system would open the part before it
+        return failed(path, EINVAL);
     }
     const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
     struct stat status {};
     if (!file.isOpen() || ::fstat(file.get(), &status) != 0) {
-        return fail(path, errno, error);
+        return failed(path, errno);
     }
     if (!S_ISREG(status.st_mode)) {
-        return fail(path, S_ISDIR(status.st_mode) ? EISDIR : EINVAL, error);
+        return failed(path, S_ISDIR(status.st_mode) ? EISDIR : EINVAL);
     }
     std::string bytes;
     std::size_t room = static_cast<std::size_t>(status.st_size) + 1;  // one more, so that growth is noticed
     for (;;) {
         if (bytes.size() > maximum || static_cast<std::size_t>(status.st_size) > maximum) {
-            return fail(path, EFBIG, error);
+            return failed(path, EFBIG);
         }
         const std::size_t used = bytes.size();
         bytes.resize(used + room);
@@ -49,9 +46,9 @@ std::optional<std::string> readFile(const DiskPath& path, std::size_t maximum, E
             return bytes;
         }
         if (count < 0 && errno != EINTR) {
-            return fail(path, errno, error);
+            return failed(path, errno);
         }
-        // What room is left shows the end; only a file that grows meanwhile needs more, and with it another place.
+        // The room that is left shows the end; only a file that grows meanwhile needs more.
         room = room > arrived ? room - arrived : 64UL << 10U;
     }
 }

@@ -3,17 +3,16 @@
 // Whole files, read with bounds.
 
 #include "platform/files/Path.h"
-#include "platform/value/Error.h"
+#include "platform/value/Result.h"
 
 #include <cstddef>
-#include <optional>
 #include <string>
 
 namespace adminhost {
 
-/// The bytes of a regular file (a link to one is followed). Nothing if it cannot be read, is no regular file (a pipe
-/// is never waited for) or is larger than the maximum in bytes; then, if error is given, it has the domain "posix",
-/// the system's error number and a description that names the host path.
-[[nodiscard]] std::optional<std::string> readFile(const DiskPath& path, std::size_t maximum, Error* error = nullptr);
+/// The bytes of a regular file (a link to one is followed). Fails if it cannot be read, is not a regular file (a pipe
+/// is never waited for) or is larger than the maximum in bytes: domain "posix", the system's error number, a
+/// description that names the host path.
+[[nodiscard]] Result<std::string> readFile(const DiskPath& path, std::size_t maximum);
 
 }  // namespace adminhost

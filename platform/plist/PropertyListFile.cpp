@@ -21,8 +21,11 @@ std::optional<Value> parsePropertyList(std::string_view bytes, Error* error, std
 }
 
 std::optional<Value> readPropertyList(const DiskPath& path, Error* error) {
-    const auto bytes = readFile(path, plistMaximumSize, error);
+    const auto bytes = readFile(path, plistMaximumSize);
     if (!bytes) {
+        if (error != nullptr) {
+            *error = bytes.error();
+        }
         return std::nullopt;
     }
     auto value = parsePropertyList(*bytes, error);

@@ -2,7 +2,7 @@
 // read-only, except the root and the directory of the test. What would leave the root fails there.
 
 #include "platform/json/Json.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/SampleRoot.h"
 

@@ -162,9 +162,9 @@ TEST_F(BundleTest, TablesOfAllFormsAreRead) {
     EXPECT_EQ(nameIn({}), "xml");
     write("en.lproj/InfoPlist.strings", std::string("\xFF\xFEN\0a\0m\0e\0=\0u\0;\0", 16));
     EXPECT_EQ(nameIn({}), "u");
-    Error error;
-    EXPECT_FALSE(readStringsTable(DiskPath((_directory / "missing").string()), &error));
-    EXPECT_EQ(error.domain, "posix");
+    const auto missing = readStringsTable(DiskPath((_directory / "missing").string()));
+    ASSERT_FALSE(missing);
+    EXPECT_EQ(missing.error().domain, "posix");
 }
 
 }  // namespace

@@ -11,15 +11,14 @@ using namespace std::string_literals;
 
 /// The table, or its error's text under the key "error".
 Dictionary parsed(std::string_view bytes) {
-    Error error;
-    auto table = parseStringsTable(bytes, &error);
-    return table ? *table : Dictionary{{"error", error.description.value_or("")}};
+    const auto table = parseStringsTable(bytes);
+    return table ? *table : Dictionary{{"error", table.error().description.value_or("")}};
 }
 
 std::string problemOf(std::string_view bytes) {
-    Error error;
-    EXPECT_FALSE(parseStringsTable(bytes, &error)) << bytes;
-    return error.description.value_or("");
+    const auto table = parseStringsTable(bytes);
+    EXPECT_FALSE(table) << bytes;
+    return table ? "" : table.error().description.value_or("");
 }
 
 std::string utf16(std::string_view ascii, bool bigEndian) {
@@ -191,10 +190,9 @@ TEST(StringsTable, CutAtEveryByteIsEitherAShorterTableOrAMistakeWithItsPlace) {
     ASSERT_TRUE(parseStringsTable(whole));
     for (const std::string& encoded : {whole, "\xEF\xBB\xBF" + whole}) {
         for (std::size_t length = 0; length < encoded.size(); ++length) {
-            Error error;
-            const auto table = parseStringsTable(std::string_view(encoded).substr(0, length), &error);
+            const auto table = parseStringsTable(std::string_view(encoded).substr(0, length));
             if (!table) {
-                EXPECT_TRUE(error.description && !error.description->empty()) << length;
+                EXPECT_FALSE(table.error().description.value_or("").empty()) << length;
             } else {
                 EXPECT_LE(table->size(), 4U);
                 EXPECT_FALSE(table->contains("last") && length < encoded.size() - 1);
