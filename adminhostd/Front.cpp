@@ -43,6 +43,7 @@ bool permitted(const Peer& peer) {
 /// The names of plug-ins or commands, for a message.
 std::string namesIn(const auto& named) {
     std::vector<std::string_view> names;
+    names.reserve(named.size());
     for (const auto& one : named) {
         names.push_back(one.name);
     }

@@ -146,10 +146,10 @@ Value encoded(Date date) {
 Value encoded(std::chrono::seconds duration) {
     return duration.count();
 }
-Value encoded(std::map<std::string, std::string> texts) {
+Value encoded(const std::map<std::string, std::string>& texts) {
     Dictionary dictionary;
-    for (auto& [key, text] : texts) {
-        dictionary.set(key, std::move(text));
+    for (const auto& [key, text] : texts) {
+        dictionary.set(key, text);
     }
     return dictionary;
 }

@@ -68,13 +68,32 @@ std::size_t widthOf(const Lines& lines) noexcept {
 std::vector<std::string> wordsOf(const Lines& lines, const LineRow& row, std::size_t width) {
     std::vector<std::string> words;
     std::unordered_set<std::string_view> seen;
+    std::size_t next = 0;
     for (std::size_t i = row.line; i < row.end && width != std::string_view::npos; ++i) {
         const std::string_view word = wordOf(lines[i], width);
-        if (!word.empty() && seen.insert(word).second) {
+        // Nearly every row repeats the words of the one before it in their order.
+        if (next == words.size()) {
+            next = 0;
+        }
+        if (next < words.size() && word == words[next]) {
+            ++next;
+        } else if (!word.empty() && seen.insert(word).second) {
             words.emplace_back(word);
+            next = words.size();
         }
     }
     return words;
+}
+
+/// Whether a row's lines have all the words in this order. A row for which this is false may have them all the same.
+bool hasInOrder(const Lines& lines, const LineRow& row, std::size_t width, const std::vector<std::string>& words) {
+    auto wanted = words.begin();
+    for (std::size_t i = row.line; i < row.end && wanted != words.end(); ++i) {
+        if (wordOf(lines[i], width) == *wanted) {
+            ++wanted;
+        }
+    }
+    return wanted == words.end();
 }
 
 /// Divides the lines [begin, end) of one row among the columns; empty unless there is exactly one way.
@@ -177,6 +196,9 @@ std::vector<std::string> lineColumnsOfEvery(std::string_view output, std::span<c
     const std::size_t width = widthOf(lines);
     std::vector<std::string> common;
     for (std::size_t i = 0; i < rows.size() && (i == 0 || !common.empty()); ++i) {
+        if (i > 0 && hasInOrder(lines, rows[i], width, common)) {
+            continue;
+        }
         std::vector<std::string> words = wordsOf(lines, rows[i], width);
         if (i == 0) {
             common = std::move(words);
