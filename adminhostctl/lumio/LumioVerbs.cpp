@@ -19,14 +19,16 @@ constexpr const char* properties = "properties";
 Array listOf(const Context& context, const CommandRef& command, const std::string& key) {
     const CommandAnswer answer = context.service.ask(command, {});
     const Dictionary* said = answer.value ? answer.value->dictionary() : nullptr;
-    std::string error = said == nullptr ? "it did not return a dictionary" : errorOf(command.description, *said);
-    if (error.empty() && said->get(key).array() == nullptr) {
-        error = key + " is missing";
+    if (said == nullptr) {
+        throw Failure(ExitStatus::failed, "the service did not return a dictionary");
     }
-    if (!error.empty()) {
-        throw Failure(ExitStatus::failed, "the service returned an error: " + error);
+    const std::string error = errorOf(command.description, *said);
+    const Array* list = said->get(key).array();
+    if (!error.empty() || list == nullptr) {
+        throw Failure(ExitStatus::failed,
+                      "the service returned an error: " + (error.empty() ? key + " is missing" : error));
     }
-    return *said->get(key).array();
+    return *list;
 }
 
 ExitStatus list(const Context& context, const std::string& name, const std::string& key) {
