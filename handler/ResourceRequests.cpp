@@ -4,6 +4,7 @@
 #include "platform/value/ValueText.h"
 #include "resources/Camera.h"
 #include "resources/Property.h"
+#include "resources/ToolWords.h"
 #include "resources/Workflow.h"
 
 namespace lumio {
@@ -29,23 +30,21 @@ Response listing(std::string_view command, std::string_view key, Array list) {
     return answer;
 }
 
-/// Applies each change entry in order, with its index; an element that is not a dictionary is passed over.
+/// Applies each change entry of the configuration's list in order, with its key path; an element that is not a
+/// dictionary is passed over.
 template <class Change>
-void forEachEntry(const Array* changes, Change change) {
+void forEachEntry(std::string_view list, const Array* changes, Change change) {
     if (changes == nullptr) {
         return;
     }
     for (std::size_t index = 0; index < changes->size(); ++index) {
+        const std::string keyPath = "configuration." + std::string(list) + '.' + std::to_string(index);
         if (const Dictionary* entry = (*changes)[index].dictionary()) {
-            change(*entry, index);
+            change(*entry, keyPath);
+        } else {
+            adminhost::reportNotDone({keyPath, "the entry is not a dictionary", {}});
         }
     }
-}
-
-/// Reports that a change entry of the list was not carried out.
-void reportEntryNotDone(std::string_view list, std::size_t index, std::string reason, const Error& error) {
-    adminhost::reportNotDone(
-        {"configuration." + std::string(list) + '.' + std::to_string(index), std::move(reason), textOf(error)});
 }
 
 std::optional<std::string> identifierOf(const Dictionary& entry) {
@@ -94,13 +93,13 @@ Response LumioRequestHandler::getCamerasWithRequest(const Dictionary&) {
 }
 
 Response LumioRequestHandler::processCameraChangesWithRequest(const Array* changes) {
-    forEachEntry(changes, [](const Dictionary& entry, std::size_t index) {
+    forEachEntry("cameras", changes, [](const Dictionary& entry, const std::string& keyPath) {
         const auto camera = Camera::initWithGUID(identifierOf(entry));
+        camera->setKeyPath(keyPath);
         if (flagOf(entry.get("_obsoleteid_"))) {
             if (const auto error = camera->delete_()) {
                 logEvent("adminhost_lumio: could not delete camera with uuid: " + textOf(entry.get("_id_")) +
                          ", error: " + textOf(*error));
-                reportEntryNotDone("cameras", index, "the camera was not removed", *error);
             }
             return;
         }
@@ -140,35 +139,41 @@ Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary& request
 }
 
 Response LumioRequestHandler::setWorkflowACLWithRequest(const Array* changes) {
-    forEachEntry(changes, [](const Dictionary& entry, std::size_t) {
-        changeAccess(*Workflow::initWithGUID(identifierOf(entry)), entry);
+    forEachEntry("workflows", changes, [](const Dictionary& entry, const std::string& keyPath) {
+        const auto workflow = Workflow::initWithGUID(identifierOf(entry));
+        workflow->setKeyPath(keyPath);
+        changeAccess(*workflow, entry);
     });
     return nullptr;
 }
 
 Response LumioRequestHandler::processPropertyChangesWithRequest(const Array* changes) {
-    forEachEntry(changes, [](const Dictionary& entry, std::size_t index) {
+    forEachEntry("properties", changes, [](const Dictionary& entry, const std::string& keyPath) {
         const Value& id = entry.get("_id_");
         // An entry that is both obsolete and new is deleted.
         if (flagOf(entry.get("_obsoleteid_"))) {
             if (const auto error = Property::deletePropertyWithID(id)) {
                 logEvent("adminhost_lumio: could not delete property with id: " + textOf(id) +
                          ", error: " + textOf(*error));
-                reportEntryNotDone("properties", index, "the property was not removed", *error);
+                adminhost::reportNotDone(
+                    {keyPath, "the property was not removed: the database refused it", toolWords(*error)});
+            } else if (id.isNull()) {
+                adminhost::reportNotDone({keyPath, "no property was removed: the entry has no \"_id_\"", {}});
             }
         } else if (flagOf(entry.get("_newid_"))) {
-            if (const auto error = Property::initNewPropertyWithDictionary(entry)->write()) {
+            const std::unique_ptr<Property> property = Property::initNewPropertyWithDictionary(entry);
+            property->setKeyPath(keyPath);
+            if (const auto error = property->write()) {
                 logEvent("adminhost_lumio: could not insert new property: " + textOf(*error));
-                reportEntryNotDone("properties", index, "the property was not added", *error);
             }
         } else {
             logEvent("adminhost_lumio: update property");
             const std::unique_ptr<Property> property = Property::initWithChangeRequest(entry);
+            property->setKeyPath(keyPath);
             logEvent("adminhost_lumio: update property -> write");
             if (const auto error = property->write()) {
                 logEvent("adminhost_lumio: could not update property with id: " + textOf(id) +
                          ", error: " + textOf(*error));
-                reportEntryNotDone("properties", index, "the property was not changed", *error);
             }
         }
     });

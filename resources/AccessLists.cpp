@@ -5,8 +5,10 @@
 #include "platform/framework/Report.h"
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
+#include "platform/text/Utf8.h"
 #include "platform/value/ValueText.h"
 #include "resources/Resource.h"
+#include "resources/ToolWords.h"
 #include "settings/StatementBatch.h"
 
 #include <algorithm>
@@ -52,23 +54,51 @@ void dropDuplicates(std::vector<Dictionary>& entries) {
     });
 }
 
-struct Names {
-    std::vector<std::string> users;
-    std::vector<std::string> groups;
+/// A name of a change of an access list, and where its entry is in the list.
+struct Named {
+    std::string name;
+    std::size_t index = 0;
 };
 
-/// Appends the login or group name behind a UUID text, if it has one.
-void appendNameOf(const Value& uuidText, Names& names) {
+struct Names {
+    std::vector<Named> users;
+    std::vector<Named> groups;
+};
+
+/// Appends the login or group name behind a UUID text; false if it has none.
+bool appendNameOf(const Value& uuidText, std::size_t index, Names& names) {
     const auto uuid = uuidText.string() == nullptr ? std::nullopt : adminhost::mbr_string_to_uuid(*uuidText.string());
     const auto id = uuid ? adminhost::mbr_uuid_to_id(*uuid) : std::nullopt;
     if (!id) {
-        return;
+        return false;
     }
     const bool isUser = id->kind == adminhost::PosixId::Kind::user;
     const auto name = isUser ? adminhost::userNameOf(id->id) : adminhost::groupNameOf(id->id);
-    if (name && !name->empty()) {
-        (isUser ? names.users : names.groups).push_back(*name);
+    if (!name || name->empty()) {
+        return false;
     }
+    (isUser ? names.users : names.groups).push_back({*name, index});
+    return true;
+}
+
+std::string pathOf(std::size_t index) {
+    return "allowedUsersAndGroups." + std::to_string(index);
+}
+
+/// The UUID of the only user or group of that name; null if the directory does not say.
+Value uuidOf(const std::string& name, std::string_view kind) {
+    const auto entries = adminhost::directoryEntriesOf(name);
+    Value uuid;
+    for (const Value& element : entries.value_or(Array())) {
+        const Dictionary& entry = *element.dictionary();
+        if (entry.get("type") == Value(kind) && entry.get("shortName") == Value(name)) {
+            if (!uuid.isNull()) {
+                return nullptr;
+            }
+            uuid = entry.get("_id_");
+        }
+    }
+    return uuid;
 }
 
 Value elementAt(const Array& array, std::size_t index) {
@@ -85,8 +115,10 @@ bool Resource::aclEnabled() {
 }
 
 void Resource::setACLEnabled(bool enabled) {
+    constexpr const char* key = "access_control_enabled";
     const std::optional<std::string> uuid = statementGuid();
     if (!uuid) {
+        reportNotDone(key, "access control was not switched: the identifier is missing");
         return;
     }
     std::optional<Error> error;
@@ -94,8 +126,14 @@ void Resource::setACLEnabled(bool enabled) {
                                                "s set access_control_enabled=\"" + (enabled ? "t" : "f") +
                                                "\" where uuid=\"" + *uuid + "\"",
                                            error);
-    if (!error) {
-        _aclEnabled = enabled;
+    if (error) {
+        reportNotDone(key, "access control was not switched: the database refused it", toolWords(*error));
+        return;
+    }
+    _aclEnabled = enabled;
+    const Value before = _data && _data->contains(key) ? Value(booleanOf(_data->get(key))) : Value();
+    if (before != Value(enabled)) {
+        reportChange(*uuid, key, before, enabled, {{key, !enabled}});
     }
 }
 
@@ -222,41 +260,71 @@ void Resource::changeACLsWithRequest(const Array* entries) {
     }
     Names toAdd;
     Names toRemove;
-    for (const Value& element : *entries) {
-        const Dictionary* entry = element.dictionary();
+    for (std::size_t index = 0; index < entries->size(); ++index) {
+        const Dictionary* entry = (*entries)[index].dictionary();
         if (entry == nullptr) {
+            reportNotDone(pathOf(index), "the entry is not a dictionary");
             continue;
         }
         if (booleanOf(entry->get("_newid_"))) {
             const bool isUser = isType(entry->get("type"), "user");
             if (!isUser && !isType(entry->get("type"), "group")) {
+                reportNotDone(pathOf(index), "the entry's \"type\" is neither \"user\" nor \"group\"");
                 continue;  // and not tried as a removal
             }
             const Value* name = entry->find("shortName");
             if (name == nullptr) {
+                reportNotDone(pathOf(index), "the entry has no \"shortName\"");
+                reportNotDone("allowedUsersAndGroups",
+                              "the list was not changed: one of its entries has no \"shortName\"");
                 return;
             }
-            (isUser ? toAdd.users : toAdd.groups).push_back(textOf(*name));
-        } else if (booleanOf(entry->get("_obsoleteid_"))) {
-            appendNameOf(entry->get("_id_"), toRemove);
+            (isUser ? toAdd.users : toAdd.groups).push_back({textOf(*name), index});
+        } else if (booleanOf(entry->get("_obsoleteid_")) && !appendNameOf(entry->get("_id_"), index, toRemove)) {
+            reportNotDone(pathOf(index), "the entry's \"_id_\" is no user or group of this machine");
         }
     }
     const std::optional<std::string> uuid = statementGuid();
     if (!uuid) {
+        reportNotDone("allowedUsersAndGroups", "the list was not changed: the identifier is missing");
         return;
     }
-    const std::string_view type = resourceType();
-    _executeLumioConfigWithCommand("--add_access", type, *uuid, "user", toAdd.users);
-    _executeLumioConfigWithCommand("--add_access", type, *uuid, "group", toAdd.groups);
-    _executeLumioConfigWithCommand("--remove_access", type, *uuid, "user", toRemove.users);
-    _executeLumioConfigWithCommand("--remove_access", type, *uuid, "group", toRemove.groups);
+    const auto run = [&](const char* command, const char* kind, const std::vector<Named>& names) {
+        std::vector<std::string> shortNames;
+        for (const Named& named : names) {
+            shortNames.push_back(named.name);
+        }
+        const auto error = _executeLumioConfigWithCommand(command, resourceType(), *uuid, kind, shortNames);
+        const bool adds = std::string_view(command) == "--add_access";
+        for (const Named& named : names) {
+            if (error) {
+                reportNotDone(pathOf(named.index),
+                              "the configuration tool failed with status " + std::to_string(error->code),
+                              error->description.value_or(""));
+                continue;
+            }
+            Dictionary undo;
+            if (!adds) {
+                undo = {{"type", kind}, {"shortName", named.name}, {"_newid_", true}};
+            } else if (Value person = uuidOf(named.name, kind); !person.isNull()) {
+                undo = {{"_id_", std::move(person)}, {"_obsoleteid_", true}};
+            }
+            const Value name = adminhost::utf8Of(named.name);
+            reportChange(*uuid, std::string(kind) + "s", adds ? Value() : name, adds ? name : Value(),
+                         undo.empty() ? Dictionary() : Dictionary{{"allowedUsersAndGroups", Array{std::move(undo)}}});
+        }
+    };
+    run("--add_access", "user", toAdd.users);
+    run("--add_access", "group", toAdd.groups);
+    run("--remove_access", "user", toRemove.users);
+    run("--remove_access", "group", toRemove.groups);
 }
 
-void Resource::_executeLumioConfigWithCommand(std::string_view command, std::string_view resourceType,
-                                              std::string_view resourceID, std::string_view recordType,
-                                              const std::vector<std::string>& shortNames) {
+std::optional<Error> Resource::_executeLumioConfigWithCommand(std::string_view command, std::string_view resourceType,
+                                                              std::string_view resourceID, std::string_view recordType,
+                                                              const std::vector<std::string>& shortNames) {
     if (shortNames.empty()) {
-        return;
+        return std::nullopt;
     }
     std::vector<std::string> arguments;
     for (const std::string_view word :
@@ -269,7 +337,10 @@ void Resource::_executeLumioConfigWithCommand(std::string_view command, std::str
         arguments.push_back(name);
     }
     static const adminhost::HostPath tool("/usr/bin/lumioconfig");
-    (void)adminhost::launch_task(adminhost::diskPath(tool), arguments, nullptr, nullptr);
+    std::string output;
+    std::string words;
+    const std::int32_t status = adminhost::launch_task(adminhost::diskPath(tool), arguments, &output, &words);
+    return status == 0 ? std::nullopt : std::optional(Error{"adminhost_lumio", status, toolWords(words, output)});
 }
 
 Array Resource::allowedUsers() const {

@@ -3,6 +3,7 @@
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
 #include "platform/value/ValueText.h"
+#include "resources/ToolWords.h"
 #include "settings/SettingsStore.h"
 
 #include <cstdlib>
@@ -61,11 +62,21 @@ std::optional<std::vector<std::unique_ptr<Camera>>> Camera::allCamerasWithError(
 std::optional<Error> Camera::delete_() {
     static const adminhost::HostPath tool("/usr/bin/lumioconfig");
     const std::optional<std::string> uuid = statementGuid();
+    if (!uuid) {
+        reportNotDone("", "the camera was not removed: its identifier is missing");
+        return Error{"adminhost_lumio", -1, std::nullopt};
+    }
+    std::string output;
+    std::string words;
     const std::int32_t status =
-        uuid ? adminhost::launch_task(adminhost::diskPath(tool), {"--remove_camera", *uuid}, nullptr, nullptr) : -1;
+        adminhost::launch_task(adminhost::diskPath(tool), {"--remove_camera", *uuid}, &output, &words);
     if (status != 0) {
+        reportNotDone("",
+                      "the camera was not removed: the configuration tool failed with status " + std::to_string(status),
+                      toolWords(words, output));
         return Error{"adminhost_lumio", status, std::nullopt};
     }
+    reportChange(*uuid, "", *uuid, nullptr, {});
     return std::nullopt;
 }
 

@@ -10,6 +10,7 @@
 #include "platform/value/ValueText.h"
 #include "resources/PropertyRows.h"
 #include "resources/StatementText.h"
+#include "resources/ToolWords.h"
 #include "settings/SettingsStore.h"
 
 #include <algorithm>
@@ -20,6 +21,7 @@ namespace lumio {
 
 using adminhost::Array;
 using adminhost::booleanOf;
+using adminhost::Change;
 using adminhost::Dictionary;
 using adminhost::DictionaryEntry;
 using adminhost::Error;
@@ -59,6 +61,15 @@ void makeUtf8(Dictionary& row) {
             *value = adminhost::utf8Of(*value->string());
         }
     }
+}
+
+void reportRemoved(const std::string& id, const std::string& name) {
+    Change change;
+    change.section = "properties";
+    change.identity = id;
+    change.name = name;
+    change.from = name.empty() ? id : name;
+    adminhost::reportChange(std::move(change));
 }
 
 std::string updateStatement(const Dictionary& working, const std::optional<std::string>& id) {
@@ -189,6 +200,8 @@ std::optional<Error> Property::deletePropertyWithID(const Value& id) {
     static_cast<void>(querySorvaneDatabase("delete from properties where id=\"" + textOf(id) + "\"", error));
     if (error) {
         logEvent("error deleting property with ID:\n" + textOf(id) + "\n  error:: " + textOf(error));
+    } else {
+        reportRemoved(textOf(id), {});
     }
     return error;
 }
@@ -204,6 +217,9 @@ std::optional<Error> Property::delete_() {
     if (error) {
         logEvent("error deleting property:\n" + recordText(booleanOf(stored("protect"))) +
                  "\n  error:: " + textOf(error));
+        reportNotDone("", "the property was not removed: the database refused it", toolWords(*error));
+    } else {
+        reportRemoved(*id, adminhost::utf8Of(textOf(stored("name"))));
     }
     return error;
 }
@@ -212,6 +228,7 @@ std::optional<Error> Property::write() {
     if (_loadError) {
         // The update could match no row, and its arguments would show the value.
         logWriteError(*_loadError, false);
+        reportNotDone("", "the property was not changed: it could not be read", toolWords(*_loadError));
         return _loadError;
     }
     const bool isUpdate = _changeValues.has_value();
@@ -223,6 +240,7 @@ std::optional<Error> Property::write() {
     std::optional<Error> error;
     if (const Value* name = working.find("name")) {
         if (std::optional<Error> taken = nameError(*name, error)) {
+            reportNotDone("name", "the property was not written: another one has this name");
             return taken;
         }
     }
@@ -237,6 +255,7 @@ std::optional<Error> Property::write() {
         if (isUpdate && !working.contains("value")) {
             if (std::optional<Error> unfit = takeStoredValue(working, isProtected, deciphered)) {
                 logWriteError(*unfit, true);
+                reportNotDone("protect", "the property stays protected", toolWords(*unfit));
                 return unfit;
             }
         }
@@ -244,6 +263,8 @@ std::optional<Error> Property::write() {
     if (isProtected && working.contains("value")) {
         std::optional<std::string> protectedValue = encryptValue(working.get("value"));
         if (!protectedValue) {
+            reportNotDone(isUpdate && !_changeValues->contains("value") ? "protect" : "value",
+                          "the property was not written: its value cannot be protected without a usable key");
             return Error{"LumioPropertyCantEncryptValue", 1, std::nullopt};
         }
         cleanseValue(working);
@@ -272,7 +293,14 @@ std::optional<Error> Property::write() {
             // The tool quotes the statement, and with it a value that stays protected now.
             failure->description = withoutSecret(*failure->description, textOf(working.get("value")), statement);
         }
+        reportNotDone("", "the property was not written: the database refused it", toolWords(*failure));
         error = std::move(failure);
+    } else {
+        if (error) {
+            reportNotDone("name", "the property was written, but whether another one has this name is not known",
+                          toolWords(*error));
+        }
+        reportWritten(working, isProtected);
     }
     if (error) {
         logWriteError(*error, isProtected || wasProtected);
@@ -288,10 +316,7 @@ std::optional<Error> Property::takeStoredValue(Dictionary& working, bool isProte
     }
     std::optional<std::string> plain = decryptValue(stored("value"));
     if (!plain) {
-        adminhost::reportNotDone(
-            {"configuration.properties",
-             "the protected value of " + textOf(stored("name")) + " cannot be deciphered; it stays as it is stored",
-             ""});
+        reportNotDone("protect", "the stored value cannot be deciphered and stays as it is");
         return std::nullopt;
     }
     const adminhost::ScopedCleanse wipePlain(*plain);
@@ -303,6 +328,54 @@ std::optional<Error> Property::takeStoredValue(Dictionary& working, bool isProte
     working.set("value", *plain);
     deciphered = true;
     return std::nullopt;
+}
+
+void Property::reportWritten(const Dictionary& working, bool isProtected) const {
+    if (!_changeValues) {
+        const Value& id = working.get("id");
+        Change change;
+        change.section = section();
+        change.identity = id.isNull() ? "" : textOf(id);
+        change.name = working.contains("name") ? textOf(working.get("name")) : "";
+        change.to = change.name;
+        if (!id.isNull()) {
+            change.undo = Dictionary{{section(), Array{Dictionary{{"_id_", change.identity}, {"_obsoleteid_", true}}}}};
+        }
+        adminhost::reportChange(std::move(change));
+        return;
+    }
+    const std::optional<std::string> id = rowId();
+    if (!id) {
+        reportNotDone("", _changeValues->contains("_id_") ? "nothing was changed: there is no such property"
+                                                          : "nothing was changed: the entry has no \"_id_\"");
+        return;
+    }
+    const bool wasProtected = booleanOf(stored("protect"));
+    if (isProtected != wasProtected) {
+        reportChange(*id, "protect", wasProtected, isProtected, {{"protect", wasProtected}});
+    }
+    for (const std::string_view key : {"name", "value"}) {
+        if (!_changeValues->contains(key)) {
+            continue;
+        }
+        if (key == "value" && (isProtected || wasProtected)) {
+            Change change;
+            change.section = section();
+            change.identity = *id;
+            change.name = adminhost::utf8Of(textOf(stored("name")));
+            change.key = key;
+            change.secret = true;
+            adminhost::reportChange(std::move(change));
+            continue;
+        }
+        const std::string before = adminhost::utf8Of(textOf(stored(key)));
+        const std::string now = textOf(_changeValues->get(key));
+        if (before != now) {
+            // A text that no statement can carry cannot be sent back.
+            reportChange(*id, key, before, now,
+                         whyUnfitForStatement(before) ? Dictionary() : Dictionary{{key, before}});
+        }
+    }
 }
 
 void Property::logWriteError(const Error& error, bool hideValue) const {

@@ -81,6 +81,7 @@ class Property final : public ResourceClass<Property> {
     [[nodiscard]] std::string_view className() const noexcept override { return "Property"; }
     [[nodiscard]] std::vector<std::string_view> listOfResourceDateKeys() const override;
     void readRow(adminhost::Dictionary row) override;
+    [[nodiscard]] std::string section() const override { return "properties"; }
 
   private:
     [[nodiscard]] std::optional<adminhost::Error> nameError(const adminhost::Value& name,
@@ -89,6 +90,8 @@ class Property final : public ResourceClass<Property> {
     /// deciphered one cannot be stored.
     [[nodiscard]] std::optional<adminhost::Error> takeStoredValue(adminhost::Dictionary& working, bool isProtected,
                                                                   bool& deciphered) const;
+    /// Reports what an insert or update has changed on disk.
+    void reportWritten(const adminhost::Dictionary& working, bool isProtected) const;
     void logWriteError(const adminhost::Error& error, bool hideValue) const;
     /// The record's value under the key; null without a record.
     [[nodiscard]] const adminhost::Value& stored(std::string_view key) const noexcept;

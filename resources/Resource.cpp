@@ -1,8 +1,10 @@
 #include "resources/Resource.h"
 
 #include "platform/bundle/Bundle.h"
+#include "platform/framework/Report.h"
 #include "platform/log/Log.h"
 #include "platform/text/LocalDate.h"
+#include "platform/text/Utf8.h"
 #include "platform/value/ValueText.h"
 #include "settings/LineRows.h"
 
@@ -168,6 +170,29 @@ Resource::RowsWithIdentities Resource::rowsWithIdentities(const std::string& sta
         }
     }
     return rows;
+}
+
+void Resource::reportNotDone(std::string_view key, std::string reason, std::string toolMessage) const {
+    std::string path = _keyPath;
+    path.append(path.empty() || key.empty() ? "" : ".").append(key);
+    adminhost::reportNotDone({std::move(path), std::move(reason), std::move(toolMessage)});
+}
+
+void Resource::reportChange(std::string_view identity, std::string_view key, Value from, Value to,
+                            Dictionary undo) const {
+    adminhost::Change change;
+    change.section = section();
+    change.identity = identity;
+    const Value& name = _data ? _data->get("name") : Value();
+    change.name = name.isNull() ? "" : adminhost::utf8Of(textOf(name));
+    change.key = key;
+    change.from = std::move(from);
+    change.to = std::move(to);
+    if (!undo.empty()) {
+        undo.set("_id_", identity);
+        change.undo = Dictionary{{section(), adminhost::Array{std::move(undo)}}};
+    }
+    adminhost::reportChange(std::move(change));
 }
 
 std::string Resource::description() const {

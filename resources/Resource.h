@@ -68,6 +68,8 @@ class Resource {
         _guid = std::move(guid);
         _guidIsTheRecords = false;
     }
+    /// Where the request has the change entry ("configuration.cameras.0"), for the reports of what was not done.
+    void setKeyPath(std::string keyPath) { _keyPath = std::move(keyPath); }
     /// The record; if there is none yet, the row of the UUID, raw (dates as text, no "_id_"), when the database has
     /// exactly one. Null otherwise; the next call tries again.
     [[nodiscard]] const adminhost::Dictionary* data();
@@ -113,10 +115,13 @@ class Resource {
     /// Entries that cannot be understood or resolved are skipped; an addition without "shortName" ends it before any
     /// run.
     void changeACLsWithRequest(const adminhost::Array* entries);
-    /// Runs the configuration tool for the names, if there are any; neither its status nor its output is looked at.
-    void _executeLumioConfigWithCommand(std::string_view command, std::string_view resourceType,
-                                        std::string_view resourceID, std::string_view recordType,
-                                        const std::vector<std::string>& shortNames);
+    /// Runs the configuration tool for the names, if there are any. A tool that fails is an error with its exit status
+    /// and its words, which is for reports alone: answers do not depend on it.
+    std::optional<adminhost::Error> _executeLumioConfigWithCommand(std::string_view command,
+                                                                   std::string_view resourceType,
+                                                                   std::string_view resourceID,
+                                                                   std::string_view recordType,
+                                                                   const std::vector<std::string>& shortNames);
     /// The user entries of the expanded access list.
     [[nodiscard]] adminhost::Array allowedUsers() const;
     /// The user entries too, never the groups. This sameness is deliberate: clients count on it.
@@ -194,7 +199,18 @@ class Resource {
                                                                std::span<const std::string> columns,
                                                                std::optional<adminhost::Error>& error);
 
+    // Reports (platform/framework/Report.h). The record is not loaded for them: what it does not say stays null.
+
+    /// Reports a part of the change entry, "" for the whole, as not carried out.
+    void reportNotDone(std::string_view key, std::string reason, std::string toolMessage = {}) const;
+    /// Reports a change. The undo is what the entry must hold beside "_id_" to take it back; empty if nothing can.
+    void reportChange(std::string_view identity, std::string_view key, adminhost::Value from, adminhost::Value to,
+                      adminhost::Dictionary undo) const;
+    /// The list in the configuration that resources of this type are in: "cameras".
+    [[nodiscard]] virtual std::string section() const { return std::string(resourceType()) + "s"; }
+
     std::optional<adminhost::Dictionary> _data;
+    std::string _keyPath;
     std::optional<std::string> _guid;
     bool _guidIsTheRecords = false;
     std::optional<RawIdentity> _rawIdentity;  ///< null for a record that did not come from the tool's output

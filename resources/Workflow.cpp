@@ -35,6 +35,11 @@ bool isBelowRoot(const DiskPath& path) {
 }  // namespace
 
 std::optional<std::vector<std::unique_ptr<Workflow>>> Workflow::allWorkflowsWithError(std::optional<Error>& error) {
+    // The tool would create a missing database as an empty file.
+    if (!SettingsStore::dbPathExists()) {
+        error = missingDatabase();
+        return std::nullopt;
+    }
     auto workflows = querySorvaneDatabase("select * from workflows where (disabled != 't' OR disabled is NULL)", error);
     if (workflows) {
         expandAll(*workflows);

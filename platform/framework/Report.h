@@ -18,7 +18,7 @@ struct Change {
     std::string section;   ///< "settings", or the list in the configuration: "cameras"
     std::string identity;  ///< what survives renaming: a UUID or an id; empty for settings
     std::string name;      ///< for people: "Studio 1"; empty for settings
-    std::string key;       ///< what changed of it: "port", "users"
+    std::string key;       ///< what changed of it: "port", "users"; empty: all of it was added or removed
     Value from;            ///< null: absent before, or secret
     Value to;              ///< null: absent now, or secret
     bool secret = false;   ///< from and to are withheld

@@ -1,0 +1,161 @@
+// What changes of cameras and properties report beside their answers.
+
+#include "tests/support/CapturedReports.h"
+#include "tests/unit/resources/AccessListsFixture.h"
+#include "tests/unit/resources/PropertyFixture.h"
+
+namespace lumio {
+namespace {
+
+using adminhost::Change;
+using adminhost::NotDone;
+
+Value undoOf(std::string_view list, Dictionary entry) {
+    return Dictionary{{list, Array{std::move(entry)}}};
+}
+
+class CameraReports : public AccessLists {
+  protected:
+    void process(const Array& changes) { handler.processCameraChangesWithRequest(&changes); }
+    adminhost::test::CapturedReports reports;
+};
+
+TEST_F(CameraReports, EachChangeOnDiskIsReportedWithItsUndo) {
+    process({Dictionary{
+        {"_id_", "C-7"},
+        {"access_control_enabled", false},
+        {"allowedUsersAndGroups", Array{Dictionary{{"type", "user"}, {"shortName", "bo"}, {"_newid_", true}},
+                                        Dictionary{{"_id_", uuidOf("group:editors")}, {"_obsoleteid_", true}}}}}});
+    EXPECT_THAT(
+        reports.changes,
+        ElementsAre(
+            Change{"cameras", "C-7", "", "access_control_enabled", nullptr, false, false,
+                   undoOf("cameras", {{"access_control_enabled", true}, {"_id_", "C-7"}})},
+            Change{"cameras", "C-7", "", "users", nullptr, "bo", false,
+                   undoOf("cameras", {{"_id_", "C-7"},
+                                      {"allowedUsersAndGroups",
+                                       Array{Dictionary{{"_id_", uuidOf("user:bo")}, {"_obsoleteid_", true}}}}})},
+            Change{"cameras", "C-7", "", "groups", "editors", nullptr, false,
+                   undoOf("cameras",
+                          {{"_id_", "C-7"},
+                           {"allowedUsersAndGroups",
+                            Array{Dictionary{{"type", "group"}, {"shortName", "editors"}, {"_newid_", true}}}}})}));
+    EXPECT_THAT(reports.parts, IsEmpty());
+}
+
+TEST_F(CameraReports, RemovalIsReportedAndCannotBeTakenBack) {
+    process({Dictionary{{"_id_", "C-7"}, {"_obsoleteid_", true}}});
+    EXPECT_THAT(reports.changes, ElementsAre(Change{"cameras", "C-7", "", "", "C-7", nullptr, false, nullptr}));
+}
+
+TEST_F(CameraReports, SkippedEntriesAreNamedByTheirKeyPaths) {
+    process(
+        {"text",
+         Dictionary{{"_id_", "C-8"},
+                    {"allowedUsersAndGroups",
+                     Array{"text", Dictionary{{"type", "robot"}, {"shortName", "r"}, {"_newid_", true}},
+                           Dictionary{{"_id_", "gone"}, {"_obsoleteid_", true}},
+                           Dictionary{{"type", "user"}, {"shortName", "bo"}}}}},
+         Dictionary{{"_id_", "C-8"}, {"allowedUsersAndGroups", Array{Dictionary{{"type", "user"}, {"_newid_", true}}}}},
+         Dictionary{{"access_control_enabled", true}}});
+    std::vector<std::string> paths;
+    for (const NotDone& part : reports.parts) {
+        paths.push_back(part.keyPath);
+        EXPECT_FALSE(part.reason.empty());
+    }
+    EXPECT_THAT(paths, ElementsAre("configuration.cameras.0", "configuration.cameras.1.allowedUsersAndGroups.0",
+                                   "configuration.cameras.1.allowedUsersAndGroups.1",
+                                   "configuration.cameras.1.allowedUsersAndGroups.2",
+                                   "configuration.cameras.2.allowedUsersAndGroups.0",
+                                   "configuration.cameras.2.allowedUsersAndGroups",
+                                   "configuration.cameras.3.access_control_enabled"));
+    EXPECT_THAT(reports.changes, IsEmpty());
+}
+
+TEST_F(CameraReports, ToolThatFailsIsReportedWithItsWordsForEachEntryAndTheOthersAreApplied) {
+    root.writeTool(tool, "#!/bin/sh\n[ \"$7\" = user ] || exit 0\necho out; echo 'no such user' >&2; exit 9\n");
+    process({Dictionary{
+        {"_id_", "C-7"},
+        {"allowedUsersAndGroups", Array{Dictionary{{"type", "user"}, {"shortName", "x"}, {"_newid_", true}},
+                                        Dictionary{{"type", "group"}, {"shortName", "editors"}, {"_newid_", true}}}}}});
+    EXPECT_THAT(reports.parts, ElementsAre(NotDone{"configuration.cameras.0.allowedUsersAndGroups.0",
+                                                   "the configuration tool failed with status 9", "no such user"}));
+    ASSERT_EQ(reports.changes.size(), 1U);
+    EXPECT_EQ(reports.changes[0].key, "groups");
+    EXPECT_THAT(log.lines, IsEmpty());
+}
+
+TEST_F(CameraReports, FailedRemovalAndSwitchAreReportedOnce) {
+    root.writeTool(tool, "#!/bin/sh\necho 'is recording' >&2; exit 3\n");
+    root.writeTool("/usr/bin/sqlite3", "#!/bin/sh\necho 'Error: busy' >&2; exit 5\n");
+    process({Dictionary{{"_id_", "C-7"}, {"_obsoleteid_", true}},
+             Dictionary{{"_id_", "C-8"}, {"access_control_enabled", true}}});
+    EXPECT_THAT(
+        reports.parts,
+        ElementsAre(NotDone{"configuration.cameras.0",
+                            "the camera was not removed: the configuration tool failed with status 3", "is recording"},
+                    NotDone{"configuration.cameras.1.access_control_enabled",
+                            "access control was not switched: the database refused it", "Error: busy"}));
+    EXPECT_THAT(reports.changes, IsEmpty());
+}
+
+class PropertyReports : public PropertyFixture {
+  protected:
+    void process(const Dictionary& entry) {
+        const Array changes{entry};
+        (void)handler.processPropertyChangesWithRequest(&changes);
+    }
+    LumioRequestHandler handler;
+    adminhost::test::CapturedReports reports;
+};
+
+TEST_F(PropertyReports, ChangesOfAPropertyAreReportedWithTheirUndo) {
+    process({{"_newid_", true}, {"name", "n"}, {"value", "v"}});
+    process({{"_id_", "1"}, {"name", "m"}, {"value", "w"}});
+    process({{"_id_", "1"}, {"name", "m"}, {"value", "w"}});
+    process({{"_id_", "1"}, {"protect", true}});
+    process({{"_id_", "1"}, {"value", "hidden"}});
+    process({{"_id_", "1"}, {"_obsoleteid_", true}});
+    EXPECT_THAT(reports.changes, ElementsAre(Change{"properties", "", "n", "", nullptr, "n", false, nullptr},
+                                             Change{"properties", "1", "n", "name", "n", "m", false,
+                                                    undoOf("properties", {{"_id_", "1"}, {"name", "n"}})},
+                                             Change{"properties", "1", "n", "value", "v", "w", false,
+                                                    undoOf("properties", {{"_id_", "1"}, {"value", "v"}})},
+                                             Change{"properties", "1", "m", "protect", false, true, false,
+                                                    undoOf("properties", {{"_id_", "1"}, {"protect", false}})},
+                                             Change{"properties", "1", "m", "value", nullptr, nullptr, true, nullptr},
+                                             Change{"properties", "1", "", "", "1", nullptr, false, nullptr}));
+    EXPECT_THAT(reports.parts, IsEmpty());
+}
+
+TEST_F(PropertyReports, PartsThatWereNotDoneAreReportedOnceEach) {
+    sql("insert into properties(id,name,value,protect) values(1,'a','v','f'),(2,'b','no cipher','t')");
+    process({{"_id_", "77"}, {"value", "w"}});
+    process({{"value", "w"}});
+    process({{"_obsoleteid_", true}});
+    process({{"_newid_", true}, {"name", "a"}});
+    process({{"_id_", "2"}, {"protect", false}});
+    std::filesystem::remove(root.path(keyPath));
+    process({{"_id_", "1"}, {"protect", true}});
+    process({{"_newid_", true}, {"name", "c"}, {"value", "hidden"}, {"protect", true}});
+    root.writeTool("/usr/bin/sqlite3", "#!/bin/sh\necho 'Error: busy' >&2; exit 5\n");
+    process({{"_id_", "1"}, {"value", "w"}});
+    process({{"_id_", "1"}, {"_obsoleteid_", true}});
+    const std::string path = "configuration.properties.0";
+    EXPECT_THAT(
+        reports.parts,
+        ElementsAre(NotDone{path, "nothing was changed: there is no such property", ""},
+                    NotDone{path, "nothing was changed: the entry has no \"_id_\"", ""},
+                    NotDone{path, "no property was removed: the entry has no \"_id_\"", ""},
+                    NotDone{path + ".name", "the property was not written: another one has this name", ""},
+                    NotDone{path + ".protect", "the stored value cannot be deciphered and stays as it is", ""},
+                    NotDone{path + ".protect",
+                            "the property was not written: its value cannot be protected without a usable key", ""},
+                    NotDone{path + ".value",
+                            "the property was not written: its value cannot be protected without a usable key", ""},
+                    NotDone{path, "the property was not changed: it could not be read", "Error: busy"},
+                    NotDone{path, "the property was not removed: the database refused it", "Error: busy"}));
+}
+
+}  // namespace
+}  // namespace lumio
