@@ -211,6 +211,12 @@ class Check {
         }
         if ((key.rules & ruleStatement) != 0) {
             statement(*text, path);
+            if (entry != nullptr) {
+                notARow(*text, *entry, path);
+            }
+        }
+        if ((key.rules & ruleOneLine) != 0 && text->find('\n') != std::string::npos) {
+            add(path, "must not hold a line feed", "write it in one line");
         }
         if ((key.rules & ruleArgument) != 0) {
             argument(*text, path);
@@ -246,9 +252,6 @@ class Check {
             add(path, "must not hold a double quote: it would end the text within the database statement",
                 "leave the double quote out, or write another kind of quote");
         }
-        if (text.find('\n') != std::string::npos) {
-            add(path, "must not hold a line feed: the text could not be read back whole", "write it in one line");
-        }
         withoutNul(text, path);
         length(text, path);
     }
@@ -268,6 +271,24 @@ class Check {
                 "begin it with a slash");
         }
         withoutNul(text, path);
+    }
+
+    /// The database tool prints values as they are: one that spells out a whole row would be read as that row.
+    void notARow(const std::string& text, const EntryDescription& entry, const std::string& path) {
+        std::size_t width = 5;
+        for (const std::string_view column : entry.columns) {
+            width = std::max(width, column.size());
+        }
+        const std::string lines = '\n' + text;
+        const bool spellsRow = !entry.columns.empty() &&
+                               std::all_of(entry.columns.begin(), entry.columns.end(), [&](std::string_view column) {
+                                   return lines.find('\n' + std::string(width - column.size(), ' ') +
+                                                     std::string(column) + " = ") != std::string::npos;
+                               });
+        if (spellsRow) {
+            add(path, "must not hold a line for each column as the database tool prints them",
+                "change one of these lines; one more blank is enough");
+        }
     }
 
     void notAColumn(const std::string& text, const EntryDescription& entry, const std::string& path) {

@@ -28,6 +28,7 @@ enum Rule : std::uint8_t {
     ruleArgument = 16U,      ///< stands in a tool's argument of its own
     ruleAbsolutePath = 64U,  ///< begins with a slash
     ruleShortNames = 32U,    ///< the "shortName" entries of the list stand together in one tool's arguments
+    ruleOneLine = 128U,      ///< holds no line feed
 };
 
 /// What a change entry does. Bits, so that a key can name those for which it is read.

@@ -25,15 +25,17 @@ RULES = {
     "argument": "ruleArgument",
     "absolute_path": "ruleAbsolutePath",
     "short_names": "ruleShortNames",
+    "one_line": "ruleOneLine",
 }
 RULE_TEXTS = {
-    "statement": "no double quote, line feed or NUL; at most 95 kB",
+    "statement": "no double quote or NUL; at most 95 kB",
     "not_a_column": "not the name of a column of its table, in any case (`rowid`, `oid`, `_rowid_` neither)",
     "row_number": "a decimal number",
     "identifier": "letters, digits and hyphens, not beginning with a hyphen",
     "argument": "no NUL, not beginning with a hyphen; at most 95 kB",
     "absolute_path": "begins with a slash, no NUL",
     "short_names": "all names together at most 1.5 MB",
+    "one_line": "no line feed",
 }
 CHANGES = {"added": "changeAdded", "removed": "changeRemoved", "changed": "changeChanged", "ignored": "changeNothing"}
 UNITS = ["bytes", "megabytes", "seconds", "minutes", "people"]

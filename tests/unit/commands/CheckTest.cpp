@@ -136,9 +136,17 @@ TEST(CheckProperties, ADoubleQuoteIsRefused) {
     EXPECT_THAT(checkValue("say \"yes\""), only(valueKey, "double quote"));
 }
 
-TEST(CheckProperties, ALineFeedIsRefused) {
+TEST(CheckProperties, ALineFeedIsRefusedInANameAndPassesInAValue) {
     EXPECT_THAT(checkName("a\nb"), only(nameKey, "line feed"));
-    EXPECT_THAT(checkValue("last\n"), only(valueKey, "line feed"));
+    EXPECT_THAT(checkValue("last\n"), IsEmpty());
+    EXPECT_THAT(checkValue("-----BEGIN\nid = 3\n\n   protect = t\n"), IsEmpty());
+}
+
+TEST(CheckProperties, AValueThatSpellsOutAWholeRowIsRefused) {
+    const std::string row =
+        "x\n   protect = f\ncreated_at = a\nupdated_at = b\n\n        id = 3\n      name = y\n     value = z";
+    EXPECT_THAT(checkValue(row), only(valueKey, "as the database tool prints them"));
+    EXPECT_THAT(checkValue(row.substr(0, row.find("     value"))), IsEmpty());
 }
 
 TEST(CheckProperties, ANulIsRefused) {
