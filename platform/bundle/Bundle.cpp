@@ -15,7 +15,7 @@ namespace fs = std::filesystem;
 /// More entries than any bundle has; a directory that others fill does not hold a request up.
 constexpr std::size_t maximumEntries = 4096;
 
-/// Drops the error: a table is an addition to what is shown, which goes without it.
+/// Drops the error: texts are shown without their translation if a table cannot be read.
 std::optional<Dictionary> valueOf(Result<Dictionary> table) {
     return table ? std::optional(std::move(*table)) : std::nullopt;
 }

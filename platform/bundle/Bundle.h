@@ -4,8 +4,7 @@
 //
 // A bundle's localizations are the subdirectories of its "Contents/Resources", of its "Resources" and of itself that
 // are named after a language (Language.h), with or without an extension. A strings table is a file TABLE.strings in one
-// of them. A bundle may be on a file system that others write to: what is read is bounded, and nothing waits for a
-// pipe.
+// of them. A bundle may be on a file system that others write to: reads are bounded, and a pipe is never waited for.
 
 #include "platform/bundle/StringsTable.h"
 #include "platform/files/Path.h"
@@ -39,7 +38,7 @@ class Bundle {
     explicit Bundle(HostPath path);
 
     HostPath _path;
-    std::vector<Localization> _localizations;  ///< by name, then in the order in which they are looked into
+    std::vector<Localization> _localizations;  ///< by name, then in search order
 };
 
 /// Reads a strings table of any form: XML, binary or quoted text. Fails if it cannot be read, is not a dictionary or is

@@ -15,7 +15,7 @@ namespace adminhost {
 
 /// The localizations that suit the preferred languages, best first, each at most once. For every preferred language in
 /// its order: the one spelled the same; those of the same language, script and region under another spelling ("English"
-/// and "en"; what is not said is filled in with what is likely: "zh-TW" is "zh-Hant"); the language without a region;
+/// and "en"; missing parts are filled in with the likely ones: "zh-TW" is "zh-Hant"); the language without a region;
 /// the language of another region. Never another language, and never another script of the same language.
 [[nodiscard]] std::vector<std::string> matchingLocalizations(const std::vector<std::string>& localizations,
                                                              const std::vector<std::string>& preferredLanguages);

@@ -42,7 +42,7 @@ std::optional<std::string> textOfTable(std::string_view bytes) {
     if (bytes.starts_with("\xFE\xFF") || bytes.starts_with("\xFF\xFE")) {
         return textOfUtf16(bytes.substr(2), bytes[0] == '\xFE');
     }
-    // A table begins with a character of ASCII, which tells the byte order where no mark does.
+    // A table begins with an ASCII character. Without a byte-order mark, that character gives the byte order.
     if (bytes.size() >= 2 && (bytes[0] == '\0') != (bytes[1] == '\0')) {
         return textOfUtf16(bytes, bytes[0] == '\0');
     }
@@ -275,7 +275,7 @@ class Parser {
             constexpr std::string_view letters = "abfnrtv";
             constexpr std::string_view meanings = "\a\b\f\n\r\t\v";
             const std::size_t letter = letters.find(c);
-            // Any other character stands for itself; its further bytes follow by themselves.
+            // Any other character is copied as it is; its further bytes are copied by the next turns.
             text += letter == std::string_view::npos ? c : meanings[letter];
             ++_at;
             return c != '\0' || fail("a text cannot hold the character NUL");

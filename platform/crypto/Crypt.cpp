@@ -20,7 +20,7 @@ struct CipherFree {
 };
 using Cipher = std::unique_ptr<EVP_CIPHER, CipherFree>;
 
-/// The library takes lengths as int.
+/// The library's lengths are of type int.
 constexpr std::size_t pieceLength = std::size_t{1} << 30U;
 
 /// Looking a cipher up costs more than enciphering a short value, so each is fetched once, on its first use.
@@ -96,7 +96,7 @@ std::int32_t encrypt(Transform& transform, const unsigned char* vector, const un
     return kCCSuccess;
 }
 
-/// The last block is deciphered first: only its padding tells how long the plain text is, and whether there is one.
+/// Deciphers the last block first: only its padding shows how long the plain text is, and whether there is one.
 std::int32_t decrypt(Transform& transform, const unsigned char* vector, const unsigned char* in, std::size_t length,
                      unsigned char* out, std::size_t available, std::size_t& moved) noexcept {
     if (length == 0 || length % kCCBlockSizeAES != 0) {

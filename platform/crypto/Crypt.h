@@ -17,14 +17,14 @@ constexpr std::size_t kCCBlockSizeAES = 16;  ///< bytes
 
 constexpr std::int32_t kCCSuccess = 0;
 constexpr std::int32_t kCCParamError =
-    -4300;  ///< an operation, algorithm, option, key length or pointer it does not take
-constexpr std::int32_t kCCBufferTooSmall = -4301;  ///< nothing was written; dataOutMoved says how many bytes are needed
+    -4300;  ///< an operation, algorithm, option, key length or pointer is not supported
+constexpr std::int32_t kCCBufferTooSmall = -4301;  ///< nothing was written; dataOutMoved is the number of bytes needed
 constexpr std::int32_t kCCMemoryFailure = -4302;
 constexpr std::int32_t kCCAlignmentError = -4303;  ///< the length of cipher text is not a positive multiple of 16
-constexpr std::int32_t kCCDecodeError = -4304;     ///< the last block carries no valid padding
+constexpr std::int32_t kCCDecodeError = -4304;     ///< the last block has no valid padding
 constexpr std::int32_t kCCUnimplemented = -4305;   ///< the cryptography library has no such cipher, or failed
 
-/// Encrypts or decrypts dataIn at once: AES in CBC mode with PKCS#7 padding, the one combination it takes
+/// Encrypts or decrypts dataIn at once: AES in CBC mode with PKCS#7 padding, the only combination it supports
 /// (kCCAlgorithmAES, kCCOptionPKCS7Padding). The key has 16, 24 or 32 bytes, the initialisation vector 16.
 ///
 /// On kCCSuccess dataOutMoved is the number of bytes written. The capacity is checked before anything is written, and

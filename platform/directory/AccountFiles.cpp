@@ -78,7 +78,7 @@ bool isAccountName(const char* name) noexcept {
     return name != nullptr && name[0] != '\0' && name[0] != '+' && name[0] != '-' && isPlain(name);
 }
 
-/// The full name: the first field of the comment, in which "&" stands for the login, capitalised.
+/// The full name: the first field of the comment, in which "&" means the login, capitalised.
 std::string longNameOf(const char* comment, std::string_view login) {
     std::string_view field = comment == nullptr ? "" : comment;
     field = field.substr(0, field.find(','));
@@ -133,7 +133,7 @@ void skipLine(std::FILE* file) {
     }
 }
 
-/// All accounts that the C library's reader finds in the text; it passes over lines that are none.
+/// All accounts that the C library's reader finds in the text; it skips lines that are not accounts.
 template <class Entry>
 std::vector<Account> accountsIn(std::string& text, int (*next)(std::FILE*, Entry*, char*, std::size_t, Entry**)) {
     std::vector<Account> accounts;
@@ -154,7 +154,7 @@ std::vector<Account> accountsIn(std::string& text, int (*next)(std::FILE*, Entry
                 accounts.push_back(accountOf(entry));
             }
         } else if (status == ERANGE && buffer.size() < maximumLine) {
-            buffer.resize(buffer.size() * 2);  // the reader stands at the line's beginning again
+            buffer.resize(buffer.size() * 2);  // the reader is at the line's beginning again
         } else if (status == ERANGE) {
             skipLine(file.get());
         } else {
@@ -205,7 +205,7 @@ std::vector<std::size_t> positionsOf(const std::vector<std::pair<Key, std::size_
 
 AccountTable::AccountTable(AccountKind kind, std::vector<Account> accounts, std::shared_ptr<const GivenUuids> given)
     : _kind(kind), _given(std::move(given)) {
-    // Of several lines with one name, the C library only ever answers the first.
+    // If several lines have the same name, the C library only ever returns the first.
     _accounts.reserve(accounts.size());
     _byName.reserve(accounts.size());
     _byId.reserve(accounts.size());

@@ -2,9 +2,9 @@
 
 // The account files of this machine, read whole and indexed.
 //
-// A table is read once and kept for as long as its files stay the same files with the same content, so that however
-// many look-ups one request makes, they share one pass over the accounts. Every look-up asks the file system
-// whether that still holds; a file changed within the clock's resolution of being read is read again.
+// A table is read once and kept as long as its files are the same files with the same content. All look-ups of a
+// request therefore share one pass over the accounts, however many they are. Every look-up checks the files again. A
+// file that changed within the clock's resolution of being read is read again.
 
 #include "platform/files/Path.h"
 #include "platform/text/Uuid.h"
@@ -25,10 +25,10 @@ namespace adminhost {
 
 enum class AccountKind { user, group };
 
-/// One line of an account file. All texts are such that a property list can carry them.
+/// One line of an account file. A property list can carry all of its texts.
 struct Account {
     std::string name;
-    std::string longName;  ///< empty for none, and for groups
+    std::string longName;  ///< empty if there is none, and for groups
     std::string home;
     std::string shell;
     std::uint32_t id = 0;            ///< user id of a user, group id of a group
@@ -36,10 +36,10 @@ struct Account {
     std::vector<std::string> members;
 };
 
-/// UUIDs given by a file of lines "user:NAME UUID" and "group:NAME UUID"; the first line of a name holds.
+/// UUIDs from a file of lines "user:NAME UUID" and "group:NAME UUID". If a name occurs twice, its first line counts.
 using GivenUuids = std::unordered_map<std::string, std::string>;
 
-/// The accounts of one kind, in file order; names are unique. Neither copied nor moved: indexes point into it.
+/// The accounts of one kind, in file order; names are unique. Not copyable or movable, because indexes point into it.
 class AccountTable {
   public:
     AccountTable(AccountKind kind, std::vector<Account> accounts, std::shared_ptr<const GivenUuids> given);
@@ -54,8 +54,8 @@ class AccountTable {
     [[nodiscard]] std::vector<std::size_t> withId(std::uint32_t id) const;
     [[nodiscard]] std::vector<std::size_t> withUuid(const Uuid& uuid) const;
 
-    /// The UUID as it is to be shown: as the file of UUIDs spells it, or the name-based one. Nothing for an account
-    /// that is missing in a file of UUIDs.
+    /// The UUID as it is to be shown: as the file of UUIDs spells it, or the name-based one. Returns nullopt if there
+    /// is a file of UUIDs and the account is missing in it.
     [[nodiscard]] std::optional<std::string> uuidTextOf(const Account& account) const;
 
   private:
@@ -64,19 +64,19 @@ class AccountTable {
     std::shared_ptr<const GivenUuids> _given;  ///< null: name-based
     std::unordered_map<std::string_view, std::size_t> _byName;
     std::vector<std::pair<std::uint32_t, std::size_t>> _byId;
-    mutable std::optional<std::vector<std::pair<Uuid, std::size_t>>> _byUuid;  ///< made at the first question
+    mutable std::optional<std::vector<std::pair<Uuid, std::size_t>>> _byUuid;  ///< built by the first look-up
 };
 
 class AccountFiles {
   public:
-    /// With a file of UUIDs, only accounts named in it have one.
+    /// If there is a file of UUIDs, only accounts named in it have a UUID.
     explicit AccountFiles(std::optional<HostPath> uuidFile = std::nullopt) : _uuidFile(std::move(uuidFile)) {}
 
-    /// The accounts below the system root as they are now: /etc/passwd or /etc/group. Null, with the error, when a
-    /// file cannot be read.
+    /// The accounts below the system root as they are now: /etc/passwd or /etc/group. Returns null, with the error, if
+    /// a file cannot be read.
     [[nodiscard]] std::shared_ptr<const AccountTable> table(AccountKind kind, Error* error = nullptr);
 
-    /// How many passes over an account file have been made.
+    /// The number of passes over account files so far.
     [[nodiscard]] std::size_t passes() const noexcept { return _passes; }
 
   private:
@@ -86,7 +86,7 @@ class AccountFiles {
         std::int64_t size = 0;
         std::int64_t modified = 0;  ///< nanoseconds
         std::int64_t changed = 0;   ///< nanoseconds
-        bool settled = false;       ///< the last change lies far enough from now that a later one would show
+        bool settled = false;       ///< the last change is old enough for a later one to show
         [[nodiscard]] bool same(const Identity& now) const noexcept;
     };
     struct Kept {

@@ -6,9 +6,9 @@
 //     auto node = DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode, &error);
 //     auto records = node ? node->records(query, &error) : std::nullopt;
 //
-// A node is opened for one request and closed by its destruction; what it learnt of who asks (authenticate) goes with
-// it. Failures are errors with a code and a description for people. A query answers everything it found or an error,
-// never a part. All calls come from one thread. Texts that nodes answer are such that a property list can carry them.
+// A node is opened for one request and closed by its destructor, which also drops the rights that authenticate() gave
+// it. Failures are errors with a code and a description for people. A query returns everything it found or an error,
+// never a part. All calls come from one thread. A property list can carry all texts that nodes return.
 
 #include "platform/value/Error.h"
 
@@ -60,7 +60,7 @@ struct DirectoryQuery {
     std::string attribute;
     Match match = Match::equal;
     std::vector<std::string> values;      ///< any of them
-    std::vector<std::string> attributes;  ///< to return; what a record lacks is absent
+    std::vector<std::string> attributes;  ///< to return; those that a record lacks are absent
     std::size_t maximum = 0;              ///< the first so many records; 0 is no limit
 };
 
@@ -83,11 +83,12 @@ class DirectoryNode {
     virtual ~DirectoryNode() = default;
 
     [[nodiscard]] virtual const std::string& name() const noexcept = 0;
-    /// The records that match, each once, in an order that is the same for the same content. Nothing on failure.
+    /// The records that match, each once, in an order that is the same for the same content. Returns nullopt on
+    /// failure.
     [[nodiscard]] virtual std::optional<std::vector<DirectoryRecord>> records(const DirectoryQuery& query,
                                                                               Error* error = nullptr) = 0;
 
-    // Changes. A node that cannot change anything answers an error that says so.
+    // Changes. A node that is read only fails with the code for "not supported by the node".
 
     /// Signs in as a user record of the node; changes are then made with that user's rights.
     [[nodiscard]] virtual std::optional<Error> authenticate(std::string_view username, std::string_view password);
@@ -102,7 +103,7 @@ class DirectoryNode {
     [[nodiscard]] Error unsupported(std::string_view operation) const;
 };
 
-/// A node that can be opened: its name, and how. Opening answers null with the error on failure.
+/// A node that can be opened: its name, and how. Opening returns null, with the error, on failure.
 struct DirectoryNodeSource {
     std::string name;
     std::function<std::unique_ptr<DirectoryNode>(Error*)> open;
@@ -116,10 +117,10 @@ class DirectorySession {
 
     explicit DirectorySession(std::vector<DirectoryNodeSource> nodes) : _nodes(std::move(nodes)) {}
 
-    /// The process's session: the accounts of this machine until setDirectoryNodes() says otherwise.
+    /// The process's session: the accounts of this machine, unless setDirectoryNodes() has set other nodes.
     [[nodiscard]] static DirectorySession& defaultSession();
 
-    /// Null, with the error, when there is no such node or it cannot be opened.
+    /// Returns null, with the error, if the node does not exist or cannot be opened.
     [[nodiscard]] std::unique_ptr<DirectoryNode> openNode(std::uint32_t nodeType, Error* error = nullptr) const;
     [[nodiscard]] std::unique_ptr<DirectoryNode> openNode(std::string_view name, Error* error = nullptr) const;
     [[nodiscard]] const std::vector<DirectoryNodeSource>& nodes() const noexcept { return _nodes; }

@@ -2,8 +2,8 @@
 
 // Directory records as the dictionaries that clients see.
 //
-// An entry has "shortName", "longName" (the short name where there is no full name), "guid", the same again as "_id_",
-// and "type": "user" or "group". What a record lacks is absent.
+// An entry has "shortName", "longName" (the short name if there is no full name), "guid", the same again as "_id_", and
+// "type": "user" or "group". Keys for attributes that a record lacks are absent.
 
 #include "platform/directory/Directory.h"
 #include "platform/value/Error.h"
@@ -17,13 +17,13 @@ namespace adminhost {
 
 [[nodiscard]] Dictionary directoryEntryOf(const DirectoryRecord& record);
 
-/// People and groups whose short or full name begins with the text, without regard to case: entries, those found by
-/// short name first, each record once, at most `limit` of them (0 is no limit). An empty text finds all. Nothing, with
-/// the error, when the directory cannot answer.
+/// People and groups whose short or full name begins with the text, without regard to case. Returns entries, those
+/// found by short name first, each record once, at most `limit` of them (0 is no limit). An empty text finds all.
+/// Returns nullopt, with the error, if the directory fails.
 [[nodiscard]] std::optional<Array> directoryEntries(std::string_view matchText, std::size_t limit,
                                                     Error* error = nullptr);
 
-/// People and groups whose short name or UUID is the text: entries that also say "node", the name of the node that
+/// People and groups whose short name or UUID is the text: entries that also have "node", the name of the node that
 /// holds the record.
 [[nodiscard]] std::optional<Array> directoryEntriesOf(std::string_view nameOrUuid, Error* error = nullptr);
 

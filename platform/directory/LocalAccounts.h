@@ -2,9 +2,9 @@
 
 // The directory node of this machine's own accounts: the files /etc/passwd and /etc/group below the system root.
 //
-// Read by the C library's own file readers, not the name service, which might enumerate a company. Users come before
-// groups, each in file order. The node changes nothing: it is read only (see DirectoryNode). docs/directory-mapping.md
-// says how a line becomes a record.
+// Read by the C library's own file readers and not through the name service, which might enumerate a company. Users
+// come before groups, each in file order. The node is read only (see DirectoryNode). docs/directory-mapping.md
+// describes how a line becomes a record.
 
 #include "platform/directory/Directory.h"
 #include "platform/files/Path.h"
@@ -16,9 +16,10 @@ namespace adminhost {
 
 inline constexpr std::string_view localAccountsNodeName = "/Local";
 
-/// The source of the node. All nodes opened from one source share one pass over the accounts for as long as the files
-/// do not change. With a file of UUIDs ("user:NAME UUID" or "group:NAME UUID" on each line), an account has the UUID
-/// that stands there or none, and a query fails when that file cannot be read; without, a name-based one.
+/// The source of the node. All nodes opened from one source share one pass over the accounts as long as the files do
+/// not change. With a file of UUIDs ("user:NAME UUID" or "group:NAME UUID" on each line), an account has the UUID in
+/// that file or none, and a query fails if the file cannot be read. Without such a file, accounts have name-based
+/// UUIDs.
 [[nodiscard]] DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile = std::nullopt);
 
 }  // namespace adminhost

@@ -3,7 +3,7 @@
 // Membership: from UUIDs of the directory to the ids and names of the system.
 //
 // All look-ups go through the nodes of the default session and so see the accounts below the system root, not the name
-// service of the machine the process runs on. A directory that cannot answer counts as "not found".
+// service of the machine the process runs on. If the directory fails, the result is "not found".
 
 #include "platform/text/Uuid.h"
 
@@ -22,14 +22,14 @@ struct PosixId {
     friend bool operator==(const PosixId&, const PosixId&) = default;
 };
 
-/// The UUID of a text of 36 characters, in either case; nothing for any other text.
+/// The UUID of a text of 36 characters, in either case; nullopt for any other text.
 [[nodiscard]] std::optional<Uuid> mbr_string_to_uuid(std::string_view text) noexcept;
 
 /// The user or group id of the first record with the UUID (nodes in order, users before groups).
 [[nodiscard]] std::optional<PosixId> mbr_uuid_to_id(const Uuid& uuid);
 
-/// The login name of a user id, as getpwuid: of several accounts with the id, the first. Nodes are asked in order
-/// until one knows the id; one that fails is passed over.
+/// The login name of a user id, as getpwuid: if several accounts have the id, the first one's. Nodes are asked in order
+/// until one knows the id; a node that fails is skipped.
 [[nodiscard]] std::optional<std::string> userNameOf(std::uint32_t userId);
 /// The name of a group id, as getgrgid.
 [[nodiscard]] std::optional<std::string> groupNameOf(std::uint32_t groupId);

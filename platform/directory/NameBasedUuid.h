@@ -1,6 +1,6 @@
 #pragma once
 
-// UUIDs that are made from names.
+// UUIDs that are computed from names.
 
 #include "platform/text/Uuid.h"
 

@@ -2,8 +2,8 @@
 
 // The event loop in which a thread waits for name resolution.
 //
-// A loop and the services resolved in it are made and freed inside one operation; all callbacks arrive on the thread
-// that runs the loop, and only while it runs (or starts) something. Services must be gone before their loop.
+// A loop and the services resolved in it are created and freed inside one operation. All callbacks arrive on the thread
+// that runs the loop, and only while it runs (or starts) something. Services must be destroyed before their loop.
 
 #include <chrono>
 #include <memory>
@@ -20,8 +20,8 @@ class EventLoop {
     EventLoop& operator=(const EventLoop&) = delete;
     ~EventLoop();
 
-    /// Waits until a resolver has news (an address, a failure, its time-out), delivers it and answers true; answers
-    /// false when the time is over first. Traffic with the daemons that is no news does not end the wait.
+    /// Waits until a resolver has news (an address, a failure, its time-out), delivers it and returns true. Returns
+    /// false if the time is over first. Other traffic with the daemons does not end the wait.
     bool runOnce(std::chrono::milliseconds time);
 
   private:

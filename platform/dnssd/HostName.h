@@ -17,9 +17,9 @@ struct HostName {
 };
 
 /// The host name of an address, by the system's resolver with the address's own family and length; never a numeric
-/// text. No name and no error: the host's entry has no name. Blocks: each name server is asked once, for 2 seconds
-/// at most, whatever /etc/resolv.conf says (it lists three servers at most); other sources of the name service switch
-/// keep their own bounds.
+/// text. No name and no error means that the host's entry has no name. Blocks: each name server is asked once, for 2
+/// seconds at most, whatever /etc/resolv.conf says (it lists three servers at most). Other sources of the name service
+/// switch keep their own bounds.
 [[nodiscard]] HostName hostNameOf(const SocketAddress& address);
 
 }  // namespace adminhost

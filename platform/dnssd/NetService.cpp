@@ -59,8 +59,8 @@ SocketAddress socketAddress(const AvahiAddress& address, std::uint16_t port, Ava
     return bytesOf(six);
 }
 
-/// Asks whether the daemon answers, without blocking. Avahi's client library makes its first calls to the daemon
-/// synchronously and waits 25 seconds for each: it must only meet a daemon that answers.
+/// Finds out whether the daemon replies, without blocking. Avahi's client library makes its first calls to the daemon
+/// synchronously and waits 25 seconds for each, so it must only be used once the daemon is known to reply.
 class Probe {
   public:
     enum class State { asking, answered, failed };
@@ -206,7 +206,7 @@ void NetService::stop() {
     }
 }
 
-/// Once the daemon is known to answer.
+/// Called once the daemon is known to reply.
 void NetService::begin() {
     Resolution& resolution = *_resolution;
     resolution.probe.reset();
@@ -254,7 +254,7 @@ bool NetService::advance() {
         return news;
     }
     if (!_addresses.empty()) {
-        stop();  // what was found stays found
+        stop();  // the addresses found so far stay
         return true;
     }
     end();

@@ -8,8 +8,9 @@
 //     service.resolveWithTimeout(std::chrono::seconds(10));
 //     while (service.addresses().empty() && ...) { loop.runOnce(std::chrono::seconds(1)); }
 //
-// Resolved by the Avahi daemon over the system bus (DBUS_SYSTEM_BUS_ADDRESS is honoured). A name that nobody answers
-// to is a failure of the daemon's after 5 seconds; a bus or daemon that keeps silent ends with the time-out.
+// The Avahi daemon resolves it over the system bus (DBUS_SYSTEM_BUS_ADDRESS is honoured). For a name that no host has,
+// the daemon reports a failure after 5 seconds. If the bus or the daemon does not reply, the time-out ends the
+// resolution.
 
 #include "platform/dnssd/EventLoop.h"
 #include "platform/value/Value.h"
@@ -40,7 +41,7 @@ class NetService {
 
     /// Code of a time-out, ours or the daemon's.
     static constexpr int timeoutCode = -15;
-    /// Code when there is no bus or no daemon.
+    /// Code if there is no bus or no daemon.
     static constexpr int noDaemonCode = -26;
 
     NetService(EventLoop& loop, std::string domain, std::string type, std::string name);
@@ -50,8 +51,9 @@ class NetService {
 
     void setDelegate(Delegate delegate) { _delegate = std::move(delegate); }
 
-    /// Begins to resolve and returns at once. Where there is no bus, or a text is not UTF-8, didNotResolve is called
-    /// before it returns; every other callback comes while the loop runs. A resolution already under way is begun anew.
+    /// Begins to resolve and returns at once. If there is no bus, or a text is not UTF-8, didNotResolve is called
+    /// before it returns; every other callback comes while the loop runs. A resolution that is already under way is
+    /// restarted.
     void resolveWithTimeout(std::chrono::milliseconds timeout);
     /// Ends the resolution; didStop is called if one was under way. The addresses found so far stay.
     void stop();
@@ -59,13 +61,13 @@ class NetService {
     [[nodiscard]] const std::string& domain() const noexcept { return _domain; }
     [[nodiscard]] const std::string& type() const noexcept { return _type; }
     [[nodiscard]] const std::string& name() const noexcept { return _name; }
-    /// Found so far, each once, in the order of their arrival.
+    /// The addresses found so far, each once, in the order of their arrival.
     [[nodiscard]] const std::vector<SocketAddress>& addresses() const noexcept { return _addresses; }
 
   private:
     friend class EventLoop;
     struct Resolution;
-    /// Does what has become due. Whether it was news.
+    /// Does everything that is due. Returns true if any of it was news.
     bool advance();
     [[nodiscard]] std::optional<std::chrono::steady_clock::time_point> deadline() const;
     void begin();

@@ -25,7 +25,7 @@ struct OwnerAndMode {
 /// Creates an empty file of mode 0644. An existing file or link of that name is an error; a link is not followed.
 [[nodiscard]] std::optional<Error> createEmptyFile(const DiskPath& path);
 
-/// The id of a group in the account files below the system root; nullopt if there is none of that name.
+/// The id of a group in the account files below the system root; nullopt if there is no such group.
 [[nodiscard]] std::optional<gid_t> groupIdOf(const char* name);
 
 }  // namespace adminhost

@@ -1,6 +1,6 @@
 #pragma once
 
-// One open file descriptor, closed when its owner goes. Move-only; a moved-from one is empty.
+// One open file descriptor, closed by its destructor. Move-only; a moved-from one is empty.
 
 #include <cerrno>
 #include <utility>
@@ -33,7 +33,7 @@ class FileDescriptor {
     /// Gives up ownership: the caller closes the descriptor.
     [[nodiscard]] int release() noexcept { return std::exchange(_number, -1); }
 
-    /// Closes it if it is open and answers the system's error number, 0 for success. errno stays as it was.
+    /// Closes it if it is open. Returns the system's error number, 0 for success. errno keeps its value.
     int close() noexcept {
         const int before = errno;
         int failure = 0;

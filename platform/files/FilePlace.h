@@ -16,8 +16,8 @@ struct FilePlace {
 };
 
 /// Finds the place of a file, which need not exist. Links on the way are followed only where nobody but root and this
-/// process's own user can have put them: a link in a directory that others may write to is ELOOP. Answers the system's
-/// error number, 0 for success; a path that ends in no name ("/", "a/", "a/..") is EINVAL.
+/// process's own user can have created them: a link in a directory that others may write to is ELOOP. Returns the
+/// system's error number, 0 for success; a path that does not end in a name ("/", "a/", "a/..") is EINVAL.
 [[nodiscard]] int openPlace(const DiskPath& path, FilePlace& place);
 
 }  // namespace adminhost

@@ -64,7 +64,7 @@ HostPath hostPath(const DiskPath& path) {
 
 bool exists(const DiskPath& path) noexcept {
     struct stat status {};
-    // The system would look at what stands before a NUL.
+    // The system would look at the part before a NUL.
     return path.text().find('\0') == std::string::npos && ::stat(path.c_str(), &status) == 0;
 }
 

@@ -2,8 +2,8 @@
 
 // Paths and the system root.
 //
-// A HostPath is a path as the service's administrator knows it: what settings hold and operations answer and log. A
-// DiskPath is where it lies on this disk. What touches the disk takes a DiskPath only; diskPath() is the one way from
+// A HostPath is a path as the service's administrator knows it: in settings, responses and log lines. A DiskPath is the
+// place of the file on this disk. Functions that touch the disk accept a DiskPath only; diskPath() is the one way from
 // the first to the second. Both compare and copy as their text; neither is normalised.
 
 #include <compare>
@@ -35,7 +35,7 @@ class DiskPath {
     std::string _text;
 };
 
-/// Sets the directory below which every absolute host path lies: "/" at first. Set once, before requests are served.
+/// Sets the directory below which every absolute host path is: "/" at first. Set once, before requests are served.
 void setSystemRoot(std::string directory);
 [[nodiscard]] const std::string& systemRoot() noexcept;
 
@@ -47,7 +47,7 @@ void setSystemRoot(std::string directory);
 /// The way back, for texts that people read: the host path of a place below the system root; any other path as it is.
 [[nodiscard]] HostPath hostPath(const DiskPath& path);
 
-/// Whether a file system entry exists there (a link is followed). False also when it cannot be known.
+/// Returns true if a file system entry exists there (a link is followed). Returns false also if it cannot be known.
 [[nodiscard]] bool exists(const DiskPath& path) noexcept;
 
 }  // namespace adminhost

@@ -66,7 +66,7 @@ void removeLeftoversIn(const FilePlace& place) {
     }
 }
 
-/// The file that takes the new bytes; removed again unless it was moved into its place.
+/// The file for the new bytes; removed again unless it was moved into its place.
 class TemporaryFile {
   public:
     explicit TemporaryFile(const FilePlace& place) noexcept : _place(place) {}
@@ -80,7 +80,7 @@ class TemporaryFile {
 
     [[nodiscard]] int descriptor() const noexcept { return _file.get(); }
 
-    // Each answers the system's error number, 0 for success.
+    // Each returns the system's error number, 0 for success.
 
     int create() {
         for (int attempt = 0; attempt < 100; ++attempt) {
@@ -98,8 +98,8 @@ class TemporaryFile {
                 return errno;
             }
             _name = name;
-            // Between creation and lock another writer may have taken the file for a leftover: who holds a lock now is
-            // about to remove it.
+            // Between creation and lock another writer may have mistaken the file for a leftover. If one holds a lock
+            // now, it is about to remove the file.
             struct stat status {};
             ::flock(_file.get(), LOCK_EX);
             if (::fstat(_file.get(), &status) != 0) {
@@ -165,7 +165,7 @@ int readAttribute(int file, const char* name, std::vector<char>& value) {
             value.resize(static_cast<std::size_t>(count));
             return 0;
         }
-        if (errno != ERANGE) {  // which says that it has grown meanwhile
+        if (errno != ERANGE) {  // ERANGE: it has grown meanwhile
             return errno;
         }
     }
@@ -243,7 +243,7 @@ std::optional<Error> keepProperties(const FileDescriptor& old, const struct stat
     return std::nullopt;
 }
 
-/// Opens the file that is to be replaced; empty, without an error, when there is none or a link stands in its place.
+/// Opens the file that is to be replaced. It stays empty, without an error, if the file does not exist or is a link.
 std::optional<Error> openOld(const FilePlace& place, const HostPath& path, FileDescriptor& old, struct stat& status) {
     if (::fstatat(place.directory.get(), place.name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
         return errno == ENOENT ? std::nullopt : std::optional(failure("look at", path, errno));

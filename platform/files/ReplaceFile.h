@@ -1,6 +1,6 @@
 #pragma once
 
-// Replacing a file as a whole, so that whoever reads it meets either the old bytes or the new ones, also after a crash.
+// Replacing a file as a whole: a reader sees either the old bytes or the new ones, also after a crash.
 
 #include "platform/files/Path.h"
 #include "platform/value/Error.h"
@@ -17,26 +17,27 @@ namespace adminhost {
 /// a new file has the given mode and belongs to the process's user. Labels and attributes that only the system may set,
 /// and attributes that the file system does not know, are left to the system.
 ///
-/// No link is followed: one in the file's place is itself replaced by a new file, one on the way only where
-/// openPlace() allows it. Anything else in its place (a directory, a pipe) is an error.
+/// No link is followed. A link in the file's place is itself replaced by a new file; a link on the way is followed only
+/// where openPlace() allows it. Anything else in its place (a directory, a pipe) is an error.
 ///
-/// On failure the old file stands as it was and no temporary file is left; the error (domain "posix", the system's
-/// number) names the step, the host path and the system's text. One failure comes too late for that: when the
-/// directory cannot be flushed the new file is in place, but might not outlast a power cut; the error says so.
+/// On failure the old file is unchanged and no temporary file is left. The error (domain "posix", the system's number)
+/// names the step, the host path and the system's text. One failure comes too late for that: if the directory cannot be
+/// flushed, the new file is in place, but might be lost in a power cut. The error reports that.
 ///
-/// Temporary files that killed processes left for the same file are removed first; those of living writers are not.
-/// Several may write the same file at once, also from machines that share the directory: one of them is the last.
+/// Temporary files that killed processes left for the same file are removed first; those of running writers are not.
+/// Several processes may write the same file at once, also from machines that share the directory: one of them is the
+/// last.
 [[nodiscard]] std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path, mode_t newMode = 0644);
 
 /// Removes the temporary files that killed processes left for the file, as replaceFile() does before it writes. Those
 /// that cannot be removed stay.
 void removeLeftovers(const HostPath& path);
 
-/// Keeps a file that cannot be loaded beside its place before it is replaced: as PATH ".unreadable-" and the moment
-/// ("2026-01-31T080000Z", UTC), with "-2" and so on after it when that is taken. The file stays in its place too, so
-/// that there is no moment without one; where it cannot have two names, or cannot be read by this process at all, it
-/// is moved. A link is kept as a link; anything else than a file or link stays and is an error. Answers the new name,
-/// or nothing, with the error, when it could not be kept.
+/// Keeps a copy of a file that cannot be loaded before it is replaced: beside it, as PATH ".unreadable-" and the time
+/// ("2026-01-31T080000Z", UTC), with "-2" and so on after it if that name exists. The file stays in its place too, so
+/// that it is never missing. If it cannot have two names, or this process cannot read it at all, it is moved instead. A
+/// link is kept as a link; anything else than a file or link stays and is an error. Returns the new name; nullopt, with
+/// the error, if the file could not be kept.
 [[nodiscard]] std::optional<HostPath> keepUnreadable(const HostPath& path, Error* error = nullptr);
 
 }  // namespace adminhost

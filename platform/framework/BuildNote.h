@@ -34,7 +34,8 @@
 #endif
 
 /// Identity of a build: plug-in interface, C++ ABI and whether it is a checking build. Neither the release nor the
-/// compiler's version is part of it: a plug-in that is packaged separately outlives an update of either.
+/// compiler's version is part of it, so that a plug-in that is packaged separately still loads after an update of
+/// either.
 #define ADMINHOST_BUILD_IDENTITY \
     "adminhost interface " ADMINHOST_TEXT(ADMINHOST_PLUGIN_INTERFACE) ", " ADMINHOST_CXX_ABI ADMINHOST_BUILD_FLAVOUR
 

@@ -33,7 +33,7 @@ enum class Access : std::uint8_t {
 struct Command {
     std::string name;                 ///< last word of its address; unique in the plug-in
     Access access = Access::account;  ///< the strictest, in case that one is forgotten
-    bool showsRevision = false;       ///< its answer carries revision()
+    bool showsRevision = false;       ///< its response includes revision()
     bool takesRevision = false;       ///< accepts If-Match, and changes settings(): the host keeps their history
     std::vector<std::string> needs;   ///< names for probe(); each must be usable before perform() is called
     std::chrono::seconds deadline{};  ///< its own bound; zero: the daemon's
@@ -110,18 +110,19 @@ class Plugin {
     /// Serves one command of commands().
     [[nodiscard]] virtual Response perform(std::string_view command, const Dictionary& request) = 0;
 
-    /// Whether what commands need under this name is usable. Called before each command that needs it, so a plug-in
-    /// keeps a result that took time and looks again only while it is not usable. Its tools are ended after 5 seconds.
+    /// Returns whether something that commands need under this name is usable. Called before each command that needs
+    /// it: a plug-in should keep a result that took long to find out, and check again only while it is not usable. Its
+    /// tools are killed after 5 seconds.
     [[nodiscard]] virtual Probe probe(std::string_view /*need*/) { return {}; }
     /// Checks of the installation, for an administrator. Each ends within 2 seconds.
     [[nodiscard]] virtual std::vector<Diagnosis> diagnose() { return {}; }
-    /// A short digest of what reading settings would show now; empty if the plug-in has none.
+    /// A short digest of what reading settings would show now; empty if the plug-in does not have one.
     [[nodiscard]] virtual std::string revision() { return {}; }
 
     /// The settings whose history the host keeps, in the order in which people read them.
     [[nodiscard]] virtual std::vector<Setting> settingKeys() { return {}; }
-    /// Their values as reading shows them now, without those that are not set. The value of a secret is its stored
-    /// (enciphered) form. On an error the host makes no entry and logs the reason.
+    /// The values of these settings as reading shows them now, without those that are not set. The value of a secret is
+    /// its stored (enciphered) form. On an error the host adds no entry and logs the reason.
     [[nodiscard]] virtual Result<Dictionary> settings() { return Dictionary(); }
     /// The files in which these settings are stored, whatever their format; some may not exist. The host copies them
     /// byte for byte into each entry of the history, and removes what an unfinished write left beside them.

@@ -1,6 +1,7 @@
 #pragma once
 
-// What the host gives a request handler: the base class, the forms of an answer, the defaults and fresh UUID texts.
+// What the host gives a request handler: the base class, the forms of a response, the user defaults and random UUID
+// texts.
 
 #include "platform/value/Value.h"
 
@@ -10,12 +11,12 @@
 
 namespace adminhost {
 
-/// What an operation answers: a response dictionary, nothing, or the framework's error response.
+/// What an operation returns: a response dictionary, no response, or the framework's error response.
 class Response {
   public:
     enum class Kind { nothing, dictionary, error };
 
-    /// Nothing.
+    /// No response.
     Response() noexcept = default;
     Response(std::nullptr_t) noexcept {}
     Response(Dictionary dictionary) noexcept : _kind(Kind::dictionary), _dictionary(std::move(dictionary)) {}
@@ -23,7 +24,7 @@ class Response {
     [[nodiscard]] static Response error(std::string_view code, std::string_view message);
 
     [[nodiscard]] Kind kind() const noexcept { return _kind; }
-    /// Empty for nothing.
+    /// Empty if there is no response.
     [[nodiscard]] const Dictionary& dictionary() const noexcept { return _dictionary; }
     [[nodiscard]] Dictionary& dictionary() noexcept { return _dictionary; }
 

@@ -2,9 +2,9 @@
 
 // Reports: what a running operation has changed, and which parts of its request it did not carry out.
 //
-// An operation reports when it happens, beside its answer, which stays as it is. The worker hands each report to the
-// front at once, so that reports survive a worker that is killed halfway. History, audit and command line read
-// reports; nothing parses log lines. All calls come from the thread that runs the operation.
+// An operation reports each change when it happens. Reports do not alter its response. The worker hands each report to
+// the front at once, so that reports survive a worker that is killed halfway. History, audit and command line read
+// reports and never parse log lines. All calls come from the thread that runs the operation.
 
 #include "platform/value/Value.h"
 
@@ -16,13 +16,13 @@ namespace adminhost {
 /// One thing that was changed, reported once it is on disk. No text may hold a secret.
 struct Change {
     std::string section;   ///< "settings", or the list in the configuration: "cameras"
-    std::string identity;  ///< what survives renaming: a UUID or an id; empty for settings
+    std::string identity;  ///< a UUID or an id, which renaming does not change; empty for settings
     std::string name;      ///< for people: "Studio 1"; empty for settings
-    std::string key;       ///< what changed of it: "port", "users"; empty: all of it was added or removed
+    std::string key;       ///< the part that changed: "port", "users"; empty: all of it was added or removed
     Value from;            ///< null: absent before, or secret
     Value to;              ///< null: absent now, or secret
     bool secret = false;   ///< from and to are withheld
-    Value undo;            ///< the part of a request's "configuration" that takes it back; null: cannot be taken back
+    Value undo;            ///< the part of a request's "configuration" that undoes it; null: cannot be undone
 
     bool operator==(const Change&) const = default;
 };
@@ -31,7 +31,7 @@ struct Change {
 struct NotDone {
     std::string keyPath;      ///< "configuration.cameras.0.users.1"
     std::string reason;       ///< one sentence for people
-    std::string toolMessage;  ///< the tool's or the library's own words; empty if there are none
+    std::string toolMessage;  ///< the tool's or the library's own text; may be empty
 
     bool operator==(const NotDone&) const = default;
 };
@@ -45,7 +45,7 @@ class ReportSink {
     ~ReportSink() = default;
 };
 
-/// Where reports go from now on; null (the initial state): they are dropped. The sink must outlive its use.
+/// Sets where reports go from now on. With null, the initial state, they are dropped. The sink must outlive its use.
 void setReportSink(ReportSink* sink) noexcept;
 void reportChange(Change change);
 void reportNotDone(NotDone part);

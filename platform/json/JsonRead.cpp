@@ -37,7 +37,7 @@ class CountingIterator {
     const char** _reached;
 };
 
-/// Takes the parser's events and builds the value. Every event returns whether to go on.
+/// Receives the parser's events and builds the value. Every event returns true to go on.
 class Builder {
   public:
     using Json = nlohmann::json;
@@ -209,7 +209,7 @@ bool Builder::parse_error(std::size_t position, const std::string&, const Json::
             text.remove_prefix(at + before.size());
         }
     }
-    // What was read last may hold bytes that are not UTF-8, and values that nobody should meet in an error message.
+    // The last part read may hold bytes that are not UTF-8, and values that must not appear in an error message.
     text = text.substr(0, text.find("; last read"));
     text = text.substr(0, text.find(" parsing '"));
     _position = position;
@@ -223,7 +223,7 @@ std::optional<Value> parseJson(std::string_view text, Error* error, std::size_t 
     Builder builder(valuesMaximum);
     if (Builder::Json::sax_parse(CountingIterator(text.data(), &reached),
                                  CountingIterator(text.data() + text.size(), &reached), &builder)) {
-        // The parser takes a NUL for the end of its input. Inside a value it has rejected one.
+        // The parser reads a NUL as the end of its input. It has rejected one inside a value.
         const std::size_t nul = text.find('\0');
         if (nul == std::string_view::npos) {
             return builder.take();

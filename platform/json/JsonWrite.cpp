@@ -59,7 +59,7 @@ void Writer::writeReal(double real) {
     }
 }
 
-/// Bytes of ASCII that stand for themselves in a text, which most texts consist of.
+/// ASCII bytes that need no escape. Most texts consist of them.
 constexpr std::array<bool, 256> standForThemselves = [] {
     std::array<bool, 256> plain{};
     for (std::size_t byte = 0x20; byte < 0x7f; ++byte) {

@@ -1,6 +1,6 @@
 #pragma once
 
-// The system log: one call per event. Platform rooms do not log; their callers do.
+// The system log: one call for each event. The rooms of platform/ do not log; their callers do.
 //
 // Every sink writes the text as logTextOf() returns it, so that a name, a value or the output of a tool cannot look
 // like an event of its own. No sink ever blocks: what cannot be written at once waits in a queue of 1 MiB, events

@@ -1,6 +1,6 @@
 #pragma once
 
-// Events on their way to an output that may not accept them at once.
+// A log sink that queues events while its output does not accept them.
 
 #include "platform/log/Log.h"
 
@@ -38,7 +38,7 @@ class QueuedSink final : public LogSink {
 
   private:
     struct Queued {
-        std::string text;        ///< what is not written yet
+        std::string text;        ///< the part that is not written yet
         std::size_t events = 1;  ///< that are lost with it
     };
 

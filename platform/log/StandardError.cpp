@@ -20,7 +20,7 @@ namespace {
 /// that has it.
 class SecondOpening {
   public:
-    /// The descriptor for what is standard error now; -1 when it cannot be opened.
+    /// A descriptor for the present standard error; -1 when it cannot be opened.
     int of(const struct stat& status) {
         if (status.st_dev != _device || status.st_ino != _inode) {
             _descriptor = FileDescriptor(::open("/proc/self/fd/2", O_WRONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));

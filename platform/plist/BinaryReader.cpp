@@ -42,7 +42,7 @@ class BinaryReader {
 
     [[nodiscard]] std::uint8_t byteAt(std::size_t at) const noexcept { return static_cast<std::uint8_t>(_bytes[at]); }
 
-    /// Big-endian, of at most 8 bytes that lie inside the file.
+    /// Big-endian, of at most 8 bytes that are inside the file.
     [[nodiscard]] std::uint64_t numberAt(std::size_t at, std::size_t size) const noexcept {
         std::uint64_t number = 0;
         for (std::size_t i = 0; i < size; ++i) {
@@ -137,7 +137,7 @@ class BinaryReader {
         return spend(at, 0) ? std::optional<Value>(marker == 0x09) : std::nullopt;
     }
 
-    /// Whether size bytes lie after the first one of the object.
+    /// Returns true if size bytes follow the first one of the object.
     bool holds(std::size_t at, std::uint64_t size) {
         if (size > _table - at - 1) {
             fail(at, "an object that reaches beyond the objects");

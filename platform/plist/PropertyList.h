@@ -24,13 +24,13 @@ constexpr std::size_t plistMaximumSize = std::size_t{64} << 20U;  ///< bytes
 constexpr int plistMaximumDepth = 512;                            ///< nested arrays and dictionaries
 constexpr std::int64_t plistTooManyValues = 2;  ///< code of the error for more values than the caller allows
 
-/// Parses a property list of at most so many values (keys are none). Returns nullopt on failure; then, if error is
-/// given, it says what is wrong and where (line and column from 1; in the binary form the byte from 0), in the domain
-/// "propertyList", code 1 or plistTooManyValues. Rejected: invalid UTF-8, a key without a value, a key that occurs
-/// twice, unknown elements and attributes, text after the end, a second root, a document type with an internal subset,
-/// integers outside -2^63 ... 2^64-1, dates that the calendar does not have, more than the maximum size or depth. In
-/// the binary form also: objects inside themselves, object identifiers, null, and more content than the maximum size,
-/// however often an object is referred to.
+/// Parses a property list of at most so many values (keys are not counted). Returns nullopt on failure; then, if error
+/// is given, it describes what is wrong and where (line and column from 1; in the binary form the byte from 0), in the
+/// domain "propertyList", code 1 or plistTooManyValues. Rejected: invalid UTF-8, a key without a value, a key that
+/// occurs twice, unknown elements and attributes, text after the end, a second root, a document type with an internal
+/// subset, integers outside -2^63 ... 2^64-1, dates that the calendar does not have, more than the maximum size or
+/// depth. In the binary form also: objects inside themselves, object identifiers, null, and more content than the
+/// maximum size, however often an object is referred to.
 [[nodiscard]] std::optional<Value> parsePropertyList(std::string_view bytes, Error* error = nullptr,
                                                      std::size_t valuesMaximum = SIZE_MAX);
 

@@ -80,7 +80,7 @@ constexpr bool isWhiteSpace(char c) noexcept {
     return c == '\t' || c == '\n' || c == ' ' || c == '\r';
 }
 
-/// Most character events of an indented list are this; the library's search takes longer.
+/// Fast path: most character events of an indented list are white space, and the library's search is slower.
 bool isAllWhiteSpace(std::string_view text) noexcept {
     return std::all_of(text.begin(), text.end(), isWhiteSpace);
 }
@@ -99,7 +99,7 @@ bool readWhole(std::string_view text, Number& number) noexcept {
     return failure == std::errc{} && end == text.data() + text.size();
 }
 
-/// Decimal digits after an optional sign; hexadecimal forms are no part of the format.
+/// Decimal digits after an optional sign; the format has no hexadecimal form.
 std::optional<Value> integerOf(std::string_view text) {
     if (text.starts_with('+') && text.size() > 1 && text[1] != '-') {
         text.remove_prefix(1);
@@ -325,7 +325,7 @@ class XmlReader {
                 }
         }
         if (!value) {
-            // Without the text itself: a list may hold what nobody should meet in an error message.
+            // Without the text itself: a list may hold values that must not appear in an error message.
             return fail(fmt::format("this text is no <{}>", nameOf(element)));
         }
         store(std::move(*value));

@@ -22,13 +22,13 @@ class Child {
     Child& operator=(const Child&) = delete;
     ~Child();
 
-    /// Starts the tool in a process group of its own; withInput says whether it reads a pipe instead of /dev/null.
-    /// Returns the system's error number, 0 for success. Called once.
+    /// Starts the tool in a process group of its own. Its standard input is a pipe if `withInput` is true, else
+    /// /dev/null. Returns the system's error number, 0 for success. Called once.
     [[nodiscard]] int start(const std::string& tool, const std::vector<std::string>& arguments,
                             std::vector<std::string> environment, bool withInput);
 
-    /// SIGKILL for the child's process group, unless the child itself has exited: what it has left in its group is a
-    /// daemon that stays.
+    /// Sends SIGKILL to the child's process group, unless the child itself has exited: a process that it left in its
+    /// group is a daemon that must go on.
     void kill() noexcept;
 
     /// Call when `exit` is readable: the child is no longer in the process's register (ToolRegister.h).
@@ -44,7 +44,7 @@ class Child {
     FileDescriptor exit;    ///< becomes readable when the child has exited
 
   private:
-    pid_t _pid = 0;  ///< 0 when there is nothing to wait for
+    pid_t _pid = 0;  ///< 0: no child to wait for
     bool _exited = false;
     std::atomic<pid_t>* _registration = nullptr;
 };

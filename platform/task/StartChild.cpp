@@ -26,7 +26,7 @@ static_assert(std::atomic<pid_t>::is_always_lock_free, "a child that shares our 
 /// The kernel's own set of signals. The C library's calls leave out the two signals that it uses itself.
 using KernelSignals = std::uint64_t;
 
-/// What the child needs, as plain data.
+/// The child's part of the plan, as plain data.
 struct ChildSide {
     const char* program;
     char* const* arguments;
@@ -166,7 +166,7 @@ FileDescriptor lifted(int descriptor, int least) noexcept {
     return FileDescriptor(::fcntl(descriptor, F_DUPFD_CLOEXEC, least));
 }
 
-/// Kills what was started and waits for it.
+/// Kills the started child and waits for it.
 void discard(pid_t pid) noexcept {
     ::kill(pid, SIGKILL);
     while (::waitpid(pid, nullptr, 0) < 0 && errno == EINTR) {

@@ -35,7 +35,7 @@ struct ChildPlan {
     std::optional<std::string> directory;  ///< without one, the child keeps our current directory
     std::optional<mode_t> fileModeMask;    ///< without one, the child keeps our umask
     /// Where the child writes its own process id before it executes the program, or null. In memory shared with another
-    /// process, this tells that process which children run, also if we die. A child whose parent dies before the id is
+    /// process, this shows that process which children run, also if we die. A child whose parent dies before the id is
     /// written does not execute the program. After a failure the id is 0 again; otherwise the caller sets it to 0,
     /// before it reaps the child.
     std::atomic<pid_t>* registration = nullptr;

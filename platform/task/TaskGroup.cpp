@@ -67,7 +67,7 @@ class Capture {
 
     /// Reads once, unless that exceeds the bound; closes the stream at its end.
     void readSome(std::size_t bound) {
-        std::array<char, 65536> buffer;  // not initialised: read() fills what is used
+        std::array<char, 65536> buffer;  // not initialised: read() fills the used part
         const ssize_t count = ::read(_stream.get(), buffer.data(), buffer.size());
         if (count > 0) {
             _count += static_cast<std::size_t>(count);
@@ -80,7 +80,7 @@ class Capture {
         }
     }
 
-    /// Reads what is in the pipe at this moment, however long that takes, and no more than that.
+    /// Reads the bytes that are in the pipe at this moment, however long that takes, and not more.
     void readWhatIsThere(std::size_t bound) {
         int waiting = 0;
         if (!isOpen() || ::ioctl(_stream.get(), FIONREAD, &waiting) != 0) {
@@ -98,7 +98,7 @@ class Capture {
         std::string().swap(_bytes);
     }
 
-    /// The text, with what is not UTF-8 replaced.
+    /// The text, with bytes that are not UTF-8 replaced.
     [[nodiscard]] std::string takeText() { return isUtf8(_bytes) ? std::move(_bytes) : utf8Of(_bytes); }
 
   private:
@@ -211,7 +211,7 @@ class TaskGroup::RunningTask {
     TaskResult result() { return std::move(_result); }
 
   private:
-    /// Writes as much as the pipe takes; closes it when all is written or nobody reads it any more.
+    /// Writes as much as fits into the pipe; closes it when all is written or nobody reads it any more.
     void writeSome() {
         const WithoutSigpipe guard;
         const ssize_t count = ::write(_child.input.get(), _rest.data(), _rest.size());

@@ -2,10 +2,10 @@
 
 // Several tools at once, from one thread: start them, wait or poll, collect their results in any order.
 //
-// What Task.h says of one tool holds for each: its descriptors, its environment, the daemon that it may leave behind,
-// and the deadline, which is that of the process at the moment of the start. One bound holds for all bytes that the
-// group has read and that were not collected yet. The tool that exceeds it is killed with its process group and fails;
-// its bytes are dropped, and the others go on.
+// Everything that Task.h states about one tool applies to each: its descriptors, its environment, the daemon that it
+// may leave behind, and the deadline, which is that of the process at the moment of the start. One bound applies to all
+// bytes that the group has read and that were not collected yet. A tool that exceeds it is killed with its process
+// group and fails; its bytes are dropped, and the others go on.
 
 #include "platform/files/Path.h"
 
@@ -45,7 +45,7 @@ class TaskGroup {
     TaskGroup() noexcept;
     TaskGroup(const TaskGroup&) = delete;
     TaskGroup& operator=(const TaskGroup&) = delete;
-    /// Kills what still runs, with its process group.
+    /// Kills the tools that are still running, with their process groups.
     ~TaskGroup();
 
     /// Starts a tool. One that cannot be started has ended with status -1.

@@ -9,7 +9,7 @@
 namespace adminhost {
 std::string isoTextOf(std::chrono::sys_seconds date) {
     using namespace std::chrono;
-    // The C library looks at the zone file even for UTC, and can do nothing that this does not for these years.
+    // For these years the C library gives the same text, but looks at the zone file even for UTC.
     constexpr sys_days firstDay = year(0) / January / 1;
     constexpr sys_days lastDay = year(9999) / December / 31;
     if (date >= firstDay && date < lastDay + days(1)) {

@@ -9,7 +9,7 @@
 
 namespace adminhost {
 
-/// A year outside 0000 to 9999 is written with a sign and at least six digits; a moment whose year fits no 32 bits is
+/// A year outside 0000 to 9999 is written with a sign and at least six digits; a moment whose year exceeds 32 bits is
 /// written as its seconds since 1970.
 [[nodiscard]] std::string isoTextOf(std::chrono::sys_seconds date);
 

@@ -18,8 +18,8 @@ long zoneOffsetAt(std::chrono::sys_days midnight) {
     return ::localtime_r(&moment, &parts) == nullptr ? 0 : parts.tm_gmtoff;
 }
 
-/// Whether the zone may be another one than when this was last asked. A daemon lives on while its machine's zone is
-/// changed; once a second is soon enough to notice.
+/// Returns true if the zone may have changed since the last call. The daemon keeps running while its machine's zone is
+/// changed; checking once a second is enough to notice.
 bool zoneMayHaveChanged() {
     using Clock = std::chrono::steady_clock;
     static std::optional<Clock::time_point> last;
@@ -34,7 +34,7 @@ bool zoneMayHaveChanged() {
     return true;
 }
 
-/// The zone's offset throughout that local day; nothing near a change of the clocks. Lists hold many dates of few days.
+/// The zone's offset throughout that local day; nullopt near a change of the clocks. Lists hold many dates of few days.
 std::optional<long> zoneOffsetOn(std::chrono::sys_days day) {
     struct Known {
         std::chrono::sys_days day{std::chrono::sys_days::max()};
@@ -55,7 +55,7 @@ std::optional<long> zoneOffsetOn(std::chrono::sys_days day) {
 
 /// A date's text as the C library reads it.
 std::optional<std::tm> datePartsOf(std::string_view text) {
-    // The form that is stored; the library takes longer over it than over all the rest.
+    // Fast path for the stored form: the library's parser takes longer than all the rest.
     constexpr std::string_view form = "dddd-dd-dd dd:dd:dd";
     const auto fits = [](char c, char f) { return f == 'd' ? c >= '0' && c <= '9' : c == f; };
     std::tm parts{};
@@ -81,7 +81,7 @@ std::optional<Date> localDateOf(std::string_view text) {
     if (!parts) {
         return std::nullopt;
     }
-    // The C library accepts 30 February and a 61st second and moves them on; a stored date that does so is no date.
+    // The C library accepts 30 February and a 61st second and moves them on; a stored date like that is not a date.
     using namespace std::chrono;
     const year_month_day day{year(parts->tm_year + 1900), month(static_cast<unsigned>(parts->tm_mon + 1)),
                              std::chrono::day(static_cast<unsigned>(parts->tm_mday))};

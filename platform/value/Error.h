@@ -1,6 +1,6 @@
 #pragma once
 
-// Error record: how an operation says what went wrong.
+// Error record: how an operation reports what went wrong.
 
 #include <cstdint>
 #include <optional>

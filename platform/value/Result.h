@@ -1,6 +1,6 @@
 #pragma once
 
-// A value, or the error that says why there is none.
+// A value, or the error that explains why there is none.
 
 #include "platform/value/Error.h"
 

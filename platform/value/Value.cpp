@@ -161,7 +161,7 @@ Value::Value(Value&& other) noexcept : _value(std::move(other._value)) {
 Value& Value::operator=(const Value&) = default;
 Value& Value::operator=(Value&& other) noexcept {
     if (this != &other) {
-        // Taken out first: the other value may lie inside this one.
+        // Moved out first: the other value may be inside this one.
         auto taken = std::exchange(other._value, std::monostate{});
         _value = std::move(taken);
     }

@@ -48,12 +48,12 @@ class Dictionary {
     [[nodiscard]] const Value* find(std::string_view key) const noexcept;
     [[nodiscard]] Value* find(std::string_view key) noexcept;
     [[nodiscard]] bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
-    /// The value under the key; a null Value (of static life) if there is none.
+    /// The value under the key; a null Value (a static object) if there is none.
     [[nodiscard]] const Value& get(std::string_view key) const noexcept;
     /// The text of the string under the key; empty if there is no value under it or one of another type. Converts
     /// nothing. Refers to the value in the dictionary, so it is valid only as long as a pointer from find() is.
     [[nodiscard]] std::string_view text(std::string_view key) const noexcept;
-    /// Follows a key path ("outer.inner") through nested dictionaries; a null Value where it ends early.
+    /// Follows a key path ("outer.inner") through nested dictionaries; a null Value if it ends early.
     [[nodiscard]] const Value& at(std::string_view keyPath) const noexcept;
 
     /// Stores the value; an existing key keeps its place. A null value removes the key.

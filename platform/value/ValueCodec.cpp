@@ -96,7 +96,7 @@ bool Decoder::text(std::string_view& text) {
 
 bool Decoder::array(Value& value, std::size_t depth) {
     std::size_t count = 0;
-    // Every element takes a byte at least, so that a forged count cannot ask for memory.
+    // Every element occupies at least one byte, so a forged count cannot make this allocate much memory.
     if (depth == codecMaximumDepth || !size(count) || count > _bytes.size()) {
         return false;
     }

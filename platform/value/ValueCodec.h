@@ -1,6 +1,6 @@
 #pragma once
 
-// The compact binary form of values, for two processes of one build on one machine. It is no file format: it may
+// The compact binary form of values, for two processes of one build on one machine. It is not a file format: it may
 // change with any release.
 
 #include "platform/value/Value.h"
@@ -18,9 +18,9 @@ constexpr std::size_t codecMaximumDepth = 1024;
 /// Appends the value's bytes.
 void encodeValue(const Value& value, std::string& bytes);
 
-/// The value that exactly these bytes stand for. Nothing when they are cut off, hold anything more, are nested too
-/// deep, or hold what no value does (a null or repeated key in a dictionary). Never reserves more memory than the bytes
-/// at hand justify.
+/// The value that exactly these bytes encode. Returns nullopt if they are cut off, continue after the value, are nested
+/// too deep, or contain something that a value cannot have (a null or repeated key in a dictionary). Never reserves
+/// more memory than the given bytes justify.
 [[nodiscard]] std::optional<Value> decodeValue(std::string_view bytes);
 
 }  // namespace adminhost

@@ -1,6 +1,6 @@
 #pragma once
 
-// The texts of values, and the booleans that values and texts stand for.
+// The texts of values, and the booleans that values and texts mean.
 
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
@@ -11,11 +11,11 @@
 
 namespace adminhost {
 
-/// The text that log lines, messages and statements show for a value: null is "(null)", true "1", false "0", a number
-/// its shortest decimal form without an exponent (100000.0 is "100000", a very large or small one has all its digits;
-/// "inf" and "nan" are what no digits can show), a string itself, a date "2026-01-31 08:00:00 +0000" (UTC), data its
-/// bytes in hexadecimal between angle brackets; arrays and dictionaries are written on indented lines between
-/// parentheses and braces.
+/// The text of a value in log lines, messages and statements. Null is "(null)", true "1", false "0". A number is its
+/// shortest decimal form without an exponent (100000.0 is "100000", a very large or small one has all its digits; "inf"
+/// and "nan" if digits cannot show it). A string is itself, a date "2026-01-31 08:00:00 +0000" (UTC), data its bytes in
+/// hexadecimal between angle brackets. Arrays and dictionaries are written on indented lines between parentheses and
+/// braces.
 [[nodiscard]] std::string textOf(const Value& value);
 /// A missing text is "(null)".
 [[nodiscard]] std::string textOf(const std::optional<std::string>& text);
@@ -23,10 +23,11 @@ namespace adminhost {
 [[nodiscard]] std::string textOf(const Error& error);
 [[nodiscard]] std::string textOf(const std::optional<Error>& error);
 
-/// The boolean reading of a stored or requested value: a boolean as it is, a number when non-zero, a string when its
-/// first character that is no blank (space, tab) is one of Y y T t or 1 to 9. Anything else is false.
+/// The boolean meaning of a stored or requested value: a boolean as it is, a number if it is not zero, a string if its
+/// first character other than a blank (space, tab) is one of Y y T t or 1 to 9. Anything else is false.
 [[nodiscard]] bool booleanOf(const Value& value) noexcept;
-/// The reading of a change entry's flags: as booleanOf, but a string's leading zeros are skipped too ("01" is true).
+/// The boolean meaning of a change entry's flags: as booleanOf, but a string's leading zeros are skipped too ("01" is
+/// true).
 [[nodiscard]] bool flagOf(const Value& value) noexcept;
 
 }  // namespace adminhost
