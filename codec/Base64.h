@@ -1,7 +1,7 @@
 #pragma once
 
-// What is behind the base64 operations: the table, the encoder with its growing buffer, a line's last characters. Open
-// to the tests; others use LumioCategories.h.
+// The internals of the base64 operations: the table, the encoder with its growing buffer, the decoding of a line's last
+// characters. For the tests; other code uses LumioCategories.h.
 
 #include "codec/LumioCategories.h"
 
@@ -27,10 +27,10 @@ extern const std::array<std::int8_t, 128> base64DecodeTable;
 /// Output bytes that grow by doubling. A buffer that cannot grow drops further bytes, with one log line for each.
 class ByteBuffer {
   public:
-    /// How a buffer grows; tests put a failing one in.
+    /// How a buffer grows; tests substitute one that fails.
     struct Growth {
         std::size_t limit = 0x7FFFFFFF;  ///< a full buffer of so many bytes does not grow
-        /// Makes room for that many bytes in all; false, and the bytes as they were, when that fails.
+        /// Makes room for that many bytes in all; returns false, with the bytes unchanged, if that fails.
         bool (*reserve)(adminhost::Data& bytes, std::size_t capacity) noexcept = reserveBytes;
     };
 
@@ -45,8 +45,8 @@ class ByteBuffer {
         _bytes.push_back(byte);
     }
 
-    /// Lengthens the bytes, growing just as that many single bytes would; the caller fills them. Null, and nothing
-    /// appended, when there is no room for all.
+    /// Lengthens the bytes, growing just as that many single bytes would; the caller fills them. Returns null and
+    /// appends no byte if there is not enough room for all.
     [[nodiscard]] std::uint8_t* extend(std::size_t length) noexcept {
         while (_bytes.capacity() - _bytes.size() < length) {
             if (!grow()) {
@@ -58,7 +58,7 @@ class ByteBuffer {
         return _bytes.data() + used;
     }
 
-    /// Hands the bytes over, without a copy.
+    /// Moves the bytes to the caller, without a copy.
     [[nodiscard]] adminhost::Data take() && noexcept { return std::move(_bytes); }
 
     static bool reserveBytes(adminhost::Data& bytes, std::size_t capacity) noexcept {
@@ -87,9 +87,9 @@ struct EncoderOptions {
 
 [[nodiscard]] adminhost::Data encodeBase64Data(Bytes data, const EncoderOptions& options);
 
-/// Writes the bytes of the characters behind a line's last whole group of four (at most 3, all of the alphabet) and
-/// answers the place behind them. One character alone carries no byte and cannot come from a valid line: it is only
-/// logged, with characterCount, the number of the line's characters before its pads.
+/// Writes the bytes of the characters after a line's last whole group of four (at most 3, all of the alphabet) and
+/// returns the place after those bytes. One character alone encodes no byte and cannot come from a valid line: it is
+/// only logged, with characterCount, the number of the line's characters before its pads.
 [[nodiscard]] std::uint8_t* decodeRemainder(Bytes remainder, std::size_t characterCount, std::uint8_t* out);
 
 }  // namespace lumio

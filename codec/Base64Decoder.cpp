@@ -65,8 +65,8 @@ std::int8_t entryOf(std::uint8_t byte) noexcept {
 
 struct Line {
     bool valid = true;
-    const std::uint8_t* dataEnd = nullptr;  ///< behind the data part, the pads included
-    const std::uint8_t* next = nullptr;     ///< behind the line end
+    const std::uint8_t* dataEnd = nullptr;  ///< after the data part, pads included
+    const std::uint8_t* next = nullptr;     ///< after the line end
     std::size_t pads = 0;
 };
 
@@ -133,11 +133,11 @@ adminhost::Data LumioUtilities_decodeBase64(Bytes text) {
     const std::uint8_t* at = text.data();
     const std::uint8_t* const end = at + text.size();
     const auto decodedLength = [&](const std::uint8_t* from) { return static_cast<std::size_t>(end - from) / 4 * 3; };
-    // There is always room for what the rest of the input decodes to; only lines copied as they are take more.
+    // Everything that decodes fits into what is reserved; only lines that are copied unchanged need more.
     adminhost::Data result(decodedLength(at));
     std::size_t used = 0;
     while (at != end) {
-        // Whole groups are decoded at once; should the line turn out not to be base64, they are taken back.
+        // Whole groups are decoded at once. If the line turns out not to be base64, their bytes are dropped.
         std::uint8_t* out = result.data() + used;
         const std::uint8_t* const rest = decodeGroups(at, end, out);
         const Line line = scanLine(at, rest, end);

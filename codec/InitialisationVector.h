@@ -2,9 +2,9 @@
 
 // The initialisation vector of protected values.
 //
-// THESE SIXTEEN BYTES MUST EQUAL THE SERVICE'S OWN DEFINITION of the protected-value format: a value protected under
-// one vector does not come back under another, and what is stored already cannot be read any more. This is the only
-// place that names them; docs/protected-values.md describes the whole format.
+// THESE SIXTEEN BYTES MUST EQUAL THE SERVICE'S OWN DEFINITION of the protected-value format. A value that was protected
+// with one vector cannot be read with another, so a change makes all stored values unreadable. No other file contains
+// them; docs/protected-values.md describes the whole format.
 
 #include <array>
 #include <cstdint>

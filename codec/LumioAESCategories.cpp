@@ -26,7 +26,7 @@ std::optional<adminhost::Data> cryptedData(std::uint32_t operation, Bytes data, 
         if (status != adminhost::kCCBufferTooSmall) {
             return std::nullopt;
         }
-        // A library that does not say how much it needs is asked again with the same size.
+        // If the library does not report how much it needs, it is called again with the same size.
         size = moved == 0 ? size : moved;
     }
 }

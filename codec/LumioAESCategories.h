@@ -3,7 +3,7 @@
 // The cipher of protected values: AES in CBC mode with PKCS#7 padding under one fixed initialisation vector, so that
 // equal texts under equal keys give equal cipher texts.
 //
-// A key of 16 bytes is what the format means; one of 24 or 32 works too, and any other length answers nothing.
+// The format uses a key of 16 bytes; one of 24 or 32 bytes works too, and with any other length the operations fail.
 
 #include "codec/InitialisationVector.h"
 #include "codec/LumioCategories.h"
@@ -13,13 +13,13 @@
 
 namespace lumio {
 
-/// Nothing on any failure.
+/// Returns nullopt on any failure.
 [[nodiscard]] std::optional<adminhost::Data> aes128cbcEncryptDataWithKey(Bytes data, Bytes key);
-/// Nothing on any failure: a bad key length, a length that is no positive multiple of 16, bad padding. A wrong key that
-/// happens to give valid padding is not noticed.
+/// Returns nullopt on any failure: a bad key length, a length that is not a positive multiple of 16, bad padding. A
+/// wrong key that happens to give valid padding is not noticed.
 [[nodiscard]] std::optional<adminhost::Data> aes128cbcDecryptDataWithKey(Bytes data, Bytes key);
 
-/// Both of them, with the vector and the library's call open to the tests.
+/// Encrypts or decrypts, with the vector and the library's call as arguments for the tests.
 using CryptCall = decltype(&adminhost::CCCrypt);
 [[nodiscard]] std::optional<adminhost::Data> cryptedData(std::uint32_t operation, Bytes data, Bytes key,
                                                          const InitialisationVector& vector,

@@ -4,7 +4,7 @@
 //
 // The codec is the service's own and deliberately not a standard one: the decoder works line by line, copies lines that
 // are not base64 through unchanged, and reads every byte as its low 7 bits (0xC1 is an "A", 0x8A a line feed, 0xA0 a
-// blank, 0xBD a pad). Every operation answers newly owned bytes and none reports a failure.
+// blank, 0xBD a pad). Every operation returns new bytes and none reports a failure.
 
 #include "platform/value/Value.h"
 
@@ -35,7 +35,8 @@ using Bytes = std::span<const std::uint8_t>;
 /// blanks. Empty data passes.
 [[nodiscard]] bool LumioUtilities_isValidBase64Data(Bytes data);
 
-/// The entries of the dictionary for the keys, in the keys' order; missing keys are left out. Nothing for null keys.
+/// The entries of the dictionary for the keys, in the keys' order; missing keys are left out. Returns nullopt for null
+/// keys.
 [[nodiscard]] std::optional<adminhost::Dictionary> objectsWithAndForKeys(const adminhost::Dictionary& dictionary,
                                                                          const std::vector<std::string>* keys);
 
