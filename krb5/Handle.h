@@ -8,8 +8,8 @@
 
 namespace lumio {
 
-/// Frees its handle with Free and the context that the handle was made with; that context must outlive it. Move-only;
-/// a moved-from owner is empty.
+/// Frees its handle with Free and the context that the handle was created with; that context must outlive it.
+/// Move-only; a moved-from owner is empty.
 template <class Native, auto Free>
 class Handle {
   public:
@@ -21,12 +21,12 @@ class Handle {
     ~Handle() { reset(); }
 
     [[nodiscard]] Native get() const noexcept { return _native; }
-    /// For a library call that makes the handle; what was owned before is freed.
+    /// For a library call that creates the handle; the one owned before is freed.
     [[nodiscard]] Native* receive() noexcept {
         reset();
         return &_native;
     }
-    /// Gives the handle away, unfreed.
+    /// Releases the handle without freeing it.
     [[nodiscard]] Native release() noexcept { return std::exchange(_native, nullptr); }
     void reset() noexcept {
         if (_native != nullptr) {

@@ -1,6 +1,6 @@
 #pragma once
 
-// The Kerberos library's context, and what the whole object layer has in common:
+// The Kerberos library's context, and the rules that all objects of this room share:
 //
 // - Each object owns exactly one native handle; what comes from elsewhere is copied first, so no handle is shared.
 // - Every object holds a shared reference to the context it was made with, dropped after its own handle is freed.
@@ -30,13 +30,13 @@ class KRB5Keytab;
 
 class KRB5Context : public std::enable_shared_from_this<KRB5Context> {
   public:
-    /// A new context. One that the library could not make (a malformed krb5.conf) is answered with its errorCode set;
-    /// null only if the library gave neither a context nor an error.
+    /// A new context. If the library could not create it (a malformed krb5.conf), the object has its errorCode set.
+    /// Returns null only if the library gave neither a context nor an error.
     [[nodiscard]] static std::shared_ptr<KRB5Context> init();
     /// The same.
     [[nodiscard]] static std::shared_ptr<KRB5Context> context();
-    /// One context for the whole process, made at the first call and never freed. Making it is safe between threads;
-    /// using it is not.
+    /// One context for the whole process, created by the first call and never freed. Creating it is safe between
+    /// threads; using it is not.
     [[nodiscard]] static std::shared_ptr<KRB5Context> defaultContext();
 
     KRB5Context(const KRB5Context&) = delete;
@@ -49,15 +49,15 @@ class KRB5Context : public std::enable_shared_from_this<KRB5Context> {
 
     /// The library's default keytab. Null without a native context.
     [[nodiscard]] std::unique_ptr<KRB5Keytab> defaultKeytab();
-    /// Sets KRB5_KTNAME of this process to "TYPE:NAME" of the keytab, or removes it (null). Records nothing.
+    /// Sets KRB5_KTNAME of this process to "TYPE:NAME" of the keytab, or removes it (null). Records no status.
     void setDefaultKeytab(const KRB5Keytab* keytab) const;
 
     /// The library's default cache; null if it holds no principal yet, and without a native context.
     [[nodiscard]] std::unique_ptr<KRB5CredentialCache> defaultCredentialCache();
     /// Makes the cache the default of this context, by its bare name without the type: the library reads that as a file
-    /// cache, so this suits file caches. Null restores the library's own default.
+    /// cache, so this suits file caches only. Null restores the library's own default.
     void setDefaultCredentialCache(const KRB5CredentialCache* cache);
-    /// Makes the cache, by its bare name, the one that GSS-API uses on this thread; null restores the default. Answers
+    /// Makes the cache, by its bare name, the one that GSS-API uses on this thread; null restores the default. Returns
     /// the GSS major status.
     [[nodiscard]] static std::uint32_t setDefaultGSSCredentialCache(const KRB5CredentialCache* cache);
 

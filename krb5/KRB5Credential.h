@@ -13,12 +13,12 @@ namespace lumio {
 
 /// An owned copy of one credential of a cache: a client's ticket for a service, with its times. Immutable.
 ///
-/// It has no error code: a record that could not be copied leaves an object whose every answer is null. The library's
+/// It has no error code: if the record could not be copied, every accessor of the object returns null. The library's
 /// 32-bit times are read as signed.
 class KRB5Credential {
   public:
-    /// Always an object. A null record, or one that cannot be copied (one without client or server), gives one without
-    /// a record.
+    /// Always returns an object. If the record is null or cannot be copied (one without client or server), the object
+    /// has no record.
     [[nodiscard]] static std::unique_ptr<KRB5Credential> initWithNativeCredential(const krb5_creds* nativeCredential,
                                                                                   std::shared_ptr<KRB5Context> context);
 

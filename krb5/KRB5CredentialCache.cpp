@@ -59,7 +59,7 @@ std::unique_ptr<KRB5CredentialCache> KRB5CredentialCache::initWithName(const std
         throw std::invalid_argument("at least one of name and principal must be set");
     }
     const std::string cacheType = type.value_or(KRB5CredentialCacheAPIType);
-    // This system has no credential cache service to search or to create a cache in.
+    // This system has no credential cache service to search, or to create a cache in.
     if (cacheType == KRB5CredentialCacheAPIType) {
         return nullptr;
     }
@@ -147,7 +147,7 @@ void KRB5CredentialCache::setPrincipal(const KRB5Principal& principal) {
     if (nativeCredentialCache() == nullptr) {
         return;
     }
-    // The library compares and initialises with a null principal by crashing.
+    // The library crashes if it compares or initialises with a null principal.
     if (principal.nativePrincipal() == nullptr) {
         record(EINVAL);
         return;
@@ -248,8 +248,8 @@ void KRB5CredentialCache::acquireInitialCredentialWithPrincipal(const KRB5Princi
                                           keytab != nullptr ? keytab->nativeKeytab() : nullptr, 0, nullptr, &options));
     }
     if (errorCode() == 0) {
-        // Not recorded: errorCode tells how the request went. A ticket that could not be stored shows as a cache for
-        // which acquisition is still necessary.
+        // Not recorded: errorCode is the outcome of the request. If the ticket could not be stored, the cache shows
+        // that acquisition is still necessary.
         static_cast<void>(krb5_cc_store_cred(nativeContext(), nativeCredentialCache(), &*acquired));
     }
 }

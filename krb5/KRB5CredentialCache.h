@@ -27,7 +27,7 @@ inline constexpr const char* KRB5CredentialCacheFileType = "FILE";
 /// - Listing ends the sequence only when starting it gave a cursor; the library crashes on a missing one.
 /// - A cache that destroy() re-opened, and that this object has not initialised since, lists as empty with errorCode 0;
 ///   any other cache without a file keeps the library's KRB5_FCC_NOFILE.
-/// - After a failed destroy() there is no native cache, and every operation answers null, false or an empty list.
+/// - After a failed destroy() there is no native cache, and every operation returns null, false or an empty list.
 class KRB5CredentialCache : public KRB5Object {
   public:
     /// Opens the cache and binds it to the principal. A cache that holds another principal's tickets, none at all or
@@ -42,8 +42,8 @@ class KRB5CredentialCache : public KRB5Object {
     [[nodiscard]] static std::unique_ptr<KRB5CredentialCache> initWithType(const std::optional<std::string>& type,
                                                                            const KRB5Principal* principal,
                                                                            std::shared_ptr<KRB5Context> context);
-    /// Opens the same cache once more; null stands for the library's default cache. The handle passed in stays the
-    /// caller's. Null if the cache holds no principal.
+    /// Opens the same cache once more; null means the library's default cache. The caller keeps the handle that it
+    /// passes in. Null if the cache holds no principal.
     [[nodiscard]] static std::unique_ptr<KRB5CredentialCache> initWithNativeCredentialCache(
         krb5_ccache nativeCredentialCache, std::shared_ptr<KRB5Context> context);
 
@@ -58,8 +58,9 @@ class KRB5CredentialCache : public KRB5Object {
 
     /// The ticket-granting ticket of the cache's principal; null if there is none or on failure.
     [[nodiscard]] std::unique_ptr<KRB5Credential> initialCredential() const;
-    /// Whether the principal (null: the cache's) has no ticket-granting ticket that lasts for another 600 seconds.
-    /// False on failure, with errorCode set; that includes a ticket whose key type the library does not support.
+    /// Returns true if the principal (null: the cache's) has no ticket-granting ticket that lasts for another 600
+    /// seconds. Returns false on failure, with errorCode set; that includes a ticket whose key type the library does
+    /// not support.
     [[nodiscard]] bool initialCredentialAcquisitionIsNecessaryForPrincipal(const KRB5Principal* principal) const;
 
     /// Empties the cache, binds it to the principal (null: the cache's) and asks the KDC for a forwardable, proxiable
@@ -70,7 +71,7 @@ class KRB5CredentialCache : public KRB5Object {
                                                std::optional<std::string_view> password);
     void acquireInitialCredentialWithPassword(std::string_view password);
     void acquireInitialCredentialWithKeytab(const KRB5Keytab* keytab);
-    /// Acquires if necessary. Answers whether it was, so whether it was tried, not whether it succeeded.
+    /// Acquires if necessary. Returns true if it was necessary, so if it was tried, not if it succeeded.
     bool acquireInitialCredentialIfNecessaryWithPrincipal(const KRB5Principal* principal, const KRB5Keytab* keytab,
                                                           std::optional<std::string_view> password);
     bool acquireInitialCredentialIfNecessaryWithPassword(std::string_view password);
@@ -88,9 +89,9 @@ class KRB5CredentialCache : public KRB5Object {
     explicit KRB5CredentialCache(std::shared_ptr<KRB5Context> context) noexcept;
 
     bool initialize(krb5_principal principal);
-    /// A copy of the principal, or of the cache's if null; empty on failure, recorded.
+    /// A copy of the principal, or of the cache's if null; empty on failure, which is recorded.
     [[nodiscard]] PrincipalHandle clientFor(const KRB5Principal* principal) const;
-    /// On success, recorded like failure, the caller frees the contents of found.
+    /// Records its status. On success the caller frees the contents of found.
     [[nodiscard]] bool findTicketGrantingTicket(krb5_const_principal client, krb5_creds& found) const;
 
     Handle<krb5_ccache, krb5_cc_close> _nativeCredentialCache;

@@ -118,7 +118,7 @@ void KRB5Keytab::addEntry(const KRB5KeytabEntry& entry) {
         recordMissingHandle();
         return;
     }
-    // The library takes the record by non-const pointer but only reads it, here and in removeEntry.
+    // The library's parameter is a non-const pointer, but it only reads the record, here and in removeEntry.
     krb5_keytab_entry native = entry.nativeKeytabEntry();
     record(native.principal != nullptr ? krb5_kt_add_entry(nativeContext(), nativeKeytab(), &native) : EINVAL);
 }

@@ -21,16 +21,16 @@ inline constexpr const char* KRB5KeytabWritableFileType = "WRFILE";
 class KRB5Keytab : public KRB5Object {
   public:
     /// Opens "TYPE:NAME" (the file need not exist yet); the type defaults to FILE. Without a name, FILE opens the
-    /// library's default keytab and any other type, WRFILE too, opens nothing. Null if nothing was opened and there was
-    /// no error.
+    /// library's default keytab, and no other type, not even WRFILE, opens anything. Null if no keytab was opened and
+    /// there was no error.
     [[nodiscard]] static std::unique_ptr<KRB5Keytab> initWithName(const std::optional<std::string>& name,
                                                                   const std::optional<std::string>& type,
                                                                   std::shared_ptr<KRB5Context> context);
 
     KRB5Keytab(KRB5Keytab&&) noexcept = default;
 
-    /// Without the type: the path of a file keytab. A name beyond 1,099 bytes (type included) is answered cut, with the
-    /// library's status recorded.
+    /// Without the type: the path of a file keytab. A name of more than 1,099 bytes (type included) is returned cut,
+    /// with the library's status recorded.
     [[nodiscard]] std::optional<std::string> name() const;
     [[nodiscard]] std::optional<std::string> type() const;
     /// "TYPE:NAME"
@@ -44,7 +44,7 @@ class KRB5Keytab : public KRB5Object {
 
     void addEntry(const KRB5KeytabEntry& entry);
     void removeEntry(const KRB5KeytabEntry& entry);
-    /// Whether there is a key of that principal, version and encryption type. Leaves errorCode as it is.
+    /// Returns true if there is a key of that principal, version and encryption type. Leaves errorCode as it is.
     [[nodiscard]] bool containsEntry(const KRB5KeytabEntry& entry) const;
 
     [[nodiscard]] krb5_keytab nativeKeytab() const noexcept { return _nativeKeytab.get(); }
@@ -52,7 +52,7 @@ class KRB5Keytab : public KRB5Object {
   private:
     explicit KRB5Keytab(std::shared_ptr<KRB5Context> context) noexcept;
 
-    /// Calls visit with each entry until the keytab ends, a read fails, or visit answers false.
+    /// Calls visit with each entry until the keytab ends, a read fails, or visit returns false.
     template <class Visit>
     void walk(Visit visit) const;
 

@@ -22,7 +22,7 @@ KRB5KeytabEntry::~KRB5KeytabEntry() {
 std::unique_ptr<KRB5KeytabEntry> KRB5KeytabEntry::initWithNativeKeytabEntry(const krb5_keytab_entry& nativeKeytabEntry,
                                                                             std::shared_ptr<KRB5Context> context) {
     std::unique_ptr<KRB5KeytabEntry> entry(new KRB5KeytabEntry(std::move(context)));
-    // The library copies neither without a context nor from a null principal: it crashes.
+    // The library crashes if it copies without a context or from a null principal.
     if (entry->nativeContext() == nullptr || nativeKeytabEntry.principal == nullptr) {
         return nullptr;
     }
@@ -54,7 +54,7 @@ adminhost::Date KRB5KeytabEntry::timestamp() const noexcept {
 
 std::string KRB5KeytabEntry::enctypeString() const {
     std::array<char, 100> name{};
-    // The status tells nothing more than the empty buffer.
+    // The status adds nothing to the empty buffer.
     static_cast<void>(krb5_enctype_to_string(_nativeKeytabEntry.key.enctype, name.data(), name.size()));
     if (name[0] == '\0') {
         return "enctype " + std::to_string(enctype());

@@ -22,7 +22,7 @@ class KRB5KeytabEntry : public KRB5Object {
 
     /// Null if it has no text.
     [[nodiscard]] std::unique_ptr<KRB5Principal> principal() const;
-    /// When the key was made. The library's 32 bits are read as signed: a time after January 2038 comes out before
+    /// When the key was created. The library's 32 bits are read as signed: a time after January 2038 becomes one before
     /// 1970.
     [[nodiscard]] adminhost::Date timestamp() const noexcept;
     /// The key version number.

@@ -1,6 +1,6 @@
 #pragma once
 
-// What every Kerberos object but the context and the credential has: its context and the status it recorded last.
+// The base of every Kerberos object but the context and the credential: its context and the status it recorded last.
 
 #include "krb5/Handle.h"
 #include "krb5/KRB5Context.h"
@@ -12,7 +12,7 @@
 
 namespace lumio {
 
-/// A base only; being the base, it drops the context after the derived object has freed its handle.
+/// Base class only. As the base, it drops the context after the derived object has freed its handle.
 class KRB5Object {
   public:
     KRB5Object(const KRB5Object&) = delete;
@@ -31,13 +31,13 @@ class KRB5Object {
     ~KRB5Object() = default;
 
     [[nodiscard]] krb5_context nativeContext() const noexcept { return _context ? _context->nativeContext() : nullptr; }
-    /// Answers whether the status is success.
+    /// Returns true if the status is success.
     bool record(krb5_error_code status) const noexcept {
         _errorCode = status;
         return status == 0;
     }
-    /// In place of a call that the library does not survive without a handle: keeps the error of the failed
-    /// construction, which says more.
+    /// Used in place of a call that would crash the library without a handle. Keeps the error of the failed
+    /// construction, which is more specific.
     void recordMissingHandle() const noexcept {
         if (_errorCode == 0) {
             _errorCode = EINVAL;

@@ -35,7 +35,7 @@ class KRB5Principal : public KRB5Object {
 
     /// Of the text, so that equal principals of different contexts have equal hashes.
     [[nodiscard]] std::size_t hash() const;
-    /// Whether the texts are equal. A principal without text equals only itself.
+    /// Returns true if the texts are equal. A principal without text equals only itself.
     [[nodiscard]] bool isEqual(const KRB5Principal& other) const;
     friend bool operator==(const KRB5Principal& a, const KRB5Principal& b) { return a.isEqual(b); }
 

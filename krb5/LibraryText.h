@@ -11,7 +11,7 @@
 
 namespace lumio {
 
-/// The library's text if it is UTF-8; nothing if it is null or not UTF-8.
+/// The library's text if it is UTF-8; nullopt if it is null or not UTF-8.
 [[nodiscard]] inline std::optional<std::string> utf8TextOf(const char* text) {
     if (text == nullptr || !adminhost::isUtf8(text)) {
         return std::nullopt;
@@ -19,7 +19,7 @@ namespace lumio {
     return text;
 }
 
-/// Whether the library would read only the beginning of the text.
+/// Returns true if the library would read only the beginning of the text.
 [[nodiscard]] inline bool hasNul(std::string_view text) noexcept {
     return text.find('\0') != std::string_view::npos;
 }
