@@ -45,7 +45,7 @@ constexpr const char* expected =
 /// Whether a failed run says more about the machine at this moment than about the tool.
 bool isPassing(std::int32_t status, std::string_view error) {
     if (status == diedBySignal + SIGKILL) {
-        return true;  // at the deadline, or for want of memory
+        return true;  // at the deadline, or because memory ran out
     }
     for (const int number : {EAGAIN, ENOMEM, EMFILE, ENFILE, ETXTBSY, EINTR}) {
         if (error.find(std::strerror(number)) != std::string_view::npos) {
@@ -106,7 +106,7 @@ Probe DatabaseTool::probe() {
 }
 
 adminhost::ToolFile databaseToolStartFile() {
-    // The answers to the settings themselves must not end up among the rows.
+    // The output of these settings themselves must not end up among the rows.
     return {"sqlite3/sqliterc",
             ".output /dev/null\n"
             ".dbconfig dqs_dml on\n"

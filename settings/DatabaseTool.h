@@ -1,6 +1,6 @@
 #pragma once
 
-// Whether the database tool prints what this plug-in reads.
+// The check of the database tool: whether it prints rows in the form that this plug-in reads.
 
 #include "platform/framework/Plugin.h"
 
@@ -16,10 +16,10 @@ class DatabaseTool {
 
     explicit DatabaseTool(std::string home = homeOfAccount()) : _home(std::move(home)) {}
 
-    /// Unusable while the account has a start file of the tool: it can change what every run prints, also when it
-    /// appears later, so it is looked for each time. Otherwise the tool is tried once, with a statement whose output is
-    /// known; that it is usable is kept, every other result is found out again. Without a database file nothing needs
-    /// the tool, and it is not tried.
+    /// Unusable while the account has a start file of the tool: it can change the output of every run, also if it is
+    /// created later, so it is looked for each time. Otherwise the tool is tried once, with a statement whose output is
+    /// known. The result "usable" is kept; after any other result the tool is tried again. If there is no database
+    /// file, no command needs the tool, and it is not tried.
     [[nodiscard]] adminhost::Probe probe();
 
   private:

@@ -22,7 +22,7 @@ class Lines {
     }
 
     [[nodiscard]] std::size_t count() const noexcept { return _begins.size() - 1; }
-    /// Whether there is text behind the last line feed.
+    /// Returns true if there is text after the last line feed.
     [[nodiscard]] bool isCut() const noexcept { return _begins.back() != _output.size(); }
     [[nodiscard]] std::string_view operator[](std::size_t i) const noexcept {
         return _output.substr(_begins[i], _begins[i + 1] - 1 - _begins[i]);
@@ -111,7 +111,7 @@ std::vector<std::string_view> valuesOf(const Lines& lines, std::size_t begin, st
             starts.push_back(begin + i);
         }
     } else {
-        // ways[j]: in how many ways the lines so far can end within column j; 2 stands for more than one.
+        // ways[j]: in how many ways the lines so far can end within column j; 2 means more than one.
         std::vector<unsigned> ways(prefixes.size(), 0);
         struct Candidate {
             std::size_t line;

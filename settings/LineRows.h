@@ -8,7 +8,7 @@
 // name of the first column behind an empty line.
 //
 // A value may hold lines that look exactly like a column. A row whose lines can be divided among the columns in more
-// than one way, or in none, is returned without values: what it says is not known. A value that spells out the rest of
+// than one way, or in none, is returned without values: its content is not known. A value that spells out the rest of
 // its row and whole rows after it cannot be told from those rows by their text.
 
 #include <cstddef>
@@ -22,7 +22,7 @@ namespace lumio {
 
 struct LineRow {
     std::size_t line = 0;                  ///< index of the row's first line in the output
-    std::size_t end = 0;                   ///< index of the line behind its last one
+    std::size_t end = 0;                   ///< index of the line after its last one
     std::vector<std::string_view> values;  ///< in the columns' order, part of the output; empty if not known
 
     friend bool operator==(const LineRow&, const LineRow&) = default;

@@ -40,8 +40,8 @@ std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
     if (output.empty()) {
         return records;
     }
-    // Every row is closed by an empty line; the last row's is the empty element behind the final line feed. An output
-    // that does not end in a line feed therefore loses its last row, which the tool never printed whole.
+    // Every row ends with an empty line; the last row's is the empty element after the final line feed. An output that
+    // does not end in a line feed therefore loses its last row, which the tool never printed whole.
     Dictionary pending;
     for (std::size_t begin = 0; begin <= output.size();) {
         const std::size_t end = std::min(output.find('\n', begin), output.size());

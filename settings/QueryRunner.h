@@ -21,18 +21,19 @@ namespace lumio {
 /// that begins with a hyphen is a failure with code 1 and runs no tool, which would read it as an option.
 [[nodiscard]] adminhost::Result<std::string> statementOutput(const std::string& statement);
 
-/// Runs the statement likewise. The rows in output order, each a dictionary of texts
-/// by column name (NULL is the empty text); empty for a statement that prints nothing. Null when the tool fails, and
-/// only then the error is written. Rows printed before a failure are dropped.
+/// Runs the statement likewise. Returns the rows in output order, each a dictionary of texts by column name (NULL is
+/// the empty text); empty if the statement prints nothing. Returns null if the tool fails, and writes the error only
+/// then. Rows printed before a failure are dropped.
 [[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> runStatement(const std::string& statement,
                                                                              std::optional<adminhost::Error>& error);
 
-/// The tool's run for the statement.
+/// The plan of the tool's run for the statement.
 [[nodiscard]] adminhost::TaskPlan planOf(const std::string& statement);
 /// What runStatement() returns for the result of that run.
 [[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> rowsOf(const adminhost::TaskResult& result,
                                                                        std::optional<adminhost::Error>& error);
-/// The failure of a listing whose database does not exist. Listings look first: the tool would create an empty file.
+/// The failure of a listing whose database does not exist. Listings check first, because the tool would create an empty
+/// file.
 [[nodiscard]] adminhost::Error missingDatabase();
 
 /// The rows in the tool's line output.

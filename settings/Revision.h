@@ -7,9 +7,9 @@
 
 namespace lumio {
 
-/// Digest of the four settings files as they load and of the resources' columns that administrators change (what
-/// cameras and jobs are doing at the moment plays no part). It guards administrators against each other: the service
-/// itself may change its files and its database at any time, also between a comparison and the write that follows it.
+/// Digest of the four settings files as they load and of the resources' columns that administrators change (the present
+/// activity of cameras and jobs is not part of it). It guards administrators against each other: the service itself may
+/// change its files and its database at any time, also between a comparison and the write that follows it.
 [[nodiscard]] std::string settingsRevision();
 
 }  // namespace lumio

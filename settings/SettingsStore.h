@@ -3,7 +3,7 @@
 // Where the service keeps its settings and its database, and the loaders of its four settings files.
 //
 // Nothing is cached: every call reads the disk again. No operation reports an error: a file that cannot be read or
-// parsed, or whose top level is no dictionary, counts as missing, and the database path always has an answer.
+// parsed, or whose top level is not a dictionary, counts as missing, and there is always a database path.
 
 #include "platform/files/Path.h"
 #include "platform/value/Result.h"
@@ -20,8 +20,8 @@ class SettingsStore {
     static constexpr std::string_view defaultSharedFilesystem = "/Library/SorvaneProducer/Shared";
     static constexpr std::string_view stateDirectory = "/var/lumio/server";
 
-    /// The identity preferences' "shared_filesystem" as it stands there, never normalised; without it the default
-    /// shared file system.
+    /// The identity preferences' "shared_filesystem" exactly as stored, never normalised; the default shared file
+    /// system if it is not set.
     [[nodiscard]] static std::string sharedFilesystemPath();
     /// The identity preferences' "member_uuid".
     [[nodiscard]] static std::optional<std::string> memberUUID();
@@ -38,16 +38,16 @@ class SettingsStore {
     /// As memberPreferences.
     [[nodiscard]] static std::optional<adminhost::Dictionary> clusterPreferences();
 
-    // For a write, which must not take a file that could not be read for one that does not exist.
+    // For a write, which must not treat a file that could not be read as one that does not exist.
 
     /// Loads a settings file. Returns nullopt if it does not exist; fails, with the reason, if it exists but cannot be
     /// read or parsed, or is not a dictionary.
     [[nodiscard]] static adminhost::Result<std::optional<adminhost::Dictionary>> stored(
         const adminhost::HostPath& path);
-    /// The same for the identity preferences, which the service may be rewriting at this moment: looks a second and a
+    /// The same for the identity preferences. The service may be rewriting them at this moment: tries a second and a
     /// third time, 50 ms apart, before it fails.
     [[nodiscard]] static adminhost::Result<std::optional<adminhost::Dictionary>> storedIdentity();
-    // The places that these identity preferences name, so that one reading decides on all of a write.
+    // The places that these identity preferences name, so that a write reads them once for all decisions.
     [[nodiscard]] static adminhost::HostPath memberPreferencesPath(
         const std::optional<adminhost::Dictionary>& identity);
     [[nodiscard]] static adminhost::HostPath clusterPreferencesPath(
@@ -56,9 +56,9 @@ class SettingsStore {
     [[nodiscard]] static adminhost::HostPath cachedClusterPreferencesPath();
 
     /// The service's database file: the production entry of the location file, else "Server/db.sqlite3" on the shared
-    /// file system. A relative path is returned as it stands. A location file above 1 MiB counts as unreadable.
+    /// file system. A relative path is returned unchanged. A location file above 1 MiB counts as unreadable.
     [[nodiscard]] static adminhost::HostPath dbPath();
-    /// Whether a file system entry exists at dbPath.
+    /// Returns true if a file system entry exists at dbPath.
     [[nodiscard]] static bool dbPathExists();
 };
 

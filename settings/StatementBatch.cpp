@@ -16,7 +16,7 @@ using adminhost::TaskResult;
 namespace {
 
 constexpr std::size_t mostAtOnce = 8;
-constexpr std::size_t mostUntaken = 64;  ///< results that wait for their turn: each holds memory
+constexpr std::size_t mostUntaken = 64;  ///< results kept until their turn: each holds memory
 /// SQLite's "database is locked". The last reader of a WAL database may meet it when it closes the file, which a
 /// statement that runs by itself never does.
 constexpr std::int32_t locked = 5;

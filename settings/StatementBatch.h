@@ -2,8 +2,8 @@
 
 // Independent statements of one listing, several of them running at a time.
 //
-// The results are those of runStatement() for each statement in turn, and are handed out in that order. As many tools
-// run at once as there are processors, at most 8, and at most 64 results wait to be taken. All share the request's
+// The results are those of runStatement() for each statement in turn, and are returned in that order. As many tools run
+// at once as there are processors, at most 8. At most 64 results are kept until their turn. All share the request's
 // deadline and one bound on captured bytes. With one statement or one processor the tools run one after the other.
 
 #include "platform/task/TaskGroup.h"
@@ -33,7 +33,7 @@ class StatementBatch {
     std::vector<std::string> _statements;
     std::size_t _atOnce;
     std::vector<adminhost::TaskGroup::Id> _tasks;  ///< of the statements that were started, in their order
-    std::size_t _next = 0;                         ///< the statement whose result is handed out next
+    std::size_t _next = 0;                         ///< the statement whose result is returned next
     adminhost::TaskGroup _group;
 };
 
