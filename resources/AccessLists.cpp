@@ -147,7 +147,7 @@ std::vector<std::string> Resource::uuidsIn(const std::optional<std::vector<Dicti
     logUnusableId();
     if (!rows) {
         adminhost::logEvent("getUserAndGroupACLs SQL query returned error: " + textOf(error));
-        // The answer shows an empty list: without a report a client would take it for one.
+        // The response shows an empty list: without a report, a client would believe that it is one.
         adminhost::reportNotDone({"", "an access list cannot be read", textOf(error)});
         return {};
     }

@@ -10,7 +10,7 @@ namespace lumio {
 
 class Camera final : public ResourceClass<Camera> {
   public:
-    /// Every enabled camera, without its access list (dictionary() expands it); nothing, with the error, on failure.
+    /// Every enabled camera, without its access list (dictionary() expands it); nullopt, with the error, on failure.
     [[nodiscard]] static std::optional<std::vector<std::unique_ptr<Camera>>> allCamerasWithError(
         std::optional<adminhost::Error>& error);
 

@@ -280,7 +280,7 @@ std::optional<Error> Property::write() {
         working.set("created_at", now);
     }
     if (isUpdate && !id) {
-        // No row matches, and arguments are open to everyone on the machine.
+        // No row matches, and every process on the machine can read a tool's arguments.
         cleanseValue(working);
         working.remove("value");
     }
@@ -290,7 +290,7 @@ std::optional<Error> Property::write() {
     static_cast<void>(querySorvaneDatabase(statement, failure));
     if (failure) {
         if (deciphered) {
-            // The tool quotes the statement, and with it a value that stays protected now.
+            // The tool quotes the statement, which contains a value that stays protected in this case.
             failure->description = withoutSecret(*failure->description, textOf(working.get("value")), statement);
         }
         reportNotDone("", "the property was not written: the database refused it", toolWords(*failure));
@@ -371,7 +371,7 @@ void Property::reportWritten(const Dictionary& working, bool isProtected) const 
         const std::string before = adminhost::utf8Of(textOf(stored(key)));
         const std::string now = textOf(_changeValues->get(key));
         if (before != now) {
-            // A text that no statement can carry cannot be sent back.
+            // A text that cannot be part of a statement cannot be sent back.
             reportChange(*id, key, before, now,
                          whyUnfitForStatement(before) ? Dictionary() : Dictionary{{key, before}});
         }

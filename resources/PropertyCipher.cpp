@@ -45,7 +45,7 @@ std::optional<Data> keyEncryptionKey() {
         return std::nullopt;
     }
     Data key = base64DecodedData(*secret);
-    // The file's values are this function's own, and not to be seen after it.
+    // These are copies of the file's values; they must not stay in memory.
     adminhost::cleanse(const_cast<char*>(secret->data()), secret->size());
     return key;
 }

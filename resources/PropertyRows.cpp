@@ -30,7 +30,7 @@ bool isColumn(const std::string& name) {
 struct Reading {
     Names columns;  ///< those of the properties table
     std::vector<LineRow> rows;
-    Names further;  ///< other names that every row has a line of
+    Names further;  ///< other names for which every row has a line
 };
 
 Reading readingOf(const std::string& output) {
@@ -55,7 +55,7 @@ bool idsAreDifferent(const Reading& reading) {
 
 /// Whether the output can be read in one way only.
 bool isCertain(const Reading& reading, const std::string& output) {
-    // A name that every row has a line of may be a further column of the table.
+    // A name for which every row has a line may be a further column of the table.
     return reading.further.empty() && output.ends_with('\n') &&
            output.find(replacementCharacter) == std::string::npos && !reading.rows.empty() &&
            std::none_of(reading.rows.begin(), reading.rows.end(),

@@ -4,7 +4,7 @@
 //
 // A resource lives for one request. Its record comes from a query (initWithDictionary) or, for a resource known only by
 // its UUID, from the database on the first use of data(). Changes go to the database or the configuration tool at once
-// and are not reflected in the record. Operations named init... answer a new object that the caller owns.
+// and are not reflected in the record. Operations named init... return a new object that the caller owns.
 
 #include "platform/value/Result.h"
 #include "platform/value/Value.h"
@@ -31,21 +31,21 @@ class Resource {
     Resource& operator=(const Resource&) = delete;
     virtual ~Resource() = default;
 
-    // Objects of the base class itself, whose type word names no table. Each class below has its own.
+    // Objects of the base class itself, whose type word does not name a table. Each class below has its own.
     [[nodiscard]] static std::unique_ptr<Resource> init() { return std::make_unique<Resource>(); }
     [[nodiscard]] static std::unique_ptr<Resource> initWithGUID(std::optional<std::string> guid);
     [[nodiscard]] static std::unique_ptr<Resource> initWithDictionary(adminhost::Dictionary row);
-    /// Always a plain Resource, whichever class it is asked through. That is deliberate.
+    /// Always returns a plain Resource, also if called through a derived class. That is deliberate.
     [[nodiscard]] static std::unique_ptr<Resource> resourceWithDictionary(adminhost::Dictionary dictionary);
     /// Does nothing.
     static void initialize() {}
-    /// The bundle's strings table of that name in the best of the preferred languages, else in "English"; nothing if it
+    /// The bundle's strings table of that name in the best of the preferred languages, else in "English"; nullopt if it
     /// has none, or if the first one found cannot be read.
     [[nodiscard]] static std::optional<adminhost::Dictionary> localizationsForResourceNamed(
         std::string_view name, const adminhost::Bundle& bundle, const std::vector<std::string>& preferredLanguages);
 
     /// Runs a statement; each row becomes an object of the result class: Dictionary, or a class with
-    /// initWithDictionary. Null, and only then an error, when the tool fails (QueryRunner.h).
+    /// initWithDictionary. Returns null, and sets the error, only if the tool fails (QueryRunner.h).
     template <class ResultClass>
     [[nodiscard]] static auto querySorvaneDatabase(const std::string& statement,
                                                    std::optional<adminhost::Error>& error) {
@@ -62,26 +62,26 @@ class Resource {
         return querySorvaneDatabase<Resource>(statement, error);
     }
 
-    /// The UUID that the resource was made with, else the record's "uuid".
+    /// The UUID that the resource was created with, else the record's "uuid".
     [[nodiscard]] const std::optional<std::string>& guid();
     void setGuid(std::optional<std::string> guid) {
         _guid = std::move(guid);
         _guidIsTheRecords = false;
     }
-    /// Where the request has the change entry ("configuration.cameras.0"), for the reports of what was not done.
+    /// The key path of the change entry in the request ("configuration.cameras.0"), for the reports of parts not done.
     void setKeyPath(std::string keyPath) { _keyPath = std::move(keyPath); }
-    /// The record; if there is none yet, the row of the UUID, raw (dates as text, no "_id_"), when the database has
+    /// The record. If there is none yet, loads the row of the UUID, raw (dates as text, no "_id_"), if the database has
     /// exactly one. Null otherwise; the next call tries again.
     [[nodiscard]] const adminhost::Dictionary* data();
-    /// Replaces the record; nothing clears it.
+    /// Replaces the record; nullopt clears it.
     void setData(std::optional<adminhost::Dictionary> data) {
         _data = std::move(data);
         _rawIdentity.reset();
     }
-    /// The record as administrators see it, or null: with its access list expanded, which happens once. A missing
-    /// record is not loaded for it.
+    /// The record as administrators see it, with its access list expanded, which happens once. Null if there is no
+    /// record: it is not loaded for this.
     [[nodiscard]] virtual const adminhost::Dictionary* dictionary();
-    /// Expands the access lists of all these resources as dictionary() does, several queries at a time. Answers and log
+    /// Expands the access lists of all these resources as dictionary() does, several queries at a time. Results and log
     /// lines are in the order of the resources. None of them may have been expanded before.
     static void expandAll(const std::vector<Resource*>& resources);
     template <class Class>
@@ -95,28 +95,28 @@ class Resource {
     }
     /// The same without a copy, for a resource that is not needed any more.
     [[nodiscard]] std::optional<adminhost::Dictionary> takeDictionary() &&;
-    /// "CLASS - guid: UUID, " and the record from the next line on: the fields as they stand, nothing is loaded.
+    /// "CLASS - guid: UUID, " and the record from the next line on. Shows the present fields and loads nothing.
     [[nodiscard]] std::string description() const;
 
     /// The type word: "" here, "workflow", "camera" or "property" below.
     [[nodiscard]] virtual std::string_view resourceType() const noexcept { return ""; }
-    /// Removes the resource. Nothing happens here, and no error is reported.
+    /// Removes the resource. The base class does nothing and reports no error.
     [[nodiscard]] virtual std::optional<adminhost::Error> delete_() { return std::nullopt; }
 
     // Access control (AccessLists.cpp)
 
-    /// Whether access control is on, by the record if there is one (none is loaded), else as last set.
+    /// Returns true if access control is on: by the record if there is one (none is loaded), else as last set.
     [[nodiscard]] bool aclEnabled();
     /// Switches access control on or off in the database; needs a UUID. A failure is dropped without a message.
     void setACLEnabled(bool enabled);
     /// The UUIDs of the access list in row order, duplicates kept. A failure is logged and gives an empty list.
     [[nodiscard]] std::vector<std::string> getUserAndGroupACLs();
     /// Adds and removes people and groups with the service's configuration tool, one run for each kind of change.
-    /// Entries that cannot be understood or resolved are skipped; an addition without "shortName" ends it before any
-    /// run.
+    /// Entries that cannot be understood or resolved are skipped. An addition without "shortName" ends the operation
+    /// before any run.
     void changeACLsWithRequest(const adminhost::Array* entries);
-    /// Runs the configuration tool for the names, if there are any. A tool that fails is an error with its exit status
-    /// and its words, which is for reports alone: answers do not depend on it.
+    /// Runs the configuration tool for the names, if there are any. If the tool fails, the error has its exit status
+    /// and output. The error is for reports alone: responses do not depend on it.
     std::optional<adminhost::Error> _executeLumioConfigWithCommand(std::string_view command,
                                                                    std::string_view resourceType,
                                                                    std::string_view resourceID,
@@ -133,8 +133,8 @@ class Resource {
     [[nodiscard]] adminhost::Value objectInAllowedGroupsAtIndex(std::size_t index) const;
 
   protected:
-    /// Adds "useUser" and "allowedUsersAndGroups" to the record and makes its access switch a boolean. Works on the
-    /// record as it stands: run a second time it would take the boolean true for a text other than "t".
+    /// Adds "useUser" and "allowedUsersAndGroups" to the record and makes its access switch a boolean. Must run once
+    /// only: a second run would read the boolean true as a text other than "t".
     void expandACLs();
     // Its steps, with the statement that is run between them.
     void expandColumns();
@@ -142,8 +142,8 @@ class Resource {
     [[nodiscard]] std::vector<std::string> uuidsIn(const std::optional<std::vector<adminhost::Dictionary>>& rows,
                                                    const std::optional<adminhost::Error>& error) const;
     void expandList(const std::vector<std::string>& uuids);
-    /// The directory's entries for the UUIDs, of one record type or of people and groups. A failing directory is told
-    /// on standard output and gives an empty list.
+    /// The directory's entries for the UUIDs, of one record type or of people and groups. If the directory fails,
+    /// prints that on standard output and returns an empty list.
     [[nodiscard]] static std::vector<adminhost::Dictionary> getDirectoryDetailsForUUIDs(
         const std::vector<std::string>& uuids, std::optional<std::string_view> recordType = std::nullopt);
     [[nodiscard]] static std::vector<adminhost::Dictionary> getUserDetailsForUUIDs(
@@ -154,22 +154,22 @@ class Resource {
     [[nodiscard]] virtual std::string_view className() const noexcept { return "Resource"; }
     /// The columns whose local times become dates when a row is read.
     [[nodiscard]] virtual std::vector<std::string_view> listOfResourceDateKeys() const;
-    /// What initWithDictionary does with the row.
+    /// The part of initWithDictionary that reads the row.
     virtual void readRow(adminhost::Dictionary row);
 
-    // What a database row says about itself is no more trustworthy than the names in it: only these go into statements
-    // and tool arguments.
+    // The columns of a database row are no more trustworthy than the names in it: only these go into statements and
+    // tool arguments.
 
-    /// The record's "id" if it is decimal digits, as the raw text of the tool's output has it.
+    /// The record's "id" if it is decimal digits, as in the raw text of the tool's output.
     [[nodiscard]] std::optional<std::string> rowId() const;
     /// Logs a record whose id is not a number.
     void logUnusableId() const;
-    /// The UUID: one that was given as it is, the record's if it is an identifier (letters, digits, hyphens); else null
-    /// after a log line.
+    /// The UUID: one that was given is returned unchanged, the record's only if it is an identifier (letters, digits,
+    /// hyphens); else null after a log line.
     [[nodiscard]] std::optional<std::string> statementGuid();
 
-    /// The objects of a statement's rows. The columns, in the statement's order, tell the rows' identities from what
-    /// their values look like; without them they are inferred from the output.
+    /// The objects of a statement's rows. The columns, in the statement's order, separate the rows' identities from
+    /// values that look like them; without columns they are inferred from the output.
     template <class ResultClass>
     [[nodiscard]] static std::optional<std::vector<std::unique_ptr<ResultClass>>> resourcesOf(
         const std::string& statement, std::span<const std::string> columns, std::optional<adminhost::Error>& error) {
@@ -186,7 +186,7 @@ class Resource {
         return results;
     }
 
-    /// "id" and "uuid" as the raw text of the tool's output has them; null where they are not known.
+    /// "id" and "uuid" as in the raw text of the tool's output; null if they are not known.
     struct RawIdentity {
         std::optional<std::string> id;
         std::optional<std::string> uuid;
@@ -199,11 +199,11 @@ class Resource {
                                                                std::span<const std::string> columns,
                                                                std::optional<adminhost::Error>& error);
 
-    // Reports (platform/framework/Report.h). The record is not loaded for them: what it does not say stays null.
+    // Reports (platform/framework/Report.h). The record is not loaded for them: fields that it does not have stay null.
 
     /// Reports a part of the change entry, "" for the whole, as not carried out.
     void reportNotDone(std::string_view key, std::string reason, std::string toolMessage = {}) const;
-    /// Reports a change. The undo is what the entry must hold beside "_id_" to take it back; empty if nothing can.
+    /// Reports a change. The undo is what the entry must hold beside "_id_" to undo it; empty if it cannot be undone.
     void reportChange(std::string_view identity, std::string_view key, adminhost::Value from, adminhost::Value to,
                       adminhost::Dictionary undo) const;
     /// The list in the configuration that resources of this type are in: "cameras".

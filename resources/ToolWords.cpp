@@ -8,7 +8,7 @@ std::string toolWords(std::string_view error, std::string_view output) {
     constexpr std::size_t maximum = 1000;
     std::string_view words = error.find_first_not_of(" \n") == std::string_view::npos ? output : error;
     words = words.substr(0, words.find_last_not_of(" \n") + 1);
-    // A character that the bound cuts is left out.
+    // A character that the bound would cut is left out.
     std::size_t length = std::min(words.size(), maximum);
     while (length < words.size() && length > 0 && (static_cast<unsigned char>(words[length]) & 0xC0U) == 0x80U) {
         --length;

@@ -1,6 +1,6 @@
 #pragma once
 
-// A tool's own words, for reports.
+// A tool's own error text, for reports.
 
 #include "platform/value/Error.h"
 
@@ -9,9 +9,9 @@
 
 namespace lumio {
 
-/// What a tool printed as its error, else its output, without line feeds at the end and in at most 1000 bytes.
+/// The error output of a tool, else its output, without line feeds at the end and in at most 1000 bytes.
 [[nodiscard]] std::string toolWords(std::string_view error, std::string_view output);
-/// What the database tool printed, by the description of a failed statement.
+/// The output of the database tool, from the description of a failed statement.
 [[nodiscard]] std::string toolWords(const adminhost::Error& error);
 
 }  // namespace lumio

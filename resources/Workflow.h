@@ -2,7 +2,7 @@
 
 // Workflows: rows of the workflows table, each with a bundle on the shared file system that holds its texts.
 //
-// A bundle is on a file system that others write to. It is read with bounds, and outside the system root it counts as
+// A bundle is on a file system that others write to. Reads are bounded, and a bundle outside the system root counts as
 // missing. Missing or unreadable parts are not an error: texts fall back until they are empty.
 
 #include "platform/bundle/Bundle.h"
@@ -24,7 +24,7 @@ class Workflow final : public ResourceClass<Workflow> {
     /// The directory that "bundle_path" names below the shared file system, also if it begins with "/"; the empty text
     /// names the shared file system itself. Expands the access list if that has not happened.
     [[nodiscard]] std::optional<adminhost::Bundle> bundle();
-    /// The information file, read afresh by every call.
+    /// The information file; every call reads it again.
     [[nodiscard]] std::optional<adminhost::Dictionary> uncachedInfoDictionary();
     /// The bundle's texts in the best of the languages (names or codes, most preferred first), else in English.
     [[nodiscard]] std::optional<adminhost::Dictionary> localizedStrings(const std::vector<std::string>& languages);
@@ -35,7 +35,7 @@ class Workflow final : public ResourceClass<Workflow> {
     [[nodiscard]] std::string_view className() const noexcept override { return "Workflow"; }
 
   private:
-    /// The information file's value under the key, the empty text if there is none.
+    /// The information file's value under the key; the empty text if it has none.
     [[nodiscard]] adminhost::Value information(std::string_view key);
 };
 
