@@ -1,6 +1,6 @@
 #pragma once
 
-// How long the grid controller's address is waited for.
+// The bounded wait for the grid controller's address.
 
 #include <chrono>
 

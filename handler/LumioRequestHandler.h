@@ -2,9 +2,9 @@
 
 // The request handler: the operations through which administrators reach the service.
 //
-// An operation that serves a command has the command's name followed by WithRequest. It blocks until its answer is
-// built and reports failure inside the answer. Nothing is kept between requests. Every diagnostic
-// line starts with "adminhost_lumio: ". Each operation is written in the source file of its group.
+// An operation that serves a command has the command's name followed by WithRequest. It blocks until its response is
+// built and reports failure in that response. Nothing is kept between requests. Every diagnostic line starts with
+// "adminhost_lumio: ". Each operation is in the source file of its group.
 
 #include "platform/framework/PluginRequestHandler.h"
 #include "platform/value/Error.h"
@@ -24,11 +24,11 @@ class NetService;
 
 namespace lumio {
 
-/// What a failed settings write answers.
+/// The error of a failed settings write.
 struct SettingsWriteError {
     std::string domain;  ///< always empty
     std::int64_t code = 400;
-    adminhost::Error underlying;  ///< what serialising or writing said; its description is the administrator's text
+    adminhost::Error underlying;  ///< of serialising or writing; its description is the text for administrators
 };
 
 class LumioRequestHandler : public adminhost::PluginRequestHandler, public SettingsStore {
@@ -43,8 +43,9 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     /// "readStatus", the preferences setup script's status, and "configuration", narrowed by
     /// "optionalArguments.variant".
     [[nodiscard]] Response readSettingsWithRequest(const Dictionary& request);
-    /// Applies "configuration" and answers what a read then answers, with "readStatus" 0, "writeStatus" and, when they
-    /// apply, "errorDescription" and "needsRecycleOrRestart". Resource changes are applied whatever the write status.
+    /// Applies "configuration" and returns what a read would now return, with "readStatus" 0, "writeStatus" and, if
+    /// they apply, "errorDescription" and "needsRecycleOrRestart". Resource changes are applied whatever the write
+    /// status.
     [[nodiscard]] Response writeSettingsWithRequest(const Dictionary& request);
 
     // Service state and control; the variant may be null
@@ -53,7 +54,7 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     [[nodiscard]] Response getLogPathsWithRequest(const Dictionary& request);
     [[nodiscard]] Response startServiceWithVariant(const Value& variant);
     [[nodiscard]] Response stopServiceWithVariant(const Value& variant);
-    /// Does nothing and answers nothing.
+    /// Does nothing and returns no response.
     [[nodiscard]] Response recycleServiceWithVariant(const Value& variant);
     [[nodiscard]] Response validateSettingsWithRequest(const Dictionary& request);
     [[nodiscard]] Response createNimboAccountWithRequest(const Dictionary& request);
@@ -64,7 +65,7 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     [[nodiscard]] Response getWorkflowsWithRequest(const Dictionary& request);
     [[nodiscard]] Response getCamerasWithRequest(const Dictionary& request);
     [[nodiscard]] Response getPropertiesWithRequest(const Dictionary& request);
-    // Each applies an array of change records, entry by entry; null does nothing. The answer is nothing.
+    // Each applies an array of change records, entry by entry; null does nothing. They return no response.
     Response setWorkflowACLWithRequest(const Array* changes);
     Response processCameraChangesWithRequest(const Array* changes);
     Response processPropertyChangesWithRequest(const Array* changes);
@@ -76,10 +77,10 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     void copyClusterPreferencesToConfig(Dictionary& config) const;
     void copyMemberPreferencesToConfig(Dictionary& config) const;
     void copyLibraryInformationToConfig(Dictionary& config) const;
-    /// The grid client's password in plain text; nothing if it is not set or cannot be deciphered.
+    /// The grid client's password in plain text; nullopt if it is not set or cannot be deciphered.
     [[nodiscard]] static std::optional<std::string> nimboClientPasswordFromPrefs(const Dictionary& prefs);
-    /// Stores each value that the source has under one of the keys; a key the source lacks leaves the destination as it
-    /// is.
+    /// Stores each value that the source has under one of the keys. A key that the source lacks leaves the destination
+    /// unchanged.
     static void copyKeys(const std::vector<std::string_view>& keys, const Dictionary& source, Dictionary& destination);
     // The keys that are read from, and written to, each file. The library's are only read.
     [[nodiscard]] static std::vector<std::string_view> identityPreferencesKeysToCopy();
@@ -92,25 +93,25 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
 
     // Pieces of writing settings
 
-    // Each runs the service's setup script of that name; its output is dropped. Its exit status, 0 on success.
+    // Each runs the service's setup script of that name and drops its output. Returns its exit status, 0 on success.
     [[nodiscard]] std::int32_t setupPreferences() const;
     [[nodiscard]] std::int32_t setupLibrary() const;
-    // Each writes its file's share of the configuration. 0, or the status of the write; then "errorDescription" stands
-    // in the result. "needsRecycleOrRestart" is set there when the change needs it, also before a write that fails. The
-    // password leaves the configuration, and is stored only in its protected form.
+    // Each writes its file's share of the configuration. Returns 0, or the status of a failed write, and then sets
+    // "errorDescription" in the result. Sets "needsRecycleOrRestart" there if the change needs it, also before a write
+    // that fails. The password is removed from the configuration, and is stored only in its protected form.
     [[nodiscard]] std::int32_t setIdentityPreferencesFromConfig(Dictionary& config, Dictionary& result);
     [[nodiscard]] std::int32_t setClusterPreferencesFromConfig(Dictionary& config, Dictionary& result);
     [[nodiscard]] std::int32_t setMemberPreferencesFromConfig(Dictionary& config, Dictionary& result);
-    // Each replaces its file atomically (platform/plist). One that stands there and cannot be loaded is kept beside it.
+    // Each replaces its file atomically (platform/plist). A file that cannot be loaded is kept beside the new one.
     [[nodiscard]] std::optional<SettingsWriteError> writeIdentityPreferences(const Dictionary& prefs);
     [[nodiscard]] std::optional<SettingsWriteError> writeClusterPreferences(const Dictionary& prefs);
     [[nodiscard]] std::optional<SettingsWriteError> writeMemberPreferences(const Dictionary& prefs);
-    /// Makes the setup-done marker, and its directory, if it is missing. Failures are logged.
+    /// Creates the setup-done marker, and its directory, if it is missing. Failures are logged.
     void markSetupDone();
-    /// Whether the setup-done marker exists.
+    /// Returns true if the setup-done marker exists.
     [[nodiscard]] bool checkSetupDone() const;
     /// Resolves the grid controller's DNS-SD name to the host name of its first address (ControllerName.cpp), within
-    /// about ten seconds. A failure is logged where the resolver or the lookup reported it; the error says why.
+    /// about ten seconds. A failure is logged where the resolver or the look-up reported it; the error has the reason.
     [[nodiscard]] adminhost::Result<std::string> hostNameOfController(const std::string& name);
     // The resolver's callbacks, made on the calling thread while hostNameOfController waits.
     void netService(const adminhost::NetService& service, const Dictionary& didNotResolve);
@@ -120,10 +121,11 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     [[nodiscard]] static std::vector<std::string_view> listOfResourceDateKeys();
 
   private:
-    /// Runs the setup scripts and writes the three files, up to the first step that fails. Its status.
+    /// Runs the setup scripts and writes the three files, up to the first step that fails. Returns the status of the
+    /// last step.
     [[nodiscard]] std::int32_t writeSettingsFiles(Dictionary& config, Dictionary& result);
 
-    /// What the resolver said in its most recent did-not-resolve callback.
+    /// The dictionary of the resolver's most recent did-not-resolve callback.
     std::optional<Dictionary> mBJError;
 };
 

@@ -64,7 +64,7 @@ Response LumioRequestHandler::readSettingsWithRequest(const Dictionary& request)
         copyMemberPreferencesToConfig(config);
         copyLibraryInformationToConfig(config);
     }
-    // The tool would make a missing database file, so nothing below may touch it before it is known to exist.
+    // The tool would create a missing database file, so it must not run before the file is known to exist.
     if (dbPathExists()) {
         if (all || variantIs("getCameras")) {
             moveList(getCamerasWithRequest(request), "cameras", config);
