@@ -13,7 +13,7 @@ struct DaemonReply {
     long status = 0;
     std::string body;
     std::string requestId;  ///< the daemon's name for the request; empty if it gave none
-    std::string revision;   ///< of what was read, as the ETag header gives it; empty if it gave none
+    std::string revision;   ///< of the state that was read, from the ETag header; empty without that header
     bool notDone = false;   ///< parts of the request were not carried out, or were ignored
 };
 
@@ -23,16 +23,15 @@ class LostConnection : public Failure {
     using Failure::Failure;
 };
 
-/// What a request that may change something is sent with.
+/// Headers of a request that may change something.
 struct PostHeaders {
     std::string requestId;  ///< a UUID of the client's choice; empty: the daemon chooses
     std::string revision;  ///< the daemon refuses the request (412) unless this is the current one; empty: no condition
 };
 
 /// One connection, kept open between requests. Throws Failure when the daemon cannot be reached (notReachable) or the
-/// socket may not be opened (notPermitted), and LostConnection from post() when the connection ends without an answer
-/// or isInterrupted() becomes true meanwhile. Waits for an answer as long as the daemon takes: the daemon bounds
-/// requests.
+/// socket may not be opened (notPermitted). post() throws LostConnection when the connection ends without an answer or
+/// isInterrupted() becomes true before the answer. There is no time limit here, because the daemon limits requests.
 class Connection {
   public:
     explicit Connection(std::string socketPath);

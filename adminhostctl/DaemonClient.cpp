@@ -77,7 +77,7 @@ std::vector<const Dictionary*> dictionariesAt(const Dictionary& dictionary, std:
     return all;
 }
 
-/// What an answer that is an error says, with its findings.
+/// The message of an error answer, with its findings.
 std::string messageOf(const DaemonReply& reply) {
     const auto body = parseJson(reply.body);
     const Dictionary* said = body ? body->dictionary() : nullptr;

@@ -1,6 +1,6 @@
 #pragma once
 
-// The daemon, as the verbs use it: its plug-ins and commands, their answers, and what became of a request.
+// The daemon as the verbs use it: its plug-ins and commands, their answers, and the outcome of a request.
 
 #include "adminhostctl/Connection.h"
 #include "adminhostctl/Description.h"
@@ -45,7 +45,7 @@ struct ReportedGap {
     std::string toolMessage;
 };
 
-/// What the daemon knows of a request.
+/// The daemon's record of a request.
 struct RequestReport {
     enum class State {
         waiting,
@@ -57,7 +57,7 @@ struct RequestReport {
     State state = State::unknown;
     std::vector<ReportedChange> changes;
     std::vector<ReportedGap> notDone;
-    std::uint64_t changesDropped = 0;  ///< happened and are not listed
+    std::uint64_t changesDropped = 0;  ///< changes that were applied and are not listed
     std::uint64_t notDoneDropped = 0;
     std::vector<std::string> log;
 };
@@ -86,24 +86,25 @@ class DaemonClient {
   public:
     explicit DaemonClient(std::string socketPath) : _connection(std::move(socketPath)) {}
 
-    /// What runs now: the daemon's own account of itself.
+    /// The daemon's overview: the running request, how many wait, and the plug-ins.
     [[nodiscard]] Value overview();
     /// Every plug-in with its commands.
     [[nodiscard]] const std::vector<PluginInfo>& plugins();
-    /// The command of that name, "PLUGIN/COMMAND" where two plug-ins have it. Throws Failure(usage) with the known
-    /// ones.
+    /// The command of that name, or "PLUGIN/COMMAND" if two plug-ins have it. Throws Failure(usage), which lists the
+    /// known commands.
     [[nodiscard]] CommandRef command(const std::string& name);
     /// The command that reads, or writes, the state that a file can describe: state is "read" or "write". Throws
     /// Failure(usage) when no plug-in has one, or several have.
     [[nodiscard]] CommandRef stateCommand(std::string_view state);
-    /// Sends the request once and returns the answer. A request that gives a revision fails unless it is still current.
-    /// Throws Failure with the daemon's message, its findings and, after a failure inside the service, the log lines of
-    /// the request. Where the command changes something and its answer is missing: LostAnswer.
+    /// Sends the request once and returns the answer. A request with a revision fails unless the revision is still
+    /// current. Throws Failure with the daemon's message, its findings and, after a failure inside the service, the log
+    /// lines of the request. Throws LostAnswer if the command may change something and its answer is missing.
     [[nodiscard]] CommandAnswer ask(const CommandRef& command, const Dictionary& request,
                                     const std::string& revision = {});
-    /// What the daemon knows of a request now. A daemon that cannot be asked is a state, not a failure.
+    /// Returns the daemon's current record of a request. A daemon that cannot be reached is a state of the report, not
+    /// a Failure.
     [[nodiscard]] RequestReport report(const std::string& requestId);
-    /// The same, waiting up to ten seconds for a request that is not done, and for a daemon that is not reachable.
+    /// The same, but waits up to ten seconds while the request is not done or the daemon cannot be reached.
     [[nodiscard]] RequestReport settledReport(const std::string& requestId);
 
     /// The JSON value at an address of the daemon. Throws Failure as ask() does.
@@ -116,8 +117,8 @@ class DaemonClient {
     std::optional<std::vector<PluginInfo>> _plugins;
 };
 
-/// The failure in an answer: the keys that the description lists under its errors, unless they are null or the
-/// number 0. One sentence; empty when there is no error.
+/// Returns the failure in an answer as one sentence; empty if there is none. A failure is a key that the description
+/// lists under its errors, unless its value is null or the number 0.
 [[nodiscard]] std::string errorOf(const Description& command, const Dictionary& answer);
 
 }  // namespace adminhost::ctl

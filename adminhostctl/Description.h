@@ -1,6 +1,6 @@
 #pragma once
 
-// A command as the daemon describes it. Nothing about commands is known here beyond this form.
+// A command as the daemon describes it. No command is known here; only this form is.
 
 #include "platform/value/Value.h"
 
@@ -26,19 +26,19 @@ struct DescribedKey {
     // Of a list's element that is a person or a group.
     std::vector<std::string> title;  ///< keys of the element; the first with a text is shown for it
     std::string kind;                ///< key of the element that holds "user", "group", ...
-    // What a state that can be written consists of; empty where it does not apply.
+    // Parts of a state that can be written; empty if they do not apply.
     std::string section;               ///< table of a file: of plain values, of a list's elements
     std::string file;                  ///< of a setting: the settings file that holds it
     std::vector<std::string> locates;  ///< of a setting: files that move when it changes
     std::vector<std::string> restart;  ///< of a setting: commands to run for it to take effect
     std::string lookedUp;              ///< of a setting: which values a write replaces
-    std::string shownBy;               ///< of a secret setting: the key that says whether it is set
+    std::string shownBy;               ///< of a secret setting: the key that shows whether it is set
     std::string identity;              ///< of an element: the key that a write names it by
     std::string label;                 ///< of an element: the key that people name it by
     bool byIdentity = false;           ///< of an element: people may name it by identity too
     std::string addedBy;               ///< of an element: the flag that adds one
     std::string removedBy;             ///< of an element: the flag that removes one
-    std::string unlisted;              ///< of an element: the switch that removes unlisted ones
+    std::string unlisted;              ///< of an element: the switch that removes unlisted elements
     std::vector<std::pair<std::string, std::string>> kinds;  ///< of an element: its name in a file for each kind
     std::string inFile;                                      ///< of an element's key: its name in a file
     std::string secretIf;                                    ///< of an element's key: secret while this key is true
@@ -47,7 +47,7 @@ struct DescribedKey {
 class Description {
   public:
     Description() = default;
-    /// What is missing or of another type than described counts as empty.
+    /// A part that is missing, or has another type than expected, counts as empty.
     explicit Description(const Dictionary& command);
 
     [[nodiscard]] const std::string& name() const noexcept { return _name; }
@@ -55,9 +55,9 @@ class Description {
     [[nodiscard]] const std::string& text() const noexcept { return _text; }
     /// Whether the command may change something: it has another right than reading.
     [[nodiscard]] bool changes() const noexcept { return _changes; }
-    /// "read" or "write" of the one command that reads, or writes, the state; empty for others.
+    /// "read" if the command reads the state, "write" if it writes the state; empty for other commands.
     [[nodiscard]] const std::string& state() const noexcept { return _state; }
-    /// A request that reads only this section of the state; an empty one where the description names none.
+    /// A request that reads only this section of the state; empty if the description has none.
     [[nodiscard]] Dictionary partOf(const std::string& section) const;
     [[nodiscard]] const std::vector<DescribedKey>& keys() const noexcept { return _keys.all; }
     [[nodiscard]] const std::vector<DescribedKey>& answerKeys() const noexcept { return _answer.all; }

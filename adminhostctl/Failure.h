@@ -26,7 +26,7 @@ class Failure : public std::runtime_error {
     ExitStatus _status;
 };
 
-/// What was written on the command line cannot be carried out.
+/// The failure of a command line that cannot be carried out.
 [[nodiscard]] inline Failure usageError(const std::string& message) {
     return {ExitStatus::usage, message};
 }

@@ -1,6 +1,6 @@
 #pragma once
 
-// The verbs that serve every plug-in: what the daemon runs, its commands and their help, who the directory knows.
+// The verbs that serve every plug-in: the daemon's status, its commands and their help, look-ups in the directory.
 
 #include "adminhostctl/Verb.h"
 

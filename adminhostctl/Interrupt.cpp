@@ -3,7 +3,7 @@
 namespace adminhost::ctl {
 namespace {
 
-// A handler can reach nothing but static storage.
+// A signal handler can only reach static storage.
 volatile std::sig_atomic_t remembered = 0;
 bool isGuarded = false;
 void rememberSignal(int number) noexcept {
@@ -16,7 +16,7 @@ InterruptGuard::InterruptGuard() noexcept {
     struct sigaction action {};
     action.sa_handler = &rememberSignal;
     isGuarded = true;
-    // The handler is gone after the first signal: the second one ends the program.
+    // The first signal resets the handler, so that the second one ends the program.
     action.sa_flags = static_cast<int>(SA_RESETHAND);
     sigemptyset(&action.sa_mask);
     for (std::size_t i = 0; i < signals.size(); ++i) {

@@ -21,10 +21,10 @@ class InterruptGuard {
     std::array<struct sigaction, 3> _before{};
 };
 
-/// Whether a signal was remembered while the guard that now exists did.
+/// Returns true if a signal has arrived since the current guard was created.
 [[nodiscard]] bool isInterrupted() noexcept;
 
-/// Ends the program by the signal that was remembered, as the caller of the program expects. Returns if there was none.
+/// Ends the program by the remembered signal, so that its caller sees that signal. Returns if there was none.
 void endIfInterrupted() noexcept;
 
 }  // namespace adminhost::ctl

@@ -14,7 +14,7 @@ namespace {
 
 constexpr mode_t ownersOnly = 0600;
 
-/// The file's own place, without links on the way, which replacing a file does not follow everywhere.
+/// The path of the file itself, without symbolic links: replacing a file does not follow all of them.
 HostPath placeOf(const std::string& path) {
     std::error_code error;
     const fs::path there = fs::canonical(path, error);

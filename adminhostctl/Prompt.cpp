@@ -22,14 +22,15 @@ struct CloseFile {
     void operator()(std::FILE* file) const noexcept { static_cast<void>(std::fclose(file)); }
 };
 
-// A handler can reach nothing but static storage.
+// A signal handler can only reach static storage.
 volatile std::sig_atomic_t caughtSignal = 0;
 void remember(int number) noexcept {
     caughtSignal = number;
 }
 
-/// While it lives, signals that would end or stop the program are held back, and waitForInput() remembers them instead.
-/// Held back outside of it, because one that came just before a blocking read would not interrupt that read.
+/// While it exists, signals that would end or stop the program are blocked, and waitForInput() remembers them instead.
+/// They are blocked outside of that function too, because a signal just before a blocking read would not interrupt the
+/// read.
 class SignalGuard {
   public:
     SignalGuard() noexcept {
@@ -68,7 +69,7 @@ class SignalGuard {
     sigset_t _maskBefore{};
 };
 
-/// While it lives, the terminal does not show what is typed.
+/// While it exists, the terminal does not show what is typed.
 class EchoGuard {
   public:
     EchoGuard() noexcept : _changed(tcgetattr(STDIN_FILENO, &_before) == 0) {
@@ -145,7 +146,7 @@ std::string askOnce(const std::string& key, const std::string& question) {
         }
     }
     if (const int number = caughtSignal; number != 0) {
-        // The terminal is restored; now let the signal do what it does.
+        // The terminal is restored; now the signal can have its effect.
         static_cast<void>(std::raise(number));
         throw usageError("interrupted");
     }

@@ -1,6 +1,6 @@
 #pragma once
 
-// Values from files, standard input and people.
+// Reads values from files, standard input and the terminal.
 
 #include <string>
 
@@ -9,13 +9,13 @@ namespace adminhost::ctl {
 /// Whether standard input is a terminal.
 [[nodiscard]] bool inputIsTerminal() noexcept;
 
-/// The bytes of a file, or of standard input for "-"; at most 64 MiB. Throws Failure(usage) when it cannot be read, and
-/// when standard input is asked for twice.
+/// Returns the bytes of a file, or of standard input for "-"; at most 64 MiB. Throws Failure(usage) when it cannot be
+/// read, and when standard input is read a second time.
 [[nodiscard]] std::string readSource(const std::string& path);
 
-/// Asks for a secret on the terminal, and once more, without showing what is typed. A signal that would end or stop the
-/// program restores the terminal first. Throws Failure(usage) when the input ends without a line, and when the two
-/// lines differ.
+/// Asks twice for a secret on the terminal, without showing what is typed. A signal that ends or stops the program
+/// restores the terminal first. Throws Failure(usage) when the input ends without a line, and when the two lines
+/// differ.
 [[nodiscard]] std::string askSecret(const std::string& key);
 
 }  // namespace adminhost::ctl

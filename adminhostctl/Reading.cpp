@@ -22,7 +22,7 @@ bool isTable(const Value& value) {
            std::all_of(array->begin(), array->end(), [](const Value& v) { return v.dictionary() != nullptr; });
 }
 
-/// The number of a number, also of one that is stored as text.
+/// The value as a number, also if the number is stored as text.
 std::optional<double> numberOf(const Value& value) {
     if (const auto real = value.real()) {
         return real;
@@ -58,7 +58,7 @@ std::string sizeText(std::uint64_t bytes) {
     }
     double size = static_cast<double>(bytes);
     std::size_t unit = 0;
-    // What would be rounded to 1000 is one of the next unit.
+    // A number that would be rounded to 1000 is shown as 1 of the next unit.
     while (size >= 999.5 && unit + 1 < units.size()) {
         size /= 1000;
         ++unit;
@@ -158,7 +158,7 @@ void Reading::appendTable(std::string& text, const Array& rows, const std::strin
             headings.push_back(key.column);
         }
     }
-    if (keys.empty()) {  // no description says which columns are worth reading
+    if (keys.empty()) {  // the description names no columns
         for (const Value& row : rows) {
             for (const DictionaryEntry& entry : *row.dictionary()) {
                 if (std::find(keys.begin(), keys.end(), entry.key) == keys.end()) {

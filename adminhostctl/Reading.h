@@ -10,8 +10,8 @@
 
 namespace adminhost::ctl {
 
-/// How an answer is shown. Units and headings come from the command's description; what it does not describe is shown
-/// all the same, by its type.
+/// Formats an answer. Units and headings come from the command's description. Keys that it does not describe are shown
+/// according to their type.
 class Reading {
   public:
     Reading(const Description& description, std::size_t width) noexcept : _description(description), _width(width) {}

@@ -217,8 +217,8 @@ std::string withoutLineEnd(std::string text) {
     return text;
 }
 
-/// The value of a text that was read. A secret that is empty by mistake (standard input is /dev/null) would remove the
-/// stored one.
+/// The value of a text that was read. An empty secret is rejected, because it would remove the stored one by mistake
+/// (when standard input is /dev/null).
 Value notEmpty(const DescribedKey& key, const std::string& text, const Sources& sources) {
     if (key.secret && text.empty() && !sources.clear) {
         throw usageError(key.path + ": the value is empty; use --clear to remove the stored one");

@@ -1,6 +1,6 @@
 #pragma once
 
-// The request dictionary, built from the words of the command line.
+// Builds the request dictionary from the words of the command line.
 
 #include "adminhostctl/Description.h"
 #include "platform/value/Value.h"
@@ -13,31 +13,31 @@
 
 namespace adminhost::ctl {
 
-/// Where values come from that are not on the command line. Each function throws Failure when it cannot read.
+/// The sources of values that are not on the command line. Each function throws Failure when it cannot read.
 struct Sources {
     /// The bytes of a file; "-" is standard input.
     std::function<std::string(const std::string& path)> read;
     /// Asks a person, twice, without showing what is typed; only called when standard input is a terminal.
     std::function<std::string(const std::string& key)> ask;
-    bool terminal = false;  ///< standard input is one
-    bool clear = false;     ///< an empty secret is meant: it removes the stored one
+    bool terminal = false;  ///< standard input is a terminal
+    bool clear = false;     ///< an empty secret is intended: it removes the stored one
 };
 
 /// Builds the request. Each argument is KEY=TEXT (converted to the key's type), KEY:=JSON, KEY@FILE or KEY@- (standard
 /// input; a secret is asked for at a terminal). KEY is a path with dots; a number names a list's element, an existing
 /// one or the next one. A file of text loses one line end at its end; for a list or a dictionary it holds JSON or an
-/// XML property list. Arguments replace what the base request holds. Throws Failure(usage): an argument of another
-/// form, a key that is not described (KEY:=JSON may bring one), a text that does not fit its key, a secret on the
-/// command line, an empty secret, a key twice.
+/// XML property list. Arguments replace what the base request holds. Throws Failure(usage) for an argument of another
+/// form, a key that is not described (except with KEY:=JSON), a text that does not fit its key, a secret on the command
+/// line, an empty secret, or a key that is given twice.
 [[nodiscard]] Dictionary buildRequest(const Description& command, Dictionary base,
                                       const std::vector<std::string>& arguments, const Sources& sources);
 
 /// The dictionary of a whole request: JSON, or an XML property list. Throws Failure(usage) with line and column.
 [[nodiscard]] Dictionary parseRequest(std::string_view bytes, const std::string& from);
 
-/// The value of a word for a key: a text, "@FILE" or "@-". A secret is never on the command line: with no word, or "@-"
-/// at a terminal, it is asked for; with no word and Sources::clear it is empty. Throws Failure(usage) as buildRequest
-/// does.
+/// The value of a word for a key: a text, "@FILE" or "@-". A secret is never on the command line: without a word, or
+/// with "@-" at a terminal, the person is asked for it; without a word and with Sources::clear it is empty. Throws
+/// Failure(usage) as buildRequest does.
 [[nodiscard]] Value valueOfWord(const DescribedKey& key, const std::optional<std::string>& word,
                                 const Sources& sources);
 

@@ -11,7 +11,7 @@ namespace adminhost::ctl {
 namespace {
 
 constexpr std::size_t gap = 2;
-constexpr std::size_t leastWidth = 12;  ///< columns are not narrowed below
+constexpr std::size_t leastWidth = 12;  ///< columns are not made narrower than this
 
 std::string capitals(std::string text) {
     std::transform(text.begin(), text.end(), text.begin(),

@@ -9,16 +9,16 @@
 
 namespace adminhost::ctl {
 
-/// Headings in capitals, two blanks between columns, numbers to the right. A table that is too wide has its widest
-/// columns narrowed and their texts wrapped, between words as long as that is enough; if that is not enough, its last
-/// columns are left out and named below.
+/// Headings in capitals, two blanks between columns, numbers aligned to the right. If the table is too wide, its widest
+/// columns are narrowed and their texts wrapped, between words if possible. If that is not enough, the last columns are
+/// omitted and named below the table.
 class Table {
   public:
     explicit Table(std::vector<std::string> headings);
 
     /// One cell for each heading; texts as shown() returns them.
     void addRow(std::vector<std::string> cells);
-    /// Every line ends in a line feed and begins with so many blanks. Columns that are empty in all rows are left out.
+    /// Every line begins with `indent` blanks and ends in a line feed. Columns that are empty in all rows are omitted.
     [[nodiscard]] std::string text(std::size_t width, std::size_t indent) const;
 
   private:

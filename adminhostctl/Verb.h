@@ -1,7 +1,7 @@
 #pragma once
 
-// A verb: what can be written after "adminhostctl". Each room has a table of its own verbs, Main.cpp joins the tables.
-// Every other word is a command of a plug-in.
+// Verbs: the words that may follow "adminhostctl". Each room has a table of its own verbs, and Main.cpp joins the
+// tables. Every other word is a command of a plug-in.
 
 #include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Failure.h"
@@ -24,7 +24,7 @@ struct VerbOptions {
     std::string file;                 ///< of the whole request; empty for none
     std::string passwordFile;         ///< of the secret setting of a desired state; empty for none
     bool names = false;               ///< only names, one a line, for completion
-    bool group = false;               ///< short names are groups'
+    bool group = false;               ///< short names are names of groups
     std::optional<bool> isProtected;  ///< whether a property is to be protected
     std::size_t width = 80;           ///< columns of the terminal
 };
@@ -50,24 +50,25 @@ struct Verb {
     ExitStatus (*run)(const Context& context, std::span<const std::string> arguments);
 };
 
-/// Writes a value in the asked format; as text, as the value at the path of the command's answer. Throws Failure.
+/// Writes a value in the requested format. In text format it is shown as the value at this path of the command's
+/// answer. Throws Failure.
 void writeValue(const Context& context, const Value& value, const Description& description,
                 const std::string& path = {});
 
-/// Prints the error of an answer (errorOf()) on standard error; done if there is none.
+/// Prints the error of an answer (errorOf()) on standard error and returns failed; returns done if there is none.
 [[nodiscard]] ExitStatus reportAnswered(const Context& context, const std::string& error);
 
 /// "list.0: reason (words of the tool)".
 [[nodiscard]] std::string gapText(const ReportedGap& gap);
 
-/// Prints on standard error why the answer to a request is missing and what became of it, without repeating it: what
-/// the daemon reports as changed and as not done, and the log lines. Returns what it has printed.
+/// Prints on standard error why the answer to a request is missing, and its outcome: what the daemon reports as changed
+/// and as not done, and the log lines. Does not send the request again. Returns the printed report.
 RequestReport reportLost(const Context& context, const LostAnswer& lost);
 
-/// The argument at the index, if so many were given.
+/// The argument at the index; nullopt if fewer were given.
 [[nodiscard]] std::optional<std::string> wordAt(std::span<const std::string> arguments, std::size_t index);
 
-/// Runs the verb, or the command, that the words begin with. Throws Failure.
+/// Runs the verb or command at the beginning of the words. Throws Failure.
 [[nodiscard]] ExitStatus run(const Context& context, const std::vector<std::string>& words);
 
 }  // namespace adminhost::ctl

@@ -54,7 +54,7 @@ std::string replaced(std::string_view text, const Write& write) {
     std::string out;
     for (std::size_t at = 0; at < clean.size();) {
         const Utf8Character character = firstCharacterOf(std::string_view(clean).substr(at));
-        // Formats are laid out with line feeds and tabs of their own, and escape those of values.
+        // Line feeds and tabs are part of the layout of every format; those within values are escaped already.
         if (isActedOn(character.code) && character.code != '\n' && character.code != '\t') {
             out += write(static_cast<std::uint32_t>(character.code));
         } else {
@@ -65,7 +65,7 @@ std::string replaced(std::string_view text, const Write& write) {
     return out;
 }
 
-/// Length of the longest beginning that takes at most so many columns; at least one character.
+/// Length of the longest prefix of at most so many columns; at least one character.
 std::size_t fitting(std::string_view text, std::size_t width) {
     std::size_t at = 0;
     std::size_t used = 0;

@@ -1,6 +1,6 @@
 #pragma once
 
-// Texts as they stand on a terminal.
+// Texts as a terminal shows them: control characters and widths.
 
 #include <cstddef>
 #include <string>
@@ -9,19 +9,20 @@
 
 namespace adminhost::ctl {
 
-/// The text with everything that a terminal would act on shown instead: control characters as \xNN, also those above
-/// U+007F and those that change the direction of writing. Line feeds stay.
+/// Returns the text with the characters that a terminal would act on written as \xNN or \uNNNN: control characters,
+/// also those above U+007F, and characters that change the direction of writing. Line feeds and tabs stay.
 [[nodiscard]] std::string shown(std::string_view text);
 
-/// JSON text with the same characters written as \uNNNN. Both lose nothing: such characters stand only within strings.
+/// JSON text with the same characters written as \uNNNN. Its value stays the same: such characters occur only within
+/// strings.
 [[nodiscard]] std::string shownJson(std::string_view json);
 /// XML text with the same characters written as &#xNN;
 [[nodiscard]] std::string shownXml(std::string_view xml);
 
-/// Columns that the text takes: wide characters two, combining ones none. For texts without control characters.
+/// Number of columns of the text: wide characters have two, combining ones none. For texts without control characters.
 [[nodiscard]] std::size_t widthOf(std::string_view text);
 
-/// The text in lines of at most so many columns (at least 2), broken at blanks where it has any.
+/// The text in lines of at most `width` columns (at least 2), broken at blanks if it has any.
 [[nodiscard]] std::vector<std::string> wrapped(std::string_view text, std::size_t width);
 
 }  // namespace adminhost::ctl
