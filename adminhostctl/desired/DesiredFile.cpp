@@ -54,8 +54,8 @@ std::string listText(const std::vector<std::string>& texts) {
     return '[' + list + ']';
 }
 
-/// What a file names the element by: its label, its identity where the label does not find this element alone, or
-/// nothing.
+/// The name of the element in a file: its label, or its identity if the label is not unique; nullopt if neither can be
+/// used.
 std::optional<std::string> nameOf(const State& state, const ListForm& list, const Element& element) {
     try {
         if (!element.label.empty() && findElement(state, list, element.label) == &element) {
@@ -103,7 +103,7 @@ void appendSection(std::string& text, const State& state, const ListForm& list) 
     }
 }
 
-/// A node with its place for messages.
+/// A node with its line and column for messages.
 class Node {
   public:
     Node(const std::string& from, std::string path, const toml::node& node)
@@ -176,7 +176,7 @@ class Node {
     const toml::node& _node;
 };
 
-/// Whether a setting can hold the value: of the described type, or of the type that is stored.
+/// Returns true if a setting can hold the value: it has the described type, or the type of the stored value.
 bool fits(const DescribedKey& key, const Value& value, const Value& stored) {
     if (value.type() == stored.type()) {
         return true;

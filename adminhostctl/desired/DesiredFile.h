@@ -1,7 +1,7 @@
 #pragma once
 
-// The desired state as a file: what "export" writes and "plan" and "apply" read. One form, TOML. The tables are the
-// sections that the descriptions name (StateForm.h):
+// The TOML file of a desired state, which "export" writes and "plan" and "apply" read. The tables are the sections that
+// the descriptions name (StateForm.h):
 //
 //     [remove_unlisted]
 //     SWITCH = false           # remove what is not listed here
@@ -9,7 +9,7 @@
 //     [SETTINGS]
 //     KEY = 8170
 //
-//     [SECTION."Main hall"]    # label, or identity where people may use it
+//     [SECTION."Main hall"]    # label, or identity if people may use it
 //     FIELD = true
 //     PEOPLE = ["anna"]
 //
@@ -23,13 +23,13 @@
 
 namespace adminhost::ctl {
 
-/// The file of a state. Its plan on that state has no change. What the file cannot carry (a secret, one of several
-/// elements of a name) is a comment. Throws Failure(failed) when the service did not list a section: the file
-/// would read as if all of its elements were gone.
+/// Returns the file of a state. Its plan for that state has no change. A value that the file cannot carry (a secret, an
+/// element whose name is not unique) is a comment. Throws Failure(failed) when the service did not list a section:
+/// without it, the file would look as if all of its elements had been removed.
 [[nodiscard]] std::string exportOf(const StateForm& form, const State& state);
 
-/// Throws Failure(usage) with what is wrong, in which line and column, and what to do: broken TOML, an unknown table,
-/// key or setting, a value of another type than its key and what is stored under it.
+/// Reads a file. Throws Failure(usage) with the mistake, its line and column, and what to do: broken TOML, an unknown
+/// table, key or setting, or a value whose type is neither that of its key nor that of the stored value.
 [[nodiscard]] Wanted parseDesired(std::string_view text, const std::string& from, const StateForm& form,
                                   const State& state);
 

@@ -13,7 +13,7 @@ namespace {
 
 using Words = std::span<const std::string>;
 
-/// What the file, and the password file, ask for.
+/// The desired state from the file and the password file.
 Wanted wantedOf(const Context& context, const std::string& file, const CurrentState& current) {
     requireWhole(current);
     Wanted wanted = parseDesired(context.sources.read(file), file, current.form, current.state);

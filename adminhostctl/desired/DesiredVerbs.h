@@ -1,7 +1,6 @@
 #pragma once
 
-// The verbs of the state that a service is to have: reading and writing settings, the file of a whole state, the
-// history.
+// The verbs of the desired state: reading and writing settings, the file of a whole state, the history.
 
 #include "adminhostctl/Verb.h"
 

@@ -1,6 +1,6 @@
 #pragma once
 
-// The verbs that look back: what writes of settings changed, and going back.
+// The verbs of the history: list what writes of settings changed, and restore former settings.
 
 #include "adminhostctl/Verb.h"
 
@@ -11,8 +11,9 @@ namespace adminhost::ctl {
                                                       const std::vector<std::string>& keys);
 
 [[nodiscard]] ExitStatus history(const Context& context, std::span<const std::string> arguments);
-/// Writes the settings of an entry as every verb that changes something does it (Writing.h). A setting that is set now
-/// and was not set then stays: it is named, and the status is failed. A secret stays too, with a note.
+/// Writes the settings of an entry, in the same way as every verb that changes something (Writing.h). A setting that is
+/// set now and was not set then keeps its value: it is named, and the status is failed. A secret also keeps its value,
+/// with a note.
 [[nodiscard]] ExitStatus rollback(const Context& context, std::span<const std::string> arguments);
 
 }  // namespace adminhost::ctl

@@ -23,7 +23,7 @@ bool contains(const Range& range, const Element& element) {
     return std::find(std::begin(range), std::end(range), element) != std::end(range);
 }
 
-/// The settings files that are others once the wanted settings are written.
+/// The settings files whose paths change when the wanted settings are written.
 std::set<std::string> movedFiles(const StateForm& form, const Wanted& wanted, const State& state) {
     std::set<std::string> files;
     for (const DescribedKey& key : form.settings()) {
@@ -56,7 +56,7 @@ void planSetting(Plan& plan, const StateForm& form, const Wanted& wanted, const 
             }
         }
     }
-    // What is equal now need not be equal in the file that is used from then on.
+    // A value that is equal now may differ in the file that is used after the move.
     if (differs || moved) {
         plan.root.set(entry.key, entry.value);
     }
@@ -145,7 +145,7 @@ class Section {
         }
     }
 
-    /// Puts the records where the request has them.
+    /// Stores the records in the request under their keys.
     void finish() {
         if (!_records.empty()) {
             _plan.root.set(_list.key, std::move(_records));
@@ -273,7 +273,7 @@ class Section {
         }
     }
 
-    /// False when the same change is planned already.
+    /// Returns false if the same change is planned already.
     bool pushPerson(const Array& entries, const PeopleForm& form, const std::string& list, const std::string& name,
                     bool allowed) {
         const std::string entry = _entry + '.' + list + '.' + tomlKey(name);
@@ -303,7 +303,7 @@ std::string reasonOf(const ReportedGap& gap) {
     return gap.reason + (gap.toolMessage.empty() ? "" : " (" + gap.toolMessage + ")");
 }
 
-/// The report on the change, on a part of it or on what it is a part of; null if there is none.
+/// The report on the change, on a part of it or on something that contains it; null if there is none.
 const ReportedGap* gapOf(const PlannedChange& change, const RequestReport& report) {
     for (const ReportedGap& gap : report.notDone) {
         if (!gap.keyPath.empty() && (isBelow(gap.keyPath, change.keyPath) || isBelow(change.keyPath, gap.keyPath))) {
@@ -322,7 +322,7 @@ bool isReported(const StateForm& form, const PlannedChange& change, const Reques
     });
 }
 
-/// What of the wanted can be compared with what is there afterwards.
+/// The part of the desired state that can be compared with the state afterwards.
 Wanted comparable(const StateForm& form, const Wanted& wanted, const Plan& plan, const State& before,
                   const State& after, bool answered) {
     Wanted visible = wanted;
@@ -330,7 +330,7 @@ Wanted comparable(const StateForm& form, const Wanted& wanted, const Plan& plan,
     for (const DescribedKey& key : form.settings()) {
         const std::string name = form.nameOf(key);
         const Value& value = wanted.settings.get(name);
-        // What is stored is what the lookup found, which need not be what was written.
+        // The stored value is the result of the lookup, which may differ from what was written.
         if (!value.isNull() && isLookedUp(key, value) &&
             (answered || !plan.root.contains(name) || after.settings.get(name) != before.settings.get(name))) {
             visible.settings.remove(name);

@@ -1,7 +1,7 @@
 #pragma once
 
-// From what is wanted and what is there to the changes between them, and what became of the changes. No input, no
-// output.
+// Plans the changes that turn the current state into the desired one, and determines afterwards which of them were
+// applied. No input, no output.
 
 #include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/desired/State.h"
@@ -15,15 +15,15 @@
 
 namespace adminhost::ctl {
 
-/// What is wanted of one element. What is absent stays as it is.
+/// The desired state of one element. Fields that are absent stay as they are.
 struct WantedElement {
-    std::string name;                                       ///< label, or identity where people may use it
+    std::string name;                                       ///< label, or identity if people may use it
     Dictionary fields;                                      ///< by their key
     std::map<std::string, std::vector<std::string>> lists;  ///< labels of people, by the name of their list in a file
     std::vector<Person> denied;                             ///< by label; an empty kind means all kinds
     bool remove = false;
-    /// Write a text that is a secret already. It cannot be compared, so a file that is applied again and again does not
-    /// ask for it.
+    /// Write a text that is a secret already. It cannot be compared, so a file, which may be applied many times, does
+    /// not set this.
     bool writeSecret = false;
 };
 
@@ -32,7 +32,7 @@ struct Wanted {
     std::map<std::string, std::string> secrets;                  ///< secret settings; "" removes the stored one
     std::map<std::string, std::vector<WantedElement>> elements;  ///< by section
     std::set<std::string> removeUnlisted;                        ///< switches that are on
-    /// Write a name that the write itself looks up, although what it finds is not known before.
+    /// Also write a name that the write itself looks up, although its result is not known in advance.
     bool lookUp = false;
 };
 
@@ -40,12 +40,12 @@ struct PlannedChange {
     std::string entry;     ///< "SECTION.KEY", "SECTION.\"Main hall\".LIST.anna"
     std::string from;      ///< as TOML writes it, or words in parentheses; "(secret)" for every secret
     std::string to;        ///< the same
-    std::string keyPath;   ///< where in the request it is: "ROOT.LIST.0"
+    std::string keyPath;   ///< its key path in the request: "ROOT.LIST.0"
     bool hidden = false;   ///< reading does not show whether it was applied
     std::string identity;  ///< of the element
     std::string key;       ///< of the setting, or of the element
 
-    /// Of what changes; where in the request it is does not matter.
+    /// Compares the change itself, without its place in the request.
     friend bool operator==(const PlannedChange& a, const PlannedChange& b) {
         return a.entry == b.entry && a.from == b.from && a.to == b.to;
     }
@@ -53,21 +53,22 @@ struct PlannedChange {
 
 struct Plan {
     std::vector<PlannedChange> changes;
-    std::vector<std::string> notes;    ///< what is wanted and left as it is, what follows from a change
-    Dictionary root;                   ///< what to write; empty when nothing changes
+    std::vector<std::string> notes;    ///< desired values that are left as they are, and consequences of changes
+    Dictionary root;                   ///< what to write; empty if nothing changes
     std::vector<std::string> restart;  ///< commands that have to be run for a change to take effect
     bool moves = false;                ///< other settings files, perhaps another database, are used from then on
 };
 
-/// Whether writing the value makes the service look it up and store what it finds.
+/// Returns true if the service looks the written value up and stores the result instead.
 [[nodiscard]] bool isLookedUp(const DescribedKey& setting, const Value& value);
 
-/// Throws Failure(usage) when something wanted does not fit what is there, naming it.
+/// Returns the changes from `state` to what is wanted. Throws Failure(usage), which names the place, if something
+/// wanted does not fit the state.
 [[nodiscard]] Plan planOf(const StateForm& form, const Wanted& wanted, const State& state);
 
 /// A change that was not applied, and why as far as the daemon reports it.
 struct FailedChange {
-    PlannedChange change;  ///< its `from` is what is there instead
+    PlannedChange change;  ///< its `from` is the value that is stored instead
     std::string reason;    ///< empty if there is no report
 };
 
@@ -77,9 +78,9 @@ struct PlanOutcome {
     std::vector<PlannedChange> undetermined;
 };
 
-/// What became of the plan's changes. `after` is what reading shows afterwards, nothing when it cannot be read.
-/// `answered`: the writing command returned no error. Reading decides; the daemon's report of what was
-/// not carried out decides on what reading does not show.
+/// Returns which changes of the plan were applied. `after` is the state that was read afterwards, nullopt if it cannot
+/// be read. `answered`: the writing command returned no error. The state decides; for values that reading does not
+/// show, the daemon's report of what was not carried out decides.
 [[nodiscard]] PlanOutcome outcomeOf(const StateForm& form, const Wanted& wanted, const Plan& plan, const State& before,
                                     const std::optional<State>& after, bool answered, const RequestReport& report);
 

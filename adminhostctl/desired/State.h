@@ -29,22 +29,23 @@ struct Element {
 
 struct State {
     Dictionary settings;  ///< all plain values, also those that cannot be written
-    /// By section, in the service's order. A section is missing when the service listed none: its database is missing
-    /// or cannot be read.
+    /// By section, in the service's order. A section is missing if the service did not list it, because its database is
+    /// missing or cannot be read.
     std::map<std::string, std::vector<Element>> lists;
 };
 
-/// Elements without identity are left out; a value of an unexpected type counts as missing.
+/// Builds the state from an answer. Elements without identity are left out; a value of an unexpected type counts as
+/// missing.
 [[nodiscard]] State stateOf(const StateForm& form, const Dictionary& root);
 
 /// Whether the text of the field is a secret of this element.
 [[nodiscard]] bool isSecret(const FieldForm& field, const Element& element);
 
-/// The elements of a section. Throws Failure(failed) when the service listed none.
+/// The elements of a section. Throws Failure(failed) if the service did not list the section.
 [[nodiscard]] const std::vector<Element>& elementsOf(const State& state, const ListForm& list);
 
-/// The element with the identity, in any case (where people may use it), or else with the label; null if there is none.
-/// Throws Failure: several have the label (usage), the section is not listed (failed).
+/// The element with this identity, in upper or lower case (if people may use identities), or else with this label; null
+/// if there is none. Throws Failure if several have the label (usage) or the section is not listed (failed).
 [[nodiscard]] const Element* findElement(const State& state, const ListForm& list, const std::string& name);
 
 }  // namespace adminhost::ctl

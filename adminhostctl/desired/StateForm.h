@@ -1,7 +1,7 @@
 #pragma once
 
-// What a state that can be written consists of. Everything is learnt from the description of the writing command, so
-// that no key, table or command of a service is named here (commands/README.md has the words of the descriptions).
+// The parts of a state that can be written. All of them come from the description of the writing command, so that no
+// key, table or command of a service is named here (commands/README.md explains the words of the descriptions).
 
 #include "adminhostctl/Description.h"
 
@@ -17,7 +17,7 @@ struct FieldForm {
     std::string key;
     std::string inFile;    ///< its name in a file
     bool boolean = false;  ///< else a text
-    std::string secretIf;  ///< key of the boolean that makes it a secret; empty: it is none
+    std::string secretIf;  ///< key of the boolean that makes it a secret; empty: it is not a secret
 };
 
 /// A key of an element that holds a list of people.
@@ -32,7 +32,7 @@ struct PeopleForm {
     std::vector<std::pair<std::string, std::string>> kinds;  ///< kind, and the name of its list in a file
 };
 
-/// A list of elements, a table of a file each.
+/// A list of elements. In a file, each element is a table.
 struct ListForm {
     std::string section;  ///< name of the table
     std::string key;      ///< of the list in the state
@@ -67,7 +67,7 @@ class StateForm {
     /// Sections whose elements people create come first.
     [[nodiscard]] const std::vector<ListForm>& lists() const noexcept { return _lists; }
 
-    /// The setting, or the secret one, of the name; null if there is none.
+    /// The setting, or the secret setting, with this name; null if there is none.
     [[nodiscard]] const DescribedKey* setting(std::string_view name) const noexcept;
     [[nodiscard]] const DescribedKey* secret(std::string_view name) const noexcept;
     /// The list with the section's name; throws Failure(failed) if there is none.

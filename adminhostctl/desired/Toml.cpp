@@ -24,7 +24,7 @@ std::string tomlText(std::string_view text) {
         } else if (byte < 0x20 || byte == 0x7F) {
             quoted += fmt::format("\\u{:04X}", byte);
         } else if (byte >= 0xC0) {
-            // A whole character: what a terminal would act on (C1 controls, changes of direction) is written by number.
+            // Characters that a terminal would act on (C1 controls, changes of direction) are written by number.
             const Utf8Character first = firstCharacterOf(text.substr(at));
             const std::string_view character = text.substr(at, first.size);
             if (shown(character) == character) {

@@ -1,6 +1,6 @@
 #pragma once
 
-// Values and keys as a TOML file writes them, which is also how changes are shown.
+// Formats values and keys for a TOML file. Changes are shown in the same form.
 
 #include "platform/value/Value.h"
 
@@ -10,11 +10,12 @@
 
 namespace adminhost::ctl {
 
-/// A text between double quotes, everything that is no printable character escaped.
+/// The text between double quotes, with every character that is not printable escaped.
 [[nodiscard]] std::string tomlText(std::string_view text);
-/// A key: bare where it can be.
+/// The key, without quotes if possible.
 [[nodiscard]] std::string tomlKey(std::string_view key);
-/// Nothing for what a setting's line cannot carry: lists, dictionaries, data, integers above the signed range.
+/// nullopt for values that the line of a setting cannot carry: lists, dictionaries, data, integers above the signed
+/// range.
 [[nodiscard]] std::optional<std::string> tomlValue(const Value& value);
 
 }  // namespace adminhost::ctl

@@ -41,7 +41,7 @@ void showFailed(std::ostream& err, const std::vector<FailedChange>& failed) {
     }
 }
 
-/// Names that the write has looked up, and what it has stored.
+/// Prints the names that the write has looked up, and the stored results.
 void showLookedUp(const Context& context, const StateForm& form, const Plan& plan, const State& after) {
     for (const DescribedKey& key : form.settings()) {
         const std::string name = form.nameOf(key);
@@ -58,7 +58,7 @@ void showLookedUp(const Context& context, const StateForm& form, const Plan& pla
     }
 }
 
-/// One write, and what became of it.
+/// One write and its outcome.
 class PlannedWrite {
   public:
     PlannedWrite(const Context& context, const CurrentState& current, const Wanted& wanted, Plan plan)
@@ -106,7 +106,7 @@ class PlannedWrite {
     ExitStatus afterLost(const LostAnswer& lost) {
         const RequestReport report = reportLost(_context, lost);
         std::optional<State> after;
-        // While the request runs, reading would only wait for it and show nothing that is final.
+        // While the request is running, reading would only wait for it, and the state is not final.
         if (report.state == RequestReport::State::done || report.state == RequestReport::State::unknown) {
             try {
                 after = readState(_context).state;
@@ -214,7 +214,7 @@ ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentS
     if (!plan.moves || first.changes.size() == plan.changes.size()) {
         return PlannedWrite(context, current, wanted, std::move(plan)).perform();
     }
-    // The new files may come with another database, in which an identity stands for another element.
+    // The new files may refer to another database, in which the identity belongs to another element.
     const ExitStatus status = PlannedWrite(context, current, settings, std::move(first)).perform();
     if (status != ExitStatus::done) {
         return status;

@@ -1,6 +1,6 @@
 #pragma once
 
-// How every verb that changes something does it: read, plan, write what was planned on, compare what is there then.
+// Carries out the changes of every verb: read the state, plan, write depending on the revision that was read, compare.
 
 #include "adminhostctl/Verb.h"
 #include "adminhostctl/desired/Plan.h"
@@ -9,7 +9,7 @@
 
 namespace adminhost::ctl {
 
-/// The state as it is now, what it consists of, and its revision.
+/// The current state, its form and its revision.
 struct CurrentState {
     StateForm form;
     State state;
@@ -17,20 +17,20 @@ struct CurrentState {
     std::vector<ReportedGap> unread;  ///< parts that the service could not read: they look empty
 };
 
-/// The state, or only one section of it. Throws Failure when the service does not return it.
+/// Reads the state, or only one section of it. Throws Failure if the service does not return it.
 [[nodiscard]] CurrentState readState(const Context& context, const std::string& section = {});
 
 /// Throws Failure(failed) with the reasons if parts of the state could not be read.
 void requireWhole(const CurrentState& current);
 
-/// The plan in the asked format.
+/// Prints the plan in the requested format.
 void showPlan(const Context& context, const Plan& plan);
 
-/// Changes what differs from what is wanted, and prints what. Nothing is sent when nothing differs. The write is
-/// refused by the daemon when another client has changed something since the reading. A change that moves settings
-/// files is written before the elements, which are planned again on what is there then. Returns failed after
-/// naming each change that was not applied, and undetermined when the answer is missing and reading and the daemon's
-/// report do not show what was written. Nothing is ever written twice.
+/// Changes what differs from the desired state, and prints the changes. Sends nothing if nothing differs. The daemon
+/// refuses the write if another client has changed something since the state was read. A change that moves settings
+/// files is written before the elements, which are then planned again for the new state. Names each change that was not
+/// applied and returns failed. Returns undetermined if the answer is missing and neither the state nor the daemon's
+/// report shows what was written. Nothing is ever written twice.
 [[nodiscard]] ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentState& current);
 
 }  // namespace adminhost::ctl

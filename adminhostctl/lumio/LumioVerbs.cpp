@@ -74,7 +74,7 @@ ExitStatus cameraShow(const Context& context, Words words) {
     return ExitStatus::done;
 }
 
-/// Changes one camera, which has to be there.
+/// Changes one camera, which must exist.
 ExitStatus changeCamera(const Context& context, WantedElement camera) {
     const CurrentState current = readState(context);
     requireWhole(current);
@@ -137,7 +137,7 @@ ExitStatus propertySet(const Context& context, Words arguments) {
     if (context.options.isProtected) {
         property.fields.set("protect", becomes);
     }
-    // Without a value, switching the protection keeps the stored one.
+    // Without a value, the stored value is kept and only its protection changes.
     if (arguments.size() > 1 || stored == nullptr || becomes == isProtected) {
         DescribedKey key;
         key.path = "the value of " + tomlText(arguments.front());
