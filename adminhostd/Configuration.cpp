@@ -97,7 +97,7 @@ void apply(const Entry& entry, Options& options) {
 }  // namespace
 
 void readConfiguration(const std::string& file, Options& options) {
-    // The parser would read a directory, or what fails while it is read, as an empty file.
+    // The parser would read a directory, or a file whose reading fails, as an empty file.
     const auto text = readFile(DiskPath(file), configurationMaximum);
     if (!text) {
         throw std::runtime_error(fmt::format("{}: {}; the configuration must be a readable file", file,

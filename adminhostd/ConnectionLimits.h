@@ -10,28 +10,28 @@
 namespace adminhost {
 
 /// Counts the open connections of each account. Root may use all of them. All other accounts together leave some to
-/// root, and one of them alone may have half of what is left, so that no account can lock out the others.
+/// root, and one of them alone may have half of the rest, so that no account can lock out the others.
 class ConnectionLimits {
   public:
     static constexpr std::size_t maximum = 256;        ///< in total
     static constexpr std::size_t rootReserve = 16;     ///< of them, for root only
-    static constexpr std::size_t ownDescriptors = 16;  ///< that the daemon needs beside its connections
+    static constexpr std::size_t ownDescriptors = 16;  ///< that the daemon needs besides its connections
 
-    /// The process may have so many descriptors open. With few of them the numbers above shrink, to 1 in total at the
-    /// least.
+    /// `descriptors` is how many the process may have open. If there are few, the numbers above shrink, to 1 in total
+    /// at the least.
     explicit ConnectionLimits(std::size_t descriptors) noexcept;
 
     [[nodiscard]] std::size_t total() const noexcept { return _total; }
-    /// Of all accounts but root.
+    /// For all accounts but root together.
     [[nodiscard]] std::size_t others() const noexcept { return _others; }
-    /// Of one account that is not root.
+    /// For one account that is not root.
     [[nodiscard]] std::size_t perAccount() const noexcept { return _perAccount; }
 
-    /// True when no further connection can be held, root's included.
+    /// Returns true if no further connection can be held, root's included.
     [[nodiscard]] bool full() const noexcept { return _open >= _total; }
-    /// Counts a connection of the account, or returns false when it may not have another one now.
+    /// Counts a connection of the account. Returns false if the account may not have another one now.
     [[nodiscard]] bool add(uid_t uid);
-    /// A connection that add() has counted is closed.
+    /// Must be called when a connection that add() has counted is closed.
     void remove(uid_t uid) noexcept;
 
   private:

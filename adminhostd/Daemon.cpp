@@ -24,11 +24,11 @@ namespace {
 using namespace std::chrono_literals;
 using Clock = std::chrono::steady_clock;
 
-constexpr auto runningBound = 10s;  ///< for a running operation that only reads when the daemon is to stop
-constexpr auto extension = 5s;      ///< that the service manager waits longer than a running write may take
+constexpr auto runningBound = 10s;  ///< at a stop, for a running operation that only reads
+constexpr auto extension = 5s;      ///< by which the service manager waits longer than a running write may run
 constexpr int logPause = 100;       ///< milliseconds until the next try while the log cannot be written
 constexpr auto logBound = 200ms;    ///< for the log's last events at the end
-constexpr auto sendingBound = 2s;   ///< for its clients to read their answers then
+constexpr auto sendingBound = 2s;   ///< at a stop, for clients to read their answers
 
 FileDescriptor stopSignals() {
     sigset_t signals;
@@ -54,7 +54,7 @@ class Daemon {
 
     void run() {
         for (;;) {
-            // Clients that come before the first worker is ready wait in the socket's backlog.
+            // Clients that connect before the first worker is ready wait in the socket's backlog.
             if (!_server && _front.queue().settled() && !_stopping) {
                 _server.emplace(_socket.take(), _options.clientTimeout,
                                 [this](Exchange& exchange) { return _front.head(exchange); });
@@ -111,7 +111,7 @@ class Daemon {
         }
         _front.queue().stop(runningBound);
         if (const auto due = _front.queue().due()) {
-            // A write may take longer than the unit grants for a stop.
+            // A write may run longer than the unit's time for a stop.
             const auto left =
                 std::chrono::ceil<std::chrono::microseconds>(*due - Clock::now() + sendingBound + extension);
             notify(fmt::format("EXTEND_TIMEOUT_USEC={}", left.count()));

@@ -63,7 +63,7 @@ void FrameReader::append(std::string_view bytes) {
         _missing -= ofBegun.size();
         bytes.remove_prefix(ofBegun.size());
     }
-    // Done here and not frame by frame, which for many small ones would move what follows again and again.
+    // Done here and not for each frame: many small frames would move the rest again and again.
     if (const std::size_t read = std::exchange(_read, 0); read == _bytes.size()) {
         clear(_bytes);
     } else {
@@ -103,7 +103,7 @@ std::optional<Frame> FrameReader::next() {
     Frame frame{
         static_cast<FrameType>(header.type), std::move(*payload), {}, sizeof header + header.payload + header.bytes};
     const std::string_view here = bytes.substr(0, header.bytes);
-    // Memory that is asked for but not written to costs nothing.
+    // Reserved memory that is not written to costs nothing.
     frame.bytes.reserve(header.bytes);
     frame.bytes = here;
     _read += sizeof header + header.payload + here.size();

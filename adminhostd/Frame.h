@@ -2,9 +2,9 @@
 
 // Frames: the units in which front and worker exchange messages (Protocol.h) over their socket pair.
 //
-// A frame is a header (magic, type, two lengths), a payload (one encoded value) and bytes that are passed on as they
-// are. Both ends are processes of one build; the checks turn a broken peer into an error instead of a misreading.
-// Requests may hold secrets: a reader's memory is cleared once it is no longer needed.
+// A frame is a header (magic, type, two lengths), a payload (one encoded value) and bytes that are passed on unchanged.
+// Both ends are processes of one build; the checks turn a broken peer into an error instead of a misreading. Requests
+// may hold secrets: a reader's memory is cleared once it is no longer needed.
 
 #include "platform/value/Value.h"
 
@@ -40,7 +40,7 @@ struct Frame {
 /// The frame's header and payload; its bytes follow. Returns nullopt if they are together above the maximum.
 [[nodiscard]] std::optional<std::string> encodeFrame(const Frame& frame);
 
-/// Puts frames together from the bytes as they arrive.
+/// Builds frames from the bytes in the order of their arrival.
 class FrameReader {
   public:
     FrameReader() = default;
@@ -49,9 +49,9 @@ class FrameReader {
     ~FrameReader();
 
     void append(std::string_view bytes);
-    /// The next whole frame; nullopt while bytes are missing, or if the stream is broken.
+    /// The next whole frame; nullopt if bytes are missing, or if the stream is broken.
     [[nodiscard]] std::optional<Frame> next();
-    /// Whether the stream has held something that is not a frame. Nothing that comes later can be read.
+    /// Returns true if the stream has contained something that is not a frame. Nothing after it can be read.
     [[nodiscard]] bool broken() const noexcept { return _broken; }
 
   private:
@@ -62,9 +62,9 @@ class FrameReader {
     bool _broken = false;
 };
 
-/// Blocking, on a descriptor. Returns false if the frame is too large, or the other end is closed.
+/// Blocks, on a descriptor. Returns false if the frame is too large, or the other end is closed.
 [[nodiscard]] bool writeFrame(int descriptor, const Frame& frame);
-/// Blocking. The next frame; nullopt at the end of the stream or if it is broken.
+/// Blocks. Returns the next frame; nullopt at the end of the stream or if it is broken.
 [[nodiscard]] std::optional<Frame> readFrame(int descriptor, FrameReader& reader);
 
 }  // namespace adminhost

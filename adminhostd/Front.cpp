@@ -329,7 +329,7 @@ std::variant<HttpAnswer, HttpServer::Serve> Front::head(Exchange& exchange) {
         return [this, target](Exchange& whole) { serve(whole, target); };
     }
     if (stranger || exchange.method() == "POST") {
-        // Log unauthorised requests, but keep them out of what the daemon remembers.
+        // Log unauthorised requests, but keep them out of the log of requests.
         const std::shared_ptr<RequestRecord> record = stranger ? RequestLog::begin(exchange) : _log.add(exchange);
         record->plugin = target.plugin.substr(0, keptName);
         record->command = target.command.substr(0, keptName);
@@ -427,7 +427,7 @@ void Front::operation(Exchange& exchange, const Target& target) {
         end(operation, std::move(answer), code);
     };
 
-    // Between head and body a new worker may have brought other plug-ins.
+    // A new worker may have loaded other plug-ins since the head arrived.
     if (auto answer = missing(target)) {
         return refuse(std::move(*answer));
     }

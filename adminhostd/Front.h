@@ -1,6 +1,6 @@
 #pragma once
 
-// The front: what each address serves, who may ask, and the audit.
+// The front: what each address serves, which clients are permitted, and the audit.
 
 #include "adminhostd/Http.h"
 #include "adminhostd/OperationQueue.h"
@@ -16,17 +16,17 @@ namespace adminhost {
 
 class Front {
   public:
-    /// The configuration for the workers, and the plug-ins that were not even offered to them. Hands the operations to
-    /// a worker, which it starts.
+    /// `settings` configures the workers; `refused` are the plug-ins that are not even offered to them. Creates the
+    /// queue, which starts a worker for the operations.
     Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused);
     Front(const Front&) = delete;
     Front& operator=(const Front&) = delete;
 
     [[nodiscard]] OperationQueue& queue() noexcept { return _queue; }
 
-    /// For a request whose head has arrived: the answer that needs no body (not permitted, not found, not understood),
-    /// or the function that serves it once its body is there, at once or, an operation, when it has run. Permission,
-    /// address and id are looked at here only.
+    /// Handles a request whose head has arrived. Returns the answer if it needs no body (not permitted, not found,
+    /// malformed), else the function that serves it once its body is there: at once, or, for an operation, after it has
+    /// run. Permission, address and id are checked here only.
     [[nodiscard]] std::variant<HttpAnswer, HttpServer::Serve> head(Exchange& exchange);
 
   private:
@@ -34,9 +34,9 @@ class Front {
         enum class Kind { unknown, overview, plugin, command, request, directory, history };
         Kind kind = Kind::unknown;
         std::string plugin;
-        std::string command;  ///< or, of a request, its id
+        std::string command;  ///< for a request: its id
 
-        /// Whether it is served by the worker, and remembered.
+        /// Returns true if the worker serves it. Such requests are recorded in the log of requests.
         [[nodiscard]] bool isOperation() const noexcept {
             return kind == Kind::command || kind == Kind::directory || kind == Kind::history;
         }
@@ -47,23 +47,23 @@ class Front {
     [[nodiscard]] const protocol::OfferedPlugin* pluginNamed(std::string_view name) const;
     [[nodiscard]] std::vector<protocol::RefusedPlugin> refusedPlugins() const;
 
-    /// Makes the id that a client may have sent the exchange's; an answer if it cannot be.
+    /// Uses the id that the client may have sent as the exchange's. Returns an answer if that id is rejected.
     std::optional<HttpAnswer> adoptId(Exchange& exchange, const Target& target);
-    /// The answer if the plug-in or its command does not exist.
+    /// Returns the answer if the plug-in or its command does not exist.
     [[nodiscard]] std::optional<HttpAnswer> missing(const Target& target) const;
     [[nodiscard]] std::optional<HttpAnswer> refusal(const Exchange& exchange, const Target& target) const;
     void serve(Exchange& exchange, const Target& target);
     [[nodiscard]] HttpAnswer overview() const;
     void operation(Exchange& exchange, const Target& target);
-    /// What the worker serves without an operation of a plug-in.
+    /// Passes on a request that the worker serves without an operation of a plug-in.
     void query(Exchange& exchange, const Target& target);
     void enqueue(Operation operation);
     void finished(const Operation& operation, OperationQueue::Ending ending);
-    /// Answers an operation, and logs its end.
+    /// Sends an operation's answer and logs its end.
     static void end(const Operation& operation, HttpAnswer answer, std::string_view code);
 
     RequestLog _log;
-    std::vector<protocol::RefusedPlugin> _refused;  ///< before a worker saw them
+    std::vector<protocol::RefusedPlugin> _refused;  ///< before they were offered to a worker
     std::optional<protocol::Hello> _hello;          ///< of the latest worker
     OperationQueue _queue;
 };

@@ -317,7 +317,7 @@ bool HttpServer::acceptOne() {
     ucred credentials{};
     socklen_t size = sizeof credentials;
     if (::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) {
-        return true;  // without them nothing may be served: closes the connection
+        return true;  // requests without an account are never served: closes the connection
     }
     if (!_limits.add(credentials.uid)) {
         // Connections that the client has just closed must not count: only the library can notice that.
@@ -374,7 +374,7 @@ HttpServer::Client* HttpServer::clientOf(MHD_Connection* connection) {
 }
 
 void HttpServer::dropSlowClients() {
-    // The library's own bound is on silence; one byte every few seconds would hold a connection for ever.
+    // The library only bounds silence; a client that sends one byte every few seconds would hold a connection for ever.
     const auto now = Clock::now();
     for (Client& client : _clients) {
         if (client.receiving && now - client.since > _clientTimeout) {
@@ -487,7 +487,7 @@ int HttpServer::send(Exchange& exchange) {
         answer.text.reset();
     } else if (answer.body) {
         std::optional<std::string> text;
-        // A value that a property list cannot carry is sent as JSON all the same: the type says what it is.
+        // A value that a property list cannot carry is sent as JSON instead; the Content-Type states the form.
         if (exchange.wantsPropertyList()) {
             text = xmlPropertyList(*answer.body);
             type = "application/x-plist";

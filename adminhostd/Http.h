@@ -28,8 +28,8 @@ struct MHD_Daemon;
 namespace adminhost {
 
 constexpr std::size_t bodyMaximum = std::size_t{8} << 20U;  ///< bytes of a request's body
-/// Bytes of all answers that clients have not read yet. Beyond it the oldest of them is dropped with its connection;
-/// the newest never is, so that an answer of any size arrives.
+/// Bytes of all answers that clients have not read yet. Above it, the oldest of them is dropped with its connection.
+/// The newest never is, so that an answer of any size arrives.
 constexpr std::size_t unreadMaximum = std::size_t{64} << 20U;
 
 /// The process at the other end, as the kernel knew it when it connected.
@@ -63,20 +63,20 @@ class Exchange {
     [[nodiscard]] const std::string& method() const noexcept { return _method; }
     [[nodiscard]] const std::string& path() const noexcept { return _path; }  ///< decoded, without the query
     [[nodiscard]] const std::string& body() const noexcept { return _body; }
-    /// Returns nullopt when the client did not send the header, and an empty text when it sent an empty one. A NUL ends
-    /// the text.
+    /// Returns nullopt if the client did not send the header, and an empty text if it sent an empty one. A NUL ends the
+    /// text.
     [[nodiscard]] std::optional<std::string_view> header(const char* name) const;
-    /// A value of the address's query, decoded; empty when the client did not send it.
+    /// A value of the address's query, decoded; empty if the client did not send it.
     [[nodiscard]] std::string_view argument(const char* name) const;
-    /// Returns true when the answer's text is to be a property list, and false for JSON.
+    /// Returns true if the answer's text is to be a property list, and false for JSON.
     [[nodiscard]] bool wantsPropertyList() const;
-    /// Replaces the id by the one that the client has given.
+    /// Replaces the id by the client's own.
     void adoptId(std::string id) noexcept { _id = std::move(id); }
     /// Clears and frees the body once it has been read.
     void dropBody() noexcept;
-    /// Returns true when the client has closed its connection, or its sending half.
+    /// Returns true if the client has closed its connection, or its sending half.
     [[nodiscard]] bool clientGone() const noexcept;
-    /// Answers the request, now or later, once. The exchange may be gone when the server runs next.
+    /// Sends the answer, now or later. Must be called once. The exchange may be gone when the server runs next.
     void answer(HttpAnswer answer);
 
   private:
@@ -91,8 +91,8 @@ class Exchange {
     std::string _path;
     std::string _body;
     std::size_t _received = 0;
-    std::function<void(Exchange&)> _serve;  ///< what head() returned
-    std::optional<HttpAnswer> _refusal;     ///< decided from the head, sent when the body has been read away
+    std::function<void(Exchange&)> _serve;  ///< the function that head() returned
+    std::optional<HttpAnswer> _refusal;     ///< decided from the head, sent once the body has been read and dropped
     std::optional<HttpAnswer> _answer;
     std::string _bytes;       ///< of the answer, while it is sent
     std::size_t _unread = 0;  ///< bytes of it that count as unread; 0 when it has been dropped
@@ -103,28 +103,28 @@ class HttpServer {
   public:
     /// Called with the whole request.
     using Serve = std::function<void(Exchange&)>;
-    /// Called when the head of a request is there. An answer refuses it before its body is read; else what is returned
-    /// is called with the whole request.
+    /// Called when the head of a request is there. Returns an answer to refuse it before its body is read, else the
+    /// function to be called with the whole request.
     using Head = std::function<std::variant<HttpAnswer, Serve>(Exchange&)>;
 
-    /// Takes the listening socket. A client that takes longer than the time for a request, or to read on, is dropped.
-    /// Throws std::runtime_error when the library fails to start.
+    /// Takes ownership of the listening socket. A client that exceeds the time for a request, or for reading on, is
+    /// dropped. Throws std::runtime_error if the library fails to start.
     HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeout, Head head);
     HttpServer(const HttpServer&) = delete;
     HttpServer& operator=(const HttpServer&) = delete;
-    /// Every exchange must have been answered.
+    /// Every exchange must have its answer before.
     ~HttpServer();
 
     /// Adds the descriptors that become readable when run() has something to do. The listener is among them only while
     /// a connection can be accepted: otherwise it would stay readable and the loop would spin.
     void addTo(std::vector<pollfd>& entries) const;
-    /// Milliseconds until run() must be called; nullopt when there is no hurry.
+    /// Milliseconds until run() must be called; nullopt if there is no limit.
     [[nodiscard]] std::optional<int> timeout() const;
-    /// Accepts, reads, serves and sends whatever can be done without waiting.
+    /// Accepts, reads, serves and sends everything that needs no waiting.
     void run();
     /// Closes the listening socket: accepts no further connection.
     void quiesce() noexcept { _listener.close(); }
-    /// Requests that have begun and are not fully answered.
+    /// The number of requests that have begun and whose answers are not fully sent.
     [[nodiscard]] std::size_t open() const noexcept { return _open; }
 
   private:
@@ -155,7 +155,7 @@ class HttpServer {
     std::chrono::seconds _clientTimeout;
     Head _head;
     MHD_Daemon* _daemon = nullptr;
-    int _descriptor = -1;  ///< of the library: readable when it has something to do
+    int _descriptor = -1;  ///< the library's: readable when it has something to do
     ConnectionLimits _limits;
     std::list<Client> _clients;
     std::optional<Clock::time_point> _acceptAfter;  ///< set while no descriptor is free

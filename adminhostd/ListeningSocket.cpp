@@ -52,7 +52,7 @@ void refuseLivingDaemon(const std::string& path, const sockaddr_un& address) {
     }
     const FileDescriptor probe = newSocket();
     const int connected = ::connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
-    // EAGAIN comes from a living daemon whose backlog is full.
+    // EAGAIN comes from a running daemon whose backlog is full.
     if (connected == 0 || errno == EAGAIN) {
         fail("another daemon serves " + path + "; stop it or choose another path");
     }
@@ -98,7 +98,7 @@ class StartLock {
         }
         return false;
     }
-    /// The daemon that held the lock before has removed its file at the end.
+    /// Returns false if the daemon that held the lock before has removed its file at its end.
     bool isInPlace() const {
         struct stat ours {};
         struct stat there {};
@@ -122,7 +122,7 @@ class SocketDirectory {
     }
 
     [[nodiscard]] std::string socketPath() const { return _path + "/socket"; }
-    /// As short as an address has to be, however long the path is.
+    /// As short as an address must be, however long the path is.
     [[nodiscard]] std::string shortPath() const { return fmt::format("/proc/self/fd/{}/socket", _directory.get()); }
 
   private:

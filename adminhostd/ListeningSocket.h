@@ -11,24 +11,24 @@
 
 namespace adminhost {
 
-/// Why no socket can be at the path, with a suggested fix: its length, or a file that is not a socket. Returns nullopt
-/// for a free path and for a socket, living or dead.
+/// Returns why no socket can be at the path, with a suggested fix: its length, or a file that is not a socket. Returns
+/// nullopt for a free path and for a socket, whether a daemon serves it or not.
 [[nodiscard]] std::optional<std::string> socketPathProblem(const std::string& path);
 
 /// Listens at the path with mode 0660. The socket gets its group and mode in a private directory and is then moved to
-/// its path, so that nobody ever meets it with other rights. A socket that a dead daemon left is replaced; one that a
-/// living daemon serves, and anything that is not a socket, is an error. The path is removed with its owner.
+/// its path, so that it is never reachable with other rights. A socket that a dead daemon left is replaced; one that a
+/// running daemon serves, and anything that is not a socket, is an error. The destructor removes the path.
 class ListeningSocket {
   public:
     static constexpr gid_t sameGroup = static_cast<gid_t>(-1);
 
-    /// Throws std::runtime_error with what is wrong and a suggested fix.
+    /// Throws std::runtime_error with a description and a suggested fix.
     ListeningSocket(std::string path, gid_t group);
     ListeningSocket(const ListeningSocket&) = delete;
     ListeningSocket& operator=(const ListeningSocket&) = delete;
     ~ListeningSocket() { remove(); }
 
-    /// Hands out the descriptor; the path stays this object's.
+    /// Returns the descriptor and gives up its ownership; the path stays this object's.
     [[nodiscard]] FileDescriptor take() { return std::move(_socket); }
     /// Removes the path, unless another daemon has taken it over.
     void remove() noexcept;

@@ -12,7 +12,7 @@
 namespace adminhost {
 
 void notify(std::string_view state) noexcept {
-    // The protocol is one datagram; the library for it would bring half a dozen others into a small process.
+    // The protocol is one datagram; its library would load half a dozen others into a small process.
     const char* path = std::getenv("NOTIFY_SOCKET");
     sockaddr_un address{};
     const std::size_t length = path == nullptr ? 0 : std::strlen(path);

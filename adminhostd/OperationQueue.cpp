@@ -91,7 +91,7 @@ void OperationQueue::run(std::span<const pollfd> polled) {
 }
 
 void OperationQueue::converse(std::span<const pollfd> polled) {
-    // Asked first: what a worker sent before its end is read in any case.
+    // Checked first: then everything that the worker sent before its end is still read below.
     const bool ended = _worker->mayHaveEnded(polled) && _worker->ending();
     if (!ended && !_worker->mayConverse(polled)) {
         return;
@@ -109,7 +109,7 @@ void OperationQueue::converse(std::span<const pollfd> polled) {
     if (same() && _worker->broken()) {
         endWorker("sent what cannot be read");
     } else if (same() && ended && !more) {
-        const std::string how = *_worker->ending();  // the worker itself goes with its end
+        const std::string how = *_worker->ending();  // a copy, because the worker is destroyed below
         workerEnded(how);
     }
 }
@@ -258,7 +258,7 @@ void OperationQueue::begin(Operation operation) {
         const auto left = std::chrono::ceil<std::chrono::milliseconds>(*operation.until - now);
         perform->milliseconds = static_cast<std::uint64_t>(left.count());
     }
-    // A change may have to be sent again.
+    // Kept for a change, which may have to be sent again.
     const auto frame = protocol::frameOf(operation.changes ? operation.order : std::exchange(operation.order, {}));
     if (!_worker->send(frame)) {
         _events.finished(operation, Unserved{Unserved::Reason::tooLarge, "The request is too large to be passed on."});

@@ -1,11 +1,11 @@
 #pragma once
 
-// The queue of operations and the worker that runs them: one at a time, in the order of their arrival. Only while
-// another process holds the lock for changes (WriteLock.h) does what reads overtake what changes.
+// The queue of operations and the worker that runs them: one at a time, in the order of their arrival. Operations that
+// only read overtake changes only while another process holds the lock for changes (WriteLock.h).
 //
-// A worker that crashes, overruns the deadline or breaks the protocol costs the operation that it was running; the next
-// worker runs the others. One that does not even start costs all that are waiting, and is started again after a pause
-// that grows.
+// If a worker crashes, overruns the deadline or breaks the protocol, the operation that it was running fails; the next
+// worker runs the others. If a worker does not even start, all waiting operations fail, and the next start follows
+// after a pause that grows.
 
 #include "adminhostd/Protocol.h"
 #include "adminhostd/RequestLog.h"
@@ -30,18 +30,18 @@ struct Operation {
     std::chrono::milliseconds deadline = {};      ///< its own; zero: the queue's
     bool changes = false;                         ///< the worker runs it only while it holds the lock for changes
     std::optional<protocol::Answer> locked = {};  ///< of the last worker that did not get the lock
-    /// The end of its time, from its first start on.
+    /// The end of its time, counted from its first start.
     std::optional<std::chrono::steady_clock::time_point> until = {};
 };
 
-/// Why an operation ended without an answer of a worker.
+/// Why an operation ended without a worker's answer.
 struct Unserved {
     enum class Reason {
         failed,       ///< the worker died, or broke the protocol
-        tooLarge,     ///< the request does not fit a frame
+        tooLarge,     ///< the request does not fit into a frame
         overrun,      ///< the deadline passed
-        unavailable,  ///< no worker starts
-        stopping,     ///< the daemon ends
+        unavailable,  ///< no worker could be started
+        stopping,     ///< the daemon is stopping
         abandoned,    ///< the client went away before its turn
     };
     Reason reason = Reason::failed;
@@ -65,7 +65,7 @@ class OperationQueue {
 
     OperationQueue(Settings settings, Events events);
 
-    /// Whether no further operation may wait.
+    /// Returns true if no further operation may wait.
     [[nodiscard]] bool full() const noexcept {
         const bool runsAtOnce = _state == State::idle && _waiting.empty();
         return !runsAtOnce && _waiting.size() >= _settings.limit;
@@ -74,17 +74,18 @@ class OperationQueue {
     [[nodiscard]] const Operation* running() const noexcept { return _running ? &*_running : nullptr; }
     [[nodiscard]] std::size_t waiting() const noexcept { return _waiting.size(); }
     [[nodiscard]] std::optional<pid_t> workerPid() const;
-    /// Whether the first worker has said hello, or could not.
+    /// Returns true once the first worker has said hello, or has failed to.
     [[nodiscard]] bool settled() const noexcept { return _settled; }
 
-    /// Ends what is waiting. A running operation that changes something has its whole time: half of a change is worse
-    /// than a late end. Another one has the time of the bound. Then no worker is started any more.
+    /// Fails the waiting operations. A running operation that changes something keeps its whole time, because half of a
+    /// change is worse than a late end. Another one has the time of the bound. No worker is started after that.
     void stop(std::chrono::milliseconds bound);
     [[nodiscard]] bool stopped() const noexcept { return _stopping && !_running; }
 
     void addTo(std::vector<pollfd>& entries) const;
     [[nodiscard]] std::optional<std::chrono::steady_clock::time_point> due() const { return _due; }
-    /// Does what can be done without waiting, after a poll of these entries: addTo() has added the queue's.
+    /// Does everything that needs no waiting. Called after a poll of these entries, to which addTo() has added the
+    /// queue's.
     void run(std::span<const pollfd> polled);
 
   private:
@@ -95,7 +96,7 @@ class OperationQueue {
     void startFailed(const std::string& reason);
     void converse(std::span<const pollfd> polled);
     void receive(Frame frame);
-    /// Each returns whether the message was expected.
+    /// Each returns true if the message was expected.
     bool take(protocol::Hello hello);
     bool take(const protocol::Log& log);
     bool take(const Change& change);
@@ -105,8 +106,8 @@ class OperationQueue {
     void workerEnded(const std::string& how);
     void timeUp();
     void next();
-    /// The first operation that may run now, or the end: while another process holds the lock for changes, a change and
-    /// those behind it wait, and what only reads goes on.
+    /// The first operation that may run now, or the end. While another process holds the lock for changes, a change and
+    /// the changes behind it wait, and operations that only read go on.
     [[nodiscard]] std::deque<Operation>::iterator nextToRun();
     void begin(Operation operation);
     void waitForLock(protocol::Answer answer);

@@ -55,7 +55,7 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
             throw std::runtime_error(options.root + " is not a directory; create it or correct --root");
         }
         const DiskPath standard = diskPath(HostPath(defaultConfiguration));
-        // It names what is loaded into the daemon, so the same rules hold for it as for plug-ins.
+        // It names the files that are loaded into the daemon, so the same rules apply to it as to plug-ins.
         const auto problem = !configuration.empty() ? openToEverybody(DiskPath(configuration))
                              : exists(standard)     ? distrust(standard)
                                                     : std::nullopt;

@@ -1,6 +1,6 @@
 #pragma once
 
-// How the daemon is set up: its command line and its configuration file.
+// The daemon's options: its command line and its configuration file.
 
 #include "platform/files/Path.h"
 #include "platform/value/Value.h"
@@ -14,7 +14,7 @@ namespace adminhost {
 
 struct Options {
     std::string root = "/";
-    std::vector<DiskPath> plugins;  ///< instead of the plug-in directory's, when there are any
+    std::vector<DiskPath> plugins;  ///< instead of the plug-in directory's, if there are any
     HostPath pluginDirectory{"/usr/lib/adminhostd/plugins"};
     HostPath runDirectory{"/run/adminhostd"};
     std::optional<DiskPath> socket;               ///< instead of the one in the run directory
@@ -28,16 +28,16 @@ struct Options {
     bool check = false;
 };
 
-/// Reads both; the command line wins. Sets the system root. A relative root or plug-in is below the current
-/// directory. Returns nullopt when the daemon must exit at once, because help or a mistake was printed; then status is
-/// the exit status.
+/// Reads both; the command line wins. Sets the system root. A relative root or plug-in is below the current directory.
+/// Returns nullopt if the daemon must exit at once, because help or an error was printed; then status is the exit
+/// status.
 [[nodiscard]] std::optional<Options> readOptions(int count, const char* const* arguments, int& status);
 
-/// Applies a configuration file to the options. Throws std::runtime_error with file, line, what is wrong and a
+/// Applies a configuration file to the options. Throws std::runtime_error with the file, the line, a description and a
 /// suggested fix.
 void readConfiguration(const std::string& file, Options& options);
 
-/// The languages that the environment names, the most wanted first.
+/// The languages that the environment names, the preferred one first.
 [[nodiscard]] Array languagesOfEnvironment();
 
 }  // namespace adminhost

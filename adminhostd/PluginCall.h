@@ -1,6 +1,6 @@
 #pragma once
 
-// Calling a plug-in: nothing that it throws reaches the host.
+// Calling a plug-in: no exception of a plug-in reaches the host.
 
 #include "platform/value/Result.h"
 
@@ -19,7 +19,7 @@ struct ResultOf<Result<T>> {
     using Type = Result<T>;
 };
 
-/// Calls a function that runs code of a plug-in, and returns its result. What it throws becomes an error with the
+/// Calls a function that runs code of a plug-in, and returns its result. If it throws, returns an error with the
 /// exception's text.
 template <class Function>
 [[nodiscard]] auto callPlugin(Function&& function) -> typename ResultOf<std::invoke_result_t<Function>>::Type {

@@ -15,7 +15,8 @@ namespace adminhost {
 /// own account) and must not be writable by group or others. nullopt if it is trusted.
 [[nodiscard]] std::optional<std::string> distrust(const DiskPath& path);
 
-/// Returns that everybody may write to the file, with a suggested fix; nullopt if not, or if the file does not exist.
+/// Returns a warning, with a suggested fix, if everybody may write to the file; nullopt if not, or if the file does not
+/// exist.
 [[nodiscard]] std::optional<std::string> openToEverybody(const DiskPath& path);
 
 /// The plug-ins (*.so) of a directory in the order of their names; nullopt, with errno, if it cannot be read.
@@ -26,15 +27,15 @@ namespace adminhost {
 [[nodiscard]] Result<std::string> buildIdentityOf(const DiskPath& file);
 
 struct LoadedPlugin {
-    Plugin* plugin = nullptr;  ///< lives as long as the process
+    Plugin* plugin = nullptr;  ///< valid until the process ends
     std::string name;
     std::string version;
     std::vector<Command> commands;
 };
 
 /// Loads a plug-in whose note has this build's identity, and asks it for its name, version and commands. The error's
-/// description names the file, what is wrong and the fix: the note is another one, the file cannot be loaded or has no
-/// entry point, or name or commands cannot be used in addresses. A loaded file stays loaded, also after an error.
+/// description names the file, what is wrong and the fix: the note is a different one, the file cannot be loaded or has
+/// no entry point, or name or commands cannot be used in addresses. A loaded file stays loaded, also after an error.
 [[nodiscard]] Result<LoadedPlugin> loadPlugin(const DiskPath& file);
 
 }  // namespace adminhost

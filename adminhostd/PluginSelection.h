@@ -11,11 +11,11 @@ namespace adminhost {
 
 struct PluginSelection {
     std::vector<DiskPath> files;
-    std::vector<protocol::RefusedPlugin> refused;  ///< not trustworthy, or not readable
+    std::vector<protocol::RefusedPlugin> refused;  ///< not trusted, or not readable
 };
 
-/// Selects the plug-ins that are named in the options (refused only when everybody may write them), or else those of
-/// the plug-in directory, which must be trustworthy as a whole.
+/// Selects the plug-ins that are named in the options (refused only if everybody may write to them), or else those of
+/// the plug-in directory, which must be trusted as a whole.
 [[nodiscard]] PluginSelection selectPlugins(const Options& options);
 
 }  // namespace adminhost

@@ -65,7 +65,7 @@ class Trial {
     std::optional<std::string> finish(Clock::time_point until);
 
   private:
-    /// Kills what is left of the process group, before its number can be another's, and reaps the child.
+    /// Kills the rest of the process group, before its number can be another's, and reaps the child.
     int end() {
         int status = 0;
         if (_child.pid > 0) {
@@ -128,7 +128,7 @@ std::vector<std::optional<std::string>> tryPlugins(const std::vector<DiskPath>& 
 }
 
 int serveTrial(const char* file) {
-    // A worker that is killed meanwhile cannot end this process.
+    // A worker that is killed in the meantime cannot end this process.
     ::prctl(PR_SET_PDEATHSIG, SIGKILL);
     ::alarm(lonelySeconds);
     const rlimit none{0, 0};
@@ -141,7 +141,7 @@ int serveTrial(const char* file) {
     const std::string text = loaded ? std::string(1, usable) : unusable + textOf(loaded.error().description);
     const std::size_t size = std::min(text.size(), reasonMaximum);
     const bool sent = ::write(resultDescriptor, text.data(), size) == static_cast<ssize_t>(size);
-    // Without destructors of the plug-in.
+    // Skips the destructors of the plug-in.
     ::_exit(sent ? 0 : 1);
 }
 

@@ -37,7 +37,7 @@ FileDescriptor createPrivateDirectory(const std::string& parent, std::string& pa
         if (held.isOpen()) {
             return held;
         }
-        // Another daemon that has just started has removed it, because nobody held it yet.
+        // Another daemon that has just started has removed it, because no process held it yet.
         if (errno != ENOENT) {
             throw std::system_error(errno, std::generic_category(), "cannot use " + path);
         }

@@ -8,11 +8,12 @@
 
 namespace adminhost {
 
-/// Creates a directory of mode 0700 and an unpredictable name in the parent, and stores its path. While the descriptor,
-/// or one of holdDirectory(), is open, removeAbandonedDirectories() leaves it alone. Throws std::system_error.
+/// Creates a directory of mode 0700 and an unpredictable name in the parent, and stores its path. As long as the
+/// descriptor, or one of holdDirectory(), is open, removeAbandonedDirectories() leaves the directory alone. Throws
+/// std::system_error.
 [[nodiscard]] FileDescriptor createPrivateDirectory(const std::string& parent, std::string& path);
 
-/// As above, for another process that uses the directory. Empty if it does not exist.
+/// As above, for another process that uses the directory. Returns an empty descriptor if it does not exist.
 [[nodiscard]] FileDescriptor holdDirectory(const std::string& path);
 
 /// Removes the private directories in the parent that no process holds.

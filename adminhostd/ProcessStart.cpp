@@ -28,7 +28,7 @@ void resetSignals() noexcept {
 
 void tidyDescriptors() noexcept {
     if (!openStandardDescriptors()) {
-        ::_exit(EXIT_FAILURE);  // there is nowhere to say why
+        ::_exit(EXIT_FAILURE);  // there is nowhere to report why
     }
     ::close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC);
 }

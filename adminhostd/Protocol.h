@@ -3,7 +3,7 @@
 // The messages between front and worker: one struct for each.
 //
 // They travel as frames (Frame.h). Dictionaries are only their encoding, which Protocol.cpp alone knows. Decoding is
-// strict: an unknown word, a missing or surplus member and a value of another type are errors, and the peer that sent
+// strict: an unknown word, a missing or surplus member and a value of another type are errors, and a peer that sent
 // them is ended.
 
 #include "adminhostd/Frame.h"
@@ -25,15 +25,14 @@
 
 namespace adminhost::protocol {
 
-/// What the worker made of a request. What the front itself makes of one that no worker finished is in
-/// OperationQueue.h.
+/// The outcome of a request in the worker. For the outcomes of requests that no worker finished see OperationQueue.h.
 enum class Outcome {
     nothing,   ///< the operation returned nothing
     answered,  ///< bytes: the answer
     error,     ///< error, message; bytes: the error response
     later,     ///< error, message: it was not possible to run it now; the same request may be sent again
     refused,   ///< findings, never empty: the plug-in's check refuses the request
-    conflict,  ///< none of the revisions holds
+    conflict,  ///< none of the revisions is the present one
     overrun,   ///< the deadline passed
     locked,    ///< message: another process holds the lock for changes; nothing was done
     broken,    ///< message: the worker could not do it
@@ -68,11 +67,11 @@ struct Perform {
     Caller caller;
     Date received;
     Dictionary arguments;
-    std::vector<std::string> revisions;  ///< one of them must hold; empty: no condition
+    std::vector<std::string> revisions;  ///< one of them must be the present one; empty: no condition
     bool showsRevision = false;          ///< the answer is to carry the revision
     bool keepsHistory = false;           ///< the settings are to be kept before it runs
     std::uint64_t milliseconds = 0;      ///< until its deadline
-    BodyForm form = BodyForm::json;      ///< that the client wants
+    BodyForm form = BodyForm::json;      ///< that the client prefers
     bool operator==(const Perform&) const = default;
 };
 
@@ -108,7 +107,7 @@ struct RefusedPlugin {
     bool operator==(const RefusedPlugin&) const = default;
 };
 
-/// The answer to Configure.
+/// The reply to Configure.
 struct Hello {
     std::vector<OfferedPlugin> plugins;
     std::vector<RefusedPlugin> refused;
@@ -123,7 +122,7 @@ struct Log {
     bool operator==(const Log&) const = default;
 };
 
-/// The answer to Perform, FindAccounts and ReadHistory.
+/// The reply to Perform, FindAccounts and ReadHistory.
 struct Answer {
     Outcome outcome = Outcome::broken;
     std::string error;               ///< a code
@@ -139,7 +138,7 @@ using ToFront = std::variant<Hello, Log, Change, NotDone, Answer>;
 
 [[nodiscard]] Frame frameOf(ToWorker message);
 [[nodiscard]] Frame frameOf(ToFront message);
-/// The message of a frame. Error: the frame is not exactly one message to this side.
+/// The message of a frame. Fails if the frame is not exactly one message to this side.
 [[nodiscard]] Result<ToWorker> toWorker(Frame frame);
 [[nodiscard]] Result<ToFront> toFront(Frame frame);
 

@@ -73,7 +73,7 @@ std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyPr
 bool prefersPropertyList(std::string_view accept) {
     double list = 0;
     double json = 0;
-    double other = 0;  // of a range, which stands for what is not named itself
+    double other = 0;  // of a range such as "*/*", for types that are not named themselves
     bool jsonIsNamed = false;
     while (!accept.empty()) {
         const std::size_t end = std::min(accept.find(','), accept.size());
@@ -89,7 +89,7 @@ bool prefersPropertyList(std::string_view accept) {
             }
         }
         if (same(type, "application/x-plist")) {
-            // Named second with the same weight, it is the second wish.
+            // If it is named second with the same weight, it is the second choice.
             list = jsonIsNamed && weight <= json ? 0 : weight;
         } else if (same(type, "application/json")) {
             json = weight;
@@ -108,7 +108,7 @@ std::optional<std::vector<std::string>> revisionsOf(std::string_view ifMatch) {
         return revisions;
     }
     if (ifMatch.empty()) {
-        return std::nullopt;  // a condition that cannot be checked: never as if there were none
+        return std::nullopt;  // a condition that cannot be checked must not be treated as none
     }
     while (!ifMatch.empty()) {
         const std::size_t end = ifMatch.find('"', 1);

@@ -1,6 +1,6 @@
 #pragma once
 
-// What a client sends with a request: its body, its wishes and its conditions.
+// The parts of a client's request: its body, its preferred form and its conditions.
 
 #include "platform/value/Value.h"
 
@@ -12,8 +12,8 @@
 
 namespace adminhost {
 
-/// Values in one body: a small dictionary takes ten bytes of it and a kilobyte of memory, so its bytes alone bound
-/// nothing.
+/// The maximum of values in one body. A small dictionary is ten bytes in it and a kilobyte in memory, so a bound on
+/// bytes alone would not bound the memory.
 constexpr std::size_t bodyValuesMaximum = 100'000;
 
 enum class BodyForm { json, propertyList };
@@ -26,14 +26,14 @@ struct BodyProblem {
     std::string text;            ///< with line and column
 };
 
-/// The request dictionary of a body; an empty one for an empty body. Returns nullopt, with the problem, when the body
-/// is not a dictionary.
+/// The request dictionary of a body; an empty one for an empty body. Returns nullopt, with the problem, if the body is
+/// not a dictionary.
 [[nodiscard]] std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem);
 
 /// Returns true when an Accept header prefers a property list to JSON, by a higher weight or by naming it first.
 [[nodiscard]] bool prefersPropertyList(std::string_view accept);
 
-/// The revisions that an If-Match header lists; an empty list for "*". Returns nullopt when the header is malformed, or
+/// The revisions that an If-Match header lists; an empty list for "*". Returns nullopt if the header is malformed or
 /// empty.
 [[nodiscard]] std::optional<std::vector<std::string>> revisionsOf(std::string_view ifMatch);
 

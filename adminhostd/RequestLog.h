@@ -1,6 +1,6 @@
 #pragma once
 
-// What the daemon remembers of the latest requests for operations.
+// The log of requests: the latest requests for operations, with their events and reports.
 
 #include "adminhostd/Http.h"
 #include "platform/framework/Report.h"
@@ -17,8 +17,8 @@
 
 namespace adminhost {
 
-/// One request, from its arrival on. Of the values in requests and answers it holds those that are reported as changed,
-/// never a secret.
+/// One request, from its arrival on. Of the values in requests and answers it holds only those that are reported as
+/// changed, never a secret.
 struct RequestRecord {
     enum class State { waiting, running, done };
 
@@ -39,18 +39,18 @@ struct RequestRecord {
     unsigned status = 0;
     std::string error;  ///< the code of an answer that is an error
 
-    // Beyond the bounds above, events and reports are only counted.
+    // Above these bounds, events and reports are only counted.
     void add(std::string_view event);
     void add(const Change& change);
     void add(const NotDone& part);
 
-    /// How many were reported, including those that were not kept.
+    /// The number of reports, including those that were not kept.
     [[nodiscard]] std::size_t changes() const noexcept { return _changes.reported; }
     [[nodiscard]] std::size_t notDone() const noexcept { return _notDone.reported; }
     [[nodiscard]] std::size_t reportBytes() const noexcept { return _reportBytes; }
 
-    /// The form that clients get. The reports are for the account that sent the request, and for those that may read
-    /// every request's.
+    /// The form that clients get. The reports are for the account that sent the request, and for accounts that may read
+    /// the reports of every request.
     [[nodiscard]] Dictionary describe(bool withReports) const;
 
   private:
@@ -74,15 +74,15 @@ class RequestLog {
     static constexpr std::size_t reportBytesMaximum = std::size_t{64} << 20U;  ///< of all records together
     static constexpr std::size_t usedMaximum = 10'000;  ///< ids of clients that are not accepted again
 
-    /// A record that is not remembered.
+    /// A record that is not added to the log.
     [[nodiscard]] static std::shared_ptr<RequestRecord> begin(const Exchange& exchange);
-    /// Begins a record. The oldest one is forgotten, and more of them if their reports take too much memory.
+    /// Adds a record. The oldest one is dropped, and more of them if their reports use too much memory.
     std::shared_ptr<RequestRecord> add(const Exchange& exchange);
     void add(std::shared_ptr<RequestRecord> record);
-    /// Upper and lower case are one in an id.
+    /// Finds a record by its id; upper and lower case are equal.
     [[nodiscard]] const RequestRecord* find(std::string_view id) const;
 
-    /// Marks a client's id as used. Returns false if it was already.
+    /// Marks a client's id as used. Returns false if it was used already.
     [[nodiscard]] bool use(std::string_view id);
 
   private:
@@ -91,7 +91,8 @@ class RequestLog {
     std::unordered_set<std::string> _used;
 };
 
-/// Whether a text is a UUID in its canonical form: 32 hexadecimal digits of either case with hyphens (8-4-4-4-12).
+/// Returns true if the text is a UUID in its canonical form: 32 hexadecimal digits of either case with hyphens
+/// (8-4-4-4-12).
 [[nodiscard]] bool isCanonicalUuid(std::string_view text) noexcept;
 
 }  // namespace adminhost

@@ -11,7 +11,7 @@ std::string socketPath(const Options& options) {
     }
     const std::string directory = diskPath(options.runDirectory).text();
     std::error_code ignored;
-    // A failure shows when the socket is created.
+    // A failure is reported when the socket is created.
     std::filesystem::create_directories(directory, ignored);
     return directory + "/adminhostd.sock";
 }

@@ -1,6 +1,6 @@
 #pragma once
 
-// Where the daemon's socket and its private directories are.
+// The places of the daemon's socket and its private directories.
 
 #include "adminhostd/Options.h"
 
@@ -8,7 +8,7 @@
 
 namespace adminhost {
 
-/// The socket's path on disk. The run directory is created when the socket is to be in it and it is missing.
+/// The socket's path on disk. If it is in the run directory and that is missing, the directory is created.
 [[nodiscard]] std::string socketPath(const Options& options);
 
 /// Where private directories are created: beside the socket. Never in the system's directory for temporary files, from

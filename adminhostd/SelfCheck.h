@@ -1,6 +1,6 @@
 #pragma once
 
-// adminhostd --check: what would keep the daemon from working here.
+// adminhostd --check: finds everything that would keep the daemon from working here.
 
 #include "adminhostd/Options.h"
 

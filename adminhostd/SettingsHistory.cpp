@@ -153,7 +153,7 @@ std::optional<Error> copy(const std::vector<HostPath>& files, const HostPath& en
         }
         const auto bytes = readFile(diskPath(files[i]), plistMaximumSize);
         if (!bytes) {
-            // What cannot be read is kept by the operation that replaces it; the other files still have their entry.
+            // The operation that replaces an unreadable file keeps it; the entry has the other files.
             continue;
         }
         const std::string name = std::to_string(i) + ".plist";

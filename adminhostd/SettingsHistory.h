@@ -1,15 +1,15 @@
 #pragma once
 
-// The history of a plug-in's settings and resources, for an administrator who wants to look or go back.
+// The history of a plug-in's settings and resources, for an administrator who wants to see or undo earlier changes.
 //
 // An entry of the settings holds their values before a write, who wrote when, the settings files byte for byte and,
-// once the write is over, what it changed. It is kept before the write, so that one that is killed has its entry too; a
-// write that changed no setting has none. An edit that was made outside the daemon since the last write gets an entry
-// of its own. An entry of the resources holds the changes that one request reported.
+// once the write is over, what it changed. It is stored before the write, so that a write that is killed has its entry
+// too; a write that changed no setting has none. An edit that was made outside the daemon since the last write gets an
+// entry of its own. An entry of the resources holds the changes that one request reported.
 //
-// Entries are numbered from 1 and never renumbered. The directory can be entered by root alone. Secrets are kept as
-// keyed digests, which show that they changed; their values appear only in the copies of the files, as the service
-// stores them. Each entry names the format it is written in: older ones are read, newer ones are skipped.
+// Entries are numbered from 1 and never renumbered. Only root can enter the directory. Secrets are stored as keyed
+// digests, which show that they changed; their values are only in the copies of the files, as the service stores them.
+// Each entry names the format it is written in: older ones are read, newer ones are skipped.
 
 #include "platform/files/Path.h"
 #include "platform/framework/Plugin.h"
@@ -30,7 +30,7 @@ class SettingsHistory {
   public:
     static constexpr std::size_t settingsMaximum = 50;    ///< entries
     static constexpr std::size_t resourcesMaximum = 500;  ///< entries
-    static constexpr std::int64_t format = 2;             ///< that is written here
+    static constexpr std::int64_t format = 2;             ///< that this release writes
 
     /// `settings` are the keys that entries hold, secret ones marked.
     SettingsHistory(std::string_view plugin, std::vector<Setting> settings);
@@ -39,10 +39,11 @@ class SettingsHistory {
     /// "who", ...). Returns its number. On failure there is no new entry.
     [[nodiscard]] Result<std::uint64_t> keep(const std::vector<HostPath>& files, const Dictionary& values,
                                              const Dictionary& about) const;
-    /// Adds to the entry what the write changed; removes it if that is nothing.
+    /// Adds to the entry the changes that the write made; removes the entry if there are none.
     [[nodiscard]] std::optional<Error> complete(std::uint64_t number, const Dictionary& values) const;
-    /// Adds an entry of the resources with these changes; those of the section "settings" are left out, and without
-    /// others there is no entry. First, a value that has become secret is replaced by "(secret)" in all kept entries.
+    /// Adds an entry of the resources with these changes. Those of the section "settings" are left out; if there are no
+    /// others, no entry is added. Before that, a value that has become secret is replaced by "(secret)" in all stored
+    /// entries.
     [[nodiscard]] std::optional<Error> keepResources(const std::vector<Change>& changes, const Dictionary& about) const;
 
     /// The entries, oldest first: `about` with "number", "settings" (a secret's value is "(secret)") and, for a write
@@ -53,12 +54,12 @@ class SettingsHistory {
     /// The same for the resources: `about` with "number" and "changes", as requests report them.
     [[nodiscard]] Array resourceEntries() const;
 
-    /// Removes what a process that was killed while it added an entry left; keep() does so too. No entry of another
-    /// process may be in the making.
+    /// Removes the remains of a process that was killed while it added an entry; keep() does so too. No other process
+    /// may be adding an entry at the same time.
     void removeUnfinished() const;
 
   private:
-    /// The values as they are kept: "settings", and "digests" of the secret ones.
+    /// The values in their stored form: "settings", and "digests" of the secret ones.
     [[nodiscard]] Result<Dictionary> snapshotOf(const Dictionary& values) const;
     [[nodiscard]] Result<std::string> digestKey() const;
     [[nodiscard]] std::optional<Error> keepOutsideEdit(const Dictionary& snapshot, const Dictionary& about) const;

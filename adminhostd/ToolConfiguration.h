@@ -12,11 +12,11 @@
 
 namespace adminhost {
 
-/// Names the directory for the tools. Each plug-in's tools get a subdirectory of it.
+/// The variable that names the directory for the tools. Each plug-in's tools get a subdirectory of it.
 constexpr const char* toolConfigurationVariable = "XDG_CONFIG_HOME";
 
-/// A private directory below the given one, in place of the account's: what an account keeps there could change what
-/// tools print. Removed with this object.
+/// A private directory below the given one, used in place of the account's: files of an account could change the output
+/// of tools. Removed with this object.
 class ToolConfiguration {
   public:
     /// Throws std::system_error if the directory cannot be created.

@@ -103,7 +103,8 @@ class Worker {
     std::optional<int> serve(protocol::ToWorker message);
     protocol::Hello configure(const protocol::Configure& configuration);
     void load(const DiskPath& file, protocol::Hello& hello);
-    /// Once, and only by a worker that holds the lock for changes: what looks left over may be what another is writing.
+    /// Runs once, and only in a worker that holds the lock for changes: another process may be writing a file that
+    /// looks left over.
     void removeLeftovers();
 
     protocol::Answer answer(const protocol::Perform& order);
@@ -115,7 +116,7 @@ class Worker {
     [[nodiscard]] Probe ask(const LoadedPlugin& loaded, const std::string& need, Clock::duration bound) const;
     [[nodiscard]] std::optional<protocol::Answer> unmetNeed(const LoadedPlugin& loaded,
                                                             const protocol::Perform& order) const;
-    /// The entry of the history that a write begins with; nullopt, with a report, if there is none.
+    /// Adds the entry of the history with which a write begins; nullopt, with a report, if that fails.
     [[nodiscard]] static std::optional<std::uint64_t> keepHistory(const LoadedPlugin& loaded, const Dictionary& about);
     void completeHistory(const LoadedPlugin& loaded, std::optional<std::uint64_t> entry, const Dictionary& about);
     [[nodiscard]] const LoadedPlugin* pluginNamed(std::string_view name) const;
@@ -414,7 +415,7 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
             return answer;
         }
         held.emplace(*std::move(lock));
-        // A worker that was stopped may have slept through the end of its front, and later writes of another worker.
+        // A worker that was stopped may have missed the end of its front, and later writes of another worker.
         if (isClosed(_descriptor)) {
             return broken("The daemon that sent the request has ended.");
         }
@@ -453,7 +454,7 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
                                  textOf(now.error().description)));
         }
     }
-    // A tool that was killed at the deadline makes an answer that misleads: only the overrun is reported.
+    // If a tool was killed at the deadline, the answer would mislead: only the overrun is reported.
     if (Clock::now() >= deadline) {
         answer.outcome = Outcome::overrun;
         return answer;
@@ -514,7 +515,7 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
             return 1;
         }
         if (!configuration->tryOnly) {
-            // Only now: a shared file system that hangs may hold up requests, but not the start. If another process
+            // Not earlier: a shared file system that hangs may hold up requests, but not the start. If another process
             // holds the lock, the first write does it.
             if (const auto lock = WriteLock::tryToHold()) {
                 removeLeftovers();
@@ -545,7 +546,7 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
 }
 
 int Worker::run() {
-    // A signal for the whole group or service is the front's to act on: the running operation is to end in peace.
+    // The front acts on a signal for the whole group or service: the running operation must not be interrupted.
     for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGPIPE}) {
         static_cast<void>(std::signal(signal, SIG_IGN));
     }

@@ -2,8 +2,8 @@
 
 // The worker: the process that loads the plug-ins and runs their operations, one at a time.
 //
-// It is started by the front, on the other end of an inherited socket pair, has one thread, and ends when the front
-// closes its end. What the two say to each other is in Protocol.h.
+// The front starts it on the other end of an inherited socket pair. It has one thread, and ends when the front closes
+// its end. Protocol.h describes their messages.
 
 namespace adminhost {
 

@@ -1,6 +1,6 @@
 #pragma once
 
-// What every worker is sent first.
+// The first message to every worker.
 
 #include "adminhostd/Options.h"
 #include "adminhostd/PluginSelection.h"
@@ -10,7 +10,7 @@
 
 namespace adminhost {
 
-/// The tool configuration is the directory in which tools look for their settings.
+/// `toolConfiguration` is the directory in which tools look for their settings.
 [[nodiscard]] protocol::Configure workerConfiguration(const Options& options, const PluginSelection& plugins,
                                                       const std::string& toolConfiguration);
 

@@ -115,7 +115,7 @@ void WorkerProcess::write() {
             continue;
         }
         if (written < 0) {
-            // Full, or gone: then the end of the process tells.
+            // Full, or closed: the end of the process is noticed separately.
             break;
         }
         _sent += static_cast<std::size_t>(written);

@@ -21,37 +21,37 @@ namespace adminhost {
 class WorkerProcess {
   public:
     /// Starts a worker. Operations print to its standard output, which is ours (a service manager keeps it), or our
-    /// standard error where the log goes there. Null, with errno, when it cannot be started.
+    /// standard error if the log goes there. Returns null, with errno, if it cannot be started.
     [[nodiscard]] static std::unique_ptr<WorkerProcess> start(bool outputToStandardError);
 
     WorkerProcess(const WorkerProcess&) = delete;
     WorkerProcess& operator=(const WorkerProcess&) = delete;
-    /// A worker that still runs is killed. One that the kernel cannot end yet (a dead mount) is left to the next
+    /// A worker that is still running is killed. One that the kernel cannot end yet (a dead mount) is left to the next
     /// parent.
     ~WorkerProcess();
 
     [[nodiscard]] pid_t pid() const noexcept { return _pid; }
-    /// What to poll for: first the conversation, then the end of the process.
+    /// Adds the descriptors to poll: first the conversation, then the end of the process.
     void addTo(std::vector<pollfd>& entries) const;
 
-    /// After a poll of these entries: whether converse() has something to do, and whether the process may have ended.
+    /// After a poll of these entries: returns true if converse() has something to do, or if the process may have ended.
     [[nodiscard]] bool mayConverse(std::span<const pollfd> polled) const noexcept;
     [[nodiscard]] bool mayHaveEnded(std::span<const pollfd> polled) const noexcept;
 
     /// Queues a frame and sends what can be sent. Returns false if it is too large.
     [[nodiscard]] bool send(const Frame& frame);
-    /// Reads and writes what can be done without waiting, but not without end: returns true if there may be more to
-    /// read at once.
+    /// Reads and writes what can be done without waiting, up to a bound. Returns true when the bound ended it: call
+    /// again.
     bool converse();
     /// The next frame that has arrived.
     [[nodiscard]] std::optional<Frame> next() { return _reader.next(); }
-    /// Whether the worker has sent bytes that are not a frame.
+    /// Returns true if the worker has sent bytes that are not a frame.
     [[nodiscard]] bool broken() const noexcept { return _reader.broken(); }
-    /// How the process ended ("was killed by signal 11 (Segmentation fault)"); nullopt while it runs. The tools that it
-    /// ran are ended then, but not a service that they have started.
+    /// How the process ended ("was killed by signal 11 (Segmentation fault)"); nullopt while it is running. Ends the
+    /// tools that it ran, but not a service that they have started.
     [[nodiscard]] const std::optional<std::string>& ending();
     void kill() noexcept;
-    /// Asks it to end by closing the conversation, and waits for its end, at most for the milliseconds.
+    /// Makes the worker end by closing the conversation, and waits for it, at most for the milliseconds.
     void finish(int milliseconds);
 
   private:
@@ -59,12 +59,12 @@ class WorkerProcess {
     void write();
 
     pid_t _pid = -1;
-    ToolRegister _tools;  ///< that it runs
+    ToolRegister _tools;  ///< that the worker runs
     FileDescriptor _socket;
     FileDescriptor _process;
     FrameReader _reader;
     std::string _unsent;
-    std::size_t _sent = 0;  ///< how much of it is on its way
+    std::size_t _sent = 0;  ///< how much of it has been sent
     bool _closed = false;
     std::optional<std::string> _ending;
 };

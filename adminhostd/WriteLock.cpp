@@ -104,7 +104,7 @@ Result<WriteLock::Held> WriteLock::tryToHold() {
     const std::string self = std::to_string(::getpid()) + "\n";
     if (::ftruncate(file.get(), 0) != 0 ||
         ::pwrite(file.get(), self.data(), self.size(), 0) != static_cast<ssize_t>(self.size())) {
-        // On a full disk others do not see who holds the lock. It is held all the same.
+        // On a full disk other processes do not see which one holds the lock. It is held all the same.
     }
     return Held(std::move(file));
 }

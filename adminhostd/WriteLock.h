@@ -15,7 +15,7 @@ namespace adminhost {
 
 class WriteLock {
   public:
-    /// While it exists, the lock is held.
+    /// The lock is held as long as the object exists.
     class Held {
       public:
         Held(Held&&) noexcept = default;
