@@ -101,7 +101,7 @@ class LumioPlugin final : public adminhost::Plugin {
                                     : operation->perform(_handler, request);
     }
 
-    /// "database" is all that a command names.
+    /// Commands name no other need than "database".
     adminhost::Probe probe(std::string_view) override { return _databaseTool.probe(); }
 
     std::string revision() override { return lumio::settingsRevision(); }
