@@ -122,7 +122,7 @@ class UnknownKeys {
   private:
     void dictionary(const Dictionary& values, const KeyDescription& key, const std::string& path) {
         if (key.entry != nullptr && changeOf(values, *key.entry) == changeNothing) {
-            return;  // it is there to be shown, as reading returned it
+            return;  // it is only for display, as reading returned it
         }
         for (const adminhost::DictionaryEntry& entry : values) {
             const std::string at = path + '.' + entry.key;
@@ -136,7 +136,7 @@ class UnknownKeys {
         }
     }
 
-    /// Whether reading returns the key, so that a client may send it back unchanged.
+    /// Returns true if reading returns the key, so that a client may send it back unchanged.
     static bool isColumn(std::string_view name, const EntryDescription& entry) {
         return std::find(entry.columns.begin(), entry.columns.end(), name) != entry.columns.end();
     }
@@ -204,7 +204,7 @@ class Check {
         }
         const std::string* text = value.string();
         if (text == nullptr) {
-            return;  // the text forms of numbers, dates and booleans hold nothing that could do harm
+            return;  // the text forms of numbers, dates and booleans cannot do harm
         }
         if ((key.rules & ruleIdentifier) != 0) {
             identifier(*text, path);
@@ -273,7 +273,7 @@ class Check {
         withoutNul(text, path);
     }
 
-    /// The database tool prints values as they are: one that spells out a whole row would be read as that row.
+    /// The database tool prints values unchanged: a value that spells out a whole row would be read as that row.
     void notARow(const std::string& text, const EntryDescription& entry, const std::string& path) {
         std::size_t width = 5;
         for (const std::string_view column : entry.columns) {
@@ -312,7 +312,7 @@ class Check {
         }
     }
 
-    /// Texts that are short enough one by one, but not within one statement.
+    /// Texts that are short enough each, but not within one statement.
     void together(const Dictionary& values, const EntryDescription& entry, const std::string& path) {
         std::size_t sum = 0;
         std::string names;

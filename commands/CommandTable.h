@@ -1,8 +1,8 @@
 #pragma once
 
-// The plug-in's commands as their descriptions (the .toml files of this room) say: the table that requests are checked
-// against, and the form in which the daemon's clients get the descriptions. The tables are constants; everything here
-// may be called at any time.
+// The plug-in's commands as the .toml files of this room describe them: the table that requests are checked against,
+// and the form in which the daemon's clients get the descriptions. The tables are constants; everything here may be
+// called at any time.
 
 #include "platform/framework/Plugin.h"
 #include "platform/value/Value.h"
@@ -15,26 +15,26 @@
 
 namespace lumio {
 
-/// The values that fit a key. A boolean may also come as number or text, because operations read both as booleans;
-/// a real may come as whole number; a scalar is any single value but data.
+/// The values that fit a key. A boolean may also be a number or text, because operations read both as booleans; a real
+/// may be a whole number; a scalar is any single value but data.
 enum class KeyType : std::uint8_t { any, scalar, text, integer, real, boolean, date, data, list, dictionary };
 
-/// What a statement or an argument that carries the value demands of it. Bits.
+/// The rules for a value, because of the statement or argument that it becomes part of. Bits.
 enum Rule : std::uint8_t {
-    ruleStatement = 1U,      ///< stands between double quotes in a statement
+    ruleStatement = 1U,      ///< is put between double quotes in a statement
     ruleNotAColumn = 2U,     ///< is not the name of a column: the database would read the column instead
     ruleRowNumber = 4U,      ///< a whole number in decimal
     ruleIdentifier = 8U,     ///< letters, digits and hyphens
-    ruleArgument = 16U,      ///< stands in a tool's argument of its own
+    ruleArgument = 16U,      ///< is an argument of a tool
     ruleAbsolutePath = 64U,  ///< begins with a slash
-    ruleShortNames = 32U,    ///< the "shortName" entries of the list stand together in one tool's arguments
-    ruleOneLine = 128U,      ///< holds no line feed
+    ruleShortNames = 32U,    ///< the "shortName" entries of the list are together in one tool's arguments
+    ruleOneLine = 128U,      ///< contains no line feed
 };
 
-/// What a change entry does. Bits, so that a key can name those for which it is read.
+/// The effect of a change entry. Bits, so that a key can name those for which it is read.
 enum Change : std::uint8_t { changeNothing = 1U, changeAdded = 2U, changeRemoved = 4U, changeChanged = 8U };
 
-/// How a list's elements say what they do.
+/// The flags by which a list's elements choose their effect.
 struct EntryDescription {
     std::string_view addedBy;                      ///< the flag of an addition; empty when there are none
     std::string_view removedBy;                    ///< the flag of a removal; empty when there are none
@@ -43,7 +43,7 @@ struct EntryDescription {
     Change otherwise;                              ///< what an entry without flags does
     std::span<const std::string_view> addedKinds;  ///< additions of another "type" do nothing; empty: there is no type
     std::span<const std::string_view> columns;     ///< of the table that the entries change
-    std::span<const std::string_view> together;    ///< keys whose texts stand in one statement
+    std::span<const std::string_view> together;    ///< keys whose texts are in one statement
 };
 
 struct KeyDescription {
@@ -51,7 +51,7 @@ struct KeyDescription {
     KeyType type;
     std::uint8_t rules;                        ///< Rule bits
     std::uint8_t readFor;                      ///< Change bits; only told apart within change entries
-    std::span<const std::string_view> with;    ///< read only when one of these stands in the same changed entry
+    std::span<const std::string_view> with;    ///< read only if the same changed entry has one of these
     std::span<const KeyDescription> children;  ///< keys of a dictionary, or the one element description of a list
     const EntryDescription* entry;             ///< for a dictionary that is a change entry, else null
 };
@@ -60,9 +60,9 @@ struct CommandDescription {
     std::string_view name;
     std::string_view summary;
     adminhost::Access access;
-    bool showsRevision;                       ///< its answer carries the settings' revision
+    bool showsRevision;                       ///< its answer includes the settings' revision
     bool takesRevision;                       ///< can be made to depend on a revision
-    std::span<const std::string_view> needs;  ///< what the plug-in is asked about before it runs: "database"
+    std::span<const std::string_view> needs;  ///< names for Plugin::probe(), called before it runs: "database"
     std::int64_t deadlineSeconds;             ///< its own bound; 0: the daemon's
     std::span<const KeyDescription> keys;
 };
@@ -73,18 +73,17 @@ struct CommandDescription {
 /// Null for an unknown name.
 [[nodiscard]] const CommandDescription* findCommand(std::string_view name) noexcept;
 
-/// The descriptions as the daemon hands them on: an array of dictionaries (README.md describes them).
+/// The descriptions in the form that clients get: an array of dictionaries (README.md describes them).
 [[nodiscard]] adminhost::Value describeCommands();
 
-/// Whether the operations can carry the request: everything that is wrong with it, in the order of the descriptions.
-/// Looked at are the types of described keys and, in change entries, the keys that the entry's change reads. Keys that
-/// no description names pass, and so does a missing key: operations answer for those themselves.
+/// Returns everything that is wrong with the request, in the order of the descriptions; empty if the operations can
+/// carry it out. Checks the types of described keys and, in change entries, the keys that the entry's change reads.
+/// Keys that no description names pass, and so does a missing key: operations report those themselves.
 [[nodiscard]] std::vector<adminhost::Finding> checkRequest(std::string_view command,
                                                            const adminhost::Dictionary& request);
 
-/// The key paths within the request's "configuration" that no description names and that are no columns of the table
-/// that an entry changes: operations ignore them. In the request's order. Entries that change nothing are not looked
-/// at.
+/// The key paths within the request's "configuration" that no description names and that are not columns of the table
+/// that an entry changes: operations ignore them. In the request's order. Entries that change nothing are not checked.
 [[nodiscard]] std::vector<std::string> unknownKeys(std::string_view command, const adminhost::Dictionary& request);
 
 /// One step of the descriptions' flat form, from which describeCommands() builds them.
