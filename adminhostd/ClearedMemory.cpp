@@ -1,8 +1,8 @@
 // Memory that front and worker free is cleared first.
 //
-// Requests and answers hold passwords, and parsers, strings and containers copy them to where nobody can clear them by
-// name. The front's and the worker's own new and delete do it for all of them. The plug-ins' memory goes through them,
-// too. Linked into both programs as a source of their own: in an archive it would be left out.
+// Requests and answers hold passwords, and parsers, strings and containers copy them to places that cannot be cleared
+// by name. The front's and the worker's own new and delete do it for all of them. The plug-ins' memory goes through
+// them, too. Linked into both programs as a source of their own: in an archive it would be left out.
 
 #include <cstdlib>
 #include <cstring>

@@ -23,7 +23,7 @@ struct Header {
     std::uint64_t bytes;    ///< length
 };
 
-/// A reader's buffer that once held a large frame gives its memory back.
+/// Above this capacity, a reader's buffer is freed once its content has been read.
 constexpr std::size_t keptCapacity = std::size_t{256} << 10U;
 
 bool fits(const Header& header) {

@@ -29,7 +29,7 @@ HttpAnswer retryLater(std::string_view code, std::string_view message) {
     return answer;
 }
 
-/// The code of an error that the front itself made.
+/// The code of an error that comes from the front itself.
 std::string_view codeOf(const HttpAnswer& answer) {
     const Dictionary* body = answer.status >= 400 && answer.body ? answer.body->dictionary() : nullptr;
     return body == nullptr ? std::string_view() : body->text("error");

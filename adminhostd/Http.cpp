@@ -29,11 +29,12 @@ using namespace std::chrono_literals;
 constexpr int acceptedAtOnce = 64;  ///< connections in one turn, so that a flood of them does not hold up the others
 constexpr auto shortagePause = 1s;  ///< until the next try when no descriptor is free
 constexpr auto logPause = 60s;      ///< between two events about the same kind of refusal
-/// Buffers from this size on are worth being returned to the system when they are freed.
+/// Freed buffers of at least this size are worth returning to the system.
 constexpr std::size_t largeBuffer = std::size_t{1} << 20U;
 constexpr std::size_t headMaximum = std::size_t{32}
                                     << 10U;  ///< bytes of a request's head and what the library keeps with it
-/// A body of unknown length that has outgrown the bound is read away up to here, so that the client gets its answer.
+/// A body of unknown length that exceeds the bound is read and dropped up to this size, so that the client gets its
+/// answer.
 constexpr std::size_t discardMaximum = 4 * bodyMaximum;
 
 // The library takes a connection over at once, and reports it, only if it knows that no other thread calls it. Before
@@ -59,7 +60,7 @@ std::size_t descriptorMaximum() noexcept {
     return ::getrlimit(RLIMIT_NOFILE, &bound) == 0 ? bound.rlim_cur : 0;
 }
 
-/// True when nothing of the kind has been logged lately: clients must not be able to fill the log.
+/// Returns true if no event of this kind has been logged lately: clients must not be able to fill the log.
 bool worthLogging(std::optional<std::chrono::steady_clock::time_point>& last) {
     const auto now = std::chrono::steady_clock::now();
     if (last && now - *last < logPause) {
@@ -85,7 +86,7 @@ std::string pathOf(std::string_view target) {
     return target.empty() ? "/" : std::string(target);
 }
 
-/// The connection is closed after it: where one request ends and the next begins may be in doubt.
+/// Closes the connection after the answer, because the end of the request may be in doubt.
 HttpAnswer malformed(const char* message) {
     return {400, Dictionary{{"error", "MALFORMED_HEAD"}, {"message", message}}, {{"Connection", "close"}}};
 }
@@ -109,7 +110,7 @@ std::vector<std::string_view> headersOf(MHD_Connection* connection, const char* 
     return std::move(found.values);
 }
 
-/// Rejects what is wrong in the head of a request and what the library accepts all the same.
+/// Rejects errors in the head of a request that the library accepts.
 std::optional<HttpAnswer> headRefusal(MHD_Connection* connection, std::string_view version) {
     if (version == MHD_HTTP_VERSION_1_1 && !headerOf(connection, MHD_HTTP_HEADER_HOST)) {
         return malformed("The Host header is missing; send one, with any value.");
@@ -191,7 +192,7 @@ void Exchange::answer(HttpAnswer answer) {
     }
 }
 
-/// What the library calls: no exception may reach it.
+/// The library's callbacks: no exception may leave them.
 struct HttpServer::Callbacks {
     static MHD_Result access(void* context, MHD_Connection* connection, const char* url, const char* method,
                              const char* version, const char* data, std::size_t* size, void** place) {
@@ -345,7 +346,7 @@ bool HttpServer::acceptOne() {
     return true;
 }
 
-/// The request is not waited for: the answer is there when the client reads.
+/// The answer is sent without waiting for the request: it is there when the client reads.
 void HttpServer::refuse(int socket, uid_t uid) {
     if (worthLogging(_refusalLogged)) {
         logEvent(fmt::format("adminhostd: uid {} has too many connections open; further ones are refused", uid));

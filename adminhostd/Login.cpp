@@ -12,7 +12,7 @@
 namespace adminhost {
 namespace {
 
-/// What the kernel shows for a process that no login session started.
+/// The value that the kernel shows for a process that no login session started.
 constexpr uid_t noSession = static_cast<uid_t>(-1);
 
 std::optional<uid_t> sessionOf(pid_t pid) {

@@ -72,7 +72,7 @@ std::optional<std::string> unusableName(const std::vector<Command>& commands) {
     return std::nullopt;
 }
 
-/// Whether clients can be sent it: every text is UTF-8, and it is not nested without end.
+/// Returns true if it can be sent to clients: every text is UTF-8, and its nesting is bounded.
 bool isPresentable(const Value& value, int depth) {
     if (depth > depthMaximum) {
         return false;

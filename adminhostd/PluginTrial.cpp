@@ -30,7 +30,7 @@ constexpr unsigned lonelySeconds = 60;       ///< after which a trial that nobod
 constexpr char usable = '+';
 constexpr char unusable = '-';
 
-/// One child. It is ended and reaped with this object at the latest.
+/// One child process. The destructor ends and reaps it.
 class Trial {
   public:
     explicit Trial(const DiskPath& file) : _file(file) {

@@ -11,7 +11,7 @@
 namespace adminhost {
 namespace {
 
-/// Only what is ignored can be inherited. A handler is the sanitizer's own.
+/// Changes ignored signals only, because only that can be inherited. A handler is the sanitizer's own.
 void resetSignals() noexcept {
     struct sigaction standard {};
     standard.sa_handler = SIG_DFL;

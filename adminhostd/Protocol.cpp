@@ -346,7 +346,7 @@ Frame encodedFrame(auto message) {
         std::move(message));
 }
 
-/// Fills the alternative of the frame's type; false if there is none of it.
+/// Fills the alternative of the frame's type; returns false if no alternative has that type.
 template <class T>
 bool decodeAs(Frame& frame, auto& message, Decoder& decoder, bool& fits) {
     if (frame.type != typeOf<T>) {

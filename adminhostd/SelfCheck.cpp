@@ -20,7 +20,7 @@
 namespace adminhost {
 namespace {
 
-/// The worker's first message. Without one the problem says why.
+/// The worker's first message. If there is none, `problem` describes why.
 protocol::Hello helloOf(const protocol::Configure& configuration, std::string& problem) {
     const auto worker = WorkerProcess::start(true);
     if (!worker || !worker->send(protocol::frameOf(configuration))) {

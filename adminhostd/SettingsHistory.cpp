@@ -45,7 +45,7 @@ OwnerAndMode mine() {
     return {::geteuid(), ::getegid(), 0700};
 }
 
-/// The numbers of the entries, in order; what stands in the directory beside them has none.
+/// The numbers of the entries, in order. Other files in the directory are skipped.
 std::vector<std::uint64_t> numbersIn(const HostPath& directory) {
     std::vector<std::uint64_t> numbers;
     std::error_code error;
@@ -75,8 +75,8 @@ Error failed(const char* step, const std::error_code& code) {
     return Error{"posix", code.value(), std::string(step) + ": " + code.message()};
 }
 
-/// Writes a file of a new entry. It is not flushed: an entry that a power cut spoils is left out when it is read, and
-/// no administrator waits for the disk.
+/// Writes a file of a new entry without a flush, so that no administrator waits for the disk. An entry that a power cut
+/// damages is left out when it is read.
 std::optional<Error> writePlainly(std::string_view bytes, const HostPath& path) {
     errno = 0;
     std::ofstream file(diskPath(path).text(), std::ios::binary);
@@ -94,7 +94,7 @@ std::optional<Error> writePlainly(const Dictionary& dictionary, const HostPath& 
     return text ? writePlainly(*text, path) : error;
 }
 
-/// Replaces a file of an entry, which is either the old one or the new one then.
+/// Replaces a file of an entry. A reader sees either the old file or the new one.
 std::optional<Error> replacePlainly(const Dictionary& dictionary, const HostPath& path) {
     const HostPath fresh(path.text() + ".new");
     if (auto error = writePlainly(dictionary, fresh)) {
@@ -120,7 +120,7 @@ const Dictionary& dictionaryAt(const Dictionary& from, std::string_view key) {
     return found == nullptr ? empty : *found;
 }
 
-/// What became of each setting between two snapshots.
+/// The change of each setting between two snapshots.
 Array changesBetween(const Dictionary& before, const Dictionary& after, const std::vector<Setting>& settings) {
     Array changes;
     for (const Setting& setting : settings) {
@@ -165,7 +165,7 @@ std::optional<Error> copy(const std::vector<HostPath>& files, const HostPath& en
     return std::nullopt;
 }
 
-/// An entry's description, if the entry is whole.
+/// An entry's description, if the entry is complete.
 std::optional<Dictionary> wholeEntry(const HostPath& entry) {
     auto about = readDictionary(below(entry, aboutName));
     const Array* files = about ? about->get("files").array() : nullptr;

@@ -139,14 +139,15 @@ protocol::Answer broken(std::string message) {
     return answer;
 }
 
-/// Whether a command changes something. One that the plug-in does not name is not known to only read.
+/// Returns true if a command may change something: also one that the plug-in does not name, because it is not known to
+/// only read.
 bool changes(const LoadedPlugin& loaded, const std::string& name) {
     const auto command = std::find_if(loaded.commands.begin(), loaded.commands.end(),
                                       [&](const Command& one) { return one.name == name; });
     return command == loaded.commands.end() || command->access != Access::read;
 }
 
-/// Whether the other end of a conversation has been closed.
+/// Returns true if the other end of a conversation has been closed.
 bool isClosed(int descriptor) {
     pollfd entry{descriptor, POLLRDHUP, 0};
     return ::poll(&entry, 1, 0) > 0;
@@ -156,8 +157,8 @@ protocol::Answer notLoaded(const std::string& plugin) {
     return broken("The plug-in \"" + plugin + "\" is not loaded.");
 }
 
-/// The answer's text in the form that the client wants; in JSON where a property list cannot carry it. The dictionary
-/// is dropped: an answer is in memory in one form at a time.
+/// The answer's text in the form that the client prefers; in JSON if a property list cannot carry it. Drops the
+/// dictionary, so that an answer is in memory in one form at a time.
 protocol::Answer written(Outcome outcome, Dictionary response, BodyForm form) {
     protocol::Answer answer;
     answer.outcome = outcome;
@@ -260,7 +261,7 @@ void Worker::tryNeeds(const LoadedPlugin& loaded, std::vector<std::string>& prob
     }
 }
 
-/// Sets what the tools find that the plug-in runs.
+/// Sets the environment of the tools that the plug-in runs.
 void Worker::enter(const LoadedPlugin& loaded) const {
     auto environment = _toolEnvironment;
     environment[toolConfigurationVariable] += "/" + loaded.name;
@@ -310,7 +311,7 @@ Result<SettingsHistory> historyOf(const LoadedPlugin& loaded) {
                     : failure(settings.error());
 }
 
-/// Of workers that were killed in the middle of a write.
+/// Removes files of workers that were killed in the middle of a write.
 void Worker::removeLeftovers() {
     if (std::exchange(_leftoversRemoved, true)) {
         return;

@@ -19,7 +19,7 @@
 namespace adminhost {
 namespace {
 
-/// Bytes that are read in one go. A worker that never stops talking must not keep the front from its clients.
+/// Bytes that are read in one go. A worker that sends without end must not keep the front from its clients.
 constexpr std::size_t readMaximum = std::size_t{1} << 20U;
 
 /// The worker's program: beside this one in a build, in the library directory next to ours when installed.

@@ -61,7 +61,7 @@ Result<FileDescriptor> privateDirectory() {
     return directory;
 }
 
-/// What the holder has written; empty if it has not yet.
+/// The holder's process id, as it has written it; empty if it has not yet.
 std::string holderOf(int file) {
     std::array<char, 16> text{};
     const ssize_t length = ::pread(file, text.data(), text.size(), 0);

@@ -43,7 +43,7 @@ std::uint32_t groupOf(const std::uint8_t* in) noexcept {
     return places[0][in[0]] | places[1][in[1]] | places[2][in[2]] | places[3][in[3]];
 }
 
-/// Decodes groups of four while they are characters of the alphabet alone; answers where it stopped.
+/// Decodes groups of four while they are characters of the alphabet alone. Returns the place where it stopped.
 const std::uint8_t* decodeGroups(const std::uint8_t* in, const std::uint8_t* end, std::uint8_t*& out) noexcept {
     while (end - in >= 4) {
         const std::uint32_t group = groupOf(in);

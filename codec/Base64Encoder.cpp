@@ -53,7 +53,7 @@ __attribute__((target("ssse3"))) inline void encodeTwelve(const std::uint8_t* in
     _mm_storeu_si128(reinterpret_cast<__m128i*>(out), text);
 }
 
-/// The place in a text that is being made, with what may be read and written behind it.
+/// The place in a text that is being encoded, and the ends of the memory that may be read and written.
 struct Place {
     const std::uint8_t* in;
     const std::uint8_t* inEnd;
@@ -61,8 +61,8 @@ struct Place {
     std::uint8_t* outEnd;
 };
 
-/// Encodes of so many bytes what can be encoded twelve at a time. Up to nine bytes more than asked for may be encoded:
-/// what follows is written over their characters. Answers how many of the bytes are left.
+/// Encodes the part of so many bytes that can be encoded twelve at a time. May encode up to nine bytes more than asked
+/// for; later characters overwrite those. Returns how many of the bytes are left.
 __attribute__((target("ssse3"))) std::size_t encodeWideGroups(Place& at, std::size_t length) noexcept {
     const std::uint8_t* in = at.in;
     const std::uint8_t* const end = in + length;
@@ -85,7 +85,7 @@ __attribute__((target("ssse3"))) std::size_t encodeWideGroups(Place& at, std::si
 }
 #endif
 
-/// Encodes that many bytes, a multiple of three, and moves behind them.
+/// Encodes that many bytes, a multiple of three, and moves to the place after them.
 void encodeGroups(Place& at, std::size_t length) noexcept {
     std::size_t left = length;
 #ifdef __x86_64__
@@ -100,8 +100,8 @@ void encodeGroups(Place& at, std::size_t length) noexcept {
     }
 }
 
-/// A text of so many characters that fits the buffer's first capacity is made without the buffer: most values are
-/// short, and it would take as long as their encoding.
+/// A text of so many characters, which fits the buffer's first capacity, is written without the buffer. Most values are
+/// short, and the buffer would cost as much time as their encoding.
 constexpr std::size_t shortText = 256;
 
 struct Layout {
@@ -109,7 +109,7 @@ struct Layout {
     std::size_t textLength;  ///< of the whole text
 };
 
-/// A line ends behind the first group that brings it to its limit of characters.
+/// A line ends after the first group that brings it to its limit of characters.
 constexpr std::size_t lineInputOf(std::size_t lineLimit) noexcept {
     return (lineLimit + 3) / 4 * 3;
 }
@@ -123,7 +123,7 @@ Layout layoutOf(std::size_t length, const EncoderOptions& options) noexcept {
     return {options.lineBreaks ? brokenLineInput : unbrokenLineInput, length / 3 * 4 + lineFeeds + tailLength};
 }
 
-/// Writes the text, which is as long as its layout says.
+/// Writes the text, whose length is in its layout.
 void encodeText(Bytes data, const EncoderOptions& options, const Layout& layout, std::uint8_t* out) noexcept {
     Place at{data.data(), data.data() + data.size(), out, out + layout.textLength};
     std::size_t left = data.size();
@@ -148,7 +148,7 @@ void encodeText(Bytes data, const EncoderOptions& options, const Layout& layout,
     std::fill(at.out, at.outEnd, options.pad);
 }
 
-/// Encodes into a buffer that has no room for the whole text: it takes what it can, piece after piece.
+/// Encodes into a buffer that has no room for the whole text: fills it piece after piece.
 [[gnu::noinline]] void appendPieces(Bytes data, EncoderOptions options, std::size_t lineInput, ByteBuffer& buffer) {
     options.lineBreaks = false;  // a piece never goes beyond its line
     const std::size_t pieceInput = std::min<std::size_t>(lineInput, 3072);

@@ -20,7 +20,7 @@ using adminhost::Value;
 constexpr std::size_t maximumText = 95'000;
 /// All arguments of one tool together may have 2 MiB, the environment included.
 constexpr std::size_t maximumArguments = 1'500'000;
-/// What each short name costs beside its bytes: its option, two terminating bytes and two pointers.
+/// The cost of each short name besides its bytes: its option, two terminating bytes and two pointers.
 constexpr std::size_t argumentCost = 32;
 constexpr std::size_t maximumDigits = 19;
 
@@ -101,7 +101,7 @@ Change changeOf(const Dictionary& values, const EntryDescription& entry) {
     return known ? changeAdded : changeNothing;
 }
 
-/// Walks a configuration along its description and collects the key paths that it does not name.
+/// Walks a configuration along its description and collects the key paths that the description does not name.
 class UnknownKeys {
   public:
     explicit UnknownKeys(std::vector<std::string>& paths) noexcept : _paths(paths) {}
@@ -144,7 +144,7 @@ class UnknownKeys {
     std::vector<std::string>& _paths;
 };
 
-/// Walks a request along its description and collects what does not fit.
+/// Walks a request along its description and collects the findings.
 class Check {
   public:
     explicit Check(std::vector<Finding>& findings) noexcept : _findings(findings) {}

@@ -8,7 +8,7 @@ namespace {
 
 using adminhost::Value;
 
-/// Builds the value that begins at the token, and moves on behind it.
+/// Builds the value that begins at the token, and moves to the token after it.
 Value build(const DescriptionToken*& token) {
     const DescriptionToken& first = *token++;
     switch (first.kind) {

@@ -4,7 +4,7 @@ namespace lumio {
 
 using adminhost::Response;
 
-// What this release declares but does not offer yet says so, and never pretends to have done anything.
+// Operations that this release declares but does not offer yet fail with an error, and never pretend to have succeeded.
 
 Response LumioRequestHandler::getStateWithRequest(const Dictionary&) {
     return responseForError("NOT_AVAILABLE");

@@ -42,7 +42,7 @@ std::int32_t portAfter(std::int32_t port) noexcept {
     return static_cast<std::int32_t>(static_cast<std::uint32_t>(port) + 1U);
 }
 
-/// Moves a listing's answer into the configuration; a listing that failed has no list and adds nothing.
+/// Moves a listing's list into the configuration; a listing that failed has no list and adds nothing.
 void moveList(Response response, std::string_view key, Dictionary& config) {
     if (Value* list = response.dictionary().find(key)) {
         config.set(key, std::move(*list));

@@ -18,7 +18,7 @@ using adminhost::Value;
 
 namespace {
 
-/// The answer of a listing that failed: the status alone, neither command nor list.
+/// The response of a listing that failed: the status alone, neither command nor list.
 Response failedListing(const std::optional<Error>& error) {
     return Dictionary{{"readStatus", error ? error->code : -1}};
 }
@@ -31,7 +31,7 @@ Response listing(std::string_view command, std::string_view key, Array list) {
 }
 
 /// Applies each change entry of the configuration's list in order, with its key path; an element that is not a
-/// dictionary is passed over.
+/// dictionary is skipped.
 template <class Change>
 void forEachEntry(std::string_view list, const Array* changes, Change change) {
     if (changes == nullptr) {

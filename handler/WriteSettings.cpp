@@ -28,7 +28,7 @@ constexpr std::string_view setupDoneMarker = "/var/lumio/server/.lumio_setup_don
 constexpr std::string_view passwordKey = "nimbo_client_password";
 constexpr std::string_view controllerKey = "nimbo_controller";
 constexpr std::string_view localSuffix = ".local";
-/// Domain of the errors that the framework itself makes up, whose underlying error tells the story.
+/// Domain of the framework's own errors, whose underlying error has the details.
 constexpr std::string_view generalErrorDomain = "adminhost";
 
 struct ScriptRun {
@@ -55,7 +55,7 @@ SettingKeys clusterKeys() {
     return keys;
 }
 
-/// Reports the settings that a failed step kept from being written.
+/// Reports the settings that were not written because a step failed.
 void reportSkipped(std::initializer_list<SettingKeys> files, const Dictionary& config, const std::string& reason,
                    const std::string& words) {
     bool any = false;
@@ -68,7 +68,7 @@ void reportSkipped(std::initializer_list<SettingKeys> files, const Dictionary& c
     }
 }
 
-/// Why a value could not be protected: the system's words on the key file.
+/// Why a value could not be protected: the system's error text for the key file.
 std::string keyFileWords() {
     const HostPath file(SettingsStore::sharedFilesystemPath() + "/Server/Secrets/kek.plist");
     const auto keys = SettingsStore::stored(file);
@@ -77,8 +77,8 @@ std::string keyFileWords() {
                    : file.text() + " does not exist";
 }
 
-/// Keeps a file that exists but cannot be loaded beside its place, because it is going to be replaced: what it holds
-/// is the administrator's to look at.
+/// Keeps a copy of a file that exists but cannot be loaded, because it is going to be replaced and an administrator may
+/// want to look at it.
 void keepBeside(const HostPath& path) {
     Error error;
     const auto kept = adminhost::keepUnreadable(path, &error);
@@ -86,7 +86,7 @@ void keepBeside(const HostPath& path) {
                         (kept ? "; it is kept as " + kept->text() : " or kept: " + textOf(error)));
 }
 
-/// What a write begins with: the stored preferences, else the cached copy, else none.
+/// The dictionary that a write begins with: the stored preferences, else the cached copy, else empty.
 Dictionary startAt(const HostPath& path, const HostPath& cached) {
     auto stored = SettingsStore::stored(path);
     if (!stored) {
@@ -115,12 +115,12 @@ std::int32_t statusOf(const std::optional<SettingsWriteError>& error, Dictionary
     return static_cast<std::int32_t>(error->domain == generalErrorDomain ? error->underlying.code : error->code);
 }
 
-/// Whether the configuration holds a value for the key that is not the stored one.
+/// Returns true if the configuration has a value for the key that is not the stored one.
 bool changes(const Dictionary& config, std::string_view key, const Dictionary& stored) {
     return config.contains(key) && config.get(key) != stored.get(key);
 }
 
-/// The name under which the controller is to be resolved; nothing when it stands for itself.
+/// The name under which the controller is to be resolved; nullopt if the value is used unchanged.
 std::optional<std::string> nameToResolve(const Dictionary& config) {
     const Value& value = config.get(controllerKey);
     if (value.isNull()) {
@@ -204,7 +204,7 @@ std::int32_t LumioRequestHandler::writeSettingsFiles(Dictionary& config, Diction
 
 namespace {
 
-/// Writes the file of one set operation; reports what became of its keys.
+/// Writes the file of one set operation and reports the outcome for its keys.
 std::int32_t writeAndReport(const SettingKeys& keys, const Dictionary& config, const Dictionary& before,
                             const Dictionary& after, const HostPath& path, Dictionary& result) {
     const std::int32_t status = statusOf(writeSettingsFile(after, path), result);
@@ -216,8 +216,8 @@ std::int32_t writeAndReport(const SettingKeys& keys, const Dictionary& config, c
     return status;
 }
 
-/// The status where the identity preferences cannot be read. They say nothing then about where a file belongs: nothing
-/// is written, least of all below the default shared file system.
+/// The status if the identity preferences cannot be read. The place of the other files is not known then, so no file is
+/// written, least of all below the default shared file system.
 std::int32_t unknownPlace(const SettingKeys& keys, const Dictionary& config, const Error& error, Dictionary& result) {
     reportSettingsNotDone(keys, config, "The identity preferences, which name the file's place, cannot be read.",
                           error.description.value_or(""));

@@ -2,10 +2,10 @@
 
 // The Kerberos library's context, and the rules that all objects of this room share:
 //
-// - Each object owns exactly one native handle; what comes from elsewhere is copied first, so no handle is shared.
-// - Every object holds a shared reference to the context it was made with, dropped after its own handle is freed.
-// - Nothing throws but KRB5CredentialCache::initWithName without name and principal. An operation that fails answers
-//   nothing, and errorCode() then tells the status of the last library call that the object recorded (0 = success).
+// - Each object owns exactly one native handle; a handle from elsewhere is copied first, so no handle is shared.
+// - Every object holds a shared reference to the context it was created with, dropped after its own handle is freed.
+// - Nothing throws but KRB5CredentialCache::initWithName without name and principal. An operation that fails returns
+//   null or nullopt; errorCode() is then the status of the last library call that the object recorded (0 = success).
 //   Reading operations record too, and do so on const objects.
 // - No object may be used by two threads at once. That holds for all objects of one context together.
 // - Texts of principals and realms are UTF-8; one that is not counts as missing. File names of keytabs and caches are

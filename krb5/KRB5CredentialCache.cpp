@@ -30,7 +30,7 @@ class CredentialContents {
     krb5_creds _contents{};
 };
 
-/// The one copy of a password that the library needs for its terminator; wiped when it goes away.
+/// The one copy of a password that the library needs for its terminator; wiped by the destructor.
 class TerminatedPassword {
   public:
     explicit TerminatedPassword(std::string_view password) : _bytes(password.size() + 1, '\0') {

@@ -85,7 +85,7 @@ std::string pathOf(std::size_t index) {
     return "allowedUsersAndGroups." + std::to_string(index);
 }
 
-/// The UUID of the only user or group of that name; null if the directory does not say.
+/// The UUID of the only user or group of that name; null if the directory fails or does not have exactly one.
 Value uuidOf(const std::string& name, std::string_view kind) {
     const auto entries = adminhost::directoryEntriesOf(name);
     Value uuid;

@@ -53,7 +53,7 @@ class ScopedValueCleanse {
     Dictionary& _values;
 };
 
-/// A text as answers can carry it.
+/// Makes the texts fit a response, which can only carry UTF-8.
 void makeUtf8(Dictionary& row) {
     for (const std::string& column : Property::tableColumnNames()) {
         Value* value = row.find(column);

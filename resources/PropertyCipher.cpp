@@ -22,7 +22,7 @@ Bytes bytesOf(std::string_view text) noexcept {
     return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
 }
 
-/// The key file belongs to the service, which makes it when it is set up; here it is only read, on every call.
+/// The key file belongs to the service, which creates it when it is set up; here it is only read, on every call.
 std::optional<Data> keyEncryptionKey() {
     const auto preferences = SettingsStore::identityPreferences();
     const Value sharedFilesystem = preferences ? preferences->get("shared_filesystem") : Value();

@@ -26,7 +26,7 @@ bool isColumn(const std::string& name) {
     return std::find(columns.begin(), columns.end(), name) != columns.end();
 }
 
-/// An output with what can be said about its columns.
+/// A reading of an output, with the facts known about its columns.
 struct Reading {
     Names columns;  ///< those of the properties table
     std::vector<LineRow> rows;
@@ -53,7 +53,7 @@ bool idsAreDifferent(const Reading& reading) {
                        [&](const LineRow& row) { return ids.insert(row.values[id]).second; });
 }
 
-/// Whether the output can be read in one way only.
+/// Returns true if the output can be read in one way only.
 bool isCertain(const Reading& reading, const std::string& output) {
     // A name for which every row has a line may be a further column of the table.
     return reading.further.empty() && output.ends_with('\n') &&
@@ -77,8 +77,8 @@ std::optional<std::string> bytesOfHex(std::string_view digits) {
     return bytes;
 }
 
-/// Adds the columns that the table has beside its own ones, as the ordinary output shows them. A line that is part of
-/// the value is none of them.
+/// Adds the columns that the table has besides its own ones, as the ordinary output shows them. A line that is part of
+/// the value is not a column.
 void addFurtherColumns(std::vector<Dictionary>& rows, const Reading& reading, const std::string& output) {
     Names shown = lineColumns(output);
     std::erase_if(shown, [&](const std::string& name) {

@@ -26,7 +26,7 @@ bool equalWithoutCase(std::string_view a, std::string_view b) noexcept {
     return std::equal(a.begin(), a.end(), b.begin(), b.end(), [](char x, char y) { return lower(x) == lower(y); });
 }
 
-/// As the tool shows a statement: every kind of blank is one.
+/// The text as the tool shows a statement: every kind of blank becomes a space.
 std::string withBlanks(std::string_view text) {
     std::string shown(text);
     std::replace_if(

@@ -19,7 +19,8 @@ using adminhost::Value;
 
 namespace {
 
-/// True for a place below the system root, after all links on the way. One that does not exist is not there.
+/// Returns true for a place below the system root, after all links on the way. A place that does not exist is not below
+/// it.
 bool isBelowRoot(const DiskPath& path) {
     namespace fs = std::filesystem;
     std::error_code error;

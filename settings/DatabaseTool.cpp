@@ -42,7 +42,7 @@ constexpr const char* expected =
     "escape\n"
     "         c = z\n";
 
-/// Whether a failed run says more about the machine at this moment than about the tool.
+/// Returns true if a failed run is more likely due to the state of the machine at this moment than to the tool.
 bool isPassing(std::int32_t status, std::string_view error) {
     if (status == diedBySignal + SIGKILL) {
         return true;  // at the deadline, or because memory ran out

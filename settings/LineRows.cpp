@@ -50,7 +50,7 @@ std::vector<std::string> prefixesOf(std::span<const std::string> columns) {
     return prefixes;
 }
 
-/// The word of a line "   word = ..." whose separator begins at the width; empty if it is no such line.
+/// The word of a line "   word = ..." whose separator begins at the width; empty if the line has another form.
 std::string_view wordOf(std::string_view line, std::size_t width) noexcept {
     if (line.size() < width + separator.size() || line.substr(width, separator.size()) != separator) {
         return {};
@@ -85,7 +85,8 @@ std::vector<std::string> wordsOf(const Lines& lines, const LineRow& row, std::si
     return words;
 }
 
-/// Whether a row's lines have all the words in this order. A row for which this is false may have them all the same.
+/// Returns true if a row's lines have all the words in this order. A row for which this is false may have them all the
+/// same.
 bool hasInOrder(const Lines& lines, const LineRow& row, std::size_t width, const std::vector<std::string>& words) {
     auto wanted = words.begin();
     for (std::size_t i = row.line; i < row.end && wanted != words.end(); ++i) {

@@ -12,7 +12,7 @@ namespace {
 constexpr const char* failed = "Can't execute sqlite3 query: ";
 constexpr std::string_view separator = " = ";
 
-/// Where the first separator begins. Searched by its middle: lines begin with blanks.
+/// The place where the first separator begins. Searches for its middle, because lines begin with blanks.
 std::size_t separatorIn(std::string_view line) noexcept {
     for (std::size_t at = line.find('=', 1); at < line.size(); at = line.find('=', at + 1)) {
         if (line.substr(at - 1, separator.size()) == separator) {
@@ -22,7 +22,7 @@ std::size_t separatorIn(std::string_view line) noexcept {
     return std::string_view::npos;
 }
 
-/// The tool would take such a path for one of its options, and one of those runs commands.
+/// The tool would read such a path as one of its options, and one of those runs commands.
 bool beginsWithHyphen(const adminhost::HostPath& database) noexcept {
     return database.text().starts_with('-');
 }

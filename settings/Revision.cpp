@@ -12,7 +12,8 @@ namespace lumio {
 
 namespace {
 
-/// What there is of each kind. Texts that may hold line feeds or separators travel as hexadecimal digits.
+/// The columns of each kind of resource. Texts that may hold line feeds or separators are selected as hexadecimal
+/// digits.
 constexpr std::array<std::string_view, 4> selections = {
     "select 'camera' as kind, hex(uuid) as a, hex(name) as b, access_control_enabled as c, disabled as d from cameras",
     "select 'workflow' as kind, hex(uuid) as a, hex(bundle_path) as b, access_control_enabled as c, disabled as d "
@@ -39,7 +40,7 @@ bool appendRows(std::string& text, std::string_view selection) {
     return true;
 }
 
-/// All resources in one start of the tool. Where one table is missing, the others still count, each by itself.
+/// Reads all resources in one start of the tool. If one table is missing, the others still count, each by itself.
 void appendResources(std::string& text) {
     std::string all;
     for (const std::string_view selection : selections) {

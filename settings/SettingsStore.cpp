@@ -62,7 +62,7 @@ bool separates(UChar32 character) noexcept {
     }
 }
 
-/// Hands out the tokens of a text. Every separator ends a token, so two in a row give an empty one.
+/// Returns the tokens of a text one by one. Every separator ends a token, so two in a row give an empty one.
 class Tokens {
   public:
     explicit Tokens(std::string_view text) noexcept : _text(text) {}
@@ -90,7 +90,7 @@ class Tokens {
     bool _done = false;
 };
 
-/// The database value of the production section. Words are all that counts: indentation and nesting play no part.
+/// The database value of the production section. Only the words count; indentation and nesting are ignored.
 std::optional<std::string_view> productionDatabase(std::string_view text) {
     Tokens tokens(text);
     bool inProduction = false;

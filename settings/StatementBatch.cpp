@@ -17,8 +17,8 @@ namespace {
 
 constexpr std::size_t mostAtOnce = 8;
 constexpr std::size_t mostUntaken = 64;  ///< results kept until their turn: each holds memory
-/// SQLite's "database is locked". The last reader of a WAL database may meet it when it closes the file, which a
-/// statement that runs by itself never does.
+/// SQLite's "database is locked". The last reader of a WAL database may get it when it closes the file; a statement
+/// that runs by itself never gets it.
 constexpr std::int32_t locked = 5;
 
 }  // namespace

@@ -12,7 +12,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-/// More entries than any bundle has; a directory that others fill does not hold a request up.
+/// More entries than any bundle has, so that a directory that others fill cannot delay a request for long.
 constexpr std::size_t maximumEntries = 4096;
 
 /// Drops the error: texts are shown without their translation if a table cannot be read.

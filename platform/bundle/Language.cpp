@@ -56,7 +56,7 @@ constexpr std::pair<const char*, const char*> otherNames[] = {
     {"norwegian bokmal", "nb"},
 };
 
-/// Codes by the English names of languages. Made on the first use: most bundles and people name languages by codes.
+/// Codes by the English names of languages. Built on the first use: most bundles and people name languages by codes.
 const std::unordered_map<std::string, std::string>& codesByName() {
     static const std::unordered_map<std::string, std::string> codes = [] {
         std::unordered_map<std::string, std::string> made;
@@ -153,7 +153,7 @@ Rank rankOf(const Candidate& candidate, std::string_view spelling, const std::op
     return tag->hasRegion ? otherRegion : withoutRegion;
 }
 
-/// Appends what is not yet in the list, up to the given rank.
+/// Appends those that are not yet in the list, up to the given rank.
 void appendMatches(std::vector<std::string>& matches, const std::vector<Candidate>& candidates,
                    std::string_view spelling, Rank last) {
     const std::optional<Tag> wanted = tagOf(spelling);

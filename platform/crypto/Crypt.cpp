@@ -50,7 +50,7 @@ class Transform {
 
     [[nodiscard]] bool hasContext() const noexcept { return _context != nullptr; }
 
-    /// Runs the whole input through the cipher from a fresh start. The output has room for what comes out.
+    /// Runs the whole input through the cipher from a fresh start. The output is large enough for the result.
     bool run(const unsigned char* vector, bool padding, const unsigned char* in, std::size_t length, unsigned char* out,
              std::size_t& written) noexcept {
         written = 0;

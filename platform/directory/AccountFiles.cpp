@@ -36,7 +36,7 @@ std::int64_t nanosecondsOf(const timespec& time) noexcept {
     return static_cast<std::int64_t>(time.tv_sec) * 1'000'000'000 + time.tv_nsec;
 }
 
-/// Whether XML can carry the well-formed UTF-8 character that begins at the position.
+/// Returns true if XML can carry the well-formed UTF-8 character that begins at the position.
 bool isCarried(std::string_view text, std::size_t at) noexcept {
     const auto byte = static_cast<unsigned char>(text[at]);
     if (byte < 0x20) {
@@ -58,7 +58,7 @@ bool isPlain(std::string_view text) noexcept {
     return true;
 }
 
-/// For texts that people read: what a property list cannot carry becomes U+FFFD.
+/// For texts that people read: bytes that a property list cannot carry become U+FFFD.
 std::string repaired(std::string_view bytes) {
     if (isPlain(bytes)) {
         return std::string(bytes);

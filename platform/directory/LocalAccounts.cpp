@@ -18,7 +18,7 @@ char lower(char c) noexcept {
     return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
 }
 
-/// Text without regard to case, for comparison.
+/// Folds the case of texts, for comparison.
 class CaseFolding {
   public:
     CaseFolding() {
@@ -82,7 +82,7 @@ std::vector<std::string> valuesOf(const AccountTable& table, AccountKind kind, c
     return {};
 }
 
-/// The number whose decimal text, without leading zeros, this is.
+/// The number of which this is the decimal text without leading zeros.
 std::optional<std::uint32_t> idOf(const std::string& text) {
     std::uint32_t id = 0;
     const char* end = text.data() + text.size();

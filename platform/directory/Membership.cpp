@@ -7,7 +7,7 @@
 namespace adminhost {
 namespace {
 
-/// The first record that any node has; a node that fails is passed over.
+/// The first record that any node has; a node that fails is skipped.
 std::optional<DirectoryRecord> firstRecord(const DirectoryQuery& query) {
     for (const DirectoryNodeSource& source : DirectorySession::defaultSession().nodes()) {
         const auto node = source.open(nullptr);

@@ -134,7 +134,7 @@ class Probe {
 
 }  // namespace
 
-/// What Avahi calls only leaves its news here; NetService::advance acts on it, outside of Avahi's own calls.
+/// Avahi's callbacks only store their news here; NetService::advance acts on it, outside of Avahi's own calls.
 struct NetService::Resolution {
     Clock::time_point deadline;
     std::optional<Probe> probe;

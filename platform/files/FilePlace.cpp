@@ -15,7 +15,7 @@ namespace {
 
 constexpr int mostLinks = 40;  // as many as the kernel follows
 
-/// Whether others than root and this process's user may put entries into the directory.
+/// Returns true if others than root and this process's user may create entries in the directory.
 bool othersMayWrite(const struct stat& directory) noexcept {
     return (directory.st_mode & (S_IWGRP | S_IWOTH)) != 0 || (directory.st_uid != 0 && directory.st_uid != ::geteuid());
 }

@@ -10,8 +10,8 @@ namespace {
 
 std::string root = "/";
 
-/// The path without those steps "..", counted along its text, that would lead above its beginning. All else stays, so
-/// that a link on the way means what it means to the system.
+/// The path without those steps "..", counted along its text, that would lead above its beginning. Other steps are
+/// kept, so that a link on the way has the same meaning as for the system.
 std::string withinRoot(std::string_view path) {
     std::string kept;
     std::size_t depth = 0;

@@ -38,8 +38,9 @@ std::string temporaryPrefix(std::string_view name) {
     return fmt::format(".{}.adminhost-", name);
 }
 
-/// Removes what killed writers of the same file left. A living writer, here or on another machine that shares the
-/// directory, holds an exclusive lock on its temporary file. Failures are not the coming write's matter.
+/// Removes the files that killed writers of the same file left. A running writer, here or on another machine that
+/// shares the directory, holds an exclusive lock on its temporary file. Failures are ignored: they do not affect the
+/// coming write.
 void removeLeftoversIn(const FilePlace& place) {
     const int copy = ::openat(place.directory.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     if (copy < 0) {
@@ -223,7 +224,7 @@ int copyAttributes(int from, int to) {
     return 0;
 }
 
-/// Gives the temporary file what the old one has besides its bytes.
+/// Gives the temporary file all that the old one has besides its bytes.
 std::optional<Error> keepProperties(const FileDescriptor& old, const struct stat& status, int temporary,
                                     const HostPath& path) {
     struct stat mine {};
@@ -267,7 +268,7 @@ int flushDirectory(const FilePlace& place) noexcept {
     return ::fsync(place.directory.get()) == 0 || errno == EINVAL || isUnsupported(errno) ? 0 : errno;
 }
 
-/// A second name for the file, or its only one; the system's error number.
+/// Gives the file a second name, or moves it to it. Returns the system's error number.
 int giveName(const FilePlace& place, const std::string& name) noexcept {
     const int directory = place.directory.get();
     if (::faccessat(directory, place.name.c_str(), R_OK, AT_EACCESS | AT_SYMLINK_NOFOLLOW) == 0 &&

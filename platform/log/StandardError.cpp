@@ -36,7 +36,7 @@ class SecondOpening {
     ino_t _inode = 0;
 };
 
-/// Writes to what cannot be opened a second time only so much that a pipe with room for anything accepts it.
+/// For an output that cannot be opened a second time: writes only so much that a pipe with any room accepts it.
 ssize_t writeCarefully(std::string_view text) {
     pollfd entry{STDERR_FILENO, POLLOUT, 0};
     if (::poll(&entry, 1, 0) != 1) {

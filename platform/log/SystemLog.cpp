@@ -15,7 +15,7 @@ namespace {
 
 constexpr std::size_t cutSize = std::size_t{64} << 10U;  ///< bytes of a text that is too long for the socket
 
-/// Where the text may be cut without damaging a character.
+/// The place where the text may be cut without damaging a character.
 std::string_view cut(std::string_view text) {
     std::size_t size = cutSize;
     while (size > 0 && (static_cast<unsigned char>(text[size]) & 0xc0U) == 0x80U) {

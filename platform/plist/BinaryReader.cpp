@@ -17,7 +17,7 @@ namespace {
 constexpr std::size_t headerSize = 8;
 constexpr std::size_t trailerSize = 32;
 constexpr std::int64_t epochOfDates = 978'307'200;  // 2001-01-01T00:00:00Z
-/// What one value counts, beside its bytes, towards the bound on the whole list.
+/// The size of one value, besides its bytes, in the bound on the whole list.
 constexpr std::size_t costOfValue = 8;
 
 /// Reads the objects that the offset table points to. Every number in the file is checked before it is used; the first

@@ -61,7 +61,7 @@ std::string_view nameOf(Element element) noexcept {
     return elementNames.at(static_cast<std::size_t>(element));
 }
 
-/// Names and keys from a file in a message: not longer than a reader wants to see.
+/// Shortens names and keys from a file for a message.
 std::string shortened(std::string_view text) {
     constexpr std::size_t longest = 60;
     if (text.size() <= longest) {
@@ -164,7 +164,7 @@ class XmlReader {
 
     XmlReader(const XmlReader&) = delete;
     XmlReader& operator=(const XmlReader&) = delete;
-    /// The list may be a file of secrets.
+    /// Clears the text, because the list may be a file of secrets.
     ~XmlReader() {
         _text.resize(_text.capacity());
         ::explicit_bzero(_text.data(), _text.size());
@@ -249,7 +249,7 @@ class XmlReader {
         _containers.emplace_back().isDictionary = element == Element::dict;
     }
 
-    /// Whether the element may come at this place; if not, the error is set.
+    /// Returns true if the element may come at this place; if not, sets the error.
     bool mayStand(Element element) {
         if (_containers.empty()) {
             if (_root || element == Element::key) {

@@ -14,7 +14,7 @@ namespace {
 
 class XmlWriter {
   public:
-    /// False, with what() and where(), when a value cannot be carried.
+    /// Returns false, with what() and where(), if a value cannot be carried.
     bool write(const Value& value) {
         _text = "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">\n";
         const bool done = append(value, 0);

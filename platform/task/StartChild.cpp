@@ -43,8 +43,8 @@ struct ChildSide {
     pid_t parent;
 };
 
-/// Everything between the birth of the child and its program. No allocation, no lock, no C++ library: the child uses
-/// our memory. Not instrumented, because the sanitizer would keep book of this stack for us.
+/// Runs from the birth of the child to the start of its program. No allocation, no lock, no C++ library: the child uses
+/// our memory. Not instrumented, because the sanitizer would record this stack as ours.
 class [[gnu::visibility("hidden")]] ChildProcess{public : [[gnu::no_sanitize("address", "undefined")]] static int run(
     void* argument){const auto* side = static_cast<const ChildSide*>(argument);
 if (prepare(*side)) {
@@ -60,7 +60,7 @@ private:
     return ::syscall(SYS_setpgid, 0, 0) == 0 && enter(side) && place(side) && drop(side) && signals();
 }
 
-/// Registers the child. Until that is done it must not outlive its parent: nobody would know of it.
+/// Registers the child. Until that is done it must not outlive its parent: no process would know of it.
 [[gnu::no_sanitize("address", "undefined")]] static bool enter(const ChildSide& side) {
     if (side.registration == nullptr) {
         return true;

@@ -54,7 +54,7 @@ class WithoutSigpipe {
     bool _wasPending = false;
 };
 
-/// What arrives on one of the tool's streams.
+/// The captured bytes of one of the tool's streams.
 class Capture {
   public:
     /// `held` counts the bytes of the whole group.

@@ -31,7 +31,7 @@ tl::unexpected<Error> failed() {
 
 enum class State { gone, stopped, running };
 
-/// The state of a process from /proc. One that is on its way out counts as gone.
+/// The state of a process from /proc. One that is exiting counts as gone.
 State stateOf(pid_t pid) noexcept {
     constexpr unsigned long isExiting = 0x4;  // PF_EXITING of the kernel
     constexpr int flagsAfterState = 7;
@@ -60,8 +60,8 @@ State stateOf(pid_t pid) noexcept {
     return state == 'T' || state == 't' ? State::stopped : State::running;
 }
 
-/// Kills the group of a process that has not exited. The process is stopped before: otherwise it could exit between our
-/// look and our signal, which would then hit the service that it has started.
+/// Kills the group of a process that has not exited. Stops the process first: otherwise it could exit between the check
+/// and the signal, which would then hit the service that it has started.
 void killGroup(pid_t pid) noexcept {
     if (::getpgid(pid) != pid || ::getsid(pid) != ::getsid(0) || stateOf(pid) == State::gone) {
         return;
