@@ -1,6 +1,6 @@
 #pragma once
 
-// Two works timed in turn in one benchmark, so that whatever else the machine does meets both alike.
+// Times two pieces of work in turn in one benchmark, so that disturbances on the machine affect both equally.
 
 #include <algorithm>
 #include <ctime>
@@ -10,8 +10,8 @@
 
 namespace bench {
 
-/// Wall time where processes or waiting are measured; processor time, which other work on the machine disturbs less,
-/// where it is computing alone.
+/// Wall time is for processes and waiting. Processor time, which other work on the machine disturbs less, is for
+/// computing only.
 enum class Clock { wall = CLOCK_MONOTONIC, processor = CLOCK_PROCESS_CPUTIME_ID };
 
 inline double now(Clock clock) {
@@ -32,8 +32,8 @@ inline double median(std::vector<double> values) {
     return values[values.size() / 2];
 }
 
-/// Times ours and the floor in turn, and does what comes between without timing it; counters: the medians in
-/// microseconds and their ratio.
+/// Times ours and the floor in turn; the work between them is not timed. The counters are the medians in microseconds
+/// and their ratio.
 template <typename Ours, typename Floor, typename Between>
 void alternate(benchmark::State& state, Clock clock, Ours ours, Floor floor, Between between) {
     std::vector<double> oursTimes;

@@ -1,7 +1,7 @@
 // Base64 and the cipher of protected values against the libraries used directly, in one run.
 //
-// Every base64 operation makes a new result, ours and the others' alike; EvpInto... are OpenSSL's calls into a buffer
-// that is there already. Lengths are those of the plain bytes. Cipher: the operation of protected values against one
+// Every base64 operation allocates a new result, in our code and in the other libraries. EvpInto... are OpenSSL's calls
+// into an existing buffer. Lengths are those of the plain bytes. Cipher: the operation of protected values against one
 // EVP pass with a fetched cipher, a new context and a result buffer of the right size.
 
 #include "codec/LumioAESCategories.h"
@@ -164,7 +164,7 @@ void EncryptEvp(benchmark::State& state) {
     evpPass(state, plain(state), true);
 }
 
-/// What protecting a value does, the key file's reading left out.
+/// Protects a value as Property does, without reading the key file.
 void EncryptToText(benchmark::State& state) {
     const Data data = plain(state);
     for (auto _ : state) {

@@ -1,8 +1,9 @@
-// Looking people up in the machine's accounts, with 10 and with 100,000 of them.
+// Look-ups of people in the machine's accounts, with 10 and with 100,000 accounts.
 //
-// FirstLookUp reads the account files; NextLookUp shares that pass, and costs the same however many accounts there are.
-// Request is what listing 1000 cameras with 5 access entries each asks of the directory, its one pass included; its
-// counter "passes" says how often an account file was read. Completion looks at every account's names.
+// FirstLookUp reads the account files. NextLookUp uses the result of that pass, and needs the same time for any number
+// of accounts. Request has the look-ups of a listing of 1000 cameras with 5 access entries each, including the one
+// pass; its counter "passes" is the number of times an account file was read. Completion compares the names of every
+// account.
 
 #include "platform/directory/AccountFiles.h"
 #include "platform/directory/Directory.h"
@@ -24,7 +25,7 @@ namespace {
 
 using namespace adminhost;
 
-/// A system root with so many users, for the life of the object.
+/// A system root with this many users, which exists as long as the object.
 class Accounts {
   public:
     explicit Accounts(std::int64_t count) {
@@ -42,7 +43,7 @@ class Accounts {
         users.close();
         std::ofstream(_directory / "etc/group") << "staff:x:50:\n";
         setSystemRoot(_directory.string());
-        // A file that has just been changed is read again and again; that is not what is measured here.
+        // A file that has just been changed is read at every look-up, which is not to be measured here.
         std::this_thread::sleep_for(std::chrono::milliseconds(50));
     }
     Accounts(const Accounts&) = delete;
@@ -82,7 +83,7 @@ std::size_t lookUp(std::int64_t accounts) {
 void FirstLookUp(benchmark::State& state) {
     const Accounts accounts(state.range(0));
     while (state.KeepRunning()) {
-        setDirectoryNodes({localAccounts()});  // knows nothing yet
+        setDirectoryNodes({localAccounts()});  // has read no file yet
         benchmark::DoNotOptimize(lookUp(state.range(0)));
     }
 }

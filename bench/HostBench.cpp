@@ -1,5 +1,5 @@
 // The daemon's own share of a request: against a bare echo over a Unix socket, through the worker, at start, in memory.
-// Compared things are timed in turn in one run, so that whatever else the machine does meets both alike.
+// Compared programs are timed in turn in one run, so that disturbances on the machine affect both equally.
 
 #include "tests/support/DaemonProcess.h"
 
@@ -36,7 +36,7 @@ sockaddr_un addressOf(const std::string& path) {
     return address;
 }
 
-/// A client without any comfort, so that what is measured is the server.
+/// A minimal client, so that the server is measured and not the client.
 class Client {
   public:
     explicit Client(const std::string& path) : _socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
@@ -49,7 +49,7 @@ class Client {
     Client& operator=(const Client&) = delete;
     ~Client() { ::close(_socket); }
 
-    /// Sends, and reads one answer of HTTP; answers its size.
+    /// Sends the text, reads one HTTP answer and returns its size.
     std::size_t exchange(std::string_view request) {
         if (::send(_socket, request.data(), request.size(), MSG_NOSIGNAL) != static_cast<ssize_t>(request.size())) {
             throw std::runtime_error("cannot send");
@@ -190,7 +190,7 @@ void startToFirstAnswer(benchmark::State& state) {
                 Client(daemon.socket()).exchange(overviewRequest);
                 break;
             } catch (const std::runtime_error&) {
-                ::usleep(200);  // the socket is not there yet
+                ::usleep(200);  // the socket does not exist yet
             }
         }
         times.push_back(std::chrono::duration<double, std::milli>(Clock::now() - start).count());

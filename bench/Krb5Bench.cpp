@@ -1,4 +1,4 @@
-// The Kerberos object layer against the library used directly, and how the listing of a keytab grows.
+// The Kerberos object layer against the library used directly, and the listing of keytabs of several sizes.
 
 #include "krb5/KRB5CredentialCache.h"
 #include "krb5/KRB5Keytab.h"
@@ -22,7 +22,7 @@ void require(bool condition, const char* what) {
     }
 }
 
-/// A realm for the whole program, with its environment in force.
+/// A realm for the whole program, with its environment variables set.
 struct Realm {
     Realm() : environment(kdc.environment()) { kdc.admin("addprinc -pw \"alice secret\" alice\n"); }
     support::Kdc kdc;
@@ -111,7 +111,7 @@ double medianOf(std::vector<double> values) {
     return values[values.size() / 2];
 }
 
-/// Both ways in turn, so that whatever else the machine does falls on both alike. Figures are medians.
+/// Times both in turn, so that disturbances on the machine affect both equally. Figures are medians.
 void ticketThroughLayerAndLibrary(benchmark::State& state) {
     const std::string path = realm().kdc.directory() / "bench";
     const auto layerContext = KRB5Context::context();

@@ -47,7 +47,7 @@ void parseWithExpatAlone(const std::string& list) {
     ::XML_ParserFree(parser);
 }
 
-/// The parsed value outlives the timing: freeing it is no part of parsing.
+/// The parsed value outlives the timing, because freeing it is not part of parsing.
 std::optional<Value> parseOurs(const std::string& list) {
     auto value = parsePropertyList(list);
     if (!value) {
@@ -64,7 +64,7 @@ void ParseAgainstExpatAlone(benchmark::State& state) {
     state.counters["bytes"] = static_cast<double>(text().size());
 }
 
-/// One run of Python answers the processor time of its parsing, without its start.
+/// Runs Python once and returns the processor time of its parsing, without its start.
 void ParseAgainstPlistlib(benchmark::State& state) {
     std::string place = std::filesystem::temp_directory_path() / "plistbench-XXXXXX";
     if (::mkdtemp(place.data()) == nullptr) {

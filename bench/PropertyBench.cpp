@@ -1,5 +1,5 @@
 // Listing 1000 properties, every fifth protected, against one bare run of the SQL tool with the same statement: by the
-// handler alone, and through the whole road.
+// handler alone, and through client, front and worker.
 
 #include "bench/Road.h"
 #include "handler/LumioRequestHandler.h"
@@ -10,7 +10,8 @@ using namespace bench;
 
 constexpr int propertyCount = 1000;
 
-/// The sample service, its properties replaced by the benchmark's: protected ones have two full lines and a part.
+/// The sample service with the benchmark's properties in place of its own. Protected values have two full lines and a
+/// shorter one.
 const SampleRoot& service() {
     static const SampleRoot root({0, 0, 0, 0, 0, 0});
     static const bool filled = [] {

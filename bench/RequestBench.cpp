@@ -1,4 +1,4 @@
-// Reading through the whole road against its floor.
+// Reading through client, front, worker and tools against its floor: the tool runs alone.
 
 #include "bench/Road.h"
 

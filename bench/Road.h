@@ -1,8 +1,8 @@
 #pragma once
 
-// A request through the whole road (client, socket, front, worker, plug-in, tools) timed against its floor: the same
-// runs of the same tools by posix_spawn and nothing else. Both are timed in turn in one run; "ratio" is the median of
-// the requests divided by the median of the floors.
+// Times a request on its whole way (client, socket, front, worker, plug-in, tools) against its floor: the same runs of
+// the same tools by posix_spawn alone. Both are timed in turn in one run; "ratio" is the median of the requests divided
+// by the median of the floors.
 
 #include "bench/Alternating.h"
 #include "tests/support/SampleRoot.h"
@@ -44,7 +44,7 @@ inline pid_t start(const Command& command, const posix_spawn_file_actions_t* act
     return child;
 }
 
-/// One bare run: both streams captured, the child waited for.
+/// One bare run: captures both streams and waits for the child.
 inline std::size_t run(const Command& command) {
     std::array<int, 2> out{};
     std::array<int, 2> err{};
@@ -86,7 +86,7 @@ inline std::size_t run(const Command& command) {
     return captured.size();
 }
 
-/// The daemon on a sample root, stopped with its owner.
+/// The daemon on a sample root. The destructor stops it.
 class Daemon {
   public:
     explicit Daemon(const SampleRoot& root) : _socket(root.directory() + "/s") {
@@ -110,7 +110,7 @@ class Daemon {
         ::waitpid(_process, nullptr, 0);
     }
 
-    /// One request on a connection of its own; the whole answer.
+    /// Sends one request on a connection of its own and returns the whole answer.
     [[nodiscard]] std::string request(const std::string& command, const std::string& body) const {
         const int connection = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
         sockaddr_un address{};

@@ -1,5 +1,5 @@
-// Writing all settings through the whole road against its floor: the three script runs, the read-back's one statement,
-// and three files written with the same flushes.
+// Writing all settings through client, front, worker and tools against its floor: the three script runs, the one
+// statement of reading back, and three files written with the same flushes.
 
 #include "bench/Road.h"
 
@@ -9,7 +9,7 @@ using namespace bench;
 
 constexpr const char* scripts = "/usr/share/sorvaneproducer/lumioserverd/script/";
 
-/// A file replaced as durably as can be: temporary file, flush, rename, flush of the directory.
+/// Replaces a file durably: temporary file, flush, rename, flush of the directory.
 void replace(const std::string& path, const std::string& bytes) {
     const std::string temporary = path + ".bench";
     const int file = ::open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
@@ -25,7 +25,7 @@ void replace(const std::string& path, const std::string& bytes) {
 void writeSettings(benchmark::State& state) {
     const SampleRoot root;
     const Daemon daemon(root);
-    // Every writable setting as it stands, so that each write is the same.
+    // Every writable setting with its current value, so that all writes are the same.
     const std::string read = daemon.request("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})");
     const std::string config = read.substr(read.find("\"configuration\":") + 16);
     const std::string body = R"({"optionalArguments":{"variant":"getConfig"},"configuration":)" +

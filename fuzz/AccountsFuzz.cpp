@@ -1,5 +1,5 @@
-// Account files as somebody might have left them: what the directory answers can travel in a property list, names
-// stand once, and each account is found by its name, its number and its UUID.
+// Damaged account files: the directory's entries fit into a property list, each name occurs once, and each account is
+// found by its name, its number and its UUID.
 
 #include "platform/directory/AccountFiles.h"
 #include "platform/plist/PropertyList.h"
@@ -17,7 +17,7 @@ namespace {
 using adminhost::Account;
 using adminhost::AccountKind;
 
-/// A system root of the process's own.
+/// A system root for this process only.
 class Root {
   public:
     Root() {

@@ -1,4 +1,4 @@
-// Base64: what is encoded comes back, and any text decodes to no more bytes than it has.
+// Base64: encoded bytes decode to the same bytes, and no text decodes to more bytes than it has.
 
 #include "codec/LumioCategories.h"
 

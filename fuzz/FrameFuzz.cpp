@@ -1,5 +1,4 @@
-// What a broken worker might send: frames in two pieces. A payload that is accepted is encoded and decoded to the same
-// bytes.
+// Frames of a broken worker, in two pieces. An accepted payload is encoded and decoded to the same bytes.
 
 #include "adminhostd/Frame.h"
 #include "platform/value/ValueCodec.h"

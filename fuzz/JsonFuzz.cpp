@@ -1,5 +1,5 @@
-// JSON texts: whatever is accepted is written and reads back as the same text, in both layouts; whatever is refused is
-// refused with a place and in valid UTF-8.
+// JSON texts: an accepted text can be written and reads back as the same text, in both layouts. The error of a rejected
+// text has a line and column and is valid UTF-8.
 
 #include "platform/json/Json.h"
 #include "platform/text/Utf8.h"

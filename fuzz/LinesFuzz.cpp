@@ -1,5 +1,5 @@
-// What the database tool might print: its rows are those of a second, plainer reading, and putting property rows
-// together again neither makes rows up nor loses a record's columns.
+// Output of the database tool: its rows are equal to those of a second, simpler reader. Rebuilding the rows of
+// properties neither invents rows nor loses columns of a record.
 
 #include "resources/WrappedRows.h"
 #include "settings/QueryRunner.h"
@@ -23,7 +23,7 @@ std::vector<std::string> split(const std::string& text, const std::string& separ
     return pieces;
 }
 
-/// The rows of an output, by splitting and joining.
+/// The simpler reader: splits the output into rows and joins their lines.
 std::vector<Row> rowsOf(const std::string& output) {
     std::vector<Row> rows;
     const std::vector<std::string> lines = split(output, "\n");

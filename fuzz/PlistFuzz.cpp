@@ -1,5 +1,5 @@
-// Property lists of either form: whatever is accepted can be written, unless it holds text that XML cannot carry, and
-// reads back as the same text.
+// Property lists of both forms: an accepted list can be written, unless it has text that XML cannot carry, and reads
+// back as the same text.
 
 #include "platform/plist/PropertyList.h"
 
@@ -16,7 +16,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     const auto text = xmlPropertyList(*value);
     if (!text) {
         if (isXml) {
-            std::abort();  // XML carried it once
+            std::abort();  // this text came from XML, so XML can carry it
         }
         return 0;
     }

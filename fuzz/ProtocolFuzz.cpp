@@ -1,4 +1,4 @@
-// What a broken peer might send: frames for either side. A message that is accepted encodes, and to the same again.
+// Frames of a broken peer, for both sides. An accepted message can be encoded, and decodes to the same message.
 
 #include "adminhostd/Protocol.h"
 

@@ -1,4 +1,5 @@
-// Strings tables: a refusal says why, and an accepted table, written in quoted-text form, reads back as itself.
+// Strings tables: a rejected table has a reason, and an accepted one, written in quoted-text form, reads back as the
+// same table.
 
 #include "platform/bundle/StringsTable.h"
 
@@ -26,7 +27,7 @@ bool writeText(std::string& out, const std::string& text) {
 
 bool writeEntries(std::string& out, const Dictionary& dictionary, int depth);
 
-/// False for what only the other forms can hold.
+/// Returns false if only the other forms can hold the value.
 bool writeValue(std::string& out, const Value& value, int depth) {
     if (depth > stringsTableMaximumDepth) {
         return false;
