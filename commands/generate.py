@@ -49,10 +49,10 @@ ACCESS = {
 
 COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline_seconds", "shows_revision", "takes_revision", "state", "parts", "available",
                  "errors", "keys", "answer", "include", "example"}
-# What programs that compare and write a desired state have to know of a key (README.md).
+# Words for programs that compare and write a desired state (README.md).
 STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_file", "kind", "kinds", "secret_if", "file",
                "locates", "restart", "looked_up", "shown_by"}
-# What a setting's number means and may sensibly be; described where the setting is read.
+# Unit and sensible range of a setting's number; described where the setting is read.
 RANGE_WORDS = {"unit", "minimum", "maximum"}
 KEY_WORDS = {"type", "entered_as", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"} | STATE_WORDS | RANGE_WORDS
 ANSWER_WORDS = {"type", "secret", "column", "help", "title", "kind"} | RANGE_WORDS
@@ -141,7 +141,7 @@ def from_json(pairs):
 
 
 def taken_over(commands, own, what, name, seen):
-    """The keys of a command with those that it takes over from others: what is "keys" or "answer"."""
+    """The keys of a command with those that it includes from others: what is "keys" or "answer"."""
     keys = dict(own)
     for under, source in commands[name].get("include", {}).get(what, {}).items():
         other, _, path = source.partition(":")
@@ -157,7 +157,7 @@ def taken_over(commands, own, what, name, seen):
 
 
 def in_tree_order(keys, under=""):
-    """Each key right behind its parent, so that what was taken over stands where it belongs."""
+    """Each key right after its parent, so that included keys are in their place."""
     ordered = {}
     for path, key in keys.items():
         if parent(path) == under:
