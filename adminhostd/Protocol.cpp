@@ -88,7 +88,7 @@ template <>
 constexpr auto members<Finding> = std::tuple(member("finding.keyPath", &Finding::keyPath),
                                              member("finding.rule", &Finding::rule),
                                              member("finding.advice", &Finding::advice));
-/// Answer::bytes is not among them: it is behind the dictionary, in the frame.
+/// Answer::bytes is not among them: it follows the dictionary in the frame.
 template <>
 constexpr auto members<Answer> = std::tuple(member("answer.outcome", &Answer::outcome),
                                             member("answer.error", &Answer::error),

@@ -1,5 +1,5 @@
-// The check of a request before any operation sees it. Operations put values verbatim into statements and arguments;
-// what those cannot carry is therefore refused here, as a whole, before anything has been changed.
+// The check of a request before it reaches an operation. Operations put values unchanged into statements and arguments.
+// If a value does not fit, the whole request is therefore refused here, before anything has been changed.
 
 #include "commands/CommandTable.h"
 #include "platform/value/ValueText.h"

@@ -4,7 +4,7 @@
 //
 // - Each object owns exactly one native handle; a handle from elsewhere is copied first, so no handle is shared.
 // - Every object holds a shared reference to the context it was created with, dropped after its own handle is freed.
-// - Nothing throws but KRB5CredentialCache::initWithName without name and principal. An operation that fails returns
+// - Only KRB5CredentialCache::initWithName throws, without name and principal. An operation that fails returns
 //   null or nullopt; errorCode() is then the status of the last library call that the object recorded (0 = success).
 //   Reading operations record too, and do so on const objects.
 // - No object may be used by two threads at once. That holds for all objects of one context together.

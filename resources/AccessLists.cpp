@@ -65,7 +65,7 @@ struct Names {
     std::vector<Named> groups;
 };
 
-/// Appends the login or group name behind a UUID text; false if it has none.
+/// Appends the login or group name of a UUID text; returns false if it has none.
 bool appendNameOf(const Value& uuidText, std::size_t index, Names& names) {
     const auto uuid = uuidText.string() == nullptr ? std::nullopt : adminhost::mbr_string_to_uuid(*uuidText.string());
     const auto id = uuid ? adminhost::mbr_uuid_to_id(*uuid) : std::nullopt;

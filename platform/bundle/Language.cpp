@@ -12,10 +12,10 @@ namespace adminhost {
 namespace {
 
 struct Tag {
-    std::string canonical;  ///< all that was said, in its canonical spelling
+    std::string canonical;  ///< all the given parts, in canonical spelling
     std::string language;
-    std::string script;      ///< said or likely
-    std::string region;      ///< said or likely
+    std::string script;      ///< given or likely
+    std::string region;      ///< given or likely
     bool hasRegion = false;  ///< said
 };
 

@@ -48,7 +48,8 @@ std::optional<Array> directoryEntries(std::string_view matchText, std::size_t li
     Array entries;
     std::set<std::tuple<std::string, std::string, std::string>> seen;  // node, type, short name
     for (const std::string_view attribute : {directory::recordName, directory::realName}) {
-        // The second question may find the same records again; asked for as many as the limit, it still fills it up.
+        // The second query may find the same records again. It asks for as many as the limit, so the result still
+        // reaches it.
         const auto records = find(*node, attribute, Match::beginsWith, matchText, limit, error);
         if (!records) {
             return std::nullopt;

@@ -3,7 +3,7 @@
 // The system log: one call for each event. The rooms of platform/ do not log; their callers do.
 //
 // Every sink writes the text as logTextOf() returns it, so that a name, a value or the output of a tool cannot look
-// like an event of its own. No sink ever blocks: what cannot be written at once waits in a queue of 1 MiB, events
+// like a separate event. No sink ever blocks: text that cannot be written at once waits in a queue of 1 MiB. Events
 // beyond it are lost, and their number is logged as soon as the log can be written again.
 
 #include <string>

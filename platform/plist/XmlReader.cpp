@@ -197,7 +197,7 @@ class XmlReader {
     static void guarded(void* self, Handler handler) noexcept {
         XmlReader& reader = *static_cast<XmlReader*>(self);
         if (!reader._message.empty()) {
-            return;  // expat may call on for a moment after it has been told to stop
+            return;  // expat may still call for a moment after XML_StopParser()
         }
         try {
             handler(reader);

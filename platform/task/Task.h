@@ -12,10 +12,10 @@
 // its input: the rest is dropped.
 //
 // Standard output and error are captured whole, up to 256 MiB together. More is a failure, never a truncation: the
-// tool's process group is killed and -1 returned. Bytes that are not UTF-8 become U+FFFD each, because captured text
-// must be able to travel in a property list; those bytes are lost. A tool may leave a daemon behind that holds the
-// pipes: once the tool itself has exited, what is in the pipes is read, at most 200 ms are waited for more, and the
-// daemon stays alive (its later output meets a closed pipe).
+// tool's process group is killed and -1 returned. Bytes that are not UTF-8 become U+FFFD each and are lost, because
+// captured text must fit into a property list. A tool may leave a daemon behind that holds the pipes. In that case,
+// once the tool itself has exited, the content of the pipes is read, at most 200 ms are waited for more, and the daemon
+// keeps running (its later output meets a closed pipe).
 //
 // A null place for captured text means that the stream is read and dropped, within the same bound. Places are
 // replaced, not appended to. After a failure both are empty, except for the error's text.

@@ -51,7 +51,7 @@ class TaskGroup {
     /// Starts a tool. One that cannot be started has ended with status -1.
     [[nodiscard]] Id start(TaskPlan plan);
 
-    /// Adds what to poll for. When one is ready, call serve().
+    /// Adds the descriptors to poll. When one is ready, call serve().
     void addTo(std::vector<pollfd>& entries) const;
     /// The latest moment of the next call of serve(), if there is one.
     [[nodiscard]] std::optional<Clock::time_point> due() const;

@@ -37,8 +37,8 @@ class ToolRegister {
     /// A place for one tool, which is free again when it is 0; null if all are used.
     [[nodiscard]] std::atomic<pid_t>* claim() noexcept;
 
-    /// After the death of the process that filled it: kills the process groups of the tools that still run, and empties
-    /// the register. A group whose first process has exited is left alone, because what is in it is a service that the
+    /// After the death of the process that filled it: kills the process groups of the tools that are still running, and
+    /// empties the register. A group whose first process has exited is left alone, because it is a service that the
     /// tool has started. Waits for at most some milliseconds for each tool.
     void killRemaining() noexcept;
 
