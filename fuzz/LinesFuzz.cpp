@@ -1,5 +1,5 @@
 // Output of the database tool: its rows are equal to those of a second, simpler reader. Rebuilding the rows of
-// properties neither invents rows nor loses columns of a record.
+// properties does not invent rows.
 
 #include "resources/WrappedRows.h"
 #include "settings/QueryRunner.h"

@@ -10,8 +10,8 @@ import sys
 
 SOURCES = {".cpp", ".h"}
 INCLUDE = re.compile(r'^\s*#\s*include\s*"([^"]+)"')
-# Room: the rooms and folders that it may include besides itself. Rooms and folders are path prefixes. Of a file's path the
-# longest prefix counts, so a room inside another one, or a folder or file that is named on its own, goes before it.
+# Room: the rooms and folders that it may include besides itself. Rooms and folders are path prefixes. The longest prefix of
+# a file's path counts, so an entry for a room, folder or file inside another room overrides that room's entry.
 CONTROL = {"platform/value", "platform/text", "platform/plist", "platform/json", "platform/files"}
 MAY_INCLUDE = {
     "platform": set(),
@@ -58,7 +58,7 @@ def check(root):
             continue
         for number, line in enumerate(path.read_text(encoding="utf-8").splitlines(), 1):
             match = INCLUDE.match(line)
-            # Includes are written from the project's root; what is not there is generated or a mistake the compiler finds.
+            # Includes start at the project's root. A file that is not there is generated, or the compiler reports it.
             if match and match[1].split("/", 1)[0] in TOP | FREE:
                 why = refused(name, match[1])
                 if why:

@@ -4,13 +4,13 @@
 usage: plugin_words.py [ROOT]   (the project's root: by default the directory above this script's)
 
 The words are not listed here: they are the commands, keys, words and columns in the descriptions (commands/*.toml), and the
-tools, tables and names of several words that the plug-in's own rooms have in literals. A word that nobody writes by chance
-("server_port", "getCameras") is looked for everywhere. Of the plain ones only the names of lists and dictionaries ("cameras")
-are looked for, as whole string literals: that of a single value ("name") is anybody's.
+tools, tables and names of several words that the plug-in's own rooms have in literals. A compound word ("server_port",
+"getCameras") is looked for everywhere, because it is not written by chance. Of the plain words, only the names of lists and
+dictionaries ("cameras") are looked for, as whole string literals: the name of a single value ("name") may be anyone's.
 
-The plug-in also uses words of others, which are free: those that the daemon's own documentation defines (docs/http.md, and
-the form of a description in commands/README.md), as far as they are plain; and a key that a room of platform/ documents in a
-header and writes in its source.
+Some words of the plug-in are not its own and are permitted: plain words that the daemon's own documentation defines
+(docs/http.md, and the form of a description in commands/README.md), and a key that a room of platform/ documents in a header
+and uses in its source.
 """
 
 import pathlib
@@ -19,7 +19,7 @@ import sys
 import tomllib
 
 HOST = ["adminhostd", "platform", "adminhostctl"]
-# The verbs of this one service, and the program that puts them together.
+# The verbs of this one service, and the program that joins them.
 NOT_HOST = ["adminhostctl/lumio", "adminhostctl/desired", "adminhostctl/Main.cpp"]
 PLUGIN = ["plugin", "handler", "resources", "settings", "commands"]
 SOURCES = {".cpp", ".h"}
@@ -27,7 +27,7 @@ TEXT = re.compile(r'"((?:[^"\\\n]|\\.)*)"')
 TABLE = re.compile(r"\b(?:from|into|update|join|table) +([a-z_]+)", re.IGNORECASE)
 TOOL = re.compile(r"^/(?:usr/)?s?bin/([^/ ]+)$")
 IDENTIFIER = re.compile(r"^[a-z_][A-Za-z0-9_]*$")
-# Made of several words: nobody writes it by chance.
+# A word made of several words, which is not written by chance.
 COMPOUND = re.compile(r"[a-z]+[A-Z]|[A-Za-z]_[A-Za-z]|[A-Za-z][0-9]$")
 
 
