@@ -5,8 +5,8 @@
 // - Each object owns exactly one native handle; a handle from elsewhere is copied first, so no handle is shared.
 // - Every object holds a shared reference to the context it was created with, dropped after its own handle is freed.
 // - Only KRB5CredentialCache::initWithName throws, without name and principal. An operation that fails returns
-//   null or nullopt; errorCode() is then the status of the last library call that the object recorded (0 = success).
-//   Reading operations record too, and do so on const objects.
+//   null, nullopt, false or an empty list. errorCode() is then the status of the last library call that the object
+//   recorded (0 = success). Reading operations record too, and do so on const objects.
 // - No object may be used by two threads at once. That holds for all objects of one context together.
 // - Texts of principals and realms are UTF-8; one that is not counts as missing. File names of keytabs and caches are
 //   bytes of the file system's own encoding.

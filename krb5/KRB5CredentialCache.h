@@ -79,8 +79,8 @@ class KRB5CredentialCache : public KRB5Object {
 
     /// All credentials that can be read. errorCode is 0 after a complete listing.
     [[nodiscard]] std::vector<KRB5Credential> credentials() const;
-    /// Removes the cache and re-opens it by its bare name, without the type: a memory cache comes back as a file cache,
-    /// and a file cache with a colon in its path does not come back.
+    /// Removes the cache and re-opens it by its bare name, without the type: a memory cache becomes a file cache, and
+    /// a file cache with a colon in its path cannot be re-opened.
     void destroy();
 
     [[nodiscard]] krb5_ccache nativeCredentialCache() const noexcept { return _nativeCredentialCache.get(); }

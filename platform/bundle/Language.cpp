@@ -16,7 +16,7 @@ struct Tag {
     std::string language;
     std::string script;      ///< given or likely
     std::string region;      ///< given or likely
-    bool hasRegion = false;  ///< said
+    bool hasRegion = false;  ///< given
 };
 
 /// Lower case, with single blanks for "_" and "-".
