@@ -32,6 +32,6 @@ def write(root, workflows):
             write_strings(root, bundle, language, "InfoPlist", {"Name": name, "Description": description})
     settings.write_plist(root, LOCALIZATIONS + "/Contents/Info.plist", {"Name": "Server localizations"})
     for language, entries in library.DESCRIPTIONS.items():
-        # One table in the other encoding that such tables come in ("utf-16" writes a byte-order mark).
+        # One table has the other encoding that such tables may have ("utf-16" writes a byte-order mark).
         encoding = "utf-16" if language == "French" else "utf-8"
         write_strings(root, LOCALIZATIONS, language, "PropertyDescriptions", entries, encoding)

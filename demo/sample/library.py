@@ -1,4 +1,4 @@
-"""What the sample library holds: cameras, workflows and properties with their texts."""
+"""The contents of the sample library: cameras, workflows and properties with their texts."""
 
 # name, recording status, disabled, access control, access list, last user of the camera
 CAMERAS = [
@@ -76,7 +76,7 @@ DESCRIPTIONS = {
     },
 }
 
-# Of ten jobs in turn; a job that was never handed to the grid has neither id nor status.
+# The states of ten jobs, which repeat; a job that was never sent to the grid has neither id nor status.
 JOB_STATUSES = ["Finished", "Finished", "Finished", "Running", "Finished", "Finished", "Pending", "Failed", None, "Canceled"]
 
 

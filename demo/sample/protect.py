@@ -4,7 +4,7 @@ import base64
 import functools
 import subprocess
 
-# The sample service's key: fixed, so that roots of one size are the same. A real service draws its own.
+# The sample service's key: fixed, so that roots of one size are the same. A real service creates a random one.
 KEY = b"lumio-sample-key"
 VECTOR = b"LumioPropertyIV1"
 

@@ -67,7 +67,7 @@ production:
 
 
 def below(root, path):
-    """The disk path of a host path, with its directory made."""
+    """The disk path of a host path; creates its directory."""
     disk = root / path.lstrip("/")
     disk.parent.mkdir(parents=True, exist_ok=True)
     return disk

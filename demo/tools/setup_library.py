@@ -1,4 +1,4 @@
-"""Lays out a library: setup_library.py ROOT. What is there already stays as it is."""
+"""Creates a library: setup_library.py ROOT. Files that exist already are not changed."""
 
 import os
 import plistlib

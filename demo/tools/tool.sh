@@ -1,5 +1,5 @@
-# What the stand-ins share. A tool sets `place` (its own host path) and `switches` (the name of its switch files), finds
-# `root` from them, and sources this: it records the call and does what the switches say (demo/README.md lists both).
+# Common code of the stand-ins. A tool sets `place` (its own host path) and `switches` (the name of its switch files),
+# derives `root` from them, and sources this file, which records the call and obeys the switches (demo/README.md).
 
 if [ -f "$root/var/log/tool-calls.log" ]; then
     /usr/bin/python3 -S -c '
