@@ -8,6 +8,7 @@
 
 #include "platform/bundle/StringsTable.h"
 #include "platform/files/Path.h"
+#include "platform/framework/Export.h"
 #include "platform/value/Value.h"
 
 #include <optional>
@@ -18,7 +19,7 @@
 
 namespace adminhost {
 
-class Bundle {
+class ADMINHOST_EXPORT Bundle {
   public:
     /// Returns nullopt if the path is not a directory.
     [[nodiscard]] static std::optional<Bundle> open(const HostPath& path);
@@ -43,11 +44,11 @@ class Bundle {
 
 /// Reads a strings table of any form: XML, binary or quoted text. Fails if it cannot be read, is not a dictionary or is
 /// larger than stringsTableMaximumSize.
-[[nodiscard]] Result<Dictionary> readStringsTable(const DiskPath& path);
+[[nodiscard]] ADMINHOST_EXPORT Result<Dictionary> readStringsTable(const DiskPath& path);
 
 /// The table in the best of the preferred languages (names or codes, most preferred first) that has it, else in
 /// "English". Returns nullopt if there is none, and also if the first one found cannot be read.
-[[nodiscard]] std::optional<Dictionary> localizedTable(const Bundle& bundle, std::string_view table,
-                                                       const std::vector<std::string>& preferredLanguages);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Dictionary> localizedTable(
+    const Bundle& bundle, std::string_view table, const std::vector<std::string>& preferredLanguages);
 
 }  // namespace adminhost

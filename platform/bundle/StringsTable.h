@@ -9,6 +9,7 @@
 // character beyond U+FFFF), and a backslash before any other character for that character. An octal escape names the
 // character U+0000 to U+00FF. Encodings: UTF-8 and UTF-16, with or without a byte-order mark.
 
+#include "platform/framework/Export.h"
 #include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
@@ -23,6 +24,6 @@ constexpr int stringsTableMaximumDepth = 64;                             ///< ne
 /// Parses a strings table in quoted-text form, or an XML or binary property list that is a dictionary. If a key occurs
 /// twice, the last one counts. The error describes what is wrong and where (line and column from 1, counted in
 /// characters). Rejected: the character NUL, invalid UTF-8 and UTF-16, sizes and depths above the maximum.
-[[nodiscard]] Result<Dictionary> parseStringsTable(std::string_view bytes);
+[[nodiscard]] ADMINHOST_EXPORT Result<Dictionary> parseStringsTable(std::string_view bytes);
 
 }  // namespace adminhost

@@ -2,6 +2,8 @@
 
 // The one-shot cipher call, and the wiping of secrets.
 
+#include "platform/framework/Export.h"
+
 #include <cstddef>
 #include <cstdint>
 #include <string>
@@ -31,13 +33,14 @@ constexpr std::int32_t kCCUnimplemented = -4305;   ///< the cryptography library
 /// exactly: a plain text that just fits is decrypted although its cipher text is longer than the buffer. On any other
 /// status than kCCSuccess and kCCBufferTooSmall dataOutMoved is 0 and no plain text is left in dataOut.
 /// A wrong key is noticed only if it spoils the padding. Input and output must not overlap.
-[[nodiscard]] std::int32_t CCCrypt(std::uint32_t operation, std::uint32_t algorithm, std::uint32_t options,
-                                   const void* key, std::size_t keyLength, const void* initialisationVector,
-                                   const void* dataIn, std::size_t dataInLength, void* dataOut,
-                                   std::size_t dataOutAvailable, std::size_t* dataOutMoved) noexcept;
+[[nodiscard]] ADMINHOST_EXPORT std::int32_t CCCrypt(std::uint32_t operation, std::uint32_t algorithm,
+                                                    std::uint32_t options, const void* key, std::size_t keyLength,
+                                                    const void* initialisationVector, const void* dataIn,
+                                                    std::size_t dataInLength, void* dataOut,
+                                                    std::size_t dataOutAvailable, std::size_t* dataOutMoved) noexcept;
 
 /// Overwrites the bytes in a way that the compiler keeps.
-void cleanse(void* bytes, std::size_t length) noexcept;
+ADMINHOST_EXPORT void cleanse(void* bytes, std::size_t length) noexcept;
 
 /// Wipes a text or data of its owner when the scope ends, its unused capacity excepted.
 template <typename Bytes>

@@ -7,6 +7,7 @@
 // file that changed within the clock's resolution of being read is read again.
 
 #include "platform/files/Path.h"
+#include "platform/framework/Export.h"
 #include "platform/text/Uuid.h"
 #include "platform/value/Error.h"
 
@@ -26,7 +27,7 @@ namespace adminhost {
 enum class AccountKind { user, group };
 
 /// One line of an account file. A property list can carry all of its texts.
-struct Account {
+struct ADMINHOST_EXPORT Account {
     std::string name;
     std::string longName;  ///< empty if there is none, and for groups
     std::string home;
@@ -40,7 +41,7 @@ struct Account {
 using GivenUuids = std::unordered_map<std::string, std::string>;
 
 /// The accounts of one kind, in file order; names are unique. Not copyable or movable, because indexes point into it.
-class AccountTable {
+class ADMINHOST_EXPORT AccountTable {
   public:
     AccountTable(AccountKind kind, std::vector<Account> accounts, std::shared_ptr<const GivenUuids> given);
     AccountTable(const AccountTable&) = delete;
@@ -67,7 +68,7 @@ class AccountTable {
     mutable std::optional<std::vector<std::pair<Uuid, std::size_t>>> _byUuid;  ///< built by the first look-up
 };
 
-class AccountFiles {
+class ADMINHOST_EXPORT AccountFiles {
   public:
     /// If there is a file of UUIDs, only accounts named in it have a UUID.
     explicit AccountFiles(std::optional<HostPath> uuidFile = std::nullopt) : _uuidFile(std::move(uuidFile)) {}

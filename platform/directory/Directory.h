@@ -10,6 +10,7 @@
 // it. Failures are errors with a code and a description for people. A query returns everything it found or an error,
 // never a part. All calls come from one thread. A property list can carry all texts that nodes return.
 
+#include "platform/framework/Export.h"
 #include "platform/value/Error.h"
 
 #include <cstddef>
@@ -50,7 +51,7 @@ inline constexpr std::int64_t noSuchRecord = 3;
 
 using DirectoryAttributes = std::map<std::string, std::vector<std::string>, std::less<>>;
 
-struct DirectoryQuery {
+struct ADMINHOST_EXPORT DirectoryQuery {
     enum class Match : std::uint32_t {
         equal = 0x2001,       ///< the whole value; UUIDs without regard to case
         beginsWith = 0x2002,  ///< the beginning of the value, without regard to case
@@ -64,7 +65,7 @@ struct DirectoryQuery {
     std::size_t maximum = 0;              ///< the first so many records; 0 is no limit
 };
 
-struct DirectoryRecord {
+struct ADMINHOST_EXPORT DirectoryRecord {
     std::string type;
     std::string node;  ///< name of the node that holds it
     DirectoryAttributes attributes;
@@ -75,7 +76,7 @@ struct DirectoryRecord {
     [[nodiscard]] const std::string* first(std::string_view attribute) const noexcept;
 };
 
-class DirectoryNode {
+class ADMINHOST_EXPORT DirectoryNode {
   public:
     DirectoryNode() = default;
     DirectoryNode(const DirectoryNode&) = delete;
@@ -104,12 +105,12 @@ class DirectoryNode {
 };
 
 /// A node that can be opened: its name, and how. Opening returns null, with the error, on failure.
-struct DirectoryNodeSource {
+struct ADMINHOST_EXPORT DirectoryNodeSource {
     std::string name;
     std::function<std::unique_ptr<DirectoryNode>(Error*)> open;
 };
 
-class DirectorySession {
+class ADMINHOST_EXPORT DirectorySession {
   public:
     /// The node that searches all nodes of the session in order. It fails as soon as one of them does.
     static constexpr std::uint32_t authenticationSearchNode = 0x2201;
@@ -131,6 +132,6 @@ class DirectorySession {
 };
 
 /// Sets the nodes of the default session, in search order. Called by the worker before requests are served.
-void setDirectoryNodes(std::vector<DirectoryNodeSource> nodes);
+ADMINHOST_EXPORT void setDirectoryNodes(std::vector<DirectoryNodeSource> nodes);
 
 }  // namespace adminhost

@@ -6,6 +6,7 @@
 // "type": "user" or "group". Keys for attributes that a record lacks are absent.
 
 #include "platform/directory/Directory.h"
+#include "platform/framework/Export.h"
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
 
@@ -15,16 +16,17 @@
 
 namespace adminhost {
 
-[[nodiscard]] Dictionary directoryEntryOf(const DirectoryRecord& record);
+[[nodiscard]] ADMINHOST_EXPORT Dictionary directoryEntryOf(const DirectoryRecord& record);
 
 /// People and groups whose short or full name begins with the text, without regard to case. Returns entries, those
 /// found by short name first, each record once, at most `limit` of them (0 is no limit). An empty text finds all.
 /// Returns nullopt, with the error, if the directory fails.
-[[nodiscard]] std::optional<Array> directoryEntries(std::string_view matchText, std::size_t limit,
-                                                    Error* error = nullptr);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Array> directoryEntries(std::string_view matchText, std::size_t limit,
+                                                                     Error* error = nullptr);
 
 /// People and groups whose short name or UUID is the text: entries that also have "node", the name of the node that
 /// holds the record.
-[[nodiscard]] std::optional<Array> directoryEntriesOf(std::string_view nameOrUuid, Error* error = nullptr);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Array> directoryEntriesOf(std::string_view nameOrUuid,
+                                                                       Error* error = nullptr);
 
 }  // namespace adminhost

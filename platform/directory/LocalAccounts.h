@@ -8,6 +8,7 @@
 
 #include "platform/directory/Directory.h"
 #include "platform/files/Path.h"
+#include "platform/framework/Export.h"
 
 #include <optional>
 #include <string_view>
@@ -20,6 +21,6 @@ inline constexpr std::string_view localAccountsNodeName = "/Local";
 /// not change. With a file of UUIDs ("user:NAME UUID" or "group:NAME UUID" on each line), an account has the UUID in
 /// that file or none, and a query fails if the file cannot be read. Without such a file, accounts have name-based
 /// UUIDs.
-[[nodiscard]] DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile = std::nullopt);
+[[nodiscard]] ADMINHOST_EXPORT DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile = std::nullopt);
 
 }  // namespace adminhost

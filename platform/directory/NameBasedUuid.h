@@ -2,6 +2,7 @@
 
 // UUIDs that are computed from names.
 
+#include "platform/framework/Export.h"
 #include "platform/text/Uuid.h"
 
 #include <string_view>
@@ -9,7 +10,7 @@
 namespace adminhost {
 
 /// The name-based UUID (RFC 4122, version 5, SHA-1) of a name in a namespace.
-[[nodiscard]] Uuid nameBasedUuid(const Uuid& space, std::string_view name);
+[[nodiscard]] ADMINHOST_EXPORT Uuid nameBasedUuid(const Uuid& space, std::string_view name);
 
 /// The namespace of the UUIDs that accounts of this machine get: "user:NAME" and "group:NAME" are the names in it.
 /// The service's own tool computes the same ones, so it never changes.

@@ -5,6 +5,8 @@
 // A loop and the services resolved in it are created and freed inside one operation. All callbacks arrive on the thread
 // that runs the loop, and only while it runs (or starts) something. Services must be destroyed before their loop.
 
+#include "platform/framework/Export.h"
+
 #include <chrono>
 #include <memory>
 #include <vector>
@@ -13,7 +15,7 @@ namespace adminhost {
 
 class NetService;
 
-class EventLoop {
+class ADMINHOST_EXPORT EventLoop {
   public:
     EventLoop();
     EventLoop(const EventLoop&) = delete;

@@ -3,13 +3,14 @@
 // Reverse look-up of an address.
 
 #include "platform/dnssd/NetService.h"
+#include "platform/framework/Export.h"
 
 #include <optional>
 #include <string>
 
 namespace adminhost {
 
-struct HostName {
+struct ADMINHOST_EXPORT HostName {
     std::optional<std::string> name;
     int error = 0;  ///< the resolver's EAI number when the look-up failed, else 0
 
@@ -20,6 +21,6 @@ struct HostName {
 /// text. No name and no error means that the host's entry has no name. Blocks: each name server is asked once, for 2
 /// seconds at most, whatever /etc/resolv.conf says (it lists three servers at most). Other sources of the name service
 /// switch keep their own bounds.
-[[nodiscard]] HostName hostNameOf(const SocketAddress& address);
+[[nodiscard]] ADMINHOST_EXPORT HostName hostNameOf(const SocketAddress& address);
 
 }  // namespace adminhost

@@ -13,6 +13,7 @@
 // resolution.
 
 #include "platform/dnssd/EventLoop.h"
+#include "platform/framework/Export.h"
 #include "platform/value/Value.h"
 
 #include <chrono>
@@ -28,7 +29,7 @@ namespace adminhost {
 /// The bytes of a socket address (sockaddr_in or sockaddr_in6, whole).
 using SocketAddress = std::vector<std::uint8_t>;
 
-class NetService {
+class ADMINHOST_EXPORT NetService {
   public:
     /// Callbacks; an empty one is not called. They may stop the service, but not destroy it.
     struct Delegate {

@@ -3,6 +3,7 @@
 // Creating directories and empty files that are missing.
 
 #include "platform/files/Path.h"
+#include "platform/framework/Export.h"
 #include "platform/value/Error.h"
 
 #include <optional>
@@ -11,7 +12,7 @@
 
 namespace adminhost {
 
-struct OwnerAndMode {
+struct ADMINHOST_EXPORT OwnerAndMode {
     uid_t owner = 0;
     gid_t group = 0;
     mode_t mode = 0755;
@@ -20,12 +21,13 @@ struct OwnerAndMode {
 /// Creates the directory and every missing one above it, each with this owner and mode. An existing one keeps its own.
 /// On failure the error names the step and the system's text, and created directories stay; an owner that cannot be set
 /// is such a failure.
-[[nodiscard]] std::optional<Error> createDirectories(const DiskPath& path, const OwnerAndMode& ownerAndMode);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Error> createDirectories(const DiskPath& path,
+                                                                      const OwnerAndMode& ownerAndMode);
 
 /// Creates an empty file of mode 0644. An existing file or link of that name is an error; a link is not followed.
-[[nodiscard]] std::optional<Error> createEmptyFile(const DiskPath& path);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Error> createEmptyFile(const DiskPath& path);
 
 /// The id of a group in the account files below the system root; nullopt if there is no such group.
-[[nodiscard]] std::optional<gid_t> groupIdOf(const char* name);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<gid_t> groupIdOf(const char* name);
 
 }  // namespace adminhost

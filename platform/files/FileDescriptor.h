@@ -2,6 +2,8 @@
 
 // One open file descriptor, closed by its destructor. Move-only; a moved-from one is empty.
 
+#include "platform/framework/Export.h"
+
 #include <cerrno>
 #include <utility>
 
@@ -9,7 +11,7 @@
 
 namespace adminhost {
 
-class FileDescriptor {
+class ADMINHOST_EXPORT FileDescriptor {
   public:
     FileDescriptor() noexcept = default;
     /// Takes ownership; a negative number is an empty descriptor.

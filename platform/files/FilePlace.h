@@ -4,13 +4,14 @@
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/Path.h"
+#include "platform/framework/Export.h"
 
 #include <string>
 
 namespace adminhost {
 
 /// A file's directory, open for reading, and its name in it.
-struct FilePlace {
+struct ADMINHOST_EXPORT FilePlace {
     FileDescriptor directory;
     std::string name;
 };
@@ -18,6 +19,6 @@ struct FilePlace {
 /// Finds the place of a file, which need not exist. Links on the way are followed only where nobody but root and this
 /// process's own user can have created them: a link in a directory that others may write to is ELOOP. Returns the
 /// system's error number, 0 for success; a path that does not end in a name ("/", "a/", "a/..") is EINVAL.
-[[nodiscard]] int openPlace(const DiskPath& path, FilePlace& place);
+[[nodiscard]] ADMINHOST_EXPORT int openPlace(const DiskPath& path, FilePlace& place);
 
 }  // namespace adminhost

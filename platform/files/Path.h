@@ -6,13 +6,15 @@
 // place of the file on this disk. Functions that touch the disk accept a DiskPath only; diskPath() is the one way from
 // the first to the second. Both compare and copy as their text; neither is normalised.
 
+#include "platform/framework/Export.h"
+
 #include <compare>
 #include <string>
 #include <utility>
 
 namespace adminhost {
 
-class HostPath {
+class ADMINHOST_EXPORT HostPath {
   public:
     HostPath() = default;
     explicit HostPath(std::string text) : _text(std::move(text)) {}
@@ -23,7 +25,7 @@ class HostPath {
     std::string _text;
 };
 
-class DiskPath {
+class ADMINHOST_EXPORT DiskPath {
   public:
     DiskPath() = default;
     explicit DiskPath(std::string text) : _text(std::move(text)) {}
@@ -36,18 +38,18 @@ class DiskPath {
 };
 
 /// Sets the directory below which every absolute host path is: "/" at first. Set once, before requests are served.
-void setSystemRoot(std::string directory);
-[[nodiscard]] const std::string& systemRoot() noexcept;
+ADMINHOST_EXPORT void setSystemRoot(std::string directory);
+[[nodiscard]] ADMINHOST_EXPORT const std::string& systemRoot() noexcept;
 
 /// The host path below the system root. While that is "/" a path stays as it is, and a relative one is relative to the
 /// current directory. Below any other root a relative path begins at the root, and no step ".." of the text leads above
 /// it: whatever the path, nothing outside the root is touched, unless a link inside leads there.
-[[nodiscard]] DiskPath diskPath(const HostPath& path);
+[[nodiscard]] ADMINHOST_EXPORT DiskPath diskPath(const HostPath& path);
 
 /// The way back, for texts that people read: the host path of a place below the system root; any other path as it is.
-[[nodiscard]] HostPath hostPath(const DiskPath& path);
+[[nodiscard]] ADMINHOST_EXPORT HostPath hostPath(const DiskPath& path);
 
 /// Returns true if a file system entry exists there (a link is followed). Returns false also if it cannot be known.
-[[nodiscard]] bool exists(const DiskPath& path) noexcept;
+[[nodiscard]] ADMINHOST_EXPORT bool exists(const DiskPath& path) noexcept;
 
 }  // namespace adminhost

@@ -5,6 +5,8 @@
 //
 // The note is an ordinary ELF note of the name "adminhost", so it survives stripping and `readelf -n` shows it.
 
+#include "platform/framework/Export.h"
+
 #include <cstddef>
 #include <cstdint>
 #include <string_view>
@@ -48,7 +50,7 @@ constexpr std::uint32_t buildNoteType = 1;
 constexpr std::string_view buildNoteName = "adminhost";
 
 /// The note as it is in the file: the header of an ELF note, its name padded to four bytes, the identity.
-struct BuildNote {
+struct ADMINHOST_EXPORT BuildNote {
     std::uint32_t nameSize = 10;
     std::uint32_t descriptionSize = buildIdentityMaximum;
     std::uint32_t type = buildNoteType;

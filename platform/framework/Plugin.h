@@ -10,6 +10,7 @@
 
 #include "platform/files/Path.h"
 #include "platform/framework/BuildNote.h"
+#include "platform/framework/Export.h"
 #include "platform/framework/PluginRequestHandler.h"
 #include "platform/value/Result.h"
 #include "platform/value/Value.h"
@@ -30,7 +31,7 @@ enum class Access : std::uint8_t {
     account,  ///< handles accounts or their passwords
 };
 
-struct Command {
+struct ADMINHOST_EXPORT Command {
     std::string name;                 ///< last word of its address; unique in the plug-in
     Access access = Access::account;  ///< the strictest, in case that one is forgotten
     bool showsRevision = false;       ///< its response includes revision()
@@ -44,7 +45,7 @@ struct Command {
 };
 
 /// One reason why a whole request is refused.
-struct Finding {
+struct ADMINHOST_EXPORT Finding {
     std::string keyPath;  ///< "configuration.cameras.0.name"
     std::string rule;     ///< what is wrong
     std::string advice;   ///< how to fix it
@@ -54,7 +55,7 @@ struct Finding {
 
 /// Whether something that commands need is usable. Unknown (time-out, no memory) is not unusable: a client may send the
 /// same request again.
-struct Probe {
+struct ADMINHOST_EXPORT Probe {
     enum class State : std::uint8_t { usable, unusable, unknown };
     State state = State::usable;
     std::string reason;  ///< "/usr/bin/tool cannot be run (No such file or directory)"
@@ -62,7 +63,7 @@ struct Probe {
 };
 
 /// The result of one check of the installation.
-struct Diagnosis {
+struct ADMINHOST_EXPORT Diagnosis {
     enum class Health : std::uint8_t { ok, warning, failure };
     Health health = Health::ok;
     std::string name;   ///< "database"
@@ -71,24 +72,24 @@ struct Diagnosis {
 };
 
 /// A setting whose history the host keeps: a key of Plugin::settings().
-struct Setting {
+struct ADMINHOST_EXPORT Setting {
     std::string key;
     bool secret = false;
 };
 
 /// A log file of the service.
-struct LogFile {
+struct ADMINHOST_EXPORT LogFile {
     std::string name;  ///< "access"
     HostPath path;
 };
 
 /// A configuration file that the plug-in's tools read.
-struct ToolFile {
+struct ADMINHOST_EXPORT ToolFile {
     std::string path;  ///< below the directory that XDG_CONFIG_HOME names for the tools: "tool/toolrc"
     std::string text;
 };
 
-class Plugin {
+class ADMINHOST_EXPORT Plugin {
   public:
     Plugin() = default;
     Plugin(const Plugin&) = delete;

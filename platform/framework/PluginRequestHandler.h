@@ -3,6 +3,7 @@
 // What the host gives a request handler: the base class, the forms of a response, the user defaults and random UUID
 // texts.
 
+#include "platform/framework/Export.h"
 #include "platform/value/Value.h"
 
 #include <string>
@@ -12,7 +13,7 @@
 namespace adminhost {
 
 /// What an operation returns: a response dictionary, no response, or the framework's error response.
-class Response {
+class ADMINHOST_EXPORT Response {
   public:
     enum class Kind { nothing, dictionary, error };
 
@@ -34,7 +35,7 @@ class Response {
 };
 
 /// Base of every request handler.
-class PluginRequestHandler {
+class ADMINHOST_EXPORT PluginRequestHandler {
   public:
     PluginRequestHandler() = default;
     PluginRequestHandler(const PluginRequestHandler&) = delete;
@@ -46,11 +47,11 @@ class PluginRequestHandler {
 };
 
 /// The process's user defaults: values of the daemon's configuration that plug-ins read. Null for an unknown name.
-[[nodiscard]] const Value& userDefault(std::string_view name) noexcept;
+[[nodiscard]] ADMINHOST_EXPORT const Value& userDefault(std::string_view name) noexcept;
 /// Set by the worker before requests are served.
-void setUserDefault(std::string_view name, Value value);
+ADMINHOST_EXPORT void setUserDefault(std::string_view name, Value value);
 
 /// A fresh random UUID (RFC 4122, version 4) in its canonical text of 36 characters, upper case.
-[[nodiscard]] std::string makeUUIDString();
+[[nodiscard]] ADMINHOST_EXPORT std::string makeUUIDString();
 
 }  // namespace adminhost

@@ -6,6 +6,7 @@
 // the front at once, so that reports survive a worker that is killed halfway. History, audit and command line read
 // reports and never parse log lines. All calls come from the thread that runs the operation.
 
+#include "platform/framework/Export.h"
 #include "platform/value/Value.h"
 
 #include <string>
@@ -14,7 +15,7 @@
 namespace adminhost {
 
 /// One thing that was changed, reported once it is on disk. No text may hold a secret.
-struct Change {
+struct ADMINHOST_EXPORT Change {
     std::string section;   ///< "settings", or the list in the configuration: "cameras"
     std::string identity;  ///< a UUID or an id, which renaming does not change; empty for settings
     std::string name;      ///< for people: "Studio 1"; empty for settings
@@ -28,7 +29,7 @@ struct Change {
 };
 
 /// A part of an accepted request that was not carried out, or was ignored. No text may hold a secret.
-struct NotDone {
+struct ADMINHOST_EXPORT NotDone {
     std::string keyPath;      ///< "configuration.cameras.0.users.1"
     std::string reason;       ///< one sentence for people
     std::string toolMessage;  ///< the tool's or the library's own text; may be empty
@@ -36,7 +37,7 @@ struct NotDone {
     bool operator==(const NotDone&) const = default;
 };
 
-class ReportSink {
+class ADMINHOST_EXPORT ReportSink {
   public:
     virtual void changed(Change change) = 0;
     virtual void notDone(NotDone part) = 0;
@@ -46,8 +47,8 @@ class ReportSink {
 };
 
 /// Sets where reports go from now on. With null, the initial state, they are dropped. The sink must outlive its use.
-void setReportSink(ReportSink* sink) noexcept;
-void reportChange(Change change);
-void reportNotDone(NotDone part);
+ADMINHOST_EXPORT void setReportSink(ReportSink* sink) noexcept;
+ADMINHOST_EXPORT void reportChange(Change change);
+ADMINHOST_EXPORT void reportNotDone(NotDone part);
 
 }  // namespace adminhost

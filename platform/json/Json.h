@@ -8,6 +8,7 @@
 // there. Integers stay integers over the whole signed and unsigned 64-bit range; a number with a fraction or an
 // exponent is a real.
 
+#include "platform/framework/Export.h"
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
 
@@ -27,11 +28,11 @@ constexpr std::int64_t jsonTooManyValues = 2;  ///< code of the error for more v
 /// columns count characters). Rejected besides broken syntax: invalid UTF-8, a key that occurs twice, nesting beyond
 /// the maximum, an integer outside the 64-bit range, null in a list, a key with a single "$" that is not one of the
 /// forms above.
-[[nodiscard]] std::optional<Value> parseJson(std::string_view text, Error* error = nullptr,
-                                             std::size_t valuesMaximum = SIZE_MAX);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Value> parseJson(std::string_view text, Error* error = nullptr,
+                                                              std::size_t valuesMaximum = SIZE_MAX);
 
 /// The JSON text of a value; no line feed at its end. Pretty: one entry a line, two blanks of indentation a level.
 /// Bytes of a string that are not UTF-8 are written as U+FFFD.
-[[nodiscard]] std::string jsonOf(const Value& value, bool pretty = false);
+[[nodiscard]] ADMINHOST_EXPORT std::string jsonOf(const Value& value, bool pretty = false);
 
 }  // namespace adminhost

@@ -6,13 +6,15 @@
 // like a separate event. No sink ever blocks: text that cannot be written at once waits in a queue of 1 MiB. Events
 // beyond it are lost, and their number is logged as soon as the log can be written again.
 
+#include "platform/framework/Export.h"
+
 #include <string>
 #include <string_view>
 
 namespace adminhost {
 
 /// Where events go. Called on the thread that logs; must not throw and must not block.
-class LogSink {
+class ADMINHOST_EXPORT LogSink {
   public:
     virtual ~LogSink() = default;
     virtual void write(std::string_view event) noexcept = 0;
@@ -23,20 +25,20 @@ class LogSink {
 /// The text of an event as it is logged. A text without control characters is returned as it is. The lines after the
 /// first are indented by four blanks, line feeds at the end are left out. Other control characters (C0 with the tab,
 /// DEL, C1) and bytes that are not UTF-8 are escaped: "\t", "\r", "\x1b", "\u0085".
-[[nodiscard]] std::string logTextOf(std::string_view event);
+[[nodiscard]] ADMINHOST_EXPORT std::string logTextOf(std::string_view event);
 
 /// The syslog socket /dev/log, which is the journal's where it runs: facility daemon, priority notice, one message for
 /// each event. A text beyond what the socket accepts is cut, with the number of omitted bytes.
-[[nodiscard]] LogSink& syslogSink() noexcept;
+[[nodiscard]] ADMINHOST_EXPORT LogSink& syslogSink() noexcept;
 /// Standard error, with a line feed after each event.
-[[nodiscard]] LogSink& standardErrorSink() noexcept;
+[[nodiscard]] ADMINHOST_EXPORT LogSink& standardErrorSink() noexcept;
 
 /// Sets the process's sink; the caller keeps ownership and keeps it alive. The first sink is standardErrorSink().
-void setLogSink(LogSink& sink) noexcept;
+ADMINHOST_EXPORT void setLogSink(LogSink& sink) noexcept;
 /// Logs one event.
-void logEvent(std::string_view event) noexcept;
+ADMINHOST_EXPORT void logEvent(std::string_view event) noexcept;
 /// Tries to write what the process's sink has queued; returns true when nothing is left. To be called from time to time
 /// while it returns false: without it, queued events wait for the next one.
-bool flushLog() noexcept;
+ADMINHOST_EXPORT bool flushLog() noexcept;
 
 }  // namespace adminhost

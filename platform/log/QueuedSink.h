@@ -2,6 +2,7 @@
 
 // A log sink that queues events while its output does not accept them.
 
+#include "platform/framework/Export.h"
 #include "platform/log/Log.h"
 
 #include <cstddef>
@@ -14,7 +15,7 @@
 namespace adminhost {
 
 /// A sink that writes through a function and queues what the function does not write. See Log.h for the contract.
-class QueuedSink final : public LogSink {
+class ADMINHOST_EXPORT QueuedSink final : public LogSink {
   public:
     static constexpr std::size_t maximum = std::size_t{1} << 20U;  ///< bytes in the queue
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/framework/Export.h"
 #include "platform/log/QueuedSink.h"
 
 #include <string_view>
@@ -8,6 +9,6 @@ namespace adminhost {
 
 /// Writes to standard error without blocking, whatever it is: a file, a terminal, a pipe that nobody reads, or a
 /// socket. Its flags are left alone, because other processes share them.
-[[nodiscard]] QueuedSink::Written writeToStandardError(std::string_view text);
+[[nodiscard]] ADMINHOST_EXPORT QueuedSink::Written writeToStandardError(std::string_view text);
 
 }  // namespace adminhost

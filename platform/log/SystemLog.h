@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/framework/Export.h"
 #include "platform/log/QueuedSink.h"
 
 #include <string>
@@ -9,7 +10,7 @@
 namespace adminhost {
 
 /// The client's side of a syslog socket. The C library's syslog() waits for a reader that is stuck; this does not.
-class SystemLog {
+class ADMINHOST_EXPORT SystemLog {
   public:
     /// Connects when the first text is written, and again after the reader was restarted.
     explicit SystemLog(std::string path) : _path(std::move(path)) {}

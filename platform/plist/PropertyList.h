@@ -9,6 +9,7 @@
 // is read, never written, and the fraction of a second of its dates is dropped.
 
 #include "platform/files/Path.h"
+#include "platform/framework/Export.h"
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
 
@@ -31,21 +32,21 @@ constexpr std::int64_t plistTooManyValues = 2;  ///< code of the error for more 
 /// subset, integers outside -2^63 ... 2^64-1, dates that the calendar does not have, more than the maximum size or
 /// depth. In the binary form also: objects inside themselves, object identifiers, null, and more content than the
 /// maximum size, however often an object is referred to.
-[[nodiscard]] std::optional<Value> parsePropertyList(std::string_view bytes, Error* error = nullptr,
-                                                     std::size_t valuesMaximum = SIZE_MAX);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Value> parsePropertyList(std::string_view bytes, Error* error = nullptr,
+                                                                      std::size_t valuesMaximum = SIZE_MAX);
 
 /// The XML form. Returns nullopt, with the error, when a value cannot be written: null, a string or key with a NUL or
 /// another character that XML 1.0 does not allow, invalid UTF-8, a date outside the years 0000 to 9999, too deep, or
 /// more than the maximum size. The error names the value by its key path.
-[[nodiscard]] std::optional<std::string> xmlPropertyList(const Value& value, Error* error = nullptr);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<std::string> xmlPropertyList(const Value& value, Error* error = nullptr);
 
 /// Reads and parses a whole file (64 MiB at most, regular files or links to one only). Returns nullopt if it cannot be
 /// read or parsed; the error is readFile()'s or parsePropertyList()'s, with the path in front.
-[[nodiscard]] std::optional<Value> readPropertyList(const DiskPath& path, Error* error = nullptr);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Value> readPropertyList(const DiskPath& path, Error* error = nullptr);
 
 /// Replaces the file by the XML form of the value, atomically and durably: see replaceFile() in
 /// platform/files/ReplaceFile.h for what is kept of the old file and what happens on failure. A value that cannot be
 /// serialised changes nothing.
-[[nodiscard]] std::optional<Error> writePropertyList(const Value& value, const HostPath& path);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Error> writePropertyList(const Value& value, const HostPath& path);
 
 }  // namespace adminhost

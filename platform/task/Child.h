@@ -5,6 +5,7 @@
 // waited for, so that no way out of a launch leaves a zombie or a stray.
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/framework/Export.h"
 
 #include <atomic>
 #include <cstdint>
@@ -15,7 +16,7 @@
 
 namespace adminhost {
 
-class Child {
+class ADMINHOST_EXPORT Child {
   public:
     Child() = default;
     Child(const Child&) = delete;

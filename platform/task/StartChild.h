@@ -8,6 +8,7 @@
 // is not close-on-exec.
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/framework/Export.h"
 #include "platform/value/Result.h"
 
 #include <atomic>
@@ -20,13 +21,13 @@
 namespace adminhost {
 
 /// The account that a child runs as.
-struct ChildRights {
+struct ADMINHOST_EXPORT ChildRights {
     uid_t user;
     gid_t group;
     std::vector<gid_t> groups;  ///< its supplementary groups, all of them
 };
 
-struct ChildPlan {
+struct ADMINHOST_EXPORT ChildPlan {
     std::string program;                   ///< absolute path
     std::vector<std::string> arguments;    ///< the whole argument vector, the name of the program first
     std::vector<std::string> environment;  ///< "NAME=value"
@@ -42,16 +43,16 @@ struct ChildPlan {
     std::optional<ChildRights> rights;  ///< without them, the child keeps ours
 };
 
-struct StartedChild {
+struct ADMINHOST_EXPORT StartedChild {
     pid_t pid = 0;        ///< also the id of its process group
     FileDescriptor exit;  ///< a pidfd: readable when the child has exited
 };
 
 /// Returns once the program is being executed. Fails (domain "posix", the system's number and text) when it cannot be
 /// executed, or when a text holds a NUL byte or the path is not absolute (EINVAL); no child is left then.
-[[nodiscard]] Result<StartedChild> startChild(const ChildPlan& plan);
+[[nodiscard]] ADMINHOST_EXPORT Result<StartedChild> startChild(const ChildPlan& plan);
 
 /// This process's environment, for a plan.
-[[nodiscard]] std::vector<std::string> processEnvironment();
+[[nodiscard]] ADMINHOST_EXPORT std::vector<std::string> processEnvironment();
 
 }  // namespace adminhost

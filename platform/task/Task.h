@@ -21,6 +21,7 @@
 // replaced, not appended to. After a failure both are empty, except for the error's text.
 
 #include "platform/files/Path.h"
+#include "platform/framework/Export.h"
 
 #include <chrono>
 #include <cstdint>
@@ -32,28 +33,29 @@
 
 namespace adminhost {
 
-[[nodiscard]] std::int32_t launch_task(const DiskPath& tool, const std::vector<std::string>& arguments,
-                                       std::string* output, std::string* error);
+[[nodiscard]] ADMINHOST_EXPORT std::int32_t launch_task(const DiskPath& tool, const std::vector<std::string>& arguments,
+                                                        std::string* output, std::string* error);
 
-[[nodiscard]] std::int32_t launch_task_with_input(const DiskPath& tool, const std::vector<std::string>& arguments,
-                                                  const std::optional<std::string>& input, std::string* output,
-                                                  std::string* error);
+[[nodiscard]] ADMINHOST_EXPORT std::int32_t launch_task_with_input(const DiskPath& tool,
+                                                                   const std::vector<std::string>& arguments,
+                                                                   const std::optional<std::string>& input,
+                                                                   std::string* output, std::string* error);
 
-[[nodiscard]] std::int32_t launch_task_with_input_and_environment(
+[[nodiscard]] ADMINHOST_EXPORT std::int32_t launch_task_with_input_and_environment(
     const DiskPath& tool, const std::vector<std::string>& arguments, const std::optional<std::string>& input,
     std::string* output, std::string* error, const std::map<std::string, std::string>& environment);
 
 /// Prepares the process for launching tools: umask 022, current directory "/", and SIGCHLD, which the process may have
 /// inherited as ignored (exit statuses would be lost), at its default. Called once at the start of a process that
 /// launches tools.
-void prepareForTasks() noexcept;
+ADMINHOST_EXPORT void prepareForTasks() noexcept;
 
 /// The moment at which a running tool of this process is killed with its process group (status 128 + 9, and no further
 /// tool is started: -1); nullopt means no bound. It applies to tools started after the call. The worker sets it for
 /// each request.
-void setTaskDeadline(std::optional<std::chrono::steady_clock::time_point> deadline) noexcept;
+ADMINHOST_EXPORT void setTaskDeadline(std::optional<std::chrono::steady_clock::time_point> deadline) noexcept;
 
 /// Variables added to every tool's environment from now on. Set once, before requests are served.
-void setTaskEnvironment(std::map<std::string, std::string> environment);
+ADMINHOST_EXPORT void setTaskEnvironment(std::map<std::string, std::string> environment);
 
 }  // namespace adminhost

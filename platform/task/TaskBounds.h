@@ -3,6 +3,8 @@
 // What applies to every tool that this process runs. The functions of Task.h set it, except the bound, which only tests
 // change: they need no 256 MiB.
 
+#include "platform/framework/Export.h"
+
 #include <chrono>
 #include <cstddef>
 #include <map>
@@ -15,10 +17,10 @@ using TaskEnvironment = std::map<std::string, std::string>;
 constexpr std::size_t taskDefaultOutputBound = std::size_t{256} << 20U;  ///< bytes
 
 /// Sets the bound for task groups made from now on, in bytes.
-void setTaskOutputBound(std::size_t bytes) noexcept;
+ADMINHOST_EXPORT void setTaskOutputBound(std::size_t bytes) noexcept;
 
-[[nodiscard]] std::size_t taskOutputBound() noexcept;
-[[nodiscard]] std::chrono::steady_clock::time_point taskDeadline() noexcept;  ///< the maximum for none
-[[nodiscard]] const TaskEnvironment& taskEnvironment() noexcept;
+[[nodiscard]] ADMINHOST_EXPORT std::size_t taskOutputBound() noexcept;
+[[nodiscard]] ADMINHOST_EXPORT std::chrono::steady_clock::time_point taskDeadline() noexcept;  ///< the maximum for none
+[[nodiscard]] ADMINHOST_EXPORT const TaskEnvironment& taskEnvironment() noexcept;
 
 }  // namespace adminhost

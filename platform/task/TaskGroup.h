@@ -8,6 +8,7 @@
 // group and fails; its bytes are dropped, and the others go on.
 
 #include "platform/files/Path.h"
+#include "platform/framework/Export.h"
 
 #include <chrono>
 #include <cstddef>
@@ -22,7 +23,7 @@
 
 namespace adminhost {
 
-struct TaskPlan {
+struct ADMINHOST_EXPORT TaskPlan {
     DiskPath tool;
     std::vector<std::string> arguments;  ///< without the tool itself
     std::optional<std::string> input = std::nullopt;
@@ -31,13 +32,13 @@ struct TaskPlan {
     bool keepsError = true;
 };
 
-struct TaskResult {
+struct ADMINHOST_EXPORT TaskResult {
     std::int32_t status = -1;  ///< as launch_task returns it
     std::string output;
     std::string error;
 };
 
-class TaskGroup {
+class ADMINHOST_EXPORT TaskGroup {
   public:
     using Clock = std::chrono::steady_clock;
     using Id = std::size_t;

@@ -7,6 +7,7 @@
 // is seen, before the tool is reaped: so an id in the register never belongs to another process while its owner lives.
 
 #include "platform/files/FileDescriptor.h"
+#include "platform/framework/Export.h"
 #include "platform/value/Result.h"
 
 #include <array>
@@ -18,7 +19,7 @@
 
 namespace adminhost {
 
-class ToolRegister {
+class ADMINHOST_EXPORT ToolRegister {
   public:
     static constexpr std::size_t capacity = 64;  ///< tools at the same time
 
@@ -53,7 +54,7 @@ class ToolRegister {
 };
 
 /// Tools that this process starts from now on are entered there; null for none. It must outlive them.
-void setToolRegister(ToolRegister* toolRegister) noexcept;
-[[nodiscard]] ToolRegister* toolRegister() noexcept;
+ADMINHOST_EXPORT void setToolRegister(ToolRegister* toolRegister) noexcept;
+[[nodiscard]] ADMINHOST_EXPORT ToolRegister* toolRegister() noexcept;
 
 }  // namespace adminhost

@@ -3,6 +3,8 @@
 // Base64 (RFC 4648, section 4) in one line: the form of data in property lists and JSON. The service's own form, with
 // its lines and lenient reading, is in codec/.
 
+#include "platform/framework/Export.h"
+
 #include <cstdint>
 #include <optional>
 #include <span>
@@ -13,9 +15,9 @@
 namespace adminhost {
 
 /// With padding, without line feeds.
-[[nodiscard]] std::string base64TextOf(std::span<const std::uint8_t> bytes);
+[[nodiscard]] ADMINHOST_EXPORT std::string base64TextOf(std::span<const std::uint8_t> bytes);
 
 /// The bytes whose base64TextOf() is exactly this text; nullopt for any other text.
-[[nodiscard]] std::optional<std::vector<std::uint8_t>> bytesOfBase64Text(std::string_view text);
+[[nodiscard]] ADMINHOST_EXPORT std::optional<std::vector<std::uint8_t>> bytesOfBase64Text(std::string_view text);
 
 }  // namespace adminhost

@@ -2,12 +2,14 @@
 
 // Where in a text something is, as messages name it.
 
+#include "platform/framework/Export.h"
+
 #include <string>
 #include <string_view>
 
 namespace adminhost {
 
 /// "line L, column C" of the character that follows the text, both from 1; columns count characters.
-[[nodiscard]] std::string lineAndColumnAfter(std::string_view text);
+[[nodiscard]] ADMINHOST_EXPORT std::string lineAndColumnAfter(std::string_view text);
 
 }  // namespace adminhost

@@ -2,6 +2,8 @@
 
 // UUIDs and their canonical texts.
 
+#include "platform/framework/Export.h"
+
 #include <array>
 #include <cstdint>
 #include <optional>
@@ -14,12 +16,12 @@ namespace adminhost {
 using Uuid = std::array<std::uint8_t, 16>;
 
 /// Reads the canonical text of 36 characters, digits in either case. Returns nullopt for any other text.
-[[nodiscard]] std::optional<Uuid> uuidOf(std::string_view text) noexcept;
+[[nodiscard]] ADMINHOST_EXPORT std::optional<Uuid> uuidOf(std::string_view text) noexcept;
 
 /// The canonical text, upper case.
-[[nodiscard]] std::string textOf(const Uuid& uuid);
+[[nodiscard]] ADMINHOST_EXPORT std::string textOf(const Uuid& uuid);
 
 /// A fresh random one (RFC 4122, version 4). Throws std::runtime_error if the system has no random bytes.
-[[nodiscard]] Uuid randomUuid();
+[[nodiscard]] ADMINHOST_EXPORT Uuid randomUuid();
 
 }  // namespace adminhost

@@ -6,6 +6,8 @@
 // null. Equality is equality of type and content: the integer 1, the real 1.0 and true are three different values. A
 // non-negative integer is one value whichever of the two integer types it was made from.
 
+#include "platform/framework/Export.h"
+
 #include <chrono>
 #include <concepts>
 #include <cstdint>
@@ -30,7 +32,7 @@ using Array = std::vector<Value>;
 /// String-keyed values in insertion order. Each key is there at most once, and never with a null value: storing null
 /// removes the key. Look-up takes constant time however many keys there are; removal is linear.
 /// Iterators and pointers to values are invalidated by every change.
-class Dictionary {
+class ADMINHOST_EXPORT Dictionary {
   public:
     using const_iterator = std::vector<DictionaryEntry>::const_iterator;
 
@@ -68,7 +70,7 @@ class Dictionary {
     [[nodiscard]] const_iterator end() const noexcept;
 
     /// Same keys with equal values, in any order.
-    friend bool operator==(const Dictionary& a, const Dictionary& b);
+    ADMINHOST_EXPORT friend bool operator==(const Dictionary& a, const Dictionary& b);
 
   private:
     [[nodiscard]] std::size_t indexOf(std::string_view key) const noexcept;
@@ -81,7 +83,7 @@ class Dictionary {
     std::unique_ptr<Index> _index;
 };
 
-class Value {
+class ADMINHOST_EXPORT Value {
   public:
     enum class Type { null, boolean, integer, real, string, date, data, array, dictionary };
 
@@ -133,14 +135,14 @@ class Value {
     [[nodiscard]] const Dictionary* dictionary() const noexcept { return std::get_if<Dictionary>(&_value); }
     [[nodiscard]] Dictionary* dictionary() noexcept { return std::get_if<Dictionary>(&_value); }
 
-    friend bool operator==(const Value& a, const Value& b);
+    ADMINHOST_EXPORT friend bool operator==(const Value& a, const Value& b);
 
   private:
     std::variant<std::monostate, bool, std::int64_t, std::uint64_t, double, std::string, Date, Data, Array, Dictionary>
         _value;
 };
 
-struct DictionaryEntry {
+struct ADMINHOST_EXPORT DictionaryEntry {
     std::string key;
     Value value;
 
@@ -149,12 +151,12 @@ struct DictionaryEntry {
 
 /// One entry of a list that initialises a dictionary. The elements of a std::initializer_list are constant, and only a
 /// mutable member can be moved out of them. A list is therefore good for one dictionary: write it in place.
-struct GivenEntry {
+struct ADMINHOST_EXPORT GivenEntry {
     std::string_view key;
     mutable Value value;
 };
 
 /// The name of a type as messages to people use it: "text", "dictionary", "whole number", ...
-[[nodiscard]] std::string_view nameOf(Value::Type type) noexcept;
+[[nodiscard]] ADMINHOST_EXPORT std::string_view nameOf(Value::Type type) noexcept;
 
 }  // namespace adminhost

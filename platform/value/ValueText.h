@@ -2,6 +2,7 @@
 
 // The texts of values, and the booleans that values and texts mean.
 
+#include "platform/framework/Export.h"
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
 
@@ -16,18 +17,18 @@ namespace adminhost {
 /// and "nan" if digits cannot show it). A string is itself, a date "2026-01-31 08:00:00 +0000" (UTC), data its bytes in
 /// hexadecimal between angle brackets. Arrays and dictionaries are written on indented lines between parentheses and
 /// braces.
-[[nodiscard]] std::string textOf(const Value& value);
+[[nodiscard]] ADMINHOST_EXPORT std::string textOf(const Value& value);
 /// A missing text is "(null)".
-[[nodiscard]] std::string textOf(const std::optional<std::string>& text);
+[[nodiscard]] ADMINHOST_EXPORT std::string textOf(const std::optional<std::string>& text);
 /// "DOMAIN (CODE): DESCRIPTION", or "DOMAIN (CODE)" for an error without description; a missing error is "(null)".
-[[nodiscard]] std::string textOf(const Error& error);
-[[nodiscard]] std::string textOf(const std::optional<Error>& error);
+[[nodiscard]] ADMINHOST_EXPORT std::string textOf(const Error& error);
+[[nodiscard]] ADMINHOST_EXPORT std::string textOf(const std::optional<Error>& error);
 
 /// The boolean meaning of a stored or requested value: a boolean as it is, a number if it is not zero, a string if its
 /// first character other than a blank (space, tab) is one of Y y T t or 1 to 9. Anything else is false.
-[[nodiscard]] bool booleanOf(const Value& value) noexcept;
+[[nodiscard]] ADMINHOST_EXPORT bool booleanOf(const Value& value) noexcept;
 /// The boolean meaning of a change entry's flags: as booleanOf, but a string's leading zeros are skipped too ("01" is
 /// true).
-[[nodiscard]] bool flagOf(const Value& value) noexcept;
+[[nodiscard]] ADMINHOST_EXPORT bool flagOf(const Value& value) noexcept;
 
 }  // namespace adminhost
