@@ -29,7 +29,7 @@ using adminhost::ctl::LostConnection;
 using testing::HasSubstr;
 using testing::Not;
 
-/// Answers each request that a function has an answer for; closes the connection without one where it has none.
+/// Sends the answer that a function returns for each request, and closes the connection if it returns none.
 class PlayedServer {
   public:
     explicit PlayedServer(std::function<std::string(const std::string&)> answer) : _answer(std::move(answer)) {
@@ -53,7 +53,7 @@ class PlayedServer {
     PlayedServer& operator=(const PlayedServer&) = delete;
 
     [[nodiscard]] std::string path() const { return _directory + "/socket"; }
-    /// The requests so far; only after the client has its answer, or its failure.
+    /// The requests so far. To be called only after the client has its answer or its failure.
     [[nodiscard]] std::vector<std::string> requests() const { return _requests; }
 
   private:

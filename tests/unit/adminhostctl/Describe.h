@@ -1,6 +1,6 @@
 #pragma once
 
-// The plug-in's own descriptions of its commands, as the command line meets them.
+// The plug-in's own descriptions of its commands, in the form that the command line gets.
 
 #include "adminhostctl/Description.h"
 #include "commands/CommandTable.h"

@@ -22,7 +22,7 @@ using adminhost::ctl::Failure;
 using adminhost::ctl::Sources;
 using testing::HasSubstr;
 
-/// Files that a test gives, and a person who types.
+/// Files with the contents that a test gives, and a person who types.
 struct Given {
     std::map<std::string, std::string> files;
     std::string typed;
@@ -282,7 +282,7 @@ TEST(ValueOfText, DataComesFromAFile) {
               (Dictionary{{"blob", Data{0, 0xFF, '\n'}}}));
 }
 
-/// What a verb takes its word for: the value of a key.
+/// The value of a verb's word.
 Value word(const DescribedKey& key, const std::optional<std::string>& text, const Given& given = {}) {
     return adminhost::ctl::valueOfWord(key, text, given.sources());
 }

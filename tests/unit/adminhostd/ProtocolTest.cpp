@@ -7,7 +7,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
-// No member of a sample has its default value, so that one that is not carried is noticed.
+// No member of a sample has its default value, so that a member that is not transmitted is noticed.
 
 Perform perform() {
     return {.request = "1-2",
@@ -102,7 +102,7 @@ TEST(Protocol, MessageForTheOtherSideIsAnError) {
     }
 }
 
-/// Calls the function with the payload of every message, and of each whatever is wrong with the payload.
+/// Calls the function with the payload of every message, and with faulty forms of each payload.
 template <class Decode>
 void spoilEveryMember(const auto& messages, Decode decode) {
     for (const auto& message : messages) {
@@ -174,7 +174,7 @@ TEST(Protocol, RefusalWithoutFindingsIsAnError) {
     EXPECT_FALSE(toFront(frameOf(refused)));
 }
 
-/// Changes each bit; what is still accepted must be a message like any other: it encodes, and to the same again.
+/// Changes each bit. A message that is still accepted must be valid: encoding and decoding returns the same message.
 template <class Decode>
 void changeEveryBit(const auto& messages, Decode decode) {
     for (const auto& message : messages) {

@@ -23,7 +23,7 @@ constexpr const char* directory = "/var/lib/adminhostd/history/lumio";
 
 class HistoryTest : public testing::Test {
   protected:
-    /// A write from one state of the settings to another. The entry's number.
+    /// Performs a write from one state of the settings to another. Returns the entry's number.
     std::uint64_t write(const Dictionary& before, const std::optional<Dictionary>& after, const char* who = "anna") {
         const auto number = history.keep(files, before, Dictionary{{"who", who}});
         EXPECT_TRUE(number) << *number.error().description;

@@ -70,7 +70,7 @@ TEST_P(AesKnownVectors, ComeOutAndComeBack) {
             "30c81c46a35ce411e5fbc1191a0a52eff69f2445df4f9b17ad2b417be66c3710");
     const auto cipher = cryptedData(adminhost::kCCEncrypt, text, hex(GetParam().key), vector);
     ASSERT_TRUE(cipher);
-    ASSERT_EQ(cipher->size(), 80U);  // the padding is a block of its own
+    ASSERT_EQ(cipher->size(), 80U);  // the padding is a separate block
     EXPECT_EQ(Data(cipher->begin(), cipher->begin() + 64), hex(GetParam().cipher));
     EXPECT_EQ(cryptedData(adminhost::kCCDecrypt, *cipher, hex(GetParam().key), vector), text);
 }
@@ -179,9 +179,9 @@ TEST(AesTransform, BadPaddingDoesNotDecrypt) {
     }
 }
 
-/// One block whose plain text is these sixteen bytes: no padding of its own.
+/// Returns one block whose plain text is these sixteen bytes, without padding.
 Data cipherOfLastBlock(const Data& block) {
-    // Encrypting pads by a block of its own; without it the text's last block is what the padding is read from.
+    // Encrypting adds a block of padding. Without that block the padding is read from the text's last block.
     Data cipher = *aes128cbcEncryptDataWithKey(block, key);
     cipher.resize(16);
     return cipher;
@@ -189,7 +189,7 @@ Data cipherOfLastBlock(const Data& block) {
 
 TEST(AesTransform, EveryLastBlockIsDecryptedExactlyWhenItsPaddingIsValid) {
     for (unsigned last = 0; last < 256; ++last) {
-        // A whole padding of that length: only 1 to 16 are one.
+        // A whole padding of that length: only 1 to 16 are valid.
         Data block(16, 0xAB);
         std::fill(block.end() - static_cast<std::ptrdiff_t>(std::min(last, 16U)), block.end(), last);
         block.back() = static_cast<std::uint8_t>(last);

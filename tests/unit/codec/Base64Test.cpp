@@ -36,7 +36,7 @@ Data randomBytes(std::size_t length, unsigned seed = 1) {
     return data;
 }
 
-/// The encoder's rules one byte at a time, to compare the real one with.
+/// The encoder's rules one byte at a time, as a reference for the real one.
 std::string encodedByTheRules(const Data& data, bool lineBreaks, bool standard, char pad) {
     std::string alphabet(base64Alphabet);
     if (!standard) {

@@ -405,7 +405,7 @@ TEST(CheckAccess, MoreNamesThanTheArgumentsOfOneToolCanCarryAreRefused) {
     EXPECT_THAT(checkCamera({{"_id_", "a"}, {"allowedUsersAndGroups", many}}), IsEmpty());
 }
 
-// What other commands put into arguments
+// Values that other commands pass to tools
 
 TEST(CheckArguments, AControllerMustFitTheGridToolsArgument) {
     EXPECT_THAT(lumio::checkRequest("validateSettings", {{"nimbo_controller", "-grid"}}),

@@ -1,4 +1,4 @@
-// The generator refuses descriptions that are not right, so that a slip is found while building.
+// The generator rejects faulty descriptions, so that a typo is found while building.
 
 #include "tests/support/Program.h"
 
@@ -37,7 +37,7 @@ class Generate : public testing::Test {
 
     void write(const char* file, const std::string& text) const { std::ofstream(_directory / file) << text; }
 
-    /// What the generator says, followed by its exit status.
+    /// The generator's output, followed by its exit status.
     std::string run(const std::string& what, const std::string& file) const {
         const auto result = adminhost::test::runProgram(
             {"/usr/bin/python3", "-B", (_directory / "generate.py").string(), what, (_directory / file).string()},
@@ -46,7 +46,7 @@ class Generate : public testing::Test {
     }
     std::string table() const { return run("table", "table.cpp"); }
 
-    /// What is said of the sound description with one text replaced by another.
+    /// The generator's output for the valid description with one text replaced by another.
     std::string with(const std::string& from, const std::string& to) const {
         std::string text = sound;
         text.replace(text.find(from), from.size(), to);

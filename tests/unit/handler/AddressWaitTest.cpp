@@ -13,7 +13,7 @@ using testing::Each;
 using testing::ElementsAre;
 using testing::SizeIs;
 
-/// Stands for a service; an address appears, or the resolution fails, after so many turns of the loop.
+/// A stand-in for a service. After so many turns of the loop an address appears, or the resolution fails.
 struct Resolver {
     void resolveWithTimeout(milliseconds timeout) { timeouts.push_back(timeout); }
     [[nodiscard]] const std::vector<int>& addresses() const { return found; }

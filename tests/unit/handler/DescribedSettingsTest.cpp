@@ -1,4 +1,4 @@
-// The settings' keys are named twice: in the code, by file, and in the descriptions that clients read.
+// The keys of settings are in two places: in the code, by file, and in the descriptions that clients read.
 
 #include "commands/CommandTable.h"
 #include "handler/LumioRequestHandler.h"

@@ -1,4 +1,4 @@
-// What the check refuses, and what each such request would do if it reached the operations, which put values into
+// Requests that the check refuses, and what each would do in the operations, which put values into
 // statements and arguments as they are.
 
 #include "commands/CommandTable.h"

@@ -1,4 +1,4 @@
-// What a write of the settings reports: each key that is changed on disk, and each that was not carried out.
+// The reports of a write of settings: each key that was changed on disk, and each that was not carried out.
 
 #include "commands/CommandTable.h"
 #include "tests/support/CapturedReports.h"
@@ -51,7 +51,7 @@ class SettingsReports : public WriteSettings {
         ADD_FAILURE() << key << " is not described";
         return {};
     }
-    /// A directory in the file's place: it can be neither loaded, kept aside nor replaced.
+    /// Puts a directory in place of the file: it can be neither loaded, kept aside nor replaced.
     void obstruct(std::string_view path) const {
         fs::remove_all(root.path(path));
         fs::create_directories(root.path(path));

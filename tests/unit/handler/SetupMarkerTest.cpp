@@ -42,7 +42,7 @@ TEST_F(SetupMarker, MarkerDirectoryBelongsToTheRootsGroupWheel) {
         EXPECT_EQ(status.st_gid, 4711U);
         EXPECT_THAT(log.lines, IsEmpty());
     } else {
-        // Only the superuser can give a directory away.
+        // Only the superuser can change the owner of a directory.
         EXPECT_THAT(log.lines, testing::ElementsAre(HasSubstr("error: posix (1): cannot set the owner")));
     }
 }

@@ -163,7 +163,7 @@ TEST_F(WriteSettingsFailures, SharedFilesystemThatIsNoDirectoryIsAFailedWriteTha
     EXPECT_THAT(*answer.get("errorDescription").string(), HasSubstr("/flat/Server/cluster_preferences.plist"));
 }
 
-/// The state that one failed read of the identity preferences in the middle of a write leaves a set operation in.
+/// The state of a set operation after one failed read of the identity preferences in the middle of a write.
 TEST_F(WriteSettingsFailures, UnreadableIdentityPreferencesStopAClusterOrMemberWriteBeforeItTouchesAFile) {
     for (const std::string_view file : {clusterFile, memberFile}) {
         root.write("/Library/SorvaneProducer/Shared" + std::string(file).substr(7), root.read(file));

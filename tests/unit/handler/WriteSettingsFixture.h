@@ -50,7 +50,8 @@ class WriteSettings : public testing::Test {
                                "<string>grid.example</string><key>kept</key><string>cluster</string>");
         root.writePropertyList("/shared/Server/Secrets/kek.plist",
                                "<key>lumio_secret</key><string>AAECAwQFBgcICQoLDA0ODw==</string>");
-        // Owners can be set only by the superuser; whoever runs the tests finds the directory made.
+        // Only the superuser can set owners, so the directory exists already, with the account of the tests as its
+        // owner.
         fs::create_directories(root.path("/var/lumio/server"));
     }
 
@@ -68,7 +69,7 @@ class WriteSettings : public testing::Test {
         const auto value = adminhost::readPropertyList(adminhost::DiskPath(root.path(path)));
         return value && value->dictionary() != nullptr ? *value->dictionary() : Dictionary{{"unreadable", true}};
     }
-    /// A file that was replaced is another one.
+    /// The inodes of the settings files: the inode of a file changes when it is replaced.
     [[nodiscard]] std::vector<ino_t> inodes() const {
         std::vector<ino_t> numbers;
         for (const std::string_view path : {identityFile, clusterFile, memberFile}) {

@@ -1,7 +1,7 @@
 #include "krb5/KRB5CredentialCache.h"
 #include "tests/unit/krb5/Realm.h"
 
-// Exported by the library for programs that need a clock that stands still, but declared in no public header.
+// Exported by the library for programs that need a fixed time, but not declared in a public header.
 extern "C" krb5_error_code krb5_set_debugging_time(krb5_context, krb5_timestamp, krb5_int32);
 
 namespace lumio {
@@ -20,7 +20,7 @@ class Acquiring : public RealmTest {
         EXPECT_EQ(krb5_cc_store_cred(_context->nativeContext(), cache->nativeCredentialCache(), &changed), 0);
         return cache;
     }
-    /// A cache whose ticket ends that many seconds from the context's now, which stands still.
+    /// A cache whose ticket ends that many seconds after the context's time, which is fixed.
     [[nodiscard]] std::unique_ptr<KRB5CredentialCache> aliceWithTicketEndingIn(std::int32_t seconds) const {
         auto cache = aliceWithTicket();
         const auto ticket = cache->initialCredential();
@@ -53,7 +53,7 @@ TEST_F(Acquiring, RemainingTimeIsComparedInSigned32Bits) {
     storeWithEnd(*cache, *ticket, INT32_MAX);
     ASSERT_EQ(krb5_set_debugging_time(_context->nativeContext(), INT32_MAX - 600, 0), 0);
     EXPECT_FALSE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(nullptr));
-    // The sum wraps to a negative number, which is not later.
+    // The sum overflows to a negative number, which is not later.
     ASSERT_EQ(krb5_set_debugging_time(_context->nativeContext(), INT32_MAX - 599, 0), 0);
     EXPECT_FALSE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(nullptr));
 }
@@ -75,7 +75,7 @@ TEST_F(Acquiring, NoFileAndNoPrincipalIsNotNecessary) {
     EXPECT_FALSE(std::filesystem::exists(path("none")));
     EXPECT_EQ(cache->initialCredential(), nullptr);
     EXPECT_EQ(cache->principal(), nullptr);
-    // Asked for a principal, a cache without a file simply has no ticket of it.
+    // For a named principal, a cache without a file has no ticket, which is not an error.
     EXPECT_TRUE(cache->initialCredentialAcquisitionIsNecessaryForPrincipal(principal("alice").get()));
     EXPECT_EQ(cache->errorCode(), 0);
 }

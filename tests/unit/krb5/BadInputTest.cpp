@@ -1,4 +1,4 @@
-// Kerberos when the world is broken: KDCs, clocks, disks and files.
+// Kerberos with broken KDCs, clocks, disks and files.
 
 #include "krb5/KRB5CredentialCache.h"
 #include "tests/support/KeytabFile.h"
@@ -22,7 +22,7 @@ int clockShift = 0;
 
 }  // namespace
 
-/// The clock that the Kerberos library reads, in front of the real one.
+/// The clock that the Kerberos library reads. It replaces the real one.
 extern "C" int gettimeofday(timeval* __restrict now, void* __restrict /*zone*/) noexcept {
     timespec real{};
     clock_gettime(CLOCK_REALTIME, &real);
@@ -34,7 +34,7 @@ extern "C" int gettimeofday(timeval* __restrict now, void* __restrict /*zone*/) 
 namespace lumio {
 namespace {
 
-/// For a while, this program's clock is that many seconds fast.
+/// While it exists, this program's clock is that many seconds fast.
 class ShiftedClock {
   public:
     explicit ShiftedClock(int seconds) { clockShift = seconds; }
@@ -43,7 +43,7 @@ class ShiftedClock {
     ~ShiftedClock() { clockShift = 0; }
 };
 
-/// A loopback port that is taken and refuses connections.
+/// A loopback port that is in use and refuses connections.
 class ClosedPort {
   public:
     ClosedPort() : _socket(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
@@ -65,7 +65,7 @@ class ClosedPort {
     int _port = 0;
 };
 
-/// No file of this process grows beyond the size: a full disk.
+/// While it exists, no file of this process can exceed the size, as on a full disk.
 class FullDisk {
   public:
     explicit FullDisk(rlim_t size) : _formerHandler(std::signal(SIGXFSZ, SIG_IGN)) {
@@ -85,7 +85,7 @@ class FullDisk {
     void (*_formerHandler)(int);
 };
 
-/// For a while, root has to obey the permissions of files like everybody else.
+/// While it exists, the permissions of files also apply to root.
 class ObeyedPermissions {
   public:
     ObeyedPermissions() {
@@ -105,10 +105,10 @@ class ObeyedPermissions {
 
 class BadInput : public RealmTest {
   protected:
-    /// Makes _context one whose realm has its KDC at that port.
+    /// Replaces _context by one whose realm has its KDC at that port.
     void useKdcAt(int port, const std::string& libdefaults = {}) {
         write(path("krb5.conf"), support::Kdc::clientConfiguration("NIMBO.TEST", port, libdefaults));
-        setenv("KRB5_CONFIG", path("krb5.conf").c_str(), 1);  // put back by the fixture
+        setenv("KRB5_CONFIG", path("krb5.conf").c_str(), 1);  // restored by the fixture
         _context = KRB5Context::context();
     }
     /// The realm's own configuration with further lines in [libdefaults].
@@ -122,7 +122,7 @@ class BadInput : public RealmTest {
     [[nodiscard]] std::unique_ptr<KRB5CredentialCache> unbound(const std::string& name) const {
         return KRB5CredentialCache::initWithName(path(name), KRB5CredentialCacheFileType, nullptr, _context);
     }
-    /// What opening the cache for alice, and acquiring into it, record. Opening must fail.
+    /// Returns the errors of opening the cache for alice and of acquiring into it. Opening must fail.
     [[nodiscard]] std::int64_t statusOfAcquiringInto(const std::string& name) const {
         const auto alice = principal("alice");
         EXPECT_EQ(KRB5CredentialCache::initWithName(path(name), KRB5CredentialCacheFileType, alice.get(), _context),
@@ -166,7 +166,7 @@ TEST_F(BadInput, ClockFarOffIsLearntFromTheKdcUnlessForbidden) {
 }
 
 TEST_F(BadInput, ClockFarBehindWithoutPreauthenticationGivesATicketThatHasEnded) {
-    // Nothing tells the client the time before it asks, so it asks for a ticket that ends in the past, and gets it.
+    // The client does not know the KDC's time, so it requests a ticket that ends in the past, and gets it.
     const ShiftedClock clock(-5 * 24 * 3600);
     useConfigurationWith("");
     const auto cache = cacheOf(*principal("alice"));

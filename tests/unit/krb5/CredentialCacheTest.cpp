@@ -11,7 +11,7 @@ bool resolvesToNothing = false;
 
 }  // namespace
 
-/// In front of the library's function of that name, to answer what the real one never does: success and no handle.
+/// Replaces the library's function of that name, to return what the real one never does: success without a handle.
 extern "C" krb5_error_code krb5_cc_resolve(krb5_context context, const char* name, krb5_ccache* cache) {
     if (resolvesToNothing) {
         *cache = nullptr;
@@ -108,7 +108,7 @@ TEST_F(CredentialCache, MissingFileIsReportedUnlessDestroyed) {
 }
 
 TEST_F(CredentialCache, DestroyedFileCacheWithAColonInItsPathIsNotReopened) {
-    // Without the type in front, the library takes what stands before the colon for one.
+    // Without a type, the library reads the text before the colon as the type.
     const auto alice = principal("alice");
     const auto cache = cacheOf(*alice, "with:colon");
     cache->destroy();

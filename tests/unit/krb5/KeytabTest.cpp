@@ -11,8 +11,8 @@
 namespace lumio {
 namespace {
 
-/// While it lives, lost memory is not reported: the library (1.20.1) loses what it had read of an entry that ends too
-/// early, and hands nothing out that could be freed. valgrind.supp says the same to valgrind.
+/// While it exists, leaks are not reported: the library (1.20.1) leaks the part of an entry that ends too early, and
+/// returns no pointer to free it. valgrind.supp suppresses the same leak.
 class LibraryLeaks {
   public:
 #if defined(ADMINHOST_SANITIZED)
@@ -195,7 +195,7 @@ TEST_F(Keytab, NameIsThePathAndDescriptionHasTheType) {
     EXPECT_EQ(table->type(), "FILE");
     EXPECT_EQ(table->description(), "FILE:" + path("with:colon"));
     EXPECT_EQ(table->errorCode(), 0);
-    // The library keeps no difference between the two types.
+    // The library does not distinguish the two types.
     EXPECT_EQ(KRB5Keytab::initWithName(path("kt"), KRB5KeytabWritableFileType, _context)->description(),
               "FILE:" + path("kt"));
 }

@@ -15,8 +15,8 @@ struct Wiped {
     std::size_t size;
 };
 
-/// What is recorded, from the library's call on; null outside the test that asks. The program goes on to wipe memory
-/// after its last test.
+/// The record, from the library's call on; null outside of the tests that use it, because the program still wipes
+/// memory after its last test.
 struct Recording {
     const char* password = nullptr;
     std::string passwordText;
@@ -52,7 +52,7 @@ krb5_error_code krb5_get_init_creds_password(krb5_context context, krb5_creds* c
     return real(context, creds, client, password, prompter, data, start_time, in_tkt_service, options);
 }
 
-// By their names in the object file, since the C library's header defines them inline when the compiler fortifies.
+// Named as in the object file, because the C library's header defines them inline in fortified builds.
 void wipePlain(void* start, std::size_t size) noexcept __asm__("explicit_bzero");
 void wipeChecked(void* start, std::size_t size, std::size_t room) noexcept __asm__("__explicit_bzero_chk");
 

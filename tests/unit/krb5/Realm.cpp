@@ -41,7 +41,7 @@ std::filesystem::path makeDirectory() {
 
 namespace {
 
-/// The layer keeps statuses and texts for its callers and logs nothing itself: watched over during every test.
+/// Checks during every test that the layer logs nothing itself: statuses and texts are for its callers.
 class SilenceWatch final : public testing::EmptyTestEventListener {
     void OnTestStart(const testing::TestInfo& /*test*/) override { _log.emplace(); }
     void OnTestEnd(const testing::TestInfo& /*test*/) override {
@@ -111,7 +111,7 @@ std::string contentsOf(const std::string& path) {
 }
 
 void write(const std::string& path, const std::string& bytes) {
-    // A new file: some file systems wait for the disk when an old one is rewritten.
+    // Create a new file: some file systems wait for the disk when an existing one is overwritten.
     std::filesystem::remove(path);
     std::ofstream file(path, std::ios::binary);
     file << bytes;

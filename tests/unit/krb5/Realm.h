@@ -21,7 +21,7 @@ inline constexpr const char* alicePassword = "alice secret";
 /// robot (keytab client.keytab), host/localhost and nimbo/admin (keytab krb5.keytab).
 support::Kdc& realm();
 
-/// Runs with the realm's KRB5 environment in an empty directory of its own, and puts both back.
+/// Runs each test with the realm's KRB5 environment in an empty directory of its own, and restores both.
 class RealmTest : public testing::Test {
   protected:
     RealmTest();
@@ -42,7 +42,7 @@ class RealmTest : public testing::Test {
     std::shared_ptr<KRB5Context> _context;
 };
 
-/// Runs a program with the present environment; its standard error goes into the output.
+/// Runs a program with the current environment; its standard error is part of the output.
 adminhost::test::ProgramResult runTool(const std::vector<std::string>& command, std::string_view input = {});
 /// How many descriptors this process has open.
 int openDescriptors();

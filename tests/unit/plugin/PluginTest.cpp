@@ -1,4 +1,4 @@
-// The plug-in as the worker sees it: its table of operations, through the entry point of the built file.
+// The plug-in as the worker uses it: its table of operations, through the entry point of the built file.
 
 #include "adminhostd/PluginFile.h"
 #include "platform/directory/LocalAccounts.h"

@@ -99,7 +99,7 @@ TEST_F(AccessLists, AccessListIsTheRowsOfTypeAndIdInOrderWithDuplicates) {
 }
 
 TEST_F(AccessLists, RowsOfTheAccessListWithoutAUuidAreSkipped) {
-    // The empty line within the text ends its record, and what follows is a record without the column.
+    // The empty line within the text ends its record, and the rest is a record without the column.
     root.sql(database, "insert into access_control_entries values('A' || char(10,10) || 'rest','Camera',7)");
     allow(7, "B");
     EXPECT_THAT(camera()->getUserAndGroupACLs(), ElementsAre("A", "B"));
@@ -179,7 +179,7 @@ TEST_F(AccessLists, FailingDirectoryIsToldOnStandardOutputAndTheListIsEmpty) {
     const auto hall = camera(1);
     const auto aula = camera();
     EXPECT_EQ(allowed(*aula), Array{});
-    // Asked twice: for who uses the camera, and for the list.
+    // Two queries: for the user of the camera, and for the list.
     EXPECT_EQ(testing::internal::GetCapturedStdout(),
               "Tarn query error for users: the directory is away\nTarn query error for users: the directory is away\n");
     EXPECT_THAT(log.lines, IsEmpty());

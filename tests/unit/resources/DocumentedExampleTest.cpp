@@ -6,7 +6,7 @@
 namespace lumio {
 namespace {
 
-/// The worked example of docs/protected-values.md, as it stands there.
+/// The example in docs/protected-values.md, exactly as it is there.
 class DocumentedExample : public PropertyFixture {
   protected:
     void SetUp() override {

@@ -1,6 +1,6 @@
 #pragma once
 
-// A directory with a fixed answer, in the place of the machine's accounts.
+// A directory with a fixed answer, in place of the machine's accounts.
 
 #include "platform/directory/Directory.h"
 
@@ -15,7 +15,7 @@ namespace lumio {
 using adminhost::DirectoryRecord;
 using adminhost::Error;
 
-/// A directory that answers what it is given, whatever it is asked.
+/// A directory that returns the given records for every query.
 class FixedNode final : public adminhost::DirectoryNode {
   public:
     explicit FixedNode(std::optional<std::vector<DirectoryRecord>> records) : _records(std::move(records)) {}
@@ -43,7 +43,7 @@ inline DirectoryRecord record(std::string_view type, std::string_view name, std:
     return made;
 }
 
-/// Makes these records all that the directory answers; without any it fails. Set the nodes anew afterwards.
+/// The directory returns these records for every query; without records, queries fail. Set the nodes again afterwards.
 inline void useDirectory(std::optional<std::vector<DirectoryRecord>> records) {
     adminhost::setDirectoryNodes(
         {{"/Fixed", [records = std::move(records)](Error*) { return std::make_unique<FixedNode>(records); }}});

@@ -1,4 +1,4 @@
-// What a camera's name holds never decides what a statement says.
+// The contents of a camera's name never change a statement.
 
 #include "platform/value/ValueText.h"
 #include "tests/support/RecordedStatements.h"
@@ -76,7 +76,7 @@ TEST_F(ForgedRows, RowWithTwoReadingsHasNoIdAndSaysSoOnce) {
 }
 
 TEST_F(ForgedRows, PiecesOfARowHaveNoId) {
-    // An empty line ends a record, so the rest of the row is one of its own.
+    // An empty line ends a record, so the rest of the row is a separate record.
     nameHall("x||                    id = 7");
     const std::vector<std::string> statements = queries();
     ASSERT_EQ(answer.size(), 3U);

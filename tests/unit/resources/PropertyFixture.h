@@ -47,7 +47,7 @@ class PropertyFixture : public testing::Test {
         }
         return value;
     }
-    /// The protected form without its line feeds, as the openssl tool makes it.
+    /// The protected form without its line feeds, created by the openssl tool.
     [[nodiscard]] std::string protectedByOpenssl(const std::string& plain) const {
         root.write("/plain", plain);
         return adminhost::test::runProgram({"openssl", "enc", "-aes-128-cbc", "-K", "6c756d696f2d73616d706c652d6b6579",

@@ -1,4 +1,4 @@
-// What keeps a failed change of a property from losing data or showing a secret.
+// A failed change of a property loses no data and shows no secret.
 
 #include "handler/LumioRequestHandler.h"
 #include "platform/value/ValueText.h"

@@ -1,4 +1,4 @@
-// Values are read back as they were stored, whatever lines they have.
+// Values with any lines are read back as they were stored.
 
 #include "platform/text/Utf8.h"
 #include "platform/value/ValueText.h"

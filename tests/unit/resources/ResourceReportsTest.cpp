@@ -1,4 +1,4 @@
-// What changes of cameras and properties report beside their answers.
+// The reports of changes of cameras and properties.
 
 #include "tests/support/CapturedReports.h"
 #include "tests/unit/resources/AccessListsFixture.h"

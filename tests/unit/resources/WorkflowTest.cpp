@@ -120,7 +120,7 @@ TEST_F(Workflows, ListingExpandsTheAccessListOnce) {
     writeInformation("A", "<key>Name</key><string>n</string>");
     root.sql(database, "insert into access_control_entries values('" + uuidOf("user:anna") + "','Workflow',1)");
     const Dictionary workflow = *listed().at(0).dictionary();
-    // A second expansion would take the boolean for a text other than "t".
+    // A second expansion would read the boolean as a text other than "t".
     EXPECT_EQ(workflow.get("access_control_enabled"), Value(true));
     ASSERT_NE(workflow.get("allowedUsersAndGroups").array(), nullptr);
     ASSERT_EQ(workflow.get("allowedUsersAndGroups").array()->size(), 1U);

@@ -30,7 +30,7 @@ class DatabaseToolTest : public testing::Test {
     DatabaseToolTest& operator=(const DatabaseToolTest&) = delete;
 
     [[nodiscard]] std::string home() const { return root.path("/home").string(); }
-    /// Replaces the tool by a script that notes each run.
+    /// Replaces the tool by a script that records each run.
     void replaceTool(const std::string& text) const {
         std::filesystem::remove(root.path("/usr/bin/sqlite3"));
         root.writeTool("/usr/bin/sqlite3", "#!/bin/sh\necho run >> '" + root.path("/runs").string() + "'\n" + text);

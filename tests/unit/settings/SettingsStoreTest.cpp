@@ -114,7 +114,7 @@ TEST_F(SettingsStoreTest, AnExistingFileThatCannotBeReadGivesNullAndNotTheCached
     useSharedFilesystem("/shared");
     root.writePropertyList("/var/lumio/server/cached_member_preferences.plist", "<key>a</key><true/>");
     std::filesystem::create_directories(root.path("/shared/Server"));
-    // A pipe stands for a file that cannot be read: permissions do not stop a superuser who runs the tests.
+    // A pipe cannot be read as a file. Missing permissions would not stop tests that are run by the superuser.
     ASSERT_EQ(::mkfifo(root.path("/shared/Server/member_preferences_M-1.plist").c_str(), 0600), 0);
     EXPECT_EQ(SettingsStore::memberPreferences(), std::nullopt);
 }

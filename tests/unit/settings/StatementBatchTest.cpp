@@ -29,7 +29,7 @@ struct Outcome {
     bool operator==(const Outcome&) const = default;
 };
 
-// The tool records its statement, sleeps as long as the statement's number says, and does what its word says.
+// The tool records its statement, sleeps for the statement's number, and does what the statement's word names.
 class StatementBatchTest : public testing::Test {
   protected:
     StatementBatchTest() {
@@ -161,7 +161,7 @@ TEST_F(StatementBatchTest, ALockedDatabaseIsTriedAgainAlone) {
     list[1] = "locked 1";
     const std::vector<Outcome> outcomes = inBatch(list, 3);
     EXPECT_EQ(outcomes[1].rows, (std::vector<Dictionary>{{{"id", "1"}, {"value", "locked"}}}));
-    // Nothing else ran beside the second try.
+    // No other tool was running during the second try.
     const std::vector<std::string> lines = calls();
     const auto first = std::find(lines.begin(), lines.end(), "locked 1");
     const auto second = std::find(first + 1, lines.end(), "locked 1");

@@ -1,6 +1,6 @@
 #pragma once
 
-// A system root in a directory of its own, with account files, set for the life of the object.
+// A system root in a directory of its own, with account files, which is set while the object exists.
 
 #include "platform/directory/Directory.h"
 #include "platform/directory/LocalAccounts.h"

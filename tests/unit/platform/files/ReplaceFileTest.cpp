@@ -99,7 +99,7 @@ TEST_F(ReplaceFile, ModeOfTheOldFileIsKept) {
 
 TEST_F(ReplaceFile, OwnerOfTheOldFileIsKept) {
     write("file", "old", 0640);
-    // Only the superuser may give files away; another user's file keeps the owner that it has.
+    // Only the superuser may change owners; a file of another user keeps its owner.
     const bool given = ::chown(path().c_str(), 33, 44) == 0;
     const struct stat before = statusOf();
     EXPECT_EQ(before.st_uid, given ? 33 : ::geteuid());

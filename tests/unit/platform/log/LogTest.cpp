@@ -93,7 +93,7 @@ TEST_F(Log, EventsGoToTheSinkThatIsSetOneByOne) {
     EXPECT_EQ(recorder.events(), (std::vector<std::string>{"one", "two\n"}));
 }
 
-/// Standard error as a pipe or socket of a test, until the object goes.
+/// While it exists, standard error is a pipe or socket of the test.
 class RedirectedError {
   public:
     explicit RedirectedError(int descriptor) : _before(::dup(STDERR_FILENO)) { ::dup2(descriptor, STDERR_FILENO); }
@@ -212,7 +212,7 @@ TEST_F(Log, EventsThatCannotBeWrittenAtAllAreCounted) {
     EXPECT_EQ(text, "adminhost: 5 events were lost: the log could not be written\nfirst\n");
 }
 
-/// A syslog socket of the test's own.
+/// A syslog socket for one test.
 class SystemLogSocket : public Log {
   protected:
     SystemLogSocket() { listen(); }

@@ -243,7 +243,7 @@ TEST(BinaryReader, ObjectsThatMultiplyThemselvesAreRefused) {
 }
 
 TEST(BinaryReader, NumberOfValuesIsBoundedByTheCallerHoweverOftenOneObjectStands) {
-    // A dictionary of one list of three texts: its key is none.
+    // A dictionary whose key is a list of three texts, which is not a valid key.
     const std::string bytes = binary({"\xD1\x01\x02"s, "\x51k"s, "\xA3\x01\x01\x01"s});
     EXPECT_TRUE(parsePropertyList(bytes, nullptr, 5));
     Error error;

@@ -1,6 +1,6 @@
 #pragma once
 
-// What the property-list tests share: a directory of their own and Python's plistlib as a second opinion.
+// Common code of the property-list tests: a directory of their own, and Python's plistlib as an independent reader.
 
 #include "platform/plist/PropertyList.h"
 #include "platform/task/Task.h"

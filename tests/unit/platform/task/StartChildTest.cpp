@@ -27,7 +27,7 @@ namespace {
 using namespace adminhost;
 namespace fs = std::filesystem;
 
-/// What the child wrote to its standard output, until it and everything that it started has closed it.
+/// Reads the child's standard output until the child and everything that it started have closed it.
 struct Ended {
     std::string output;
     int status = -1;
@@ -67,7 +67,7 @@ std::atomic<pid_t>* sharedPage() {
     return page == MAP_FAILED ? nullptr : new (page) std::atomic<pid_t>(0);
 }
 
-/// Whether every child of ours ends within ten seconds; one that does not is killed.
+/// Returns true if every child of this process ends within ten seconds; a child that does not is killed.
 bool adoptedChildrenEnd() {
     const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
     for (;;) {
@@ -126,7 +126,7 @@ TEST(StartChild, DescriptorsAreTheOnesOfThePlanAlsoWhenTheyAreTheirOwnTargets) {
     ASSERT_NE(::mkdtemp(directory.data()), nullptr);
     const FileDescriptor first(::open((directory + "/first").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
     const FileDescriptor second(::open((directory + "/second").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
-    // As many as it takes for each to be the number that the other goes to.
+    // Enough that each has a number to which another one is moved.
     const int count = std::max(first.get(), second.get()) + 1;
     ChildPlan plan = shell("for fd in /proc/$$/fd/*; do echo ${fd##*/} $(readlink $fd); done");
     plan.program = "/bin/bash";  // dash opens descriptor 10 for itself
@@ -272,7 +272,7 @@ TEST(StartChild, AChildWhoseParentIsKilledIsEitherRegisteredOrGone) {
 
 TEST(StartChild, RightsAreDroppedBeforeTheProgram) {
     ChildPlan plan = shell("grep -E '^(Uid|Gid|Groups):' /proc/self/status");
-    // A plain account can only keep its own.
+    // An unprivileged account can only keep its own groups.
     const bool root = ::geteuid() == 0;
     if (root) {
         plan.rights = ChildRights{65534, 65533, {7, 9}};

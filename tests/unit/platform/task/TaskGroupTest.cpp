@@ -183,7 +183,7 @@ TEST_F(TaskGroupOf, OneBoundHoldsForTheBytesOfAllTools) {
     EXPECT_EQ(over.status, -1);
     EXPECT_EQ(over.output, "");
     EXPECT_EQ(over.error, "/bin/sh: stopped: it and the tools beside it wrote more than 100000 bytes");
-    // The bytes of the tool that failed count no more, and those that were collected neither.
+    // The bytes of the failed tool and the collected bytes no longer count.
     const auto third = group.start(shell("head -c 40000 /dev/zero"));
     EXPECT_EQ(group.collect(third).output.size(), 40'000U);
     EXPECT_EQ(group.collect(first).output.size(), 60'000U);
@@ -253,7 +253,7 @@ TEST_F(TaskGroupOf, ADaemonThatAToolLeftIsNotKilledWithAGroupThatNobodyCollects)
         while (!fs::exists(place("pid"))) {
             std::this_thread::sleep_for(1ms);
         }
-        std::this_thread::sleep_for(50ms);  // the tool has exited, unseen
+        std::this_thread::sleep_for(50ms);  // the tool has exited, and nothing has noticed it yet
     }
     std::ifstream(place("pid")) >> pid;
     std::this_thread::sleep_for(50ms);

@@ -77,7 +77,7 @@ bool isGoneSoon(pid_t pid) {
     return !isAlive(pid);
 }
 
-/// A process that the test leaves behind on purpose, ended with the test.
+/// A process that the tool leaves behind on purpose. The destructor ends it.
 class Leftover {
   public:
     explicit Leftover(const std::string& pid) : _pid(pid.empty() ? 0 : static_cast<pid_t>(std::stol(pid))) {}
@@ -281,7 +281,7 @@ TEST_F(Task, TaskEnvironmentReachesEveryToolAndTheCallsOwnWins) {
 TEST_F(Task, DirectoryIsTheProcessesWhichIsTheRoot) {
     EXPECT_EQ(run("/bin/pwd", {"-P"}), 0);
     EXPECT_EQ(_output, "/\n");
-    // A relative path that this process has looked at is the same path for the tool.
+    // A relative path refers to the same file in this process and in the tool.
     fs::current_path(_dir);
     EXPECT_EQ(run("/bin/pwd", {"-P"}), 0);
     EXPECT_EQ(_output, fs::canonical(_dir).string() + "\n");
@@ -373,7 +373,7 @@ TEST_F(Task, OtherChildrenOfTheProcessAreNotReaped) {
 TEST_F(Task, DaemonLeftBehindWithThePipesDoesNotHoldTheAnswerAndLivesOn) {
     const auto start = std::chrono::steady_clock::now();
     EXPECT_EQ(shell("sleep 300 & echo $!; exit 6"), 6);
-    EXPECT_LT(std::chrono::steady_clock::now() - start, 60s);  // far below the daemon's life
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 60s);  // far less than the daemon's running time
     const Leftover daemon(_output);
     EXPECT_TRUE(isAlive(daemon.pid()));
 }

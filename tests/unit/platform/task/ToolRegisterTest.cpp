@@ -26,7 +26,7 @@ class Register : public testing::Test {
     }
     void TearDown() override { setToolRegister(nullptr); }
 
-    /// The ids that it holds, read as another process does.
+    /// The ids in the register, read as another process does.
     [[nodiscard]] std::multiset<pid_t> ids() const {
         std::vector<pid_t> numbers(ToolRegister::capacity);
         const auto bytes = static_cast<ssize_t>(numbers.size() * sizeof(pid_t));
@@ -68,7 +68,7 @@ TEST_F(Register, AToolThatFindsNoFreePlaceIsNotStarted) {
     std::string error;
     EXPECT_EQ(launch_task(DiskPath("/bin/true"), {}, nullptr, &error), -1);
     EXPECT_EQ(error, "/bin/true: Resource temporarily unavailable");
-    // Claims of tools that never entered an id are no processes.
+    // Claimed places without an id do not name processes.
     _register->killRemaining();
     EXPECT_TRUE(ids().empty());
     EXPECT_EQ(launch_task(DiskPath("/bin/true"), {}, nullptr, nullptr), 0);

@@ -55,7 +55,7 @@ TEST(ValueCodec, SurvivesEveryChangedByte) {
             std::string changed = bytes;
             changed[i] = static_cast<char>(changed[i] ^ change);
             const auto value = decodeValue(changed);
-            // Whatever is accepted is a value that can be written again.
+            // An accepted value can be written again.
             EXPECT_TRUE(!value || decodeValue(encoded(*value)).has_value()) << i;
         }
     }
