@@ -41,7 +41,7 @@ std::string findingsText(const Value& findings) {
 std::string logText(const std::vector<std::string>& lines) {
     std::string text = lines.empty() ? "" : "\nlog lines of the request:";
     for (const std::string& line : lines) {
-        text += "\n  " + shown(line);
+        text += "\n  " + shownIndented(line, 4);
     }
     return text;
 }
@@ -86,8 +86,11 @@ std::string messageOf(const DaemonReply& reply) {
     }
     const std::string message = textAt(*said, "message");
     const std::string code = textAt(*said, "error");
-    return (message.empty() ? code : message + (code.empty() ? "" : " (" + code + ")")) +
-           findingsText(said->get("findings"));
+    // The message of a rejected request repeats the first finding.
+    if (const std::string findings = findingsText(said->get("findings")); !findings.empty()) {
+        return "the request was rejected, and nothing was changed (" + code + "):" + findings;
+    }
+    return message.empty() ? code : message + (code.empty() ? "" : " (" + code + ")");
 }
 
 Failure noPlugin() {

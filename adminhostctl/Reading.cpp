@@ -39,12 +39,12 @@ std::string withUnit(const Value& value, const std::string& unit) {
     if (!number || !(*number >= 0)) {
         return {};
     }
-    if (unit == "seconds" || unit == "minutes") {
-        return shown(textOf(value)) + (unit == "seconds" ? " s" : " min");
+    // The unit of a setting is kept: the number shown is the one to be written.
+    if (unit == "seconds" || unit == "minutes" || unit == "megabytes") {
+        return shown(textOf(value)) + (unit == "seconds" ? " s" : unit == "minutes" ? " min" : " MB");
     }
-    const double bytes = *number * (unit == "megabytes" ? 1e6 : 1);
-    if ((unit == "bytes" || unit == "megabytes") && bytes < 18e18) {
-        return sizeText(static_cast<std::uint64_t>(bytes));
+    if (unit == "bytes" && *number < 18e18) {
+        return sizeText(static_cast<std::uint64_t>(*number));
     }
     return {};
 }

@@ -19,7 +19,7 @@ void printNotDone(const Context& context, const RequestReport& report) {
     }
     context.err << "adminhostctl: these parts of the request were not carried out:\n";
     for (const ReportedGap& gap : report.notDone) {
-        context.err << "  " << shown(gapText(gap)) << '\n';
+        context.err << "  " << shownIndented(gapText(gap), 4) << '\n';
     }
     if (report.notDoneDropped > 0) {
         context.err << "  and " << report.notDoneDropped << " more\n";
@@ -121,7 +121,7 @@ RequestReport reportLost(const Context& context, const LostAnswer& lost) {
     if (!report.changes.empty()) {
         context.err << "the daemon reports these changes:\n";
         for (const ReportedChange& change : report.changes) {
-            context.err << "  " << shown(changeText(change)) << '\n';
+            context.err << "  " << shownIndented(changeText(change), 4) << '\n';
         }
         if (report.changesDropped > 0) {
             context.err << "  and " << report.changesDropped << " more\n";
@@ -131,7 +131,7 @@ RequestReport reportLost(const Context& context, const LostAnswer& lost) {
     if (!report.log.empty()) {
         context.err << "log lines of the request:\n";
         for (const std::string& line : report.log) {
-            context.err << "  " << shown(line) << '\n';
+            context.err << "  " << shownIndented(line, 4) << '\n';
         }
     }
     return report;

@@ -99,6 +99,14 @@ std::string shown(std::string_view text) {
     return out;
 }
 
+std::string shownIndented(std::string_view text, std::size_t indent) {
+    std::string out = shown(text);
+    for (std::size_t at = out.find('\n'); at != std::string::npos; at = out.find('\n', at + 1)) {
+        out.insert(at + 1, indent, ' ');
+    }
+    return out;
+}
+
 std::string shownJson(std::string_view json) {
     return replaced(json, [](std::uint32_t code) { return fmt::format("\\u{:04x}", code); });
 }

@@ -13,6 +13,9 @@ namespace adminhost::ctl {
 /// also those above U+007F, and characters that change the direction of writing. Line feeds and tabs stay.
 [[nodiscard]] std::string shown(std::string_view text);
 
+/// shown(), with each further line indented by so many blanks: no line feed of a value begins a line of ours.
+[[nodiscard]] std::string shownIndented(std::string_view text, std::size_t indent);
+
 /// JSON text with the same characters written as \uNNNN. Its value stays the same: such characters occur only within
 /// strings.
 [[nodiscard]] std::string shownJson(std::string_view json);

@@ -12,8 +12,6 @@
 namespace adminhost::ctl {
 namespace {
 
-const Value secretText("(secret)");
-
 /// Names of the settings that a write can set and reading shows.
 std::vector<std::string> writableKeys(const StateForm& form) {
     std::vector<std::string> keys;
@@ -24,6 +22,9 @@ std::vector<std::string> writableKeys(const StateForm& form) {
 }
 
 std::string settingText(const Value& value) {
+    if (const auto boolean = value.boolean()) {
+        return *boolean ? "yes" : "no";
+    }
     return value.isNull() ? "not set" : shown(textOf(value));
 }
 
@@ -40,20 +41,23 @@ const Dictionary& dictionaryAt(const Dictionary& dictionary, std::string_view ke
     return found == nullptr ? none : *found;
 }
 
-}  // namespace
-
-std::vector<std::string> changesBetween(const Dictionary& before, const Dictionary& after,
-                                        const std::vector<std::string>& keys) {
-    std::vector<std::string> changes;
-    for (const std::string& key : keys) {
-        const Value& old = before.get(key);
-        const Value& now = after.get(key);
-        if (old != now && old != secretText && now != secretText) {
-            changes.push_back(key + ": " + settingText(old) + " -> " + settingText(now));
+/// What the write changed, as the daemon has recorded it.
+std::string changesText(const Dictionary& entry) {
+    const Array* changes = entry.get("changes").array();
+    if (changes == nullptr) {
+        return "unknown: the write did not end";
+    }
+    std::string text;
+    for (const Value& element : *changes) {
+        if (const Dictionary* change = element.dictionary()) {
+            text += (text.empty() ? "" : "; ") + shown(textOf(change->get("key"))) + ": " +
+                    settingText(change->get("from")) + " -> " + settingText(change->get("to"));
         }
     }
-    return changes;
+    return text.empty() ? "no setting" : text;
 }
+
+}  // namespace
 
 ExitStatus history(const Context& context, std::span<const std::string>) {
     const CommandRef write = context.service.stateCommand("write");
@@ -66,22 +70,13 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
         context.out << "No settings have been written yet.\n";
         return ExitStatus::done;
     }
-    const StateForm form(write.description);
-    const std::vector<std::string> keys = writableKeys(form);
-    const Dictionary current = readState(context, form.settingsSection()).state.settings;
     Table table({"number", "when", "who", "changed"});
     // The newest first: that is the one that people look for.
     for (std::size_t i = entries.size(); i-- > 0;) {
         const Dictionary& entry = *entries[i].dictionary();
-        const Dictionary& after =
-            i + 1 < entries.size() ? dictionaryAt(*entries[i + 1].dictionary(), "settings") : current;
-        std::string changed;
-        for (const std::string& change : changesBetween(dictionaryAt(entry, "settings"), after, keys)) {
-            changed += (changed.empty() ? "" : "; ") + change;
-        }
         const auto when = entry.get("when").date();
         table.addRow({textOf(entry.get("number")), when ? dateText(*when) : "", shown(textOf(entry.get("who"))),
-                      changed.empty() ? "no setting" : changed});
+                      changesText(entry)});
     }
     context.out << table.text(context.options.width, 0)
                 << "\nadminhostctl rollback NUMBER restores the settings as they were before that write.\n";

@@ -6,10 +6,6 @@
 
 namespace adminhost::ctl {
 
-/// The settings that differ, "KEY: BEFORE -> AFTER" each; only the given keys are compared, and secrets never.
-[[nodiscard]] std::vector<std::string> changesBetween(const Dictionary& before, const Dictionary& after,
-                                                      const std::vector<std::string>& keys);
-
 [[nodiscard]] ExitStatus history(const Context& context, std::span<const std::string> arguments);
 /// Writes the settings of an entry, in the same way as every verb that changes something (Writing.h). A setting that is
 /// set now and was not set then keeps its value: it is named, and the status is failed. A secret also keeps its value,

@@ -37,7 +37,7 @@ void showFailed(std::ostream& err, const std::vector<FailedChange>& failed) {
     for (const FailedChange& one : failed) {
         err << "  ";
         showLine(err, one.change);
-        err << (one.reason.empty() ? "" : ": " + shown(one.reason)) << '\n';
+        err << (one.reason.empty() ? "" : ": " + shownIndented(one.reason, 4)) << '\n';
     }
 }
 
@@ -58,11 +58,56 @@ void showLookedUp(const Context& context, const StateForm& form, const Plan& pla
     }
 }
 
+/// The plan for programs.
+void writePlan(const Context& context, const Plan& plan) {
+    Array changes;
+    for (const PlannedChange& change : plan.changes) {
+        changes.emplace_back(Dictionary{{"entry", change.entry}, {"from", change.from}, {"to", change.to}});
+    }
+    Array notes;
+    for (const std::string& note : plan.notes) {
+        notes.emplace_back(note);
+    }
+    writeValue(
+        context,
+        Dictionary{{"changes", std::move(changes)}, {"notes", std::move(notes)}, {"restart", !plan.restart.empty()}},
+        Description());
+}
+
+/// The plans of one verb's writes. Text is printed at once; for programs, finish() prints them as one document.
+class PlanOutput {
+  public:
+    explicit PlanOutput(const Context& context) noexcept : _context(context) {}
+
+    void show(const Plan& plan) {
+        if (_context.options.format == Format::text) {
+            showPlan(_context, plan);
+            return;
+        }
+        _shown = true;
+        _all.changes.insert(_all.changes.end(), plan.changes.begin(), plan.changes.end());
+        _all.notes.insert(_all.notes.end(), plan.notes.begin(), plan.notes.end());
+        _all.restart.insert(_all.restart.end(), plan.restart.begin(), plan.restart.end());
+    }
+    void finish() const {
+        if (_shown) {
+            writePlan(_context, _all);
+        }
+    }
+
+  private:
+    const Context& _context;
+    Plan _all;
+    bool _shown = false;
+};
+
 /// One write and its outcome.
 class PlannedWrite {
   public:
-    PlannedWrite(const Context& context, const CurrentState& current, const Wanted& wanted, Plan plan)
+    PlannedWrite(const Context& context, const CurrentState& current, const Wanted& wanted, Plan plan,
+                 PlanOutput& output)
         : _context(context),
+          _output(output),
           _current(current),
           _wanted(wanted),
           _plan(std::move(plan)),
@@ -84,7 +129,7 @@ class PlannedWrite {
         }
         const PlanOutcome outcome =
             outcomeOf(_current.form, _wanted, _plan, _current.state, after, error.empty(), report);
-        showPlan(_context, _plan);
+        _output.show(_plan);
         if (after) {
             showLookedUp(_context, _current.form, _plan, *after);
         }
@@ -96,7 +141,7 @@ class PlannedWrite {
         }
         _context.err << (report.log.empty() ? "the request logged nothing\n" : "log lines of the request:\n");
         for (const std::string& line : report.log) {
-            _context.err << "  " << shown(line) << '\n';
+            _context.err << "  " << shownIndented(line, 4) << '\n';
         }
         return status == ExitStatus::done && outcome.failed.empty() ? ExitStatus::undetermined : ExitStatus::failed;
     }
@@ -121,7 +166,7 @@ class PlannedWrite {
         if (!applied.changes.empty()) {
             _context.err << "these changes were applied:\n";
             _context.err.flush();
-            showPlan(_context, applied);
+            _output.show(applied);
         }
         showFailed(_context.err, outcome.failed);
         showLines(_context.err, "it could not be determined whether these changes were applied:", outcome.undetermined);
@@ -132,11 +177,41 @@ class PlannedWrite {
     }
 
     const Context& _context;
+    PlanOutput& _output;
     const CurrentState& _current;
     const Wanted& _wanted;
     Plan _plan;
     CommandRef _command;
 };
+
+ExitStatus carryOutWith(const Context& context, const Wanted& wanted, const CurrentState& current, PlanOutput& output) {
+    Plan plan = planOf(current.form, wanted, current.state);
+    if (plan.changes.empty()) {
+        output.show(plan);
+        return ExitStatus::done;
+    }
+    Wanted settings = wanted;
+    settings.elements.clear();
+    settings.removeUnlisted.clear();
+    Plan first = planOf(current.form, settings, current.state);
+    if (!plan.moves || first.changes.size() == plan.changes.size()) {
+        return PlannedWrite(context, current, wanted, std::move(plan), output).perform();
+    }
+    // The new files may refer to another database, in which the identity belongs to another element.
+    const ExitStatus status = PlannedWrite(context, current, settings, std::move(first), output).perform();
+    if (status != ExitStatus::done) {
+        return status;
+    }
+    Wanted elements = wanted;
+    elements.settings = {};
+    elements.secrets.clear();
+    const CurrentState moved = readState(context);
+    Plan second = planOf(moved.form, elements, moved.state);
+    if (second.changes.empty()) {
+        return ExitStatus::done;
+    }
+    return PlannedWrite(context, moved, elements, std::move(second), output).perform();
+}
 
 }  // namespace
 
@@ -168,19 +243,7 @@ void requireWhole(const CurrentState& current) {
 
 void showPlan(const Context& context, const Plan& plan) {
     if (context.options.format != Format::text) {
-        Array changes;
-        for (const PlannedChange& change : plan.changes) {
-            changes.emplace_back(Dictionary{{"entry", change.entry}, {"from", change.from}, {"to", change.to}});
-        }
-        Array notes;
-        for (const std::string& note : plan.notes) {
-            notes.emplace_back(note);
-        }
-        writeValue(
-            context,
-            Dictionary{
-                {"changes", std::move(changes)}, {"notes", std::move(notes)}, {"restart", !plan.restart.empty()}},
-            Description());
+        writePlan(context, plan);
         return;
     }
     for (const PlannedChange& change : plan.changes) {
@@ -202,32 +265,15 @@ void showPlan(const Context& context, const Plan& plan) {
 }
 
 ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentState& current) {
-    Plan plan = planOf(current.form, wanted, current.state);
-    if (plan.changes.empty()) {
-        showPlan(context, plan);
-        return ExitStatus::done;
-    }
-    Wanted settings = wanted;
-    settings.elements.clear();
-    settings.removeUnlisted.clear();
-    Plan first = planOf(current.form, settings, current.state);
-    if (!plan.moves || first.changes.size() == plan.changes.size()) {
-        return PlannedWrite(context, current, wanted, std::move(plan)).perform();
-    }
-    // The new files may refer to another database, in which the identity belongs to another element.
-    const ExitStatus status = PlannedWrite(context, current, settings, std::move(first)).perform();
-    if (status != ExitStatus::done) {
+    PlanOutput output(context);
+    try {
+        const ExitStatus status = carryOutWith(context, wanted, current, output);
+        output.finish();
         return status;
+    } catch (const Failure&) {
+        output.finish();
+        throw;
     }
-    Wanted elements = wanted;
-    elements.settings = {};
-    elements.secrets.clear();
-    const CurrentState moved = readState(context);
-    Plan second = planOf(moved.form, elements, moved.state);
-    if (second.changes.empty()) {
-        return ExitStatus::done;
-    }
-    return PlannedWrite(context, moved, elements, std::move(second)).perform();
 }
 
 }  // namespace adminhost::ctl

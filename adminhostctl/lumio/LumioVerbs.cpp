@@ -25,8 +25,9 @@ Array listOf(const Context& context, const CommandRef& command, const std::strin
     const std::string error = errorOf(command.description, *said);
     const Array* list = said->get(key).array();
     if (!error.empty() || list == nullptr) {
-        throw Failure(ExitStatus::failed,
-                      "the service returned an error: " + (error.empty() ? key + " is missing" : error));
+        throw Failure(ExitStatus::failed, "the service does not list its " + key +
+                                              ": its database is missing or cannot be read" +
+                                              (error.empty() ? "" : " (" + error + ")"));
     }
     return *list;
 }

@@ -5,6 +5,7 @@
 namespace adminhost::test {
 namespace {
 
+using testing::ContainsRegex;
 using testing::HasSubstr;
 using testing::Not;
 
@@ -179,6 +180,39 @@ TEST_F(ChangeVerbs, SettingsFileThatCannotBeWrittenIsNamedWithItsReason) {
     EXPECT_EQ(set.status, 1);
     EXPECT_THAT(set.output, HasSubstr("writeStatus is 7"));
     EXPECT_THAT(set.output, HasSubstr("not applied:\n  settings.server_port: 8170 -> 8180"));
+}
+
+TEST_F(ChangeVerbs, HistoryShowsAChangedPasswordAndEditsMadeOutsideTheDaemon) {
+    ASSERT_EQ(ctl({"settings", "set", "nimbo_client_password", "@" + file("password", "another\n")}).status, 0);
+    ASSERT_EQ(ctl({"settings", "set", "sorvane_capture_web_enabled", "off"}).status, 0);
+    std::string outside = read(root.memberPreferencesPath());
+    const std::size_t at = outside.find("<integer>8170</integer>");
+    ASSERT_NE(at, std::string::npos);
+    outside.replace(at, 23, "<integer>4242</integer>");
+    std::ofstream(root.memberPreferencesPath()) << outside;
+    ASSERT_EQ(ctl({"settings", "set", "tunnel_timeout_seconds", "31"}).status, 0);
+    const std::string history = ctl({"history"}).output;
+    EXPECT_THAT(history, ContainsRegex("1 .* nimbo_client_password: \\(secret\\) -> \\(secret\\) changed\n"));
+    EXPECT_THAT(history, ContainsRegex("2 .* sorvane_capture_web_enabled: yes -> no\n"));
+    EXPECT_THAT(history, ContainsRegex("3 .* outside the daemon  server_port: 8170 -> 4242\n"));
+    EXPECT_THAT(history, ContainsRegex("4 .* tunnel_timeout_seconds: 30 -> 31\n"));
+}
+
+TEST_F(ChangeVerbs, RejectedRequestNamesEachFindingOnce) {
+    const ProgramResult set = ctl({"settings", "set", "shared_filesystem", "relative/path"});
+    EXPECT_EQ(set.status, 1);
+    EXPECT_EQ(set.output,
+              "adminhostctl: the request was rejected, and nothing was changed (REQUEST_REFUSED):\n"
+              "  configuration.shared_filesystem: must be an absolute path: the service and its tools do not share a "
+              "current directory (begin it with a slash)\n");
+}
+
+TEST_F(ChangeVerbs, FurtherLinesOfAToolsWordsAreIndented) {
+    root.setSwitch("lumioconfig.error", "locked\nadminhostctl: done\n");
+    root.setSwitch("lumioconfig.exit", "3");
+    const ProgramResult allow = ctl({"camera", "allow", "Roof", "ben"});
+    EXPECT_EQ(allow.status, 1);
+    EXPECT_THAT(allow.output, HasSubstr("locked\n    adminhostctl: done)\n"));
 }
 
 }  // namespace

@@ -1,5 +1,6 @@
 // A change of the place of the settings files: one apply settles what the plan shows.
 
+#include "platform/json/Json.h"
 #include "tests/system/apply/ControlledService.h"
 
 #include <filesystem>
@@ -56,6 +57,18 @@ TEST_F(Moving, ListsAreChangedTogetherWithTheMove) {
     _text.replace(at, 12, "value = \"fr\"");
     settlesAtOnce();
     EXPECT_EQ(root.sql("select value from properties where name='default_language'"), "fr\n");
+}
+
+TEST_F(Moving, BothStepsAreOneDocumentForPrograms) {
+    replaceSetting("shared_filesystem", "\"/Library/Moved\"");
+    const std::size_t at = _text.find("value = \"de\"");
+    ASSERT_NE(at, std::string::npos);
+    _text.replace(at, 12, "value = \"fr\"");
+    const ProgramResult apply = ctl({"--format", "json", "apply", file("desired.toml", _text)});
+    EXPECT_EQ(apply.status, 0);
+    const auto document = parseJson(apply.output);
+    ASSERT_TRUE(document) << apply.output;
+    EXPECT_THAT(apply.output, AllOf(HasSubstr("settings.shared_filesystem"), HasSubstr("properties.default_language")));
 }
 
 TEST_F(Moving, PlanNamesWhatTheNewFilesNeedNotHave) {

@@ -46,5 +46,14 @@ TEST_F(Unreadable, AccessListsThatCannotBeReadAreNotExportedAsEmpty) {
     EXPECT_EQ(ctl({"settings", "set", "server_port", "8180"}).status, 0) << "which has nothing to do with them";
 }
 
+TEST_F(Unreadable, ListsOfABrokenDatabaseFailInTheSameWords) {
+    std::ofstream(root.databasePath()) << std::string(4096, 'x');
+    for (const std::string& what : {std::string("camera"), std::string("property")}) {
+        const ProgramResult list = ctl({what, "list"});
+        EXPECT_EQ(list.status, 1) << what;
+        EXPECT_THAT(list.output, HasSubstr(": its database is missing or cannot be read (readStatus is 26)\n"));
+    }
+}
+
 }  // namespace
 }  // namespace adminhost::test
