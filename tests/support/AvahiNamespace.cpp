@@ -26,7 +26,7 @@ pid_t avahiDaemon() {
     return static_cast<pid_t>(pid);
 }
 
-/// Reads until the text has come; the writer must send it within 20 seconds.
+/// Reads until the text has arrived; the writer must send it within 20 seconds.
 bool awaitText(int descriptor, const std::string& text) {
     std::string seen;
     pollfd wait{descriptor, POLLIN, 0};
@@ -75,7 +75,7 @@ PublishedService::PublishedService(const std::string& name, const std::string& t
     }
     posix_spawn_file_actions_t actions;
     ::posix_spawn_file_actions_init(&actions);
-    ::posix_spawn_file_actions_adddup2(&actions, ends[1], STDERR_FILENO);  // where the tool says that it has published
+    ::posix_spawn_file_actions_adddup2(&actions, ends[1], STDERR_FILENO);  // on which the tool reports success
     std::string words[] = {"avahi-publish-service", "-s", name, type, "7777"};
     char* const command[] = {words[0].data(), words[1].data(), words[2].data(),
                              words[3].data(), words[4].data(), nullptr};

@@ -15,7 +15,7 @@
 
 namespace adminhost::test {
 
-/// Runs this program again inside, and exits with its status; returns when it runs inside already.
+/// Runs this program again inside and exits with its status. Returns if it runs inside already.
 void enterAvahiNamespace(int argc, char** argv);
 
 /// A service on port 7777 of this host, whose address 10.77.0.1 has the name controller.test.example; published
@@ -31,7 +31,7 @@ class PublishedService {
     pid_t _child = -1;
 };
 
-/// The Avahi daemon, silent for the life of the object.
+/// While it exists, the Avahi daemon does not answer.
 class SilentAvahi {
   public:
     SilentAvahi();

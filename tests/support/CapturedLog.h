@@ -11,7 +11,7 @@
 
 namespace adminhost::test {
 
-/// Keeps every event while it lives.
+/// Keeps every event while it exists.
 class CapturedLog final : public LogSink {
   public:
     CapturedLog() { setLogSink(*this); }
@@ -20,7 +20,7 @@ class CapturedLog final : public LogSink {
     ~CapturedLog() override { setLogSink(standardErrorSink()); }
     void write(std::string_view event) noexcept override { lines.emplace_back(event); }
 
-    /// Whether any event has the text in it.
+    /// Returns true if an event contains the text.
     [[nodiscard]] bool contains(std::string_view text) const {
         return std::any_of(lines.begin(), lines.end(),
                            [&](const std::string& line) { return line.find(text) != std::string::npos; });

@@ -55,7 +55,7 @@ DaemonProcess::DaemonProcess(const Options& options) {
     std::vector<std::string> environment = options.environment;
     environment.push_back("TMPDIR=" + (_directory / "tmp").string());
     for (char** variable = environ; *variable != nullptr; ++variable) {
-        environment.emplace_back(*variable);  // of two the first counts
+        environment.emplace_back(*variable);  // the first of two definitions counts
     }
     if (std::find(arguments.begin(), arguments.end(), "--root") == arguments.end()) {
         // Nothing of this machine, except for the database tool.
@@ -111,7 +111,7 @@ DaemonProcess::~DaemonProcess() {
 
 void DaemonProcess::end() {
     if (_pid > 0 && !_status) {
-        // Its worker ends by itself when the conversation is closed.
+        // Its worker ends by itself when the socket pair is closed.
         ::kill(_pid, SIGKILL);
         wait();
     }
@@ -162,7 +162,7 @@ std::optional<int> DaemonProcess::wait(std::chrono::milliseconds bound) {
 
 std::size_t descriptorsOf(pid_t pid) {
     if (::geteuid() != 0 && ::access(("/proc/" + std::to_string(pid) + "/fd").c_str(), R_OK) != 0) {
-        return 0;  // the daemon denies its inspection; only root sees its descriptors
+        return 0;  // the daemon cannot be inspected; only root sees its descriptors
     }
     const std::filesystem::directory_iterator entries("/proc/" + std::to_string(pid) + "/fd");
     return static_cast<std::size_t>(std::distance(begin(entries), end(entries)));

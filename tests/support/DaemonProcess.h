@@ -1,7 +1,7 @@
 #pragma once
 
 // The daemon of this build, run by a test: started with its socket and its temporary files in a directory of its own,
-// ended and removed with the object. What goes wrong while starting throws std::runtime_error.
+// ended and removed with the object. A failure to start throws std::runtime_error.
 
 #include "tests/support/UnixHttp.h"
 
@@ -31,7 +31,7 @@ class DaemonProcess {
     explicit DaemonProcess(const Options& options);
     DaemonProcess(const DaemonProcess&) = delete;
     DaemonProcess& operator=(const DaemonProcess&) = delete;
-    /// Ends it by force if it still runs.
+    /// Kills it if it is still running.
     ~DaemonProcess();
 
     [[nodiscard]] pid_t pid() const noexcept { return _pid; }
@@ -39,15 +39,16 @@ class DaemonProcess {
     [[nodiscard]] const std::string& socket() const noexcept { return _socket; }
     [[nodiscard]] UnixHttp connect() const { return UnixHttp(socket()); }
 
-    /// The process id of the worker, as the daemon says.
+    /// The process id of the worker, as the daemon reports it.
     [[nodiscard]] pid_t workerPid() const;
-    /// What it has written to standard error: the log.
+    /// Its output on standard error: the log.
     [[nodiscard]] std::string log() const;
-    /// Waits until the log has the text in it; false after ten seconds.
+    /// Waits until the log contains the text. Returns false after ten seconds.
     [[nodiscard]] bool waitForLog(const std::string& text) const;
 
     void signal(int number) const;
-    /// Waits for its end: the exit status, 128 + number after a death by signal, nothing when it does not end in time.
+    /// Waits for its end. Returns the exit status, 128 + number if a signal ended it, nullopt if it does not end in
+    /// time.
     std::optional<int> wait(std::chrono::milliseconds bound = std::chrono::seconds(20));
 
   private:

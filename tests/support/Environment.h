@@ -1,6 +1,6 @@
 #pragma once
 
-// Environment variables of the test program, changed for a while.
+// Changes environment variables of the test program temporarily.
 
 #include <cstdlib>
 #include <map>
@@ -9,7 +9,7 @@
 
 namespace support {
 
-/// Sets (or, with no value, removes) variables, and puts every one back as it was when it goes away.
+/// Sets variables (or removes those without a value). The destructor restores them.
 class ScopedEnvironment {
   public:
     using Changes = std::map<std::string, std::optional<std::string>>;

@@ -27,7 +27,7 @@ using adminhost::test::runProgram;
 
 namespace {
 
-/// A descriptor, closed when it goes away.
+/// A descriptor that its destructor closes.
 class Descriptor {
   public:
     explicit Descriptor(int number) : _number(number) {}
@@ -157,7 +157,7 @@ ScopedEnvironment::Changes Kdc::environment() const {
 }
 
 std::string Kdc::clientConfiguration(const std::string& realm, int port, const std::string& libdefaults) {
-    // Names are never looked up outside, and TCP tells at once when nobody listens.
+    // No name is looked up outside, and TCP fails at once if no KDC listens.
     return "[libdefaults]\n default_realm = " + realm +
            "\n dns_lookup_realm = false\n dns_lookup_kdc = false\n dns_canonicalize_hostname = false\n"
            " rdns = false\n udp_preference_limit = 1\n" +
@@ -191,7 +191,7 @@ bool Kdc::start(int port) {
     kdcConfiguration = kdcConfiguration.substr(kdcConfiguration.find("[realms]"));
     write(_directory / "kdc.conf",
           "[kdcdefaults]\n kdc_listen = " + address + "\n kdc_tcp_listen = " + address + "\n" + kdcConfiguration);
-    // A test program that crashes takes its KDC along.
+    // If the test program crashes, its KDC is killed too.
     _pid = spawn({"/usr/bin/setpriv", "--pdeathsig", "KILL", "/usr/sbin/krb5kdc", "-n"}, _directory / "kdc.out");
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
     while (std::chrono::steady_clock::now() < deadline) {
@@ -220,7 +220,7 @@ void Kdc::stop() noexcept {
 void Kdc::admin(std::string_view commands) const {
     const ScopedEnvironment scoped(environment());
     const auto done = runProgram({"/usr/sbin/kadmin.local"}, Errors::merge, commands);
-    // The tool's exit status does not tell: failures are lines such as "add_principal: Principal or policy already
+    // The tool's exit status does not show failures. They are lines such as "add_principal: Principal or policy already
     // exists while creating "alice@R"."
     if (done.status != 0 || done.output.find(" while ") != std::string::npos ||
         done.output.find("unknown request") != std::string::npos || done.output.find("usage:") != std::string::npos) {

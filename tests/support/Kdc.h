@@ -1,6 +1,6 @@
 #pragma once
 
-// A throw-away Kerberos realm: database, KDC on a free loopback port, client configuration. Everything lies in a new
+// A temporary Kerberos realm: database, KDC on a free loopback port, client configuration. Everything is in a new
 // temporary directory. Needs no privileges and never reads the machine's own configuration.
 
 #include "tests/support/Environment.h"
@@ -15,8 +15,8 @@ namespace support {
 
 class Kdc {
   public:
-    /// Creates the realm and waits until its KDC accepts connections. Throws std::runtime_error with what the tools
-    /// said on failure.
+    /// Creates the realm and waits until its KDC accepts connections. On failure, throws std::runtime_error with the
+    /// output of the tools.
     explicit Kdc(std::string realm = "NIMBO.TEST");
     Kdc(const Kdc&) = delete;
     Kdc& operator=(const Kdc&) = delete;
@@ -31,7 +31,7 @@ class Kdc {
     [[nodiscard]] const std::filesystem::path& directory() const noexcept { return _directory; }
     /// The client configuration file, to be named by KRB5_CONFIG.
     [[nodiscard]] std::filesystem::path configuration() const { return _directory / "krb5.conf"; }
-    /// What clients of the realm need in their environment: all KRB5 variables, caches and keytabs below the directory.
+    /// The environment for clients of the realm: all KRB5 variables, with caches and keytabs below the directory.
     [[nodiscard]] ScopedEnvironment::Changes environment() const;
     /// A client configuration for the realm, with its KDC at that loopback port and further lines in [libdefaults].
     [[nodiscard]] static std::string clientConfiguration(const std::string& realm, int port,
@@ -39,7 +39,7 @@ class Kdc {
 
   private:
     void createDatabase() const;
-    /// Answers whether the KDC serves; it does not if another program took the port meanwhile.
+    /// Returns true if the KDC serves. It does not if another program has got the port in the meantime.
     [[nodiscard]] bool start(int port);
     void stop() noexcept;
 

@@ -1,6 +1,6 @@
 #pragma once
 
-// Keytab files written byte by byte, for sizes that adding entries one by one takes too long for.
+// Writes keytab files byte by byte, because adding many entries one by one would be too slow.
 
 #include <cstdint>
 #include <string>

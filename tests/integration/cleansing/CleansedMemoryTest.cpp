@@ -1,5 +1,5 @@
-// Whether memory that is given back still holds a key or a plain text. The program has its own new and delete for it
-// and looks at whole blocks, written or not, so it is none of the unit programs, which also run below valgrind.
+// Checks that freed memory holds no key and no plain text. The program has its own new and delete for that, which read
+// whole blocks, written or not. So it is not part of the unit programs, which also run below valgrind.
 
 #include "tests/unit/resources/PropertyFixture.h"
 
@@ -36,7 +36,7 @@ void release(void* block) noexcept {
 
 }  // namespace
 
-// This program's memory: what is given back is looked through first.
+// This program's memory: each block is searched before it is freed.
 void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
     return std::malloc(std::max<std::size_t>(size, 1));
 }

@@ -1,4 +1,4 @@
-// The grid controller's name on its way into the cluster preferences, against a real bus and a real Avahi daemon.
+// Writing the grid controller's name to the cluster preferences, with a real bus and a real Avahi daemon.
 
 #include "handler/LumioRequestHandler.h"
 #include "platform/plist/PropertyList.h"
@@ -36,12 +36,12 @@ using Clock = std::chrono::steady_clock;
 constexpr const char* type = "_nimbo._tcp";
 constexpr std::string_view clusterFile = "/shared/Server/cluster_preferences.plist";
 constexpr const char* foundHost = "controller.test.example";
-/// Where with-avahi keeps the host names of its namespace.
+/// The file in which with-avahi keeps the host names of its namespace.
 constexpr const char* hostsFile = "/run/with-avahi/hosts";
 
 const ScopedEnvironment::Changes noBus{{"DBUS_SYSTEM_BUS_ADDRESS", "unix:path=/run/with-avahi/missing"}};
 
-/// The host file of the namespace without its names, for a while: the addresses have none then.
+/// While it exists, the host file of the namespace is empty, so that the addresses have no names.
 class NamelessAddresses {
   public:
     NamelessAddresses() {

@@ -69,7 +69,7 @@ struct Recorded {
                              }});
     }
 
-    /// As a caller waits: turns of one second until an address or a failure.
+    /// Waits as a caller does: turns of one second until there is an address or a failure.
     void wait(EventLoop& loop) const {
         for (int turns = 20; turns > 0 && failures.empty() && service.addresses().empty(); --turns) {
             loop.runOnce(1s);

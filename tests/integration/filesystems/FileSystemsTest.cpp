@@ -1,5 +1,5 @@
-// Settings written to file systems that are missing, read-only or full: real ones, mounted by the test in namespaces of
-// its own, in which it is the superuser whoever runs it.
+// Settings written to file systems that are missing, read-only or full. The test mounts real ones in namespaces of its
+// own, in which every account is the superuser.
 
 #include "adminhostd/SettingsHistory.h"
 #include "handler/LumioRequestHandler.h"
@@ -39,7 +39,7 @@ constexpr std::string_view clusterFile = "/shared/Server/cluster_preferences.pli
 constexpr std::string_view memberFile = "/shared/Server/member_preferences_M.plist";
 constexpr const char* small = "size=64k,mode=755";
 
-/// A file system of its own at a host path, for the life of the object. Throws when it cannot be mounted.
+/// A separate file system at a host path, mounted while the object exists. Throws if it cannot be mounted.
 class Mount {
   public:
     Mount(const adminhost::test::TemporaryRoot& root, std::string_view place, const char* options = small)
@@ -55,7 +55,7 @@ class Mount {
         check(::mount("tmpfs", _place.c_str(), "tmpfs", MS_REMOUNT | MS_RDONLY, nullptr), "remount");
         ASSERT_FALSE(std::ofstream(_place / "probe").is_open()) << "it is not read-only";
     }
-    /// Leaves not a single free byte.
+    /// Fills the file system to the last byte.
     void fill() const {
         std::ofstream file(_place / "filling");
         while (file << 'x' << std::flush) {
@@ -74,7 +74,7 @@ class Mount {
     fs::path _place;
 };
 
-/// Files of mode 000 are closed to the superuser too, for the life of the object.
+/// While it exists, the superuser cannot open files of mode 000.
 class WithoutAccessPrivileges {
   public:
     WithoutAccessPrivileges() {
@@ -283,7 +283,7 @@ TEST_F(FileSystems, HistoryWithoutRoomIsAnErrorThatLeavesNoHalfEntry) {
     EXPECT_THAT(*refused.error().description, HasSubstr("Read-only file system"));
 }
 
-/// Runs this program again as the superuser of a user namespace, with mounts of its own; returns when it runs there.
+/// Runs this program again as the superuser of a user namespace, with mounts of its own. Returns in that second run.
 void enterNamespace(int argc, char** argv) {
     constexpr const char* inside = "ADMINHOST_TEST_NAMESPACE";
     if (std::getenv(inside) != nullptr) {

@@ -14,7 +14,7 @@
 namespace lumio {
 namespace {
 
-/// How long a caller of the layer blocks in the worst case is the library's decision; this shows it.
+/// Shows how long a caller of the layer blocks in the worst case. The library sets this limit.
 TEST(SilentKdc, ThatAcceptsAndNeverAnswersIsGivenUpAsUnreachable) {
     std::string pattern = std::filesystem::temp_directory_path() / "silent.XXXXXX";
     ASSERT_NE(mkdtemp(pattern.data()), nullptr);

@@ -1,5 +1,5 @@
-// Every system call on the way of a written property list fails once, fails for ever, and is the process's last. The
-// test program is its own writer: with --write it writes one list between two calls that mark the way in strace's log.
+// Each system call of writing a property list fails once, fails always, and is the process's last one. The test program
+// is also the writer: with --write it writes one list between two calls that mark the write in strace's log.
 
 #include "platform/plist/PropertyList.h"
 #include "tests/support/Traced.h"
@@ -26,7 +26,7 @@ using namespace adminhost;
 namespace fs = std::filesystem;
 using test::TracedCall;
 
-/// A list of several pages, so that the bytes do not fit a single block.
+/// A list of several pages, so that the bytes do not fit into one block.
 Value listOf(const std::string& word) {
     Array array;
     for (int i = 0; i < 2000; ++i) {
@@ -85,14 +85,14 @@ class PlistFaults : public testing::TestWithParam<bool> {
         return calls;
     }
 
-    /// Calls of the memory allocator; their failures are the C library's matter.
+    /// Calls of the memory allocator; the C library handles their failures.
     static bool isMemory(const std::string& name) {
         return std::set<std::string>{"brk", "mmap", "munmap", "mremap", "madvise", "mprotect", "futex"}.contains(name);
     }
 
     [[nodiscard]] fs::path leftover() const { return _dir / "files" / ".a.plist.adminhost-0123456789abcdef"; }
 
-    /// The next write, undisturbed: it succeeds and leaves nothing but the file.
+    /// The next write, undisturbed: it succeeds and leaves only the file.
     void writeAgain() const {
         EXPECT_EQ(writePropertyList(listOf("newer"), HostPath(_file)), std::nullopt);
         EXPECT_TRUE(holds("newer"));
@@ -157,7 +157,7 @@ TEST_P(PlistFaults, EachCallThatFailsLeavesTheOldFileOrTheNewOneWhole) {
                     EXPECT_TRUE(isNew());
                 } else {
                     EXPECT_TRUE(isOld());
-                    // A writer that cannot write at all cannot say why either.
+                    // A writer that cannot write at all cannot report the reason either.
                     EXPECT_NE(_error.find(_file.string() + ": ") != std::string::npos,
                               call.name == "write" && *again != 0)
                         << _error;

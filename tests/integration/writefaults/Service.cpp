@@ -22,7 +22,7 @@ namespace {
 constexpr std::string_view marker = "/var/lumio/server/.lumio_setup_done";
 const std::string scripts = "/usr/share/sorvaneproducer/lumioserverd/script/";
 
-/// Several pages, so that no file fits a single block.
+/// Several pages, so that no file fits into one block.
 const std::string filling(20'000, 'x');
 
 Value writeNew() {
@@ -49,7 +49,7 @@ void Service::makeWithoutFiles() const {
         fs::create_directories(root.path(file).parent_path());
     }
     fs::remove_all(root.path("/var/lumio"));
-    // Its owner can be set by the superuser alone; whoever runs the tests finds it made.
+    // Only the superuser can set its owner, so it exists already, with the account of the tests as its owner.
     fs::create_directories(root.path("/var/lumio/server"));
 }
 
@@ -120,7 +120,7 @@ bool Service::marked() const {
 int writeBetweenMarks(const std::vector<std::string>& arguments) {
     adminhost::setSystemRoot(arguments.at(0));
     if (arguments.size() > 1) {
-        // Bytes that a file may have: the write that reaches them is cut short, the next one fails.
+        // The limit on the size of files: the write that reaches it is cut short, the next one fails.
         const rlimit limit{std::stoul(arguments[1]), std::stoul(arguments[1])};
         ::setrlimit(RLIMIT_FSIZE, &limit);
         static_cast<void>(::signal(SIGXFSZ, SIG_IGN));

@@ -1,7 +1,7 @@
 #pragma once
 
-// A small service whose settings are written by this program, run once more as a process of its own: with --write it
-// writes the settings once, between the two marks of a traced way.
+// A small service whose settings are written by a second process of this program: with --write it writes the settings
+// once, between the two marks in the trace.
 
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TemporaryRoot.h"
@@ -33,22 +33,22 @@ class Service {
   public:
     Service();
 
-    /// Puts the settings back as they were, without the marker, and removes whatever else stands beside them.
+    /// Restores the original settings, without the marker, and removes all other files beside them.
     void makeOld() const;
     void makeWithoutFiles() const;
-    /// A process that writes the new settings, each of its files bounded to so many bytes if a number is given. Its
-    /// status.
+    /// Runs a process that writes the new settings and returns its status. If a number is given, each file may have so
+    /// many bytes.
     std::int32_t writeAlone(const std::optional<std::string>& bytes = std::nullopt);
-    /// The same below strace, with its options and its log.
+    /// The same below strace, with these options and this log.
     std::int32_t writeTraced(const std::vector<std::string>& options, const std::string& logFile);
-    /// Writes the new settings in this process; whether that succeeded.
+    /// Writes the new settings in this process. Returns true on success.
     [[nodiscard]] bool writeHere() const;
 
     [[nodiscard]] Contents contents() const;
-    /// What stands beside the settings files, by name.
+    /// The names of other files beside the settings files.
     [[nodiscard]] std::vector<std::string> others() const;
     [[nodiscard]] bool marked() const;
-    /// What the process said: its log, and the answer's "errorDescription" in the last line.
+    /// The output of the process: its log, and the answer's "errorDescription" in the last line.
     [[nodiscard]] const std::string& said() const { return _said; }
 
     adminhost::test::TemporaryRoot root;

@@ -1,6 +1,6 @@
-// Every system call with which writing the settings changes or opens something fails once, fails for ever, and is the
-// process's last. Afterwards each settings file is the old one or the new one, whole, and after the next write nothing
-// else stands beside them.
+// Each system call with which a write of settings changes or opens something fails once, fails always, and is the
+// process's last one. Afterwards each settings file is the whole old one or the whole new one, and after the next write
+// there are no other files beside them.
 
 #include "tests/integration/writefaults/Service.h"
 #include "tests/support/Traced.h"
@@ -19,17 +19,17 @@ using testing::AnyOf;
 using testing::IsEmpty;
 
 struct Call : adminhost::test::TracedCall {
-    bool changes;  ///< something on the disk; others only open, look or close
+    bool changes;  ///< something on the disk; the other calls only open, read or close
 };
 
-/// What is printed at the end.
+/// The counts that are printed at the end.
 struct Counts {
     int runs = 0;
     int refused = 0;
     int files = 0;
     int old = 0;
     int fresh = 0;    ///< the new one
-    int started = 0;  ///< the new one, begun from nothing: the old one could not be loaded
+    int started = 0;  ///< the new one without the old keys, because the old one could not be loaded
     int broken = 0;
 
     void print(const char* what) const {
@@ -64,7 +64,7 @@ class WriteFaults : public testing::Test {
     std::int32_t write(const std::vector<std::string>& options) { return service.writeTraced(options, logFile()); }
     [[nodiscard]] std::string logFile() const { return service.root.path("/strace").string(); }
 
-    /// The calls between the two marks of an undisturbed write with which a file is opened, made, changed or closed.
+    /// The calls between the two marks of an undisturbed write with which a file is opened, created, changed or closed.
     /// Not getrandom: the XML library ends the process when that fails, before anything is written.
     std::vector<Call> callsOfTheWay() {
         static const std::set<std::string> changing{
@@ -85,7 +85,7 @@ class WriteFaults : public testing::Test {
         return calls;
     }
 
-    /// Each file is the old one, the new one, or (after a load that failed) the new one begun from nothing.
+    /// Each file is the old one, the new one, or (after a load that failed) the new one without the old keys.
     void checkFiles(Counts& count) {
         ++count.runs;
         const Contents now = service.contents();
@@ -125,7 +125,7 @@ class WriteFaults : public testing::Test {
                 const std::string code = codes[i];
                 if (!call.changes &&
                     (call.number % 4 != 0 || static_cast<std::size_t>(call.number / 4) % codes.size() != i)) {
-                    continue;  // a sample of them
+                    continue;  // only a sample of the calls is tested
                 }
                 service.makeOld();
                 SCOPED_TRACE(call.line.substr(0, 300) + " fails with " + code + again);
@@ -137,7 +137,7 @@ class WriteFaults : public testing::Test {
                 Counts& count = counts[std::string("call fails ") + (*again == 0 ? "once" : "for ever")];
                 count.refused += status == written ? 0 : 1;
                 checkFiles(count);
-                if (status == refused && !(call.name == "write" && *again != 0)) {  // else it cannot say why either
+                if (status == refused && !(call.name == "write" && *again != 0)) {  // else it cannot report why
                     EXPECT_NE(service.said().find(".plist: "), std::string::npos) << "names path and reason";
                 }
                 if (status == written && call.changes) {
