@@ -256,7 +256,7 @@ void OperationQueue::begin(Operation operation) {
     }
     if (auto* perform = std::get_if<protocol::Perform>(&operation.order)) {
         const auto left = std::chrono::ceil<std::chrono::milliseconds>(*operation.until - now);
-        perform->milliseconds = static_cast<std::uint64_t>(left.count());
+        perform->milliseconds = static_cast<std::uint64_t>(std::max<std::int64_t>(left.count(), 0));
     }
     // Kept for a change, which may have to be sent again.
     const auto frame = protocol::frameOf(operation.changes ? operation.order : std::exchange(operation.order, {}));

@@ -106,9 +106,15 @@ void RequestLog::add(std::shared_ptr<RequestRecord> record) {
     for (const auto& one : _records) {
         bytes += one->reportBytes();
     }
-    while (_records.size() > length || bytes > reportBytesMaximum) {
-        bytes -= _records.front()->reportBytes();
-        _records.pop_front();
+    // A request that waits or runs is never forgotten: a client that lost its connection asks what becomes of it.
+    for (auto one = _records.begin();
+         one != _records.end() && (_records.size() > length || bytes > reportBytesMaximum);) {
+        if ((*one)->state == RequestRecord::State::done) {
+            bytes -= (*one)->reportBytes();
+            one = _records.erase(one);
+        } else {
+            ++one;
+        }
     }
 }
 

@@ -76,7 +76,8 @@ class RequestLog {
 
     /// A record that is not added to the log.
     [[nodiscard]] static std::shared_ptr<RequestRecord> begin(const Exchange& exchange);
-    /// Adds a record. The oldest one is dropped, and more of them if their reports use too much memory.
+    /// Adds a record. Beyond the length, or if all reports together use too much memory, the oldest requests that have
+    /// ended are dropped.
     std::shared_ptr<RequestRecord> add(const Exchange& exchange);
     void add(std::shared_ptr<RequestRecord> record);
     /// Finds a record by its id; upper and lower case are equal.

@@ -150,10 +150,7 @@ Response LumioRequestHandler::writeSettingsWithRequest(const Dictionary& request
     const std::int32_t status = writeSettingsFiles(config, result);
 
     // Resources are changed whether or not the settings files were written.
-    if (setWorkflowACLWithRequest(config.get("workflows").array()).kind() == Response::Kind::error &&
-        config.contains("workflows")) {
-        reportSettingNotDone("workflows", "This release does not change workflows.");
-    }
+    setWorkflowACLWithRequest(config.get("workflows").array());
     processCameraChangesWithRequest(config.get("cameras").array());
     processPropertyChangesWithRequest(config.get("properties").array());
     for (const std::string_view key : resourceKeys) {

@@ -2,10 +2,12 @@
 
 #include "platform/files/Path.h"
 #include "platform/task/Task.h"
+#include "platform/task/TaskBounds.h"
 #include "settings/SettingsStore.h"
 
 #include <array>
 #include <cerrno>
+#include <chrono>
 #include <csignal>
 #include <cstring>
 #include <string_view>
@@ -44,8 +46,8 @@ constexpr const char* expected =
 
 /// Returns true if a failed run is more likely due to the state of the machine at this moment than to the tool.
 bool isPassing(std::int32_t status, std::string_view error) {
-    if (status == diedBySignal + SIGKILL) {
-        return true;  // at the deadline, or because memory ran out
+    if (status == diedBySignal + SIGKILL || std::chrono::steady_clock::now() >= adminhost::taskDeadline()) {
+        return true;  // at the deadline, not started because of it, or because memory ran out
     }
     for (const int number : {EAGAIN, ENOMEM, EMFILE, ENFILE, ETXTBSY, EINTR}) {
         if (error.find(std::strerror(number)) != std::string_view::npos) {
@@ -71,12 +73,15 @@ std::string DatabaseTool::homeOfAccount() {
 
 Probe DatabaseTool::probe() {
     const adminhost::HostPath tool("/usr/bin/sqlite3");
+    if (!SettingsStore::dbPathExists()) {
+        return {};
+    }
     const std::string startFile = _home + "/.sqliterc";
     if (::access(startFile.c_str(), F_OK) == 0) {
         return {Probe::State::unusable, startFile + " can change what " + tool.text() + " prints",
                 "remove the file, or move it away"};
     }
-    if (_usable || !SettingsStore::dbPathExists()) {
+    if (_usable) {
         return {};
     }
     std::string output;

@@ -43,25 +43,11 @@ struct ChildSide {
     pid_t parent;
 };
 
-/// Runs from the birth of the child to the start of its program. No allocation, no lock, no C++ library: the child uses
-/// our memory. Not instrumented, because the sanitizer would record this stack as ours.
-class [[gnu::visibility("hidden")]] ChildProcess{public : [[gnu::no_sanitize("address", "undefined")]] static int run(
-    void* argument){const auto* side = static_cast<const ChildSide*>(argument);
-if (prepare(*side)) {
-    ::execve(side->program, side->arguments, side->environment);
-}
-const int number = errno;
-[[maybe_unused]] const ssize_t written = ::write(side->failure, &number, sizeof number);
-::_exit(127);
-}  // namespace
-
-private:
-[[gnu::no_sanitize("address", "undefined")]] static bool prepare(const ChildSide& side) {
-    return ::syscall(SYS_setpgid, 0, 0) == 0 && enter(side) && place(side) && drop(side) && signals();
-}
+// From the birth of the child to the start of its program: no allocation, no lock, no C++ library, because the child
+// uses our memory. Not instrumented, because the sanitizer would record this stack as ours.
 
 /// Registers the child. Until that is done it must not outlive its parent: no process would know of it.
-[[gnu::no_sanitize("address", "undefined")]] static bool enter(const ChildSide& side) {
+[[gnu::no_sanitize("address", "undefined")]] bool enter(const ChildSide& side) {
     if (side.registration == nullptr) {
         return true;
     }
@@ -73,13 +59,13 @@ private:
 }
 
 /// The descriptors, the directory and the umask. The sources are all above the numbers that they go to.
-[[gnu::no_sanitize("address", "undefined")]] static bool place(const ChildSide& side) {
+[[gnu::no_sanitize("address", "undefined")]] bool place(const ChildSide& side) {
     for (int number = 0; number < side.descriptorCount; ++number) {
         int source = side.descriptors[number];
         if (source < 0) {
-            source = ::open("/dev/null", O_RDWR);
+            source = static_cast<int>(::syscall(SYS_openat, AT_FDCWD, "/dev/null", O_RDWR, 0));
         }
-        if (source < 0 || (source != number && ::dup2(source, number) < 0)) {
+        if (source < 0 || (source != number && ::syscall(SYS_dup3, source, number, 0) < 0)) {
             return false;
         }
     }
@@ -92,13 +78,13 @@ private:
         return false;
     }
     if (side.fileModeMask != nullptr) {
-        ::umask(*side.fileModeMask);
+        ::syscall(SYS_umask, *side.fileModeMask);
     }
-    return side.directory == nullptr || ::chdir(side.directory) == 0;
+    return side.directory == nullptr || ::syscall(SYS_chdir, side.directory) == 0;
 }
 
 /// By raw calls: those of the C library would change every thread of ours.
-[[gnu::no_sanitize("address", "undefined")]] static bool drop(const ChildSide& side) {
+[[gnu::no_sanitize("address", "undefined")]] bool drop(const ChildSide& side) {
     if (side.rights == nullptr) {
         return true;
     }
@@ -109,7 +95,7 @@ private:
 }
 
 /// Last, so that no handler of ours runs in the child: every signal has been blocked so far.
-[[gnu::no_sanitize("address", "undefined")]] static bool signals() {
+[[gnu::no_sanitize("address", "undefined")]] bool signals() {
     const unsigned long standard[8] = {};  // at least the kernel's struct sigaction: default action, no flags
     for (int number = 1; number < NSIG; ++number) {
         ::syscall(SYS_rt_sigaction, number, standard, nullptr, sizeof(KernelSignals));  // two may not be changed
@@ -117,7 +103,21 @@ private:
     const KernelSignals none = 0;
     return ::syscall(SYS_rt_sigprocmask, SIG_SETMASK, &none, nullptr, sizeof none) == 0;
 }
-};  // namespace adminhost
+
+[[gnu::no_sanitize("address", "undefined")]] bool prepare(const ChildSide& side) {
+    return ::syscall(SYS_setpgid, 0, 0) == 0 && enter(side) && place(side) && drop(side) && signals();
+}
+
+[[gnu::no_sanitize("address", "undefined")]] int runChild(void* argument) {
+    const auto* side = static_cast<const ChildSide*>(argument);
+    if (prepare(*side)) {
+        ::syscall(SYS_execve, side->program, side->arguments, side->environment);
+    }
+    const int number = errno;
+    [[maybe_unused]] const long written = ::syscall(SYS_write, side->failure, &number, sizeof number);
+    ::syscall(SYS_exit_group, 127);
+    __builtin_unreachable();
+}
 
 /// Blocks every signal, also those of the C library.
 class WithoutSignals {
@@ -177,7 +177,7 @@ void discard(pid_t pid) noexcept {
 pid_t cloneChild(ChildSide& side) noexcept {
     alignas(16) std::array<std::byte, 32768> stack;  // the child's until it executes its program
     const WithoutSignals guard;
-    return ::clone(&ChildProcess::run, stack.data() + stack.size(), CLONE_VM | CLONE_VFORK | SIGCHLD, &side);
+    return ::clone(&runChild, stack.data() + stack.size(), CLONE_VM | CLONE_VFORK | SIGCHLD, &side);
 }
 
 }  // namespace

@@ -146,8 +146,8 @@ TEST_F(PluginLoading, PluginOfAnotherReleaseIsLoadedIfItsInterfaceIsTheSame) {
 }
 
 TEST_F(PluginLoading, TruncatedFileIsRefusedBeforeItRuns) {
-    const auto whole = fs::file_size(pluginFile("fixture_good"));
-    const ProgramResult result = check({"--plugin", cut(whole / 2), "--plugin", pluginFile("fixture_throwing")});
+    // The first pages hold the note; the code comes after them.
+    const ProgramResult result = check({"--plugin", cut(8192), "--plugin", pluginFile("fixture_throwing")});
     EXPECT_THAT(result.output, HasSubstr("cut.so is truncated; install it again\n"));
 }
 

@@ -41,6 +41,7 @@ TEST(RequestRecord, LargeReportsAreCountedOnlyBeyondTheirBound) {
 std::shared_ptr<RequestRecord> recordNamed(const std::string& id) {
     auto record = std::make_shared<RequestRecord>();
     record->id = id;
+    record->state = RequestRecord::State::done;
     return record;
 }
 
@@ -67,6 +68,25 @@ TEST(RequestLog, ForgetsTheOldestWhenTheReportsOfAllTakeTooMuchMemory) {
     EXPECT_EQ(log.find("0"), nullptr);
     EXPECT_NE(log.find("29"), nullptr);
     EXPECT_NE(log.find("last"), nullptr);
+}
+
+TEST(RequestLog, RequestsThatWaitOrRunAreNeverForgotten) {
+    RequestLog log;
+    auto running = recordNamed("running");
+    running->state = RequestRecord::State::running;
+    auto waiting = recordNamed("waiting");
+    waiting->state = RequestRecord::State::waiting;
+    log.add(running);
+    log.add(waiting);
+    for (std::size_t i = 0; i <= RequestLog::length; ++i) {
+        log.add(recordNamed(std::to_string(i)));
+    }
+    EXPECT_NE(log.find("running"), nullptr);
+    EXPECT_NE(log.find("waiting"), nullptr);
+    EXPECT_EQ(log.find("0"), nullptr);
+    running->state = RequestRecord::State::done;
+    log.add(recordNamed("next"));
+    EXPECT_EQ(log.find("running"), nullptr);
 }
 
 TEST(RequestLog, IdIsUsedOnceInAnyCase) {

@@ -65,6 +65,19 @@ TEST_F(DatabaseToolTest, WithoutADatabaseFileTheToolIsNotTriedAndItIsOnceThereIs
     EXPECT_EQ(runs(), 1U);
 }
 
+TEST_F(DatabaseToolTest, WithoutADatabaseFileAStartFileRefusesNothing) {
+    std::filesystem::remove(root.path("/Library/SorvaneProducer/Shared/Server/db.sqlite3"));
+    root.write("/home/.sqliterc", ".nullvalue x\n");
+    EXPECT_EQ(tool.probe().state, State::usable);
+}
+
+TEST_F(DatabaseToolTest, ToolThatIsNotStartedBecauseTheTimeIsOverIsUnknown) {
+    adminhost::setTaskDeadline(std::chrono::steady_clock::now() - std::chrono::seconds(1));
+    EXPECT_EQ(tool.probe().state, State::unknown);
+    adminhost::setTaskDeadline(std::nullopt);
+    EXPECT_EQ(tool.probe().state, State::usable);
+}
+
 TEST_F(DatabaseToolTest, MissingToolIsUnusableUntilItIsInstalled) {
     std::filesystem::remove(root.path("/usr/bin/sqlite3"));
     const Probe probe = tool.probe();
