@@ -44,7 +44,7 @@ class Descriptor {
     int _number;
 };
 
-/// Starts the program with nothing to read and its output in the file.
+/// Starts the program with empty input and its output in the file.
 pid_t spawn(const std::vector<std::string>& arguments, const std::filesystem::path& output) {
     std::vector<char*> argv;
     argv.reserve(arguments.size() + 1);

@@ -1,6 +1,6 @@
 #pragma once
 
-// Runs a program of the test's own environment to its end, without a shell. Independent of what is tested.
+// Runs a program of the test's own environment to its end, without a shell. Independent of the code under test.
 
 #include <optional>
 #include <string>
@@ -17,7 +17,7 @@ struct ProgramResult {
 enum class Errors { pass, merge };  ///< standard error: to the test's own, or into the output
 
 /// command[0] is looked up in PATH unless it has a slash. Standard input is the input, or the test's own without one.
-/// Waits for the end of the output as well as the program's. Throws std::runtime_error when it cannot be started.
+/// Waits for the end of both the program and its output. Throws std::runtime_error if it cannot be started.
 [[nodiscard]] ProgramResult runProgram(const std::vector<std::string>& command, Errors errors = Errors::pass,
                                        std::optional<std::string_view> input = std::nullopt);
 

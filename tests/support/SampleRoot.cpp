@@ -73,7 +73,7 @@ SampleRoot::~SampleRoot() {
             run({disk("/usr/sbin/lumioctl"), "server", "stop"});
         }
     } catch (const std::exception&) {
-        // The daemon ends by itself when its pid file goes with the directory.
+        // The daemon ends by itself when its pid file is removed with the directory.
     }
     fs::remove_all(_base, ignored);
 }

@@ -1,9 +1,9 @@
 #pragma once
 
-// A root directory of the sample service for one test: made by demo/make-root in a temporary directory of its own
-// (below TMPDIR), removed with it; the daemons that its stand-ins left are ended first.
+// A root directory of the sample service for one test, created by demo/make-root in a temporary directory of its own
+// (below TMPDIR). The destructor ends the daemons that the stand-ins left behind and removes the directory.
 //
-// What goes wrong while preparing throws std::runtime_error: the test then fails with its text.
+// A failure to prepare it throws std::runtime_error, and the test fails with its text.
 
 #include "platform/files/Path.h"
 
@@ -14,7 +14,7 @@
 
 namespace adminhost::test {
 
-/// Sizes of the sample library; what is not set has the library's own believable content.
+/// Sizes of the sample library; without a size, the library has its usual content.
 struct SampleSizes {
     std::optional<int> cameras;
     std::optional<int> workflows;
@@ -45,7 +45,7 @@ class SampleRoot {
         return _base;
     }  ///< holds the root: room for a test's own files
 
-    /// Where a host path ("/var/lumio/server") lies on the disk. Independent of the process's system root.
+    /// The disk path of a host path ("/var/lumio/server"). Independent of the process's system root.
     [[nodiscard]] std::string disk(const std::string& hostPath) const { return _path + hostPath; }
 
     [[nodiscard]] std::string databasePath() const;             ///< disk path
@@ -54,23 +54,23 @@ class SampleRoot {
     [[nodiscard]] std::string clusterPreferencesPath() const;   ///< disk path
     [[nodiscard]] std::string identityPreferencesPath() const;  ///< disk path
 
-    /// Runs SQL through the real sqlite3 tool; answers its output in list mode ("a|b" lines). Throws when the tool
+    /// Runs SQL through the real sqlite3 tool and returns its output in list mode ("a|b" lines). Throws if the tool
     /// fails.
     std::string sql(const std::string& statements) const;
 
-    /// A file's whole content; throws when it cannot be read.
+    /// A file's whole content; throws if it cannot be read.
     [[nodiscard]] std::string read(const std::string& hostPath) const;
     /// Writes a file, with its directories. A link there (the SQL tool's) is replaced, never followed.
     void write(const std::string& hostPath, const std::string& content) const;
-    void remove(const std::string& hostPath) const;  ///< a file or a whole directory; nothing if it is not there
+    void remove(const std::string& hostPath) const;  ///< a file or a whole directory; may be missing
 
-    /// Makes a stand-in behave: its switch, for example ("lumioctl.exit", "3"). See demo/README.md.
+    /// Sets a switch of a stand-in, for example ("lumioctl.exit", "3"). See demo/README.md.
     void setSwitch(const std::string& name, const std::string& content) const;
     void clearSwitches() const;
-    /// The process that a "NAME.daemon" switch left behind: its id while it lives, else nothing.
+    /// The id of the process that a "NAME.daemon" switch left behind; nullopt if it is not running.
     [[nodiscard]] std::optional<int> daemonLeftBy(const std::string& switchName) const;
 
-    /// From now on the stand-ins record their calls; recorded ones are forgotten.
+    /// The stand-ins record their calls from now on. Earlier records are removed.
     void recordToolCalls() const;
     [[nodiscard]] std::vector<ToolCall> toolCalls() const;  ///< in their order
 

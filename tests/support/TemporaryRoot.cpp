@@ -39,7 +39,7 @@ fs::path TemporaryRoot::path(std::string_view hostPath) const {
 
 void TemporaryRoot::write(std::string_view hostPath, std::string_view text) const {
     fs::create_directories(path(hostPath).parent_path());
-    fs::remove(path(hostPath));  // a link there leads out of the root, to this machine's own tool
+    fs::remove(path(hostPath));  // a link may point out of the root, to this machine's tool
     std::ofstream file(path(hostPath), std::ios::binary);
     file << text;
     if (!file.flush()) {

@@ -1,7 +1,7 @@
 #pragma once
 
-// A system root of the test's own: an empty directory below the test's temporary directory, set as the process's system
-// root and removed at the end, with the real sqlite3 tool at its place; and the log lines that the test causes.
+// A system root for one test: a directory below the test's temporary directory that contains only the real sqlite3 tool
+// at its usual path. It is the process's system root and is removed at the end. It also has the log lines of the test.
 
 #include "tests/support/CapturedLog.h"
 
@@ -19,16 +19,16 @@ class TemporaryRoot {
     TemporaryRoot& operator=(const TemporaryRoot&) = delete;
     ~TemporaryRoot();
 
-    /// Where a host path lies.
+    /// The disk path of a host path.
     [[nodiscard]] std::filesystem::path path(std::string_view hostPath) const;
-    /// Writes a file, making its directories.
+    /// Writes a file and creates its directories.
     void write(std::string_view hostPath, std::string_view text) const;
     /// As write, with the mode 0755.
     void writeTool(std::string_view hostPath, std::string_view text) const;
-    /// A property list whose top-level dictionary has this content, in the format's own elements.
+    /// Writes a property list whose top-level dictionary has this content, as XML elements.
     void writePropertyList(std::string_view hostPath, std::string_view dictionaryContent) const;
     [[nodiscard]] std::string read(std::string_view hostPath) const;
-    /// Runs statements on a database with the real tool and answers its output; a failure throws.
+    /// Runs statements on a database with the real tool and returns its output. Throws on failure.
     std::string sql(std::string_view database, const std::string& statements) const;
 
   private:

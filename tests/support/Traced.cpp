@@ -30,7 +30,7 @@ std::int32_t runTraced(const std::vector<std::string>& options, const std::strin
     std::vector<std::string> arguments{"-o", log};
     arguments.insert(arguments.end(), options.begin(), options.end());
     arguments.insert(arguments.end(), command.begin(), command.end());
-    // A traced process cannot look for leaks.
+    // A traced process cannot search for leaks.
     return launch_task_with_input_and_environment(DiskPath("/usr/bin/strace"), arguments, std::nullopt, nullptr,
                                                   &errors, {{"ASAN_OPTIONS", "detect_leaks=0"}});
 }

@@ -1,7 +1,7 @@
 #pragma once
 
-// A small HTTP/1.1 client on a Unix socket for tests, one connection an object. It also sends what no proper client
-// would. Everything waits ten seconds at most (or the given time) and then throws std::runtime_error.
+// A small HTTP/1.1 client on a Unix socket for tests, with one connection per object. It can also send malformed
+// requests. Everything waits ten seconds at most (or the given time) and then throws std::runtime_error.
 
 #include <chrono>
 #include <map>
@@ -41,7 +41,7 @@ class UnixHttp {
                const Headers& headers = {});
     void send(std::string_view bytes);
     HttpReply reply(bool headOnly = false);
-    /// Whether the server has closed the connection, waiting for it so long.
+    /// Returns true if the server closes the connection within this time.
     bool closedWithin(std::chrono::milliseconds time);
     void close();
 

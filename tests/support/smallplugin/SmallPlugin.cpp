@@ -1,5 +1,5 @@
-// A second plug-in, as small as one can be: the host knows nothing that is not said here. It keeps its settings in a
-// file of its own format ("KEY VALUE" lines) and has no database.
+// A second plug-in, as small as possible. It shows that the host needs no knowledge of a plug-in beyond its interface.
+// It stores its settings in a file of its own format ("KEY VALUE" lines) and has no database.
 
 #include "platform/files/Path.h"
 #include "platform/framework/Plugin.h"

@@ -1,4 +1,4 @@
-// Preloaded into test programs that run below valgrind: what starting a child needs and valgrind 3.19 does not have.
+// Preloaded into test programs that run below valgrind: calls for starting a child that valgrind 3.19 does not support.
 // - pidfd_open(2): returns a descriptor that becomes readable when the child has exited, and does not reap the child.
 // - execve(2) that fails with E2BIG. Valgrind checks the program's file itself, and ends the child when the call fails
 //   for another reason.
@@ -28,7 +28,7 @@ int readableAfterExitOf(pid_t child) noexcept {
             siginfo_t ignored{};
             while (::waitid(P_PID, static_cast<id_t>(child), &ignored, WEXITED | WNOWAIT) != 0 && errno == EINTR) {
             }
-            ::close(end);  // poll tells the other end of it
+            ::close(end);  // poll reports it at the other end
         }).detach();
     } catch (const std::system_error& failure) {
         ::close(pipe[0]);
@@ -63,7 +63,7 @@ extern "C" long syscall(long number, ...) noexcept {
     va_list list;
     va_start(list, number);
     for (long& argument : arguments) {
-        argument = va_arg(list, long);  // as the real one does, which does not know either how many there are
+        argument = va_arg(list, long);  // like the real one, which does not know their number either
     }
     va_end(list);
     if (number == SYS_pidfd_open) {

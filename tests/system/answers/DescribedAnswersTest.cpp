@@ -12,7 +12,7 @@
 namespace adminhost {
 namespace {
 
-/// The keys of an answer by their paths, each with the types that it was seen with: "configuration.cameras[].name".
+/// The keys of an answer by their paths ("configuration.cameras[].name"), each with the types of its values.
 using Seen = std::map<std::string, std::set<Value::Type>>;
 
 void collect(const Value& value, const std::string& path, Seen& seen) {
@@ -30,7 +30,7 @@ void collect(const Value& value, const std::string& path, Seen& seen) {
     }
 }
 
-/// Whether a value of this type may stand where an answer's description names that one.
+/// Returns true if a value of this type fits the type in an answer's description.
 bool fits(Value::Type type, const std::string& described) {
     using T = Value::Type;
     static const std::map<std::string, std::set<T>> types{
@@ -57,7 +57,7 @@ class DescribedAnswers : public testing::Test {
     }
     [[nodiscard]] static Value valueOf(const test::HttpReply& reply) {
         if (reply.body.empty()) {
-            return {};  // an answer of nothing
+            return {};  // the command returns no answer
         }
         const auto value = parseJson(reply.body);
         EXPECT_TRUE(value) << reply.body;
@@ -68,7 +68,7 @@ class DescribedAnswers : public testing::Test {
         const std::string* text = dictionary == nullptr ? nullptr : dictionary->get(key).string();
         return text == nullptr ? std::string() : *text;
     }
-    /// The answer, unless this release does not serve the command.
+    /// The answer; nullopt if this release does not serve the command.
     [[nodiscard]] std::optional<Value> answerOf(const std::string& command, const std::string& request) const {
         const Value answer = valueOf(daemon.connect().post("/v1/lumio/" + command, request));
         return textAt(answer, "error") == "NOT_AVAILABLE" ? std::nullopt : std::optional(answer);

@@ -17,7 +17,7 @@ using testing::Not;
 
 class Apply : public ControlledService {
   protected:
-    /// The exported file with each text replaced; answers its path.
+    /// Exports a file, replaces each text and returns the file's path.
     [[nodiscard]] std::string changed(const std::vector<std::pair<std::string, std::string>>& replacements) const {
         std::string text = ctl({"export"}).output;
         for (const auto& [from, to] : replacements) {
@@ -27,7 +27,7 @@ class Apply : public ControlledService {
         }
         return file("desired.toml", text);
     }
-    /// What a file with this text is refused with; nothing may be sent.
+    /// The message with which a file with this text is rejected. Nothing may be sent.
     [[nodiscard]] std::string refusal(const std::string& text) const {
         const ProgramResult apply = ctl({"apply", file("bad.toml", text)});
         EXPECT_EQ(apply.status, 2) << apply.output;

@@ -101,7 +101,7 @@ TEST_F(ChangeVerbs, ProtectedPropertyIsEncryptedOnceAndItsValueNeverShown) {
     EXPECT_EQ(ctl({"property", "set", "token", "other"}).status, 2) << "a secret on the command line";
     EXPECT_EQ(ctl({"property", "set", "token", "--protect", "@" + file("token", "second")}).output,
               "properties.token.value: (secret) -> (secret)\n");
-    // Plain again: what comes out shows that it was encrypted once.
+    // Remove the protection: the plain text shows that it was encrypted only once.
     EXPECT_EQ(ctl({"property", "set", "token", "--no-protect"}).output, "properties.token.protect: true -> false\n");
     EXPECT_EQ(root.sql(row), "second|f\n");
     EXPECT_EQ(ctl({"property", "set", "token", "--protect"}).output, "properties.token.protect: false -> true\n");

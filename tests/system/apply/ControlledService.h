@@ -1,6 +1,6 @@
 #pragma once
 
-// The sample service with this build's daemon and plug-in, asked through this build's command line.
+// The sample service with this build's daemon and plug-in, used through this build's command line.
 
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Program.h"
@@ -32,7 +32,7 @@ class ControlledService : public testing::Test {
         words.insert(words.begin(), {std::string(BINARY_DIR) + "/bin/adminhostctl", "--socket", daemon.socket()});
         return runProgram(words, Errors::merge);
     }
-    /// A file of the test's own; answers its path.
+    /// Writes a file for the test and returns its path.
     [[nodiscard]] std::string file(const std::string& name, const std::string& content) const {
         const std::string path = root.directory() + '/' + name;
         std::ofstream(path) << content;

@@ -1,4 +1,4 @@
-// Writes whose answer never comes: what was written is determined and reported, and nothing is written a second time.
+// Writes whose answer is lost: the outcome is determined and reported, and nothing is written a second time.
 
 #include "tests/system/apply/ControlledService.h"
 
@@ -17,7 +17,7 @@ using testing::AllOf;
 using testing::HasSubstr;
 using testing::Not;
 
-/// A command line that runs beside the test; output and messages together.
+/// A command line that is running in the background; output and messages together.
 class RunningCtl {
   public:
     RunningCtl(const std::string& socket, const std::vector<std::string>& words) {
@@ -46,7 +46,7 @@ class RunningCtl {
     RunningCtl& operator=(const RunningCtl&) = delete;
 
     void signal(int number) const { ::kill(_pid, number); }
-    /// Its whole output and its status; 128 + number after a death by signal.
+    /// Its whole output and its status; 128 + number if a signal ended it.
     ProgramResult wait() {
         ProgramResult result;
         std::array<char, 4096> bytes{};
@@ -67,7 +67,7 @@ class RunningCtl {
 class LostAnswers : public ControlledService {
   protected:
     explicit LostAnswers(const std::string& configuration = {}) : ControlledService(configuration) {}
-    /// Waits until the daemon runs a write.
+    /// Waits until a write is running in the daemon.
     void waitForWrite() const {
         for (int i = 0; i < 1000; ++i) {
             if (daemon.connect().get("/v1/").body.find("writeSettings\",\"since") != std::string::npos ||

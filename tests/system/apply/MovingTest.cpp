@@ -1,4 +1,4 @@
-// A change of the place of the settings files: one apply settles what the plan shows.
+// A change of the path of the settings files: one apply carries out everything that the plan shows.
 
 #include "platform/json/Json.h"
 #include "tests/system/apply/ControlledService.h"
@@ -19,7 +19,7 @@ class Moving : public ControlledService {
         ASSERT_NE(at, 0U) << key;
         _text.replace(at, _text.find('\n', at) - at, key + " = " + value);
     }
-    /// Applies the file; the second time nothing differs, and the exported state is the file.
+    /// Applies the file twice: the second time nothing differs, and the exported state equals the file.
     void settlesAtOnce() {
         const std::string desired = file("desired.toml", _text);
         const ProgramResult plan = ctl({"plan", desired});

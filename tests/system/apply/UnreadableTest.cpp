@@ -1,4 +1,4 @@
-// A state that cannot be read in full is never written down as if the rest did not exist.
+// A state that cannot be read completely is never exported as if the rest did not exist.
 
 #include "tests/system/apply/ControlledService.h"
 
