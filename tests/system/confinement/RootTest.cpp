@@ -33,16 +33,16 @@ constexpr const char* allow =
     "kernel.apparmor_restrict_unprivileged_userns=0, in a container --security-opt seccomp=unconfined or --cap-add "
     "SYS_ADMIN)";
 
-/// The directory in which everything that may change lies, created and removed outside the namespace.
+/// The directory of everything that may change, created and removed outside the namespace.
 fs::path writable;
-/// Why there is no namespace.
+/// The reason why the namespace could not be created.
 std::string problem;
 
 std::string failed(const char* step) {
     return std::string(step) + ": " + std::strerror(errno) + allow;
 }
 
-/// Moves this process into namespaces of its own. Returns what failed, empty if nothing did.
+/// Moves this process into namespaces of its own. Returns the name of the failed step; empty on success.
 std::string enterReadOnlyNamespace() {
     const std::string uid = "0 " + std::to_string(::geteuid()) + " 1";
     const std::string gid = "0 " + std::to_string(::getegid()) + " 1";

@@ -1,5 +1,5 @@
-// The command line against the daemon of this build: with the service's plug-in on a sample root, and with a plug-in
-// that answers what a test asks for.
+// The command line with the daemon of this build: with the service's plug-in on a sample root, and with a plug-in that
+// returns the answers that a test chooses.
 
 #include "platform/json/Json.h"
 #include "platform/task/Task.h"
@@ -257,7 +257,7 @@ TEST(CtlReach, HelpOfTheVerbsNeedsNoDaemon) {
 TEST(CtlReach, WhoMayNotUseTheDaemonGetsStatusFour) {
     const DaemonProcess daemon(withPlugins({"tests/plugins/fixture_described.so"}));
     if (::geteuid() == 0) {
-        // Let another account reach the socket: then it is the daemon that says no. The program runs inside the
+        // Let another account reach the socket, so that the daemon refuses it. The program runs inside the
         // directory, from a copy: the directories above that one and above the build may be closed to others.
         std::filesystem::copy_file(program, daemon.directory() / "adminhostctl");
         const std::vector<std::string> words = {"-C",

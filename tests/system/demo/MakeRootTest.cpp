@@ -17,7 +17,7 @@ using adminhost::test::SampleSizes;
 using testing::HasSubstr;
 namespace fs = std::filesystem;
 
-// What Python's own property-list reader, an independent one, says of a file: the text form of the value.
+// The text form of a file's value as read by Python's own property-list reader, which is independent of ours.
 std::string plistText(const SampleRoot& root, const std::string& hostPath) {
     const ProgramResult result = runProgram(
         {"/usr/bin/python3", "-S", "-c", "import plistlib, sys; print(plistlib.load(open(sys.argv[1], 'rb')), end='')",

@@ -1,4 +1,4 @@
-// What each address answers.
+// The answers of each address.
 
 #include "tests/system/host/Host.h"
 

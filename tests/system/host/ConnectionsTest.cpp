@@ -109,7 +109,7 @@ TEST(Connections, OneAccountCannotHoldAllOfThem) {
 }
 
 TEST(Connections, ShortOfDescriptorsTheDaemonWaitsInsteadOfSpinning) {
-    // Where the bound begins to hurt depends on what the daemon itself needs: some of these do not let it start.
+    // The critical number depends on what the daemon itself needs: with some of these it cannot start.
     for (const unsigned descriptors : {8U, 9U, 10U, 12U, 14U, 16U}) {
         auto options = withDescriptors(descriptors);
         options.waitUntilReady = false;
@@ -125,7 +125,7 @@ TEST(Connections, ShortOfDescriptorsTheDaemonWaitsInsteadOfSpinning) {
                     clients.back().send("GET /v1/ HTTP/1.1\r\n");
                 }
             } catch (const std::runtime_error&) {
-                // It may have ended meanwhile.
+                // It may have ended in the meantime.
             }
         }
         if (daemon.wait(std::chrono::milliseconds(500))) {
@@ -141,7 +141,7 @@ TEST(Connections, ShortOfDescriptorsTheDaemonWaitsInsteadOfSpinning) {
 
 TEST(Connections, TwelveClientsThatDoNotReadCostOneFormOfTheirAnswersAndItIsReturned) {
     auto options = withFixture();
-    options.environment = {"ASAN_OPTIONS=quarantine_size_mb=1"};  // else a sanitizer keeps what was given back
+    options.environment = {"ASAN_OPTIONS=quarantine_size_mb=1"};  // otherwise a sanitizer keeps freed memory
     const DaemonProcess daemon(options);
     const std::string body = largeBody();
     const std::size_t before = residentKilobytesOf(daemon.pid());
@@ -193,7 +193,7 @@ TEST(Connections, LogIntoAPipeThatNobodyReadsKeepsNobodyWaiting) {
         ASSERT_EQ(client.post("/v1/fixture/nothing").status, 204) << i;
     }
     ASSERT_EQ(client.post("/v1/fixture/flood", R"({"lines": 40, "bytes": 100000})").status, 204);
-    // Read again, the log goes on, and says what it lacks.
+    // When the log is read again, it continues and reports how many events are missing.
     std::string text;
     EXPECT_TRUE(eventually([&] {
         char buffer[64 << 10];

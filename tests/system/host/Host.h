@@ -1,6 +1,6 @@
 #pragma once
 
-// What the daemon's tests share: a daemon with the fixture plug-in.
+// Common code of the daemon's tests: a daemon with the fixture plug-in.
 
 #include "platform/json/Json.h"
 #include "tests/support/DaemonProcess.h"
@@ -45,7 +45,7 @@ inline void expectError(const HttpReply& reply, int status, std::string_view cod
     EXPECT_TRUE(reply.headers.contains("request-id"));
 }
 
-/// Whether the condition comes true within ten seconds.
+/// Returns true if the condition becomes true within ten seconds.
 inline bool eventually(const std::function<bool()>& condition) {
     for (int i = 0; i < 2000; ++i) {
         if (condition()) {

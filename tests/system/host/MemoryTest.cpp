@@ -1,4 +1,4 @@
-// What requests and answers leave in the memory of front and worker.
+// Front and worker keep no passwords of requests and answers in their memory.
 
 #include "tests/system/host/Host.h"
 
@@ -11,7 +11,7 @@
 namespace adminhost::test {
 namespace {
 
-/// Where a text is in the writable memory of a process; empty if it is nowhere. Only root may look.
+/// The places of a text in the writable memory of a process; empty if it is not found. Only root may read that memory.
 std::vector<std::string> placesOf(const std::string& text, pid_t pid) {
     std::vector<std::string> places;
     const std::string process = "/proc/" + std::to_string(pid);
@@ -45,7 +45,7 @@ std::vector<std::string> placesOf(const std::string& text, pid_t pid) {
     return places;
 }
 
-// Sanitizers keep freed memory as it was, to find out who still uses it.
+// Sanitizers keep freed memory unchanged, to detect later uses of it.
 #ifndef ADMINHOST_SANITIZED
 
 class MemoryAfterAnAnswer : public ::testing::Test {
@@ -53,7 +53,7 @@ class MemoryAfterAnAnswer : public ::testing::Test {
     void expectNothingLeft() {
         client.close();
         for (const pid_t pid : {daemon.pid(), daemon.workerPid()}) {
-            // The answer is there before the worker has freed it, and the connection's end is noticed in its turn.
+            // The answer arrives before the worker has freed it, and the end of the connection is noticed later.
             EXPECT_TRUE(eventually([&] { return placesOf(secret, pid).empty(); }))
                 << (pid == daemon.pid() ? "the front" : "the worker") << testing::PrintToString(placesOf(secret, pid));
         }
@@ -121,7 +121,7 @@ TEST_F(MemoryAfterAnAnswer, HoldsNoTextOfARequestWhoseWorkerDied) {
 
 #endif
 
-/// Whether the text is found at all: else the tests above prove nothing.
+/// Shows that the search can find the text; otherwise the tests above would prove nothing.
 TEST(MemoryOfARunningRequest, HoldsItsText) {
     const std::string secret = "A-password-longer-than-a-short-string-" + std::to_string(::getpid());
     DaemonProcess daemon(withFixture());

@@ -1,4 +1,4 @@
-// Which plug-in files are loaded, and what the log and --check report of the others.
+// Which plug-in files are loaded, and what the log and --check report about the others.
 
 #include "adminhostd/PluginFile.h"
 #include "tests/support/Program.h"
@@ -68,7 +68,7 @@ class PluginLoading : public ::testing::Test {
         arguments.insert(arguments.end(), plugins.begin(), plugins.end());
         return runProgram(arguments, Errors::merge);
     }
-    /// A copy of the good plug-in with only so many of its bytes.
+    /// A copy of the good plug-in, cut to so many bytes.
     std::string cut(std::uintmax_t size) const {
         const fs::path file = directory / "cut.so";
         fs::copy_file(pluginFile("fixture_good"), file, fs::copy_options::overwrite_existing);

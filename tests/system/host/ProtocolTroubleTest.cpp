@@ -1,4 +1,4 @@
-// Workers that do not keep to the protocol: each is ended, its request fails, and the next worker serves on.
+// Workers that break the protocol: each is killed, its request fails, and the next worker serves the others.
 
 #include "adminhostd/Protocol.h"
 #include "tests/system/host/Host.h"

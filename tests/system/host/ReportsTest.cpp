@@ -1,4 +1,4 @@
-// What an operation reports while it runs, and ids that clients choose.
+// Reports of an operation while it is running, and ids that clients choose.
 
 #include "tests/system/host/Host.h"
 

@@ -81,7 +81,7 @@ TEST_F(Start, SocketIsForOwnerAndGroupOnly) {
 TEST_F(Start, SocketGetsTheConfiguredGroup) {
     gid_t groups[256];
     const int count = ::getgroups(256, groups);
-    // Root may give it any group, a plain account one of its own.
+    // Root may set any group, an unprivileged account one of its own.
     const gid_t wanted = ::geteuid() == 0 ? 65534 : count > 0 ? groups[count - 1] : ::getegid();
     const group* entry = ::getgrgid(wanted);
     ASSERT_NE(entry, nullptr);
@@ -430,7 +430,7 @@ TEST_F(Start, ConfigurationThatIsADirectoryIsAnError) {
 
 TEST_F(Start, WhatTheParentLeftOpenReachesNoTool) {
     int ends[2];
-    ASSERT_EQ(::pipe(ends), 0);  // inherited by whatever this test starts
+    ASSERT_EQ(::pipe(ends), 0);  // inherited by every process that this test starts
     DaemonProcess daemon(withFixture());
     ::close(ends[1]);
     // The daemon itself still has it.
@@ -459,13 +459,13 @@ TEST_F(Start, SignalsThatTheParentIgnoredOrBlockedAreAtTheirDefaultInBothProcess
     }
 }
 
-/// Whether this process may inspect another one.
+/// Returns true if this process may inspect another one.
 bool inspects(pid_t pid) {
     char buffer[8];
     return ::readlink(("/proc/" + std::to_string(pid) + "/exe").c_str(), buffer, sizeof buffer) > 0;
 }
 
-/// Gives up root's right to inspect every process, for this process and for what it starts.
+/// Drops root's right to inspect every process, for this process and its children.
 bool inspectNoLongerAsRoot() {
     __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
     __user_cap_data_struct capabilities[_LINUX_CAPABILITY_U32S_3]{};

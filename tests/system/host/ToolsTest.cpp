@@ -1,4 +1,4 @@
-// What becomes of the tools of a worker that is killed, and of the services that they have started.
+// After a worker is killed, its tools are ended, but not the services that they have started.
 
 #include "tests/support/SampleRoot.h"
 #include "tests/system/host/Host.h"
@@ -98,7 +98,7 @@ TEST_F(Tools, ServiceStaysWhenTheWorkerIsKilledWhileItWaitsForTheServicesOutput)
     const pid_t worker = _daemon.workerPid();
     UnixHttp client = run("sleep 300 & mark service; mark starter");
     const pid_t service = marked("service");
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));  // of the 200 that the worker waits
+    std::this_thread::sleep_for(std::chrono::milliseconds(20));  // of the 200 ms that the worker waits
     killWorker(worker);
     std::this_thread::sleep_for(std::chrono::milliseconds(300));
     EXPECT_FALSE(hasEnded(service));
@@ -173,7 +173,7 @@ TEST_F(Tools, ToolsOfAWorkerThatOverrunsItsDeadlineEndWithIt) {
     client.begin("POST", "/v1/fixture/run",
                  "{\"script\": \"echo $$ > " + mark + ".new; mv " + mark + ".new " + mark + "; sleep 300\"}");
     ASSERT_TRUE(eventually([&] { return fs::exists(mark); }));
-    ::kill(worker, SIGSTOP);  // it can neither end its tool nor report
+    ::kill(worker, SIGSTOP);  // so that it can neither end its tool nor report
     expectError(client.reply(), 504, "DEADLINE_EXCEEDED");
     pid_t tool = -1;
     std::ifstream(mark) >> tool;

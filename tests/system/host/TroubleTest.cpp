@@ -1,4 +1,4 @@
-// Workers that die or hang, clients that misbehave, and the daemon's end.
+// Workers that die or hang, clients that misbehave, and stopping the daemon.
 
 #include "tests/system/host/Host.h"
 
@@ -241,19 +241,19 @@ TEST(Clients, OperationMayTakeLongerThanAClientMay) {
 TEST(Clients, AccountThatIsNeitherRootNorTheDaemonsIsNotPermitted) {
     DaemonProcess daemon(withFixture());
     if (::geteuid() != 0) {
-        // A plain account cannot become another one; here the kernel itself must keep others out.
+        // An unprivileged account cannot change to another one; here the kernel itself must keep other accounts out.
         struct stat status {};
         ASSERT_EQ(::stat(daemon.socket().c_str(), &status), 0);
         EXPECT_EQ(status.st_mode & S_IRWXO, 0U);
         return;
     }
-    // Directory and socket are opened wide, so that it is the daemon that refuses.
+    // Directory and socket are open to everybody, so that it is the daemon that refuses.
     ASSERT_EQ(::chmod(daemon.directory().c_str(), 0755), 0);
     ASSERT_EQ(::chmod(daemon.socket().c_str(), 0666), 0);
     const pid_t child = ::fork();
     if (child == 0) {
         int status = 1;
-        // From inside the directory: those above it may be closed to others.
+        // From inside the directory, because those above it may be closed to other accounts.
         if (::chdir(daemon.directory().c_str()) == 0 && ::setgroups(0, nullptr) == 0 && ::setgid(65534) == 0 &&
             ::setuid(65534) == 0) {
             try {
@@ -281,7 +281,7 @@ TEST(Clients, AccountThatIsNeitherRootNorTheDaemonsIsNotPermitted) {
     expectError(daemon.connect().get("/v1/requests/" + id), 404, "UNKNOWN_REQUEST");
 }
 
-/// How many private directories are in a directory.
+/// The number of private directories in a directory.
 int privateDirectories(const std::filesystem::path& directory) {
     int count = 0;
     for (const auto& entry : std::filesystem::directory_iterator(directory)) {

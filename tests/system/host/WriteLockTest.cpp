@@ -1,4 +1,4 @@
-// Two daemons at once: what changes something waits for the lock, what reads does not.
+// Two daemons at once: commands that change something wait for the lock, commands that read do not.
 
 #include "tests/support/Program.h"
 #include "tests/system/host/Host.h"
@@ -99,7 +99,7 @@ TEST_F(TwoDaemons, WhileAHolderIsStoppedReadsAreAnsweredAndAWriteNamesTheHolder)
     EXPECT_TRUE(refused.headers.contains("retry-after"));
     EXPECT_EQ(daemon.connect().post("/v1/fixture/run", body("exit 0")).status, 200);
     EXPECT_FALSE(fs::exists(place("data")));
-    // Once the holder goes on, the next write waits for its end only.
+    // Once the holder continues, the next write waits only for its end.
     UnixHttp next = daemon.connect();
     next.begin("POST", "/v1/fixture/runWrite", body("echo third >> " + place("data")));
     go();

@@ -1,4 +1,4 @@
-// What the host does for every plug-in, with each of the plug-ins that it knows nothing about.
+// Tests what the host does for every plug-in with each of two plug-ins.
 
 #include "adminhostd/PluginFile.h"
 #include "platform/json/Json.h"
@@ -21,7 +21,7 @@ namespace {
 using ::testing::HasSubstr;
 using ::testing::Not;
 
-/// The plug-in in tests/support/smallplugin; another build of it if the environment names one.
+/// The plug-in in tests/support/smallplugin, or another build of it that the environment names.
 std::string smallPlugin() {
     const char* other = std::getenv("ADMINHOST_TEST_SMALL_PLUGIN");
     return other == nullptr ? std::string(BINARY_DIR) + "/tests/plugins/small_plugin.so" : other;

@@ -1,4 +1,5 @@
-// Adds a command to a copy of the tree as docs/add-a-command.md says, and compares the touched files with its table.
+// Adds a command to a copy of the tree as docs/add-a-command.md describes, and compares the changed files with its
+// table.
 
 #include "tests/support/Program.h"
 
@@ -52,7 +53,7 @@ class AddACommand : public testing::Test {
         const auto result = runProgram(program, Errors::merge);
         EXPECT_EQ(result.status, 0) << result.output;
     }
-    /// The files of the copy that the tree does not have, or has with other contents.
+    /// The files of the copy that are missing from the tree or differ from it.
     [[nodiscard]] std::set<std::string> touched() const {
         std::set<std::string> files;
         for (const auto& entry : fs::recursive_directory_iterator(tree)) {
@@ -63,7 +64,7 @@ class AddACommand : public testing::Test {
         }
         return files;
     }
-    /// The first column of the guide's table, with the command's names put in.
+    /// The first column of the guide's table, with the names of this command inserted.
     [[nodiscard]] static std::set<std::string> namedByTheGuide() {
         std::ifstream guide(std::string(SOURCE_DIR) + "/docs/add-a-command.md");
         std::set<std::string> places;

@@ -15,7 +15,7 @@ using adminhost::test::ProgramResult;
 using adminhost::test::runProgram;
 namespace fs = std::filesystem;
 
-// A tree of one source file with one include, and what the script says of it.
+// A tree of one source file with one include, and the script's output for it.
 class IncludeEdges : public testing::Test {
   protected:
     IncludeEdges() {

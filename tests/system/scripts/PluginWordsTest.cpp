@@ -15,7 +15,7 @@ using adminhost::test::ProgramResult;
 using adminhost::test::runProgram;
 namespace fs = std::filesystem;
 
-// A copy of what the script reads, with one more file.
+// A copy of the files that the script reads, with one more file.
 class PluginWords : public testing::Test {
   protected:
     PluginWords() {
@@ -31,7 +31,7 @@ class PluginWords : public testing::Test {
     [[nodiscard]] ProgramResult check() const {
         return runProgram({"/usr/bin/python3", "-B", SOURCE_DIR "/scripts/plugin_words.py", _tree}, Errors::merge);
     }
-    /// What the script reports of a file with this line.
+    /// The script's output for a file with this line.
     [[nodiscard]] std::string of(const std::string& file, const std::string& line) const {
         std::ofstream(_tree / file) << line << '\n';
         const ProgramResult result = check();

@@ -1,5 +1,5 @@
-// The grid password on its way through the real command line, daemon, worker and tools: its plain text is kept in no
-// file, and shown in no log line, reply, argument list or environment, whatever becomes of the request that brings it.
+// Passes the grid password through the real command line, daemon, worker and tools. Its plain text is in no file, log
+// line, reply, argument list or environment, whether the request succeeds or fails.
 
 #include "platform/json/Json.h"
 #include "platform/value/Value.h"
@@ -40,7 +40,7 @@ std::string bytesOf(const fs::path& file) {
     return {std::istreambuf_iterator<char>(in), {}};
 }
 
-/// A directory for the file that gives the password to the command line: the one place where it may stand.
+/// The directory of the file from which the command line reads the password: the only place where it may be.
 class PasswordFile {
   public:
     PasswordFile() {
@@ -84,7 +84,7 @@ class GridPassword : public testing::Test {
             true,
             {}});
     }
-    /// Whatever the test did, nothing holds the password afterwards.
+    /// After every test, the password is in no file and no process.
     void TearDown() override {
         checkProcesses();
         for (const fs::path& directory : {fs::path(root.directory()), daemon->directory()}) {
@@ -108,7 +108,7 @@ class GridPassword : public testing::Test {
     [[nodiscard]] std::string recordOf(std::size_t tool) const {
         return root.directory() + "/recorded." + std::to_string(tool);
     }
-    /// A reply, what the daemon remembers of the request and everything that it can be asked for.
+    /// Checks a reply, the daemon's record of the request, and its other answers.
     HttpReply checked(HttpReply reply) const {
         EXPECT_FALSE(holdsPlanted(reply.body)) << reply.body;
         for (const auto& [name, value] : reply.headers) {
@@ -175,7 +175,7 @@ TEST_F(GridPassword, AcceptedOneIsStoredOnlyInItsProtectedFormAndHistoryHoldsNoO
     EXPECT_NE(after, before);
     EXPECT_THAT(after, HasSubstr("nimbo_client_password"));
 
-    // Again, as the same, so that the history's newest entry was made with the password stored; and as a property list.
+    // The same request again, so that the password is stored already when the newest entry is made; as a property list.
     EXPECT_EQ(post(bodyWith(R"(,"server_port":8172)")).status, 200);
     EXPECT_EQ(bytesOf(root.clusterPreferencesPath()), after);
     const HttpReply list =

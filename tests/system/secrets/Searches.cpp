@@ -42,7 +42,7 @@ std::vector<pid_t> processesFrom(pid_t first) {
         if (name.find_first_not_of("0123456789") != std::string::npos) {
             continue;
         }
-        // "PID (NAME) STATE PARENT ...", where the name may hold anything.
+        // "PID (NAME) STATE PARENT ...", where the name may contain any character.
         const std::string status = bytesOf(entry.path() / "stat");
         if (const std::size_t end = status.rfind(')'); end != std::string::npos && end + 4 < status.size()) {
             parents[std::stoi(name)] = std::stoi(status.substr(end + 4));

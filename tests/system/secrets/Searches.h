@@ -1,6 +1,6 @@
 #pragma once
 
-// Where a planted password stands that should stand nowhere.
+// Searches files and processes for a test's password, which must be in none of them.
 
 #include <array>
 #include <filesystem>
@@ -26,10 +26,10 @@ struct FileSearch {
 
 [[nodiscard]] FileSearch searchBelow(const std::filesystem::path& directory);
 
-/// The process and all that descend from it, as they are now.
+/// The process and all its descendants at this moment.
 [[nodiscard]] std::vector<pid_t> processesFrom(pid_t first);
 
-/// What stands in a process's argument list and environment.
+/// The argument list and environment of a process.
 [[nodiscard]] std::string argumentsAndEnvironmentOf(pid_t pid);
 
 }  // namespace adminhost::test

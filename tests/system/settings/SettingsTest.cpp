@@ -196,7 +196,8 @@ TEST_F(Settings, RollbackOfSettingsThatAnotherClientChangesMeanwhileIsRefused) {
     root.setSwitch("setup_preferences.sleep", "1");
     ProgramResult rollback;
     std::thread restoring([&] { rollback = ctl({"rollback", "1"}); });
-    // The other client's write waits behind the reading that the rollback begins with, and so comes before its write.
+    // The other client's write waits in the queue behind the rollback's first read, so it runs before the rollback's
+    // write.
     for (int i = 0; i < 2000 && daemon.connect().get("/v1/").body.find("readSettings\",\"uid") == std::string::npos;
          ++i) {
         std::this_thread::sleep_for(std::chrono::milliseconds(5));

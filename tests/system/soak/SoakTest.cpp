@@ -24,7 +24,7 @@ struct Tally {
     std::size_t unexpected = 0;
 };
 
-/// One client on one connection; every answer must be the one of its own request, which shows in what is listed.
+/// One client on one connection. Every answer must belong to its own request, as the listed items show.
 void work(const test::DaemonProcess& daemon, Clock::time_point end, Tally& tally) {
     test::UnixHttp connection(daemon.socket(), std::chrono::seconds(60));
     constexpr std::array<std::array<const char*, 3>, 4> rounds{{
@@ -67,7 +67,7 @@ TEST(Soak, EightClientsForAMinuteAreAllAnsweredInOrderAndNothingLeaks) {
         answered += tally.answered;
     }
     EXPECT_EQ(daemon.workerPid(), worker) << "the worker was replaced";
-    // The closed connections' descriptors go when the front next runs.
+    // The front closes the descriptors of closed connections when it runs the next time.
     (void)daemon.connect().get("/v1/");
     EXPECT_LE(test::descriptorsOf(daemon.pid()), frontBefore + 1);
     EXPECT_EQ(test::descriptorsOf(worker), workerBefore);
