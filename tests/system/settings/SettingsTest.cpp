@@ -185,8 +185,9 @@ TEST_F(Settings, RollbackNamesWhatWasNotSetThenAndSaysThatThePasswordStays) {
     const ProgramResult rollback = ctl({"rollback", "1"});
     EXPECT_EQ(rollback.status, 1) << "not all of it could be restored";
     EXPECT_THAT(rollback.output, HasSubstr("settings.server_port: 9001 -> 8170\n"));
-    EXPECT_THAT(rollback.output, HasSubstr("settings.tunnel_agent_host was not set then"));
-    EXPECT_THAT(rollback.output, HasSubstr("The grid password stays as it is"));
+    EXPECT_THAT(rollback.output,
+                HasSubstr("settings.tunnel_agent_host: not set at that time; it cannot be removed and stays agent\n"));
+    EXPECT_THAT(rollback.output, HasSubstr("settings.nimbo_client_password: not restored, a stored secret"));
     EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8170\n");
     EXPECT_EQ(ctl({"settings", "get", "tunnel_agent_host"}).output, "agent\n");
 }
