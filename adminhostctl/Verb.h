@@ -31,7 +31,7 @@ struct VerbOptions {
 
 struct Verb;
 
-/// What a verb works with.
+/// Everything that a verb uses.
 struct Context {
     DaemonClient& service;
     const VerbOptions& options;

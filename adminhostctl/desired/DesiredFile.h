@@ -13,7 +13,7 @@
 //     FIELD = true
 //     PEOPLE = ["anna"]
 //
-// What is not listed stays as it is. The switches have a table of their own because an element may have any name.
+// Anything not listed stays as it is. The switches have a table of their own because an element may have any name.
 
 #include "adminhostctl/desired/Plan.h"
 #include "adminhostctl/desired/State.h"

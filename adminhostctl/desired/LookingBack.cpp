@@ -41,7 +41,7 @@ const Dictionary& dictionaryAt(const Dictionary& dictionary, std::string_view ke
     return found == nullptr ? none : *found;
 }
 
-/// What the write changed, as the daemon has recorded it.
+/// The changes of the write, as recorded by the daemon.
 std::string changesText(const Dictionary& entry) {
     const Array* changes = entry.get("changes").array();
     if (changes == nullptr) {

@@ -19,7 +19,7 @@ namespace adminhost::test {
 void enterAvahiNamespace(int argc, char** argv);
 
 /// A service on port 7777 of this host, whose address 10.77.0.1 has the name controller.test.example; published
-/// with Avahi's own tool until the object goes away. Throws std::runtime_error when that does not succeed.
+/// with Avahi's own tool while the object exists. Throws std::runtime_error on failure.
 class PublishedService {
   public:
     PublishedService(const std::string& name, const std::string& type);

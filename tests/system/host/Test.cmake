@@ -1,4 +1,4 @@
-# The plug-ins that the daemon is tested with: one that works, and one for each way of being wrong.
+# The plug-ins for tests of the daemon: one that works, and one for each kind of fault.
 set(FIXTURES ${CMAKE_SOURCE_DIR}/tests/support/fixtures)
 function(fixture_plugin name source)
     add_library(${name} MODULE ${FIXTURES}/${source})

@@ -74,7 +74,7 @@ printf '   id = %s\nvalue = %s\n' "$2" "$1"
         }
         return outcomes;
     }
-    /// What the tool recorded since the last call: its statements, and "end" with one that ended by itself.
+    /// The records since the last call: the statements, and an "end" line for each run that ended by itself.
     [[nodiscard]] std::vector<std::string> calls() const {
         std::vector<std::string> lines;
         std::istringstream text(root.read("/calls"));
