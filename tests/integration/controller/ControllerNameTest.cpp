@@ -138,7 +138,7 @@ TEST_F(ControllerName, OtherDotsBeforeTheSuffixDoNotKeepANameFromBeingResolved) 
     EXPECT_THAT(log.lines, IsEmpty());
 }
 
-TEST_F(ControllerName, WithTheFlagANameWithADotIsResolvedAsItStands) {
+TEST_F(ControllerName, WithTheFlagANameWithADotIsResolvedUnchanged) {
     const PublishedService published("grid.example", type);
     write("grid.example", true);
     EXPECT_EQ(stored(), Value(foundHost));
@@ -179,7 +179,7 @@ TEST_F(ControllerName, NameThatNobodyAnswersToIsLoggedAndStoredUnchanged) {
     EXPECT_LT(time, 9s) << "the failure ends the wait";
 }
 
-TEST_F(ControllerName, ServiceOfAnotherTypeIsNoController) {
+TEST_F(ControllerName, ServiceOfAnotherTypeIsNotAController) {
     const PublishedService published("Printer", "_other._tcp");
     write("Printer");
     EXPECT_EQ(stored(), Value("Printer"));

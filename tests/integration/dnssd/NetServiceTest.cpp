@@ -315,7 +315,7 @@ TEST(HostName, AddressWithoutANameIsAnErrorNotANumber) {
     EXPECT_NE(result.error, 0);
 }
 
-TEST(HostName, WhatIsNoAddressIsAnError) {
+TEST(HostName, TextThatIsNotAnAddressIsAnError) {
     EXPECT_EQ(hostNameOf({}).error, EAI_FAMILY);
     EXPECT_EQ(hostNameOf({2}).error, EAI_FAMILY);
     SocketAddress cut = ipv4("10.77.0.1");

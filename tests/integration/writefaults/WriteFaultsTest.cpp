@@ -174,7 +174,7 @@ TEST_F(WriteFaults, EachCallThatFailsOnceLeavesEveryFileOldOrNewAndWhole) {
     EXPECT_GE(counts["call fails once"].refused, 60);
 }
 
-TEST_F(WriteFaults, EachCallThatFailsForEverLeavesEveryFileOldOrNewAndWhole) {
+TEST_F(WriteFaults, EachCallThatAlwaysFailsLeavesEveryFileOldOrNewAndWhole) {
     failEach("+");
     EXPECT_GE(counts["call fails for ever"].refused, 60);
 }
@@ -220,7 +220,7 @@ TEST_F(WriteFaults, OneFailedReadOfTheIdentityPreferencesMovesAndMisplacesNothin
     EXPECT_GE(reads, 3);
 }
 
-TEST_F(WriteFaults, WriteThatTakesNoBytesIsAFailureAndNotALoop) {
+TEST_F(WriteFaults, WriteOfNoBytesIsAFailureAndNotALoop) {
     for (const Call& call : callsOfTheWay()) {
         if (call.name != "write") {
             continue;

@@ -147,7 +147,7 @@ TEST_F(Apply, ExportIntoAPipeIsWrittenToItAndOneThatCannotBeWrittenIsSaid) {
     EXPECT_EQ(ctl({"export", root.directory()}).status, 2);
 }
 
-TEST_F(Apply, UnlistedOnesGoOnlyWhenTheSwitchSaysSo) {
+TEST_F(Apply, UnlistedOnesAreRemovedOnlyWhenTheSwitchIsOn) {
     const std::string some = "[properties.default_language]\nvalue = \"de\"\n[cameras.\"Main hall\"]\nusers = []\n";
     EXPECT_EQ(ctl({"apply", file("some.toml", some)}).output, "no change\n");
     const ProgramResult apply =
@@ -158,7 +158,7 @@ TEST_F(Apply, UnlistedOnesGoOnlyWhenTheSwitchSaysSo) {
     EXPECT_EQ(root.sql("select name from properties"), "default_language\n");
 }
 
-TEST_F(Apply, ConfigurationToolThatFailsIsNamedAndTheRestTakes) {
+TEST_F(Apply, ConfigurationToolThatFailsIsNamedAndTheRestIsApplied) {
     root.setSwitch("lumioconfig.exit", "3");
     const ProgramResult apply =
         ctl({"apply",
@@ -183,7 +183,7 @@ TEST_F(Apply, ProtectedValueIsNeverPrintedAndAppliedOnce) {
     EXPECT_THAT(daemon.log(), Not(HasSubstr("planted-token")));
 }
 
-TEST_F(Apply, PasswordIsTakenFromItsFileAndShownNowhere) {
+TEST_F(Apply, PasswordIsReadFromItsFileAndShownNowhere) {
     const std::string desired = changed({});
     const ProgramResult apply = ctl({"apply", desired, "--password-file", file("password", "planted-password\n")});
     EXPECT_EQ(apply.status, 0);
@@ -192,7 +192,7 @@ TEST_F(Apply, PasswordIsTakenFromItsFileAndShownNowhere) {
     EXPECT_THAT(read(root.clusterPreferencesPath()), Not(HasSubstr("planted-password")));
 }
 
-TEST_F(Apply, ControllerNameThatAWriteResolvesIsNoChangeButSaid) {
+TEST_F(Apply, ControllerNameThatAWriteResolvesIsNotedAndNotAChange) {
     const std::string desired =
         changed({{"nimbo_controller = \"grid1.example.org\"", "nimbo_controller = \"studio.local\""}});
     const ProgramResult apply = ctl({"apply", desired});

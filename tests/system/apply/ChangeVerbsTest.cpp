@@ -19,12 +19,12 @@ TEST_F(ChangeVerbs, SettingIsConvertedWrittenAndReadBack) {
     EXPECT_THAT(read(root.memberPreferencesPath()), HasSubstr("<integer>8180</integer>"));
 }
 
-TEST_F(ChangeVerbs, SettingThatStandsAlreadyIsNotWrittenAgain) {
+TEST_F(ChangeVerbs, SettingThatHasItsValueAlreadyIsNotWrittenAgain) {
     EXPECT_EQ(ctl({"settings", "set", "server_port", "8170"}).output, "no change\n");
     EXPECT_EQ(ctl({"history"}).output, "No settings have been written yet.\n");
 }
 
-TEST_F(ChangeVerbs, SettingThatNeedsARestartSaysSo) {
+TEST_F(ChangeVerbs, SettingThatNeedsARestartIsFollowedByANote) {
     EXPECT_THAT(ctl({"settings", "set", "nimbo_client_username", "other"}).output, HasSubstr("has to be restarted"));
     EXPECT_THAT(ctl({"settings", "set", "server_host", "other"}).output, Not(HasSubstr("restarted")));
 }

@@ -83,7 +83,7 @@ TEST_F(Ctl, TextsArriveAsTheTypesThatTheDaemonDescribes) {
                                                {"list", Array{Dictionary{{"name", "a"}}, Dictionary{{"name", "b"}}}}}));
 }
 
-TEST_F(Ctl, OptionsMayStandBehindTheCommand) {
+TEST_F(Ctl, OptionsMayFollowTheCommand) {
     EXPECT_EQ(run({"echoTyped", "count=7", "--format", "json"}).value(), Value(Dictionary{{"count", 7}}));
 }
 
@@ -208,7 +208,7 @@ TEST_F(Ctl, CommandsAndHelpComeFromTheDaemon) {
     EXPECT_EQ(run({"help", "fail", "--names"}).out, "status=\n");
 }
 
-TEST_F(Ctl, StatusTellsOfPlugInsAndOfWhatWaits) {
+TEST_F(Ctl, StatusListsPlugInsAndWaitingRequests) {
     EXPECT_THAT(run({"status"}).out,
                 AllOf(HasSubstr("waiting"), HasSubstr("plugins (1)\n"), HasSubstr("described  1.0.0")));
 }

@@ -240,7 +240,7 @@ TEST_F(Answers, WholeAddressIsServedAsItsPath) {
     expectError(client.get("http://localhost"), 404, "UNKNOWN_ADDRESS");
 }
 
-TEST_F(Answers, QueryThatIsNoUtf8Is400) {
+TEST_F(Answers, QueryThatIsNotUtf8Is400) {
     expectError(client.get("/v1/directory?match=%ff"), 400, "MALFORMED_ADDRESS");
     EXPECT_EQ(client.get("/v1/directory?match=%c3%a4").status, 200);
 }
@@ -341,7 +341,7 @@ TEST_F(Answers, TheLatest200RequestsAreRemembered) {
     EXPECT_EQ(client.get("/v1/requests/" + first).status, 404);
 }
 
-TEST_F(Answers, RememberedLogIsBoundedAndSaysSo) {
+TEST_F(Answers, RememberedLogIsBoundedAndFurtherLinesAreCounted) {
     const HttpReply reply = client.post("/v1/fixture/log", R"({"lines": [")" + std::string(60'000, 'x') + R"(", ")" +
                                                                std::string(10'000, 'y') + R"("]})");
     const Dictionary record = dictionaryOf(client.get("/v1/requests/" + reply.headers.at("request-id")));

@@ -131,7 +131,7 @@ TEST_F(RequestIds, MalformedOneIs400AndNothingRuns) {
     EXPECT_EQ(client.post("/v1/fixture/look").headers.at("etag"), "\"r1\"");
 }
 
-TEST_F(RequestIds, TellsWaitingRunningDoneAndUnknown) {
+TEST_F(RequestIds, StateIsWaitingRunningDoneOrUnknown) {
     const std::string second = "6ba7b811-9dad-11d1-80b4-00c04fd430c8";
     EXPECT_EQ(recordOf(daemon, id).get("state"), Value("unknown"));
     expectError(client.get("/v1/requests/" + id), 404, "UNKNOWN_REQUEST");

@@ -92,7 +92,7 @@ TEST_F(Start, SocketGetsTheConfiguredGroup) {
     EXPECT_EQ(status.st_mode & 07777U, 0660U);
 }
 
-TEST_F(Start, DefaultSocketLiesBelowTheRoot) {
+TEST_F(Start, DefaultSocketIsBelowTheRoot) {
     const fs::path etc = directory / "etc";
     fs::create_directories(etc);
     std::ofstream(etc / "adminhostd.toml") << "queue_limit = 3\n";
@@ -196,7 +196,7 @@ TEST_F(Start, StaleSocketIsReplacedAndALiveOneIsAnError) {
     EXPECT_EQ(daemon.connect().get("/v1/").status, 200);
 }
 
-TEST_F(Start, WhatIsNoSocketIsNeverReplaced) {
+TEST_F(Start, FileThatIsNotASocketIsNeverReplaced) {
     const fs::path path = directory / "socket";
     std::ofstream(path) << "precious";
     const ProgramResult result = run({"--socket", path, "--plugin", pluginFile("fixture_good")});
@@ -273,7 +273,7 @@ TEST_F(Start, PluginThatEverybodyMayWriteIsRefused) {
     EXPECT_NE(result.output.find("may be written by everybody"), std::string::npos) << result.output;
 }
 
-TEST_F(Start, CheckSaysThatNothingIsWrongAndLeavesNothingBehind) {
+TEST_F(Start, CheckReportsThatNothingIsWrongAndLeavesNothingBehind) {
     const ProgramResult result =
         run({"--check", "--plugin", pluginFile("fixture_good"), "--socket", directory / "socket"});
     EXPECT_EQ(result.status, 0) << result.output;

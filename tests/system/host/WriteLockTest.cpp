@@ -166,7 +166,7 @@ TEST_F(TwoDaemons, LeftoversAreRemovedOnlyWithTheLockByTheFirstWriteAtTheLatest)
     }
 }
 
-TEST_F(TwoDaemons, CheckTakesNoLockWaitsForNoneAndCleansNothingUp) {
+TEST_F(TwoDaemons, CheckNeedsNoLockAndRemovesNothing) {
     DaemonProcess holder(options());
     const UnixHttp writing = startWrite(holder, "first");
     const auto check = [&] {

@@ -148,7 +148,7 @@ TEST_P(EveryPlugin, WriteThatNamesAnOldRevisionIs412AndChangesNothing) {
     EXPECT_EQ(revision(), after);
 }
 
-TEST_P(EveryPlugin, RevisionForACommandThatTakesNoneIs400) {
+TEST_P(EveryPlugin, RevisionForACommandThatAcceptsNoneIs400) {
     const HttpReply reply = post(GetParam().read, "{}", {"If-Match: \"r\""});
     EXPECT_EQ(reply.status, 400);
     EXPECT_THAT(reply.body, HasSubstr("PRECONDITION_NOT_UNDERSTOOD"));

@@ -244,7 +244,7 @@ TEST_F(GridPassword, RefusedRequestsShowNothingOfIt) {
     }
 }
 
-TEST_F(GridPassword, CommandLineTakesItFromFilesAndShowsItNowhere) {
+TEST_F(GridPassword, CommandLineReadsItFromFilesAndShowsItNowhere) {
     const std::string desired = root.directory() + "/desired.toml";
     EXPECT_EQ(ctl({"export", desired}).status, 0);
     EXPECT_EQ(ctl({"plan", desired, "--password-file", password.path()}).status, 0);

@@ -176,7 +176,7 @@ TEST_F(Settings, RollbackThatDoesNotTakeIsNamed) {
     EXPECT_EQ(ctl({"rollback", "77"}).status, 2);
 }
 
-TEST_F(Settings, RollbackNamesWhatWasNotSetThenAndSaysThatThePasswordStays) {
+TEST_F(Settings, RollbackNamesSettingsThatWereNotSetThenAndNotesThatThePasswordStays) {
     root.write("/Library/SorvaneProducer/Shared/Server/member_preferences_" +
                    test::SampleRoot::uuidOf("member", "media1") + ".plist",
                "<plist><dict><key>server_port</key><integer>8170</integer></dict></plist>");

@@ -122,7 +122,7 @@ TEST(AskSecret, AnEndOfInputWithoutALineIsAUsageError) {
     EXPECT_EQ(WEXITSTATUS(child.wait()), 2);
 }
 
-TEST(ReadSource, SaysWhichFileCannotBeRead) {
+TEST(ReadSource, NamesTheFileThatCannotBeRead) {
     try {
         static_cast<void>(adminhost::ctl::readSource("/nowhere/file"));
         ADD_FAILURE();

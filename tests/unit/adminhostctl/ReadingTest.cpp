@@ -225,14 +225,14 @@ TEST(Wrapped, BreaksAtBlanksAndElseWithinWords) {
     EXPECT_THAT(wrapped("", 5), ElementsAre(""));
 }
 
-TEST(Table, NumbersStandToTheRightAndEmptyColumnsAreLeftOut) {
+TEST(Table, NumbersAreAlignedToTheRightAndEmptyColumnsAreOmitted) {
     Table table({"name", "count", "nothing"});
     table.addRow({"a", "5", ""});
     table.addRow({"bcdef", "12,000", ""});
     EXPECT_EQ(table.text(80, 1), " NAME    COUNT\n a           5\n bcdef  12,000\n");
 }
 
-TEST(Table, VersionsAreNoNumbers) {
+TEST(Table, VersionsAreNotNumbers) {
     Table table({"version", "b"});
     table.addRow({"1.0.0", "2.5"});
     EXPECT_EQ(table.text(80, 0), "VERSION    B\n1.0.0    2.5\n");

@@ -100,7 +100,7 @@ TEST(BuildRequest, ATextThatDoesNotFitItsKeyIsAUsageError) {
               "configuration.server_port: \"eighty\" is not a whole number");
 }
 
-TEST(BuildRequest, JsonSaysItsTypeItself) {
+TEST(BuildRequest, JsonHasATypeOfItsOwn) {
     EXPECT_EQ(build("readSettings", {"optionalArguments.languages:=[\"de\", \"en\"]"}),
               (Dictionary{{"optionalArguments", Dictionary{{"languages", Array{"de", "en"}}}}}));
     EXPECT_EQ(build("writeSettings", {"configuration.server_port:=\"8170\""}),
@@ -120,13 +120,13 @@ TEST(BuildRequest, OnlyJsonBringsAKeyThatIsNotDescribed) {
     EXPECT_EQ(build("readSettings", {"colour:=5"}), (Dictionary{{"colour", 5}}));
 }
 
-TEST(BuildRequest, AKeyThatTakesAnythingTakesText) {
+TEST(BuildRequest, AKeyForAnyValueAcceptsText) {
     EXPECT_EQ(build("getState", {"variant=withDetails"}), (Dictionary{{"variant", "withDetails"}}));
     EXPECT_EQ(build("getState", {"variant.deep.er=x"}),
               (Dictionary{{"variant", Dictionary{{"deep", Dictionary{{"er", "x"}}}}}}));
 }
 
-TEST(BuildRequest, AListTakesJsonOrAFileButNoText) {
+TEST(BuildRequest, AListAcceptsJsonOrAFileButNotText) {
     EXPECT_THAT(
         usageOf("readSettings", {"optionalArguments.languages=de"}),
         HasSubstr("the value is a list; use optionalArguments.languages:=JSON or optionalArguments.languages@FILE"));
@@ -150,7 +150,7 @@ TEST(BuildRequest, ArgumentsReplaceWhatTheFileHolds) {
               (Dictionary{{"configuration", Dictionary{{"server_port", 2}, {"server_host", "a"}}}}));
 }
 
-TEST(BuildRequest, AKeyBelowSomethingThatIsNoDictionaryIsAUsageError) {
+TEST(BuildRequest, AKeyBelowAValueThatIsNotADictionaryIsAUsageError) {
     EXPECT_THAT(usageOf("writeSettings", {"configuration.server_port=2"}, {}, {{"configuration", "text"}}),
                 HasSubstr("server_port is not in a dictionary"));
 }
@@ -309,7 +309,7 @@ TEST(ValueOfWord, WordIsConvertedToTheTypeOfTheKey) {
     EXPECT_THAT(wordRefused(keyOf("integer"), "x"), HasSubstr("is not a whole number"));
 }
 
-TEST(ValueOfWord, WordBehindAnAtSignIsAFileOrStandardInput) {
+TEST(ValueOfWord, WordAfterAnAtSignIsAFileOrStandardInput) {
     const Given given{{{"port", "8170\n"}, {"-", "typed\n"}, {"bytes", "\xFF"}}, "", false, false};
     EXPECT_EQ(word(keyOf("integer"), "@port", given), Value(8170));
     EXPECT_EQ(word(keyOf("text"), "@-", given), Value("typed"));

@@ -111,7 +111,7 @@ TEST(WriteFrame, CarriesALargeFrameThroughASocket) {
     ::close(ends[1]);
 }
 
-TEST(WriteFrame, SaysWhenNobodyReads) {
+TEST(WriteFrame, FailsWhenNobodyReads) {
     int ends[2];
     ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
     ::close(ends[1]);

@@ -224,7 +224,7 @@ TEST_F(HistoryTest, UnfinishedEntryOfAKilledProcessIsRemovedAndNoEntry) {
     EXPECT_FALSE(fs::exists(root.path(std::string(directory) + "/unfinished-2")));
 }
 
-TEST_F(HistoryTest, DirectoryThatCannotBeMadeIsAnErrorThatSaysWhy) {
+TEST_F(HistoryTest, DirectoryThatCannotBeCreatedIsAnErrorWithTheReason) {
     root.write("/var/lib", "a file where the directory belongs");
     const auto number = history.keep(files, {}, {});
     ASSERT_FALSE(number);

@@ -155,7 +155,7 @@ TEST(AesTransform, AnyOtherStatusAnswersNothing) {
     }
 }
 
-TEST(AesTransform, LengthThatIsNoMultipleOfABlockDoesNotDecrypt) {
+TEST(AesTransform, LengthThatIsNotAMultipleOfABlockDoesNotDecrypt) {
     Data cipher = *aes128cbcEncryptDataWithKey(plain(100), key);
     for (std::size_t length = 0; length < 112; ++length) {
         if (length % 16 != 0) {
@@ -214,7 +214,7 @@ TEST(AesTransform, PaddingOfUnequalBytesDoesNotDecrypt) {
     }
 }
 
-TEST(AesTransform, BlockOfZerosIsNoPadding) {
+TEST(AesTransform, BlockOfZerosIsNotPadding) {
     EXPECT_EQ(aes128cbcDecryptDataWithKey(cipherOfLastBlock(Data(16, 0)), key), std::nullopt);
 }
 

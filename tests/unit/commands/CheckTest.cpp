@@ -74,7 +74,7 @@ TEST(CheckRequest, ATextWhereAListBelongsIsRefused) {
                 only("optionalArguments.languages", "must be a list"));
 }
 
-TEST(CheckRequest, AnElementThatIsNoDictionaryIsNamedByItsIndex) {
+TEST(CheckRequest, AnElementThatIsNotADictionaryIsNamedByItsIndex) {
     EXPECT_THAT(checkList("workflows", {Dictionary{}, "x", Array{}}),
                 ElementsAre(At("configuration.workflows.1"), At("configuration.workflows.2")));
     EXPECT_THAT(checkCamera({{"allowedUsersAndGroups", Array{"anna"}}}), only(accessKey, "must be a dictionary"));

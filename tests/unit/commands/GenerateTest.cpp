@@ -57,7 +57,7 @@ class Generate : public testing::Test {
     std::filesystem::path _directory;
 };
 
-TEST_F(Generate, TakesASoundDescription) {
+TEST_F(Generate, AcceptsAValidDescription) {
     write("doIt.toml", sound);
     EXPECT_EQ(table(), "status 0");
     EXPECT_TRUE(std::filesystem::exists(_directory / "table.cpp"));

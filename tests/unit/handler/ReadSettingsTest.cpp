@@ -203,7 +203,7 @@ TEST_F(ReadSettings, PortWithLeadingZerosIsDecimalAndHexadecimalDigitsEndIt) {
     EXPECT_EQ(catalogFor("<string>0x10</string>"), "http://h:1/sorvaneproducer/catalogs");
 }
 
-TEST_F(ReadSettings, WebAddressShowsTheTextOfAPortAsItStands) {
+TEST_F(ReadSettings, WebAddressShowsTheTextOfAPortUnchanged) {
     writeSettings();
     for (const char* port : {"010", "0x10", " 8170x", "http", ""}) {
         writeMember("<key>server_host</key><string>h</string><key>server_port</key><string>" + std::string(port) +

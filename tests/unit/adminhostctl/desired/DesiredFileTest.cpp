@@ -182,7 +182,7 @@ TEST(Export, FailsWhenTheServiceDoesNotListASection) {
     }
 }
 
-TEST(Desired, FileIsReadAsItStands) {
+TEST(Desired, FileIsReadWithAllItsTables) {
     const Wanted wanted = parse(
         "[remove_unlisted]\nproperties = true\naccess = true\n"
         "[settings]\nserver_port = 9000\nserver_host = \"media\"\nsorvane_capture_web_enabled = false\n"

@@ -190,7 +190,7 @@ TEST(Plan, SecretsShowAsSuchOnBothSides) {
         << "a file does not write it again";
 }
 
-TEST(Plan, AccessListTellsUsersFromGroupsOfTheSameName) {
+TEST(Plan, AccessListDistinguishesUsersFromGroupsOfTheSameName) {
     Wanted wanted;
     WantedElement camera = element("aaaa-1");
     camera.lists["users"] = {"ben", "ben"};
