@@ -206,6 +206,27 @@ bool sameThing(const Dictionary& kept, const Change& change) {
            kept.get("key") == Value(change.key);
 }
 
+/// Replaces what the changes hold of these secrets by "(secret)"; returns true if there was anything to replace.
+bool hideIn(Array& changes, const std::vector<const Change*>& secret) {
+    bool hid = false;
+    for (Value& change : changes) {
+        Dictionary* kept = change.dictionary();
+        if (kept == nullptr || kept->get("secret") == Value(true) ||
+            std::none_of(secret.begin(), secret.end(), [&](const Change* one) { return sameThing(*kept, *one); })) {
+            continue;
+        }
+        for (const std::string_view key : {"from", "to"}) {
+            if (kept->contains(key)) {
+                kept->set(key, hidden);
+            }
+        }
+        kept->remove("undo");
+        kept->set("secret", true);
+        hid = true;
+    }
+    return hid;
+}
+
 Dictionary dictionaryOf(const Change& change) {
     Dictionary kept{
         {"section", change.section}, {"identity", change.identity}, {"name", change.name}, {"key", change.key}};
@@ -357,58 +378,40 @@ std::optional<Error> SettingsHistory::complete(std::uint64_t number, const Dicti
     return replacePlainly(*about, file);
 }
 
-std::optional<Error> SettingsHistory::hideFormerValues(const std::vector<Change>& changes) const {
+std::optional<Error> SettingsHistory::hideFormerValues(const std::vector<const Change*>& secret) const {
+    std::optional<Error> failed;
+    for (const std::uint64_t number : secret.empty() ? std::vector<std::uint64_t>() : numbersIn(_resources)) {
+        const HostPath file = resourceEntryOf(_resources, number);
+        auto entry = readDictionary(file);
+        Value* list = entry ? entry->find("changes") : nullptr;
+        if (list == nullptr || list->array() == nullptr || !hideIn(*list->array(), secret)) {
+            continue;
+        }
+        if (auto error = replacePlainly(*entry, file)) {
+            error->description = "the former values of a secret stay in the history: " + textOf(error->description);
+            failed = std::move(error);
+        }
+    }
+    return failed;
+}
+
+std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& changes, const Dictionary& about) const {
     std::vector<const Change*> secret;
+    Array kept;
     for (const Change& change : changes) {
         if (change.secret && !change.identity.empty()) {
             secret.push_back(&change);
         }
-    }
-    if (secret.empty()) {
-        return std::nullopt;
-    }
-    for (const std::uint64_t number : numbersIn(_resources)) {
-        const HostPath file = resourceEntryOf(_resources, number);
-        auto entry = readDictionary(file);
-        Value* list = entry ? entry->find("changes") : nullptr;
-        bool hid = false;
-        for (std::size_t i = 0; list != nullptr && list->array() != nullptr && i < list->array()->size(); ++i) {
-            Dictionary* kept = (*list->array())[i].dictionary();
-            if (kept == nullptr || kept->get("secret") == Value(true) ||
-                std::none_of(secret.begin(), secret.end(), [&](const Change* one) { return sameThing(*kept, *one); })) {
-                continue;
-            }
-            for (const std::string_view key : {"from", "to"}) {
-                if (kept->contains(key)) {
-                    kept->set(key, hidden);
-                }
-            }
-            kept->remove("undo");
-            kept->set("secret", true);
-            hid = true;
-        }
-        if (hid) {
-            if (auto error = replacePlainly(*entry, file)) {
-                return error;
-            }
-        }
-    }
-    return std::nullopt;
-}
-
-std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& changes, const Dictionary& about) const {
-    if (auto error = hideFormerValues(changes)) {
-        return error;
-    }
-    Array kept;
-    for (const Change& change : changes) {
         if (change.section != "settings") {
             kept.emplace_back(dictionaryOf(change));
         }
     }
+    std::optional<Error> notHidden = hideFormerValues(secret);
     if (kept.empty()) {
-        return std::nullopt;
+        return notHidden;
     }
+    // The same request may have set a plain value first.
+    hideIn(kept, secret);
     for (const HostPath& directory : {_directory, _resources}) {
         if (auto error = createDirectories(diskPath(directory), mine())) {
             return error;
@@ -420,13 +423,13 @@ std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& c
     entry.set("format", format);
     entry.set("changes", std::move(kept));
     if (auto error = replacePlainly(entry, resourceEntryOf(_resources, number))) {
-        return error;
+        return notHidden ? notHidden : error;
     }
     numbers.push_back(number);
     for (std::size_t i = 0; i + resourcesMaximum < numbers.size(); ++i) {
         removeAll(resourceEntryOf(_resources, numbers[i]));
     }
-    return std::nullopt;
+    return notHidden;
 }
 
 Array SettingsHistory::settingsEntries() const {

@@ -42,8 +42,8 @@ class SettingsHistory {
     /// Adds to the entry the changes that the write made; removes the entry if there are none.
     [[nodiscard]] std::optional<Error> complete(std::uint64_t number, const Dictionary& values) const;
     /// Adds an entry of the resources with these changes. Those of the section "settings" are left out; if there are no
-    /// others, no entry is added. Before that, a value that has become secret is replaced by "(secret)" in all stored
-    /// entries.
+    /// others, no entry is added. A value that has become secret is replaced by "(secret)" in this and all stored
+    /// entries; if one of them cannot be replaced, the others are, the entry is added, and the error is returned.
     [[nodiscard]] std::optional<Error> keepResources(const std::vector<Change>& changes, const Dictionary& about) const;
 
     /// The entries, oldest first: `about` with "number", "settings" (a secret's value is "(secret)") and, for a write
@@ -65,7 +65,7 @@ class SettingsHistory {
     [[nodiscard]] std::optional<Error> keepOutsideEdit(const Dictionary& snapshot, const Dictionary& about) const;
     [[nodiscard]] std::optional<Error> add(const std::vector<HostPath>& files, Dictionary about,
                                            std::uint64_t& number) const;
-    [[nodiscard]] std::optional<Error> hideFormerValues(const std::vector<Change>& changes) const;
+    [[nodiscard]] std::optional<Error> hideFormerValues(const std::vector<const Change*>& secret) const;
 
     HostPath _directory;
     HostPath _resources;

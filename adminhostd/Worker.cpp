@@ -73,14 +73,15 @@ class ForwardingSink final : public LogSink, public ReportSink {
         }
     }
     void changed(Change change) override {
-        if (_changes.size() < changesMaximum) {
+        // Beyond the bound, secret ones are kept: the history must hide their former values.
+        if (_changes.size() < changesMaximum || change.secret) {
             _changes.push_back(change);
         }
         static_cast<void>(send(_descriptor, std::move(change)));
     }
     void notDone(NotDone part) override { static_cast<void>(send(_descriptor, std::move(part))); }
 
-    /// The changes that were reported since the last call, at most as many as a request's record keeps.
+    /// The changes that were reported since the last call: the secret ones, and the first ones up to a request's bound.
     [[nodiscard]] std::vector<Change> takeChanges() { return std::exchange(_changes, {}); }
 
   private:
@@ -371,7 +372,8 @@ void Worker::completeHistory(const LoadedPlugin& loaded, std::optional<std::uint
         return;
     }
     if (const auto error = history->keepResources(changes, about)) {
-        reportNoEntry(*error);
+        logEvent("adminhostd: the history of this write is incomplete: " + textOf(*error));
+        reportNotDone({"", "The history of this write is incomplete.", textOf(error->description)});
     }
     if (!entry) {
         return;

@@ -355,10 +355,9 @@ void Property::reportWritten(const Dictionary& working, bool isProtected) const 
         reportChange(*id, "protect", wasProtected, isProtected, {{"protect", wasProtected}});
     }
     for (const std::string_view key : {"name", "value"}) {
-        if (!_changeValues->contains(key)) {
-            continue;
-        }
-        if (key == "value" && (isProtected || wasProtected)) {
+        const bool isSent = _changeValues->contains(key);
+        // A value that becomes protected is reported even if it is not sent: the history hides its former values then.
+        if (key == "value" && (isSent ? isProtected || wasProtected : isProtected && !wasProtected)) {
             Change change;
             change.section = section();
             change.identity = *id;
@@ -366,6 +365,9 @@ void Property::reportWritten(const Dictionary& working, bool isProtected) const 
             change.key = key;
             change.secret = true;
             adminhost::reportChange(std::move(change));
+            continue;
+        }
+        if (!isSent) {
             continue;
         }
         const std::string before = adminhost::utf8Of(textOf(stored(key)));

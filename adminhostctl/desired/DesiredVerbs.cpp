@@ -112,8 +112,8 @@ constexpr std::array table = {
     Verb{"export", "[FILE]", "Write settings and lists to a TOML file", 0, 1, &exportState},
     Verb{"plan", "FILE [--password-file FILE]", "Show what applying the file would change", 1, 1, &planFile},
     Verb{"apply", "FILE [--password-file FILE]", "Change what differs from the file", 1, 1, &applyFile},
-    Verb{"history", "", "List the latest writes of settings: when, who and what changed", 0, 0, &history},
-    Verb{"rollback", "NUMBER", "Restore the settings as they were before a write", 1, 1, &rollback},
+    Verb{"history", "", "List the latest changes: when, who and what was changed", 0, 0, &history},
+    Verb{"rollback", "NUMBER", "Restore the settings as they were before a change", 1, 1, &rollback},
 };
 
 }  // namespace

@@ -1,11 +1,14 @@
 #pragma once
 
-// The verbs of the history: list what writes of settings changed, and restore former settings.
+// The verbs of the history: list what writes changed, and restore former settings.
 
 #include "adminhostctl/Verb.h"
 
 namespace adminhost::ctl {
 
+/// Prints the entries of the daemon's history, one row for each write and each edit outside the daemon. The other
+/// formats hold them as a list, oldest first: as the daemon returns them, changes of settings first, then those of
+/// elements (with "section"); an entry without settings has no number.
 [[nodiscard]] ExitStatus history(const Context& context, std::span<const std::string> arguments);
 /// Writes the settings of an entry, in the same way as every verb that changes something (Writing.h). A setting that is
 /// set now and was not set then keeps its value: it is named, and the status is failed. A secret also keeps its value,

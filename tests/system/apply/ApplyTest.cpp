@@ -31,7 +31,7 @@ class Apply : public ControlledService {
     [[nodiscard]] std::string refusal(const std::string& text) const {
         const ProgramResult apply = ctl({"apply", file("bad.toml", text)});
         EXPECT_EQ(apply.status, 2) << apply.output;
-        EXPECT_EQ(ctl({"history"}).output, "No settings have been written yet.\n");
+        EXPECT_EQ(ctl({"history"}).output, "No change has been recorded yet.\n");
         return apply.output;
     }
 };
@@ -44,7 +44,7 @@ TEST_F(Apply, ExportedStateIsNoChange) {
     const ProgramResult apply = ctl({"apply", exported});
     EXPECT_EQ(apply.status, 0);
     EXPECT_EQ(apply.output, "no change\n");
-    EXPECT_EQ(ctl({"history"}).output, "No settings have been written yet.\n");
+    EXPECT_EQ(ctl({"history"}).output, "No change has been recorded yet.\n");
 }
 
 TEST_F(Apply, NamesThatNeedQuotesOrAreNotUniqueAreExportedSoThatNothingChanges) {

@@ -10,6 +10,8 @@
 
 #include <csignal>
 #include <filesystem>
+#include <fstream>
+#include <iterator>
 #include <thread>
 
 #include <gmock/gmock.h>
@@ -20,7 +22,9 @@ namespace {
 
 using test::HttpReply;
 using test::ProgramResult;
+using testing::AnyOf;
 using testing::HasSubstr;
+using testing::Not;
 
 class Settings : public testing::Test {
   protected:
@@ -148,7 +152,7 @@ TEST_F(Settings, RequestThatAStatementCannotCarryIsRefusedWholeAndChangesNothing
     EXPECT_EQ(body.dictionary()->get("findings").array()->front().dictionary()->get("keyPath"),
               Value("configuration.properties.0.name"));
     EXPECT_EQ(root.sql("select * from properties"), before);
-    EXPECT_EQ(ctl({"history"}).output, "No settings have been written yet.\n");
+    EXPECT_EQ(ctl({"history"}).output, "No change has been recorded yet.\n");
 }
 
 TEST_F(Settings, HistoryTellsWhatEachWriteChangedAndRollbackGoesBackThroughTheSameWrite) {
@@ -157,14 +161,14 @@ TEST_F(Settings, HistoryTellsWhatEachWriteChangedAndRollbackGoesBackThroughTheSa
     const ProgramResult history = ctl({"history"});
     EXPECT_EQ(history.status, 0);
     EXPECT_THAT(history.output, HasSubstr("server_port: 8170 -> 9001"));
-    EXPECT_THAT(history.output, HasSubstr("nimbo_client_username: lumiogrid -> other"));
+    EXPECT_THAT(history.output, HasSubstr(R"(nimbo_client_username: "lumiogrid" -> "other")"));
 
     const ProgramResult rollback = ctl({"rollback", "1"});
     EXPECT_EQ(rollback.status, 0) << rollback.output;
     EXPECT_THAT(rollback.output, HasSubstr("server_port: 9001 -> 8170"));
     EXPECT_THAT(rollback.output, HasSubstr("has to be restarted"));
     EXPECT_EQ(ctl({"rollback", "1"}).output, "no change\n");
-    EXPECT_THAT(ctl({"history"}).output, HasSubstr("other -> lumiogrid"));
+    EXPECT_THAT(ctl({"history"}).output, HasSubstr(R"("other" -> "lumiogrid")"));
 }
 
 TEST_F(Settings, RollbackThatDoesNotTakeIsNamed) {
@@ -185,9 +189,11 @@ TEST_F(Settings, RollbackNamesSettingsThatWereNotSetThenAndNotesThatThePasswordS
     const ProgramResult rollback = ctl({"rollback", "1"});
     EXPECT_EQ(rollback.status, 1) << "not all of it could be restored";
     EXPECT_THAT(rollback.output, HasSubstr("settings.server_port: 9001 -> 8170\n"));
+    EXPECT_THAT(
+        rollback.output,
+        HasSubstr("settings.tunnel_agent_host: not set at that time; it cannot be removed and stays \"agent\"\n"));
     EXPECT_THAT(rollback.output,
-                HasSubstr("settings.tunnel_agent_host: not set at that time; it cannot be removed and stays agent\n"));
-    EXPECT_THAT(rollback.output, HasSubstr("settings.nimbo_client_password: not restored, a stored secret"));
+                HasSubstr("settings.nimbo_client_password: not restored, a stored secret cannot be written back\n"));
     EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8170\n");
     EXPECT_EQ(ctl({"settings", "get", "tunnel_agent_host"}).output, "agent\n");
 }
@@ -237,7 +243,7 @@ TEST_F(Settings, WhoisFindsPeopleAndGroupsByNameAndUuid) {
         EXPECT_THAT(whois.output, HasSubstr("/Local"));
     }
     const ProgramResult nobody = ctl({"whois", "nobody & nothing"});
-    EXPECT_EQ(nobody.status, 1);
+    EXPECT_EQ(nobody.status, 2);
     EXPECT_THAT(nobody.output, HasSubstr("nobody & nothing"));
 }
 
@@ -295,6 +301,106 @@ TEST_F(Settings, HistoryTellsWhatEachWriteChangedFromWhatWasEditedOutside) {
         Value(Array{Dictionary{
             {"key", "nimbo_client_password"}, {"secret", true}, {"from", "(secret)"}, {"to", "(secret) changed"}}}));
     EXPECT_THAT(*entries[2].dictionary()->get("who").string(), HasSubstr("uid "));
+}
+
+TEST_F(Settings, HistoryShowsEachWriteAndEachEditOutsideAsARowOfItsOwn) {
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
+    const std::string file = "/Library/SorvaneProducer/Shared/Server/member_preferences_" +
+                             test::SampleRoot::uuidOf("member", "media1") + ".plist";
+    std::string text = root.read(file);
+    ASSERT_NE(text.find("9001"), std::string::npos);
+    root.write(file, text.replace(text.find("9001"), 4, "9002"));
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"nimbo_client_password":"planted","properties":[)"
+                                    R"({"_newid_":true,"name":"two lines","value":"a"}]}})")
+                  .status,
+              200);
+    const std::string camera = root.sql("select name from cameras where (disabled != 't' or disabled is null) limit 1");
+    const std::string name = camera.substr(0, camera.find('\n'));
+    for (const char* state : {"off", "on"}) {
+        ASSERT_EQ(ctl({"camera", "access", name, state}).status, 0);
+    }
+    ASSERT_THAT(ctl({"camera", "deny", name, "anna"}).status, AnyOf(0, 2)) << "2: not in the list";
+    ASSERT_EQ(ctl({"camera", "allow", name, "anna"}).status, 0);
+
+    const ProgramResult history = ctl({"history"});
+    EXPECT_EQ(history.status, 0);
+    const auto lineWith = [&](const std::string& words) {
+        const std::size_t at = history.output.find(words);
+        const std::size_t begin = at == std::string::npos ? 0 : history.output.rfind('\n', at) + 1;
+        return at == std::string::npos ? "" : history.output.substr(begin, history.output.find('\n', at) - begin);
+    };
+    EXPECT_THAT(lineWith("server_port: 8170 -> 9001"), HasSubstr("(uid "));
+    EXPECT_THAT(lineWith("server_port: 9001 -> 9002"), HasSubstr("outside the daemon"));
+    EXPECT_THAT(lineWith("server_port: 9001 -> 9002"), HasSubstr("before "));
+    EXPECT_THAT(lineWith("nimbo_client_password: (secret) changed"), HasSubstr("(uid "));
+    EXPECT_THAT(lineWith("nimbo_client_password: (secret) changed"), Not(HasSubstr("server_port")));
+    EXPECT_THAT(history.output, HasSubstr("properties.\"two lines\": (not present) -> (present)\n"));
+    EXPECT_THAT(lineWith(".users.anna: (not"), HasSubstr("(uid "));
+    EXPECT_THAT(lineWith(".access_control: (not"), HasSubstr("cameras."));
+    EXPECT_THAT(history.output, Not(HasSubstr("planted")));
+
+    const auto list = parseJson(ctl({"--format", "json", "history"}).output);
+    ASSERT_TRUE(list && list->array() != nullptr);
+    const Array& entries = *list->array();
+    ASSERT_GE(entries.size(), 4U);
+    const auto changesOf = [&](std::size_t i) { return *entries[i].dictionary()->get("changes").array(); };
+    EXPECT_EQ(changesOf(0), (Array{Dictionary{{"key", "server_port"}, {"from", 8170}, {"to", 9001}}}));
+    EXPECT_EQ(entries[1].dictionary()->get("outside"), Value(true));
+    EXPECT_EQ(changesOf(1), (Array{Dictionary{{"key", "server_port"}, {"from", 9001}, {"to", 9002}}}));
+    ASSERT_EQ(changesOf(2).size(), 2U) << "one entry for a write of settings and properties";
+    EXPECT_EQ(changesOf(2)[0].dictionary()->get("to"), Value("(secret) changed"));
+    EXPECT_EQ(changesOf(2)[1].dictionary()->get("name"), Value("two lines"));
+    EXPECT_EQ(entries[2].dictionary()->get("number"), Value(3));
+    EXPECT_FALSE(entries.back().dictionary()->contains("number"));
+    EXPECT_EQ(changesOf(entries.size() - 1).back().dictionary()->get("to"), Value("anna"));
+
+    const ProgramResult rollback = ctl({"rollback", "2"});
+    EXPECT_EQ(rollback.status, 0) << rollback.output;
+    EXPECT_THAT(rollback.output, HasSubstr("settings.server_port: 9002 -> 9001\n"));
+    EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "9001\n");
+}
+
+TEST_F(Settings, HistoryShowsAWriteThatWasKilledAndLongValuesByTheirBeginning) {
+    const std::string value(100, 'x');
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_host":")" + value + R"("}})").status, 200);
+    EXPECT_THAT(ctl({"history"}).output, HasSubstr("xxx..."));
+    EXPECT_THAT(ctl({"history"}).output, Not(HasSubstr(value)));
+    const std::string about = "/var/lib/adminhostd/history/lumio/00000001/about.plist";
+    std::string text = root.read(about);
+    const std::size_t at = text.find("<key>changes</key>");
+    ASSERT_NE(at, std::string::npos);
+    root.write(about, text.replace(at, std::string("<key>changes</key>").size(), "<key>other</key>"));
+    EXPECT_THAT(ctl({"history"}).output, HasSubstr("not recorded"));
+}
+
+TEST_F(Settings, PropertyThatBecomesProtectedLeavesNoPlainValueInTheHistory) {
+    const auto change = [&](const std::string& entry) {
+        EXPECT_EQ(post("writeSettings", R"({"configuration":{"properties":[)" + entry + "]}}").status, 200);
+    };
+    change(R"({"_newid_":true,"name":"key","value":"planted-one"})");
+    const std::string id = root.sql("select id from properties where name='key'");
+    const std::string entry = R"({"_id_":")" + id.substr(0, id.find('\n')) + R"(",)";
+    change(entry + R"("value":"planted-two"})");
+    const auto filesWithPlainValue = [&] {
+        std::size_t count = 0;
+        const std::filesystem::path directory = root.disk("/var/lib/adminhostd/history");
+        for (const auto& file : std::filesystem::recursive_directory_iterator(directory)) {
+            if (!file.is_regular_file()) {
+                continue;
+            }
+            std::ifstream stream(file.path(), std::ios::binary);
+            const std::string bytes((std::istreambuf_iterator<char>(stream)), {});
+            count += bytes.find("planted-") == std::string::npos ? 0U : 1U;
+        }
+        return count;
+    };
+    ASSERT_EQ(filesWithPlainValue(), 1U) << "a plain value is kept";
+    ASSERT_THAT(daemon.connect().get("/v1/lumio/history").body, HasSubstr("planted-two"));
+
+    change(entry + R"("protect":true})");
+    EXPECT_EQ(filesWithPlainValue(), 0U);
+    EXPECT_THAT(daemon.connect().get("/v1/lumio/history").body, Not(HasSubstr("planted-")));
+    EXPECT_THAT(ctl({"history"}).output, HasSubstr("properties.key.value: (secret) changed"));
 }
 
 TEST_F(Settings, UnknownPluginHasNoHistory) {

@@ -197,6 +197,34 @@ TEST_F(HistoryTest, ValueThatBecomesSecretIsReplacedInAllKeptEntries) {
     EXPECT_EQ(entries[1].dictionary()->get("changes").array()->front().dictionary()->get("from"), Value("of another"));
 }
 
+TEST_F(HistoryTest, ValueThatIsSetAndBecomesSecretInOneRequestIsNotKept) {
+    ASSERT_FALSE(
+        history.keepResources({resourceChange("value", "first plain", "second plain"),
+                               resourceChange("value", nullptr, nullptr, true), resourceChange("name", "old", "new")},
+                              {}));
+    const Array entries = history.resourceEntries();
+    const Array& changes = *entries.at(0).dictionary()->get("changes").array();
+    ASSERT_EQ(changes.size(), 3U);
+    EXPECT_EQ(changes[0], Value(Dictionary{{"section", "properties"},
+                                           {"identity", "3"},
+                                           {"name", "watermark"},
+                                           {"key", "value"},
+                                           {"from", "(secret)"},
+                                           {"to", "(secret)"},
+                                           {"secret", true}}));
+    EXPECT_EQ(changes[2].dictionary()->get("from"), Value("old"));
+    EXPECT_EQ(root.read(std::string(directory) + "/resources/00000001.plist").find("plain"), std::string::npos);
+}
+
+TEST_F(HistoryTest, FormerValueThatCannotBeHiddenIsReportedAndTheNewEntryIsKept) {
+    ASSERT_FALSE(history.keepResources({resourceChange("value", "first plain", "second plain")}, {}));
+    fs::create_directories(root.path(std::string(directory) + "/resources/00000001.plist.new"));
+    const auto error = history.keepResources({resourceChange("value", nullptr, nullptr, true)}, {});
+    ASSERT_TRUE(error);
+    EXPECT_THAT(*error->description, HasSubstr("former values of a secret"));
+    EXPECT_EQ(history.resourceEntries().size(), 2U);
+}
+
 TEST_F(HistoryTest, EntriesOfTheFirstFormatAreReadAndThoseOfANewerOneAreSkippedWithOneLine) {
     const std::string place = directory;
     root.writePropertyList(place + "/00000001/0.plist",

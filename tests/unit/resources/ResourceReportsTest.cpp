@@ -124,8 +124,22 @@ TEST_F(PropertyReports, ChangesOfAPropertyAreReportedWithTheirUndo) {
                                              Change{"properties", "1", "m", "protect", false, true, false,
                                                     undoOf("properties", {{"_id_", "1"}, {"protect", false}})},
                                              Change{"properties", "1", "m", "value", nullptr, nullptr, true, nullptr},
+                                             Change{"properties", "1", "m", "value", nullptr, nullptr, true, nullptr},
                                              Change{"properties", "1", "", "", "1", nullptr, false, nullptr}));
     EXPECT_THAT(reports.parts, IsEmpty());
+}
+
+TEST_F(PropertyReports, ValueThatBecomesProtectedIsReportedAsSecretOnceWhetherOrNotItIsSent) {
+    sql("insert into properties(id,name,value,protect) values(1,'a','v','f'),(2,'b','w','f')");
+    process({{"_id_", "1"}, {"protect", true}});
+    process({{"_id_", "2"}, {"protect", true}, {"value", "x"}});
+    process({{"_id_", "2"}, {"protect", false}});
+    std::vector<std::string> keys;
+    for (const Change& change : reports.changes) {
+        keys.push_back(change.identity + '.' + change.key);
+        EXPECT_EQ(change.secret, change.key == "value");
+    }
+    EXPECT_THAT(keys, ElementsAre("1.protect", "1.value", "2.protect", "2.value", "2.protect"));
 }
 
 TEST_F(PropertyReports, PartsThatWereNotDoneAreReportedOnceEach) {
