@@ -19,9 +19,8 @@ constexpr long statusForbidden = 403;
 constexpr long statusInternal = 500;
 constexpr long statusTimeout = 504;
 
-std::string textAt(const Dictionary& dictionary, std::string_view key) {
-    const std::string* text = dictionary.get(key).string();
-    return text != nullptr ? shown(*text) : std::string();
+std::string shownText(const Dictionary& dictionary, std::string_view key) {
+    return shown(dictionary.text(key));
 }
 
 std::string findingsText(const Value& findings) {
@@ -29,8 +28,8 @@ std::string findingsText(const Value& findings) {
     if (const Array* array = findings.array()) {
         for (const Value& element : *array) {
             if (const Dictionary* finding = element.dictionary()) {
-                text += "\n  " + textAt(*finding, "keyPath") + ": " + textAt(*finding, "rule");
-                const std::string advice = textAt(*finding, "advice");
+                text += "\n  " + shownText(*finding, "keyPath") + ": " + shownText(*finding, "rule");
+                const std::string advice = shownText(*finding, "advice");
                 text += advice.empty() ? "" : " (" + advice + ")";
             }
         }
@@ -84,8 +83,8 @@ std::string messageOf(const DaemonReply& reply) {
     if (said == nullptr) {
         return "the daemon returned HTTP status " + std::to_string(reply.status);
     }
-    const std::string message = textAt(*said, "message");
-    const std::string code = textAt(*said, "error");
+    const std::string message = shownText(*said, "message");
+    const std::string code = shownText(*said, "error");
     // The message of a rejected request repeats the first finding.
     if (const std::string findings = findingsText(said->get("findings")); !findings.empty()) {
         return "the request was rejected, and nothing was changed (" + code + "):" + findings;

@@ -3,11 +3,6 @@
 namespace adminhost::ctl {
 namespace {
 
-std::string textAt(const Dictionary& dictionary, std::string_view key) {
-    const std::string* text = dictionary.get(key).string();
-    return text != nullptr ? *text : std::string();
-}
-
 std::vector<std::string> textsAt(const Dictionary& dictionary, std::string_view key) {
     std::vector<std::string> texts;
     const Array* array = dictionary.get(key).array();
@@ -27,34 +22,34 @@ void Description::Keys::add(const Value& described) {
         return;
     }
     DescribedKey description;
-    description.path = textAt(*key, "path");
-    description.type = textAt(*key, "type");
-    description.enteredAs = textAt(*key, "enteredAs");
-    description.unit = textAt(*key, "unit");
-    description.column = textAt(*key, "column");
-    description.help = textAt(*key, "help");
+    description.path = key->text("path");
+    description.type = key->text("type");
+    description.enteredAs = key->text("enteredAs");
+    description.unit = key->text("unit");
+    description.column = key->text("column");
+    description.help = key->text("help");
     description.secret = key->get("secret").boolean().value_or(false);
     description.required = key->get("required").boolean().value_or(false);
     description.allowed = textsAt(*key, "allowed");
     description.title = textsAt(*key, "title");
-    description.kind = textAt(*key, "kind");
-    description.section = textAt(*key, "section");
-    description.file = textAt(*key, "file");
+    description.kind = key->text("kind");
+    description.section = key->text("section");
+    description.file = key->text("file");
     description.locates = textsAt(*key, "locates");
     description.restart = textsAt(*key, "restart");
-    description.lookedUp = textAt(*key, "lookedUp");
-    description.shownBy = textAt(*key, "shownBy");
-    description.identity = textAt(*key, "identity");
-    description.label = textAt(*key, "label");
+    description.lookedUp = key->text("lookedUp");
+    description.shownBy = key->text("shownBy");
+    description.identity = key->text("identity");
+    description.label = key->text("label");
     description.byIdentity = key->get("byIdentity").boolean().value_or(false);
-    description.addedBy = textAt(*key, "addedBy");
-    description.removedBy = textAt(*key, "removedBy");
-    description.unlisted = textAt(*key, "unlisted");
-    description.inFile = textAt(*key, "inFile");
-    description.secretIf = textAt(*key, "secretIf");
+    description.addedBy = key->text("addedBy");
+    description.removedBy = key->text("removedBy");
+    description.unlisted = key->text("unlisted");
+    description.inFile = key->text("inFile");
+    description.secretIf = key->text("secretIf");
     if (const Dictionary* kinds = key->get("kinds").dictionary()) {
         for (const DictionaryEntry& kind : *kinds) {
-            description.kinds.emplace_back(kind.key, textAt(*kinds, kind.key));
+            description.kinds.emplace_back(kind.key, kinds->text(kind.key));
         }
     }
     index.emplace(description.path, all.size());
@@ -67,11 +62,11 @@ const DescribedKey* Description::Keys::find(std::string_view path) const noexcep
 }
 
 Description::Description(const Dictionary& command)
-    : _name(textAt(command, "name")),
-      _summary(textAt(command, "summary")),
-      _text(textAt(command, "description")),
+    : _name(command.text("name")),
+      _summary(command.text("summary")),
+      _text(command.text("description")),
       _changes(command.get("access") != Value("read")),
-      _state(textAt(command, "state")) {
+      _state(command.text("state")) {
     if (const Array* keys = command.get("keys").array()) {
         for (const Value& key : *keys) {
             _keys.add(key);

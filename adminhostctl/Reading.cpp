@@ -9,6 +9,7 @@
 #include <charconv>
 #include <ctime>
 #include <optional>
+#include <string_view>
 #include <vector>
 
 #include <fmt/format.h>
@@ -79,16 +80,12 @@ std::string dateText(Date date) {
 }
 
 std::string personText(const DescribedKey& element, const Dictionary& entry) {
-    const auto textAt = [&](const std::string& key) {
-        const std::string* text = entry.get(key).string();
-        return text != nullptr ? *text : std::string();
-    };
-    const std::string kind = textAt(element.kind);
+    const std::string_view kind = entry.text(element.kind);
     if (kind.empty()) {
         return {};
     }
     for (const std::string& key : element.title) {
-        if (const std::string text = textAt(key); !text.empty()) {
+        if (const std::string_view text = entry.text(key); !text.empty()) {
             return shown(text) + " (" + shown(kind) + ")";
         }
     }

@@ -6,7 +6,7 @@
 #include "platform/files/ReplaceFile.h"
 #include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -3,7 +3,7 @@
 
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
-#include "platform/value/Text.h"
+#include "platform/value/ValueText.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
