@@ -145,6 +145,11 @@ Array changesBetween(const Dictionary& before, const Dictionary& after, const st
     return changes;
 }
 
+/// The name of the copy of the settings file with this index.
+std::string copyName(std::size_t file) {
+    return std::to_string(file) + ".plist";
+}
+
 /// Copies the files that exist and can be read.
 std::optional<Error> copy(const std::vector<HostPath>& files, const HostPath& entry, Array& kept) {
     for (std::size_t i = 0; i < files.size(); ++i) {
@@ -156,7 +161,7 @@ std::optional<Error> copy(const std::vector<HostPath>& files, const HostPath& en
             // The operation that replaces an unreadable file keeps it; the entry has the other files.
             continue;
         }
-        const std::string name = std::to_string(i) + ".plist";
+        const std::string name = copyName(i);
         if (auto error = writePlainly(*bytes, below(entry, name))) {
             return error;
         }
@@ -179,14 +184,16 @@ std::optional<Dictionary> wholeEntry(const HostPath& entry) {
     return about;
 }
 
-/// The settings of an entry of the first format, which had them only in the files.
+/// The settings of an entry of the first format, which had them only in the files. Each file contributes only the
+/// settings that it stores: the same key in another file is not managed, and must not be restored as the setting.
 Dictionary settingsOfFiles(const HostPath& entry, const Dictionary& about, const std::vector<Setting>& settings) {
     Dictionary values;
     const Array* files = about.get("files").array();
     for (std::size_t i = 0; files != nullptr && i < files->size(); ++i) {
-        const auto content = readDictionary(below(entry, *(*files)[i].dictionary()->get("name").string()));
+        const std::string& name = *(*files)[i].dictionary()->get("name").string();
+        const auto content = readDictionary(below(entry, name));
         for (const Setting& setting : settings) {
-            if (content && content->contains(setting.key)) {
+            if (content && name == copyName(setting.file) && content->contains(setting.key)) {
                 values.set(setting.key, setting.secret ? Value(hidden) : content->get(setting.key));
             }
         }

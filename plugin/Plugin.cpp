@@ -12,6 +12,7 @@
 #include <chrono>
 #include <iterator>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace {
@@ -26,6 +27,11 @@ struct Operation {
 };
 
 constexpr std::string_view passwordKey = "nimbo_client_password";
+
+// Indices in settingsFiles().
+constexpr std::size_t identityFile = 0;
+constexpr std::size_t clusterFile = 1;
+constexpr std::size_t memberFile = 2;
 
 constexpr Operation operations[] = {
     {"readSettings", [](LumioRequestHandler& h, const Dictionary& r) { return h.readSettingsWithRequest(r); }},
@@ -108,14 +114,14 @@ class LumioPlugin final : public adminhost::Plugin {
 
     std::vector<adminhost::Setting> settingKeys() override {
         std::vector<adminhost::Setting> settings;
-        for (const auto& keys :
-             {LumioRequestHandler::identityPreferencesKeysToCopy(), LumioRequestHandler::memberPreferencesKeysToCopy(),
-              LumioRequestHandler::clusterPreferencesKeysToCopy()}) {
+        for (const auto& [keys, file] : {std::pair(LumioRequestHandler::identityPreferencesKeysToCopy(), identityFile),
+                                         std::pair(LumioRequestHandler::memberPreferencesKeysToCopy(), memberFile),
+                                         std::pair(LumioRequestHandler::clusterPreferencesKeysToCopy(), clusterFile)}) {
             for (const std::string_view key : keys) {
-                settings.push_back({std::string(key), false});
+                settings.push_back({std::string(key), false, file});
             }
         }
-        settings.push_back({std::string(passwordKey), true});
+        settings.push_back({std::string(passwordKey), true, clusterFile});
         return settings;
     }
 
@@ -132,6 +138,7 @@ class LumioPlugin final : public adminhost::Plugin {
         return values;
     }
 
+    /// In the order of identityFile, clusterFile and memberFile.
     std::vector<adminhost::HostPath> settingsFiles() override {
         return {LumioRequestHandler::identityPreferencesPath(), LumioRequestHandler::clusterPreferencesPath(),
                 LumioRequestHandler::memberPreferencesPath()};

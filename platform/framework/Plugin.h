@@ -16,6 +16,7 @@
 #include "platform/value/Value.h"
 
 #include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <string>
 #include <string_view>
@@ -75,6 +76,7 @@ struct ADMINHOST_EXPORT Diagnosis {
 struct ADMINHOST_EXPORT Setting {
     std::string key;
     bool secret = false;
+    std::size_t file = 0;  ///< index in Plugin::settingsFiles() of the file that stores it
 };
 
 /// A log file of the service.

@@ -154,7 +154,7 @@ class SmallPlugin final : public adminhost::Plugin {
         return std::to_string(std::hash<std::string>()(all));
     }
 
-    std::vector<adminhost::Setting> settingKeys() override { return {{"greeting", false}, {secretKey, true}}; }
+    std::vector<adminhost::Setting> settingKeys() override { return {{"greeting", false, 0}, {secretKey, true, 0}}; }
     adminhost::Result<Dictionary> settings() override { return stored(); }
     std::vector<HostPath> settingsFiles() override { return {settingsFile()}; }
     std::vector<adminhost::LogFile> logs() override { return {{"log", HostPath("/var/log/beacon.log")}}; }

@@ -241,6 +241,28 @@ TEST_F(HistoryTest, EntriesOfTheFirstFormatAreReadAndThoseOfANewerOneAreSkippedW
     EXPECT_THAT(log.lines, ElementsAre(HasSubstr("2 entries of the history were written by a newer release")));
 }
 
+TEST_F(HistoryTest, FileOfAnEntryOfTheFirstFormatContributesOnlyTheKeysOfItsOwnTable) {
+    const std::string place = directory;
+    root.writePropertyList(place + "/00000001/0.plist", "<key>a</key><integer>1</integer>");
+    root.writePropertyList(place + "/00000001/1.plist",
+                           "<key>a</key><string>unmanaged</string><key>c</key><integer>3</integer>");
+    // The file with index 0 did not exist.
+    root.writePropertyList(place + "/00000002/1.plist",
+                           "<key>a</key><string>unmanaged</string><key>c</key><integer>4</integer>");
+    const std::string second =
+        "<dict><key>path</key><string>/two.plist</string><key>name</key>"
+        "<string>1.plist</string></dict></array>";
+    root.writePropertyList(place + "/00000001/about.plist",
+                           "<key>files</key><array><dict><key>path</key><string>/one.plist</string><key>name</key>"
+                           "<string>0.plist</string></dict>" +
+                               second);
+    root.writePropertyList(place + "/00000002/about.plist", "<key>files</key><array>" + second);
+    const SettingsHistory two("lumio", {{"a", false, 0}, {"c", false, 1}});
+    EXPECT_EQ(two.settingsEntries(),
+              (Array{Value(Dictionary{{"number", 1}, {"settings", Dictionary{{"a", 1}, {"c", 3}}}}),
+                     Value(Dictionary{{"number", 2}, {"settings", Dictionary{{"c", 4}}}})}));
+}
+
 TEST_F(HistoryTest, UnfinishedEntryOfAKilledProcessIsRemovedAndNoEntry) {
     root.write(std::string(directory) + "/unfinished-1/0.plist", "half");
     EXPECT_EQ(history.settingsEntries(), Array{});

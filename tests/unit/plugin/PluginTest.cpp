@@ -133,13 +133,21 @@ TEST_F(PluginTable, SettingsAreTheManagedKeysAsReadingShowsThemAndThePasswordAsI
                                      {"nimbo_client_password", "stored form"}}));
     std::vector<std::string> secrets;
     std::vector<std::string> keys;
+    std::map<std::string, std::size_t> fileOf;
     for (const Setting& setting : plugin->settingKeys()) {
+        fileOf.emplace(setting.key, setting.file);
         keys.push_back(setting.key);
         if (setting.secret) {
             secrets.push_back(setting.key);
         }
     }
     EXPECT_THAT(secrets, ElementsAre("nimbo_client_password"));
+    EXPECT_THAT(plugin->settingsFiles(), ElementsAre(HostPath("/Library/Preferences/com.brenn.lumioserverd.plist"),
+                                                     HostPath("/s/Server/cluster_preferences.plist"),
+                                                     HostPath("/s/Server/member_preferences_M.plist")));
+    EXPECT_THAT(fileOf,
+                testing::IsSupersetOf(std::map<std::string, std::size_t>{
+                    {"member_uuid", 0}, {"server_port", 2}, {"nimbo_grid_id", 1}, {"nimbo_client_password", 1}}));
     for (const DictionaryEntry& entry : *settings) {
         EXPECT_THAT(keys, testing::Contains(entry.key));
     }
