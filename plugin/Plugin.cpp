@@ -4,6 +4,7 @@
 
 #include "commands/CommandTable.h"
 #include "handler/LumioRequestHandler.h"
+#include "platform/files/Path.h"
 #include "platform/framework/Report.h"
 #include "settings/DatabaseTool.h"
 #include "settings/Revision.h"
@@ -11,6 +12,7 @@
 #include <algorithm>
 #include <chrono>
 #include <iterator>
+#include <optional>
 #include <string>
 #include <utility>
 #include <vector>
@@ -63,6 +65,12 @@ bool isOnlyRead(std::string_view keyPath) {
     const auto keys = LumioRequestHandler::keysThatAreOnlyRead();
     return keyPath.starts_with(configuration) &&
            std::find(keys.begin(), keys.end(), keyPath.substr(configuration.size())) != keys.end();
+}
+
+/// The file that reading takes: an entry of the name on the shared file system, readable or not; else the cached copy.
+adminhost::Result<std::optional<Dictionary>> storedOrCached(const adminhost::HostPath& path,
+                                                            const adminhost::HostPath& cached) {
+    return LumioRequestHandler::stored(adminhost::exists(adminhost::diskPath(path)) ? path : cached);
 }
 
 class LumioPlugin final : public adminhost::Plugin {
@@ -125,15 +133,33 @@ class LumioPlugin final : public adminhost::Plugin {
         return settings;
     }
 
+    /// Reading shows a file that it cannot read as one without settings. In the history that would look like an edit
+    /// that removed them all, so this fails instead.
     adminhost::Result<Dictionary> settings() override {
-        Dictionary values;
-        _handler.copyIdentityPreferencesToConfig(values);
-        if (const auto prefs = LumioRequestHandler::memberPreferences()) {
-            LumioRequestHandler::copyKeys(LumioRequestHandler::memberPreferencesKeysToCopy(), *prefs, values);
+        const auto identity = LumioRequestHandler::storedIdentity();
+        if (!identity) {
+            return adminhost::failure(identity.error());
         }
-        if (const auto prefs = LumioRequestHandler::clusterPreferences()) {
-            LumioRequestHandler::copyKeys(LumioRequestHandler::clusterPreferencesKeysToCopy(), *prefs, values);
-            LumioRequestHandler::copyKeys({passwordKey}, *prefs, values);  // protected, as it is stored
+        const auto member = storedOrCached(LumioRequestHandler::memberPreferencesPath(*identity),
+                                           LumioRequestHandler::cachedMemberPreferencesPath());
+        if (!member) {
+            return adminhost::failure(member.error());
+        }
+        const auto cluster = storedOrCached(LumioRequestHandler::clusterPreferencesPath(*identity),
+                                            LumioRequestHandler::cachedClusterPreferencesPath());
+        if (!cluster) {
+            return adminhost::failure(cluster.error());
+        }
+        Dictionary values;
+        for (const auto& [keys, file] : {std::pair(LumioRequestHandler::identityPreferencesKeysToCopy(), &*identity),
+                                         std::pair(LumioRequestHandler::memberPreferencesKeysToCopy(), &*member),
+                                         std::pair(LumioRequestHandler::clusterPreferencesKeysToCopy(), &*cluster)}) {
+            if (*file) {
+                LumioRequestHandler::copyKeys(keys, **file, values);
+            }
+        }
+        if (*cluster) {
+            LumioRequestHandler::copyKeys({passwordKey}, **cluster, values);  // protected, as it is stored
         }
         return values;
     }

@@ -153,5 +153,26 @@ TEST_F(PluginTable, SettingsAreTheManagedKeysAsReadingShowsThemAndThePasswordAsI
     }
 }
 
+TEST_F(PluginTable, SettingsFileThatExistsButCannotBeReadFailsTheSettingsWithItsPath) {
+    const std::string identity = "/Library/Preferences/com.brenn.lumioserverd.plist";
+    const std::string content =
+        "<key>shared_filesystem</key><string>/s</string>"
+        "<key>member_uuid</key><string>M</string>";
+    for (const std::string& path : {identity, std::string("/s/Server/cluster_preferences.plist"),
+                                    std::string("/s/Server/member_preferences_M.plist"),
+                                    std::string("/var/lumio/server/cached_cluster_preferences.plist")}) {
+        root.writePropertyList(identity, content);
+        root.write(path, "half of a pro");
+        const auto settings = plugin->settings();
+        ASSERT_FALSE(settings) << path;
+        EXPECT_THAT(settings.error().description.value_or(""), testing::HasSubstr(path));
+        std::filesystem::remove(root.path(path));
+    }
+    root.writePropertyList(identity, content);
+    const auto settings = plugin->settings();
+    ASSERT_TRUE(settings) << "a missing file is not an error";
+    EXPECT_EQ(*settings, (Dictionary{{"member_uuid", "M"}, {"shared_filesystem", "/s"}}));
+}
+
 }  // namespace
 }  // namespace adminhost
