@@ -33,6 +33,14 @@ HostPath below(const HostPath& directory, std::string_view name) {
     return HostPath(directory.text() + '/' + std::string(name));
 }
 
+HostPath directoryOf(std::string_view plugin) {
+    return HostPath("/var/lib/adminhostd/history/" + std::string(plugin));
+}
+
+HostPath resourcesOf(const HostPath& directory) {
+    return below(directory, "resources");
+}
+
 HostPath entryOf(const HostPath& directory, std::uint64_t number) {
     return below(directory, fmt::format("{:08}", number));
 }
@@ -249,9 +257,7 @@ Dictionary dictionaryOf(const Change& change) {
 }  // namespace
 
 SettingsHistory::SettingsHistory(std::string_view plugin, std::vector<Setting> settings)
-    : _directory("/var/lib/adminhostd/history/" + std::string(plugin)),
-      _resources(below(_directory, "resources")),
-      _settings(std::move(settings)) {}
+    : _directory(directoryOf(plugin)), _resources(resourcesOf(_directory)), _settings(std::move(settings)) {}
 
 Result<std::string> SettingsHistory::digestKey() const {
     constexpr std::size_t size = 32;
@@ -495,6 +501,39 @@ void SettingsHistory::removeUnfinished() const {
             removeAll(below(_directory, name));
         }
     }
+}
+
+FormerValues::FormerValues(std::string_view plugin) : _resources(resourcesOf(directoryOf(plugin))) {}
+
+void FormerValues::hide(const Change& change) {
+    if (!_plain) {
+        // One reading for all changes of the operation: with all entries kept it takes a while.
+        _plain.emplace();
+        for (const std::uint64_t number : numbersIn(_resources)) {
+            const auto entry = readDictionary(resourceEntryOf(_resources, number));
+            const Array* changes = entry ? entry->get("changes").array() : nullptr;
+            for (std::size_t i = 0; changes != nullptr && i < changes->size(); ++i) {
+                const Dictionary* kept = (*changes)[i].dictionary();
+                if (kept != nullptr && kept->get("secret") != Value(true)) {
+                    (*_plain)[{textOf(kept->get("section")), textOf(kept->get("identity")), textOf(kept->get("key"))}]
+                        .insert(number);
+                }
+            }
+        }
+    }
+    const auto found = _plain->find({change.section, change.identity, change.key});
+    if (change.identity.empty() || found == _plain->end()) {
+        return;
+    }
+    for (const std::uint64_t number : found->second) {
+        const HostPath file = resourceEntryOf(_resources, number);
+        auto entry = readDictionary(file);
+        Value* list = entry ? entry->find("changes") : nullptr;
+        if (list != nullptr && list->array() != nullptr && hideIn(*list->array(), {&change})) {
+            static_cast<void>(replacePlainly(*entry, file));
+        }
+    }
+    _plain->erase(found);
 }
 
 }  // namespace adminhost

@@ -1,5 +1,7 @@
 #include "adminhostd/Worker.h"
 
+#include "adminhostd/ForwardingSink.h"
+#include "adminhostd/Frame.h"
 #include "adminhostd/Login.h"
 #include "adminhostd/PluginCall.h"
 #include "adminhostd/PluginFile.h"
@@ -49,47 +51,6 @@ constexpr auto probeBound = std::chrono::seconds(5);
 bool send(int descriptor, protocol::ToFront message) {
     return writeFrame(descriptor, protocol::frameOf(std::move(message)));
 }
-
-/// Passes events and reports on to the front when they happen. The front writes the system log and keeps both with the
-/// request's record. They are lost only together with the front itself.
-class ForwardingSink final : public LogSink, public ReportSink {
-  public:
-    explicit ForwardingSink(int descriptor) : _descriptor(descriptor) {
-        setLogSink(*this);
-        setReportSink(this);
-    }
-    ForwardingSink(const ForwardingSink&) = delete;
-    ForwardingSink& operator=(const ForwardingSink&) = delete;
-    ~ForwardingSink() override {
-        setReportSink(nullptr);
-        setLogSink(standardErrorSink());
-    }
-
-    void write(std::string_view event) noexcept override {
-        try {
-            static_cast<void>(send(_descriptor, protocol::Log{std::string(event)}));
-        } catch (...) {
-            return;
-        }
-    }
-    void changed(Change change) override {
-        // Beyond the bound, secret ones are kept: the history must hide their former values.
-        if (_changes.size() < changesMaximum || change.secret) {
-            _changes.push_back(change);
-        }
-        static_cast<void>(send(_descriptor, std::move(change)));
-    }
-    void notDone(NotDone part) override { static_cast<void>(send(_descriptor, std::move(part))); }
-
-    /// The changes that were reported since the last call: the secret ones, and the first ones up to a request's bound.
-    [[nodiscard]] std::vector<Change> takeChanges() { return std::exchange(_changes, {}); }
-
-  private:
-    static constexpr std::size_t changesMaximum = 1000;
-
-    int _descriptor;
-    std::vector<Change> _changes;
-};
 
 class Worker {
   public:
@@ -442,7 +403,7 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
                            {"command", order.command},
                            {"request", order.request}};
     const std::optional<std::uint64_t> entry = order.keepsHistory ? keepHistory(loaded, about) : std::nullopt;
-    static_cast<void>(_sink.takeChanges());
+    _sink.beginOperation(loaded.name);
     auto response = callPlugin([&] { return plugin.perform(order.command, order.arguments); });
     completeHistory(loaded, entry, about);
     if (!response) {

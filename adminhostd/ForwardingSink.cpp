@@ -1,0 +1,60 @@
+#include "adminhostd/ForwardingSink.h"
+
+#include "adminhostd/Frame.h"
+#include "adminhostd/Protocol.h"
+
+#include <string>
+#include <utility>
+
+namespace adminhost {
+namespace {
+
+void send(int descriptor, protocol::ToFront message) {
+    static_cast<void>(writeFrame(descriptor, protocol::frameOf(std::move(message))));
+}
+
+}  // namespace
+
+ForwardingSink::ForwardingSink(int descriptor) : _descriptor(descriptor) {
+    setLogSink(*this);
+    setReportSink(this);
+}
+
+ForwardingSink::~ForwardingSink() {
+    setReportSink(nullptr);
+    setLogSink(standardErrorSink());
+}
+
+void ForwardingSink::beginOperation(std::string_view plugin) {
+    _changes.clear();
+    _former.emplace(plugin);
+}
+
+std::vector<Change> ForwardingSink::takeChanges() {
+    return std::exchange(_changes, {});
+}
+
+void ForwardingSink::write(std::string_view event) noexcept {
+    try {
+        send(_descriptor, protocol::Log{std::string(event)});
+    } catch (...) {
+        return;
+    }
+}
+
+void ForwardingSink::changed(Change change) {
+    if (change.secret && _former) {
+        _former->hide(change);
+    }
+    // Beyond the bound, secret ones are kept: their former values are hidden once more when the entry is added.
+    if (change.secret || _changes.size() < changesMaximum) {
+        _changes.push_back(change);
+    }
+    send(_descriptor, std::move(change));
+}
+
+void ForwardingSink::notDone(NotDone part) {
+    send(_descriptor, std::move(part));
+}
+
+}  // namespace adminhost

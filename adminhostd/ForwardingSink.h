@@ -1,0 +1,47 @@
+#pragma once
+
+// The worker's end of its log and of its operations' reports.
+//
+// Events and reports are passed on to the front when they happen. The front writes the system log and keeps both with
+// the request's record. They are lost only together with the front itself.
+
+#include "adminhostd/SettingsHistory.h"
+#include "platform/framework/Report.h"
+#include "platform/log/Log.h"
+
+#include <cstddef>
+#include <optional>
+#include <string_view>
+#include <vector>
+
+namespace adminhost {
+
+/// The process's log and report sink while it lives.
+class ForwardingSink final : public LogSink, public ReportSink {
+  public:
+    /// As many as a request's record keeps.
+    static constexpr std::size_t changesMaximum = 1000;
+
+    explicit ForwardingSink(int descriptor);
+    ForwardingSink(const ForwardingSink&) = delete;
+    ForwardingSink& operator=(const ForwardingSink&) = delete;
+    ~ForwardingSink() override;
+
+    /// The reports from now on are of an operation of this plug-in.
+    void beginOperation(std::string_view plugin);
+    /// The changes of the operation: at most changesMaximum, and all secret ones above it. They are then forgotten.
+    [[nodiscard]] std::vector<Change> takeChanges();
+
+    void write(std::string_view event) noexcept override;
+    /// A secret change first hides the former values in the plug-in's history: neither a worker that is killed in the
+    /// middle of the operation nor the number of its changes may leave one readable.
+    void changed(Change change) override;
+    void notDone(NotDone part) override;
+
+  private:
+    int _descriptor;
+    std::vector<Change> _changes;
+    std::optional<FormerValues> _former;
+};
+
+}  // namespace adminhost
