@@ -75,7 +75,10 @@ int check(const Options& options) {
     }
     try {
         const PluginSelection plugins = selectPlugins(options);
-        const ToolConfiguration tools(std::filesystem::temp_directory_path().string());
+        // Beside the socket, where the next start of the daemon removes what a killed check has left.
+        const std::string parent = privateParent(options);
+        const bool writable = ::access(parent.c_str(), W_OK | X_OK) == 0;
+        const ToolConfiguration tools(writable ? parent : std::filesystem::temp_directory_path().string());
         std::string problem;
         protocol::Configure configuration = workerConfiguration(options, plugins, tools.directory());
         configuration.tryOnly = true;

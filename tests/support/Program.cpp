@@ -74,4 +74,14 @@ ProgramResult runProgram(const std::vector<std::string>& command, Errors errors,
     return result;
 }
 
+std::string namespaceProblem() {
+    const ProgramResult result =
+        runProgram({"/usr/bin/unshare", "--map-root-user", "--mount", "/bin/true"}, Errors::merge);
+    return result.status == 0
+               ? std::string()
+               : result.output + "This test needs user and mount namespaces: allow them " +
+                     "(sysctl kernel.unprivileged_userns_clone=1; in a container its option for unshare " +
+                     "and mount, such as an unconfined seccomp profile)";
+}
+
 }  // namespace adminhost::test

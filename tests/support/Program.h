@@ -21,4 +21,8 @@ enum class Errors { pass, merge };  ///< standard error: to the test's own, or i
 [[nodiscard]] ProgramResult runProgram(const std::vector<std::string>& command, Errors errors = Errors::pass,
                                        std::optional<std::string_view> input = std::nullopt);
 
+/// Why this account cannot create user and mount namespaces, and what to allow; empty if it can. A test that needs them
+/// fails with this text.
+[[nodiscard]] std::string namespaceProblem();
+
 }  // namespace adminhost::test

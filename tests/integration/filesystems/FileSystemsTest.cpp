@@ -4,6 +4,7 @@
 #include "adminhostd/SettingsHistory.h"
 #include "handler/LumioRequestHandler.h"
 #include "platform/plist/PropertyList.h"
+#include "tests/support/Program.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <array>
@@ -288,6 +289,9 @@ void enterNamespace(int argc, char** argv) {
     constexpr const char* inside = "ADMINHOST_TEST_NAMESPACE";
     if (std::getenv(inside) != nullptr) {
         return;
+    }
+    if (const std::string problem = adminhost::test::namespaceProblem(); !problem.empty()) {
+        throw std::runtime_error(problem);
     }
     ::setenv(inside, "1", 1);
     std::string program = fs::read_symlink("/proc/self/exe");

@@ -269,6 +269,7 @@ TEST_F(DatabaseNeed, MissingDatabaseRefusesNothing) {
 }
 
 TEST_F(DatabaseNeed, StartFileInTheHomeDirectoryOfTheAccountIsNamedBeforeEachRequest) {
+    ASSERT_EQ(namespaceProblem(), "");
     // The account database of a mount namespace has another home directory for the account.
     const std::string home = root.disk("/home-of-account");
     const std::string accounts = root.disk("/passwd");
