@@ -233,14 +233,18 @@ Result<StartedChild> startChild(const ChildPlan& plan) {
     if (plan.rights && dumpable == 1) {
         ::prctl(PR_SET_DUMPABLE, dumpable);  // dropping rights has cleared it for the memory that the child shared
     }
-    reporter.close();
+    if (::close(reporter.release()) != 0) {
+        // The end may still be open and keep the pipe from ending. Whatever the child had to report is in the pipe by
+        // now.
+        ::fcntl(report.get(), F_SETFL, O_NONBLOCK);
+    }
     int number = 0;
     ssize_t read = 0;
     do {
         read = ::read(report.get(), &number, sizeof number);
     } while (read < 0 && errno == EINTR);
     StartedChild started{pid, FileDescriptor()};
-    if (read == 0) {  // the pipe was closed by the execution of the program
+    if (read == 0 || (read < 0 && errno == EAGAIN)) {  // the program's execution closed the child's end unused
         // The C library declares its wrapper without C linkage.
         started.exit = FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
         if (started.exit.isOpen()) {
