@@ -43,11 +43,14 @@ struct ChildSide {
     pid_t parent;
 };
 
+// Known to both compilers in this form only.
+#define NOT_INSTRUMENTED __attribute__((no_sanitize("address", "undefined")))
+
 // From the birth of the child to the start of its program: no allocation, no lock, no C++ library, because the child
 // uses our memory. Not instrumented, because the sanitizer would record this stack as ours.
 
 /// Registers the child. Until that is done it must not outlive its parent: no process would know of it.
-[[gnu::no_sanitize("address", "undefined")]] bool enter(const ChildSide& side) {
+NOT_INSTRUMENTED bool enter(const ChildSide& side) {
     if (side.registration == nullptr) {
         return true;
     }
@@ -59,7 +62,7 @@ struct ChildSide {
 }
 
 /// The descriptors, the directory and the umask. The sources are all above the numbers that they go to.
-[[gnu::no_sanitize("address", "undefined")]] bool place(const ChildSide& side) {
+NOT_INSTRUMENTED bool place(const ChildSide& side) {
     for (int number = 0; number < side.descriptorCount; ++number) {
         int source = side.descriptors[number];
         if (source < 0) {
@@ -84,7 +87,7 @@ struct ChildSide {
 }
 
 /// By raw calls: those of the C library would change every thread of ours.
-[[gnu::no_sanitize("address", "undefined")]] bool drop(const ChildSide& side) {
+NOT_INSTRUMENTED bool drop(const ChildSide& side) {
     if (side.rights == nullptr) {
         return true;
     }
@@ -95,7 +98,7 @@ struct ChildSide {
 }
 
 /// Last, so that no handler of ours runs in the child: every signal has been blocked so far.
-[[gnu::no_sanitize("address", "undefined")]] bool signals() {
+NOT_INSTRUMENTED bool signals() {
     const unsigned long standard[8] = {};  // at least the kernel's struct sigaction: default action, no flags
     for (int number = 1; number < NSIG; ++number) {
         ::syscall(SYS_rt_sigaction, number, standard, nullptr, sizeof(KernelSignals));  // two may not be changed
@@ -104,11 +107,11 @@ struct ChildSide {
     return ::syscall(SYS_rt_sigprocmask, SIG_SETMASK, &none, nullptr, sizeof none) == 0;
 }
 
-[[gnu::no_sanitize("address", "undefined")]] bool prepare(const ChildSide& side) {
+NOT_INSTRUMENTED bool prepare(const ChildSide& side) {
     return ::syscall(SYS_setpgid, 0, 0) == 0 && enter(side) && place(side) && drop(side) && signals();
 }
 
-[[gnu::no_sanitize("address", "undefined")]] int runChild(void* argument) {
+NOT_INSTRUMENTED int runChild(void* argument) {
     const auto* side = static_cast<const ChildSide*>(argument);
     if (prepare(*side)) {
         ::syscall(SYS_execve, side->program, side->arguments, side->environment);

@@ -115,8 +115,11 @@ void DaemonProcess::end() {
         ::kill(_pid, SIGKILL);
         wait();
     }
-    std::error_code ignored;
-    std::filesystem::remove_all(_directory, ignored);
+    // A worker that is still ending may create and remove files meanwhile.
+    std::error_code error;
+    for (int tries = 0; std::filesystem::remove_all(_directory, error), error && tries < 500; ++tries) {
+        ::usleep(10'000);
+    }
 }
 
 pid_t DaemonProcess::workerPid() const {
