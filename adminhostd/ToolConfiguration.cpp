@@ -26,7 +26,8 @@ std::optional<Error> writeToolFiles(const std::string& directory, const std::vec
         return Error{"posix", errno, path + ": " + reason};
     };
     std::error_code error;
-    fs::create_directories(directory, error);
+    // Only inside the private directory: a worker whose front has ended and cleaned up must not create it again.
+    fs::create_directory(directory, error);
     fs::permissions(directory, fs::perms::owner_all, error);
     for (const ToolFile& file : files) {
         const fs::path relative(file.path);
@@ -35,7 +36,10 @@ std::optional<Error> writeToolFiles(const std::string& directory, const std::vec
             return failed(file.path, "is not a path below the directory");
         }
         const fs::path path = directory / relative;
-        fs::create_directories(path.parent_path(), error);
+        fs::path part = directory;
+        for (const fs::path& name : relative.parent_path()) {
+            fs::create_directory(part /= name, error);
+        }
         std::ofstream stream(path, std::ios::binary);
         stream << file.text;
         stream.close();
