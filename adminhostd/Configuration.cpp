@@ -69,6 +69,12 @@ void apply(const Entry& entry, Options& options) {
         options.languages = Array(texts.begin(), texts.end());
     } else if (entry.key == "account_uuids") {
         options.accountUuids = entry.text();
+    } else if (entry.key == "service_manager") {
+        const std::string text = entry.text();
+        if (text != "systemd" && text != "pidfile") {
+            entry.fail("\"systemd\" or \"pidfile\"");
+        }
+        options.serviceManager = text;
     } else if (entry.key == "request_deadline_seconds") {
         options.deadline = std::chrono::milliseconds(std::llround(std::ceil(entry.seconds() * 1000)));
     } else if (entry.key == "client_timeout_seconds") {
@@ -88,7 +94,7 @@ void apply(const Entry& entry, Options& options) {
     } else {
         throw std::runtime_error(
             fmt::format("{}, line {}: unknown key \"{}\"; known keys: plugins, plugin_directory, socket, "
-                        "socket_group, languages, account_uuids, "
+                        "socket_group, languages, account_uuids, service_manager, "
                         "request_deadline_seconds, client_timeout_seconds, queue_limit, log",
                         entry.file, entry.node.source().begin.line, entry.key));
     }

@@ -21,6 +21,7 @@ struct Options {
     std::string socketGroup;                      ///< empty: the daemon's own
     std::optional<Array> languages;               ///< instead of those of the environment
     std::string accountUuids;                     ///< host path of the accounts' UUIDs; empty: name-based ones
+    std::string serviceManager;                   ///< "systemd" or "pidfile"; empty: the platform's default
     std::chrono::milliseconds deadline{300'000};  ///< of one operation
     std::chrono::seconds clientTimeout{30};
     std::size_t queueLimit = 64;

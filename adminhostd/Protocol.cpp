@@ -32,6 +32,7 @@ template <>
 constexpr auto members<Configure> = std::tuple(member("configure.build", &Configure::build),
                                                member("configure.root", &Configure::root),
                                                member("configure.accountUuids", &Configure::accountUuids),
+                                               member("configure.serviceManager", &Configure::serviceManager),
                                                member("configure.plugins", &Configure::plugins),
                                                member("configure.languages", &Configure::languages),
                                                member("configure.toolEnvironment", &Configure::toolEnvironment),

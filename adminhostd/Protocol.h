@@ -51,7 +51,8 @@ struct Caller {
 struct Configure {
     std::string build;  ///< the front's; must be the worker's
     std::string root;
-    std::string accountUuids;  ///< host path of a file; empty: none
+    std::string accountUuids;    ///< host path of a file; empty: none
+    std::string serviceManager;  ///< "systemd" or "pidfile"; empty: the default
     std::vector<std::string> plugins;
     std::vector<std::string> languages;
     std::map<std::string, std::string> toolEnvironment;

@@ -19,6 +19,7 @@
 #include "platform/json/Json.h"
 #include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
+#include "platform/service/ServiceState.h"
 #include "platform/task/Task.h"
 #include "platform/value/ValueText.h"
 
@@ -184,6 +185,10 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
     _languages = configuration.languages;
     if (!configuration.accountUuids.empty()) {
         setDirectoryNodes({localAccounts(HostPath(configuration.accountUuids))});
+    }
+    if (!configuration.serviceManager.empty()) {
+        setServiceManager(configuration.serviceManager == "pidfile" ? ServiceManager::pidFile
+                                                                    : ServiceManager::systemd);
     }
     _toolEnvironment = configuration.toolEnvironment;
     if (const auto found = configuration.toolEnvironment.find(toolConfigurationVariable);

@@ -30,6 +30,7 @@ protocol::Configure workerConfiguration(const Options& options, const PluginSele
     }
     configuration.languages = textsOf(options.languages ? *options.languages : languagesOfEnvironment());
     configuration.accountUuids = options.accountUuids;
+    configuration.serviceManager = options.serviceManager;
     configuration.toolEnvironment = {{toolConfigurationVariable, toolConfiguration}};
     return configuration;
 }

@@ -322,6 +322,7 @@ TEST_F(Start, MistakesInTheConfigurationAreNamedWithTheirLine) {
         {"request_deadline_seconds = nan\n", "line 1: \"request_deadline_seconds\" must be a number of seconds"},
         {"client_timeout_seconds = true\n", "line 1: \"client_timeout_seconds\" must be a number of seconds"},
         {"log = \"file\"\n", "line 1: \"log\" must be"},
+        {"service_manager = \"launchd\"\n", "line 1: \"service_manager\" must be \"systemd\" or \"pidfile\""},
         {"languages = \"de\"\n", "line 1: \"languages\" must be a list of texts"},
         {"plugins = [1]\n", "line 1: \"plugins\" must be a list of texts"},
         {"socket = 1\n", "line 1: \"socket\" must be a text"},

@@ -27,6 +27,7 @@ std::vector<ToWorker> messagesToWorker() {
     return {Configure{.build = "b",
                       .root = "/r",
                       .accountUuids = "/u",
+                      .serviceManager = "pidfile",
                       .plugins = {"/a.so", "/b.so"},
                       .languages = {"de"},
                       .toolEnvironment = {{"A", "1"}, {"B", ""}},
