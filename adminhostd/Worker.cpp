@@ -228,11 +228,11 @@ void Worker::tryNeeds(const LoadedPlugin& loaded, std::vector<std::string>& prob
     }
 }
 
-/// Sets the environment of the tools that the plug-in runs.
+/// Sets where the plug-in's tools find the files that it gives them.
 void Worker::enter(const LoadedPlugin& loaded) const {
-    auto environment = _toolEnvironment;
-    environment[toolConfigurationVariable] += "/" + loaded.name;
-    setTaskEnvironment(std::move(environment));
+    auto variables = _toolEnvironment;
+    variables[toolConfigurationVariable] += "/" + loaded.name;
+    setToolFileVariables(std::move(variables));
 }
 
 Probe Worker::ask(const LoadedPlugin& loaded, const std::string& need, Clock::duration bound) const {

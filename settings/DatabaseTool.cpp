@@ -10,6 +10,7 @@
 #include <chrono>
 #include <csignal>
 #include <cstring>
+#include <optional>
 #include <string_view>
 #include <vector>
 
@@ -86,8 +87,9 @@ Probe DatabaseTool::probe() {
     }
     std::string output;
     std::string error;
-    const std::int32_t status =
-        adminhost::launch_task(adminhost::diskPath(tool), {"-line", ":memory:", statement}, &output, &error);
+    const std::int32_t status = adminhost::launch_task_with_input_and_environment(
+        adminhost::diskPath(tool), {"-line", ":memory:", statement}, std::nullopt, &output, &error,
+        adminhost::toolFileVariables());
     if (status != 0 && isPassing(status, error)) {
         return {Probe::State::unknown,
                 status == diedBySignal + SIGKILL ? tool.text() + " was ended before it had finished" : firstLine(error),

@@ -1,5 +1,6 @@
 #include "settings/QueryRunner.h"
 
+#include "platform/task/Task.h"
 #include "settings/SettingsStore.h"
 
 namespace lumio {
@@ -30,7 +31,9 @@ bool beginsWithHyphen(const adminhost::HostPath& database) noexcept {
 adminhost::TaskPlan planFor(const adminhost::HostPath& database, const std::string& statement) {
     static const adminhost::HostPath tool("/usr/bin/sqlite3");
     const std::string file = adminhost::diskPath(database).text();
-    return {adminhost::diskPath(tool), {"-line", (file.starts_with('-') ? "./" : "") + file, statement}};
+    return {.tool = adminhost::diskPath(tool),
+            .arguments = {"-line", (file.starts_with('-') ? "./" : "") + file, statement},
+            .environment = adminhost::toolFileVariables()};
 }
 
 }  // namespace

@@ -87,7 +87,7 @@ struct ADMINHOST_EXPORT LogFile {
 
 /// A configuration file that the plug-in's tools read.
 struct ADMINHOST_EXPORT ToolFile {
-    std::string path;  ///< below the directory that XDG_CONFIG_HOME names for the tools: "tool/toolrc"
+    std::string path;  ///< below the directory that XDG_CONFIG_HOME names in toolFileVariables(): "tool/toolrc"
     std::string text;
 };
 

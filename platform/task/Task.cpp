@@ -17,7 +17,7 @@ using Clock = std::chrono::steady_clock;
 
 std::atomic<Clock::time_point> deadlineOfTasks = Clock::time_point::max();
 std::atomic<std::size_t> outputBoundOfTasks = taskDefaultOutputBound;
-TaskEnvironment environmentOfTasks;
+std::map<std::string, std::string> variablesOfToolFiles;
 
 }  // namespace
 
@@ -63,12 +63,12 @@ Clock::time_point taskDeadline() noexcept {
     return deadlineOfTasks;
 }
 
-void setTaskEnvironment(std::map<std::string, std::string> environment) {
-    environmentOfTasks = std::move(environment);
+const std::map<std::string, std::string>& toolFileVariables() noexcept {
+    return variablesOfToolFiles;
 }
 
-const TaskEnvironment& taskEnvironment() noexcept {
-    return environmentOfTasks;
+void setToolFileVariables(std::map<std::string, std::string> variables) {
+    variablesOfToolFiles = std::move(variables);
 }
 
 void setTaskOutputBound(std::size_t bytes) noexcept {

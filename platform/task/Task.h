@@ -7,9 +7,10 @@
 // above the kernel's 128 KiB with the NUL that ends it) is -1, with "TOOL: " and the system's text in the captured
 // error, TOOL being the tool's host path. The tool gets exactly the given arguments (argv[0] is the tool's path on
 // disk), standard input /dev/null where no input is given, no signal blocked or ignored, no descriptor of ours, and the
-// daemon's environment extended by the given one. Its umask and current directory are the process's, which
-// prepareForTasks() has set to 022 and "/": a relative path names the same file here and there. A tool need not read
-// its input: the rest is dropped.
+// daemon's environment extended by the given one. Left out of the daemon's are the variables with which it finds its
+// credentials, sockets, tickets and directory servers (CREDENTIALS_DIRECTORY, LISTEN_*, KRB5CCNAME, KRB5_CLIENT_KTNAME,
+// LDAP*). Its umask and current directory are the process's, which prepareForTasks() has set to 022 and "/": a relative
+// path names the same file here and there. A tool need not read its input: the rest is dropped.
 //
 // Standard output and error are captured whole, up to 256 MiB together. More is a failure, never a truncation: the
 // tool's process group is killed and -1 returned. Bytes that are not UTF-8 become U+FFFD each and are lost, because
@@ -55,7 +56,11 @@ ADMINHOST_EXPORT void prepareForTasks() noexcept;
 /// each request.
 ADMINHOST_EXPORT void setTaskDeadline(std::optional<std::chrono::steady_clock::time_point> deadline) noexcept;
 
-/// Variables added to every tool's environment from now on. Set once, before requests are served.
-ADMINHOST_EXPORT void setTaskEnvironment(std::map<std::string, std::string> environment);
+/// The variables by which a tool finds the plug-in's toolFiles(). They go into the plan of a tool that reads such
+/// files, and of no other: a service that is started by its control tool would keep them for life. Empty outside the
+/// worker.
+[[nodiscard]] ADMINHOST_EXPORT const std::map<std::string, std::string>& toolFileVariables() noexcept;
+/// The worker sets them before each call of a plug-in.
+ADMINHOST_EXPORT void setToolFileVariables(std::map<std::string, std::string> variables);
 
 }  // namespace adminhost

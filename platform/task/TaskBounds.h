@@ -7,12 +7,8 @@
 
 #include <chrono>
 #include <cstddef>
-#include <map>
-#include <string>
 
 namespace adminhost {
-
-using TaskEnvironment = std::map<std::string, std::string>;
 
 constexpr std::size_t taskDefaultOutputBound = std::size_t{256} << 20U;  ///< bytes
 
@@ -21,6 +17,5 @@ ADMINHOST_EXPORT void setTaskOutputBound(std::size_t bytes) noexcept;
 
 [[nodiscard]] ADMINHOST_EXPORT std::size_t taskOutputBound() noexcept;
 [[nodiscard]] ADMINHOST_EXPORT std::chrono::steady_clock::time_point taskDeadline() noexcept;  ///< the maximum for none
-[[nodiscard]] ADMINHOST_EXPORT const TaskEnvironment& taskEnvironment() noexcept;
 
 }  // namespace adminhost

@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <csignal>
 #include <ctime>
+#include <map>
 #include <string_view>
 #include <system_error>
 #include <utility>
@@ -109,12 +110,22 @@ class Capture {
     std::size_t _count = 0;
 };
 
-/// This process's environment with the variables of the two maps in place of its own, the second before the first.
-std::vector<std::string> environmentWith(const TaskEnvironment& first, const TaskEnvironment& second) {
-    TaskEnvironment added = second;
-    added.insert(first.begin(), first.end());
+using TaskEnvironment = std::map<std::string, std::string>;
+
+/// Returns true for variables that lead to the daemon's own credentials, sockets, tickets and directory servers. A
+/// service that a tool starts would keep them for life.
+bool isOnlyTheDaemons(std::string_view name) {
+    return name == "CREDENTIALS_DIRECTORY" || name == "KRB5CCNAME" || name == "KRB5_CLIENT_KTNAME" ||
+           name.starts_with("LISTEN_") || name.starts_with("LDAP");
+}
+
+/// This process's environment as far as it concerns tools, with the given variables in place of its own.
+std::vector<std::string> environmentWith(const TaskEnvironment& added) {
     std::vector<std::string> all = processEnvironment();
-    std::erase_if(all, [&](const std::string& entry) { return added.contains(entry.substr(0, entry.find('='))); });
+    std::erase_if(all, [&](const std::string& entry) {
+        const std::string name = entry.substr(0, entry.find('='));
+        return isOnlyTheDaemons(name) || added.contains(name);
+    });
     for (const auto& [name, value] : added) {
         all.emplace_back(name).append(1, '=').append(value);
     }
@@ -149,8 +160,7 @@ class TaskGroup::RunningTask {
         const int number =
             !namesVariables(plan.environment)
                 ? EINVAL
-                : _child.start(_tool.text(), plan.arguments, environmentWith(taskEnvironment(), plan.environment),
-                               plan.input.has_value());
+                : _child.start(_tool.text(), plan.arguments, environmentWith(plan.environment), plan.input.has_value());
         if (number != 0) {
             fail(std::generic_category().message(number));
         } else if (_rest.empty()) {

@@ -27,7 +27,7 @@ struct ADMINHOST_EXPORT TaskPlan {
     DiskPath tool;
     std::vector<std::string> arguments;  ///< without the tool itself
     std::optional<std::string> input = std::nullopt;
-    std::map<std::string, std::string> environment = {};  ///< added to the process's
+    std::map<std::string, std::string> environment = {};  ///< added to the daemon's
     bool keepsOutput = true;                              ///< otherwise it is read and dropped
     bool keepsError = true;
 };

@@ -381,7 +381,8 @@ TEST_F(Answers, StandardOutputOfAnOperationDisturbsNothing) {
 }
 
 TEST_F(Answers, ToolsFindAPrivateDirectoryWithTheFilesThatThePluginGives) {
-    const std::string text = textAt(dictionaryOf(client.post("/v1/fixture/environment")), "output");
+    const std::string text =
+        textAt(dictionaryOf(client.post("/v1/fixture/environment", R"({"files": true})")), "output");
     const std::size_t at = text.find("XDG_CONFIG_HOME=");
     ASSERT_NE(at, std::string::npos) << text;
     const std::filesystem::path directory = text.substr(at + 16, text.find('\n', at) - at - 16);
@@ -391,6 +392,23 @@ TEST_F(Answers, ToolsFindAPrivateDirectoryWithTheFilesThatThePluginGives) {
     daemon.signal(SIGTERM);
     EXPECT_EQ(daemon.wait(), 0);
     EXPECT_FALSE(std::filesystem::exists(directory));
+}
+
+TEST(ToolEnvironment, HasNeitherThePrivateDirectoryNorTheDaemonsCredentials) {
+    auto options = withFixture();
+    options.environment = {"CREDENTIALS_DIRECTORY=/credentials",
+                           "LISTEN_PID=1",
+                           "LISTEN_FDS=1",
+                           "KRB5CCNAME=FILE:/a",
+                           "KRB5_CLIENT_KTNAME=/keys",
+                           "LDAPURI=ldap://a",
+                           "XDG_CONFIG_HOME=/the-account"};
+    const DaemonProcess daemon(options);
+    const std::string text = textAt(dictionaryOf(daemon.connect().post("/v1/fixture/environment")), "output");
+    EXPECT_NE(text.find("XDG_CONFIG_HOME=/the-account\n"), std::string::npos) << text;
+    for (const char* name : {"CREDENTIALS_DIRECTORY", "LISTEN_", "KRB5CCNAME", "KRB5_CLIENT_KTNAME", "LDAP"}) {
+        EXPECT_EQ(text.find(name), std::string::npos) << text;
+    }
 }
 
 TEST_F(Answers, ConfiguredLanguagesReachThePlugins) {

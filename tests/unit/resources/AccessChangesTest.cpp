@@ -1,4 +1,5 @@
 #include "platform/task/Task.h"
+#include "tests/support/Environment.h"
 #include "tests/unit/resources/AccessListsFixture.h"
 #include "tests/unit/resources/FixedDirectory.h"
 
@@ -24,6 +25,20 @@ TEST_F(AccessChanges, EachWordIsAnArgumentOfItsOwn) {
             Value(Dictionary{{"type", "user"}, {"shortName", "b c"}, {"_newid_", true}})});
     EXPECT_THAT(calls(), ElementsAre("--add_access", "--resource_type", "camera", "--resource_uuid", "C-7",
                                      "--record_type", "user", "--shortname", "a", "--shortname", "b c"));
+}
+
+TEST_F(AccessChanges, OnlyTheDatabaseToolGetsTheVariablesOfItsFiles) {
+    const std::string record =
+        "#!/bin/sh\nenv | grep ^XDG_CONFIG_HOME= >> " + root.path("/environment").string() + "\n";
+    root.writeTool(tool, record + "echo configuration >> " + root.path("/environment").string() + "\n");
+    root.writeTool("/usr/bin/sqlite3", record + "echo database >> " + root.path("/environment").string() +
+                                           "\nexec /usr/bin/sqlite3 \"$@\"\n");
+    const support::ScopedEnvironment account({{"XDG_CONFIG_HOME", std::nullopt}});
+    adminhost::setToolFileVariables({{"XDG_CONFIG_HOME", "/private"}});
+    Camera::initWithGUID("C-7")->setACLEnabled(false);
+    change({Value(Dictionary{{"type", "user"}, {"shortName", "a"}, {"_newid_", true}})});
+    adminhost::setToolFileVariables({});
+    EXPECT_EQ(root.read("/environment"), "XDG_CONFIG_HOME=/private\ndatabase\nconfiguration\n");
 }
 
 TEST_F(AccessChanges, AllFourKindsOfChangeRunInTheirOrder) {

@@ -35,7 +35,6 @@ class TaskGroupOf : public testing::Test {
     }
     void TearDown() override {
         setTaskDeadline(std::nullopt);
-        setTaskEnvironment({});
         setTaskOutputBound(taskDefaultOutputBound);
         fs::remove_all(_dir);
         EXPECT_EQ(::waitpid(-1, nullptr, WNOHANG), -1) << "a child is left";

@@ -1,5 +1,6 @@
 #include "platform/task/Task.h"
 #include "platform/task/TaskBounds.h"
+#include "tests/support/Environment.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -37,7 +38,6 @@ class Task : public testing::Test {
     }
     void TearDown() override {
         setTaskDeadline(std::nullopt);
-        setTaskEnvironment({});
         setTaskOutputBound(taskDefaultOutputBound);
         setSystemRoot("/");
         fs::remove_all(_dir);
@@ -268,14 +268,37 @@ TEST_F(Task, EnvironmentExtendsTheProcesses) {
     EXPECT_EQ(_output, "ADMINHOST_CHANGED=new=x\nADMINHOST_EMPTY=\nADMINHOST_KEPT=kept\n");
 }
 
-TEST_F(Task, TaskEnvironmentReachesEveryToolAndTheCallsOwnWins) {
-    setTaskEnvironment({{"ADMINHOST_A", "1"}, {"ADMINHOST_B", "2"}});
-    EXPECT_EQ(shell("echo $ADMINHOST_A$ADMINHOST_B"), 0);
-    EXPECT_EQ(_output, "12\n");
-    EXPECT_EQ(launch_task_with_input_and_environment(DiskPath("/bin/sh"), {"-c", "echo $ADMINHOST_A$ADMINHOST_B"},
-                                                     std::nullopt, &_output, &_error, {{"ADMINHOST_B", "3"}}),
+TEST_F(Task, VariablesOfTheDaemonsOwnCredentialsAndServersDoNotReachTools) {
+    const support::ScopedEnvironment environment({{"CREDENTIALS_DIRECTORY", "c"},
+                                                  {"LISTEN_FDS", "1"},
+                                                  {"LISTEN_FDNAMES", "a"},
+                                                  {"LISTEN_PID", "1"},
+                                                  {"KRB5CCNAME", "FILE:/daemon"},
+                                                  {"KRB5_CLIENT_KTNAME", "FILE:/keys"},
+                                                  {"LDAPURI", "ldap://a"},
+                                                  {"LDAPTLS_REQCERT", "never"},
+                                                  {"LISTENER", "kept"},
+                                                  {"KRB5_CONFIG", "kept"},
+                                                  {"ADMINHOST_LDAP", "kept"}});
+    const std::string print = "env | grep -aE 'CREDENTIALS|LISTEN|KRB5|LDAP' | sort";
+    EXPECT_EQ(shell(print), 0);
+    EXPECT_EQ(_output, "ADMINHOST_LDAP=kept\nKRB5_CONFIG=kept\nLISTENER=kept\n");
+    EXPECT_EQ(launch_task_with_input_and_environment(DiskPath("/bin/sh"), {"-c", print + "; echo $KRB5CCNAME"},
+                                                     std::nullopt, &_output, &_error, {{"KRB5CCNAME", "FILE:/own"}}),
               0);
-    EXPECT_EQ(_output, "13\n");
+    EXPECT_EQ(_output, "ADMINHOST_LDAP=kept\nKRB5CCNAME=FILE:/own\nKRB5_CONFIG=kept\nLISTENER=kept\nFILE:/own\n")
+        << "an operation may give its tool a cache";
+}
+
+TEST_F(Task, VariablesOfToolFilesReachOnlyTheToolsWhosePlanHasThem) {
+    setToolFileVariables({{"ADMINHOST_FILES", "/private"}});
+    EXPECT_EQ(shell("echo \"<$ADMINHOST_FILES>\""), 0);
+    EXPECT_EQ(_output, "<>\n");
+    EXPECT_EQ(launch_task_with_input_and_environment(DiskPath("/bin/sh"), {"-c", "echo \"<$ADMINHOST_FILES>\""},
+                                                     std::nullopt, &_output, &_error, toolFileVariables()),
+              0);
+    setToolFileVariables({});
+    EXPECT_EQ(_output, "</private>\n");
 }
 
 TEST_F(Task, DirectoryIsTheProcessesWhichIsTheRoot) {
