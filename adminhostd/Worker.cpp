@@ -465,13 +465,11 @@ protocol::Answer Worker::answer(const protocol::ReadHistory& order) {
 
 protocol::Answer Worker::answer(const protocol::FindAccounts& order) {
     constexpr std::size_t limit = 50;
-    Error error;
-    std::optional<Array> entries =
-        order.is.empty() ? directoryEntries(order.match, limit, &error) : directoryEntriesOf(order.is, &error);
+    Result<Array> entries = order.is.empty() ? directoryEntries(order.match, limit) : directoryEntriesOf(order.is);
     if (!entries) {
-        return errorAnswer("DIRECTORY_UNAVAILABLE", textOf(error), order.form);
+        return errorAnswer("DIRECTORY_UNAVAILABLE", textOf(entries.error()), order.form);
     }
-    return written(Outcome::answered, Dictionary{{"entries", std::move(*entries)}}, order.form);
+    return written(Outcome::answered, Dictionary{{"entries", *std::move(entries)}}, order.form);
 }
 
 std::optional<int> Worker::serve(protocol::ToWorker message) {

@@ -72,8 +72,7 @@ std::size_t lookUp(std::int64_t accounts) {
     }
     query.attributes = {std::string(directory::recordName), std::string(directory::realName),
                         std::string(directory::generatedUID)};
-    const auto node = DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode);
-    const auto records = node->records(query);
+    const auto records = searchDirectory(query);
     if (!records || records->size() != 5) {
         throw std::runtime_error("not all of the five were found");
     }

@@ -52,8 +52,9 @@ bool holds(const std::vector<std::size_t>& positions, std::size_t position) {
 }
 
 void lookAt(adminhost::AccountFiles& files, AccountKind kind) {
-    const auto table = files.table(kind);
-    require(table != nullptr);
+    const auto read = files.table(kind);
+    require(read.has_value());
+    const auto& table = *read;
     std::set<std::string> names;
     for (std::size_t i = 0; i < table->accounts().size(); ++i) {
         const Account& account = table->accounts()[i];

@@ -21,8 +21,8 @@ namespace lumio {
 namespace directory = adminhost::directory;
 using adminhost::Array;
 using adminhost::Dictionary;
-using adminhost::DirectorySession;
 using adminhost::Error;
+using adminhost::Result;
 using adminhost::Value;
 
 namespace {
@@ -65,19 +65,28 @@ struct Names {
     std::vector<Named> groups;
 };
 
-/// Appends the login or group name of a UUID text; returns false if it has none.
-bool appendNameOf(const Value& uuidText, std::size_t index, Names& names) {
+/// Appends the login or group name of a UUID text; returns false if it has none. Fails if the directory fails.
+Result<bool> appendNameOf(const Value& uuidText, std::size_t index, Names& names) {
     const auto uuid = uuidText.string() == nullptr ? std::nullopt : adminhost::mbr_string_to_uuid(*uuidText.string());
-    const auto id = uuid ? adminhost::mbr_uuid_to_id(*uuid) : std::nullopt;
+    if (!uuid) {
+        return false;
+    }
+    const auto id = adminhost::mbr_uuid_to_id(*uuid);
     if (!id) {
+        return adminhost::failure(id.error());
+    }
+    if (!*id) {
         return false;
     }
-    const bool isUser = id->kind == adminhost::PosixId::Kind::user;
-    const auto name = isUser ? adminhost::userNameOf(id->id) : adminhost::groupNameOf(id->id);
-    if (!name || name->empty()) {
+    const auto name = adminhost::nameOf(**id);
+    if (!name) {
+        return adminhost::failure(name.error());
+    }
+    if (!*name || (*name)->empty()) {
         return false;
     }
-    (isUser ? names.users : names.groups).push_back({*name, index});
+    const bool isUser = (*id)->kind == adminhost::PosixId::Kind::user;
+    (isUser ? names.users : names.groups).push_back({**name, index});
     return true;
 }
 
@@ -178,11 +187,9 @@ std::vector<Dictionary> Resource::getDirectoryDetailsForUUIDs(const std::vector<
     query.values = uuids;
     query.attributes = {std::string(directory::recordName), std::string(directory::realName),
                         std::string(directory::generatedUID)};
-    Error error;
-    const auto node = DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode, &error);
-    const auto records = node ? node->records(query, &error) : std::nullopt;
+    const auto records = adminhost::searchDirectory(query);
     if (!records) {
-        std::printf("Tarn query error for users: %s\n", error.description.value_or("").c_str());
+        std::printf("Tarn query error for users: %s\n", records.error().description.value_or("").c_str());
         std::fflush(stdout);
         return {};
     }
@@ -280,8 +287,13 @@ void Resource::changeACLsWithRequest(const Array* entries) {
                 return;
             }
             (isUser ? toAdd.users : toAdd.groups).push_back({textOf(*name), index});
-        } else if (booleanOf(entry->get("_obsoleteid_")) && !appendNameOf(entry->get("_id_"), index, toRemove)) {
-            reportNotDone(pathOf(index), "the entry's \"_id_\" is no user or group of this machine");
+        } else if (booleanOf(entry->get("_obsoleteid_"))) {
+            const auto appended = appendNameOf(entry->get("_id_"), index, toRemove);
+            if (!appended) {
+                reportNotDone(pathOf(index), "the directory failed: " + textOf(appended.error()));
+            } else if (!*appended) {
+                reportNotDone(pathOf(index), "the entry's \"_id_\" is no user or group of this machine");
+            }
         }
     }
     const std::optional<std::string> uuid = statementGuid();

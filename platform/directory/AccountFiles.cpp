@@ -1,8 +1,8 @@
 #include "platform/directory/AccountFiles.h"
 
+#include "platform/directory/CarriedText.h"
 #include "platform/directory/NameBasedUuid.h"
 #include "platform/files/File.h"
-#include "platform/text/Utf8.h"
 #include "platform/value/ValueText.h"
 
 #include <algorithm>
@@ -36,46 +36,10 @@ std::int64_t nanosecondsOf(const timespec& time) noexcept {
     return static_cast<std::int64_t>(time.tv_sec) * 1'000'000'000 + time.tv_nsec;
 }
 
-/// Returns true if XML can carry the well-formed UTF-8 character that begins at the position.
-bool isCarried(std::string_view text, std::size_t at) noexcept {
-    const auto byte = static_cast<unsigned char>(text[at]);
-    if (byte < 0x20) {
-        return byte == '\t' || byte == '\n' || byte == '\r';
-    }
-    const std::string_view character = text.substr(at, 3);
-    return character != "\xEF\xBF\xBE" && character != "\xEF\xBF\xBF";  // U+FFFE, U+FFFF
-}
-
-bool isPlain(std::string_view text) noexcept {
-    if (!isUtf8(text)) {
-        return false;
-    }
-    for (std::size_t i = 0; i < text.size(); ++i) {
-        if (!isCarried(text, i)) {
-            return false;
-        }
-    }
-    return true;
-}
-
-/// For texts that people read: bytes that a property list cannot carry become U+FFFD.
-std::string repaired(std::string_view bytes) {
-    if (isPlain(bytes)) {
-        return std::string(bytes);
-    }
-    std::string text = utf8Of(bytes);
-    for (std::size_t i = 0; i < text.size(); ++i) {
-        if (!isCarried(text, i)) {
-            text.replace(i, static_cast<unsigned char>(text[i]) < 0x20 ? 1 : 3, "\xEF\xBF\xBD");
-        }
-    }
-    return text;
-}
-
 /// Names are keys: a repaired one would name another account, so such an account is left out. Lines that begin with
 /// "+" or "-" are directions to the name service, not accounts.
 bool isAccountName(const char* name) noexcept {
-    return name != nullptr && name[0] != '\0' && name[0] != '+' && name[0] != '-' && isPlain(name);
+    return name != nullptr && name[0] != '\0' && name[0] != '+' && name[0] != '-' && isCarriedText(name);
 }
 
 /// The full name: the first field of the comment, in which "&" means the login, capitalised.
@@ -94,15 +58,15 @@ std::string longNameOf(const char* comment, std::string_view login) {
             name[at] = static_cast<char>(name[at] - 'a' + 'A');
         }
     }
-    return repaired(name);
+    return carriedTextOf(name);
 }
 
 Account accountOf(const passwd& entry) {
     Account account;
     account.name = entry.pw_name;
     account.longName = longNameOf(entry.pw_gecos, account.name);
-    account.home = repaired(entry.pw_dir == nullptr ? "" : entry.pw_dir);
-    account.shell = repaired(entry.pw_shell == nullptr ? "" : entry.pw_shell);
+    account.home = carriedTextOf(entry.pw_dir == nullptr ? "" : entry.pw_dir);
+    account.shell = carriedTextOf(entry.pw_shell == nullptr ? "" : entry.pw_shell);
     account.id = entry.pw_uid;
     account.primaryGroup = entry.pw_gid;
     return account;
@@ -280,7 +244,7 @@ bool AccountFiles::unchanged(const Kept& kept, const DiskPath& path) const noexc
     return kept.path == path.text() && kept.identity.same(identityOf(path));
 }
 
-std::shared_ptr<const AccountTable> AccountFiles::table(AccountKind kind, Error* error) {
+Result<std::shared_ptr<const AccountTable>> AccountFiles::table(AccountKind kind) {
     const std::size_t slot = kind == AccountKind::user ? 0 : 1;
     if (_uuidFile) {
         const DiskPath path = diskPath(*_uuidFile);
@@ -292,10 +256,7 @@ std::shared_ptr<const AccountTable> AccountFiles::table(AccountKind kind, Error*
                           identityOf(path)};  // before reading: a change meanwhile shows at the next look-up
             const auto text = readFile(path, maximumFileSize);
             if (!text) {
-                if (error != nullptr) {
-                    *error = text.error();
-                }
-                return nullptr;
+                return failure(text.error());
             }
             _given = std::make_shared<const GivenUuids>(givenUuidsIn(*text));
         }
@@ -306,10 +267,7 @@ std::shared_ptr<const AccountTable> AccountFiles::table(AccountKind kind, Error*
         _keptAccounts[slot] = {path.text(), identityOf(path)};
         auto text = readFile(path, maximumFileSize);
         if (!text) {
-            if (error != nullptr) {
-                *error = text.error();
-            }
-            return nullptr;
+            return failure(text.error());
         }
         ++_passes;
         _tables[slot] =

@@ -9,7 +9,7 @@
 #include "platform/files/Path.h"
 #include "platform/framework/Export.h"
 #include "platform/text/Uuid.h"
-#include "platform/value/Error.h"
+#include "platform/value/Result.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -73,9 +73,9 @@ class ADMINHOST_EXPORT AccountFiles {
     /// If there is a file of UUIDs, only accounts named in it have a UUID.
     explicit AccountFiles(std::optional<HostPath> uuidFile = std::nullopt) : _uuidFile(std::move(uuidFile)) {}
 
-    /// The accounts below the system root as they are now: /etc/passwd or /etc/group. Returns null, with the error, if
-    /// a file cannot be read.
-    [[nodiscard]] std::shared_ptr<const AccountTable> table(AccountKind kind, Error* error = nullptr);
+    /// The accounts below the system root as they are now: /etc/passwd or /etc/group. Never null. Fails if a file
+    /// cannot be read.
+    [[nodiscard]] Result<std::shared_ptr<const AccountTable>> table(AccountKind kind);
 
     /// The number of passes over account files so far.
     [[nodiscard]] std::size_t passes() const noexcept { return _passes; }

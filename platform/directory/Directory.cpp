@@ -13,12 +13,6 @@ Error noSuchNodeError(std::string_view node) {
     return {directory::errorDomain, directory::noSuchNode, fmt::format("there is no directory node {}", node)};
 }
 
-void report(Error* place, Error error) {
-    if (place != nullptr) {
-        *place = std::move(error);
-    }
-}
-
 /// All nodes of a session as one.
 class SearchNode : public DirectoryNode {
   public:
@@ -26,13 +20,13 @@ class SearchNode : public DirectoryNode {
 
     const std::string& name() const noexcept override { return _name; }
 
-    std::optional<std::vector<DirectoryRecord>> records(const DirectoryQuery& query, Error* error) override {
+    Result<std::vector<DirectoryRecord>> records(const DirectoryQuery& query) override {
         std::vector<DirectoryRecord> all;
         DirectoryQuery rest = query;
         for (const auto& node : _nodes) {
-            auto some = node->records(rest, error);
+            auto some = node->records(rest);
             if (!some) {
-                return std::nullopt;
+                return some;
             }
             all.insert(all.end(), std::make_move_iterator(some->begin()), std::make_move_iterator(some->end()));
             if (query.maximum != 0) {
@@ -43,6 +37,16 @@ class SearchNode : public DirectoryNode {
             }
         }
         return all;
+    }
+
+    Result<std::vector<DirectoryRecord>> groupsOf(const DirectoryRecord& person,
+                                                  const std::vector<std::string>& attributes) override {
+        for (const auto& node : _nodes) {
+            if (node->name() == person.node) {
+                return node->groupsOf(person, attributes);
+            }
+        }
+        return failure(noSuchNodeError(fmt::format("named \"{}\"", person.node)));
     }
 
   private:
@@ -68,22 +72,31 @@ Error DirectoryNode::unsupported(std::string_view operation) const {
             fmt::format("{} is not supported by the directory node {}", operation, name())};
 }
 
-std::optional<Error> DirectoryNode::authenticate(std::string_view /*username*/, std::string_view /*password*/) {
-    return unsupported("signing in");
+Result<std::vector<DirectoryRecord>> DirectoryNode::groupsOf(const DirectoryRecord& /*person*/,
+                                                             const std::vector<std::string>& /*attributes*/) {
+    return failure(unsupported("finding the groups of a person"));
 }
 
-std::optional<Error> DirectoryNode::createRecord(std::string_view /*type*/, std::string_view /*name*/,
-                                                 const DirectoryAttributes& /*attributes*/) {
-    return unsupported("creating records");
+Result<void> DirectoryNode::reach(std::chrono::milliseconds /*limit*/) {
+    return {};
 }
 
-std::optional<Error> DirectoryNode::deleteRecord(std::string_view /*type*/, std::string_view /*name*/) {
-    return unsupported("deleting records");
+Result<bool> DirectoryNode::authenticate(std::string_view /*username*/, std::string_view /*password*/) {
+    return failure(unsupported("signing in"));
 }
 
-std::optional<Error> DirectoryNode::setPassword(std::string_view /*type*/, std::string_view /*name*/,
-                                                std::string_view /*password*/) {
-    return unsupported("setting passwords");
+Result<std::optional<DirectoryRecord>> DirectoryNode::createRecord(std::string_view /*type*/, std::string_view /*name*/,
+                                                                   const DirectoryAttributes& /*attributes*/) {
+    return failure(unsupported("creating records"));
+}
+
+Result<void> DirectoryNode::deleteRecord(std::string_view /*type*/, std::string_view /*name*/) {
+    return failure(unsupported("deleting records"));
+}
+
+Result<void> DirectoryNode::setPassword(std::string_view /*type*/, std::string_view /*name*/,
+                                        std::string_view /*password*/) {
+    return failure(unsupported("setting passwords"));
 }
 
 DirectorySession& DirectorySession::defaultSession() {
@@ -91,33 +104,39 @@ DirectorySession& DirectorySession::defaultSession() {
     return session;
 }
 
-std::unique_ptr<DirectoryNode> DirectorySession::openNode(std::uint32_t nodeType, Error* error) const {
+OpenedDirectoryNode DirectorySession::openNode(std::uint32_t nodeType) const {
     if (nodeType != authenticationSearchNode) {
-        report(error, noSuchNodeError(fmt::format("of type {:#x}", nodeType)));
-        return nullptr;
+        return failure(noSuchNodeError(fmt::format("of type {:#x}", nodeType)));
     }
     std::vector<std::unique_ptr<DirectoryNode>> nodes;
     for (const DirectoryNodeSource& source : _nodes) {
-        auto node = source.open(error);
+        auto node = source.open();
         if (!node) {
-            return nullptr;
+            return node;
         }
-        nodes.push_back(std::move(node));
+        nodes.push_back(*std::move(node));
     }
     return std::make_unique<SearchNode>(std::move(nodes));
 }
 
-std::unique_ptr<DirectoryNode> DirectorySession::openNode(std::string_view name, Error* error) const {
+OpenedDirectoryNode DirectorySession::openNode(std::string_view name) const {
     if (name == authenticationSearchNodeName) {
-        return openNode(authenticationSearchNode, error);
+        return openNode(authenticationSearchNode);
     }
     for (const DirectoryNodeSource& source : _nodes) {
         if (source.name == name) {
-            return source.open(error);
+            return source.open();
         }
     }
-    report(error, noSuchNodeError(fmt::format("named \"{}\"", name)));
-    return nullptr;
+    return failure(noSuchNodeError(fmt::format("named \"{}\"", name)));
+}
+
+Result<std::vector<DirectoryRecord>> searchDirectory(const DirectoryQuery& query) {
+    const auto node = DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode);
+    if (!node) {
+        return failure(node.error());
+    }
+    return (*node)->records(query);
 }
 
 void setDirectoryNodes(std::vector<DirectoryNodeSource> nodes) {

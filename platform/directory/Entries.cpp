@@ -10,17 +10,26 @@ namespace {
 
 using Match = DirectoryQuery::Match;
 
-std::optional<std::vector<DirectoryRecord>> find(DirectoryNode& node, std::string_view attribute, Match match,
-                                                 std::string_view value, std::size_t limit, Error* error) {
+std::vector<std::string> entryAttributes() {
+    return {std::string(directory::recordName), std::string(directory::realName), std::string(directory::generatedUID)};
+}
+
+Dictionary entryWithNode(const DirectoryRecord& record) {
+    Dictionary entry = directoryEntryOf(record);
+    entry.set("node", record.node);
+    return entry;
+}
+
+Result<std::vector<DirectoryRecord>> find(std::string_view attribute, Match match, std::string_view value,
+                                          std::size_t limit) {
     DirectoryQuery query;
     query.recordTypes = {std::string(directory::users), std::string(directory::groups)};
     query.attribute = attribute;
     query.match = match;
     query.values = {std::string(value)};
-    query.attributes = {std::string(directory::recordName), std::string(directory::realName),
-                        std::string(directory::generatedUID)};
+    query.attributes = entryAttributes();
     query.maximum = limit;
-    return node.records(query, error);
+    return searchDirectory(query);
 }
 
 }  // namespace
@@ -40,19 +49,15 @@ Dictionary directoryEntryOf(const DirectoryRecord& record) {
     return entry;
 }
 
-std::optional<Array> directoryEntries(std::string_view matchText, std::size_t limit, Error* error) {
-    const auto node = DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode, error);
-    if (!node) {
-        return std::nullopt;
-    }
+Result<Array> directoryEntries(std::string_view matchText, std::size_t limit) {
     Array entries;
     std::set<std::tuple<std::string, std::string, std::string>> seen;  // node, type, short name
     for (const std::string_view attribute : {directory::recordName, directory::realName}) {
         // The second query may find the same records again. It asks for as many as the limit, so the result still
         // reaches it.
-        const auto records = find(*node, attribute, Match::beginsWith, matchText, limit, error);
+        const auto records = find(attribute, Match::beginsWith, matchText, limit);
         if (!records) {
-            return std::nullopt;
+            return failure(records.error());
         }
         for (const DirectoryRecord& record : *records) {
             const std::string* name = record.first(directory::recordName);
@@ -67,21 +72,39 @@ std::optional<Array> directoryEntries(std::string_view matchText, std::size_t li
     return entries;
 }
 
-std::optional<Array> directoryEntriesOf(std::string_view nameOrUuid, Error* error) {
-    const auto node = DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode, error);
-    if (!node) {
-        return std::nullopt;
-    }
+Result<Array> directoryEntriesOf(std::string_view nameOrUuid) {
     const auto attribute = uuidOf(nameOrUuid) ? directory::generatedUID : directory::recordName;
-    const auto records = find(*node, attribute, Match::equal, nameOrUuid, 0, error);
+    const auto records = find(attribute, Match::equal, nameOrUuid, 0);
     if (!records) {
-        return std::nullopt;
+        return failure(records.error());
     }
     Array entries;
     for (const DirectoryRecord& record : *records) {
-        Dictionary entry = directoryEntryOf(record);
-        entry.set("node", record.node);
-        entries.emplace_back(std::move(entry));
+        entries.emplace_back(entryWithNode(record));
+    }
+    return entries;
+}
+
+Result<Array> directoryGroupsOf(std::string_view nameOrUuid) {
+    DirectoryQuery query;
+    query.recordTypes = {std::string(directory::users)};
+    query.attribute = uuidOf(nameOrUuid) ? directory::generatedUID : directory::recordName;
+    query.values = {std::string(nameOrUuid)};
+    query.attributes = {std::string(directory::recordName), std::string(directory::primaryGroupID)};
+    const auto people = searchDirectory(query);
+    if (!people) {
+        return failure(people.error());
+    }
+    Array entries;
+    for (const DirectoryRecord& person : *people) {
+        const auto node = DirectorySession::defaultSession().openNode(person.node);
+        const auto groups = node ? (*node)->groupsOf(person, entryAttributes()) : failure(node.error());
+        if (!groups) {
+            return failure(groups.error());
+        }
+        for (const DirectoryRecord& group : *groups) {
+            entries.emplace_back(entryWithNode(group));
+        }
     }
     return entries;
 }

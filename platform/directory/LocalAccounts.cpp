@@ -1,6 +1,7 @@
 #include "platform/directory/LocalAccounts.h"
 
 #include "platform/directory/AccountFiles.h"
+#include "platform/directory/KerberosAuthority.h"
 
 #include <algorithm>
 #include <charconv>
@@ -52,9 +53,15 @@ std::vector<std::string> one(std::string text) {
     return text.empty() ? std::vector<std::string>() : std::vector<std::string>{std::move(text)};
 }
 
-std::vector<std::string> valuesOf(const AccountTable& table, AccountKind kind, const Account& account,
-                                  std::string_view attribute) {
-    const bool isUser = kind == AccountKind::user;
+/// The accounts of one kind, as the node shows them.
+struct Accounts {
+    const AccountTable& table;
+    AccountKind kind;
+    std::string_view realm;  ///< empty: users have no principal
+};
+
+std::vector<std::string> valuesOf(const Accounts& accounts, const Account& account, std::string_view attribute) {
+    const bool isUser = accounts.kind == AccountKind::user;
     if (attribute == directory::recordName) {
         return one(account.name);
     }
@@ -62,7 +69,7 @@ std::vector<std::string> valuesOf(const AccountTable& table, AccountKind kind, c
         return one(account.longName);
     }
     if (attribute == directory::generatedUID) {
-        return one(table.uuidTextOf(account).value_or(""));
+        return one(accounts.table.uuidTextOf(account).value_or(""));
     }
     if (attribute == directory::uniqueID && isUser) {
         return one(std::to_string(account.id));
@@ -78,6 +85,9 @@ std::vector<std::string> valuesOf(const AccountTable& table, AccountKind kind, c
     }
     if (attribute == directory::groupMembership) {
         return account.members;
+    }
+    if (attribute == directory::authenticationAuthority && isUser && !accounts.realm.empty()) {
+        return one(kerberosAuthority(kerberosPrincipalOf(account.name, accounts.realm), accounts.realm).value_or(""));
     }
     return {};
 }
@@ -95,7 +105,7 @@ void append(std::vector<std::size_t>& positions, const std::vector<std::size_t>&
     positions.insert(positions.end(), more.begin(), more.end());
 }
 
-std::vector<std::size_t> scanned(const AccountTable& table, AccountKind kind, const DirectoryQuery& query) {
+std::vector<std::size_t> scanned(const Accounts& accounts, const DirectoryQuery& query) {
     static const CaseFolding fold;
     const bool whole = query.match == DirectoryQuery::Match::equal;
     std::vector<std::string> wanted = query.values;
@@ -108,8 +118,9 @@ std::vector<std::size_t> scanned(const AccountTable& table, AccountKind kind, co
                            [&](const std::string& w) { return whole ? value == w : folded.starts_with(w); });
     };
     std::vector<std::size_t> positions;
-    for (std::size_t i = 0; i < table.accounts().size(); ++i) {
-        const auto values = valuesOf(table, kind, table.accounts()[i], query.attribute);
+    const std::vector<Account>& all = accounts.table.accounts();
+    for (std::size_t i = 0; i < all.size(); ++i) {
+        const auto values = valuesOf(accounts, all[i], query.attribute);
         if (std::any_of(values.begin(), values.end(), matches)) {
             positions.push_back(i);
         }
@@ -118,12 +129,14 @@ std::vector<std::size_t> scanned(const AccountTable& table, AccountKind kind, co
 }
 
 /// The positions of the accounts that match, ascending, each once.
-std::vector<std::size_t> positionsOf(const AccountTable& table, AccountKind kind, const DirectoryQuery& query) {
+std::vector<std::size_t> positionsOf(const Accounts& accounts, const DirectoryQuery& query) {
+    const AccountTable& table = accounts.table;
     const std::string& attribute = query.attribute;
-    const bool byId = attribute == (kind == AccountKind::user ? directory::uniqueID : directory::primaryGroupID);
+    const bool byId =
+        attribute == (accounts.kind == AccountKind::user ? directory::uniqueID : directory::primaryGroupID);
     if (query.match != DirectoryQuery::Match::equal ||
         (attribute != directory::generatedUID && attribute != directory::recordName && !byId)) {
-        return scanned(table, kind, query);
+        return scanned(accounts, query);
     }
     std::vector<std::size_t> positions;
     for (const std::string& value : query.values) {
@@ -144,55 +157,79 @@ std::vector<std::size_t> positionsOf(const AccountTable& table, AccountKind kind
 
 class LocalAccountsNode : public DirectoryNode {
   public:
-    explicit LocalAccountsNode(std::shared_ptr<AccountFiles> files) : _files(std::move(files)) {}
+    LocalAccountsNode(std::shared_ptr<AccountFiles> files, std::string realm, std::string name)
+        : _name(std::move(name)), _realm(std::move(realm)), _files(std::move(files)) {}
 
     const std::string& name() const noexcept override { return _name; }
 
-    std::optional<std::vector<DirectoryRecord>> records(const DirectoryQuery& query, Error* error) override {
+    Result<std::vector<DirectoryRecord>> records(const DirectoryQuery& query) override {
         std::vector<DirectoryRecord> found;
         for (const AccountKind kind : {AccountKind::user, AccountKind::group}) {
             const std::string_view type = kind == AccountKind::user ? directory::users : directory::groups;
             if (std::find(query.recordTypes.begin(), query.recordTypes.end(), type) == query.recordTypes.end()) {
                 continue;
             }
-            const auto table = _files->table(kind, error);
+            const auto table = _files->table(kind);
             if (!table) {
-                return std::nullopt;
+                return failure(table.error());
             }
-            for (const std::size_t position : positionsOf(*table, kind, query)) {
+            const Accounts accounts{**table, kind, _realm};
+            for (const std::size_t position : positionsOf(accounts, query)) {
                 if (query.maximum != 0 && found.size() == query.maximum) {
                     return found;
                 }
-                found.push_back(recordOf(*table, kind, table->accounts()[position], query.attributes));
+                found.push_back(recordOf(accounts, accounts.table.accounts()[position], query.attributes));
             }
         }
         return found;
     }
 
+    Result<std::vector<DirectoryRecord>> groupsOf(const DirectoryRecord& person,
+                                                  const std::vector<std::string>& attributes) override {
+        const auto table = _files->table(AccountKind::group);
+        if (!table) {
+            return failure(table.error());
+        }
+        const Accounts accounts{**table, AccountKind::group, _realm};
+        const std::string* login = person.first(directory::recordName);
+        const std::string* primary = person.first(directory::primaryGroupID);
+        std::vector<DirectoryRecord> groups;
+        for (const Account& group : accounts.table.accounts()) {
+            const bool isMember = login != nullptr &&
+                                  std::find(group.members.begin(), group.members.end(), *login) != group.members.end();
+            if (isMember || (primary != nullptr && std::to_string(group.id) == *primary)) {
+                groups.push_back(recordOf(accounts, group, attributes));
+            }
+        }
+        return groups;
+    }
+
   private:
-    DirectoryRecord recordOf(const AccountTable& table, AccountKind kind, const Account& account,
+    DirectoryRecord recordOf(const Accounts& accounts, const Account& account,
                              const std::vector<std::string>& attributes) const {
         DirectoryRecord record;
-        record.type = kind == AccountKind::user ? directory::users : directory::groups;
+        record.type = accounts.kind == AccountKind::user ? directory::users : directory::groups;
         record.node = _name;
         for (const std::string& attribute : attributes) {
-            if (auto values = valuesOf(table, kind, account, attribute); !values.empty()) {
+            if (auto values = valuesOf(accounts, account, attribute); !values.empty()) {
                 record.attributes.emplace(attribute, std::move(values));
             }
         }
         return record;
     }
 
-    std::string _name{localAccountsNodeName};
+    std::string _name;
+    std::string _realm;
     std::shared_ptr<AccountFiles> _files;
 };
 
 }  // namespace
 
-DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile) {
+DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile, std::string kerberosRealm, std::string name) {
     auto files = std::make_shared<AccountFiles>(std::move(uuidFile));
-    return {std::string(localAccountsNodeName),
-            [files](Error* /*error*/) { return std::make_unique<LocalAccountsNode>(files); }};
+    return {name, [files, realm = std::move(kerberosRealm), name] {
+                return std::make_unique<LocalAccountsNode>(files, realm, name);
+            }};
 }
 
 }  // namespace adminhost

@@ -11,6 +11,7 @@
 #include "platform/framework/Export.h"
 
 #include <optional>
+#include <string>
 #include <string_view>
 
 namespace adminhost {
@@ -20,7 +21,9 @@ inline constexpr std::string_view localAccountsNodeName = "/Local";
 /// The source of the node. All nodes opened from one source share one pass over the accounts as long as the files do
 /// not change. With a file of UUIDs ("user:NAME UUID" or "group:NAME UUID" on each line), an account has the UUID in
 /// that file or none, and a query fails if the file cannot be read. Without such a file, accounts have name-based
-/// UUIDs.
-[[nodiscard]] ADMINHOST_EXPORT DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile = std::nullopt);
+/// UUIDs. With a Kerberos realm, each user has the authentication authority of the principal NAME@REALM.
+[[nodiscard]] ADMINHOST_EXPORT DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile = std::nullopt,
+                                                                 std::string kerberosRealm = {},
+                                                                 std::string name = std::string(localAccountsNodeName));
 
 }  // namespace adminhost

@@ -7,28 +7,15 @@
 namespace adminhost {
 namespace {
 
-/// The first record that any node has; a node that fails is skipped.
-std::optional<DirectoryRecord> firstRecord(const DirectoryQuery& query) {
-    for (const DirectoryNodeSource& source : DirectorySession::defaultSession().nodes()) {
-        const auto node = source.open(nullptr);
-        auto records = node ? node->records(query) : std::nullopt;
-        if (records && !records->empty()) {
-            return std::move(records->front());
-        }
+/// The number of which this is the decimal text.
+std::optional<std::uint32_t> numberOf(const std::string* text) {
+    if (text == nullptr) {
+        return std::nullopt;
     }
-    return std::nullopt;
-}
-
-std::optional<std::string> nameWithId(std::string_view type, std::string_view attribute, std::uint32_t id) {
-    DirectoryQuery query;
-    query.recordTypes = {std::string(type)};
-    query.attribute = attribute;
-    query.values = {std::to_string(id)};
-    query.attributes = {std::string(directory::recordName)};
-    query.maximum = 1;
-    const auto record = firstRecord(query);
-    const std::string* name = record ? record->first(directory::recordName) : nullptr;
-    return name == nullptr ? std::nullopt : std::optional(*name);
+    std::uint32_t number = 0;
+    const char* end = text->data() + text->size();
+    const auto [last, status] = std::from_chars(text->data(), end, number);
+    return status == std::errc() && last == end ? std::optional(number) : std::nullopt;
 }
 
 }  // namespace
@@ -37,35 +24,53 @@ std::optional<Uuid> mbr_string_to_uuid(std::string_view text) noexcept {
     return uuidOf(text);
 }
 
-std::optional<PosixId> mbr_uuid_to_id(const Uuid& uuid) {
+Result<std::optional<PosixId>> mbr_uuid_to_id(const Uuid& uuid) {
     DirectoryQuery query;
     query.recordTypes = {std::string(directory::users), std::string(directory::groups)};
     query.attribute = directory::generatedUID;
     query.values = {textOf(uuid)};
     query.attributes = {std::string(directory::uniqueID), std::string(directory::primaryGroupID)};
     query.maximum = 1;
-    const auto record = firstRecord(query);
-    if (!record) {
-        return std::nullopt;
+    std::optional<Error> error;
+    for (const DirectoryNodeSource& source : DirectorySession::defaultSession().nodes()) {
+        const auto node = source.open();
+        const auto records = node ? (*node)->records(query) : failure(node.error());
+        if (!records) {
+            error = error ? error : records.error();
+            continue;
+        }
+        if (records->empty()) {
+            continue;
+        }
+        const DirectoryRecord& record = records->front();
+        const bool isUser = record.type == directory::users;
+        const auto id = numberOf(record.first(isUser ? directory::uniqueID : directory::primaryGroupID));
+        if (!id) {
+            return std::nullopt;
+        }
+        return PosixId{*id, isUser ? PosixId::Kind::user : PosixId::Kind::group, source.name};
     }
-    PosixId result;
-    result.kind = record->type == directory::users ? PosixId::Kind::user : PosixId::Kind::group;
-    const std::string* text =
-        record->first(result.kind == PosixId::Kind::user ? directory::uniqueID : directory::primaryGroupID);
-    if (text == nullptr) {
-        return std::nullopt;
+    if (error) {
+        return failure(*error);
     }
-    const char* end = text->data() + text->size();
-    const auto [last, status] = std::from_chars(text->data(), end, result.id);
-    return status == std::errc() && last == end ? std::optional(result) : std::nullopt;
+    return std::nullopt;
 }
 
-std::optional<std::string> userNameOf(std::uint32_t userId) {
-    return nameWithId(directory::users, directory::uniqueID, userId);
-}
-
-std::optional<std::string> groupNameOf(std::uint32_t groupId) {
-    return nameWithId(directory::groups, directory::primaryGroupID, groupId);
+Result<std::optional<std::string>> nameOf(const PosixId& id) {
+    const bool isUser = id.kind == PosixId::Kind::user;
+    DirectoryQuery query;
+    query.recordTypes = {std::string(isUser ? directory::users : directory::groups)};
+    query.attribute = isUser ? directory::uniqueID : directory::primaryGroupID;
+    query.values = {std::to_string(id.id)};
+    query.attributes = {std::string(directory::recordName)};
+    query.maximum = 1;
+    const auto node = DirectorySession::defaultSession().openNode(id.node);
+    const auto records = node ? (*node)->records(query) : failure(node.error());
+    if (!records) {
+        return failure(records.error());
+    }
+    const std::string* name = records->empty() ? nullptr : records->front().first(directory::recordName);
+    return name == nullptr ? std::nullopt : std::optional(*name);
 }
 
 }  // namespace adminhost

@@ -1,3 +1,5 @@
 find_package(OpenSSL REQUIRED)
 find_package(ICU REQUIRED COMPONENTS uc)
-target_link_libraries(adminhost PRIVATE OpenSSL::Crypto ICU::uc)
+pkg_check_modules(LDAP REQUIRED IMPORTED_TARGET ldap lber)
+pkg_check_modules(KRB5_GSSAPI REQUIRED IMPORTED_TARGET krb5-gssapi krb5)
+target_link_libraries(adminhost PRIVATE OpenSSL::Crypto ICU::uc PkgConfig::LDAP PkgConfig::KRB5_GSSAPI)

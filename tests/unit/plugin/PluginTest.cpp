@@ -102,8 +102,7 @@ TEST_F(PluginTable, ExceptionInsideAnOperationReachesTheHost) {
              "create table cameras(id integer primary key,name,uuid,create_user_uuid,created_at,update_user_uuid,"
              "updated_at,last_recording_uuid,use_user_uuid,used_at,recording_status,access_control_enabled,disabled);"
              "insert into cameras(use_user_uuid) values('A');");
-    setDirectoryNodes(
-        {{"/Broken", [](Error*) -> std::unique_ptr<DirectoryNode> { throw std::runtime_error("no memory"); }}});
+    setDirectoryNodes({{"/Broken", []() -> OpenedDirectoryNode { throw std::runtime_error("no memory"); }}});
     EXPECT_THROW(static_cast<void>(plugin->perform("getCameras", {})), std::runtime_error);
 }
 

@@ -20,12 +20,11 @@ class FixedNode final : public adminhost::DirectoryNode {
   public:
     explicit FixedNode(std::optional<std::vector<DirectoryRecord>> records) : _records(std::move(records)) {}
     [[nodiscard]] const std::string& name() const noexcept override { return _name; }
-    [[nodiscard]] std::optional<std::vector<DirectoryRecord>> records(const adminhost::DirectoryQuery&,
-                                                                      Error* error) override {
-        if (!_records && error != nullptr) {
-            *error = Error{"directory", 9, "the directory is away"};
+    [[nodiscard]] adminhost::Result<std::vector<DirectoryRecord>> records(const adminhost::DirectoryQuery&) override {
+        if (!_records) {
+            return adminhost::failure(Error{"directory", 9, "the directory is away"});
         }
-        return _records;
+        return *_records;
     }
 
   private:
@@ -46,7 +45,7 @@ inline DirectoryRecord record(std::string_view type, std::string_view name, std:
 /// The directory returns these records for every query; without records, queries fail. Set the nodes again afterwards.
 inline void useDirectory(std::optional<std::vector<DirectoryRecord>> records) {
     adminhost::setDirectoryNodes(
-        {{"/Fixed", [records = std::move(records)](Error*) { return std::make_unique<FixedNode>(records); }}});
+        {{"/Fixed", [records = std::move(records)] { return std::make_unique<FixedNode>(records); }}});
 }
 
 }  // namespace lumio

@@ -19,13 +19,16 @@ class Entries : public testing::Test {
             "Andi:x:1003:1000::/:\nroot:x:0:0:root:/root:\ntoor:x:0:0::/:\n");
         _root.groups("root:x:0:\nanimators:x:2000:anna\nbert:x:2001:\n");
     }
-    static std::vector<std::string> shortNames(const std::optional<Array>& entries) {
+    static std::vector<std::string> shortNames(const Result<Array>& entries) {
         std::vector<std::string> names;
         for (const Value& entry : entries.value_or(Array())) {
             names.push_back(*entry.dictionary()->get("shortName").string());
         }
         return names;
     }
+
+    static PosixId user(std::uint32_t id) { return {id, PosixId::Kind::user, "/Local"}; }
+    static PosixId group(std::uint32_t id) { return {id, PosixId::Kind::group, "/Local"}; }
 
     TemporaryAccounts _root;
 };
@@ -71,10 +74,11 @@ TEST_F(Entries, EmptyTextFindsAll) {
 
 TEST_F(Entries, DirectoryThatFailsIsAnError) {
     std::filesystem::remove(_root.path("etc/passwd"));
-    Error error;
-    EXPECT_FALSE(directoryEntries("an", 0, &error));
-    EXPECT_EQ(error.code, ENOENT);
-    EXPECT_FALSE(directoryEntriesOf("anna", &error));
+    const auto entries = directoryEntries("an", 0);
+    ASSERT_FALSE(entries);
+    EXPECT_EQ(entries.error().code, ENOENT);
+    EXPECT_FALSE(directoryEntriesOf("anna"));
+    EXPECT_FALSE(directoryGroupsOf("anna"));
 }
 
 TEST_F(Entries, NameOrUuidIsFoundWithItsNode) {
@@ -91,28 +95,38 @@ TEST_F(Entries, NameOrUuidIsFoundWithItsNode) {
 TEST_F(Entries, MembershipMapsUuidsToIdsWithTheirKind) {
     const auto uuid = mbr_string_to_uuid("81cef789-6423-555f-bb64-f7bd915968d3");
     ASSERT_TRUE(uuid);
-    EXPECT_EQ(mbr_uuid_to_id(*uuid), (PosixId{1001, PosixId::Kind::user}));
-    EXPECT_EQ(mbr_uuid_to_id(nameBasedUuid(localAccountsNamespace, "group:animators")),
-              (PosixId{2000, PosixId::Kind::group}));
+    EXPECT_EQ(mbr_uuid_to_id(*uuid).value(), (PosixId{1001, PosixId::Kind::user, "/Local"}));
+    EXPECT_EQ(mbr_uuid_to_id(nameBasedUuid(localAccountsNamespace, "group:animators")).value(),
+              (PosixId{2000, PosixId::Kind::group, "/Local"}));
     EXPECT_EQ(static_cast<int>(PosixId::Kind::user), 0);
     EXPECT_EQ(static_cast<int>(PosixId::Kind::group), 1);
-    EXPECT_FALSE(mbr_uuid_to_id(nameBasedUuid(localAccountsNamespace, "user:gone")));
+    EXPECT_FALSE(mbr_uuid_to_id(nameBasedUuid(localAccountsNamespace, "user:gone")).value());
     EXPECT_FALSE(mbr_string_to_uuid("garbage"));
 }
 
-TEST_F(Entries, MembershipOfAnUnreadableDirectoryIsNotFound) {
+TEST_F(Entries, MembershipOfAnUnreadableDirectoryIsItsError) {
     std::filesystem::remove(_root.path("etc/passwd"));
-    EXPECT_FALSE(mbr_uuid_to_id(*mbr_string_to_uuid("81cef789-6423-555f-bb64-f7bd915968d3")));
-    EXPECT_FALSE(userNameOf(1001));
-    EXPECT_EQ(groupNameOf(2000), "animators");
+    const auto id = mbr_uuid_to_id(*mbr_string_to_uuid("81cef789-6423-555f-bb64-f7bd915968d3"));
+    ASSERT_FALSE(id);
+    EXPECT_EQ(id.error().code, ENOENT);
+    EXPECT_FALSE(nameOf(user(1001)));
+    EXPECT_EQ(nameOf(group(2000)).value(), "animators");
 }
 
 TEST_F(Entries, NamesOfIdsComeFromTheAccountsBelowTheSystemRootTheFirstOfSeveral) {
-    EXPECT_EQ(userNameOf(1001), "anna");
-    EXPECT_EQ(userNameOf(0), "root");
-    EXPECT_EQ(groupNameOf(2000), "animators");
-    EXPECT_FALSE(userNameOf(4711));
-    EXPECT_FALSE(groupNameOf(1001)) << "a user's id is no group's";
+    EXPECT_EQ(nameOf(user(1001)).value(), "anna");
+    EXPECT_EQ(nameOf(user(0)).value(), "root");
+    EXPECT_EQ(nameOf(group(2000)).value(), "animators");
+    EXPECT_FALSE(nameOf(user(4711)).value());
+    EXPECT_FALSE(nameOf(group(1001)).value()) << "a user's id is no group's";
+}
+
+TEST_F(Entries, GroupsOfAPersonAreThoseThatListTheLoginAndThePrimaryGroup) {
+    _root.groups("staff:x:1000:\nanimators:x:2000:bo,anna\nbert:x:2001:annabel\n");
+    EXPECT_THAT(shortNames(directoryGroupsOf("anna")), ElementsAre("staff", "animators"));
+    EXPECT_THAT(shortNames(directoryGroupsOf("81CEF789-6423-555F-BB64-F7BD915968D3")),
+                ElementsAre("staff", "animators"));
+    EXPECT_THAT(shortNames(directoryGroupsOf("animators")), IsEmpty()) << "a group is not a person";
 }
 
 }  // namespace

@@ -46,11 +46,8 @@ class LocalAccounts : public testing::Test {
     }
 
     std::vector<DirectoryRecord> found(const DirectoryQuery& query) {
-        Error error;
-        const auto node =
-            DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode, &error);
-        auto records = node ? node->records(query, &error) : std::nullopt;
-        EXPECT_TRUE(records) << error.description.value_or("no description");
+        auto records = searchDirectory(query);
+        EXPECT_TRUE(records) << (records ? "" : records.error().description.value_or("no description"));
         return records.value_or(std::vector<DirectoryRecord>());
     }
     std::vector<std::string> names(const DirectoryQuery& query) {
@@ -61,13 +58,8 @@ class LocalAccounts : public testing::Test {
         return all;
     }
     std::optional<Error> failure(const DirectoryQuery& query) {
-        Error error;
-        const auto node =
-            DirectorySession::defaultSession().openNode(DirectorySession::authenticationSearchNode, &error);
-        if (node && node->records(query, &error)) {
-            return std::nullopt;
-        }
-        return error;
+        const auto records = searchDirectory(query);
+        return records ? std::nullopt : std::optional(records.error());
     }
 
     TemporaryAccounts _root;
@@ -282,26 +274,29 @@ TEST_F(LocalAccounts, HundredThousandAccountsAreFoundByUuidIdAndName) {
 
 TEST_F(LocalAccounts, UnknownNodeTypeAndUnknownNodeAreErrors) {
     const DirectorySession& session = DirectorySession::defaultSession();
-    Error error;
-    EXPECT_EQ(session.openNode(0x2202U, &error), nullptr);
-    EXPECT_EQ(error.code, directory::noSuchNode);
-    EXPECT_THAT(error.description.value_or(""), HasSubstr("0x2202"));
-    EXPECT_EQ(session.openNode("/Nowhere", &error), nullptr);
-    EXPECT_THAT(error.description.value_or(""), HasSubstr("/Nowhere"));
-    EXPECT_NE(session.openNode("/Local"), nullptr);
-    EXPECT_EQ(session.openNode("/Search")->name(), "/Search");
+    const auto unknownType = session.openNode(0x2202U);
+    ASSERT_FALSE(unknownType);
+    EXPECT_EQ(unknownType.error().code, directory::noSuchNode);
+    EXPECT_THAT(unknownType.error().description.value_or(""), HasSubstr("0x2202"));
+    const auto unknownName = session.openNode("/Nowhere");
+    ASSERT_FALSE(unknownName);
+    EXPECT_THAT(unknownName.error().description.value_or(""), HasSubstr("/Nowhere"));
+    EXPECT_EQ(session.openNode("/Local").value()->name(), "/Local");
+    EXPECT_EQ(session.openNode("/Search").value()->name(), "/Search");
 }
 
 TEST_F(LocalAccounts, ChangesAreNotSupported) {
-    const auto node = DirectorySession::defaultSession().openNode("/Local");
-    ASSERT_NE(node, nullptr);
-    for (const auto& error :
-         {node->authenticate("root", "secret"), node->createRecord(directory::users, "new", {}),
-          node->deleteRecord(directory::users, "anna"), node->setPassword(directory::users, "anna", "secret")}) {
-        ASSERT_TRUE(error);
-        EXPECT_EQ(error->code, directory::notSupported);
-        EXPECT_THAT(error->description.value_or(""), HasSubstr("not supported by the directory node /Local"));
-        EXPECT_THAT(error->description.value_or(""), Not(HasSubstr("secret")));
+    const auto opened = DirectorySession::defaultSession().openNode("/Local");
+    ASSERT_TRUE(opened);
+    DirectoryNode& node = **opened;
+    const auto errorOf = [](const auto& result) { return result ? Error() : result.error(); };
+    for (const Error& error :
+         {errorOf(node.authenticate("root", "secret")), errorOf(node.createRecord(directory::users, "new", {})),
+          errorOf(node.deleteRecord(directory::users, "anna")),
+          errorOf(node.setPassword(directory::users, "anna", "secret"))}) {
+        EXPECT_EQ(error.code, directory::notSupported);
+        EXPECT_THAT(error.description.value_or(""), HasSubstr("not supported by the directory node /Local"));
+        EXPECT_THAT(error.description.value_or(""), Not(HasSubstr("secret")));
     }
 }
 
@@ -312,10 +307,9 @@ class FixedNode : public DirectoryNode {
     FixedNode(std::string name, std::optional<std::vector<std::string>> logins)
         : _name(std::move(name)), _logins(std::move(logins)) {}
     const std::string& name() const noexcept override { return _name; }
-    std::optional<std::vector<DirectoryRecord>> records(const DirectoryQuery& query, Error* error) override {
+    Result<std::vector<DirectoryRecord>> records(const DirectoryQuery& query) override {
         if (!_logins) {
-            *error = Error{"ldap", -1, "server down"};
-            return std::nullopt;
+            return adminhost::failure(Error{"ldap", -1, "server down"});
         }
         std::vector<DirectoryRecord> records;
         for (const std::string& login : *_logins) {
@@ -335,7 +329,7 @@ class FixedNode : public DirectoryNode {
 };
 
 DirectoryNodeSource fixedNode(const std::string& name, const std::optional<std::vector<std::string>>& logins) {
-    return {name, [=](Error*) { return std::make_unique<FixedNode>(name, logins); }};
+    return {name, [=] { return std::make_unique<FixedNode>(name, logins); }};
 }
 
 TEST_F(LocalAccounts, SearchNodeAsksAllNodesInOrderUpToTheMaximum) {
@@ -354,11 +348,20 @@ TEST_F(LocalAccounts, SearchNodeFailsWithTheNodeThatFails) {
 }
 
 TEST_F(LocalAccounts, NodeThatCannotBeOpenedFailsTheSearchNode) {
-    setDirectoryNodes({{"/LDAP", [](Error* error) {
-                            *error = Error{"ldap", -2, "no ticket"};
-                            return std::unique_ptr<DirectoryNode>();
+    setDirectoryNodes({{"/LDAP", []() -> OpenedDirectoryNode {
+                            return adminhost::failure(Error{"ldap", -2, "no ticket"});
                         }}});
     EXPECT_EQ(failure(queryFor(directory::recordName, {"anna"})), (Error{"ldap", -2, "no ticket"}));
+}
+
+TEST_F(LocalAccounts, UsersHaveAPrincipalInTheRealmIfThereIsOne) {
+    EXPECT_EQ(found(queryFor(directory::recordName, {"anna"})).at(0).first(directory::authenticationAuthority),
+              nullptr);
+    setDirectoryNodes({localAccounts(std::nullopt, "NIMBO.TEST")});
+    EXPECT_THAT(found(queryFor(directory::recordName, {"anna"})).at(0).values(directory::authenticationAuthority),
+                ElementsAre(";Kerberosv5;;anna@NIMBO.TEST;NIMBO.TEST;"));
+    EXPECT_EQ(found(queryFor(directory::recordName, {"editors"})).at(0).first(directory::authenticationAuthority),
+              nullptr);
 }
 
 // UUIDs given by a file.
@@ -431,8 +434,8 @@ TEST_F(LocalAccounts, ThousandLookUpsShareOnePass) {
     settle(files);
     const std::size_t before = files.passes();
     for (int i = 0; i < 1000; ++i) {
-        ASSERT_EQ(files.table(AccountKind::user)->withUuid(*uuidOf(annaUuid)).size(), 1U);
-        ASSERT_EQ(files.table(AccountKind::group)->withUuid(*uuidOf(editorsUuid)).size(), 1U);
+        ASSERT_EQ(files.table(AccountKind::user).value()->withUuid(*uuidOf(annaUuid)).size(), 1U);
+        ASSERT_EQ(files.table(AccountKind::group).value()->withUuid(*uuidOf(editorsUuid)).size(), 1U);
     }
     EXPECT_EQ(files.passes(), before);
 }
@@ -441,12 +444,12 @@ TEST_F(LocalAccounts, ChangedAccountsAreSeenAtTheNextLookUp) {
     AccountFiles files;
     settle(files);
     _root.users("bert:x:1001:1000:Bert Berg,Room 4,,:/home/bert:/bin/zsh\n");
-    EXPECT_EQ(files.table(AccountKind::user)->named("anna").size(), 0U);
-    EXPECT_EQ(files.table(AccountKind::user)->named("bert").size(), 1U);
+    EXPECT_EQ(files.table(AccountKind::user).value()->named("anna").size(), 0U);
+    EXPECT_EQ(files.table(AccountKind::user).value()->named("bert").size(), 1U);
     // The same length at once again: the time stamps may be the same.
     for (const char* name : {"carl", "dora", "emil", "fred"}) {
         _root.users(std::string(name) + ":x:1001:1000:Bert Berg,Room 4,,:/home/bert:/bin/zsh\n");
-        EXPECT_EQ(files.table(AccountKind::user)->named(name).size(), 1U) << name;
+        EXPECT_EQ(files.table(AccountKind::user).value()->named(name).size(), 1U) << name;
     }
 }
 
@@ -455,7 +458,7 @@ TEST_F(LocalAccounts, OtherSystemRootIsSeenAtTheNextLookUp) {
     settle(files);
     TemporaryAccounts other;
     other.users("bo:x:3:1::/:\n");
-    EXPECT_EQ(files.table(AccountKind::user)->named("bo").size(), 1U);
+    EXPECT_EQ(files.table(AccountKind::user).value()->named("bo").size(), 1U);
 }
 
 }  // namespace
