@@ -47,7 +47,7 @@ ACCESS = {
     "account": "It handles accounts and their passwords.",
 }
 
-COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline_seconds", "shows_revision", "takes_revision", "state", "parts", "available",
+COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline_seconds", "shows_revision", "takes_revision", "state", "parts",
                  "errors", "keys", "answer", "include", "example"}
 # Words for programs that compare and write a desired state (README.md).
 STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_file", "kind", "kinds", "secret_if", "file",
@@ -412,8 +412,6 @@ def docs(commands):
     for name, command in commands.items():
         described = describe(name, command)
         out += ["", f"## {name}", "", command.get("description", command["summary"]).strip(), ""]
-        if not command.get("available", True):
-            out += ["Not served by this release: it answers the error `NOT_AVAILABLE`.", ""]
         notes = [text for flag, text in (
             ("shows_revision", "Its answer carries the settings' revision."),
             ("takes_revision", "It can be made to depend on the revision that was read."),

@@ -48,15 +48,29 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     /// status.
     [[nodiscard]] Response writeSettingsWithRequest(const Dictionary& request);
 
-    // Service state and control; the variant may be null
+    // Service state and control (State.cpp); the variant may be null
 
+    /// "state" with two version numbers, and the details if "variant" is "withDetails". What cannot be found out is
+    /// absent, or counts as 0: this is never an error.
     [[nodiscard]] Response getStateWithRequest(const Dictionary& request);
+    /// The paths of the service's log files by name.
     [[nodiscard]] Response getLogPathsWithRequest(const Dictionary& request);
+    /// No response, or the error "CANNOT_START_SERVICE_ERR". The variant is not read.
     [[nodiscard]] Response startServiceWithVariant(const Value& variant);
+    /// The state, with "state" always "STOPPED", or the error "CANNOT_STOP_SERVICE_ERR".
     [[nodiscard]] Response stopServiceWithVariant(const Value& variant);
     /// Does nothing and returns no response.
     [[nodiscard]] Response recycleServiceWithVariant(const Value& variant);
+
+    // Settings that depend on the outside world (Validation.cpp)
+
+    /// Tries the proposed shared file system and grid controller, each if it is given. Every failure is an error key.
     [[nodiscard]] Response validateSettingsWithRequest(const Dictionary& request);
+
+    // The grid's account (GridAccount.cpp)
+
+    /// Creates the account in a directory node, in place of an earlier one of this server, and returns its name and
+    /// password, or "errorCode" and "error". Nothing that was done before a failure is undone.
     [[nodiscard]] Response createNimboAccountWithRequest(const Dictionary& request);
 
     // Resources (ResourceRequests.cpp)
@@ -117,8 +131,43 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     void netService(const adminhost::NetService& service, const Dictionary& didNotResolve);
     void netServiceDidStop(const adminhost::NetService& service);
 
+    // Pieces of the state
+
+    /// "kNotConfigured" if a value is missing; an empty one is not. Else runs checkNimboController().
+    [[nodiscard]] std::string_view getStateOfNimboController(const std::optional<std::string>& controller,
+                                                             const std::optional<std::string>& username,
+                                                             const std::optional<std::string>& password);
+    /// "kNotConfigured" without a path. Else runs validateSharedFilesystem().
+    [[nodiscard]] std::string_view getStateOfSharedFileSystemPath(const std::optional<std::string>& path,
+                                                                  const std::optional<std::string>& owner);
+    /// In bytes.
+    [[nodiscard]] static std::optional<std::uint64_t> getFreeSpaceOfSharedFileSystem(
+        const std::optional<std::string>& path);
+    /// The creation date of the service's pid file.
+    [[nodiscard]] static std::optional<adminhost::Date> getStartTime();
+    // Numbers of grid jobs. A failure is logged and counts 0.
+    [[nodiscard]] static std::uint64_t getTotalJobs();
+    [[nodiscard]] static std::uint64_t getRunningJobs();
     /// "updated_at", "created_at", "used_at": the resources' own date keys. No operation calls it.
     [[nodiscard]] static std::vector<std::string_view> listOfResourceDateKeys();
+
+    // Checks
+
+    /// Creates a file in the directory, gives it to the owner (null: leaves its owner) and removes it. Returns 0, or
+    /// the step that failed: 1 the path is not a directory, 2 creating, 3 changing the owner, 4 removing.
+    [[nodiscard]] std::uint32_t validateSharedFilesystem(const std::string& path,
+                                                         const std::optional<std::string>& owner);
+    /// Gets a Kerberos ticket for the account and lists the controller's grids with it (ControllerCheck.cpp). Returns
+    /// 0 if there is a grid; 1 if the directory names no principal for the account; 2 if the tool printed no grid; 3 if
+    /// no ticket had to be acquired or the cache cannot be used; else the grid tool's status. `error` receives the
+    /// tool's error output. No ticket is left.
+    [[nodiscard]] std::int32_t checkNimboController(const std::string& controller, const std::string& username,
+                                                    std::string_view password, std::string* error);
+    /// The values of one attribute of a user's record; nullopt if there is none, or if the directory fails.
+    [[nodiscard]] static std::optional<std::vector<std::string>> getAttribute(std::string_view attribute,
+                                                                              const std::string& username);
+    /// The tickets of a running checkNimboController(). A worker that is killed may leave the file.
+    [[nodiscard]] static adminhost::HostPath credentialCachePath();
 
   private:
     /// Runs the setup scripts and writes the three files, up to the first step that fails. Returns the status of the

@@ -170,6 +170,8 @@ class LumioPlugin final : public adminhost::Plugin {
                 LumioRequestHandler::memberPreferencesPath()};
     }
 
+    std::vector<adminhost::HostPath> leftovers() override { return {LumioRequestHandler::credentialCachePath()}; }
+
     std::vector<adminhost::ToolFile> toolFiles() override { return {lumio::databaseToolStartFile()}; }
 
   private:

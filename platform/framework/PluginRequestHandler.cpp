@@ -26,7 +26,6 @@ Response PluginRequestHandler::responseForError(std::string_view code) const {
     constexpr Known known[] = {
         {"CANNOT_START_SERVICE_ERR", "The service could not be started. Its startup log says why."},
         {"CANNOT_STOP_SERVICE_ERR", "The service could not be stopped. Its log says why."},
-        {"NOT_AVAILABLE", "This release does not offer the command yet."},
         {"INTERNAL_ERROR", "The operation failed inside the plug-in. The log lines of this request say why."},
     };
     for (const Known& entry : known) {

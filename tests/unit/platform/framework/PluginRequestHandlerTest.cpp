@@ -29,8 +29,7 @@ TEST(Response, EmptyDictionaryIsNotNothing) {
 
 TEST(PluginRequestHandler, ErrorResponseHasCodeAndASentence) {
     const PluginRequestHandler handler;
-    for (const char* code :
-         {"CANNOT_START_SERVICE_ERR", "CANNOT_STOP_SERVICE_ERR", "NOT_AVAILABLE", "INTERNAL_ERROR"}) {
+    for (const char* code : {"CANNOT_START_SERVICE_ERR", "CANNOT_STOP_SERVICE_ERR", "INTERNAL_ERROR"}) {
         const Response response = handler.responseForError(code);
         EXPECT_EQ(response.kind(), Response::Kind::error);
         EXPECT_EQ(response.dictionary().get("error"), Value(code));
