@@ -47,6 +47,12 @@ void OperationQueue::addTo(std::vector<pollfd>& entries) const {
     for (const auto& worker : _dying) {
         worker->addTo(entries);
     }
+    _directoryProbe.addTo(entries);
+}
+
+std::optional<OperationQueue::Clock::time_point> OperationQueue::due() const {
+    const auto other = _directoryProbe.due();
+    return _due && other ? std::min(_due, other) : _due ? _due : other;
 }
 
 void OperationQueue::start() {
@@ -84,6 +90,7 @@ void OperationQueue::run(std::span<const pollfd> polled) {
     if (_worker) {
         converse(polled);
     }
+    _directoryProbe.run(polled, _events.log);
     std::erase_if(_dying, [&](const auto& worker) { return worker->mayHaveEnded(polled) && worker->ending(); });
     if (_due && Clock::now() >= *_due) {
         timeUp();
@@ -154,6 +161,7 @@ bool OperationQueue::take(protocol::Hello hello) {
     _settled = true;
     _due.reset();
     _pause = 0ms;
+    _directoryProbe.start(_settings.configuration, _settings.outputToStandardError);
     next();
     return true;
 }

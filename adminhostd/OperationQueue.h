@@ -7,6 +7,7 @@
 // worker runs the others. If a worker does not even start, all waiting operations fail, and the next start follows
 // after a pause that grows.
 
+#include "adminhostd/DirectoryProbe.h"
 #include "adminhostd/Protocol.h"
 #include "adminhostd/RequestLog.h"
 #include "adminhostd/WorkerProcess.h"
@@ -83,7 +84,7 @@ class OperationQueue {
     [[nodiscard]] bool stopped() const noexcept { return _stopping && !_running; }
 
     void addTo(std::vector<pollfd>& entries) const;
-    [[nodiscard]] std::optional<std::chrono::steady_clock::time_point> due() const { return _due; }
+    [[nodiscard]] std::optional<std::chrono::steady_clock::time_point> due() const;
     /// Does everything that needs no waiting. Called after a poll of these entries, to which addTo() has added the
     /// queue's.
     void run(std::span<const pollfd> polled);
@@ -119,6 +120,7 @@ class OperationQueue {
     State _state = State::paused;
     std::unique_ptr<WorkerProcess> _worker;
     std::vector<std::unique_ptr<WorkerProcess>> _dying;  ///< killed, but the kernel has not ended them yet
+    DirectoryProbe _directoryProbe;
     std::deque<Operation> _waiting;
     std::optional<Operation> _running;
     std::optional<Clock::time_point> _changesFrom;  ///< when the lock for changes is to be tried again

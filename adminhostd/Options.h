@@ -2,6 +2,7 @@
 
 // The daemon's options: its command line and its configuration file.
 
+#include "adminhostd/DirectoryOptions.h"
 #include "platform/files/Path.h"
 #include "platform/value/Value.h"
 
@@ -17,11 +18,12 @@ struct Options {
     std::vector<DiskPath> plugins;  ///< instead of the plug-in directory's, if there are any
     HostPath pluginDirectory{"/usr/lib/adminhostd/plugins"};
     HostPath runDirectory{"/run/adminhostd"};
-    std::optional<DiskPath> socket;               ///< instead of the one in the run directory
-    std::string socketGroup;                      ///< empty: the daemon's own
-    std::optional<Array> languages;               ///< instead of those of the environment
-    std::string accountUuids;                     ///< host path of the accounts' UUIDs; empty: name-based ones
-    std::string serviceManager;                   ///< "systemd" or "pidfile"; empty: the platform's default
+    std::optional<DiskPath> socket;  ///< instead of the one in the run directory
+    std::string socketGroup;         ///< empty: the daemon's own
+    std::optional<Array> languages;  ///< instead of those of the environment
+    std::string accountUuids;        ///< host path of the accounts' UUIDs; empty: name-based ones
+    std::string serviceManager;      ///< "systemd" or "pidfile"; empty: the platform's default
+    DirectoryOptions directory;
     std::chrono::milliseconds deadline{300'000};  ///< of one operation
     std::chrono::seconds clientTimeout{30};
     std::size_t queueLimit = 64;
@@ -34,8 +36,8 @@ struct Options {
 /// status.
 [[nodiscard]] std::optional<Options> readOptions(int count, const char* const* arguments, int& status);
 
-/// Applies a configuration file to the options. Throws std::runtime_error with the file, the line, a description and a
-/// suggested fix.
+/// Applies a configuration file to the options. Throws std::runtime_error with the file, the line, the column and a
+/// description.
 void readConfiguration(const std::string& file, Options& options);
 
 /// The languages that the environment names, the preferred one first.

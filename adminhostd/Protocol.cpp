@@ -1,6 +1,9 @@
 #include "adminhostd/Protocol.h"
 
 #include <limits>
+#include <map>
+#include <optional>
+#include <string_view>
 #include <tuple>
 #include <type_traits>
 
@@ -29,14 +32,37 @@ constexpr std::nullptr_t members = nullptr;
 template <>
 constexpr auto members<Caller> = std::tuple(member("caller.uid", &Caller::uid), member("caller.pid", &Caller::pid));
 template <>
-constexpr auto members<Configure> = std::tuple(member("configure.build", &Configure::build),
-                                               member("configure.root", &Configure::root),
-                                               member("configure.accountUuids", &Configure::accountUuids),
-                                               member("configure.serviceManager", &Configure::serviceManager),
-                                               member("configure.plugins", &Configure::plugins),
-                                               member("configure.languages", &Configure::languages),
-                                               member("configure.toolEnvironment", &Configure::toolEnvironment),
-                                               member("configure.tryOnly", &Configure::tryOnly));
+constexpr auto members<Configure> = std::tuple(
+    member("configure.build", &Configure::build), member("configure.root", &Configure::root),
+    member("configure.accountUuids", &Configure::accountUuids),
+    member("configure.serviceManager", &Configure::serviceManager), member("configure.plugins", &Configure::plugins),
+    member("configure.languages", &Configure::languages),
+    member("configure.toolEnvironment", &Configure::toolEnvironment),
+    member("configure.directory", &Configure::directory),
+    member("configure.directoryMilliseconds", &Configure::directoryMilliseconds),
+    member("configure.tryOnly", &Configure::tryOnly), member("configure.probeDirectory", &Configure::probeDirectory));
+template <>
+constexpr auto members<DirectoryNodeOptions> = std::tuple(member("node.local", &DirectoryNodeOptions::local),
+                                                          member("node.settings", &DirectoryNodeOptions::settings),
+                                                          member("node.places", &DirectoryNodeOptions::places));
+template <>
+constexpr auto members<LdapNodeSettings> = std::tuple(
+    member("ldap.name", &LdapNodeSettings::name), member("ldap.uris", &LdapNodeSettings::uris),
+    member("ldap.base", &LdapNodeSettings::base), member("ldap.userBase", &LdapNodeSettings::userBase),
+    member("ldap.groupBase", &LdapNodeSettings::groupBase), member("ldap.userFilter", &LdapNodeSettings::userFilter),
+    member("ldap.groupFilter", &LdapNodeSettings::groupFilter), member("ldap.bindDn", &LdapNodeSettings::bindDn),
+    member("ldap.bindPasswordFile", &LdapNodeSettings::bindPasswordFile),
+    member("ldap.bindPasswordCredential", &LdapNodeSettings::bindPasswordCredential),
+    member("ldap.sasl", &LdapNodeSettings::sasl), member("ldap.certFile", &LdapNodeSettings::certFile),
+    member("ldap.keyFile", &LdapNodeSettings::keyFile), member("ldap.keytab", &LdapNodeSettings::keytab),
+    member("ldap.principal", &LdapNodeSettings::principal), member("ldap.startTls", &LdapNodeSettings::startTls),
+    member("ldap.caFile", &LdapNodeSettings::caFile), member("ldap.verify", &LdapNodeSettings::verify),
+    member("ldap.schema", &LdapNodeSettings::schema), member("ldap.uuidForm", &LdapNodeSettings::uuidForm),
+    member("ldap.kerberosRealm", &LdapNodeSettings::kerberosRealm), member("ldap.userMap", &LdapNodeSettings::userMap),
+    member("ldap.groupMap", &LdapNodeSettings::groupMap), member("ldap.timeout", &LdapNodeSettings::timeout),
+    member("ldap.createBase", &LdapNodeSettings::createBase),
+    member("ldap.objectClasses", &LdapNodeSettings::objectClasses),
+    member("ldap.createAttributes", &LdapNodeSettings::createAttributes));
 template <>
 constexpr auto members<Perform> = std::tuple(
     member("perform.request", &Perform::request), member("perform.plugin", &Perform::plugin),
@@ -101,7 +127,7 @@ constexpr auto members<Answer> = std::tuple(member("answer.outcome", &Answer::ou
 template <class E>
 struct Word {
     E value;
-    const char* text;
+    std::string_view text;
 };
 
 constexpr Word<Outcome> outcomeWords[] = {
@@ -122,6 +148,18 @@ constexpr auto& wordsOf(Outcome) {
 constexpr auto& wordsOf(BodyForm) {
     return formWords;
 }
+constexpr auto& wordsOf(LdapNodeSettings::Sasl) {
+    return saslWords;
+}
+constexpr auto& wordsOf(LdapNodeSettings::Verify) {
+    return verifyWords;
+}
+constexpr auto& wordsOf(LdapNodeSettings::Schema) {
+    return schemaWords;
+}
+constexpr auto& wordsOf(LdapNodeSettings::UuidForm) {
+    return uuidFormWords;
+}
 
 template <class T>
 constexpr bool isStruct = !std::is_same_v<std::remove_cvref_t<decltype(members<T>)>, std::nullptr_t>;
@@ -129,6 +167,14 @@ template <class T>
 constexpr bool isVector = false;
 template <class T>
 constexpr bool isVector<std::vector<T>> = true;
+template <class T>
+constexpr bool isMap = false;
+template <class T>
+constexpr bool isMap<std::map<std::string, T>> = true;
+template <class T>
+constexpr bool isOptional = false;
+template <class T>
+constexpr bool isOptional<std::optional<T>> = true;
 
 // A null Value is an absent member.
 
@@ -147,12 +193,8 @@ Value encoded(Date date) {
 Value encoded(std::chrono::seconds duration) {
     return duration.count();
 }
-Value encoded(const std::map<std::string, std::string>& texts) {
-    Dictionary dictionary;
-    for (const auto& [key, text] : texts) {
-        dictionary.set(key, text);
-    }
-    return dictionary;
+Value encoded(const HostPath& path) {
+    return path.text();
 }
 
 template <class T>
@@ -162,7 +204,7 @@ Value encoded(T message) {
     } else if constexpr (std::is_enum_v<T>) {
         for (const auto& word : wordsOf(message)) {
             if (word.value == message) {
-                return word.text;
+                return std::string(word.text);
             }
         }
         return {};
@@ -173,6 +215,14 @@ Value encoded(T message) {
             array.push_back(encoded(std::move(element)));
         }
         return array;
+    } else if constexpr (isMap<T>) {
+        Dictionary dictionary;
+        for (auto& [key, value] : message) {
+            dictionary.set(key, encoded(std::move(value)));
+        }
+        return dictionary;
+    } else if constexpr (isOptional<T>) {
+        return message ? encoded(*std::move(message)) : Value();
     } else {
         static_assert(isStruct<T>);
         Dictionary dictionary;
@@ -216,25 +266,24 @@ class Decoder {
         into = boolean.value_or(false);
         return boolean.has_value();
     }
-    bool read(Value* found, std::map<std::string, std::string>& into) {
-        const Dictionary* texts = found == nullptr ? nullptr : found->dictionary();
-        if (texts == nullptr) {
-            return false;
-        }
-        for (const DictionaryEntry& entry : *texts) {
-            if (entry.value.string() == nullptr) {
-                return false;
-            }
-            into.emplace(entry.key, *entry.value.string());
-        }
-        return true;
+    bool read(Value* found, HostPath& into) {
+        const std::string* path = found == nullptr ? nullptr : found->string();
+        into = HostPath(path == nullptr ? std::string() : *path);
+        return path != nullptr;
     }
 
     template <class T>
     bool read(Value* found, T& into) {
-        if (found == nullptr) {
-            return false;
+        if constexpr (isOptional<T>) {
+            return found == nullptr || read(found, into.emplace());
+        } else {
+            return found != nullptr && readPresent(found, into);
         }
+    }
+
+  private:
+    template <class T>
+    bool readPresent(Value* found, T& into) {
         if constexpr (std::is_integral_v<T>) {
             return readNumber(*found, into);
         } else if constexpr (std::is_enum_v<T>) {
@@ -250,8 +299,21 @@ class Decoder {
             if (array == nullptr) {
                 return false;
             }
+            into.clear();
             for (Value& element : *array) {
                 if (!read(&element, into.emplace_back())) {
+                    return false;
+                }
+            }
+            return true;
+        } else if constexpr (isMap<T>) {
+            Dictionary* dictionary = found->dictionary();
+            if (dictionary == nullptr) {
+                return false;
+            }
+            into.clear();
+            for (const DictionaryEntry& entry : *dictionary) {
+                if (!read(dictionary->find(entry.key), into[entry.key])) {
                     return false;
                 }
             }
@@ -262,7 +324,6 @@ class Decoder {
         }
     }
 
-  private:
     template <class T>
     static bool take(T* found, T& into) {
         if (found == nullptr) {

@@ -6,6 +6,7 @@
 // strict: an unknown word, a missing or surplus member and a value of another type are errors, and a peer that sent
 // them is ended.
 
+#include "adminhostd/DirectoryOptions.h"
 #include "adminhostd/Frame.h"
 #include "adminhostd/RequestBody.h"
 #include "platform/framework/Plugin.h"
@@ -47,7 +48,7 @@ struct Caller {
 
 // From the front to the worker.
 
-/// First, and once.
+/// First, and once. The nodes have no credentialsDirectory: the worker knows it.
 struct Configure {
     std::string build;  ///< the front's; must be the worker's
     std::string root;
@@ -56,7 +57,10 @@ struct Configure {
     std::vector<std::string> plugins;
     std::vector<std::string> languages;
     std::map<std::string, std::string> toolEnvironment;
-    bool tryOnly = false;  ///< only to see what loads: nothing is cleaned up
+    std::vector<DirectoryNodeOptions> directory;  ///< empty: the accounts of this machine
+    std::uint64_t directoryMilliseconds = 0;      ///< for all directory work of a request
+    bool tryOnly = false;                         ///< only to see what loads: nothing is cleaned up
+    bool probeDirectory = false;                  ///< only to log the nodes that cannot be reached: no Hello
     bool operator==(const Configure&) const = default;
 };
 
@@ -108,7 +112,7 @@ struct RefusedPlugin {
     bool operator==(const RefusedPlugin&) const = default;
 };
 
-/// The reply to Configure.
+/// The reply to Configure, unless that has probeDirectory.
 struct Hello {
     std::vector<OfferedPlugin> plugins;
     std::vector<RefusedPlugin> refused;

@@ -10,9 +10,9 @@
 #include "adminhostd/Protocol.h"
 #include "adminhostd/SettingsHistory.h"
 #include "adminhostd/ToolConfiguration.h"
+#include "adminhostd/WorkerDirectory.h"
 #include "adminhostd/WriteLock.h"
-#include "platform/directory/Entries.h"
-#include "platform/directory/LocalAccounts.h"
+#include "platform/directory/DirectoryRequest.h"
 #include "platform/files/Path.h"
 #include "platform/files/ReplaceFile.h"
 #include "platform/framework/Report.h"
@@ -66,6 +66,7 @@ class Worker {
     std::optional<int> serve(protocol::ToWorker message);
     protocol::Hello configure(const protocol::Configure& configuration);
     void load(const DiskPath& file, protocol::Hello& hello);
+    static void probeDirectory(const protocol::Configure& configuration);
     /// Runs once, and only in a worker that holds the lock for changes: another process may be writing a file that
     /// looks left over.
     void removeLeftovers();
@@ -89,6 +90,7 @@ class Worker {
     FrameReader _reader;
     std::vector<std::string> _languages;
     std::map<std::string, std::string> _toolEnvironment;
+    std::chrono::milliseconds _directoryTime{};  ///< for all directory work of a request
     std::vector<LoadedPlugin> _plugins;
     FileDescriptor _toolConfiguration;  ///< open: the directory stays if the front is killed and another one starts
     bool _leftoversRemoved = false;
@@ -102,12 +104,18 @@ protocol::Answer broken(std::string message) {
     return answer;
 }
 
+/// The plug-in's description of a command; null if it has none of the name.
+const Command* commandOf(const LoadedPlugin& loaded, const std::string& name) {
+    const auto command = std::find_if(loaded.commands.begin(), loaded.commands.end(),
+                                      [&](const Command& one) { return one.name == name; });
+    return command == loaded.commands.end() ? nullptr : &*command;
+}
+
 /// Returns true if a command may change something: also one that the plug-in does not name, because it is not known to
 /// only read.
 bool changes(const LoadedPlugin& loaded, const std::string& name) {
-    const auto command = std::find_if(loaded.commands.begin(), loaded.commands.end(),
-                                      [&](const Command& one) { return one.name == name; });
-    return command == loaded.commands.end() || command->access != Access::read;
+    const Command* command = commandOf(loaded, name);
+    return command == nullptr || command->access != Access::read;
 }
 
 /// Returns true if the other end of a conversation has been closed.
@@ -183,8 +191,10 @@ const LoadedPlugin* Worker::pluginNamed(std::string_view name) const {
 protocol::Hello Worker::configure(const protocol::Configure& configuration) {
     setSystemRoot(configuration.root);
     _languages = configuration.languages;
-    if (!configuration.accountUuids.empty()) {
-        setDirectoryNodes({localAccounts(HostPath(configuration.accountUuids))});
+    _directoryTime = std::chrono::milliseconds(configuration.directoryMilliseconds);
+    const std::vector<std::string> nodeProblems = configureDirectory(configuration);
+    for (const std::string& problem : nodeProblems) {
+        logEvent("adminhostd: " + problem);
     }
     if (!configuration.serviceManager.empty()) {
         setServiceManager(configuration.serviceManager == "pidfile" ? ServiceManager::pidFile
@@ -207,11 +217,24 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
         }
     }
     if (configuration.tryOnly) {
+        hello.problems = nodeProblems;
         for (const LoadedPlugin& loaded : _plugins) {
             tryNeeds(loaded, hello.problems);
         }
+        for (std::string& problem : unreachableNodes()) {
+            hello.problems.push_back(std::move(problem));
+        }
     }
     return hello;
+}
+
+/// Logs the nodes that cannot be reached. What is wrong with their settings is logged by the worker that serves.
+void Worker::probeDirectory(const protocol::Configure& configuration) {
+    setSystemRoot(configuration.root);
+    static_cast<void>(configureDirectory(configuration));
+    for (const std::string& problem : unreachableNodes()) {
+        logEvent("adminhostd: " + problem);
+    }
 }
 
 /// Asks the plug-in about everything that its commands need.
@@ -246,9 +269,8 @@ Probe Worker::ask(const LoadedPlugin& loaded, const std::string& need, Clock::du
 
 /// The answer to a command if something that it needs is not usable, or not known to be.
 std::optional<protocol::Answer> Worker::unmetNeed(const LoadedPlugin& loaded, const protocol::Perform& order) const {
-    const auto command = std::find_if(loaded.commands.begin(), loaded.commands.end(),
-                                      [&](const Command& one) { return one.name == order.command; });
-    if (command == loaded.commands.end()) {
+    const Command* command = commandOf(loaded, order.command);
+    if (command == nullptr) {
         return std::nullopt;
     }
     for (const std::string& need : command->needs) {
@@ -445,7 +467,11 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
 
 protocol::Answer Worker::answer(const protocol::Perform& order) {
     const LoadedPlugin* found = pluginNamed(order.plugin);
-    return found == nullptr ? notLoaded(order.plugin) : perform(*found, order);
+    if (found == nullptr) {
+        return notLoaded(order.plugin);
+    }
+    const DirectoryRequestScope directory(directoryBudget(commandOf(*found, order.command), _directoryTime));
+    return perform(*found, order);
 }
 
 protocol::Answer Worker::answer(const protocol::ReadHistory& order) {
@@ -464,8 +490,8 @@ protocol::Answer Worker::answer(const protocol::ReadHistory& order) {
 }
 
 protocol::Answer Worker::answer(const protocol::FindAccounts& order) {
-    constexpr std::size_t limit = 50;
-    Result<Array> entries = order.is.empty() ? directoryEntries(order.match, limit) : directoryEntriesOf(order.is);
+    const DirectoryRequestScope directory(_directoryTime);
+    Result<Array> entries = accountsFor(order);
     if (!entries) {
         return errorAnswer("DIRECTORY_UNAVAILABLE", textOf(entries.error()), order.form);
     }
@@ -477,6 +503,10 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
         if (configuration->build != ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY) {
             logEvent("adminhostd: the worker is of another release than the daemon; restart the daemon");
             return 1;
+        }
+        if (configuration->probeDirectory) {
+            probeDirectory(*configuration);
+            return 0;
         }
         if (!send(_descriptor, configure(*configuration))) {
             return 1;

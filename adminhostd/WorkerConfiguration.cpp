@@ -3,6 +3,7 @@
 #include "adminhostd/ToolConfiguration.h"
 #include "platform/framework/BuildNote.h"
 
+#include <cstdint>
 #include <vector>
 
 namespace adminhost {
@@ -31,6 +32,8 @@ protocol::Configure workerConfiguration(const Options& options, const PluginSele
     configuration.languages = textsOf(options.languages ? *options.languages : languagesOfEnvironment());
     configuration.accountUuids = options.accountUuids;
     configuration.serviceManager = options.serviceManager;
+    configuration.directory = options.directory.nodes;
+    configuration.directoryMilliseconds = static_cast<std::uint64_t>(options.directory.budget.count());
     configuration.toolEnvironment = {{toolConfigurationVariable, toolConfiguration}};
     return configuration;
 }

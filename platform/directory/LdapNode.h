@@ -70,6 +70,8 @@ struct ADMINHOST_EXPORT LdapNodeSettings {
     std::string createBase;  ///< empty: userBase
     std::vector<std::string> objectClasses{"account", "posixAccount"};
     std::map<std::string, std::vector<std::string>> createAttributes;  ///< in values, %u is the account's name
+
+    bool operator==(const LdapNodeSettings&) const = default;
 };
 
 /// Returns why the settings cannot be used: a filter, URI, DN or attribute that is malformed, or settings that exclude

@@ -3,7 +3,7 @@
 // The directory node of this machine's own accounts: the files /etc/passwd and /etc/group below the system root.
 //
 // Read by the C library's own file readers and not through the name service, which might enumerate a company. Users
-// come before groups, each in file order. The node is read only (see DirectoryNode). docs/directory-mapping.md
+// come before groups, each in file order. The node is read only (see DirectoryNode). docs/directory.md
 // describes how a line becomes a record.
 
 #include "platform/directory/Directory.h"

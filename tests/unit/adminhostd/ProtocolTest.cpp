@@ -23,6 +23,41 @@ Perform perform() {
             .form = BodyForm::propertyList};
 }
 
+DirectoryNodeOptions node() {
+    DirectoryNodeOptions node;
+    node.local = true;
+    node.places = {{"", "file, line 1"}, {"base", ""}};
+    node.settings = {.name = "/N",
+                     .uris = {"ldap://a", "ldapi://b"},
+                     .base = "b",
+                     .userBase = "ub",
+                     .groupBase = "gb",
+                     .userFilter = "(u=*)",
+                     .groupFilter = "(g=*)",
+                     .bindDn = "dn",
+                     .bindPasswordFile = HostPath("/p"),
+                     .bindPasswordCredential = "c",
+                     .credentialsDirectory = std::nullopt,
+                     .sasl = LdapNodeSettings::Sasl::gssapi,
+                     .certFile = HostPath("/cert"),
+                     .keyFile = HostPath("/key"),
+                     .keytab = HostPath("/keytab"),
+                     .principal = "p",
+                     .startTls = true,
+                     .caFile = HostPath("/ca"),
+                     .verify = LdapNodeSettings::Verify::never,
+                     .schema = LdapNodeSettings::Schema::ad,
+                     .uuidForm = LdapNodeSettings::UuidForm::guid,
+                     .kerberosRealm = "R",
+                     .userMap = {{"UniqueID", "n"}},
+                     .groupMap = {{"RecordName", "cn"}},
+                     .timeout = 7s,
+                     .createBase = "cb",
+                     .objectClasses = {"o"},
+                     .createAttributes = {{"gecos", {"%u", "x"}}, {"empty", {}}}};
+    return node;
+}
+
 std::vector<ToWorker> messagesToWorker() {
     return {Configure{.build = "b",
                       .root = "/r",
@@ -31,7 +66,10 @@ std::vector<ToWorker> messagesToWorker() {
                       .plugins = {"/a.so", "/b.so"},
                       .languages = {"de"},
                       .toolEnvironment = {{"A", "1"}, {"B", ""}},
-                      .tryOnly = true},
+                      .directory = {node(), {}},
+                      .directoryMilliseconds = 9,
+                      .tryOnly = true,
+                      .probeDirectory = true},
             perform(), FindAccounts{"ma", "is", BodyForm::propertyList}, ReadHistory{"p", BodyForm::propertyList}};
 }
 
