@@ -273,6 +273,17 @@ RequestReport DaemonClient::report(const std::string& requestId) {
     return report;
 }
 
+std::vector<ReportedGap> DaemonClient::gapsOf(const CommandAnswer& answer) {
+    if (!answer.notDone) {
+        return {};
+    }
+    std::vector<ReportedGap> gaps = report(answer.requestId).notDone;
+    if (gaps.empty()) {
+        gaps.push_back({"", "the daemon no longer has the reasons of the request " + answer.requestId, ""});
+    }
+    return gaps;
+}
+
 RequestReport DaemonClient::settledReport(const std::string& requestId) {
     constexpr auto patience = std::chrono::seconds(10);
     constexpr auto pause = std::chrono::milliseconds(100);

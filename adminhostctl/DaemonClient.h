@@ -104,7 +104,10 @@ class DaemonClient {
     /// Returns the daemon's current record of a request. A daemon that cannot be reached is a state of the report, not
     /// a Failure.
     [[nodiscard]] RequestReport report(const std::string& requestId);
-    /// The same, but waits up to ten seconds while the request is not done or the daemon cannot be reached.
+    /// The parts that a request did not carry out or could not read, with the reasons. Never empty if the answer has
+    /// such parts: if the daemon no longer has the reasons, that is the reason.
+    [[nodiscard]] std::vector<ReportedGap> gapsOf(const CommandAnswer& answer);
+    /// As report(), but waits up to ten seconds while the request is not done or the daemon cannot be reached.
     [[nodiscard]] RequestReport settledReport(const std::string& requestId);
 
     /// The JSON value at an address of the daemon. Throws Failure as ask() does.

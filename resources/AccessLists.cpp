@@ -290,9 +290,11 @@ void Resource::changeACLsWithRequest(const Array* entries) {
         } else if (booleanOf(entry->get("_obsoleteid_"))) {
             const auto appended = appendNameOf(entry->get("_id_"), index, toRemove);
             if (!appended) {
-                reportNotDone(pathOf(index), "the directory failed: " + textOf(appended.error()));
+                reportNotDone(pathOf(index), "the directory failed, so the entry was not removed",
+                              appended.error().description.value_or(""));
             } else if (!*appended) {
-                reportNotDone(pathOf(index), "the entry's \"_id_\" is no user or group of this machine");
+                reportNotDone(pathOf(index),
+                              "the directory has no user or group with the entry's \"_id_\" and a numeric id");
             }
         }
     }

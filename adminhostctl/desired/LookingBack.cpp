@@ -193,6 +193,7 @@ ExitStatus rollback(const Context& context, std::span<const std::string> argumen
     }
     const Dictionary& settings = dictionaryAt(*found->dictionary(), "settings");
     const CurrentState current = readState(context);
+    requireWhole(current);
     const StateForm& form = current.form;
     Wanted wanted;
     std::vector<std::string> staying;

@@ -224,10 +224,7 @@ CurrentState readState(const Context& context, const std::string& section) {
         throw Failure(ExitStatus::failed, "the service did not return its " + form.root());
     }
     State state = stateOf(form, *root);
-    std::vector<ReportedGap> unread;
-    if (answer.notDone) {
-        unread = context.service.report(answer.requestId).notDone;
-    }
+    std::vector<ReportedGap> unread = context.service.gapsOf(answer);
     return {std::move(form), std::move(state), answer.revision, std::move(unread)};
 }
 

@@ -1,5 +1,6 @@
 #include "platform/directory/Directory.h"
 
+#include "platform/directory/DirectoryRequest.h"
 #include "platform/directory/LocalAccounts.h"
 
 #include <utility>
@@ -26,6 +27,7 @@ class SearchNode : public DirectoryNode {
         for (const auto& node : _nodes) {
             auto some = node->records(rest);
             if (!some) {
+                reportFailure(node->name(), some.error());
                 return some;
             }
             all.insert(all.end(), std::make_move_iterator(some->begin()), std::make_move_iterator(some->end()));
@@ -112,6 +114,7 @@ OpenedDirectoryNode DirectorySession::openNode(std::uint32_t nodeType) const {
     for (const DirectoryNodeSource& source : _nodes) {
         auto node = source.open();
         if (!node) {
+            reportFailure(source.name, node.error());
             return node;
         }
         nodes.push_back(*std::move(node));

@@ -129,7 +129,8 @@ struct ADMINHOST_EXPORT DirectoryNodeSource {
 
 class ADMINHOST_EXPORT DirectorySession {
   public:
-    /// The node that searches all nodes of the session in order. It fails as soon as one of them does.
+    /// The node that searches all nodes of the session in order. It fails as soon as one of them does, and reports that
+    /// node as not carried out (platform/framework/Report.h), once in a request.
     static constexpr std::uint32_t authenticationSearchNode = 0x2201;
     static constexpr std::string_view authenticationSearchNodeName = "/Search";
 

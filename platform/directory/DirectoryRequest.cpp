@@ -1,10 +1,14 @@
 #include "platform/directory/DirectoryRequest.h"
 
 #include "platform/directory/Directory.h"
+#include "platform/framework/Report.h"
 #include "platform/task/TaskBounds.h"
 
 #include <algorithm>
 #include <map>
+#include <set>
+
+#include <fmt/format.h>
 
 namespace adminhost {
 namespace {
@@ -14,6 +18,7 @@ using Clock = std::chrono::steady_clock;
 struct Request {
     Clock::time_point end = Clock::time_point::max();
     std::map<std::string, Error, std::less<>> failures;
+    std::set<std::string, std::less<>> reported;  ///< nodes whose failure has been reported
     std::vector<std::shared_ptr<void>> kept;
 };
 
@@ -71,6 +76,17 @@ void rememberFailure(std::string_view node, const Error& error) {
     if (request()) {
         request()->failures.insert_or_assign(std::string(node), error);
     }
+}
+
+void reportFailure(std::string_view node, const Error& error) {
+    if (request() && !request()->reported.emplace(node).second) {
+        return;
+    }
+    reportNotDone(
+        {"",
+         fmt::format("the directory node \"{}\" failed: people and groups may be missing, and lists of them empty",
+                     node),
+         error.description.value_or("")});
 }
 
 void keepForRequest(std::shared_ptr<void> object) {

@@ -55,6 +55,10 @@ struct ADMINHOST_EXPORT UnreachableNode {
 /// Remembers that the node is not to be tried again in this request. Does nothing outside a request.
 void rememberFailure(std::string_view node, const Error& error);
 
+/// Reports as not carried out that the node failed (platform/framework/Report.h), once for each node in a request:
+/// what it knows is missing in the response, which looks as if nobody had access.
+void reportFailure(std::string_view node, const Error& error);
+
 /// Keeps the object until the end of the request, or outside a request not at all.
 void keepForRequest(std::shared_ptr<void> object);
 /// Drops an object that keepForRequest() keeps.

@@ -1,7 +1,9 @@
 // The reports of changes of cameras and properties.
 
+#include "platform/directory/DirectoryRequest.h"
 #include "tests/support/CapturedReports.h"
 #include "tests/unit/resources/AccessListsFixture.h"
+#include "tests/unit/resources/FixedDirectory.h"
 #include "tests/unit/resources/PropertyFixture.h"
 
 namespace lumio {
@@ -97,6 +99,59 @@ TEST_F(CameraReports, FailedRemovalAndSwitchAreReportedOnce) {
                     NotDone{"configuration.cameras.1.access_control_enabled",
                             "access control was not switched: the database refused it", "Error: busy"}));
     EXPECT_THAT(reports.changes, IsEmpty());
+}
+
+const NotDone failedNode{
+    "", "the directory node \"/Fixed\" failed: people and groups may be missing, and lists of them empty",
+    "the directory is away"};
+
+TEST_F(CameraReports, DirectoryNodeThatFailsIsReportedOnceInEachRequest) {
+    allow(7, "A");
+    allow(8, "B");
+    useDirectory(std::nullopt);
+    testing::internal::CaptureStdout();
+    for (int i = 0; i < 2; ++i) {
+        const adminhost::DirectoryRequestScope request(std::nullopt);
+        EXPECT_EQ(allowed(*camera(0)), Array{});
+        EXPECT_EQ(allowed(*camera(1)), Array{});
+    }
+    EXPECT_THAT(reports.parts, ElementsAre(failedNode, failedNode));
+    EXPECT_THAT(testing::internal::GetCapturedStdout(),
+                StartsWith("Tarn query error for users: the directory is away\n"));
+}
+
+TEST_F(CameraReports, DirectoryNodeThatCannotBeOpenedIsReported) {
+    allow(8, "A");
+    adminhost::setDirectoryNodes({adminhost::localAccounts(), {"/Broken", []() -> adminhost::OpenedDirectoryNode {
+                                                                   return adminhost::failure(Error{"d", 1, "no key"});
+                                                               }}});
+    testing::internal::CaptureStdout();
+    EXPECT_EQ(allowed(*camera(1)), Array{});
+    (void)testing::internal::GetCapturedStdout();
+    ASSERT_EQ(reports.parts.size(), 1U);
+    EXPECT_THAT(reports.parts[0].reason, StartsWith("the directory node \"/Broken\" failed"));
+    EXPECT_EQ(reports.parts[0].toolMessage, "no key");
+}
+
+constexpr const char* someUuid = "5F2C7D1E-0000-4000-8000-00000000000A";
+
+TEST_F(CameraReports, RemovalThatAFailingDirectoryCannotResolveIsReported) {
+    useDirectory(std::nullopt);
+    process({Dictionary{{"_id_", "C-7"},
+                        {"allowedUsersAndGroups", Array{Dictionary{{"_id_", someUuid}, {"_obsoleteid_", true}}}}}});
+    EXPECT_THAT(reports.parts,
+                ElementsAre(NotDone{"configuration.cameras.0.allowedUsersAndGroups.0",
+                                    "the directory failed, so the entry was not removed", "the directory is away"}));
+    EXPECT_THAT(calls(), IsEmpty());
+}
+
+TEST_F(CameraReports, RemovalOfARecordWithoutANumericIdIsReported) {
+    useDirectory(std::vector{record("dsRecTypeStandard:Users", "anna", someUuid)});
+    process({Dictionary{{"_id_", "C-7"},
+                        {"allowedUsersAndGroups", Array{Dictionary{{"_id_", someUuid}, {"_obsoleteid_", true}}}}}});
+    ASSERT_EQ(reports.parts.size(), 1U);
+    EXPECT_EQ(reports.parts[0].reason, "the directory has no user or group with the entry's \"_id_\" and a numeric id");
+    EXPECT_THAT(calls(), IsEmpty());
 }
 
 class PropertyReports : public PropertyFixture {
