@@ -111,6 +111,22 @@ ExitStatus help(const Context& context, Words arguments) {
 
 // The directory
 
+/// The entry with the names of its groups in place of their entries.
+Dictionary withGroupNames(Dictionary entry) {
+    const Array* groups = entry.get("groups").array();
+    if (groups == nullptr) {
+        return entry;
+    }
+    Array names;
+    for (const Value& group : *groups) {
+        if (group.dictionary() != nullptr) {
+            names.emplace_back(group.dictionary()->text("shortName"));
+        }
+    }
+    entry.set("groups", std::move(names));
+    return entry;
+}
+
 ExitStatus whois(const Context& context, Words arguments) {
     const Value answer = context.service.get("/v1/directory?is=" + Connection::escaped(arguments.front()));
     const Array* entries = answer.dictionary() == nullptr ? nullptr : answer.dictionary()->get("entries").array();
@@ -122,7 +138,10 @@ ExitStatus whois(const Context& context, Words arguments) {
         return ExitStatus::done;
     }
     for (std::size_t i = 0; i < entries->size(); ++i) {
-        context.out << (i == 0 ? "" : "\n") << Reading(Description(), context.options.width).text((*entries)[i]);
+        const Dictionary* entry = (*entries)[i].dictionary();
+        context.out << (i == 0 ? "" : "\n")
+                    << Reading(Description(), context.options.width)
+                           .text(entry == nullptr ? (*entries)[i] : Value(withGroupNames(*entry)));
     }
     return ExitStatus::done;
 }

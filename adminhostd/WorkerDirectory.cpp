@@ -83,6 +83,9 @@ Result<Array> accountsFor(const protocol::FindAccounts& order) {
             continue;
         }
         const auto all = directoryGroupsOf(person.text(person.contains("guid") ? "guid" : "shortName"));
+        if (!all && all.error().domain == directory::errorDomain && all.error().code == directory::notSupported) {
+            continue;  // the node knows no groups of people
+        }
         if (!all) {
             return failure(all.error());
         }
