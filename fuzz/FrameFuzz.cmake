@@ -1,1 +1,1 @@
-set(FUZZ_LIBS host)
+set(FUZZ_LIBS host_messages)

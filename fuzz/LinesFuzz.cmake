@@ -1,1 +1,1 @@
-set(FUZZ_LIBS handler)
+set(FUZZ_LIBS settings)

@@ -62,7 +62,7 @@ Result<Message> call(sd_bus* bus, Clock::time_point deadline, const char* path, 
     for (const char* argument : {arguments...}) {
         status = status < 0 ? status : ::sd_bus_message_append_basic(request.get(), SD_BUS_TYPE_STRING, argument);
     }
-    sd_bus_error error = SD_BUS_ERROR_NULL;
+    sd_bus_error error{};
     sd_bus_message* received = nullptr;
     if (status >= 0) {
         status = ::sd_bus_call(bus, request.get(), left(deadline), &error, &received);

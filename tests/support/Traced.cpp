@@ -2,10 +2,11 @@
 
 #include "platform/task/Task.h"
 
+#include <algorithm>
 #include <fstream>
 #include <map>
-#include <regex>
 #include <stdexcept>
+#include <string_view>
 
 #include <unistd.h>
 
@@ -14,6 +15,16 @@ namespace {
 
 constexpr const char* beginMark = "/adminhost-mark-begin";
 constexpr const char* endMark = "/adminhost-mark-end";
+
+/// The name of the call in a line "NAME(...", before which strace -f writes the process's id; empty for other lines.
+std::string callOf(std::string_view line) {
+    constexpr const char* digits = "0123456789";
+    if (const std::size_t end = line.find_first_not_of(digits); end != 0 && end != std::string_view::npos) {
+        line.remove_prefix(std::min(line.find_first_not_of(' ', end), line.size()));
+    }
+    const std::size_t end = line.find_first_not_of("abcdefghijklmnopqrstuvwxyz0123456789_");
+    return std::string(end != std::string_view::npos && line[end] == '(' ? line.substr(0, end) : "");
+}
 
 }  // namespace
 
@@ -37,22 +48,21 @@ std::int32_t runTraced(const std::vector<std::string>& options, const std::strin
 
 std::vector<TracedCall> callsBetweenMarks(const std::string& log) {
     std::ifstream lines(log);
-    const std::regex form("^(?:[0-9]+ +)?([a-z0-9_]+)\\(.*");  // with -f, the process's id comes first
     std::map<std::string, int> numbers;
     std::vector<TracedCall> calls;
     bool between = false;
     for (std::string line; std::getline(lines, line);) {
-        std::smatch match;
-        if (!std::regex_match(line, match, form)) {
+        const std::string name = callOf(line);
+        if (name.empty()) {
             continue;
         }
-        const int number = ++numbers[match[1]];
+        const int number = ++numbers[name];
         if (line.find(beginMark) != std::string::npos) {
             between = true;
         } else if (line.find(endMark) != std::string::npos) {
             return calls;
         } else if (between) {
-            calls.push_back({match[1], number, line});
+            calls.push_back({name, number, line});
         }
     }
     throw std::runtime_error("the marks are not in " + log);

@@ -8,7 +8,6 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
-#include <regex>
 #include <set>
 #include <string>
 #include <thread>
@@ -363,8 +362,8 @@ TEST_F(ReplaceFile, UnreadableFileIsKeptBesideUnderADatedNameAndStaysInPlace) {
     const auto kept = keepUnreadable(HostPath(path()));
     ASSERT_TRUE(kept);
     EXPECT_THAT(kept->text(), testing::StartsWith(path() + ".unreadable-2"));
-    EXPECT_TRUE(
-        std::regex_match(kept->text().substr(path().size()), std::regex("\\.unreadable-\\d{4}-\\d{2}-\\d{2}T\\d{6}Z")));
+    EXPECT_THAT(kept->text().substr(path().size()),
+                testing::MatchesRegex("[.]unreadable-[0-9]{4}-[0-9]{2}-[0-9]{2}T[0-9]{6}Z"));
     EXPECT_EQ(read(fs::path(kept->text()).filename()), "garbage");
     EXPECT_EQ(read(), "garbage");
     EXPECT_EQ(replace("new"), std::nullopt);

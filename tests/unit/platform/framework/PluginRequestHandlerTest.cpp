@@ -1,9 +1,9 @@
 #include "platform/framework/PluginRequestHandler.h"
 
-#include <regex>
 #include <set>
 #include <string>
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 namespace {
@@ -60,10 +60,9 @@ TEST(UserDefaults, ValueIsKeptReplacedAndRemovedByNull) {
 }
 
 TEST(UUIDString, IsCanonicalUpperCaseOfVersion4) {
-    const std::regex form("[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}");
     for (int i = 0; i < 1000; ++i) {
         const std::string text = makeUUIDString();
-        ASSERT_TRUE(std::regex_match(text, form)) << text;
+        ASSERT_THAT(text, testing::MatchesRegex("[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}"));
     }
 }
 
