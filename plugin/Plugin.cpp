@@ -6,6 +6,7 @@
 #include "handler/LumioRequestHandler.h"
 #include "platform/files/Path.h"
 #include "platform/framework/Report.h"
+#include "plugin/InstallationChecks.h"
 #include "settings/DatabaseTool.h"
 #include "settings/Revision.h"
 
@@ -168,6 +169,17 @@ class LumioPlugin final : public adminhost::Plugin {
     std::vector<adminhost::HostPath> settingsFiles() override {
         return {LumioRequestHandler::identityPreferencesPath(), LumioRequestHandler::clusterPreferencesPath(),
                 LumioRequestHandler::memberPreferencesPath()};
+    }
+
+    std::vector<adminhost::Diagnosis> diagnose() override { return lumio::installationChecks(); }
+
+    std::vector<adminhost::LogFile> logs() override {
+        std::vector<adminhost::LogFile> logs;
+        const Response paths = _handler.getLogPathsWithRequest({});
+        for (const adminhost::DictionaryEntry& entry : paths.dictionary()) {
+            logs.push_back({entry.key, adminhost::HostPath(*entry.value.string())});
+        }
+        return logs;
     }
 
     std::vector<adminhost::HostPath> leftovers() override { return {LumioRequestHandler::credentialCachePath()}; }

@@ -24,6 +24,7 @@ using adminhost::Probe;
 namespace {
 
 constexpr std::int32_t diedBySignal = 128;
+constexpr const char* toolPath = "/usr/bin/sqlite3";
 
 // Everything that the readers of rows rely on: double-quoted text is text, names are padded to the longest, an absent
 // value is empty, and control characters are printed as they are.
@@ -73,18 +74,28 @@ std::string DatabaseTool::homeOfAccount() {
 }
 
 Probe DatabaseTool::probe() {
-    const adminhost::HostPath tool("/usr/bin/sqlite3");
     if (!SettingsStore::dbPathExists()) {
         return {};
     }
+    if (auto problem = startFileProblem()) {
+        return *std::move(problem);
+    }
+    Probe probe = _usable ? Probe() : tryTool();
+    _usable = probe.state == Probe::State::usable;
+    return probe;
+}
+
+std::optional<Probe> DatabaseTool::startFileProblem() const {
     const std::string startFile = _home + "/.sqliterc";
-    if (::access(startFile.c_str(), F_OK) == 0) {
-        return {Probe::State::unusable, startFile + " can change what " + tool.text() + " prints",
-                "remove the file, or move it away"};
+    if (::access(startFile.c_str(), F_OK) != 0) {
+        return std::nullopt;
     }
-    if (_usable) {
-        return {};
-    }
+    return Probe{Probe::State::unusable, startFile + " can change what " + toolPath + " prints",
+                 "remove the file, or move it away"};
+}
+
+Probe DatabaseTool::tryTool() const {
+    const adminhost::HostPath tool(toolPath);
     std::string output;
     std::string error;
     const std::int32_t status = adminhost::launch_task_with_input_and_environment(
@@ -108,7 +119,6 @@ Probe DatabaseTool::probe() {
         return {Probe::State::unusable, tool.text() + " does not print rows in the form that this release reads",
                 "install a supported release of the package sqlite3"};
     }
-    _usable = true;
     return {};
 }
 

@@ -4,6 +4,7 @@
 
 #include "platform/framework/Plugin.h"
 
+#include <optional>
 #include <string>
 
 namespace lumio {
@@ -21,6 +22,10 @@ class DatabaseTool {
     /// known. The result "usable" is kept; after any other result the tool is tried again. If there is no database
     /// file, no command needs the tool, and it is not tried.
     [[nodiscard]] adminhost::Probe probe();
+    /// The start file of the tool that the account has; nullopt if there is none.
+    [[nodiscard]] std::optional<adminhost::Probe> startFileProblem() const;
+    /// Tries the tool, whether or not there is a database file.
+    [[nodiscard]] adminhost::Probe tryTool() const;
 
   private:
     std::string _home;
