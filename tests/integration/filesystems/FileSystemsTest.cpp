@@ -4,7 +4,7 @@
 #include "adminhostd/SettingsHistory.h"
 #include "handler/LumioRequestHandler.h"
 #include "platform/plist/PropertyList.h"
-#include "tests/support/Program.h"
+#include "tests/support/OwnMounts.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <array>
@@ -19,7 +19,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <linux/capability.h>
-#include <sys/mount.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -38,41 +37,12 @@ using testing::HasSubstr;
 constexpr std::string_view identityFile = "/Library/Preferences/com.brenn.lumioserverd.plist";
 constexpr std::string_view clusterFile = "/shared/Server/cluster_preferences.plist";
 constexpr std::string_view memberFile = "/shared/Server/member_preferences_M.plist";
-constexpr const char* small = "size=64k,mode=755";
-
-/// A separate file system at a host path, mounted while the object exists. Throws if it cannot be mounted.
-class Mount {
+/// A separate file system at a host path.
+class Mount : public adminhost::test::Mount {
   public:
-    Mount(const adminhost::test::TemporaryRoot& root, std::string_view place, const char* options = small)
-        : _place(root.path(place)) {
-        fs::create_directories(_place);
-        check(::mount("tmpfs", _place.c_str(), "tmpfs", 0, options), "mount");
-    }
-    Mount(const Mount&) = delete;
-    Mount& operator=(const Mount&) = delete;
-    ~Mount() { ::umount2(_place.c_str(), MNT_DETACH); }
-
-    void makeReadOnly() const {
-        check(::mount("tmpfs", _place.c_str(), "tmpfs", MS_REMOUNT | MS_RDONLY, nullptr), "remount");
-        ASSERT_FALSE(std::ofstream(_place / "probe").is_open()) << "it is not read-only";
-    }
-    /// Fills the file system to the last byte.
-    void fill() const {
-        std::ofstream file(_place / "filling");
-        while (file << 'x' << std::flush) {
-        }
-        ASSERT_EQ(fs::space(_place).available, 0U) << "it is not full";
-    }
-    void makeRoom() const { fs::remove(_place / "filling"); }
-
-  private:
-    static void check(int status, const char* what) {
-        if (status != 0) {
-            throw std::runtime_error(std::string(what) + ": " + std::strerror(errno));
-        }
-    }
-
-    fs::path _place;
+    Mount(const adminhost::test::TemporaryRoot& root, std::string_view place,
+          const char* options = adminhost::test::smallFileSystem)
+        : adminhost::test::Mount(root.path(place), options) {}
 };
 
 /// While it exists, the superuser cannot open files of mode 000.
@@ -284,34 +254,11 @@ TEST_F(FileSystems, HistoryWithoutRoomIsAnErrorThatLeavesNoHalfEntry) {
     EXPECT_THAT(*refused.error().description, HasSubstr("Read-only file system"));
 }
 
-/// Runs this program again as the superuser of a user namespace, with mounts of its own. Returns in that second run.
-void enterNamespace(int argc, char** argv) {
-    constexpr const char* inside = "ADMINHOST_TEST_NAMESPACE";
-    if (std::getenv(inside) != nullptr) {
-        return;
-    }
-    if (const std::string problem = adminhost::test::namespaceProblem(); !problem.empty()) {
-        throw std::runtime_error(problem);
-    }
-    ::setenv(inside, "1", 1);
-    std::string program = fs::read_symlink("/proc/self/exe");
-    std::string words[] = {"unshare", "--map-root-user", "--mount", "--"};
-    std::vector<char*> command;
-    for (std::string& word : words) {
-        command.push_back(word.data());
-    }
-    command.push_back(program.data());
-    command.insert(command.end(), argv + 1, argv + argc);
-    command.push_back(nullptr);
-    ::execvp("unshare", command.data());
-    throw std::runtime_error(std::string("unshare: ") + std::strerror(errno));
-}
-
 }  // namespace
 }  // namespace lumio
 
 int main(int argc, char** argv) {
-    lumio::enterNamespace(argc, argv);
+    adminhost::test::enterOwnMounts(argc, argv);
     testing::InitGoogleTest(&argc, argv);
     return RUN_ALL_TESTS();
 }
