@@ -1,0 +1,1 @@
+set(TEST_DEPENDS adminhostd adminhost_lumio)
