@@ -111,10 +111,9 @@ Value DaemonClient::get(const std::string& path) {
     if (answer.status != statusOk) {
         fail(answer);
     }
-    Error error;
-    auto value = parseJson(answer.body, &error);
+    auto value = parseJson(answer.body);
     if (!value) {
-        throw Failure(ExitStatus::failed, "the daemon's answer cannot be read: " + textOf(error));
+        throw Failure(ExitStatus::failed, "the daemon's answer cannot be read: " + textOf(value.error()));
     }
     return std::move(*value);
 }
@@ -228,12 +227,11 @@ CommandAnswer DaemonClient::ask(const CommandRef& command, const Dictionary& req
         }
         fail(reply);
     }
-    Error error;
-    auto value = parseJson(reply.body, &error);
+    auto value = parseJson(reply.body);
     if (!value) {
-        throw Failure(ExitStatus::failed, "the answer cannot be read: " + textOf(error));
+        throw Failure(ExitStatus::failed, "the answer cannot be read: " + textOf(value.error()));
     }
-    return {std::move(value), id, reply.revision, reply.notDone};
+    return {*std::move(value), id, reply.revision, reply.notDone};
 }
 
 RequestReport DaemonClient::report(const std::string& requestId) {
@@ -245,8 +243,8 @@ RequestReport DaemonClient::report(const std::string& requestId) {
         report.state = RequestReport::State::notReachable;
         return report;
     }
-    const auto record = reply.status == statusOk ? parseJson(reply.body) : std::nullopt;
-    const Dictionary* said = record ? record->dictionary() : nullptr;
+    const Value record = reply.status == statusOk ? parseJson(reply.body).value_or(Value()) : Value();
+    const Dictionary* said = record.dictionary();
     if (said == nullptr) {
         return report;
     }

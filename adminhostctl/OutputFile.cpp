@@ -38,8 +38,8 @@ void writeOutput(const std::string& path, std::string_view bytes) {
         if (!file) {
             throw usageError(path + ": cannot be written");
         }
-    } else if (const auto error = replaceFile(bytes, placeOf(path), ownersOnly)) {
-        throw usageError(error->description.value_or(path + " cannot be written"));
+    } else if (const auto written = replaceFile(bytes, placeOf(path), ownersOnly); !written) {
+        throw usageError(written.error().description.value_or(path + " cannot be written"));
     }
 }
 

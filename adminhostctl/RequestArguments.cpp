@@ -182,7 +182,7 @@ std::optional<Value> booleanOfText(const std::string& text) {
 /// "2026-01-31T08:00:00Z", or local time: "2026-01-31 08:00:00", "2026-01-31 08:00", "2026-01-31".
 std::optional<Value> dateOfText(const std::string& text) {
     if (auto value = parseJson("{\"$date\": " + jsonOf(text) + "}"); value && value->date()) {
-        return value;
+        return *std::move(value);
     }
     for (const char* const rest : {"", ":00", " 00:00:00"}) {
         if (const auto date = localDateOf(text + rest)) {
@@ -194,11 +194,9 @@ std::optional<Value> dateOfText(const std::string& text) {
 
 Value parseStructure(std::string_view bytes, const std::string& from) {
     const std::size_t begin = bytes.find_first_not_of(" \t\r\n");
-    Error error;
-    auto value = begin != std::string_view::npos && bytes[begin] == '<' ? parsePropertyList(bytes, &error)
-                                                                        : parseJson(bytes, &error);
+    auto value = begin != std::string_view::npos && bytes[begin] == '<' ? parsePropertyList(bytes) : parseJson(bytes);
     if (!value) {
-        throw usageError(from + ": " + error.description.value_or("cannot be read"));
+        throw usageError(from + ": " + value.error().description.value_or("cannot be read"));
     }
     return std::move(*value);
 }

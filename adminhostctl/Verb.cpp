@@ -84,10 +84,10 @@ void writeValue(const Context& context, const Value& value, const Description& d
             context.out << shownJson(jsonOf(value, true)) << '\n';
             break;
         case Format::plist: {
-            Error error;
-            const auto text = xmlPropertyList(value, &error);
+            const auto text = xmlPropertyList(value);
             if (!text) {
-                throw Failure(ExitStatus::failed, "the answer cannot be written as a property list: " + textOf(error));
+                throw Failure(ExitStatus::failed,
+                              "the answer cannot be written as a property list: " + textOf(text.error()));
             }
             context.out << shownXml(*text);
             break;

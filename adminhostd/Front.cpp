@@ -172,9 +172,16 @@ void close(RequestRecord& record, unsigned status, std::string_view code) {
     for (char& c : name) {
         c = c < 0x21 || c > 0x7e ? '?' : c;
     }
-    logEvent(fmt::format("adminhostd: request {} {} by uid {} pid {}: {}{}{} in {:.1f} ms", record.id, name,
+    std::string reports;
+    for (const auto& [what, count] :
+         {std::pair("changes", record.changes()), std::pair("not done", record.notDone())}) {
+        if (count > 0) {
+            reports += fmt::format(", {}: {}", what, count);
+        }
+    }
+    logEvent(fmt::format("adminhostd: request {} {} by uid {} pid {}: {}{}{} in {:.1f} ms{}", record.id, name,
                          record.peer.uid, record.peer.pid, record.status, record.error.empty() ? "" : " ", record.error,
-                         record.milliseconds));
+                         record.milliseconds, reports));
 }
 
 BodyForm wantedForm(const Exchange& exchange) {

@@ -490,7 +490,9 @@ int HttpServer::send(Exchange& exchange) {
         std::optional<std::string> text;
         // A value that a property list cannot carry is sent as JSON instead; the Content-Type states the form.
         if (exchange.wantsPropertyList()) {
-            text = xmlPropertyList(*answer.body);
+            if (auto list = xmlPropertyList(*answer.body)) {
+                text = *std::move(list);
+            }
             type = "application/x-plist";
         }
         if (!text) {

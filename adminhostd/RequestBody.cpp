@@ -54,10 +54,10 @@ std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyPr
     if (body.empty()) {
         return Dictionary();
     }
-    Error error;
-    auto value = form == BodyForm::json ? parseJson(body, &error, bodyValuesMaximum)
-                                        : parsePropertyList(body, &error, bodyValuesMaximum);
+    auto value =
+        form == BodyForm::json ? parseJson(body, bodyValuesMaximum) : parsePropertyList(body, bodyValuesMaximum);
     if (!value) {
+        const Error& error = value.error();
         problem.tooManyValues = error.code == (form == BodyForm::json ? jsonTooManyValues : plistTooManyValues);
         problem.text = error.description.value_or("The body cannot be read.");
         return std::nullopt;

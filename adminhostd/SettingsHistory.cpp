@@ -97,9 +97,8 @@ std::optional<Error> writePlainly(std::string_view bytes, const HostPath& path) 
 }
 
 std::optional<Error> writePlainly(const Dictionary& dictionary, const HostPath& path) {
-    Error error;
-    const auto text = xmlPropertyList(dictionary, &error);
-    return text ? writePlainly(*text, path) : error;
+    const auto text = xmlPropertyList(dictionary);
+    return text ? writePlainly(*text, path) : text.error();
 }
 
 /// Replaces a file of an entry. A reader sees either the old file or the new one.
@@ -269,8 +268,8 @@ Result<std::string> SettingsHistory::digestKey() const {
     if (::getrandom(key.data(), key.size(), 0) != static_cast<ssize_t>(size)) {
         return failure(failed("no random bytes", std::error_code(errno, std::generic_category())));
     }
-    if (auto error = replaceFile(key, file, 0600)) {
-        return failure(*std::move(error));
+    if (auto written = replaceFile(key, file, 0600); !written) {
+        return failure(std::move(written.error()));
     }
     return key;
 }
@@ -300,8 +299,8 @@ std::optional<Error> SettingsHistory::add(const std::vector<HostPath>& files, Di
     std::vector<std::uint64_t> numbers = numbersIn(_directory);
     number = nextAfter(numbers);
     const HostPath making = below(_directory, std::string(unfinished) + std::to_string(number));
-    if (auto error = createDirectories(diskPath(making), mine())) {
-        return error;
+    if (auto created = createDirectories(diskPath(making), mine()); !created) {
+        return std::move(created.error());
     }
     Array kept;
     std::optional<Error> error = copy(files, making, kept);
@@ -351,8 +350,8 @@ std::optional<Error> SettingsHistory::keepOutsideEdit(const Dictionary& snapshot
 
 Result<std::uint64_t> SettingsHistory::keep(const std::vector<HostPath>& files, const Dictionary& values,
                                             const Dictionary& about) const {
-    if (auto error = createDirectories(diskPath(_directory), mine())) {
-        return failure(*std::move(error));
+    if (auto created = createDirectories(diskPath(_directory), mine()); !created) {
+        return failure(std::move(created.error()));
     }
     removeUnfinished();
     const auto snapshot = snapshotOf(values);
@@ -426,8 +425,8 @@ std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& c
     // The same request may have set a plain value first.
     hideIn(kept, secret);
     for (const HostPath& directory : {_directory, _resources}) {
-        if (auto error = createDirectories(diskPath(directory), mine())) {
-            return error;
+        if (auto created = createDirectories(diskPath(directory), mine()); !created) {
+            return std::move(created.error());
         }
     }
     std::vector<std::uint64_t> numbers = numbersIn(_resources);

@@ -21,9 +21,9 @@ ToolConfiguration::~ToolConfiguration() {
     fs::remove_all(_directory, ignored);
 }
 
-std::optional<Error> writeToolFiles(const std::string& directory, const std::vector<ToolFile>& files) {
+Result<void> writeToolFiles(const std::string& directory, const std::vector<ToolFile>& files) {
     const auto failed = [](const std::string& path, const std::string& reason) {
-        return Error{"posix", errno, path + ": " + reason};
+        return failure(Error{"posix", errno, path + ": " + reason});
     };
     std::error_code error;
     // Only inside the private directory: a worker whose front has ended and cleaned up must not create it again.
@@ -47,7 +47,7 @@ std::optional<Error> writeToolFiles(const std::string& directory, const std::vec
             return failed(path, error ? error.message() : std::generic_category().message(errno));
         }
     }
-    return std::nullopt;
+    return {};
 }
 
 }  // namespace adminhost

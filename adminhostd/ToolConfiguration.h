@@ -34,6 +34,6 @@ class ToolConfiguration {
 
 /// Creates the directory and writes the files in it, replacing those of an earlier worker. Fails if a path is not below
 /// the directory, or cannot be written.
-[[nodiscard]] std::optional<Error> writeToolFiles(const std::string& directory, const std::vector<ToolFile>& files);
+[[nodiscard]] Result<void> writeToolFiles(const std::string& directory, const std::vector<ToolFile>& files);
 
 }  // namespace adminhost

@@ -2,20 +2,18 @@
 
 #include "adminhostd/ForwardingSink.h"
 #include "adminhostd/Frame.h"
+#include "adminhostd/KeptWrite.h"
+#include "adminhostd/LoadedPlugins.h"
 #include "adminhostd/Login.h"
 #include "adminhostd/PluginCall.h"
-#include "adminhostd/PluginFile.h"
 #include "adminhostd/PluginTrial.h"
 #include "adminhostd/PrivateDirectory.h"
 #include "adminhostd/Protocol.h"
-#include "adminhostd/SettingsHistory.h"
 #include "adminhostd/ToolConfiguration.h"
 #include "adminhostd/WorkerDirectory.h"
 #include "adminhostd/WriteLock.h"
 #include "platform/directory/DirectoryRequest.h"
 #include "platform/files/Path.h"
-#include "platform/files/ReplaceFile.h"
-#include "platform/framework/Report.h"
 #include "platform/json/Json.h"
 #include "platform/log/Log.h"
 #include "platform/plist/PropertyList.h"
@@ -27,9 +25,7 @@
 #include <chrono>
 #include <csignal>
 #include <exception>
-#include <map>
 #include <optional>
-#include <set>
 #include <string>
 #include <utility>
 #include <vector>
@@ -37,7 +33,6 @@
 #include <fmt/format.h>
 #include <malloc.h>
 #include <poll.h>
-#include <unistd.h>
 
 namespace adminhost {
 namespace {
@@ -47,7 +42,6 @@ using protocol::Outcome;
 
 /// Bytes of a message after which freed memory is returned to the system.
 constexpr std::size_t largeMessage = std::size_t{1} << 20U;
-constexpr auto probeBound = std::chrono::seconds(5);
 
 bool send(int descriptor, protocol::ToFront message) {
     return writeFrame(descriptor, protocol::frameOf(std::move(message)));
@@ -65,33 +59,20 @@ class Worker {
     /// Serves one message; returns the process's exit status if it cannot go on.
     std::optional<int> serve(protocol::ToWorker message);
     protocol::Hello configure(const protocol::Configure& configuration);
-    void load(const DiskPath& file, protocol::Hello& hello);
     static void probeDirectory(const protocol::Configure& configuration);
-    /// Runs once, and only in a worker that holds the lock for changes: another process may be writing a file that
-    /// looks left over.
+    /// Runs once, and only in a worker that holds the lock for changes.
     void removeLeftovers();
 
     protocol::Answer answer(const protocol::Perform& order);
     protocol::Answer answer(const protocol::FindAccounts& order);
     protocol::Answer answer(const protocol::ReadHistory& order);
     protocol::Answer perform(const LoadedPlugin& loaded, const protocol::Perform& order);
-    void tryNeeds(const LoadedPlugin& loaded, std::vector<std::string>& problems) const;
-    void enter(const LoadedPlugin& loaded) const;
-    [[nodiscard]] Probe ask(const LoadedPlugin& loaded, const std::string& need, Clock::duration bound) const;
-    [[nodiscard]] std::optional<protocol::Answer> unmetNeed(const LoadedPlugin& loaded,
-                                                            const protocol::Perform& order) const;
-    /// Adds the entry of the history with which a write begins; nullopt, with a report, if that fails.
-    [[nodiscard]] static std::optional<std::uint64_t> keepHistory(const LoadedPlugin& loaded, const Dictionary& about);
-    void completeHistory(const LoadedPlugin& loaded, std::optional<std::uint64_t> entry, const Dictionary& about);
-    [[nodiscard]] const LoadedPlugin* pluginNamed(std::string_view name) const;
 
     int _descriptor;
     ForwardingSink _sink;
     FrameReader _reader;
-    std::vector<std::string> _languages;
-    std::map<std::string, std::string> _toolEnvironment;
     std::chrono::milliseconds _directoryTime{};  ///< for all directory work of a request
-    std::vector<LoadedPlugin> _plugins;
+    LoadedPlugins _plugins;
     FileDescriptor _toolConfiguration;  ///< open: the directory stays if the front is killed and another one starts
     bool _leftoversRemoved = false;
     bool _returnMemory = false;  ///< a large message has been freed
@@ -104,17 +85,10 @@ protocol::Answer broken(std::string message) {
     return answer;
 }
 
-/// The plug-in's description of a command; null if it has none of the name.
-const Command* commandOf(const LoadedPlugin& loaded, const std::string& name) {
-    const auto command = std::find_if(loaded.commands.begin(), loaded.commands.end(),
-                                      [&](const Command& one) { return one.name == name; });
-    return command == loaded.commands.end() ? nullptr : &*command;
-}
-
 /// Returns true if a command may change something: also one that the plug-in does not name, because it is not known to
 /// only read.
 bool changes(const LoadedPlugin& loaded, const std::string& name) {
-    const Command* command = commandOf(loaded, name);
+    const Command* command = commandNamed(loaded, name);
     return command == nullptr || command->access != Access::read;
 }
 
@@ -138,12 +112,15 @@ protocol::Answer written(Outcome outcome, Dictionary response, BodyForm form) {
         answer.message = response.text("message");
     }
     const Value value(std::move(response));
-    std::optional<std::string> text;
     if (form == BodyForm::propertyList) {
-        text = xmlPropertyList(value);
+        if (auto text = xmlPropertyList(value)) {
+            answer.form = form;
+            answer.bytes = *std::move(text);
+            return answer;
+        }
     }
-    answer.form = text ? form : BodyForm::json;
-    answer.bytes = text ? std::move(*text) : jsonOf(value) + '\n';
+    answer.form = BodyForm::json;
+    answer.bytes = jsonOf(value) + '\n';
     return answer;
 }
 
@@ -151,46 +128,20 @@ protocol::Answer errorAnswer(std::string_view code, std::string_view message, Bo
     return written(Outcome::error, Dictionary{{"error", code}, {"message", message}}, form);
 }
 
-void Worker::load(const DiskPath& file, protocol::Hello& hello) {
-    auto loaded = loadPlugin(file);
-    std::string problem = loaded ? "" : textOf(loaded.error().description);
-    if (loaded && pluginNamed(loaded->name) != nullptr) {
-        problem = fmt::format("{}: a plug-in of the name \"{}\" is already loaded", file.text(), loaded->name);
+/// The answer to a command if something that it needs is not usable, or not known to be.
+protocol::Answer unmetAnswer(const UnmetNeed& need, BodyForm form) {
+    if (need.state == Probe::State::unusable) {
+        return errorAnswer("REQUIREMENT_NOT_MET", need.message, form);
     }
-    if (loaded && problem.empty()) {
-        const auto configured = callPlugin([&] { loaded->plugin->configure(_languages); });
-        if (!configured) {
-            problem = fmt::format("{} failed while it was configured: {}", file.text(),
-                                  textOf(configured.error().description));
-        }
-    }
-    if (loaded && problem.empty()) {
-        const auto files = callPlugin([&] { return loaded->plugin->toolFiles(); });
-        const auto error =
-            files ? writeToolFiles(_toolEnvironment[toolConfigurationVariable] + "/" + loaded->name, *files)
-                  : files.error();
-        if (error) {
-            problem = fmt::format("{}: the files of its tools cannot be written: {}", file.text(),
-                                  textOf(error->description));
-        }
-    }
-    if (!problem.empty()) {
-        hello.refused.push_back({file.text(), problem});
-        return;
-    }
-    hello.plugins.push_back({loaded->name, loaded->version, file.text(), loaded->commands});
-    _plugins.push_back(*std::move(loaded));
-}
-
-const LoadedPlugin* Worker::pluginNamed(std::string_view name) const {
-    const auto found =
-        std::find_if(_plugins.begin(), _plugins.end(), [&](const LoadedPlugin& plugin) { return plugin.name == name; });
-    return found == _plugins.end() ? nullptr : &*found;
+    protocol::Answer later;
+    later.outcome = Outcome::later;
+    later.error = "REQUIREMENT_UNKNOWN";
+    later.message = need.message;
+    return later;
 }
 
 protocol::Hello Worker::configure(const protocol::Configure& configuration) {
     setSystemRoot(configuration.root);
-    _languages = configuration.languages;
     _directoryTime = std::chrono::milliseconds(configuration.directoryMilliseconds);
     const std::vector<std::string> nodeProblems = configureDirectory(configuration);
     for (const std::string& problem : nodeProblems) {
@@ -200,7 +151,7 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
         setServiceManager(configuration.serviceManager == "pidfile" ? ServiceManager::pidFile
                                                                     : ServiceManager::systemd);
     }
-    _toolEnvironment = configuration.toolEnvironment;
+    _plugins.setToolEnvironment(configuration.toolEnvironment);
     if (const auto found = configuration.toolEnvironment.find(toolConfigurationVariable);
         found != configuration.toolEnvironment.end()) {
         _toolConfiguration = holdDirectory(found->second);
@@ -212,17 +163,15 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
     for (std::size_t i = 0; i < files.size(); ++i) {
         if (reasons[i]) {
             hello.refused.push_back({files[i].text(), *reasons[i]});
+        } else if (const auto loaded = _plugins.load(files[i], configuration.languages)) {
+            hello.plugins.push_back({loaded->name, loaded->version, files[i].text(), loaded->commands});
         } else {
-            load(files[i], hello);
+            hello.refused.push_back({files[i].text(), textOf(loaded.error().description)});
         }
     }
     if (configuration.tryOnly) {
-        hello.problems = nodeProblems;
-        for (const LoadedPlugin& loaded : _plugins) {
-            tryNeeds(loaded, hello.problems);
-        }
-        for (std::string& problem : unreachableNodes()) {
-            hello.problems.push_back(std::move(problem));
+        for (const auto& problems : {nodeProblems, _plugins.needsThatAreNotUsable(), unreachableNodes()}) {
+            hello.problems.insert(hello.problems.end(), problems.begin(), problems.end());
         }
     }
     return hello;
@@ -237,140 +186,9 @@ void Worker::probeDirectory(const protocol::Configure& configuration) {
     }
 }
 
-/// Asks the plug-in about everything that its commands need.
-void Worker::tryNeeds(const LoadedPlugin& loaded, std::vector<std::string>& problems) const {
-    std::set<std::string> needs;
-    for (const Command& command : loaded.commands) {
-        needs.insert(command.needs.begin(), command.needs.end());
-    }
-    for (const std::string& need : needs) {
-        if (const Probe probe = ask(loaded, need, probeBound); probe.state != Probe::State::usable) {
-            problems.push_back(fmt::format("{}: commands that need \"{}\" are refused: {}; {}", loaded.name, need,
-                                           probe.reason, probe.fix));
-        }
-    }
-}
-
-/// Sets where the plug-in's tools find the files that it gives them.
-void Worker::enter(const LoadedPlugin& loaded) const {
-    auto variables = _toolEnvironment;
-    variables[toolConfigurationVariable] += "/" + loaded.name;
-    setToolFileVariables(std::move(variables));
-}
-
-Probe Worker::ask(const LoadedPlugin& loaded, const std::string& need, Clock::duration bound) const {
-    enter(loaded);
-    setTaskDeadline(Clock::now() + std::min<Clock::duration>(bound, probeBound));
-    auto probe = callPlugin([&] { return loaded.plugin->probe(need); });
-    return probe ? *std::move(probe)
-                 : Probe{Probe::State::unknown, "the plug-in failed: " + textOf(probe.error().description),
-                         "see the daemon's log"};
-}
-
-/// The answer to a command if something that it needs is not usable, or not known to be.
-std::optional<protocol::Answer> Worker::unmetNeed(const LoadedPlugin& loaded, const protocol::Perform& order) const {
-    const Command* command = commandOf(loaded, order.command);
-    if (command == nullptr) {
-        return std::nullopt;
-    }
-    for (const std::string& need : command->needs) {
-        const Probe probe = ask(loaded, need, std::chrono::milliseconds(order.milliseconds));
-        if (probe.state == Probe::State::usable) {
-            continue;
-        }
-        const std::string why = fmt::format("{}; {}", probe.reason, probe.fix);
-        logEvent(fmt::format("adminhostd: {}/{} needs \"{}\": {}", loaded.name, order.command, need, why));
-        const std::string message = fmt::format("The command needs \"{}\": {}.", need, why);
-        if (probe.state == Probe::State::unusable) {
-            return errorAnswer("REQUIREMENT_NOT_MET", message, order.form);
-        }
-        protocol::Answer later;
-        later.outcome = Outcome::later;
-        later.error = "REQUIREMENT_UNKNOWN";
-        later.message = message;
-        return later;
-    }
-    return std::nullopt;
-}
-
-/// The history of the settings that the plug-in names.
-Result<SettingsHistory> historyOf(const LoadedPlugin& loaded) {
-    auto settings = callPlugin([&] { return loaded.plugin->settingKeys(); });
-    return settings ? Result<SettingsHistory>(SettingsHistory(loaded.name, *std::move(settings)))
-                    : failure(settings.error());
-}
-
-/// Removes files of workers that were killed in the middle of a write.
 void Worker::removeLeftovers() {
-    if (std::exchange(_leftoversRemoved, true)) {
-        return;
-    }
-    for (const LoadedPlugin& loaded : _plugins) {
-        const auto files = callPlugin([&] { return loaded.plugin->settingsFiles(); });
-        const auto others = callPlugin([&] { return loaded.plugin->leftovers(); });
-        if (!files || !others) {
-            logEvent(fmt::format("adminhostd: the plug-in {} failed to name what interrupted operations left: {}",
-                                 loaded.name, textOf((files ? others : files).error().description)));
-            continue;
-        }
-        for (const HostPath& file : *files) {
-            adminhost::removeLeftovers(file);
-        }
-        for (const HostPath& file : *others) {
-            static_cast<void>(::unlink(diskPath(file).c_str()));
-        }
-        SettingsHistory(loaded.name, {}).removeUnfinished();
-    }
-}
-
-/// A full or read-only disk does not stop a write: on a full disk, this write may be what fixes it.
-void reportNoEntry(const Error& error) {
-    logEvent("adminhostd: the settings before this write could not be kept: " + textOf(error));
-    reportNotDone({"", "The write has no entry in the history.", textOf(error.description)});
-}
-
-Result<Dictionary> settingsOf(const LoadedPlugin& loaded) {
-    return callPlugin([&] { return loaded.plugin->settings(); });
-}
-
-std::optional<std::uint64_t> Worker::keepHistory(const LoadedPlugin& loaded, const Dictionary& about) {
-    const auto history = historyOf(loaded);
-    const auto files = callPlugin([&] { return loaded.plugin->settingsFiles(); });
-    const auto settings = settingsOf(loaded);
-    if (!history || !files || !settings) {
-        reportNoEntry(!history ? history.error() : !files ? files.error() : settings.error());
-        return std::nullopt;
-    }
-    const auto entry = history->keep(*files, *settings, about);
-    if (!entry) {
-        reportNoEntry(entry.error());
-        return std::nullopt;
-    }
-    return *entry;
-}
-
-void Worker::completeHistory(const LoadedPlugin& loaded, std::optional<std::uint64_t> entry, const Dictionary& about) {
-    const std::vector<Change> changes = _sink.takeChanges();
-    if (!entry && changes.empty()) {
-        return;
-    }
-    const auto history = historyOf(loaded);
-    if (!history) {
-        reportNoEntry(history.error());
-        return;
-    }
-    if (const auto error = history->keepResources(changes, about)) {
-        logEvent("adminhostd: the history of this write is incomplete: " + textOf(*error));
-        reportNotDone({"", "The history of this write is incomplete.", textOf(error->description)});
-    }
-    if (!entry) {
-        return;
-    }
-    const auto settings = settingsOf(loaded);
-    const auto error = settings ? history->complete(*entry, *settings) : settings.error();
-    if (error) {
-        logEvent("adminhostd: what this write changed could not be added to its entry of the history: " +
-                 textOf(*error));
+    if (!std::exchange(_leftoversRemoved, true)) {
+        _plugins.removeLeftovers();
     }
 }
 
@@ -394,8 +212,8 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
         return answer;
     }
     const auto deadline = Clock::now() + std::chrono::milliseconds(order.milliseconds);
-    if (auto unmet = unmetNeed(loaded, order)) {
-        return *std::move(unmet);
+    if (const auto unmet = _plugins.unmetNeed(loaded, order.command, std::chrono::milliseconds(order.milliseconds))) {
+        return unmetAnswer(*unmet, order.form);
     }
     std::optional<WriteLock::Held> held;
     if (changes(loaded, order.command)) {
@@ -412,7 +230,7 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
         }
         removeLeftovers();
     }
-    enter(loaded);
+    _plugins.enter(loaded);
     setTaskDeadline(deadline);
     if (!order.revisions.empty()) {
         const auto revision = callPlugin([&] { return plugin.revision(); });
@@ -424,15 +242,17 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
             return answer;
         }
     }
-    const Dictionary about{{"when", order.received},
-                           {"who", loginText(order.caller.uid, order.caller.pid)},
-                           {"uid", std::uint64_t{order.caller.uid}},
-                           {"command", order.command},
-                           {"request", order.request}};
-    const std::optional<std::uint64_t> entry = order.keepsHistory ? keepHistory(loaded, about) : std::nullopt;
+    KeptWrite write(loaded, {{"when", order.received},
+                             {"who", loginText(order.caller.uid, order.caller.pid)},
+                             {"uid", std::uint64_t{order.caller.uid}},
+                             {"command", order.command},
+                             {"request", order.request}});
+    if (order.keepsHistory) {
+        write.begin();
+    }
     _sink.beginOperation(loaded.name);
     auto response = callPlugin([&] { return plugin.perform(order.command, order.arguments); });
-    completeHistory(loaded, entry, about);
+    write.complete(_sink.takeChanges());
     if (!response) {
         return failed(response.error());
     }
@@ -466,16 +286,16 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
 }
 
 protocol::Answer Worker::answer(const protocol::Perform& order) {
-    const LoadedPlugin* found = pluginNamed(order.plugin);
+    const LoadedPlugin* found = _plugins.named(order.plugin);
     if (found == nullptr) {
         return notLoaded(order.plugin);
     }
-    const DirectoryRequestScope directory(directoryBudget(commandOf(*found, order.command), _directoryTime));
+    const DirectoryRequestScope directory(directoryBudget(commandNamed(*found, order.command), _directoryTime));
     return perform(*found, order);
 }
 
 protocol::Answer Worker::answer(const protocol::ReadHistory& order) {
-    const LoadedPlugin* found = pluginNamed(order.plugin);
+    const LoadedPlugin* found = _plugins.named(order.plugin);
     if (found == nullptr) {
         return notLoaded(order.plugin);
     }

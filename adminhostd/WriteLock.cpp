@@ -38,11 +38,11 @@ Result<FileDescriptor> privateDirectory() {
     const OwnerAndMode forAll{::geteuid(), ::getegid(), 0755};
     const OwnerAndMode forUs{::geteuid(), ::getegid(), 0700};
     const DiskPath path = diskPath(HostPath(lockDirectory));
-    for (const auto& error :
+    for (const auto& created :
          {createDirectories(diskPath(HostPath(runDirectory)), forAll), createDirectories(path, forUs)}) {
-        if (error) {
-            errno = static_cast<int>(error->code);
-            return unusable(error->description.value_or(""));
+        if (!created) {
+            errno = static_cast<int>(created.error().code);
+            return unusable(created.error().description.value_or(""));
         }
     }
     FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));

@@ -7,7 +7,6 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <optional>
 #include <string>
 
 #include <expat.h>
@@ -48,19 +47,19 @@ void parseWithExpatAlone(const std::string& list) {
 }
 
 /// The parsed value outlives the timing, because freeing it is not part of parsing.
-std::optional<Value> parseOurs(const std::string& list) {
+Value parseOurs(const std::string& list) {
     auto value = parsePropertyList(list);
     if (!value) {
         std::abort();
     }
-    return value;
+    return *std::move(value);
 }
 
 void ParseAgainstExpatAlone(benchmark::State& state) {
-    std::optional<Value> value;
+    Value value;
     bench::alternate(
         state, bench::Clock::processor, [&] { value = parseOurs(text()); }, [&] { parseWithExpatAlone(text()); },
-        [&] { value.reset(); });
+        [&] { value = nullptr; });
     state.counters["bytes"] = static_cast<double>(text().size());
 }
 
@@ -85,7 +84,7 @@ void ParseAgainstPlistlib(benchmark::State& state) {
             std::abort();
         }
         theirs.push_back(std::stod(seconds));
-        std::optional<Value> value;
+        Value value;
         const auto work = [&] { value = parseOurs(text()); };
         ours.push_back(bench::secondsOf(bench::Clock::processor, work));
         state.SetIterationTime(ours.back());

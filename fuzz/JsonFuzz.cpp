@@ -9,9 +9,9 @@
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     using namespace adminhost;
-    Error error;
-    const auto value = parseJson({reinterpret_cast<const char*>(data), size}, &error);
+    const auto value = parseJson({reinterpret_cast<const char*>(data), size});
     if (!value) {
+        const Error& error = value.error();
         if (!error.description || !error.description->starts_with("line ") || !isUtf8(*error.description)) {
             std::abort();
         }

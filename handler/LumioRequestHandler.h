@@ -169,6 +169,9 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     /// The tickets of a running checkNimboController(). A worker that is killed may leave the file.
     [[nodiscard]] static adminhost::HostPath credentialCachePath();
 
+  protected:
+    [[nodiscard]] std::string messageForError(std::string_view code) const override;
+
   private:
     /// Runs the setup scripts and writes the three files, up to the first step that fails. Returns the status of the
     /// last step.

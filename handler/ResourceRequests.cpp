@@ -32,17 +32,17 @@ Response listing(std::string_view command, std::string_view key, Array list) {
 
 /// Applies each change entry of the configuration's list in order, with its key path; an element that is not a
 /// dictionary is skipped.
-template <class Change>
-void forEachEntry(std::string_view list, const Array* changes, Change change) {
+template <class Apply>
+void forEachEntry(std::string_view list, const Array* changes, Apply apply) {
     if (changes == nullptr) {
         return;
     }
     for (std::size_t index = 0; index < changes->size(); ++index) {
         const std::string keyPath = "configuration." + std::string(list) + '.' + std::to_string(index);
         if (const Dictionary* entry = (*changes)[index].dictionary()) {
-            change(*entry, keyPath);
+            apply(*entry, keyPath);
         } else {
-            adminhost::reportNotDone({keyPath, "the entry is not a dictionary", {}});
+            adminhost::reportNotDone({keyPath, "ignored: the entry is not a dictionary", {}});
         }
     }
 }
@@ -119,7 +119,7 @@ Response LumioRequestHandler::getWorkflowsWithRequest(const Dictionary& request)
     list.reserve(workflows->size());
     for (const auto& workflow : *workflows) {
         workflow->localizeUsingLanguages(languages);
-        list.emplace_back(*workflow->dictionary());
+        list.emplace_back(*std::move(*workflow).takeDictionary());
     }
     return listing("getWorkflows", "workflows", std::move(list));
 }
@@ -155,10 +155,9 @@ Response LumioRequestHandler::processPropertyChangesWithRequest(const Array* cha
             if (const auto error = Property::deletePropertyWithID(id)) {
                 logEvent("adminhost_lumio: could not delete property with id: " + textOf(id) +
                          ", error: " + textOf(*error));
-                adminhost::reportNotDone(
-                    {keyPath, "the property was not removed: the database refused it", toolWords(*error)});
+                adminhost::reportNotDone({keyPath, "not removed: the database refused it", toolWords(*error)});
             } else if (id.isNull()) {
-                adminhost::reportNotDone({keyPath, "no property was removed: the entry has no \"_id_\"", {}});
+                adminhost::reportNotDone({keyPath, "not removed: the entry has no \"_id_\"", {}});
             }
         } else if (flagOf(entry.get("_newid_"))) {
             const std::unique_ptr<Property> property = Property::initNewPropertyWithDictionary(entry);

@@ -80,10 +80,9 @@ std::string keyFileWords() {
 /// Keeps a copy of a file that exists but cannot be loaded, because it is going to be replaced and an administrator may
 /// want to look at it.
 void keepBeside(const HostPath& path) {
-    Error error;
-    const auto kept = adminhost::keepUnreadable(path, &error);
+    const auto kept = adminhost::keepUnreadable(path);
     adminhost::logEvent("adminhost_lumio: " + path.text() + " cannot be loaded" +
-                        (kept ? "; it is kept as " + kept->text() : " or kept: " + textOf(error)));
+                        (kept ? "; it is kept as " + kept->text() : " or kept: " + textOf(kept.error())));
 }
 
 /// The dictionary that a write begins with: the stored preferences, else the cached copy, else empty.
@@ -100,8 +99,8 @@ Dictionary startAt(const HostPath& path, const HostPath& cached) {
 }
 
 std::optional<SettingsWriteError> writeSettingsFile(const Dictionary& prefs, const HostPath& path) {
-    if (std::optional<Error> error = adminhost::writePropertyList(prefs, path)) {
-        return SettingsWriteError{"", 400, *std::move(error)};
+    if (auto written = adminhost::writePropertyList(prefs, path); !written) {
+        return SettingsWriteError{"", 400, std::move(written.error())};
     }
     return std::nullopt;
 }
@@ -145,7 +144,7 @@ Response LumioRequestHandler::writeSettingsWithRequest(const Dictionary& request
     Dictionary config = given == nullptr ? Dictionary() : *given;
 
     if (config.contains(resolveKey) && !config.contains(controllerKey)) {
-        reportSettingNotDone(resolveKey, "It says how \"nimbo_controller\" is looked up, which is not given.");
+        reportSettingNotDone(resolveKey, "ignored: it has an effect only together with nimbo_controller");
     }
     const std::int32_t status = writeSettingsFiles(config, result);
 
@@ -172,23 +171,25 @@ std::int32_t LumioRequestHandler::writeSettingsFiles(Dictionary& config, Diction
     // The identity preferences come first: the library script and the later files already see a new shared file system.
     if (const ScriptRun run = runSetupScript(preferencesScript); run.status != 0) {
         reportSkipped({identity, clusterKeys(), member}, config,
-                      "The preferences setup script failed with status " + std::to_string(run.status) + ".", run.words);
+                      "not written: the preferences setup script failed with status " + std::to_string(run.status),
+                      run.words);
         return run.status;
     }
     if (const std::int32_t status = setIdentityPreferencesFromConfig(config, result); status != 0) {
-        reportSettingsNotDone(clusterKeys(), config, "The identity preferences could not be written.",
+        reportSettingsNotDone(clusterKeys(), config, "not written: the identity preferences cannot be written",
                               textOf(result.get("errorDescription")));
-        reportSettingsNotDone(member, config, "The identity preferences could not be written.",
+        reportSettingsNotDone(member, config, "not written: the identity preferences cannot be written",
                               textOf(result.get("errorDescription")));
         return status;
     }
     if (const ScriptRun run = runSetupScript(libraryScript); run.status != 0) {
         reportSkipped({clusterKeys(), member}, config,
-                      "The library setup script failed with status " + std::to_string(run.status) + ".", run.words);
+                      "not written: the library setup script failed with status " + std::to_string(run.status),
+                      run.words);
         return run.status;
     }
     if (const std::int32_t status = setClusterPreferencesFromConfig(config, result); status != 0) {
-        reportSettingsNotDone(member, config, "The cluster preferences could not be written.",
+        reportSettingsNotDone(member, config, "not written: the cluster preferences cannot be written",
                               textOf(result.get("errorDescription")));
         return status;
     }
@@ -208,7 +209,8 @@ std::int32_t writeAndReport(const SettingKeys& keys, const Dictionary& config, c
     if (status == 0) {
         reportSettingChanges(keys, before, after);
     } else {
-        reportSettingsNotDone(keys, config, "The file could not be written.", textOf(result.get("errorDescription")));
+        reportSettingsNotDone(keys, config, "not written: the file cannot be written",
+                              textOf(result.get("errorDescription")));
     }
     return status;
 }
@@ -216,7 +218,8 @@ std::int32_t writeAndReport(const SettingKeys& keys, const Dictionary& config, c
 /// The status if the identity preferences cannot be read. The place of the other files is not known then, so no file is
 /// written, least of all below the default shared file system.
 std::int32_t unknownPlace(const SettingKeys& keys, const Dictionary& config, const Error& error, Dictionary& result) {
-    reportSettingsNotDone(keys, config, "The identity preferences, which name the file's place, cannot be read.",
+    reportSettingsNotDone(keys, config,
+                          "not written: the identity preferences, which name the place of the file, cannot be read",
                           error.description.value_or(""));
     return statusOf(SettingsWriteError{"", 400, error}, result);
 }
@@ -274,8 +277,7 @@ std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& co
             } else {
                 passwordProtected = false;
                 adminhost::logEvent("adminhost_lumio: nimbo_client_password encryption failed");
-                reportSettingNotDone(passwordKey, "The password could not be encrypted; the stored one is unchanged.",
-                                     keyFileWords());
+                reportSettingNotDone(passwordKey, "not written: the password cannot be encrypted", keyFileWords());
             }
         }
     }
@@ -292,11 +294,11 @@ std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& co
     if (status == 0) {
         reportSecretChange(passwordKey, before, prefs);
         if (!unresolved.empty()) {
-            reportSettingNotDone(controllerKey, "The name could not be resolved; it is stored as it was given.",
-                                 unresolved);
+            reportSettingNotDone(controllerKey, "stored as given: the name cannot be resolved", unresolved);
         }
     } else if (passwordGiven && passwordProtected) {
-        reportSettingNotDone(passwordKey, "The file could not be written.", textOf(result.get("errorDescription")));
+        reportSettingNotDone(passwordKey, "not written: the file cannot be written",
+                             textOf(result.get("errorDescription")));
     }
     return status;
 }
@@ -327,15 +329,15 @@ void LumioRequestHandler::markSetupDone() {
     }
     const HostPath directory{std::string(stateDirectory)};
     const adminhost::OwnerAndMode attributes{0, adminhost::groupIdOf("wheel").value_or(0), 0755};
-    if (const auto error = adminhost::createDirectories(adminhost::diskPath(directory), attributes)) {
+    if (const auto created = adminhost::createDirectories(adminhost::diskPath(directory), attributes); !created) {
         adminhost::logEvent("adminhost_lumio: failed to create directory at path: " + directory.text() +
-                            ", error: " + textOf(*error));
+                            ", error: " + textOf(created.error()));
     }
     const HostPath marker{std::string(setupDoneMarker)};
-    if (const auto error = adminhost::createEmptyFile(adminhost::diskPath(marker))) {
+    if (const auto created = adminhost::createEmptyFile(adminhost::diskPath(marker)); !created) {
         adminhost::logEvent("adminhost_lumio: failed to create file at path: " + marker.text());
-        reportSettingNotDone({}, "The mark that the service is configured, " + marker.text() + ", was not created.",
-                             error->description.value_or(""));
+        reportSettingNotDone({}, "not created: the file that marks the service as configured, " + marker.text(),
+                             created.error().description.value_or(""));
     }
 }
 

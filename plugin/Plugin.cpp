@@ -24,7 +24,7 @@ using adminhost::Dictionary;
 using adminhost::Response;
 using lumio::LumioRequestHandler;
 
-struct Operation {
+struct TableRow {
     std::string_view command;
     Response (*perform)(LumioRequestHandler& handler, const Dictionary& request);
 };
@@ -36,7 +36,7 @@ constexpr std::size_t identityFile = 0;
 constexpr std::size_t clusterFile = 1;
 constexpr std::size_t memberFile = 2;
 
-constexpr Operation operations[] = {
+constexpr TableRow operations[] = {
     {"readSettings", [](LumioRequestHandler& h, const Dictionary& r) { return h.readSettingsWithRequest(r); }},
     {"writeSettings", [](LumioRequestHandler& h, const Dictionary& r) { return h.writeSettingsWithRequest(r); }},
     {"getState", [](LumioRequestHandler& h, const Dictionary& r) { return h.getStateWithRequest(r); }},
@@ -55,9 +55,9 @@ constexpr Operation operations[] = {
     {"getProperties", [](LumioRequestHandler& h, const Dictionary& r) { return h.getPropertiesWithRequest(r); }},
 };
 
-const Operation* operationNamed(std::string_view command) noexcept {
+const TableRow* operationNamed(std::string_view command) noexcept {
     const auto* found = std::find_if(std::begin(operations), std::end(operations),
-                                     [&](const Operation& row) { return row.command == command; });
+                                     [&](const TableRow& row) { return row.command == command; });
     return found == std::end(operations) ? nullptr : found;
 }
 
@@ -106,12 +106,12 @@ class LumioPlugin final : public adminhost::Plugin {
 
     Response perform(std::string_view command, const Dictionary& request) override {
         for (const std::string& keyPath : lumio::unknownKeys(command, request)) {
-            adminhost::reportNotDone({keyPath,
-                                      isOnlyRead(keyPath) ? "This key can only be read, so it was ignored."
-                                                          : "The key is not known, so it was ignored.",
-                                      {}});
+            adminhost::reportNotDone(
+                {keyPath,
+                 isOnlyRead(keyPath) ? "ignored: the key can only be read" : "ignored: the key is not known",
+                 {}});
         }
-        const Operation* operation = operationNamed(command);
+        const TableRow* operation = operationNamed(command);
         return operation == nullptr ? Response::error("UNKNOWN_COMMAND", "The plug-in does not serve this command.")
                                     : operation->perform(_handler, request);
     }

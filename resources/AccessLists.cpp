@@ -127,7 +127,7 @@ void Resource::setACLEnabled(bool enabled) {
     constexpr const char* key = "access_control_enabled";
     const std::optional<std::string> uuid = statementGuid();
     if (!uuid) {
-        reportNotDone(key, "access control was not switched: the identifier is missing");
+        reportNotDone(key, "not changed: the entry has no \"_id_\"");
         return;
     }
     std::optional<Error> error;
@@ -136,7 +136,7 @@ void Resource::setACLEnabled(bool enabled) {
                                                "\" where uuid=\"" + *uuid + "\"",
                                            error);
     if (error) {
-        reportNotDone(key, "access control was not switched: the database refused it", toolWords(*error));
+        reportNotDone(key, "not changed: the database refused it", toolWords(*error));
         return;
     }
     _aclEnabled = enabled;
@@ -151,13 +151,12 @@ std::string Resource::accessListStatement() const {
            "' and resource_id = '" + adminhost::textOf(rowId()) + "'";
 }
 
-std::vector<std::string> Resource::uuidsIn(const std::optional<std::vector<Dictionary>>& rows,
-                                           const std::optional<Error>& error) const {
+std::vector<std::string> Resource::uuidsIn(const adminhost::Result<std::vector<Dictionary>>& rows) const {
     logUnusableId();
     if (!rows) {
-        adminhost::logEvent("getUserAndGroupACLs SQL query returned error: " + textOf(error));
+        adminhost::logEvent("getUserAndGroupACLs SQL query returned error: " + textOf(rows.error()));
         // The response shows an empty list: without a report, a client would believe that it is one.
-        adminhost::reportNotDone({"", "an access list cannot be read", textOf(error)});
+        adminhost::reportNotDone({"", "not read: the access list", toolWords(rows.error())});
         return {};
     }
     std::vector<std::string> uuids;
@@ -170,9 +169,7 @@ std::vector<std::string> Resource::uuidsIn(const std::optional<std::vector<Dicti
 }
 
 std::vector<std::string> Resource::getUserAndGroupACLs() {
-    std::optional<Error> error;
-    const auto rows = querySorvaneDatabase<Dictionary>(accessListStatement(), error);
-    return uuidsIn(rows, error);
+    return uuidsIn(runStatement(accessListStatement()));
 }
 
 std::vector<Dictionary> Resource::getDirectoryDetailsForUUIDs(const std::vector<std::string>& uuids,
@@ -224,9 +221,7 @@ void Resource::expandAll(const std::vector<Resource*>& resources) {
     StatementBatch batch(std::move(statements));
     for (Resource* resource : resources) {
         resource->expandColumns();
-        std::optional<Error> error;
-        const auto rows = batch.next(error);
-        resource->expandList(resource->uuidsIn(rows, error));
+        resource->expandList(resource->uuidsIn(batch.next()));
     }
 }
 
@@ -270,37 +265,36 @@ void Resource::changeACLsWithRequest(const Array* entries) {
     for (std::size_t index = 0; index < entries->size(); ++index) {
         const Dictionary* entry = (*entries)[index].dictionary();
         if (entry == nullptr) {
-            reportNotDone(pathOf(index), "the entry is not a dictionary");
+            reportNotDone(pathOf(index), "ignored: the entry is not a dictionary");
             continue;
         }
         if (booleanOf(entry->get("_newid_"))) {
             const bool isUser = isType(entry->get("type"), "user");
             if (!isUser && !isType(entry->get("type"), "group")) {
-                reportNotDone(pathOf(index), "the entry's \"type\" is neither \"user\" nor \"group\"");
+                reportNotDone(pathOf(index), "ignored: \"type\" is neither \"user\" nor \"group\"");
                 continue;  // and not tried as a removal
             }
             const Value* name = entry->find("shortName");
             if (name == nullptr) {
-                reportNotDone(pathOf(index), "the entry has no \"shortName\"");
-                reportNotDone("allowedUsersAndGroups",
-                              "the list was not changed: one of its entries has no \"shortName\"");
+                reportNotDone(pathOf(index), "not added: the entry has no \"shortName\"");
+                reportNotDone("allowedUsersAndGroups", "not changed: one of the entries has no \"shortName\"");
                 return;
             }
             (isUser ? toAdd.users : toAdd.groups).push_back({textOf(*name), index});
         } else if (booleanOf(entry->get("_obsoleteid_"))) {
             const auto appended = appendNameOf(entry->get("_id_"), index, toRemove);
             if (!appended) {
-                reportNotDone(pathOf(index), "the directory failed, so the entry was not removed",
+                reportNotDone(pathOf(index), "not removed: the directory failed",
                               appended.error().description.value_or(""));
             } else if (!*appended) {
                 reportNotDone(pathOf(index),
-                              "the directory has no user or group with the entry's \"_id_\" and a numeric id");
+                              "not removed: the directory has no user or group with this UUID and a numeric id");
             }
         }
     }
     const std::optional<std::string> uuid = statementGuid();
     if (!uuid) {
-        reportNotDone("allowedUsersAndGroups", "the list was not changed: the identifier is missing");
+        reportNotDone("allowedUsersAndGroups", "not changed: the entry has no \"_id_\"");
         return;
     }
     const auto run = [&](const char* command, const char* kind, const std::vector<Named>& names) {
@@ -313,7 +307,8 @@ void Resource::changeACLsWithRequest(const Array* entries) {
         for (const Named& named : names) {
             if (error) {
                 reportNotDone(pathOf(named.index),
-                              "the configuration tool failed with status " + std::to_string(error->code),
+                              std::string(adds ? "not added" : "not removed") +
+                                  ": the configuration tool failed with status " + std::to_string(error->code),
                               error->description.value_or(""));
                 continue;
             }

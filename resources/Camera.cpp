@@ -55,15 +55,17 @@ std::optional<std::vector<std::unique_ptr<Camera>>> Camera::allCamerasWithError(
         error = missingDatabase();
         return std::nullopt;
     }
-    return resourcesOf<Camera>(
-        "select " + joined(columns) + " from cameras where (disabled != 't' OR disabled is NULL)", columns, error);
+    return orError(
+        resourcesOf<Camera>("select " + joined(columns) + " from cameras where (disabled != 't' OR disabled is NULL)",
+                            columns),
+        error);
 }
 
 std::optional<Error> Camera::delete_() {
     static const adminhost::HostPath tool("/usr/bin/lumioconfig");
     const std::optional<std::string> uuid = statementGuid();
     if (!uuid) {
-        reportNotDone("", "the camera was not removed: its identifier is missing");
+        reportNotDone("", "not removed: the entry has no \"_id_\"");
         return Error{"adminhost_lumio", -1, std::nullopt};
     }
     std::string output;
@@ -71,8 +73,7 @@ std::optional<Error> Camera::delete_() {
     const std::int32_t status =
         adminhost::launch_task(adminhost::diskPath(tool), {"--remove_camera", *uuid}, &output, &words);
     if (status != 0) {
-        reportNotDone("",
-                      "the camera was not removed: the configuration tool failed with status " + std::to_string(status),
+        reportNotDone("", "not removed: the configuration tool failed with status " + std::to_string(status),
                       toolWords(words, output));
         return Error{"adminhost_lumio", status, std::nullopt};
     }

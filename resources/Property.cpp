@@ -217,7 +217,7 @@ std::optional<Error> Property::delete_() {
     if (error) {
         logEvent("error deleting property:\n" + recordText(booleanOf(stored("protect"))) +
                  "\n  error:: " + textOf(error));
-        reportNotDone("", "the property was not removed: the database refused it", toolWords(*error));
+        reportNotDone("", "not removed: the database refused it", toolWords(*error));
     } else {
         reportRemoved(*id, adminhost::utf8Of(textOf(stored("name"))));
     }
@@ -228,7 +228,7 @@ std::optional<Error> Property::write() {
     if (_loadError) {
         // The update could match no row, and its arguments would show the value.
         logWriteError(*_loadError, false);
-        reportNotDone("", "the property was not changed: it could not be read", toolWords(*_loadError));
+        reportNotDone("", "not changed: the property cannot be read", toolWords(*_loadError));
         return _loadError;
     }
     const bool isUpdate = _changeValues.has_value();
@@ -240,7 +240,7 @@ std::optional<Error> Property::write() {
     std::optional<Error> error;
     if (const Value* name = working.find("name")) {
         if (std::optional<Error> taken = nameError(*name, error)) {
-            reportNotDone("name", "the property was not written: another one has this name");
+            reportNotDone("name", "not written: another property has this name");
             return taken;
         }
     }
@@ -255,7 +255,7 @@ std::optional<Error> Property::write() {
         if (isUpdate && !working.contains("value")) {
             if (std::optional<Error> unfit = takeStoredValue(working, isProtected, deciphered)) {
                 logWriteError(*unfit, true);
-                reportNotDone("protect", "the property stays protected", toolWords(*unfit));
+                reportNotDone("protect", "not changed: the deciphered value cannot be stored", toolWords(*unfit));
                 return unfit;
             }
         }
@@ -264,7 +264,7 @@ std::optional<Error> Property::write() {
         std::optional<std::string> protectedValue = encryptValue(working.get("value"));
         if (!protectedValue) {
             reportNotDone(isUpdate && !_changeValues->contains("value") ? "protect" : "value",
-                          "the property was not written: its value cannot be protected without a usable key");
+                          "not written: the value cannot be protected without a usable key");
             return Error{"LumioPropertyCantEncryptValue", 1, std::nullopt};
         }
         cleanseValue(working);
@@ -293,12 +293,11 @@ std::optional<Error> Property::write() {
             // The tool quotes the statement, which contains a value that stays protected in this case.
             failure->description = withoutSecret(*failure->description, textOf(working.get("value")), statement);
         }
-        reportNotDone("", "the property was not written: the database refused it", toolWords(*failure));
+        reportNotDone("", "not written: the database refused it", toolWords(*failure));
         error = std::move(failure);
     } else {
         if (error) {
-            reportNotDone("name", "the property was written, but whether another one has this name is not known",
-                          toolWords(*error));
+            reportNotDone("name", "written, but not checked: another property may have this name", toolWords(*error));
         }
         reportWritten(working, isProtected);
     }
@@ -316,7 +315,7 @@ std::optional<Error> Property::takeStoredValue(Dictionary& working, bool isProte
     }
     std::optional<std::string> plain = decryptValue(stored("value"));
     if (!plain) {
-        reportNotDone("protect", "the stored value cannot be deciphered and stays as it is");
+        reportNotDone("protect", "not changed: the stored value cannot be deciphered");
         return std::nullopt;
     }
     const adminhost::ScopedCleanse wipePlain(*plain);
@@ -346,8 +345,8 @@ void Property::reportWritten(const Dictionary& working, bool isProtected) const 
     }
     const std::optional<std::string> id = rowId();
     if (!id) {
-        reportNotDone("", _changeValues->contains("_id_") ? "nothing was changed: there is no such property"
-                                                          : "nothing was changed: the entry has no \"_id_\"");
+        reportNotDone("", _changeValues->contains("_id_") ? "not changed: property not found"
+                                                          : "not changed: the entry has no \"_id_\"");
         return;
     }
     const bool wasProtected = booleanOf(stored("protect"));

@@ -27,19 +27,19 @@ std::optional<Data> keyEncryptionKey() {
     const auto preferences = SettingsStore::identityPreferences();
     const Value sharedFilesystem = preferences ? preferences->get("shared_filesystem") : Value();
     const std::string path = textOf(sharedFilesystem) + "/Server/Secrets/kek.plist";
-    std::optional<Value> file;
+    Value file;
     if (!sharedFilesystem.isNull()) {
         auto bytes = adminhost::readFile(adminhost::diskPath(adminhost::HostPath(path)), adminhost::plistMaximumSize);
         if (bytes) {
             const ScopedCleanse wipeFile(*bytes);
-            file = adminhost::parsePropertyList(*bytes);
+            file = adminhost::parsePropertyList(*bytes).value_or(Value());
         }
     }
-    if (!file || file->dictionary() == nullptr) {
+    if (file.dictionary() == nullptr) {
         logEvent("failed to load " + path);
         return std::nullopt;
     }
-    const std::string* secret = file->dictionary()->get("lumio_secret").string();
+    const std::string* secret = file.dictionary()->get("lumio_secret").string();
     if (secret == nullptr) {
         logEvent("kek shared_secret not found");
         return std::nullopt;

@@ -88,12 +88,11 @@ const Dictionary* Resource::data() {
         return &*_data;
     }
     if (const std::optional<std::string> uuid = statementGuid()) {
-        std::optional<adminhost::Error> error;
         auto rows = rowsWithIdentities(
-            std::string("select * from ").append(resourceType()) + "s where uuid=\"" + *uuid + "\"", {}, error);
-        if (rows.records && rows.records->size() == 1) {
-            _data = std::move(rows.records->front());
-            _rawIdentity = std::move(rows.identities.front());
+            std::string("select * from ").append(resourceType()) + "s where uuid=\"" + *uuid + "\"", {});
+        if (rows && rows->size() == 1) {
+            _data = std::move(rows->front().record);
+            _rawIdentity = std::move(rows->front().identity);
         }
     }
     return _data ? &*_data : nullptr;
@@ -140,16 +139,16 @@ std::optional<std::string> Resource::statementGuid() {
     return std::nullopt;
 }
 
-Resource::RowsWithIdentities Resource::rowsWithIdentities(const std::string& statement,
-                                                          std::span<const std::string> columns,
-                                                          std::optional<adminhost::Error>& error) {
+adminhost::Result<std::vector<Resource::RowWithIdentity>> Resource::rowsWithIdentities(
+    const std::string& statement, std::span<const std::string> columns) {
     auto output = statementOutput(statement);
     if (!output) {
-        error = std::move(output.error());
-        return {};
+        return adminhost::failure(std::move(output.error()));
     }
-    RowsWithIdentities rows{recordsOfLineOutput(*output), {}};
-    rows.identities.resize(rows.records->size());
+    std::vector<RowWithIdentity> rows;
+    for (Dictionary& record : recordsOfLineOutput(*output)) {
+        rows.push_back({std::move(record), {}});
+    }
     std::vector<std::string> inferred;
     if (columns.empty()) {
         inferred = lineColumns(*output);
@@ -161,12 +160,12 @@ Resource::RowsWithIdentities Resource::rowsWithIdentities(const std::string& sta
     const std::size_t id = indexOf("id");
     const std::size_t uuid = indexOf("uuid");
     const auto raw = rowsOfRecords(*output, columns);
-    for (std::size_t i = 0; i < std::min(raw.size(), rows.identities.size()); ++i) {
+    for (std::size_t i = 0; i < std::min(raw.size(), rows.size()); ++i) {
         if (raw[i] && id < columns.size()) {
-            rows.identities[i].id = raw[i]->values[id];
+            rows[i].identity.id = raw[i]->values[id];
         }
         if (raw[i] && uuid < columns.size()) {
-            rows.identities[i].uuid = raw[i]->values[uuid];
+            rows[i].identity.uuid = raw[i]->values[uuid];
         }
     }
     return rows;

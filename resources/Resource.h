@@ -50,9 +50,9 @@ class Resource {
     [[nodiscard]] static auto querySorvaneDatabase(const std::string& statement,
                                                    std::optional<adminhost::Error>& error) {
         if constexpr (std::same_as<ResultClass, adminhost::Dictionary>) {
-            return runStatement(statement, error);
+            return orError(runStatement(statement), error);
         } else {
-            return resourcesOf<ResultClass>(statement, {}, error);
+            return orError(resourcesOf<ResultClass>(statement, {}), error);
         }
     }
 
@@ -139,8 +139,8 @@ class Resource {
     // Its steps, with the statement that is run between them.
     void expandColumns();
     [[nodiscard]] std::string accessListStatement() const;
-    [[nodiscard]] std::vector<std::string> uuidsIn(const std::optional<std::vector<adminhost::Dictionary>>& rows,
-                                                   const std::optional<adminhost::Error>& error) const;
+    [[nodiscard]] std::vector<std::string> uuidsIn(
+        const adminhost::Result<std::vector<adminhost::Dictionary>>& rows) const;
     void expandList(const std::vector<std::string>& uuids);
     /// The directory's entries for the UUIDs, of one record type or of people and groups. If the directory fails,
     /// prints that on standard output and returns an empty list.
@@ -171,19 +171,30 @@ class Resource {
     /// The objects of a statement's rows. The columns, in the statement's order, separate the rows' identities from
     /// values that look like them; without columns they are inferred from the output.
     template <class ResultClass>
-    [[nodiscard]] static std::optional<std::vector<std::unique_ptr<ResultClass>>> resourcesOf(
-        const std::string& statement, std::span<const std::string> columns, std::optional<adminhost::Error>& error) {
-        RowsWithIdentities rows = rowsWithIdentities(statement, columns, error);
-        if (!rows.records) {
-            return std::nullopt;
+    [[nodiscard]] static adminhost::Result<std::vector<std::unique_ptr<ResultClass>>> resourcesOf(
+        const std::string& statement, std::span<const std::string> columns) {
+        auto rows = rowsWithIdentities(statement, columns);
+        if (!rows) {
+            return adminhost::failure(std::move(rows.error()));
         }
         std::vector<std::unique_ptr<ResultClass>> results;
-        results.reserve(rows.records->size());
-        for (std::size_t i = 0; i < rows.records->size(); ++i) {
-            results.push_back(ResultClass::initWithDictionary(std::move((*rows.records)[i])));
-            static_cast<Resource&>(*results.back())._rawIdentity = std::move(rows.identities[i]);
+        results.reserve(rows->size());
+        for (RowWithIdentity& row : *rows) {
+            results.push_back(ResultClass::initWithDictionary(std::move(row.record)));
+            static_cast<Resource&>(*results.back())._rawIdentity = std::move(row.identity);
         }
         return results;
+    }
+
+    /// The form of the operations whose callers pass a place for the error; it is written on failure only.
+    template <class Rows>
+    [[nodiscard]] static std::optional<Rows> orError(adminhost::Result<Rows> rows,
+                                                     std::optional<adminhost::Error>& error) {
+        if (!rows) {
+            error = std::move(rows.error());
+            return std::nullopt;
+        }
+        return *std::move(rows);
     }
 
     /// "id" and "uuid" as in the raw text of the tool's output; null if they are not known.
@@ -191,13 +202,12 @@ class Resource {
         std::optional<std::string> id;
         std::optional<std::string> uuid;
     };
-    struct RowsWithIdentities {
-        std::optional<std::vector<adminhost::Dictionary>> records;
-        std::vector<RawIdentity> identities;  ///< one for each record
+    struct RowWithIdentity {
+        adminhost::Dictionary record;
+        RawIdentity identity;
     };
-    [[nodiscard]] static RowsWithIdentities rowsWithIdentities(const std::string& statement,
-                                                               std::span<const std::string> columns,
-                                                               std::optional<adminhost::Error>& error);
+    [[nodiscard]] static adminhost::Result<std::vector<RowWithIdentity>> rowsWithIdentities(
+        const std::string& statement, std::span<const std::string> columns);
 
     // Reports (platform/framework/Report.h). The record is not loaded for them: fields that it does not have stay null.
 

@@ -64,12 +64,8 @@ std::optional<Dictionary> Workflow::uncachedInfoDictionary() {
         return std::nullopt;
     }
     const DiskPath file = diskPath(HostPath(opened->path().text() + "/Contents/Info.plist"));
-    std::optional<Value> value;
-    if (isBelowRoot(file)) {
-        if (const auto bytes = adminhost::readFile(file, informationMaximumSize)) {
-            value = adminhost::parsePropertyList(*bytes);
-        }
-    }
+    const auto bytes = isBelowRoot(file) ? adminhost::readFile(file, informationMaximumSize) : std::string();
+    auto value = bytes ? adminhost::parsePropertyList(*bytes) : adminhost::failure(bytes.error());
     Dictionary* information = value ? value->dictionary() : nullptr;
     return information == nullptr ? std::nullopt : std::optional(std::move(*information));
 }

@@ -80,13 +80,8 @@ static adminhost::Result<std::string> outputOf(adminhost::TaskResult result) {
     return std::move(result.output);
 }
 
-std::optional<std::vector<Dictionary>> rowsOf(const adminhost::TaskResult& result, std::optional<Error>& error) {
-    const auto output = outputOf(result);
-    if (!output) {
-        error = output.error();
-        return std::nullopt;
-    }
-    return recordsOfLineOutput(*output);
+adminhost::Result<std::vector<Dictionary>> rowsOf(adminhost::TaskResult result) {
+    return outputOf(std::move(result)).map([](const std::string& output) { return recordsOfLineOutput(output); });
 }
 
 adminhost::Result<std::string> statementOutput(const std::string& statement) {
@@ -105,13 +100,8 @@ Error missingDatabase() {
                       "\": unable to open database file\n")};
 }
 
-std::optional<std::vector<Dictionary>> runStatement(const std::string& statement, std::optional<Error>& error) {
-    adminhost::Result<std::string> output = statementOutput(statement);
-    if (!output) {
-        error = std::move(output.error());
-        return std::nullopt;
-    }
-    return recordsOfLineOutput(*output);
+adminhost::Result<std::vector<Dictionary>> runStatement(const std::string& statement) {
+    return statementOutput(statement).map([](const std::string& output) { return recordsOfLineOutput(output); });
 }
 
 }  // namespace lumio

@@ -9,7 +9,6 @@
 #include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
-#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -22,16 +21,13 @@ namespace lumio {
 [[nodiscard]] adminhost::Result<std::string> statementOutput(const std::string& statement);
 
 /// Runs the statement likewise. Returns the rows in output order, each a dictionary of texts by column name (NULL is
-/// the empty text); empty if the statement prints nothing. Returns null if the tool fails, and writes the error only
-/// then. Rows printed before a failure are dropped.
-[[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> runStatement(const std::string& statement,
-                                                                             std::optional<adminhost::Error>& error);
+/// the empty text); empty if the statement prints nothing. Rows printed before a failure are dropped.
+[[nodiscard]] adminhost::Result<std::vector<adminhost::Dictionary>> runStatement(const std::string& statement);
 
 /// The plan of the tool's run for the statement.
 [[nodiscard]] adminhost::TaskPlan planOf(const std::string& statement);
 /// What runStatement() returns for the result of that run.
-[[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> rowsOf(const adminhost::TaskResult& result,
-                                                                       std::optional<adminhost::Error>& error);
+[[nodiscard]] adminhost::Result<std::vector<adminhost::Dictionary>> rowsOf(adminhost::TaskResult result);
 /// The failure of a listing whose database does not exist. Listings check first, because the tool would create an empty
 /// file.
 [[nodiscard]] adminhost::Error missingDatabase();

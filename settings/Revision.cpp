@@ -29,8 +29,7 @@ void append(std::string& text, std::string_view part) {
 }
 
 bool appendRows(std::string& text, std::string_view selection) {
-    std::optional<adminhost::Error> error;
-    const auto rows = runStatement(std::string(selection) + " order by 1,2,3,4,5", error);
+    const auto rows = runStatement(std::string(selection) + " order by 1,2,3,4,5");
     if (!rows) {
         return false;
     }

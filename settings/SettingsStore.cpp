@@ -23,7 +23,7 @@ namespace {
 constexpr std::size_t locationFileMaximum = std::size_t{1} << 20U;
 
 std::optional<Dictionary> load(const HostPath& path) {
-    std::optional<Value> value = adminhost::readPropertyList(adminhost::diskPath(path));
+    auto value = adminhost::readPropertyList(adminhost::diskPath(path));
     if (!value || value->dictionary() == nullptr) {
         return std::nullopt;
     }
@@ -151,18 +151,18 @@ HostPath SettingsStore::cachedClusterPreferencesPath() {
 }
 
 adminhost::Result<std::optional<Dictionary>> SettingsStore::stored(const HostPath& path) {
-    adminhost::Error error;
-    std::optional<Value> value = adminhost::readPropertyList(adminhost::diskPath(path), &error);
+    auto value = adminhost::readPropertyList(adminhost::diskPath(path));
     if (value && value->dictionary() != nullptr) {
         return std::move(*value->dictionary());
     }
     if (value) {
         return adminhost::failure({"posix", EINVAL, "cannot read " + path.text() + ": not a dictionary"});
     }
+    const adminhost::Error& error = value.error();
     if (error.domain == "posix" && (error.code == ENOENT || error.code == ENOTDIR)) {
         return std::nullopt;
     }
-    return adminhost::failure(std::move(error));
+    return adminhost::failure(std::move(value.error()));
 }
 
 adminhost::Result<std::optional<Dictionary>> SettingsStore::storedIdentity() {

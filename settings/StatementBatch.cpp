@@ -9,7 +9,6 @@
 namespace lumio {
 
 using adminhost::Dictionary;
-using adminhost::Error;
 using adminhost::TaskGroup;
 using adminhost::TaskResult;
 
@@ -63,7 +62,7 @@ TaskResult StatementBatch::runAlone() {
     return _group.collect(_group.start(planOf(_statements[_next])));
 }
 
-std::optional<std::vector<Dictionary>> StatementBatch::next(std::optional<Error>& error) {
+adminhost::Result<std::vector<Dictionary>> StatementBatch::next() {
     startMore();
     while (!_group.ended(_tasks[_next])) {
         serve();
@@ -75,7 +74,7 @@ std::optional<std::vector<Dictionary>> StatementBatch::next(std::optional<Error>
     }
     ++_next;
     startMore();
-    return rowsOf(std::move(result), error);
+    return rowsOf(std::move(result));
 }
 
 }  // namespace lumio

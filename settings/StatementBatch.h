@@ -10,7 +10,6 @@
 #include "settings/QueryRunner.h"
 
 #include <cstddef>
-#include <optional>
 #include <string>
 #include <vector>
 
@@ -22,7 +21,7 @@ class StatementBatch {
     explicit StatementBatch(std::vector<std::string> statements, std::size_t atOnce = 0);
 
     /// The result of the next statement, as runStatement() returns it. Called once for each statement.
-    [[nodiscard]] std::optional<std::vector<adminhost::Dictionary>> next(std::optional<adminhost::Error>& error);
+    [[nodiscard]] adminhost::Result<std::vector<adminhost::Dictionary>> next();
 
   private:
     void startMore();

@@ -323,10 +323,9 @@ class Parser {
 };
 
 Result<Dictionary> parseAsPropertyList(std::string_view bytes) {
-    Error error;
-    std::optional<Value> value = parsePropertyList(bytes, &error);
+    Result<Value> value = parsePropertyList(bytes);
     if (!value) {
-        return failure(std::move(error));
+        return failure(std::move(value.error()));
     }
     if (value->dictionary() == nullptr) {
         return failed(

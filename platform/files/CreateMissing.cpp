@@ -19,58 +19,60 @@ namespace {
 
 constexpr std::size_t maximumLine = std::size_t{64} << 20U;  ///< bytes of a group with its members
 
-Error failure(const char* step, int number) {
-    return Error{"posix", number, std::string(step) + ": " + std::generic_category().message(number)};
+tl::unexpected<Error> failed(const char* step, int number) {
+    return failure(Error{"posix", number, std::string(step) + ": " + std::generic_category().message(number)});
 }
 
 /// Sets them through a descriptor, so that a link put in the directory's place is never followed.
-std::optional<Error> setOwnerAndMode(const std::string& path, const OwnerAndMode& ownerAndMode) {
+Result<void> setOwnerAndMode(const std::string& path, const OwnerAndMode& ownerAndMode) {
     const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
     if (!directory.isOpen()) {
-        return failure("cannot open the new directory", errno);
+        return failed("cannot open the new directory", errno);
     }
-    std::optional<Error> error;
+    Result<void> result;
     if (::fchmod(directory.get(), ownerAndMode.mode) != 0) {
-        error = failure("cannot set the mode", errno);
+        result = failed("cannot set the mode", errno);
     }
     if (::fchown(directory.get(), ownerAndMode.owner, ownerAndMode.group) != 0) {
-        error = failure("cannot set the owner", errno);
+        result = failed("cannot set the owner", errno);
     }
-    return error;
+    return result;
 }
 
 }  // namespace
 
-std::optional<Error> createDirectories(const DiskPath& path, const OwnerAndMode& ownerAndMode) {
-    std::optional<Error> error;
+Result<void> createDirectories(const DiskPath& path, const OwnerAndMode& ownerAndMode) {
+    Result<void> result;
     const std::string& whole = path.text();
     for (std::size_t end = whole.find('/', 1); !whole.empty(); end = whole.find('/', end + 1)) {
         const std::string part = whole.substr(0, end);
         if (::mkdir(part.c_str(), 0700) == 0) {
-            if (auto failed = setOwnerAndMode(part, ownerAndMode)) {
-                error = std::move(failed);
+            if (auto set = setOwnerAndMode(part, ownerAndMode); !set) {
+                result = std::move(set);
             }
         } else if (errno != EEXIST) {
-            return failure("cannot create the directory", errno);
+            return failed("cannot create the directory", errno);
         }
         if (end == std::string::npos) {
             break;
         }
     }
     struct stat status {};
-    if (!error && (::stat(whole.c_str(), &status) != 0 || !S_ISDIR(status.st_mode))) {
-        error = failure("cannot create the directory", ENOTDIR);
+    if (result && (::stat(whole.c_str(), &status) != 0 || !S_ISDIR(status.st_mode))) {
+        result = failed("cannot create the directory", ENOTDIR);
     }
-    return error;
+    return result;
 }
 
-std::optional<Error> createEmptyFile(const DiskPath& path) {
+Result<void> createEmptyFile(const DiskPath& path) {
     FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644));
     if (!file.isOpen() || ::fsync(file.get()) != 0) {
-        return failure("cannot create the file", errno);
+        return failed("cannot create the file", errno);
     }
-    const int number = file.close();
-    return number == 0 ? std::nullopt : std::optional(failure("cannot create the file", number));
+    if (const int number = file.close(); number != 0) {
+        return failed("cannot create the file", number);
+    }
+    return {};
 }
 
 std::optional<gid_t> groupIdOf(const char* name) {

@@ -29,9 +29,9 @@ namespace {
 constexpr std::size_t randomDigits = 16;
 constexpr const char* accessList = "system.posix_acl_access";
 
-Error failure(std::string_view step, const HostPath& path, int number) {
-    return Error{"posix", number,
-                 fmt::format("cannot {} {}: {}", step, path.text(), std::generic_category().message(number))};
+tl::unexpected<Error> failed(std::string_view step, const HostPath& path, int number) {
+    return failure(Error{"posix", number,
+                         fmt::format("cannot {} {}: {}", step, path.text(), std::generic_category().message(number))});
 }
 
 std::string temporaryPrefix(std::string_view name) {
@@ -225,42 +225,44 @@ int copyAttributes(int from, int to) {
 }
 
 /// Gives the temporary file all that the old one has besides its bytes.
-std::optional<Error> keepProperties(const FileDescriptor& old, const struct stat& status, int temporary,
-                                    const HostPath& path) {
+Result<void> keepProperties(const FileDescriptor& old, const struct stat& status, int temporary, const HostPath& path) {
     struct stat mine {};
     if (::fstat(temporary, &mine) != 0) {
-        return failure("look at temporary file for", path, errno);
+        return failed("look at temporary file for", path, errno);
     }
     if ((mine.st_uid != status.st_uid || mine.st_gid != status.st_gid) &&
         ::fchown(temporary, status.st_uid, status.st_gid) != 0) {
-        return failure("keep the owner of", path, errno);
+        return failed("keep the owner of", path, errno);
     }
     if (const int number = copyAttributes(old.get(), temporary); number != 0) {
-        return failure("keep the attributes of", path, number);
+        return failed("keep the attributes of", path, number);
     }
     if (::fchmod(temporary, status.st_mode & 07777U) != 0) {
-        return failure("keep the mode of", path, errno);
+        return failed("keep the mode of", path, errno);
     }
-    return std::nullopt;
+    return {};
 }
 
 /// Opens the file that is to be replaced. It stays empty, without an error, if the file does not exist or is a link.
-std::optional<Error> openOld(const FilePlace& place, const HostPath& path, FileDescriptor& old, struct stat& status) {
+Result<void> openOld(const FilePlace& place, const HostPath& path, FileDescriptor& old, struct stat& status) {
     if (::fstatat(place.directory.get(), place.name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
-        return errno == ENOENT ? std::nullopt : std::optional(failure("look at", path, errno));
+        if (errno == ENOENT) {
+            return {};
+        }
+        return failed("look at", path, errno);
     }
     if (S_ISLNK(status.st_mode)) {
-        return std::nullopt;
+        return {};
     }
     if (!S_ISREG(status.st_mode)) {
-        return failure("replace", path, S_ISDIR(status.st_mode) ? EISDIR : EINVAL);
+        return failed("replace", path, S_ISDIR(status.st_mode) ? EISDIR : EINVAL);
     }
     old = FileDescriptor(
         ::openat(place.directory.get(), place.name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     if (!old.isOpen() || ::fstat(old.get(), &status) != 0) {
-        return failure("open", path, errno);
+        return failed("open", path, errno);
     }
-    return std::nullopt;
+    return {};
 }
 
 /// Some file systems cannot flush a directory at all, and need not.
@@ -283,41 +285,41 @@ int giveName(const FilePlace& place, const std::string& name) noexcept {
 
 }  // namespace
 
-std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path, mode_t newMode) {
+Result<void> replaceFile(std::string_view bytes, const HostPath& path, mode_t newMode) {
     FilePlace place;
     if (const int number = openPlace(diskPath(path), place); number != 0) {
-        return failure("open the directory of", path, number);
+        return failed("open the directory of", path, number);
     }
     removeLeftoversIn(place);
     FileDescriptor old;
     struct stat status {};
-    if (auto error = openOld(place, path, old, status)) {
-        return error;
+    if (auto opened = openOld(place, path, old, status); !opened) {
+        return opened;
     }
     TemporaryFile temporary(place);
     if (const int number = temporary.create(); number != 0) {
-        return failure("create temporary file for", path, number);
+        return failed("create temporary file for", path, number);
     }
     if (const int number = temporary.write(bytes); number != 0) {
-        return failure("write temporary file for", path, number);
+        return failed("write temporary file for", path, number);
     }
     if (old.isOpen()) {
-        if (auto error = keepProperties(old, status, temporary.descriptor(), path)) {
-            return error;
+        if (auto kept = keepProperties(old, status, temporary.descriptor(), path); !kept) {
+            return kept;
         }
     } else if (::fchmod(temporary.descriptor(), newMode) != 0) {
-        return failure("set the mode of", path, errno);
+        return failed("set the mode of", path, errno);
     }
     if (const int number = temporary.flush(); number != 0) {
-        return failure("flush temporary file for", path, number);
+        return failed("flush temporary file for", path, number);
     }
     if (const int number = temporary.moveIntoPlace(); number != 0) {
-        return failure("replace", path, number);
+        return failed("replace", path, number);
     }
     if (const int number = flushDirectory(place); number != 0) {
-        return failure("flush the directory after replacing", path, number);
+        return failed("flush the directory after replacing", path, number);
     }
-    return std::nullopt;
+    return {};
 }
 
 void removeLeftovers(const HostPath& path) {
@@ -327,23 +329,17 @@ void removeLeftovers(const HostPath& path) {
     }
 }
 
-std::optional<HostPath> keepUnreadable(const HostPath& path, Error* error) {
-    const auto fail = [&](std::string_view step, int number) {
-        if (error != nullptr) {
-            *error = failure(step, path, number);
-        }
-        return std::nullopt;
-    };
+Result<HostPath> keepUnreadable(const HostPath& path) {
     FilePlace place;
     if (const int number = openPlace(diskPath(path), place); number != 0) {
-        return fail("open the directory of", number);
+        return failed("open the directory of", path, number);
     }
     struct stat status {};
     if (::fstatat(place.directory.get(), place.name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
-        return fail("look at", errno);
+        return failed("look at", path, errno);
     }
     if (!S_ISREG(status.st_mode) && !S_ISLNK(status.st_mode)) {
-        return fail("keep the unreadable", S_ISDIR(status.st_mode) ? EISDIR : EINVAL);
+        return failed("keep the unreadable", path, S_ISDIR(status.st_mode) ? EISDIR : EINVAL);
     }
     const std::time_t now = std::chrono::system_clock::to_time_t(std::chrono::system_clock::now());
     std::tm parts{};
@@ -357,14 +353,14 @@ std::optional<HostPath> keepUnreadable(const HostPath& path, Error* error) {
             continue;
         }
         if (number != 0) {
-            return fail("keep the unreadable", number);
+            return failed("keep the unreadable", path, number);
         }
         if (const int flushed = flushDirectory(place); flushed != 0) {
-            return fail("flush the directory after keeping", flushed);
+            return failed("flush the directory after keeping", path, flushed);
         }
         return HostPath(path.text() + ending);
     }
-    return fail("keep the unreadable", EEXIST);
+    return failed("keep the unreadable", path, EEXIST);
 }
 
 }  // namespace adminhost

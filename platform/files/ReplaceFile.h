@@ -4,9 +4,8 @@
 
 #include "platform/files/Path.h"
 #include "platform/framework/Export.h"
-#include "platform/value/Error.h"
+#include "platform/value/Result.h"
 
-#include <optional>
 #include <string_view>
 
 #include <sys/types.h>
@@ -28,8 +27,8 @@ namespace adminhost {
 /// Temporary files that killed processes left for the same file are removed first; those of running writers are not.
 /// Several processes may write the same file at once, also from machines that share the directory: one of them is the
 /// last.
-[[nodiscard]] ADMINHOST_EXPORT std::optional<Error> replaceFile(std::string_view bytes, const HostPath& path,
-                                                                mode_t newMode = 0644);
+[[nodiscard]] ADMINHOST_EXPORT Result<void> replaceFile(std::string_view bytes, const HostPath& path,
+                                                        mode_t newMode = 0644);
 
 /// Removes the temporary files that killed processes left for the file, as replaceFile() does before it writes. Those
 /// that cannot be removed stay.
@@ -38,8 +37,7 @@ ADMINHOST_EXPORT void removeLeftovers(const HostPath& path);
 /// Keeps a copy of a file that cannot be loaded before it is replaced: beside it, as PATH ".unreadable-" and the time
 /// ("2026-01-31T080000Z", UTC), with "-2" and so on after it if that name exists. The file stays in its place too, so
 /// that it is never missing. If it cannot have two names, or this process cannot read it at all, it is moved instead. A
-/// link is kept as a link; anything else than a file or link stays and is an error. Returns the new name; nullopt, with
-/// the error, if the file could not be kept.
-[[nodiscard]] ADMINHOST_EXPORT std::optional<HostPath> keepUnreadable(const HostPath& path, Error* error = nullptr);
+/// link is kept as a link; anything else than a file or link stays and is an error. Returns the new name.
+[[nodiscard]] ADMINHOST_EXPORT Result<HostPath> keepUnreadable(const HostPath& path);
 
 }  // namespace adminhost

@@ -19,21 +19,14 @@ Response Response::error(std::string_view code, std::string_view message) {
 }
 
 Response PluginRequestHandler::responseForError(std::string_view code) const {
-    struct Known {
-        std::string_view code;
-        std::string_view message;
-    };
-    constexpr Known known[] = {
-        {"CANNOT_START_SERVICE_ERR", "The service could not be started. Its startup log says why."},
-        {"CANNOT_STOP_SERVICE_ERR", "The service could not be stopped. Its log says why."},
-        {"INTERNAL_ERROR", "The operation failed inside the plug-in. The log lines of this request say why."},
-    };
-    for (const Known& entry : known) {
-        if (entry.code == code) {
-            return Response::error(code, entry.message);
-        }
+    return Response::error(code, messageForError(code));
+}
+
+std::string PluginRequestHandler::messageForError(std::string_view code) const {
+    if (code == "INTERNAL_ERROR") {
+        return "The operation failed inside the plug-in. The log lines of this request give the reason.";
     }
-    return Response::error(code, "The plug-in answered an error.");
+    return "The plug-in returned an error.";
 }
 
 const Value& userDefault(std::string_view name) noexcept {

@@ -44,6 +44,10 @@ class ADMINHOST_EXPORT PluginRequestHandler {
 
     /// The framework's standard error response for an error-code text.
     [[nodiscard]] Response responseForError(std::string_view code) const;
+
+  protected:
+    /// The sentence for people in that response. A handler overrides it for the codes of its own operations.
+    [[nodiscard]] virtual std::string messageForError(std::string_view code) const;
 };
 
 /// The process's user defaults: values of the daemon's configuration that plug-ins read. Null for an unknown name.

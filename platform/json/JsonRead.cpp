@@ -218,7 +218,7 @@ bool Builder::parse_error(std::size_t position, const std::string&, const Json::
 
 }  // namespace
 
-std::optional<Value> parseJson(std::string_view text, Error* error, std::size_t valuesMaximum) {
+Result<Value> parseJson(std::string_view text, std::size_t valuesMaximum) {
     const char* reached = text.data();
     Builder builder(valuesMaximum);
     if (Builder::Json::sax_parse(CountingIterator(text.data(), &reached),
@@ -228,19 +228,14 @@ std::optional<Value> parseJson(std::string_view text, Error* error, std::size_t 
         if (nul == std::string_view::npos) {
             return builder.take();
         }
-        if (error != nullptr) {
-            *error =
-                Error{"json", 1, lineAndColumnAfter(text.substr(0, nul)) + ": only white space may follow the value"};
-        }
-        return std::nullopt;
+        return failure(
+            Error{"json", 1, lineAndColumnAfter(text.substr(0, nul)) + ": only white space may follow the value"});
     }
-    if (error != nullptr) {
-        const std::size_t consumed = builder.position().value_or(static_cast<std::size_t>(reached - text.data()));
-        // The last character that was read is the offending one.
-        *error = Error{"json", builder.tooMany() ? jsonTooManyValues : 1,
-                       lineAndColumnAfter(text.substr(0, consumed == 0 ? 0 : consumed - 1)) + ": " + builder.problem()};
-    }
-    return std::nullopt;
+    const std::size_t consumed = builder.position().value_or(static_cast<std::size_t>(reached - text.data()));
+    // The last character that was read is the offending one.
+    return failure(
+        Error{"json", builder.tooMany() ? jsonTooManyValues : 1,
+              lineAndColumnAfter(text.substr(0, consumed == 0 ? 0 : consumed - 1)) + ": " + builder.problem()});
 }
 
 }  // namespace adminhost

@@ -24,14 +24,15 @@ constexpr std::size_t costOfValue = 8;
 /// failure stops everything.
 class BinaryReader {
   public:
-    BinaryReader(std::string_view bytes, Error& error, std::size_t valuesMaximum) noexcept
-        : _bytes(bytes), _error(error), _valuesMaximum(valuesMaximum) {}
+    BinaryReader(std::string_view bytes, std::size_t valuesMaximum) noexcept
+        : _bytes(bytes), _valuesMaximum(valuesMaximum) {}
 
-    std::optional<Value> parse() {
-        if (!readTrailer()) {
-            return std::nullopt;
+    Result<Value> parse() {
+        auto value = readTrailer() ? countedObject(_top, 0) : std::nullopt;
+        if (!value) {
+            return failure(std::move(_error));
         }
-        return countedObject(_top, 0);
+        return *std::move(value);
     }
 
   private:
@@ -313,7 +314,7 @@ class BinaryReader {
     }
 
     std::string_view _bytes;
-    Error& _error;
+    Error _error;  ///< why a reading function returned nullopt
     std::size_t _offsetSize = 0;
     std::size_t _referenceSize = 0;
     std::uint64_t _count = 0;
@@ -327,8 +328,8 @@ class BinaryReader {
 
 }  // namespace
 
-std::optional<Value> parseBinary(std::string_view bytes, Error& error, std::size_t valuesMaximum) {
-    return BinaryReader(bytes, error, valuesMaximum).parse();
+Result<Value> parseBinary(std::string_view bytes, std::size_t valuesMaximum) {
+    return BinaryReader(bytes, valuesMaximum).parse();
 }
 
 }  // namespace adminhost::plist

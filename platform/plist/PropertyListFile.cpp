@@ -9,38 +9,33 @@
 
 namespace adminhost {
 
-std::optional<Value> parsePropertyList(std::string_view bytes, Error* error, std::size_t valuesMaximum) {
-    Error ignored;
-    Error& place = error != nullptr ? *error : ignored;
+Result<Value> parsePropertyList(std::string_view bytes, std::size_t valuesMaximum) {
     if (bytes.size() > plistMaximumSize) {
-        place = plist::contentError(fmt::format("larger than {} bytes", plistMaximumSize));
-        return std::nullopt;
+        return failure(plist::contentError(fmt::format("larger than {} bytes", plistMaximumSize)));
     }
-    return bytes.starts_with("bplist") ? plist::parseBinary(bytes, place, valuesMaximum)
-                                       : plist::parseXml(bytes, place, valuesMaximum);
+    return bytes.starts_with("bplist") ? plist::parseBinary(bytes, valuesMaximum)
+                                       : plist::parseXml(bytes, valuesMaximum);
 }
 
-std::optional<Value> readPropertyList(const DiskPath& path, Error* error) {
-    const auto bytes = readFile(path, plistMaximumSize);
+Result<Value> readPropertyList(const DiskPath& path) {
+    auto bytes = readFile(path, plistMaximumSize);
     if (!bytes) {
-        if (error != nullptr) {
-            *error = bytes.error();
-        }
-        return std::nullopt;
+        return failure(std::move(bytes.error()));
     }
-    auto value = parsePropertyList(*bytes, error);
-    if (!value && error != nullptr) {
-        error->description = fmt::format("{}: {}", hostPath(path).text(), error->description.value_or(""));
+    auto value = parsePropertyList(*bytes);
+    if (!value) {
+        std::optional<std::string>& description = value.error().description;
+        description = fmt::format("{}: {}", hostPath(path).text(), description.value_or(""));
     }
     return value;
 }
 
-std::optional<Error> writePropertyList(const Value& value, const HostPath& path) {
-    Error error;
-    const auto text = xmlPropertyList(value, &error);
+Result<void> writePropertyList(const Value& value, const HostPath& path) {
+    auto text = xmlPropertyList(value);
     if (!text) {
-        error.description = fmt::format("cannot serialise {}: {}", path.text(), error.description.value_or(""));
-        return error;
+        std::optional<std::string>& description = text.error().description;
+        description = fmt::format("cannot serialise {}: {}", path.text(), description.value_or(""));
+        return failure(std::move(text.error()));
     }
     return replaceFile(*text, path);
 }

@@ -20,44 +20,45 @@
 namespace adminhost::plist {
 namespace {
 
-enum class Element { plist, dict, array, key, string, integer, real, date, data, true_, false_, unknown };
+enum class XmlElement { plist, dict, array, key, string, integer, real, date, data, true_, false_, unknown };
 
 constexpr std::array<std::string_view, 11> elementNames = {"plist", "dict", "array", "key",  "string", "integer",
                                                            "real",  "date", "data",  "true", "false"};
 
 /// Called for every element of a list: the first letter leaves one or two names to compare.
-Element elementOf(std::string_view name) noexcept {
-    const auto either = [&](Element element, Element other = Element::unknown) {
-        for (const Element candidate : {element, other}) {
-            if (candidate != Element::unknown && elementNames[static_cast<std::size_t>(candidate)] == name) {
+XmlElement elementOf(std::string_view name) noexcept {
+    const auto either = [&](XmlElement element, XmlElement other = XmlElement::unknown) {
+        for (const XmlElement candidate : {element, other}) {
+            if (candidate != XmlElement::unknown && elementNames[static_cast<std::size_t>(candidate)] == name) {
                 return candidate;
             }
         }
-        return Element::unknown;
+        return XmlElement::unknown;
     };
     switch (name.empty() ? '\0' : name.front()) {
         case 'k':
-            return either(Element::key);
+            return either(XmlElement::key);
         case 's':
-            return either(Element::string);
+            return either(XmlElement::string);
         case 'i':
-            return either(Element::integer);
+            return either(XmlElement::integer);
         case 'd':
-            return name.size() > 1 && name[1] == 'i' ? either(Element::dict) : either(Element::data, Element::date);
+            return name.size() > 1 && name[1] == 'i' ? either(XmlElement::dict)
+                                                     : either(XmlElement::data, XmlElement::date);
         case 't':
-            return either(Element::true_);
+            return either(XmlElement::true_);
         case 'f':
-            return either(Element::false_);
+            return either(XmlElement::false_);
         case 'a':
-            return either(Element::array);
+            return either(XmlElement::array);
         case 'r':
-            return either(Element::real);
+            return either(XmlElement::real);
         default:
-            return either(Element::plist);
+            return either(XmlElement::plist);
     }
 }
 
-std::string_view nameOf(Element element) noexcept {
+std::string_view nameOf(XmlElement element) noexcept {
     return elementNames.at(static_cast<std::size_t>(element));
 }
 
@@ -170,17 +171,17 @@ class XmlReader {
         ::explicit_bzero(_text.data(), _text.size());
     }
 
-    std::optional<Value> parse(std::string_view bytes, Error& error) {
+    Result<Value> parse(std::string_view bytes) {
         const auto status = ::XML_Parse(_parser.get(), bytes.data(), static_cast<int>(bytes.size()), XML_TRUE);
         if (_message.empty() && status != XML_STATUS_OK) {
             fail(::XML_ErrorString(::XML_GetErrorCode(_parser.get())));
         }
         if (!_message.empty()) {
-            error = contentError(std::move(_message));
+            Error error = contentError(std::move(_message));
             error.code = _values > _valuesMaximum ? plistTooManyValues : error.code;
-            return std::nullopt;
+            return failure(std::move(error));
         }
-        return std::move(_root);
+        return *std::move(_root);
     }
 
   private:
@@ -213,32 +214,32 @@ class XmlReader {
     }
 
     void begin(std::string_view name, const XML_Char** attributes) {
-        const Element element = elementOf(name);
-        if (element == Element::unknown) {
+        const XmlElement element = elementOf(name);
+        if (element == XmlElement::unknown) {
             return fail(fmt::format("unknown element <{}>", shortened(name)));
         }
         if (_leaf) {
             return fail(fmt::format("<{}> inside <{}>", name, nameOf(*_leaf)));
         }
         for (const XML_Char** attribute = attributes; *attribute != nullptr; attribute += 2) {
-            if (element != Element::plist || std::strcmp(attribute[0], "version") != 0) {
+            if (element != XmlElement::plist || std::strcmp(attribute[0], "version") != 0) {
                 return fail(fmt::format("<{}> with an unknown attribute {}", name, shortened(attribute[0])));
             }
             if (std::strcmp(attribute[1], "1.0") != 0) {
                 return fail(fmt::format("unknown version \"{}\"", shortened(attribute[1])));
             }
         }
-        if ((element == Element::plist) == _inPlist) {
+        if ((element == XmlElement::plist) == _inPlist) {
             return fail(_inPlist ? "<plist> inside <plist>" : fmt::format("<{}> instead of <plist>", name));
         }
-        if (element == Element::plist) {
+        if (element == XmlElement::plist) {
             _inPlist = true;
             return;
         }
         if (!mayStand(element)) {
             return;
         }
-        if (element != Element::dict && element != Element::array) {
+        if (element != XmlElement::dict && element != XmlElement::array) {
             _leaf = element;
             _text.clear();
             return;
@@ -246,24 +247,24 @@ class XmlReader {
         if (_containers.size() == static_cast<std::size_t>(plistMaximumDepth)) {
             return fail(fmt::format("nested more than {} deep", plistMaximumDepth));
         }
-        _containers.emplace_back().isDictionary = element == Element::dict;
+        _containers.emplace_back().isDictionary = element == XmlElement::dict;
     }
 
     /// Returns true if the element may come at this place; if not, sets the error.
-    bool mayStand(Element element) {
+    bool mayStand(XmlElement element) {
         if (_containers.empty()) {
-            if (_root || element == Element::key) {
+            if (_root || element == XmlElement::key) {
                 fail(_root ? "a second value in <plist>" : "<key> outside <dict>");
                 return false;
             }
             return true;
         }
         const Container& parent = _containers.back();
-        if (!parent.isDictionary && element == Element::key) {
+        if (!parent.isDictionary && element == XmlElement::key) {
             fail("<key> inside <array>");
-        } else if (parent.isDictionary && parent.hasKey && element == Element::key) {
+        } else if (parent.isDictionary && parent.hasKey && element == XmlElement::key) {
             fail(fmt::format("the key \"{}\" has no value", shortened(parent.key)));
-        } else if (parent.isDictionary && !parent.hasKey && element != Element::key) {
+        } else if (parent.isDictionary && !parent.hasKey && element != XmlElement::key) {
             fail(fmt::format("<{}> without a key", nameOf(element)));
         } else {
             return true;
@@ -294,26 +295,26 @@ class XmlReader {
         }
     }
 
-    void endLeaf(Element element) {
+    void endLeaf(XmlElement element) {
         std::optional<Value> value;
         switch (element) {
-            case Element::key:
+            case XmlElement::key:
                 _containers.back().key.swap(_text);
                 _containers.back().hasKey = true;
                 return;
-            case Element::string:
+            case XmlElement::string:
                 value = Value(_text);
                 break;
-            case Element::integer:
+            case XmlElement::integer:
                 value = integerOf(trimmed(_text));
                 break;
-            case Element::real:
+            case XmlElement::real:
                 value = realOf(trimmed(_text));
                 break;
-            case Element::date:
+            case XmlElement::date:
                 value = dateOf(trimmed(_text));
                 break;
-            case Element::data:
+            case XmlElement::data:
                 std::erase_if(_text, isWhiteSpace);
                 if (auto data = bytesOfBase64Text(_text)) {
                     value = Value(std::move(*data));
@@ -321,7 +322,7 @@ class XmlReader {
                 break;
             default:
                 if (_text.empty()) {
-                    value = Value(element == Element::true_);
+                    value = Value(element == XmlElement::true_);
                 }
         }
         if (!value) {
@@ -355,8 +356,8 @@ class XmlReader {
     std::unique_ptr<XML_ParserStruct, decltype(&::XML_ParserFree)> _parser;
     std::string _message;  ///< of the first error
     std::vector<Container> _containers;
-    std::optional<Element> _leaf;  ///< the open element that holds text
-    std::string _text;             ///< of that element
+    std::optional<XmlElement> _leaf;  ///< the open element that holds text
+    std::string _text;                ///< of that element
     std::optional<Value> _root;
     bool _inPlist = false;
     std::size_t _valuesMaximum;
@@ -365,11 +366,11 @@ class XmlReader {
 
 }  // namespace
 
-std::optional<Value> parseXml(std::string_view bytes, Error& error, std::size_t valuesMaximum) {
+Result<Value> parseXml(std::string_view bytes, std::size_t valuesMaximum) {
     using namespace std::string_view_literals;
     const bool bigEndian = bytes.starts_with("\xFE\xFF"sv) || bytes.starts_with("\0<"sv);
     if (!bigEndian && !bytes.starts_with("\xFF\xFE"sv) && !bytes.starts_with("<\0"sv)) {
-        return XmlReader(nullptr, valuesMaximum).parse(bytes, error);
+        return XmlReader(nullptr, valuesMaximum).parse(bytes);
     }
     // expat does not notice unpaired surrogates in UTF-16, so it gets the text in UTF-8.
     if (bytes.front() != '<' && bytes.front() != '\0') {
@@ -377,10 +378,9 @@ std::optional<Value> parseXml(std::string_view bytes, Error& error, std::size_t 
     }
     const FromUtf16 converted = utf8OfUtf16(bytes, bigEndian);
     if (converted.end < bytes.size()) {
-        error = contentError(lineAndColumnAfter(converted.text) + ": invalid UTF-16");
-        return std::nullopt;
+        return failure(contentError(lineAndColumnAfter(converted.text) + ": invalid UTF-16"));
     }
-    return XmlReader("UTF-8", valuesMaximum).parse(converted.text, error);
+    return XmlReader("UTF-8", valuesMaximum).parse(converted.text);
 }
 
 }  // namespace adminhost::plist

@@ -186,7 +186,7 @@ class XmlWriter {
 
 }  // namespace
 
-std::optional<std::string> xmlPropertyList(const Value& value, Error* error) {
+Result<std::string> xmlPropertyList(const Value& value) {
     XmlWriter writer;
     std::string what;
     if (!writer.write(value)) {
@@ -196,10 +196,7 @@ std::optional<std::string> xmlPropertyList(const Value& value, Error* error) {
     } else {
         return std::move(writer.text());
     }
-    if (error != nullptr) {
-        *error = plist::contentError(std::move(what));
-    }
-    return std::nullopt;
+    return failure(plist::contentError(std::move(what)));
 }
 
 }  // namespace adminhost

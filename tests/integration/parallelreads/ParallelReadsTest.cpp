@@ -19,8 +19,7 @@ TEST(ParallelReads, NoneOfTenThousandOfAWalDatabaseThatNobodyElseHasOpenFails) {
     StatementBatch batch(std::vector<std::string>(count, "select id from t"), 8);
     std::size_t failures = 0;
     for (std::size_t i = 0; i < count; ++i) {
-        std::optional<adminhost::Error> error;
-        const auto rows = batch.next(error);
+        const auto rows = batch.next();
         if (!rows || *rows != std::vector<adminhost::Dictionary>{{{"id", "7"}}}) {
             ++failures;
         }

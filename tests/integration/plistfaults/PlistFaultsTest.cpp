@@ -38,12 +38,12 @@ Value listOf(const std::string& word) {
 int writeBetweenMarks(const char* path, const char* word) {
     const Value list = listOf(word);
     test::markBegin();
-    const auto error = writePropertyList(list, HostPath(path));
+    const auto written = writePropertyList(list, HostPath(path));
     test::markEnd();
-    if (error) {
-        std::cerr << error->description.value_or("no description");
+    if (!written) {
+        std::cerr << written.error().description.value_or("no description");
     }
-    return error ? 1 : 0;
+    return written ? 0 : 1;
 }
 
 class PlistFaults : public testing::TestWithParam<bool> {
@@ -94,7 +94,7 @@ class PlistFaults : public testing::TestWithParam<bool> {
 
     /// The next write, undisturbed: it succeeds and leaves only the file.
     void writeAgain() const {
-        EXPECT_EQ(writePropertyList(listOf("newer"), HostPath(_file)), std::nullopt);
+        EXPECT_TRUE(writePropertyList(listOf("newer"), HostPath(_file)));
         EXPECT_TRUE(holds("newer"));
         EXPECT_EQ(temporaries(), 0);
     }

@@ -40,7 +40,7 @@ TEST_F(Unreadable, MissingTableOfCamerasIsNotExported) {
 
 TEST_F(Unreadable, AccessListsThatCannotBeReadAreNotExportedAsEmpty) {
     root.sql("alter table access_control_entries rename to gone");
-    exportFails("parts of the state could not be read:\n  an access list cannot be read (");
+    exportFails("parts of the state could not be read:\n  not read: the access list (");
     EXPECT_EQ(ctl({"plan", file("empty.toml", "")}).status, 1);
     EXPECT_EQ(ctl({"camera", "allow", "Main hall", "ben"}).status, 1);
     EXPECT_EQ(ctl({"settings", "set", "server_port", "8180"}).status, 0) << "which has nothing to do with them";

@@ -28,6 +28,7 @@ TEST_F(Reports, AreInTheRecordAndTheirNumbersInTheAnswersHeaders) {
     EXPECT_EQ(reply.status, 204);
     EXPECT_EQ(reply.headers.at("adminhost-changes"), "2");
     EXPECT_EQ(reply.headers.at("adminhost-not-done"), "1");
+    EXPECT_TRUE(daemon.waitForLog(" ms, changes: 2, not done: 1\n"));
     const Dictionary record = recordOf(reply);
     EXPECT_EQ(record.get("changes").array()->front(), Value(Dictionary{{"section", "cameras"},
                                                                        {"identity", "U0"},
@@ -38,7 +39,7 @@ TEST_F(Reports, AreInTheRecordAndTheirNumbersInTheAnswersHeaders) {
                                                                        {"undo", Dictionary{{"cameras", Array{}}}}}));
     EXPECT_EQ(sizeOf(record.get("changes")), 2U);
     EXPECT_EQ(record.get("notDone"), Value(Array{Dictionary{{"keyPath", "configuration.cameras.0"},
-                                                            {"reason", "The camera is not known."},
+                                                            {"reason", "not changed: camera not found"},
                                                             {"toolMessage", "no row"}}}));
     EXPECT_FALSE(record.contains("changesDropped"));
     EXPECT_FALSE(record.contains("notDoneDropped"));

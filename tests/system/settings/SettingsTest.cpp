@@ -276,7 +276,7 @@ TEST_F(Settings, WriteThatCanHaveNoEntryInTheHistoryIsCarriedOutAndReportsIt) {
     const Value record = valueOf(daemon.connect().get("/v1/requests/" + reply.headers.at("request-id")));
     const Array* parts = record.dictionary()->get("notDone").array();
     ASSERT_TRUE(parts != nullptr && parts->size() == 1U) << textOf(record);
-    EXPECT_EQ(parts->front().dictionary()->get("reason"), Value("The write has no entry in the history."));
+    EXPECT_EQ(parts->front().dictionary()->get("reason"), Value("the write has no entry in the history"));
     EXPECT_NE(parts->front().dictionary()->get("toolMessage"), Value(""));
 }
 

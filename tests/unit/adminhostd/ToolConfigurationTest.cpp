@@ -22,7 +22,7 @@ TEST(ToolConfiguration, DirectoryIsPrivateAndRemovedWithTheObject) {
     std::optional<ToolConfiguration> tools(std::in_place, fs::temp_directory_path().string());
     const fs::path directory = tools->directory();
     EXPECT_EQ(fs::status(directory).permissions(), fs::perms::owner_all);
-    ASSERT_FALSE(writeToolFiles(directory / "plugin", {{"tool/rc", "text\n"}}));
+    ASSERT_TRUE(writeToolFiles(directory / "plugin", {{"tool/rc", "text\n"}}));
     tools.reset();
     EXPECT_FALSE(fs::exists(directory));
 }
@@ -30,8 +30,8 @@ TEST(ToolConfiguration, DirectoryIsPrivateAndRemovedWithTheObject) {
 TEST(ToolConfiguration, FilesOfAnEarlierWorkerAreReplaced) {
     const ToolConfiguration tools(fs::temp_directory_path().string());
     const fs::path directory = fs::path(tools.directory()) / "plugin";
-    ASSERT_FALSE(writeToolFiles(directory, {{"tool/rc", "a longer text\n"}, {"other", "x"}}));
-    ASSERT_FALSE(writeToolFiles(directory, {{"tool/rc", "short\n"}}));
+    ASSERT_TRUE(writeToolFiles(directory, {{"tool/rc", "a longer text\n"}, {"other", "x"}}));
+    ASSERT_TRUE(writeToolFiles(directory, {{"tool/rc", "short\n"}}));
     EXPECT_EQ(contentOf(directory / "tool/rc"), "short\n");
     EXPECT_EQ(contentOf(directory / "other"), "x");
     EXPECT_EQ(fs::status(directory).permissions(), fs::perms::owner_all);
@@ -41,9 +41,9 @@ TEST(ToolConfiguration, PathOutsideTheDirectoryIsAnError) {
     const ToolConfiguration tools(fs::temp_directory_path().string());
     const fs::path directory = fs::path(tools.directory()) / "plugin";
     for (const char* const path : {"", "/etc/rc", "../rc", "tool/../../rc"}) {
-        const auto error = writeToolFiles(directory, {{path, "text"}});
-        ASSERT_TRUE(error) << path;
-        EXPECT_EQ(error->description, std::string(path) + ": is not a path below the directory");
+        const auto written = writeToolFiles(directory, {{path, "text"}});
+        ASSERT_FALSE(written) << path;
+        EXPECT_EQ(written.error().description, std::string(path) + ": is not a path below the directory");
     }
     EXPECT_FALSE(fs::exists(fs::path(tools.directory()) / "rc"));
 }
@@ -52,9 +52,9 @@ TEST(ToolConfiguration, FileThatCannotBeWrittenIsAnErrorThatNamesIt) {
     const ToolConfiguration tools(fs::temp_directory_path().string());
     const fs::path directory = fs::path(tools.directory()) / "plugin";
     fs::create_directories(directory / "rc");
-    const auto error = writeToolFiles(directory, {{"rc", "text"}});
-    ASSERT_TRUE(error);
-    EXPECT_EQ(error->description, (directory / "rc").string() + ": Is a directory");
+    const auto written = writeToolFiles(directory, {{"rc", "text"}});
+    ASSERT_FALSE(written);
+    EXPECT_EQ(written.error().description, (directory / "rc").string() + ": Is a directory");
 }
 
 }  // namespace

@@ -60,8 +60,8 @@ TEST_F(PluginTable, UnknownKeyOfAConfigurationIsReportedAsNotDone) {
     test::CapturedReports reports;
     static_cast<void>(
         plugin->perform("writeSettings", {{"configuration", Dictionary{{"server_prot", 4}, {"cameras", Array{}}}}}));
-    EXPECT_THAT(reports.parts, testing::Contains(NotDone{"configuration.server_prot",
-                                                         "The key is not known, so it was ignored.", ""}));
+    EXPECT_THAT(reports.parts,
+                testing::Contains(NotDone{"configuration.server_prot", "ignored: the key is not known", ""}));
 }
 
 TEST_F(PluginTable, CommandThatIsNotDescribedIsAnError) {

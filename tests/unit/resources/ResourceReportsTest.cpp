@@ -80,8 +80,9 @@ TEST_F(CameraReports, ToolThatFailsIsReportedWithItsWordsForEachEntryAndTheOther
         {"_id_", "C-7"},
         {"allowedUsersAndGroups", Array{Dictionary{{"type", "user"}, {"shortName", "x"}, {"_newid_", true}},
                                         Dictionary{{"type", "group"}, {"shortName", "editors"}, {"_newid_", true}}}}}});
-    EXPECT_THAT(reports.parts, ElementsAre(NotDone{"configuration.cameras.0.allowedUsersAndGroups.0",
-                                                   "the configuration tool failed with status 9", "no such user"}));
+    EXPECT_THAT(reports.parts,
+                ElementsAre(NotDone{"configuration.cameras.0.allowedUsersAndGroups.0",
+                                    "not added: the configuration tool failed with status 9", "no such user"}));
     ASSERT_EQ(reports.changes.size(), 1U);
     EXPECT_EQ(reports.changes[0].key, "groups");
     EXPECT_THAT(log.lines, IsEmpty());
@@ -92,12 +93,11 @@ TEST_F(CameraReports, FailedRemovalAndSwitchAreReportedOnce) {
     root.writeTool("/usr/bin/sqlite3", "#!/bin/sh\necho 'Error: busy' >&2; exit 5\n");
     process({Dictionary{{"_id_", "C-7"}, {"_obsoleteid_", true}},
              Dictionary{{"_id_", "C-8"}, {"access_control_enabled", true}}});
-    EXPECT_THAT(
-        reports.parts,
-        ElementsAre(NotDone{"configuration.cameras.0",
-                            "the camera was not removed: the configuration tool failed with status 3", "is recording"},
-                    NotDone{"configuration.cameras.1.access_control_enabled",
-                            "access control was not switched: the database refused it", "Error: busy"}));
+    EXPECT_THAT(reports.parts,
+                ElementsAre(NotDone{"configuration.cameras.0",
+                                    "not removed: the configuration tool failed with status 3", "is recording"},
+                            NotDone{"configuration.cameras.1.access_control_enabled",
+                                    "not changed: the database refused it", "Error: busy"}));
     EXPECT_THAT(reports.changes, IsEmpty());
 }
 
@@ -139,9 +139,8 @@ TEST_F(CameraReports, RemovalThatAFailingDirectoryCannotResolveIsReported) {
     useDirectory(std::nullopt);
     process({Dictionary{{"_id_", "C-7"},
                         {"allowedUsersAndGroups", Array{Dictionary{{"_id_", someUuid}, {"_obsoleteid_", true}}}}}});
-    EXPECT_THAT(reports.parts,
-                ElementsAre(NotDone{"configuration.cameras.0.allowedUsersAndGroups.0",
-                                    "the directory failed, so the entry was not removed", "the directory is away"}));
+    EXPECT_THAT(reports.parts, ElementsAre(NotDone{"configuration.cameras.0.allowedUsersAndGroups.0",
+                                                   "not removed: the directory failed", "the directory is away"}));
     EXPECT_THAT(calls(), IsEmpty());
 }
 
@@ -150,7 +149,8 @@ TEST_F(CameraReports, RemovalOfARecordWithoutANumericIdIsReported) {
     process({Dictionary{{"_id_", "C-7"},
                         {"allowedUsersAndGroups", Array{Dictionary{{"_id_", someUuid}, {"_obsoleteid_", true}}}}}});
     ASSERT_EQ(reports.parts.size(), 1U);
-    EXPECT_EQ(reports.parts[0].reason, "the directory has no user or group with the entry's \"_id_\" and a numeric id");
+    EXPECT_EQ(reports.parts[0].reason,
+              "not removed: the directory has no user or group with this UUID and a numeric id");
     EXPECT_THAT(calls(), IsEmpty());
 }
 
@@ -213,17 +213,15 @@ TEST_F(PropertyReports, PartsThatWereNotDoneAreReportedOnceEach) {
     const std::string path = "configuration.properties.0";
     EXPECT_THAT(
         reports.parts,
-        ElementsAre(NotDone{path, "nothing was changed: there is no such property", ""},
-                    NotDone{path, "nothing was changed: the entry has no \"_id_\"", ""},
-                    NotDone{path, "no property was removed: the entry has no \"_id_\"", ""},
-                    NotDone{path + ".name", "the property was not written: another one has this name", ""},
-                    NotDone{path + ".protect", "the stored value cannot be deciphered and stays as it is", ""},
-                    NotDone{path + ".protect",
-                            "the property was not written: its value cannot be protected without a usable key", ""},
-                    NotDone{path + ".value",
-                            "the property was not written: its value cannot be protected without a usable key", ""},
-                    NotDone{path, "the property was not changed: it could not be read", "Error: busy"},
-                    NotDone{path, "the property was not removed: the database refused it", "Error: busy"}));
+        ElementsAre(NotDone{path, "not changed: property not found", ""},
+                    NotDone{path, "not changed: the entry has no \"_id_\"", ""},
+                    NotDone{path, "not removed: the entry has no \"_id_\"", ""},
+                    NotDone{path + ".name", "not written: another property has this name", ""},
+                    NotDone{path + ".protect", "not changed: the stored value cannot be deciphered", ""},
+                    NotDone{path + ".protect", "not written: the value cannot be protected without a usable key", ""},
+                    NotDone{path + ".value", "not written: the value cannot be protected without a usable key", ""},
+                    NotDone{path, "not changed: the property cannot be read", "Error: busy"},
+                    NotDone{path, "not removed: the database refused it", "Error: busy"}));
 }
 
 }  // namespace

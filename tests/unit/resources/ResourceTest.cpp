@@ -47,6 +47,14 @@ TEST_F(ResourceTest, RowBecomesARecordWithDatesAndIdentity) {
     EXPECT_EQ(record->get("used_at"), Value(5));
 }
 
+TEST_F(ResourceTest, AQueryWritesTheErrorOnlyIfItFails) {
+    error = adminhost::Error{"earlier", 77, std::nullopt};
+    EXPECT_TRUE(Camera::querySorvaneDatabase<Dictionary>("select 1", error));
+    EXPECT_EQ(error, (adminhost::Error{"earlier", 77, std::nullopt}));
+    EXPECT_FALSE(Camera::querySorvaneDatabase<Dictionary>("select * from missing", error));
+    EXPECT_EQ(error->domain, "sqliteQuery");
+}
+
 TEST_F(ResourceTest, RowWithoutUuidHasNoIdentity) {
     const auto camera = Camera::initWithDictionary(Dictionary{{"id", "1"}});
     EXPECT_FALSE(camera->data()->contains("_id_"));

@@ -18,16 +18,11 @@ namespace lumio {
 namespace {
 
 using adminhost::Dictionary;
-using adminhost::Error;
 using namespace std::chrono_literals;
 
 constexpr std::string_view database = "/Library/SorvaneProducer/Shared/Server/db.sqlite3";
 
-struct Outcome {
-    std::optional<std::vector<Dictionary>> rows;
-    std::optional<Error> error;
-    bool operator==(const Outcome&) const = default;
-};
+using Outcome = adminhost::Result<std::vector<Dictionary>>;
 
 // The tool records its statement, sleeps for the statement's number, and does what the statement's word names.
 class StatementBatchTest : public testing::Test {
@@ -61,8 +56,7 @@ printf '   id = %s\nvalue = %s\n' "$2" "$1"
     static std::vector<Outcome> inTurn(const std::vector<std::string>& list) {
         std::vector<Outcome> outcomes;
         for (const std::string& statement : list) {
-            Outcome& outcome = outcomes.emplace_back();
-            outcome.rows = runStatement(statement, outcome.error);
+            outcomes.push_back(runStatement(statement));
         }
         return outcomes;
     }
@@ -70,7 +64,7 @@ printf '   id = %s\nvalue = %s\n' "$2" "$1"
         StatementBatch batch(list, atOnce);
         std::vector<Outcome> outcomes(list.size());
         for (Outcome& outcome : outcomes) {
-            outcome.rows = batch.next(outcome.error);
+            outcome = batch.next();
         }
         return outcomes;
     }
@@ -128,10 +122,10 @@ TEST_F(StatementBatchTest, AKilledAndAFailingToolCostOnlyTheirOwnStatements) {
     list[5] = "failing 5";
     const std::vector<Outcome> outcomes = inBatch(list, 4);
     EXPECT_EQ(outcomes, inTurn(list));
-    ASSERT_TRUE(outcomes[2].error);
-    EXPECT_EQ(outcomes[2].error->code, 128 + 9);
-    ASSERT_TRUE(outcomes[5].error);
-    EXPECT_EQ(outcomes[5].error->description, "Can't execute sqlite3 query: Error: no such table\n");
+    ASSERT_FALSE(outcomes[2]);
+    EXPECT_EQ(outcomes[2].error().code, 128 + 9);
+    ASSERT_FALSE(outcomes[5]);
+    EXPECT_EQ(outcomes[5].error().description, "Can't execute sqlite3 query: Error: no such table\n");
 }
 
 TEST_F(StatementBatchTest, ADeadlineInTheMiddleEndsTheRunningToolsAndStartsNoFurther) {
@@ -143,15 +137,15 @@ TEST_F(StatementBatchTest, ADeadlineInTheMiddleEndsTheRunningToolsAndStartsNoFur
     const std::vector<Outcome> outcomes = inBatch(list, 2);
     EXPECT_LT(std::chrono::steady_clock::now() - begin, 20s);  // the tools would take a minute
     for (std::size_t i = 0; i < 4; ++i) {
-        EXPECT_TRUE(outcomes[i].rows) << i;
+        EXPECT_TRUE(outcomes[i]) << i;
     }
     for (const std::size_t i : {4U, 5U}) {
-        ASSERT_TRUE(outcomes[i].error);
-        EXPECT_EQ(outcomes[i].error->code, 128 + 9);
+        ASSERT_FALSE(outcomes[i]);
+        EXPECT_EQ(outcomes[i].error().code, 128 + 9);
     }
     for (const std::size_t i : {6U, 7U}) {
-        ASSERT_TRUE(outcomes[i].error);
-        EXPECT_EQ(outcomes[i].error->code, -1);
+        ASSERT_FALSE(outcomes[i]);
+        EXPECT_EQ(outcomes[i].error().code, -1);
     }
     EXPECT_THAT(begun(), testing::UnorderedElementsAre("row 0", "row 1", "row 2", "row 3", "hanging 4", "hanging 5"));
 }
@@ -160,7 +154,7 @@ TEST_F(StatementBatchTest, ALockedDatabaseIsTriedAgainAlone) {
     std::vector<std::string> list = statements(6);
     list[1] = "locked 1";
     const std::vector<Outcome> outcomes = inBatch(list, 3);
-    EXPECT_EQ(outcomes[1].rows, (std::vector<Dictionary>{{{"id", "1"}, {"value", "locked"}}}));
+    EXPECT_EQ(outcomes[1], (std::vector<Dictionary>{{{"id", "1"}, {"value", "locked"}}}));
     // No other tool was running during the second try.
     const std::vector<std::string> lines = calls();
     const auto first = std::find(lines.begin(), lines.end(), "locked 1");
@@ -173,24 +167,23 @@ TEST_F(StatementBatchTest, ALockedDatabaseIsTriedAgainAlone) {
 
 TEST_F(StatementBatchTest, ADatabaseThatStaysLockedIsReported) {
     const std::vector<Outcome> outcomes = inBatch({"row 0", "always 1", "row 2"}, 2);
-    EXPECT_TRUE(outcomes[0].rows);
-    ASSERT_TRUE(outcomes[1].error);
-    EXPECT_EQ(outcomes[1].error->code, 5);
-    EXPECT_TRUE(outcomes[2].rows);
+    EXPECT_TRUE(outcomes[0]);
+    ASSERT_FALSE(outcomes[1]);
+    EXPECT_EQ(outcomes[1].error().code, 5);
+    EXPECT_TRUE(outcomes[2]);
     EXPECT_THAT(begun(), testing::UnorderedElementsAre("row 0", "always 1", "always 1", "row 2"));
 }
 
 TEST_F(StatementBatchTest, OneAtATimeNeverTriesAgain) {
     const std::vector<Outcome> outcomes = inBatch({"always 0", "always 1"}, 1);
-    EXPECT_EQ(outcomes[0].error->code, 5);
+    EXPECT_EQ(outcomes[0].error().code, 5);
     EXPECT_EQ(begun(), (std::vector<std::string>{"always 0", "always 1"}));
 }
 
 TEST_F(StatementBatchTest, AnAbandonedBatchLeavesNoToolRunning) {
     {
         StatementBatch batch({"row 0", "hanging 1"}, 2);
-        std::optional<Error> error;
-        static_cast<void>(batch.next(error));
+        static_cast<void>(batch.next());
         while (!std::filesystem::exists(root.path("/process"))) {
             std::this_thread::sleep_for(10ms);
         }

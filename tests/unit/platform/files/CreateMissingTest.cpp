@@ -43,9 +43,9 @@ class CreateMissing : public testing::Test {
 
 TEST_F(CreateMissing, EveryMissingDirectoryGetsTheAttributesWhateverTheUmask) {
     const mode_t before = ::umask(0077);
-    const auto error = createDirectories(path("a/b/c"), _mine);
+    const auto created = createDirectories(path("a/b/c"), _mine);
     ::umask(before);
-    EXPECT_EQ(error, std::nullopt);
+    EXPECT_TRUE(created);
     for (const char* name : {"a", "a/b", "a/b/c"}) {
         EXPECT_EQ(modeOf(name), fs::perms(0751)) << name;
     }
@@ -54,48 +54,48 @@ TEST_F(CreateMissing, EveryMissingDirectoryGetsTheAttributesWhateverTheUmask) {
 TEST_F(CreateMissing, DirectoryThatExistsKeepsItsOwn) {
     fs::create_directory(_directory / "a");
     fs::permissions(_directory / "a", fs::perms(0700));
-    EXPECT_EQ(createDirectories(path("a/b"), _mine), std::nullopt);
-    EXPECT_EQ(createDirectories(path("a/b"), {::geteuid(), ::getegid(), 0700}), std::nullopt);
+    EXPECT_TRUE(createDirectories(path("a/b"), _mine));
+    EXPECT_TRUE(createDirectories(path("a/b"), {::geteuid(), ::getegid(), 0700}));
     EXPECT_EQ(modeOf("a"), fs::perms(0700));
     EXPECT_EQ(modeOf("a/b"), fs::perms(0751));
 }
 
 TEST_F(CreateMissing, FileInTheWayIsAnErrorWithTheSystemsText) {
-    ASSERT_EQ(createEmptyFile(path("file")), std::nullopt);
+    ASSERT_TRUE(createEmptyFile(path("file")));
     for (const char* name : {"file", "file/below"}) {
-        const auto error = createDirectories(path(name), _mine);
-        ASSERT_TRUE(error) << name;
-        EXPECT_EQ(error->code, ENOTDIR);
-        EXPECT_EQ(error->description, "cannot create the directory: Not a directory");
+        const auto created = createDirectories(path(name), _mine);
+        ASSERT_FALSE(created) << name;
+        EXPECT_EQ(created.error().code, ENOTDIR);
+        EXPECT_EQ(created.error().description, "cannot create the directory: Not a directory");
     }
 }
 
 TEST_F(CreateMissing, OwnerIsSetByTheSuperuserAndForOthersAnErrorThatLeavesTheDirectory) {
-    const auto error = createDirectories(path("a"), {4711, 4712, 0755});
+    const auto created = createDirectories(path("a"), {4711, 4712, 0755});
     EXPECT_EQ(modeOf("a"), fs::perms(0755));
     struct stat status {};
     ASSERT_EQ(::stat(path("a").c_str(), &status), 0);
     if (::geteuid() == 0) {
-        EXPECT_EQ(error, std::nullopt);
+        EXPECT_TRUE(created);
         EXPECT_EQ(status.st_uid, 4711U);
         EXPECT_EQ(status.st_gid, 4712U);
     } else {
-        ASSERT_TRUE(error);
-        EXPECT_EQ(error->description, "cannot set the owner: Operation not permitted");
+        ASSERT_FALSE(created);
+        EXPECT_EQ(created.error().description, "cannot set the owner: Operation not permitted");
         EXPECT_EQ(status.st_uid, ::geteuid());
     }
 }
 
 TEST_F(CreateMissing, EmptyFileIsCreatedOnceAndNeverThroughALink) {
-    EXPECT_EQ(createEmptyFile(path("file")), std::nullopt);
+    EXPECT_TRUE(createEmptyFile(path("file")));
     EXPECT_EQ(fs::file_size(_directory / "file"), 0U);
     std::ofstream(_directory / "file") << "text";
-    EXPECT_EQ(createEmptyFile(path("file"))->code, EEXIST);
+    EXPECT_EQ(createEmptyFile(path("file")).error().code, EEXIST);
     EXPECT_EQ(fs::file_size(_directory / "file"), 4U);
     fs::create_symlink("elsewhere", _directory / "link");
-    EXPECT_EQ(createEmptyFile(path("link"))->code, EEXIST);
+    EXPECT_EQ(createEmptyFile(path("link")).error().code, EEXIST);
     EXPECT_FALSE(fs::exists(_directory / "elsewhere"));
-    EXPECT_THAT(*createEmptyFile(path("none/file"))->description, HasSubstr("No such file or directory"));
+    EXPECT_THAT(*createEmptyFile(path("none/file")).error().description, HasSubstr("No such file or directory"));
 }
 
 TEST_F(CreateMissing, GroupIsFoundInTheAccountFilesBelowTheRoot) {

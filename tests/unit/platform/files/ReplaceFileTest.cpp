@@ -64,7 +64,7 @@ class ReplaceFile : public testing::Test {
         }
         return all;
     }
-    [[nodiscard]] std::optional<Error> replace(std::string_view bytes, const std::string& name = "file") const {
+    [[nodiscard]] Result<void> replace(std::string_view bytes, const std::string& name = "file") const {
         return replaceFile(bytes, HostPath(path(name)));
     }
     static std::string attribute(const std::string& path, const char* name) {
@@ -79,7 +79,7 @@ class ReplaceFile : public testing::Test {
 
 TEST_F(ReplaceFile, NewFileIs0644WhateverTheUmask) {
     const mode_t before = ::umask(077);
-    EXPECT_EQ(replace("bytes"), std::nullopt);
+    EXPECT_TRUE(replace("bytes"));
     ::umask(before);
     EXPECT_EQ(read(), "bytes");
     EXPECT_EQ(modeOf(), 0644U);
@@ -90,7 +90,7 @@ TEST_F(ReplaceFile, ModeOfTheOldFileIsKept) {
     for (const mode_t mode : {0600U, 0640U, 0666U, 0755U, 0444U}) {
         fs::remove(path());
         write("file", "old", mode);
-        EXPECT_EQ(replace("new"), std::nullopt);
+        EXPECT_TRUE(replace("new"));
         EXPECT_EQ(read(), "new");
         EXPECT_EQ(modeOf(), mode);
     }
@@ -102,7 +102,7 @@ TEST_F(ReplaceFile, OwnerOfTheOldFileIsKept) {
     const bool given = ::chown(path().c_str(), 33, 44) == 0;
     const struct stat before = statusOf();
     EXPECT_EQ(before.st_uid, given ? 33 : ::geteuid());
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_EQ(statusOf().st_uid, before.st_uid);
     EXPECT_EQ(statusOf().st_gid, before.st_gid);
     EXPECT_EQ(modeOf(), 0640U);
@@ -112,7 +112,7 @@ TEST_F(ReplaceFile, OwnerOfTheOldFileIsKept) {
 TEST_F(ReplaceFile, ExtendedAttributesAreKept) {
     write("file", "old");
     ASSERT_EQ(::setxattr(path().c_str(), "user.note", "kept\0x", 6, 0), 0) << "needs a file system with attributes";
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_EQ(attribute(path(), "user.note"), std::string("kept\0x", 6));
     EXPECT_EQ(read(), "new");
 }
@@ -133,7 +133,7 @@ TEST_F(ReplaceFile, AccessControlListIsKept) {
               0)
         << "needs a file system with access control lists";
     const mode_t mode = modeOf();
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_EQ(attribute(path(), "system.posix_acl_access"), accessListBytes);
     EXPECT_EQ(modeOf(), mode);
 }
@@ -143,7 +143,7 @@ TEST_F(ReplaceFile, ListThatTheDirectoryGivesNewFilesDoesNotReachAFileWithoutOne
     ASSERT_EQ(::setxattr(_dir.c_str(), "system.posix_acl_default", accessListBytes.data(), accessListBytes.size(), 0),
               0)
         << "needs a file system with access control lists";
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_EQ(attribute(path(), "system.posix_acl_access"), "none");
     EXPECT_EQ(modeOf(), 0640U);
 }
@@ -151,7 +151,7 @@ TEST_F(ReplaceFile, ListThatTheDirectoryGivesNewFilesDoesNotReachAFileWithoutOne
 TEST_F(ReplaceFile, LinkInTheFilesPlaceIsReplacedAndItsTargetUntouched) {
     write("target", "target", 0600);
     fs::create_symlink("target", path());
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_TRUE(S_ISREG(statusOf().st_mode));
     EXPECT_EQ(modeOf(), 0644U);
     EXPECT_EQ(read("target"), "target");
@@ -161,57 +161,57 @@ TEST_F(ReplaceFile, LinkInTheFilesPlaceIsReplacedAndItsTargetUntouched) {
 TEST_F(ReplaceFile, OtherNamesOfTheFileKeepTheOldBytes) {
     write("file", "old");
     fs::create_hard_link(path(), path("other"));
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_EQ(read("other"), "old");
 }
 
 TEST_F(ReplaceFile, DirectoryInTheFilesPlaceIsAnError) {
     fs::create_directory(path());
-    const auto error = replace("new");
-    ASSERT_TRUE(error);
-    EXPECT_EQ(*error, (Error{"posix", EISDIR, "cannot replace " + path() + ": Is a directory"}));
+    const auto written = replace("new");
+    ASSERT_FALSE(written);
+    EXPECT_EQ(written.error(), (Error{"posix", EISDIR, "cannot replace " + path() + ": Is a directory"}));
     EXPECT_THAT(names(), ElementsAre("file"));
 }
 
 TEST_F(ReplaceFile, PipeInTheFilesPlaceIsAnErrorAndNotWaitedFor) {
     ASSERT_EQ(::mkfifo(path().c_str(), 0600), 0);
-    const auto error = replace("new");
-    ASSERT_TRUE(error);
-    EXPECT_EQ(error->code, EINVAL);
+    const auto written = replace("new");
+    ASSERT_FALSE(written);
+    EXPECT_EQ(written.error().code, EINVAL);
     EXPECT_THAT(names(), ElementsAre("file"));
 }
 
 TEST_F(ReplaceFile, MissingDirectoryIsAnErrorThatNamesTheHostPath) {
     setSystemRoot(_dir);
-    const auto error = replaceFile("new", HostPath("/Server/cluster_preferences.plist"));
-    ASSERT_TRUE(error);
-    EXPECT_EQ(*error,
+    const auto written = replaceFile("new", HostPath("/Server/cluster_preferences.plist"));
+    ASSERT_FALSE(written);
+    EXPECT_EQ(written.error(),
               (Error{"posix", ENOENT,
                      "cannot open the directory of /Server/cluster_preferences.plist: No such file or directory"}));
 }
 
 TEST_F(ReplaceFile, PathsThatNameNoFileAreErrors) {
     for (const std::string bad : {"/", "", "/tmp/", "/tmp/..", "/tmp/."}) {
-        const auto error = replaceFile("x", HostPath(bad));
-        ASSERT_TRUE(error) << bad;
-        EXPECT_EQ(error->code, EINVAL) << bad;
+        const auto written = replaceFile("x", HostPath(bad));
+        ASSERT_FALSE(written) << bad;
+        EXPECT_EQ(written.error().code, EINVAL) << bad;
     }
-    EXPECT_TRUE(replaceFile("x", HostPath(std::string("/tmp/a\0b", 8))));
+    EXPECT_FALSE(replaceFile("x", HostPath(std::string("/tmp/a\0b", 8))));
 }
 
 TEST_F(ReplaceFile, FileInTheDirectorysPlaceIsAnError) {
     write("file", "old");
-    const auto error = replace("new", "file/name");
-    ASSERT_TRUE(error);
-    EXPECT_EQ(error->code, ENOTDIR);
+    const auto written = replace("new", "file/name");
+    ASSERT_FALSE(written);
+    EXPECT_EQ(written.error().code, ENOTDIR);
     EXPECT_EQ(read(), "old");
 }
 
 TEST_F(ReplaceFile, NameTooLongForItsTemporaryFileIsAnError) {
-    const auto error = replace("new", std::string(250, 'x'));
-    ASSERT_TRUE(error);
-    EXPECT_EQ(error->code, ENAMETOOLONG);
-    EXPECT_THAT(error->description.value_or(""), testing::StartsWith("cannot create temporary file for "));
+    const auto written = replace("new", std::string(250, 'x'));
+    ASSERT_FALSE(written);
+    EXPECT_EQ(written.error().code, ENAMETOOLONG);
+    EXPECT_THAT(written.error().description.value_or(""), testing::StartsWith("cannot create temporary file for "));
     EXPECT_TRUE(names().empty());
 }
 
@@ -222,9 +222,9 @@ TEST_F(ReplaceFile, FullDiskLeavesTheOldFileAndNoTemporary) {
         (void)::signal(SIGXFSZ, SIG_IGN);
         const rlimit limit{100'000, 100'000};
         ::setrlimit(RLIMIT_FSIZE, &limit);
-        const auto error = replace(std::string(1'000'000, 'x'));
+        const auto written = replace(std::string(1'000'000, 'x'));
         const std::string expected = "cannot write temporary file for " + path() + ": File too large";
-        ::_exit(error && error->code == EFBIG && error->description == expected ? 0 : 1);
+        ::_exit(!written && written.error().code == EFBIG && written.error().description == expected ? 0 : 1);
     }
     int status = -1;
     ASSERT_EQ(::waitpid(pid, &status, 0), pid);
@@ -236,7 +236,7 @@ TEST_F(ReplaceFile, FullDiskLeavesTheOldFileAndNoTemporary) {
 TEST_F(ReplaceFile, LeftoversOfKilledWritersAreRemoved) {
     write("file", "old");
     write(_leftover, "half", 0600);
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_THAT(names(), ElementsAre("file"));
 }
 
@@ -256,7 +256,7 @@ TEST_F(ReplaceFile, LeftoversOfOtherFilesAndLikeNamesStay) {
     for (const std::string& name : others) {
         write(name, "x");
     }
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     std::set<std::string> expected = others;
     expected.insert("file");
     EXPECT_EQ(names(), expected);
@@ -266,10 +266,10 @@ TEST_F(ReplaceFile, TemporaryFileOfALivingWriterStays) {
     write(_leftover, "being written", 0600);
     const int writer = ::open(path(_leftover).c_str(), O_WRONLY | O_CLOEXEC);
     ASSERT_EQ(::flock(writer, LOCK_EX), 0);
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_THAT(names(), UnorderedElementsAre("file", _leftover));
     ::close(writer);
-    EXPECT_EQ(replace("newer"), std::nullopt);
+    EXPECT_TRUE(replace("newer"));
     EXPECT_THAT(names(), ElementsAre("file"));
 }
 
@@ -282,7 +282,7 @@ TEST_F(ReplaceFile, WritersAtTheSameTimeNeverTakeEachOthersFilesForLeftovers) {
     for (int writer = 0; writer < writers; ++writer) {
         threads.emplace_back([&, bytes = std::string(5000, static_cast<char>('a' + writer))] {
             for (int i = 0; i < times; ++i) {
-                failures += replace(bytes) ? 1 : 0;
+                failures += replace(bytes) ? 0 : 1;
             }
         });
     }
@@ -297,7 +297,7 @@ TEST_F(ReplaceFile, WritersAtTheSameTimeNeverTakeEachOthersFilesForLeftovers) {
 TEST_F(ReplaceFile, LinkNamedLikeALeftoverHarmsNothing) {
     write("target", "target");
     fs::create_symlink("target", path(_leftover));
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_EQ(read("target"), "target");
 }
 
@@ -305,9 +305,9 @@ TEST_F(ReplaceFile, LinkOnTheWayIsFollowedWhereOnlyWeCanHavePutIt) {
     fs::create_directory(path("real"));
     fs::create_symlink("real", path("relative"));
     fs::create_symlink(path("real"), path("absolute"));
-    EXPECT_EQ(replace("1", "relative/file"), std::nullopt);
+    EXPECT_TRUE(replace("1", "relative/file"));
     EXPECT_EQ(read("real/file"), "1");
-    EXPECT_EQ(replace("2", "absolute/../real//./file"), std::nullopt);
+    EXPECT_TRUE(replace("2", "absolute/../real//./file"));
     EXPECT_EQ(read("real/file"), "2");
 }
 
@@ -317,21 +317,21 @@ TEST_F(ReplaceFile, LinkOnTheWayInADirectoryThatOthersMayWriteIsRefused) {
     fs::create_symlink(path("elsewhere"), path("shared/Server"));
     for (const mode_t mode : {0777U, 0775U, 01777U}) {
         ASSERT_EQ(::chmod(path("shared").c_str(), mode), 0);
-        const auto error = replace("x", "shared/Server/file");
-        ASSERT_TRUE(error);
-        EXPECT_EQ(error->code, ELOOP);
+        const auto written = replace("x", "shared/Server/file");
+        ASSERT_FALSE(written);
+        EXPECT_EQ(written.error().code, ELOOP);
     }
     EXPECT_TRUE(fs::is_empty(path("elsewhere")));
     ASSERT_EQ(::chmod(path("shared").c_str(), 0755), 0);
-    EXPECT_EQ(replace("x", "shared/Server/file"), std::nullopt);
+    EXPECT_TRUE(replace("x", "shared/Server/file"));
 }
 
 TEST_F(ReplaceFile, LinksInACircleAreAnError) {
     fs::create_symlink("b", path("a"));
     fs::create_symlink("a", path("b"));
-    const auto error = replace("x", "a/file");
-    ASSERT_TRUE(error);
-    EXPECT_EQ(error->code, ELOOP);
+    const auto written = replace("x", "a/file");
+    ASSERT_FALSE(written);
+    EXPECT_EQ(written.error().code, ELOOP);
 }
 
 TEST_F(ReplaceFile, RelativePathIsBelowTheCurrentDirectory) {
@@ -341,8 +341,8 @@ TEST_F(ReplaceFile, RelativePathIsBelowTheCurrentDirectory) {
     const auto plain = replaceFile("1", HostPath("file"));
     const auto below = replaceFile("2", HostPath("sub/file"));
     fs::current_path(before);
-    EXPECT_EQ(plain, std::nullopt);
-    EXPECT_EQ(below, std::nullopt);
+    EXPECT_TRUE(plain);
+    EXPECT_TRUE(below);
     EXPECT_EQ(read(), "1");
     EXPECT_EQ(read("sub/file"), "2");
 }
@@ -350,10 +350,10 @@ TEST_F(ReplaceFile, RelativePathIsBelowTheCurrentDirectory) {
 TEST_F(ReplaceFile, NoDescriptorIsLeft) {
     const auto open = [] { return std::distance(fs::directory_iterator("/proc/self/fd"), fs::directory_iterator{}); };
     const auto before = open();
-    EXPECT_EQ(replace("1"), std::nullopt);
-    EXPECT_EQ(replace("2"), std::nullopt);
-    EXPECT_TRUE(replace("3", "missing/file"));
-    EXPECT_TRUE(replace("3", "file/file"));
+    EXPECT_TRUE(replace("1"));
+    EXPECT_TRUE(replace("2"));
+    EXPECT_FALSE(replace("3", "missing/file"));
+    EXPECT_FALSE(replace("3", "file/file"));
     EXPECT_EQ(open(), before);
 }
 
@@ -366,7 +366,7 @@ TEST_F(ReplaceFile, UnreadableFileIsKeptBesideUnderADatedNameAndStaysInPlace) {
                 testing::MatchesRegex("[.]unreadable-[0-9]{4}-[0-9]{2}-[0-9]{2}T[0-9]{6}Z"));
     EXPECT_EQ(read(fs::path(kept->text()).filename()), "garbage");
     EXPECT_EQ(read(), "garbage");
-    EXPECT_EQ(replace("new"), std::nullopt);
+    EXPECT_TRUE(replace("new"));
     EXPECT_EQ(modeOf(), 0640U);
     EXPECT_EQ(read(fs::path(kept->text()).filename()), "garbage");
 }
@@ -392,12 +392,13 @@ TEST_F(ReplaceFile, UnreadableLinkIsKeptAsALink) {
 }
 
 TEST_F(ReplaceFile, NothingOrADirectoryCannotBeKept) {
-    Error error;
-    EXPECT_FALSE(keepUnreadable(HostPath(path()), &error));
-    EXPECT_EQ(error, (Error{"posix", ENOENT, "cannot look at " + path() + ": No such file or directory"}));
+    const auto missing = keepUnreadable(HostPath(path()));
+    ASSERT_FALSE(missing);
+    EXPECT_EQ(missing.error(), (Error{"posix", ENOENT, "cannot look at " + path() + ": No such file or directory"}));
     fs::create_directory(path());
-    EXPECT_FALSE(keepUnreadable(HostPath(path()), &error));
-    EXPECT_EQ(error.code, EISDIR);
+    const auto directory = keepUnreadable(HostPath(path()));
+    ASSERT_FALSE(directory);
+    EXPECT_EQ(directory.error().code, EISDIR);
     EXPECT_THAT(names(), ElementsAre("file"));
 }
 

@@ -29,7 +29,7 @@ TEST(Response, EmptyDictionaryIsNotNothing) {
 
 TEST(PluginRequestHandler, ErrorResponseHasCodeAndASentence) {
     const PluginRequestHandler handler;
-    for (const char* code : {"CANNOT_START_SERVICE_ERR", "CANNOT_STOP_SERVICE_ERR", "INTERNAL_ERROR"}) {
+    for (const char* code : {"INTERNAL_ERROR", "SOMETHING_ELSE"}) {
         const Response response = handler.responseForError(code);
         EXPECT_EQ(response.kind(), Response::Kind::error);
         EXPECT_EQ(response.dictionary().get("error"), Value(code));
@@ -43,7 +43,18 @@ TEST(PluginRequestHandler, UnknownCodeIsKeptInItsErrorResponse) {
     const Response response = PluginRequestHandler().responseForError("SOMETHING_ELSE");
     EXPECT_EQ(response.kind(), Response::Kind::error);
     EXPECT_EQ(response.dictionary(),
-              (Dictionary{{"error", "SOMETHING_ELSE"}, {"message", "The plug-in answered an error."}}));
+              (Dictionary{{"error", "SOMETHING_ELSE"}, {"message", "The plug-in returned an error."}}));
+}
+
+TEST(PluginRequestHandler, HandlerHasSentencesForItsOwnCodes) {
+    class Handler final : public PluginRequestHandler {
+        [[nodiscard]] std::string messageForError(std::string_view code) const override {
+            return code == "DOOR_LOCKED" ? "The door is locked." : PluginRequestHandler::messageForError(code);
+        }
+    };
+    EXPECT_EQ(Handler().responseForError("DOOR_LOCKED").dictionary(),
+              (Dictionary{{"error", "DOOR_LOCKED"}, {"message", "The door is locked."}}));
+    EXPECT_EQ(Handler().responseForError("OTHER").dictionary().get("message"), Value("The plug-in returned an error."));
 }
 
 TEST(UserDefaults, UnknownNameIsNull) {

@@ -38,14 +38,13 @@ std::string realBytes(double number) {
 }
 
 std::string errorOf(std::string_view bytes) {
-    Error error;
-    return parsePropertyList(bytes, &error) ? "accepted" : error.description.value_or("");
+    const auto value = parsePropertyList(bytes);
+    return value ? "accepted" : value.error().description.value_or("");
 }
 
 Value valueOf(std::string_view bytes) {
-    Error error;
-    auto value = parsePropertyList(bytes, &error);
-    EXPECT_TRUE(value) << error.description.value_or("");
+    auto value = parsePropertyList(bytes);
+    EXPECT_TRUE(value) << value.error().description.value_or("");
     return value.value_or(nullptr);
 }
 
@@ -245,11 +244,11 @@ TEST(BinaryReader, ObjectsThatMultiplyThemselvesAreRefused) {
 TEST(BinaryReader, NumberOfValuesIsBoundedByTheCallerHoweverOftenOneObjectStands) {
     // A dictionary whose key is a list of three texts, which is not a valid key.
     const std::string bytes = binary({"\xD1\x01\x02"s, "\x51k"s, "\xA3\x01\x01\x01"s});
-    EXPECT_TRUE(parsePropertyList(bytes, nullptr, 5));
-    Error error;
-    EXPECT_FALSE(parsePropertyList(bytes, &error, 4));
-    EXPECT_EQ(error.code, plistTooManyValues);
-    EXPECT_THAT(error.description.value_or(""), testing::EndsWith(": there are more than 4 values"));
+    EXPECT_TRUE(parsePropertyList(bytes, 5));
+    const auto tooMany = parsePropertyList(bytes, 4);
+    ASSERT_FALSE(tooMany);
+    EXPECT_EQ(tooMany.error().code, plistTooManyValues);
+    EXPECT_THAT(tooMany.error().description.value_or(""), testing::EndsWith(": there are more than 4 values"));
 }
 
 TEST(BinaryReader, ReferencesAndOffsetsToNothingAreRefused) {

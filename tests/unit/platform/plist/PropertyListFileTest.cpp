@@ -11,9 +11,9 @@ using namespace adminhost;
 class PropertyListFile : public PlistTest {
   protected:
     [[nodiscard]] Error readError(const std::string& name) const {
-        Error error;
-        EXPECT_FALSE(readPropertyList(DiskPath(path(name)), &error));
-        return error;
+        const auto value = readPropertyList(DiskPath(path(name)));
+        EXPECT_FALSE(value);
+        return value ? Error() : value.error();
     }
     void TearDown() override {
         setSystemRoot("/");
@@ -23,14 +23,14 @@ class PropertyListFile : public PlistTest {
 
 TEST_F(PropertyListFile, WrittenListIsReadAgain) {
     const Value value = Dictionary{{"shared_filesystem", "/Library/à"}, {"n", UINT64_MAX}};
-    EXPECT_EQ(writePropertyList(value, HostPath(path("a.plist"))), std::nullopt);
+    EXPECT_TRUE(writePropertyList(value, HostPath(path("a.plist"))));
     EXPECT_EQ(readPropertyList(DiskPath(path("a.plist"))), value);
     EXPECT_EQ(readBytes("a.plist"), xmlPropertyList(value));
 }
 
 TEST_F(PropertyListFile, IsWrittenBelowTheSystemRoot) {
     setSystemRoot(_dir);
-    EXPECT_EQ(writePropertyList(1, HostPath("/a.plist")), std::nullopt);
+    EXPECT_TRUE(writePropertyList(1, HostPath("/a.plist")));
     EXPECT_EQ(readPropertyList(diskPath(HostPath("/a.plist"))), Value(1));
     EXPECT_TRUE(std::filesystem::exists(path("a.plist")));
 }
@@ -47,9 +47,9 @@ TEST_F(PropertyListFile, ContentErrorNamesFileAndPlace) {
     EXPECT_EQ(readError("bad"),
               (Error{"propertyList", 1, path("bad") + ": line 4, column 1: the key \"a\" has no value"}));
     setSystemRoot(_dir);
-    Error error;
-    EXPECT_FALSE(readPropertyList(diskPath(HostPath("/bad")), &error));
-    EXPECT_EQ(error.description, "/bad: line 4, column 1: the key \"a\" has no value");
+    const auto value = readPropertyList(diskPath(HostPath("/bad")));
+    ASSERT_FALSE(value);
+    EXPECT_EQ(value.error().description, "/bad: line 4, column 1: the key \"a\" has no value");
 }
 
 TEST_F(PropertyListFile, NothingButRegularFilesIsRead) {
@@ -60,7 +60,7 @@ TEST_F(PropertyListFile, NothingButRegularFilesIsRead) {
 }
 
 TEST_F(PropertyListFile, LinkToAFileIsRead) {
-    ASSERT_EQ(writePropertyList("x", HostPath(path("file"))), std::nullopt);
+    ASSERT_TRUE(writePropertyList("x", HostPath(path("file"))));
     std::filesystem::create_symlink("file", path("link"));
     EXPECT_EQ(readPropertyList(DiskPath(path("link"))), Value("x"));
 }
@@ -77,10 +77,10 @@ TEST_F(PropertyListFile, FileOf64MiBPassesAndOneByteMoreIsRefused) {
 }
 
 TEST_F(PropertyListFile, ValueThatCannotBeSerialisedLeavesTheOldFile) {
-    ASSERT_EQ(writePropertyList("old", HostPath(path("a.plist"))), std::nullopt);
-    const auto error = writePropertyList(Dictionary{{"k", Array{Value()}}}, HostPath(path("a.plist")));
-    ASSERT_TRUE(error);
-    EXPECT_EQ(error->description, "cannot serialise " + path("a.plist") + ": k.0: null cannot be written");
+    ASSERT_TRUE(writePropertyList("old", HostPath(path("a.plist"))));
+    const auto written = writePropertyList(Dictionary{{"k", Array{Value()}}}, HostPath(path("a.plist")));
+    ASSERT_FALSE(written);
+    EXPECT_EQ(written.error().description, "cannot serialise " + path("a.plist") + ": k.0: null cannot be written");
     EXPECT_EQ(readPropertyList(DiskPath(path("a.plist"))), Value("old"));
 }
 

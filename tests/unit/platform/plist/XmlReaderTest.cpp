@@ -19,31 +19,31 @@ std::string plist(const std::string& content) {
 
 /// The error's description; "accepted" if there was none.
 std::string errorOf(std::string_view bytes) {
-    Error error;
-    if (parsePropertyList(bytes, &error)) {
+    const auto value = parsePropertyList(bytes);
+    if (value) {
         return "accepted";
     }
-    EXPECT_EQ(error.domain, "propertyList");
-    EXPECT_EQ(error.code, 1);
-    return error.description.value_or("");
+    EXPECT_EQ(value.error().domain, "propertyList");
+    EXPECT_EQ(value.error().code, 1);
+    return value.error().description.value_or("");
 }
 
 Value valueOf(std::string_view bytes) {
-    Error error;
-    auto value = parsePropertyList(bytes, &error);
-    EXPECT_TRUE(value) << error.description.value_or("");
+    auto value = parsePropertyList(bytes);
+    EXPECT_TRUE(value) << value.error().description.value_or("");
     return value.value_or(nullptr);
 }
 
 TEST(XmlReader, NumberOfValuesIsBoundedByTheCaller) {
     const std::string text = "<plist><dict><key>a</key><array><true/><true/></array></dict></plist>";
-    EXPECT_TRUE(parsePropertyList(text, nullptr, 4));
-    Error error;
-    EXPECT_FALSE(parsePropertyList(text, &error, 3));
-    EXPECT_EQ(error.code, plistTooManyValues);
-    EXPECT_EQ(error.description, "line 1, column 55: there are more than 3 values");
-    EXPECT_FALSE(parsePropertyList("<plist>", &error, 3));
-    EXPECT_EQ(error.code, 1);
+    EXPECT_TRUE(parsePropertyList(text, 4));
+    const auto tooMany = parsePropertyList(text, 3);
+    ASSERT_FALSE(tooMany);
+    EXPECT_EQ(tooMany.error(),
+              (Error{"propertyList", plistTooManyValues, "line 1, column 55: there are more than 3 values"}));
+    const auto broken = parsePropertyList("<plist>", 3);
+    ASSERT_FALSE(broken);
+    EXPECT_EQ(broken.error().code, 1);
 }
 
 TEST(XmlReader, ReadsEveryType) {
