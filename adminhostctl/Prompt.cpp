@@ -18,7 +18,7 @@ namespace {
 
 constexpr std::size_t maximumSize = std::size_t{64} << 20U;
 
-struct CloseFile {
+struct CloseSource {
     void operator()(std::FILE* file) const noexcept { static_cast<void>(std::fclose(file)); }
 };
 
@@ -106,7 +106,7 @@ std::string readSource(const std::string& path) {
         throw usageError("standard input can be read only once; use a file for the other value");
     }
     inputWasRead = inputWasRead || isInput;
-    const std::unique_ptr<std::FILE, CloseFile> opened(isInput ? nullptr : std::fopen(path.c_str(), "rbe"));
+    const std::unique_ptr<std::FILE, CloseSource> opened(isInput ? nullptr : std::fopen(path.c_str(), "rbe"));
     std::FILE* const file = isInput ? stdin : opened.get();
     if (file == nullptr) {
         throw usageError(path + ": " + std::strerror(errno));

@@ -234,7 +234,7 @@ Value encoded(T message) {
 }
 
 /// Reads members out of their encoding. Keeps the name of the first that is missing or wrong.
-class Decoder {
+class MessageDecoder {
   public:
     [[nodiscard]] const std::string& problem() const noexcept { return _problem; }
     bool fail(std::string problem) {
@@ -410,7 +410,7 @@ Frame encodedFrame(auto message) {
 
 /// Fills the alternative of the frame's type; returns false if no alternative has that type.
 template <class T>
-bool decodeAs(Frame& frame, auto& message, Decoder& decoder, bool& fits) {
+bool decodeAs(Frame& frame, auto& message, MessageDecoder& decoder, bool& fits) {
     if (frame.type != typeOf<T>) {
         return false;
     }
@@ -430,7 +430,7 @@ bool decodeAs(Frame& frame, auto& message, Decoder& decoder, bool& fits) {
 template <class... Ts>
 Result<std::variant<Ts...>> decoded(Frame& frame) {
     std::variant<Ts...> message;
-    Decoder decoder;
+    MessageDecoder decoder;
     bool fits = false;
     if (!(decodeAs<Ts>(frame, message, decoder, fits) || ...)) {
         return failure({"protocol", 1, "a message of this type is not for this side"});

@@ -81,7 +81,7 @@ std::string_view nameOf(KeyType type) noexcept {
     return names[static_cast<std::size_t>(type)];
 }
 
-Change changeOf(const Dictionary& values, const EntryDescription& entry) {
+EntryEffect effectOf(const Dictionary& values, const EntryDescription& entry) {
     const auto isSet = [&](std::string_view flag) {
         const Value& value = values.get(flag);
         return !flag.empty() && (entry.leadingZeros ? adminhost::flagOf(value) : adminhost::booleanOf(value));
@@ -89,7 +89,7 @@ Change changeOf(const Dictionary& values, const EntryDescription& entry) {
     const bool added = isSet(entry.addedBy);
     const bool removed = isSet(entry.removedBy);
     if (removed && !(added && entry.addedFirst)) {
-        return changeRemoved;
+        return effectRemoved;
     }
     if (!added) {
         return entry.otherwise;
@@ -98,7 +98,7 @@ Change changeOf(const Dictionary& values, const EntryDescription& entry) {
     const bool known = entry.addedKinds.empty() ||
                        (kind != nullptr && std::any_of(entry.addedKinds.begin(), entry.addedKinds.end(),
                                                        [&](std::string_view k) { return equalWithoutCase(k, *kind); }));
-    return known ? changeAdded : changeNothing;
+    return known ? effectAdded : effectNothing;
 }
 
 /// Walks a configuration along its description and collects the key paths that the description does not name.
@@ -121,7 +121,7 @@ class UnknownKeys {
 
   private:
     void dictionary(const Dictionary& values, const KeyDescription& key, const std::string& path) {
-        if (key.entry != nullptr && changeOf(values, *key.entry) == changeNothing) {
+        if (key.entry != nullptr && effectOf(values, *key.entry) == effectNothing) {
             return;  // it is only for display, as reading returned it
         }
         for (const adminhost::DictionaryEntry& entry : values) {
@@ -151,25 +151,25 @@ class Check {
 
     void dictionary(const Dictionary& values, std::span<const KeyDescription> keys, const EntryDescription* entry,
                     const std::string& path) {
-        const Change change = entry != nullptr ? changeOf(values, *entry) : changeChanged;
+        const EntryEffect effect = entry != nullptr ? effectOf(values, *entry) : effectChanged;
         for (const KeyDescription& key : keys) {
             const Value* value = values.find(key.name);
-            if (value == nullptr || !isRead(key, values, change)) {
+            if (value == nullptr || !isRead(key, values, effect)) {
                 continue;
             }
             this->value(*value, key, entry, path.empty() ? std::string(key.name) : path + '.' + std::string(key.name));
         }
-        if (entry != nullptr && (change & (changeAdded | changeChanged)) != 0) {
+        if (entry != nullptr && (effect & (effectAdded | effectChanged)) != 0) {
             together(values, *entry, path);
         }
     }
 
   private:
-    static bool isRead(const KeyDescription& key, const Dictionary& values, Change change) {
-        if ((key.readFor & change) == 0) {
+    static bool isRead(const KeyDescription& key, const Dictionary& values, EntryEffect effect) {
+        if ((key.readFor & effect) == 0) {
             return false;
         }
-        return key.with.empty() || change != changeChanged ||
+        return key.with.empty() || effect != effectChanged ||
                std::any_of(key.with.begin(), key.with.end(), [&](std::string_view other) {
                    const Value* value = values.find(other);
                    return value != nullptr && !(value->array() != nullptr && value->array()->empty());

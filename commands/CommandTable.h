@@ -32,7 +32,7 @@ enum Rule : std::uint8_t {
 };
 
 /// The effect of a change entry. Bits, so that a key can name those for which it is read.
-enum Change : std::uint8_t { changeNothing = 1U, changeAdded = 2U, changeRemoved = 4U, changeChanged = 8U };
+enum EntryEffect : std::uint8_t { effectNothing = 1U, effectAdded = 2U, effectRemoved = 4U, effectChanged = 8U };
 
 /// The flags by which a list's elements choose their effect.
 struct EntryDescription {
@@ -40,7 +40,7 @@ struct EntryDescription {
     std::string_view removedBy;                    ///< the flag of a removal; empty when there are none
     bool addedFirst;                               ///< which flag counts when both are set
     bool leadingZeros;                             ///< a flag "01" is true
-    Change otherwise;                              ///< what an entry without flags does
+    EntryEffect otherwise;                         ///< what an entry without flags does
     std::span<const std::string_view> addedKinds;  ///< additions of another "type" do nothing; empty: there is no type
     std::span<const std::string_view> columns;     ///< of the table that the entries change
     std::span<const std::string_view> together;    ///< keys whose texts are in one statement
@@ -50,7 +50,7 @@ struct KeyDescription {
     std::string_view name;  ///< "[]" for a list's elements
     KeyType type;
     std::uint8_t rules;                        ///< Rule bits
-    std::uint8_t readFor;                      ///< Change bits; only told apart within change entries
+    std::uint8_t readFor;                      ///< EntryEffect bits; only told apart within change entries
     std::span<const std::string_view> with;    ///< read only if the same changed entry has one of these
     std::span<const KeyDescription> children;  ///< keys of a dictionary, or the one element description of a list
     const EntryDescription* entry;             ///< for a dictionary that is a change entry, else null

@@ -1,12 +1,12 @@
 #!/usr/bin/python3
-"""Reads the command descriptions of this directory and writes what is made from them.
+"""Generates the tables and the reference page from the command descriptions in this directory.
 
     generate.py table OUT.cpp   the tables of CommandTable.h
     generate.py docs OUT.md     the reference of the commands
     generate.py check OUT.md    status 1, with a message, unless OUT.md is what docs would write
 
-A description that is not right (an unknown word, a key whose parent is not described, an example that does not fit) is
-an error with the file's name.
+A faulty description (an unknown word, a key whose parent is not described, an example that does not fit) is an error that
+names the file.
 """
 
 import base64
@@ -37,7 +37,7 @@ RULE_TEXTS = {
     "short_names": "all names together at most 1.5 MB",
     "one_line": "no line feed",
 }
-CHANGES = {"added": "changeAdded", "removed": "changeRemoved", "changed": "changeChanged", "ignored": "changeNothing"}
+EFFECTS = {"added": "effectAdded", "removed": "effectRemoved", "changed": "effectChanged", "ignored": "effectNothing"}
 UNITS = ["bytes", "megabytes", "seconds", "minutes", "people"]
 
 ACCESS = {
@@ -84,7 +84,7 @@ def check_keys(keys, words, what, names):
         need(key.get("type") in TYPES, f"{where}: type must be one of {TYPES}")
         need(key.get("entered_as", "text") in TYPES, f"{where}: unknown entered_as")
         need(set(key.get("rules", [])) <= set(RULES), f"{where}: unknown rule")
-        need(set(key.get("for", [])) <= set(CHANGES), f"{where}: unknown change")
+        need(set(key.get("for", [])) <= set(EFFECTS), f"{where}: unknown change")
         need(key.get("unit", "bytes") in UNITS, f"{where}: unknown unit")
         need(all(isinstance(key.get(word, 0), int) for word in ("minimum", "maximum")), f"{where}: not a whole number")
         need(key.get("minimum", 0) <= key.get("maximum", key.get("minimum", 0)), f"{where}: minimum is above maximum")
@@ -295,7 +295,7 @@ class Table:
             quoted(entry.get("removed_by", "")),
             "true" if entry.get("first", "removed") == "added" else "false",
             "true" if entry.get("leading_zeros") else "false",
-            CHANGES[entry.get("otherwise", "changed")],
+            EFFECTS[entry.get("otherwise", "changed")],
             self.texts(entry.get("added_kinds")),
             self.texts(entry.get("columns")),
             self.texts(entry.get("together")),
@@ -311,7 +311,7 @@ class Table:
                 continue
             children = self.keys(keys, path)
             rules = " | ".join(RULES[rule] for rule in key.get("rules", [])) or "0"
-            changes = " | ".join(CHANGES[change] for change in key.get("for", CHANGES))
+            changes = " | ".join(EFFECTS[effect] for effect in key.get("for", EFFECTS))
             rows.append(f"{{{quoted(split(path)[-1])}, KeyType::{key['type']}, {rules}, {changes}, "
                         f"{self.texts(key.get('with'))}, {children}, {self.entry(key.get('entry'))}}}")
         if not rows:
@@ -353,7 +353,7 @@ def table(commands):
     tokens = out.tokens([describe(name, command) for name, command in commands.items()])
     out.lines.append("constexpr DescriptionToken tokens[] = {\n    " + ",\n    ".join(tokens) + ",\n};")
     return (
-        "// Made from commands/*.toml by commands/generate.py.\n\n"
+        "// Generated from commands/*.toml by commands/generate.py.\n\n"
         '#include "commands/CommandTable.h"\n\n'
         "namespace lumio {\nnamespace {\n\n" + "\n".join(out.lines) + "\n\n}  // namespace\n\n"
         "std::span<const CommandDescription> commands() noexcept { return table; }\n"
@@ -378,7 +378,7 @@ def key_rows(keys):
         if key.get("allowed"):
             notes.append("One of " + ", ".join(f"`{word}`" for word in key["allowed"]) + ".")
         if key.get("required"):
-            notes.append("Needed.")
+            notes.append("Required.")
         if key.get("secret"):
             notes.append("Secret.")
         for rule in key.get("rules", []):
@@ -402,10 +402,10 @@ def to_json(value):
 def docs(commands):
     out = [
         "# Commands", "",
-        "Made from `commands/*.toml` by `commands/generate.py docs docs/commands.md`; change those, not this page.", "",
-        "Lists are written `name[]`; a dictionary's keys follow after a dot. A key that is \"needed\" is answered for by",
-        "the command itself when it is missing. Where a check is named, a request that does not pass it is refused",
-        "whole, before anything is changed.", "",
+        "Generated from `commands/*.toml` by `commands/generate.py docs docs/commands.md`; change those, not this page.", "",
+        "Lists are written `name[]`; a dictionary's keys follow after a dot. If a required key is missing, the command",
+        "itself returns an error. A request that fails one of the checks named here is rejected as a whole, before anything",
+        "is changed.", "",
         "| command | what it does |", "|---|---|",
     ]
     out += [f"| [`{name}`](#{name.lower()}) | {cell(command['summary'])} |" for name, command in commands.items()]
@@ -413,21 +413,21 @@ def docs(commands):
         described = describe(name, command)
         out += ["", f"## {name}", "", command.get("description", command["summary"]).strip(), ""]
         notes = [text for flag, text in (
-            ("shows_revision", "Its answer carries the settings' revision."),
-            ("takes_revision", "It can be made to depend on the revision that was read."),
+            ("shows_revision", "The answer has the revision of the settings."),
+            ("takes_revision", "A client can make it depend on the revision that it has read."),
         ) if command.get(flag)]
         notes.insert(0, f"Access: {command['access']}. {ACCESS[command['access']]}")
         if command.get("needs"):
             notes.append(f"It needs the service's {' and '.join(command['needs'])}.")
         if command.get("deadline_seconds"):
-            notes.append(f"It is ended after {command['deadline_seconds']} seconds.")
+            notes.append(f"Time limit: {command['deadline_seconds']} seconds.")
         out += [" ".join(notes), ""]
         if described["keys"]:
             out += ["| key | type | |", "|---|---|---|"] + key_rows(described["keys"]) + [""]
         if described["answer"]:
             out += ["| answer | type | |", "|---|---|---|"] + key_rows(described["answer"]) + [""]
         else:
-            out += ["It answers nothing.", ""]
+            out += ["The answer is empty.", ""]
         if described["errors"]:
             out += ["| error | meaning |", "|---|---|"]
             out += [f"| `{error.get('key', error.get('code'))}` | {cell(error['meaning'])} |" for error in described["errors"]]

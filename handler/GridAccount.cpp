@@ -36,7 +36,7 @@ struct Order {
 };
 
 /// What was created.
-struct Account {
+struct NewAccount {
     std::string name;
     std::string password;
 };
@@ -156,7 +156,7 @@ Result<std::string> createAccount(DirectoryNode& node, const std::string& name, 
     return password;
 }
 
-Result<Account> carryOut(const Order& order) {
+Result<NewAccount> carryOut(const Order& order) {
     const auto node = adminhost::DirectorySession::defaultSession().openNode(order.node);
     if (!node) {
         return adminhost::failure(node.error());
@@ -181,7 +181,7 @@ Result<Account> carryOut(const Order& order) {
     if (!password) {
         return adminhost::failure(password.error());
     }
-    return Account{std::move(name), *std::move(password)};
+    return NewAccount{std::move(name), *std::move(password)};
 }
 
 }  // namespace
@@ -189,7 +189,7 @@ Result<Account> carryOut(const Order& order) {
 Response LumioRequestHandler::createNimboAccountWithRequest(const Dictionary& request) {
     Dictionary answer{{"command", "createNimboAccount"}};
     const auto order = orderIn(request);
-    auto account = order ? carryOut(*order) : Result<Account>(adminhost::failure(order.error()));
+    auto account = order ? carryOut(*order) : Result<NewAccount>(adminhost::failure(order.error()));
     if (account) {
         answer.set("username", std::move(account->name));
         answer.set("password", std::move(account->password));

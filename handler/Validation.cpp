@@ -21,7 +21,7 @@ namespace {
 constexpr std::string_view touchFile = "/__adminhost_lumio_touch_file";
 constexpr std::string_view touchFileContent = "This file should not be sticking around.\n";
 
-enum Outcome : std::uint32_t { usable = 0, notADirectory = 1, notCreated = 2, ownerNotSet = 3, notRemoved = 4 };
+enum CheckedStep : std::uint32_t { usable = 0, notADirectory = 1, notCreated = 2, ownerNotSet = 3, notRemoved = 4 };
 
 /// The user id of an account, as the directory has it. A name of digits only is a name too.
 std::optional<uid_t> userIdOf(const std::string& name) {

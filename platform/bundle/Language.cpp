@@ -11,7 +11,7 @@
 namespace adminhost {
 namespace {
 
-struct Tag {
+struct LanguageTag {
     std::string canonical;  ///< all the given parts, in canonical spelling
     std::string language;
     std::string script;      ///< given or likely
@@ -89,7 +89,7 @@ bool isCode(std::string_view text) {
     return letters < text.size() || letters == 2 || *uloc_getISO3Language(plainName(text).c_str()) != '\0';
 }
 
-std::optional<Tag> tagOf(std::string_view nameOrCode) {
+std::optional<LanguageTag> tagOf(std::string_view nameOrCode) {
     std::string code(nameOrCode);
     if (!isCode(nameOrCode)) {
         const auto found = codesByName().find(plainName(nameOrCode));
@@ -104,7 +104,7 @@ std::optional<Tag> tagOf(std::string_view nameOrCode) {
     if (U_FAILURE(status) || locale.isBogus() || *locale.getLanguage() == '\0') {
         return std::nullopt;
     }
-    Tag tag;
+    LanguageTag tag;
     // Norwegian without more is its written standard Bokmål.
     const std::string_view language = locale.getLanguage();
     tag.language = language == "no" ? "nb" : language;
@@ -122,7 +122,7 @@ std::optional<Tag> tagOf(std::string_view nameOrCode) {
 
 struct Candidate {
     std::string spelling;
-    std::optional<Tag> tag;
+    std::optional<LanguageTag> tag;
 };
 
 std::vector<Candidate> candidatesOf(const std::vector<std::string>& localizations) {
@@ -136,11 +136,11 @@ std::vector<Candidate> candidatesOf(const std::vector<std::string>& localization
 
 enum Rank { sameSpelling, sameTag, sameLikelyTag, withoutRegion, otherRegion, noMatch };
 
-Rank rankOf(const Candidate& candidate, std::string_view spelling, const std::optional<Tag>& wanted) {
+Rank rankOf(const Candidate& candidate, std::string_view spelling, const std::optional<LanguageTag>& wanted) {
     if (candidate.spelling == spelling) {
         return sameSpelling;
     }
-    const std::optional<Tag>& tag = candidate.tag;
+    const std::optional<LanguageTag>& tag = candidate.tag;
     if (!tag || !wanted || tag->language != wanted->language || tag->script != wanted->script) {
         return noMatch;
     }
@@ -156,7 +156,7 @@ Rank rankOf(const Candidate& candidate, std::string_view spelling, const std::op
 /// Appends those that are not yet in the list, up to the given rank.
 void appendMatches(std::vector<std::string>& matches, const std::vector<Candidate>& candidates,
                    std::string_view spelling, Rank last) {
-    const std::optional<Tag> wanted = tagOf(spelling);
+    const std::optional<LanguageTag> wanted = tagOf(spelling);
     std::vector<std::pair<Rank, const std::string*>> ranked;
     ranked.reserve(candidates.size());
     for (const Candidate& candidate : candidates) {

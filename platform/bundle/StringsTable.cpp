@@ -63,9 +63,9 @@ bool isUnquoted(char c) noexcept {
            (c != '\0' && std::strchr("_$/:.-", c) != nullptr);
 }
 
-class Parser {
+class StringsTableParser {
   public:
-    explicit Parser(std::string_view text) : _text(text) {}
+    explicit StringsTableParser(std::string_view text) : _text(text) {}
 
     std::optional<Dictionary> table() {
         Dictionary entries;
@@ -351,7 +351,7 @@ Result<Dictionary> parseStringsTable(std::string_view bytes) {
     if (first != text->end() && *first == '<') {
         return parseAsPropertyList(bytes);
     }
-    Parser parser(*text);
+    StringsTableParser parser(*text);
     std::optional<Dictionary> table = parser.table();
     if (!table) {
         return failed(parser.problem());

@@ -61,11 +61,11 @@ SocketAddress socketAddress(const AvahiAddress& address, std::uint16_t port, Ava
 
 /// Finds out whether the daemon replies, without blocking. Avahi's client library makes its first calls to the daemon
 /// synchronously and waits 25 seconds for each, so it must only be used once the daemon is known to reply.
-class Probe {
+class DaemonProbe {
   public:
     enum class State { asking, answered, failed };
 
-    explicit Probe(const AvahiPoll* poll) : _poll(poll) {
+    explicit DaemonProbe(const AvahiPoll* poll) : _poll(poll) {
         sd_bus* bus = nullptr;
         int status = ::sd_bus_open_system(&bus);
         _bus.reset(bus);
@@ -80,9 +80,9 @@ class Probe {
         _watch = poll->watch_new(poll, ::sd_bus_get_fd(bus), AVAHI_WATCH_IN, onEvent, this);
         process();
     }
-    Probe(const Probe&) = delete;
-    Probe& operator=(const Probe&) = delete;
-    ~Probe() {
+    DaemonProbe(const DaemonProbe&) = delete;
+    DaemonProbe& operator=(const DaemonProbe&) = delete;
+    ~DaemonProbe() {
         if (_watch != nullptr) {
             _poll->watch_free(_watch);
         }
@@ -112,15 +112,15 @@ class Probe {
         }
     }
 
-    static void onEvent(AvahiWatch*, int, AvahiWatchEvent, void* self) { static_cast<Probe*>(self)->process(); }
+    static void onEvent(AvahiWatch*, int, AvahiWatchEvent, void* self) { static_cast<DaemonProbe*>(self)->process(); }
 
     static int onReply(sd_bus_message* reply, void* self, sd_bus_error*) {
         const sd_bus_error* error = ::sd_bus_message_get_error(reply);
         if (error == nullptr) {
-            static_cast<Probe*>(self)->_state = State::answered;
+            static_cast<DaemonProbe*>(self)->_state = State::answered;
         } else {
-            static_cast<Probe*>(self)->fail(std::string("the Avahi daemon does not answer: ") +
-                                            (error->message == nullptr ? error->name : error->message));
+            static_cast<DaemonProbe*>(self)->fail(std::string("the Avahi daemon does not answer: ") +
+                                                  (error->message == nullptr ? error->name : error->message));
         }
         return 1;
     }
@@ -137,7 +137,7 @@ class Probe {
 /// Avahi's callbacks only store their news here; NetService::advance acts on it, outside of Avahi's own calls.
 struct NetService::Resolution {
     Clock::time_point deadline;
-    std::optional<Probe> probe;
+    std::optional<DaemonProbe> probe;
     std::unique_ptr<AvahiClient, Free> client;
     std::unique_ptr<AvahiServiceResolver, Free> resolver;  // freed before its client
     std::optional<int> failed;
@@ -191,7 +191,7 @@ void NetService::resolveWithTimeout(std::chrono::milliseconds timeout) {
         return;
     }
     _resolution->probe.emplace(::avahi_simple_poll_get(_loop._poll->handle.get()));
-    if (_resolution->probe->state() == Probe::State::failed) {
+    if (_resolution->probe->state() == DaemonProbe::State::failed) {
         advance();
     }
 }
@@ -231,10 +231,10 @@ bool NetService::advance() {
     }
     std::optional<Dictionary> error;
     if (_resolution->probe) {
-        const Probe& probe = *_resolution->probe;
-        if (probe.state() == Probe::State::answered) {
+        const DaemonProbe& probe = *_resolution->probe;
+        if (probe.state() == DaemonProbe::State::answered) {
             begin();
-        } else if (probe.state() == Probe::State::failed) {
+        } else if (probe.state() == DaemonProbe::State::failed) {
             error = failure(noDaemonCode, probe.reason());
         }
     }

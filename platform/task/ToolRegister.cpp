@@ -29,10 +29,10 @@ tl::unexpected<Error> failed() {
     return failure(Error{"posix", errno, std::generic_category().message(errno)});
 }
 
-enum class State { gone, stopped, running };
+enum class ProcessState { gone, stopped, running };
 
 /// The state of a process from /proc. One that is exiting counts as gone.
-State stateOf(pid_t pid) noexcept {
+ProcessState stateOf(pid_t pid) noexcept {
     constexpr unsigned long isExiting = 0x4;  // PF_EXITING of the kernel
     constexpr int flagsAfterState = 7;
     std::array<char, 32> path{"/proc/"};
@@ -43,7 +43,7 @@ State stateOf(pid_t pid) noexcept {
     std::array<char, 1024> buffer{};
     const ssize_t length = file.isOpen() ? ::read(file.get(), buffer.data(), buffer.size()) : -1;
     if (length <= 0) {
-        return State::gone;
+        return ProcessState::gone;
     }
     // PID (NAME) STATE PPID PGRP SESSION TTY TPGID FLAGS, where NAME may hold anything.
     std::string_view rest(buffer.data(), static_cast<std::size_t>(length));
@@ -55,25 +55,25 @@ State stateOf(pid_t pid) noexcept {
     unsigned long flags = isExiting;
     std::from_chars(rest.data(), rest.data() + rest.size(), flags);
     if (state == 'Z' || state == 'X' || (flags & isExiting) != 0) {
-        return State::gone;
+        return ProcessState::gone;
     }
-    return state == 'T' || state == 't' ? State::stopped : State::running;
+    return state == 'T' || state == 't' ? ProcessState::stopped : ProcessState::running;
 }
 
 /// Kills the group of a process that has not exited. Stops the process first: otherwise it could exit between the check
 /// and the signal, which would then hit the service that it has started.
 void killGroup(pid_t pid) noexcept {
-    if (::getpgid(pid) != pid || ::getsid(pid) != ::getsid(0) || stateOf(pid) == State::gone) {
+    if (::getpgid(pid) != pid || ::getsid(pid) != ::getsid(0) || stateOf(pid) == ProcessState::gone) {
         return;
     }
     ::kill(pid, SIGSTOP);
-    State state = stateOf(pid);
-    for (int tries = 0; state == State::running && tries < stopTries; ++tries) {
+    ProcessState state = stateOf(pid);
+    for (int tries = 0; state == ProcessState::running && tries < stopTries; ++tries) {
         ::usleep(1000);
         state = stateOf(pid);
     }
     // One that the kernel does not stop, because it waits for a dead mount, does not exit either.
-    if (state != State::gone) {
+    if (state != ProcessState::gone) {
         ::kill(-pid, SIGKILL);
     }
 }

@@ -41,9 +41,9 @@ bool isIdentifier(std::string_view text) noexcept {
     return before != '.';
 }
 
-class Parser {
+class FilterParser {
   public:
-    explicit Parser(std::string_view text) noexcept : _text(text) {}
+    explicit FilterParser(std::string_view text) noexcept : _text(text) {}
 
     std::optional<FilterProblem> run() {
         if (filter(0) && _at != _text.size()) {
@@ -171,7 +171,7 @@ class Parser {
 }  // namespace
 
 std::optional<FilterProblem> ldapFilterProblem(std::string_view filter) {
-    return Parser(filter).run();
+    return FilterParser(filter).run();
 }
 
 bool isLdapAttribute(std::string_view text) noexcept {

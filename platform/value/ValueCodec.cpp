@@ -7,7 +7,7 @@
 namespace adminhost {
 namespace {
 
-enum class Tag : unsigned char {
+enum class ValueTag : unsigned char {
     null,
     no,
     yes,
@@ -21,7 +21,7 @@ enum class Tag : unsigned char {
     dictionary,
 };
 
-void putTag(Tag tag, std::string& bytes) {
+void putTag(ValueTag tag, std::string& bytes) {
     bytes += static_cast<char>(tag);
 }
 
@@ -45,9 +45,9 @@ void putText(std::string_view text, std::string& bytes) {
     bytes += text;
 }
 
-class Decoder {
+class ValueDecoder {
   public:
-    explicit Decoder(std::string_view bytes) : _bytes(bytes) {}
+    explicit ValueDecoder(std::string_view bytes) : _bytes(bytes) {}
 
     bool value(Value& value, std::size_t depth);
     [[nodiscard]] bool atEnd() const { return _bytes.empty(); }
@@ -62,7 +62,7 @@ class Decoder {
     std::string_view _bytes;
 };
 
-bool Decoder::word(std::uint64_t& word) {
+bool ValueDecoder::word(std::uint64_t& word) {
     if (_bytes.size() < sizeof word) {
         return false;
     }
@@ -71,7 +71,7 @@ bool Decoder::word(std::uint64_t& word) {
     return true;
 }
 
-bool Decoder::size(std::size_t& size) {
+bool ValueDecoder::size(std::size_t& size) {
     size = 0;
     for (unsigned shift = 0; shift < 35 && !_bytes.empty(); shift += 7) {
         const auto byte = static_cast<unsigned char>(_bytes.front());
@@ -84,7 +84,7 @@ bool Decoder::size(std::size_t& size) {
     return false;
 }
 
-bool Decoder::text(std::string_view& text) {
+bool ValueDecoder::text(std::string_view& text) {
     std::size_t length = 0;
     if (!size(length) || length > _bytes.size()) {
         return false;
@@ -94,7 +94,7 @@ bool Decoder::text(std::string_view& text) {
     return true;
 }
 
-bool Decoder::array(Value& value, std::size_t depth) {
+bool ValueDecoder::array(Value& value, std::size_t depth) {
     std::size_t count = 0;
     // Every element occupies at least one byte, so a forged count cannot make this allocate much memory.
     if (depth == codecMaximumDepth || !size(count) || count > _bytes.size()) {
@@ -111,7 +111,7 @@ bool Decoder::array(Value& value, std::size_t depth) {
     return true;
 }
 
-bool Decoder::dictionary(Value& value, std::size_t depth) {
+bool ValueDecoder::dictionary(Value& value, std::size_t depth) {
     std::size_t count = 0;
     if (depth == codecMaximumDepth || !size(count) || count > _bytes.size()) {
         return false;
@@ -133,43 +133,43 @@ bool Decoder::dictionary(Value& value, std::size_t depth) {
     return true;
 }
 
-bool Decoder::value(Value& value, std::size_t depth) {
+bool ValueDecoder::value(Value& value, std::size_t depth) {
     if (_bytes.empty()) {
         return false;
     }
-    const auto tag = static_cast<Tag>(_bytes.front());
+    const auto tag = static_cast<ValueTag>(_bytes.front());
     _bytes.remove_prefix(1);
     std::uint64_t bits = 0;
     std::string_view bytes;
     switch (tag) {
-        case Tag::null:
+        case ValueTag::null:
             value = nullptr;
             return true;
-        case Tag::no:
-        case Tag::yes:
-            value = tag == Tag::yes;
+        case ValueTag::no:
+        case ValueTag::yes:
+            value = tag == ValueTag::yes;
             return true;
-        case Tag::integer:
+        case ValueTag::integer:
             value = word(bits) ? Value(static_cast<std::int64_t>(bits)) : Value();
             return !value.isNull();
-        case Tag::unsignedInteger:
+        case ValueTag::unsignedInteger:
             value = word(bits) ? Value(bits) : Value();
             return !value.isNull();
-        case Tag::real:
+        case ValueTag::real:
             value = word(bits) ? Value(std::bit_cast<double>(bits)) : Value();
             return !value.isNull();
-        case Tag::date:
+        case ValueTag::date:
             value = word(bits) ? Value(Date(std::chrono::seconds(static_cast<std::int64_t>(bits)))) : Value();
             return !value.isNull();
-        case Tag::string:
+        case ValueTag::string:
             value = text(bytes) ? Value(bytes) : Value();
             return !value.isNull();
-        case Tag::data:
+        case ValueTag::data:
             value = text(bytes) ? Value(Data(bytes.begin(), bytes.end())) : Value();
             return !value.isNull();
-        case Tag::array:
+        case ValueTag::array:
             return array(value, depth);
-        case Tag::dictionary:
+        case ValueTag::dictionary:
             return dictionary(value, depth);
     }
     return false;
@@ -180,46 +180,46 @@ bool Decoder::value(Value& value, std::size_t depth) {
 void encodeValue(const Value& value, std::string& bytes) {
     switch (value.type()) {
         case Value::Type::null:
-            putTag(Tag::null, bytes);
+            putTag(ValueTag::null, bytes);
             return;
         case Value::Type::boolean:
-            putTag(*value.boolean() ? Tag::yes : Tag::no, bytes);
+            putTag(*value.boolean() ? ValueTag::yes : ValueTag::no, bytes);
             return;
         case Value::Type::integer:
             if (const auto number = value.integer()) {
-                putTag(Tag::integer, bytes);
+                putTag(ValueTag::integer, bytes);
                 putWord(static_cast<std::uint64_t>(*number), bytes);
             } else {
-                putTag(Tag::unsignedInteger, bytes);
+                putTag(ValueTag::unsignedInteger, bytes);
                 putWord(*value.unsignedInteger(), bytes);
             }
             return;
         case Value::Type::real:
-            putTag(Tag::real, bytes);
+            putTag(ValueTag::real, bytes);
             putWord(std::bit_cast<std::uint64_t>(*value.real()), bytes);
             return;
         case Value::Type::string:
-            putTag(Tag::string, bytes);
+            putTag(ValueTag::string, bytes);
             putText(*value.string(), bytes);
             return;
         case Value::Type::date:
-            putTag(Tag::date, bytes);
+            putTag(ValueTag::date, bytes);
             putWord(static_cast<std::uint64_t>(value.date()->time_since_epoch().count()), bytes);
             return;
         case Value::Type::data:
-            putTag(Tag::data, bytes);
+            putTag(ValueTag::data, bytes);
             putSize(value.data()->size(), bytes);
             bytes.append(value.data()->begin(), value.data()->end());
             return;
         case Value::Type::array:
-            putTag(Tag::array, bytes);
+            putTag(ValueTag::array, bytes);
             putSize(value.array()->size(), bytes);
             for (const Value& element : *value.array()) {
                 encodeValue(element, bytes);
             }
             return;
         case Value::Type::dictionary:
-            putTag(Tag::dictionary, bytes);
+            putTag(ValueTag::dictionary, bytes);
             putSize(value.dictionary()->size(), bytes);
             for (const DictionaryEntry& entry : *value.dictionary()) {
                 putText(entry.key, bytes);
@@ -230,7 +230,7 @@ void encodeValue(const Value& value, std::string& bytes) {
 }
 
 std::optional<Value> decodeValue(std::string_view bytes) {
-    Decoder decoder(bytes);
+    ValueDecoder decoder(bytes);
     Value value;
     if (!decoder.value(value, 0) || !decoder.atEnd()) {
         return std::nullopt;
