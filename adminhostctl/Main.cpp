@@ -57,6 +57,22 @@ std::vector<adminhost::ctl::Verb> allVerbs() {
     return all;
 }
 
+/// An excluded option must have been added before.
+void addOption(CLI::App& app, const adminhost::ctl::VerbOption& option, adminhost::ctl::VerbOptions& options) {
+    const std::string name(option.name);
+    const std::string help(option.help);
+    CLI::Option* const added =
+        option.argument.empty()
+            ? app.add_flag_callback(
+                  name, [&options, name] { options.own[name]; }, help)
+            : app.add_option_function<std::string>(
+                     name, [&options, name](const std::string& text) { options.own[name] = text; }, help)
+                  ->type_name(std::string(option.argument));
+    if (!option.excludes.empty()) {
+        added->excludes(app.get_option(std::string(option.excludes)));
+    }
+}
+
 int runMain(int count, char** words) {
     adminhost::ctl::VerbOptions options;
     std::string socket = defaultSocket;
@@ -73,16 +89,13 @@ int runMain(int count, char** words) {
     app.add_option("--file", options.file, "Read the request from a file, JSON or property list; - is standard input")
         ->type_name("FILE");
     app.add_flag("--names", options.names, "Print only names, one a line");
-    app.add_flag("--group", options.group, "With camera allow and camera deny: the names are names of groups");
-    app.add_option("--password-file", options.passwordFile,
-                   "With plan and apply: read the service's password from a file; - asks, or reads standard input")
-        ->type_name("FILE");
     bool clear = false;
     app.add_flag("--clear", clear, "Remove a stored secret: without this an empty secret is rejected");
-    bool protect = false;
-    bool noProtect = false;
-    CLI::Option* const on = app.add_flag("--protect", protect, "With property set: store the value encrypted");
-    app.add_flag("--no-protect", noProtect, "With property set: store the value unencrypted")->excludes(on);
+    for (const auto& table : {adminhost::ctl::lumioOptions(), adminhost::ctl::desiredOptions()}) {
+        for (const adminhost::ctl::VerbOption& option : table) {
+            addOption(app, option, options);
+        }
+    }
     app.add_option("words", rest, "A verb or a command, and its arguments: KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-")
         ->type_name("WORD");
     app.set_version_flag("--version", std::string("adminhostctl ") + ADMINHOST_RELEASE);
@@ -102,7 +115,6 @@ int runMain(int count, char** words) {
     }
     options.format = format == "json" ? Format::json : format == "plist" ? Format::plist : Format::text;
     options.width = outputWidth();
-    options.isProtected = protect ? std::optional(true) : noProtect ? std::optional(false) : std::nullopt;
     try {
         adminhost::ctl::DaemonClient service(socket);
         const adminhost::ctl::Sources sources{&adminhost::ctl::readSource, &adminhost::ctl::askSecret,

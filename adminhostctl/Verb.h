@@ -1,13 +1,15 @@
 #pragma once
 
-// Verbs: the words that may follow "adminhostctl". Each room has a table of its own verbs, and Main.cpp joins the
-// tables. Every other word is a command of a plug-in.
+// Verbs: the words that may follow "adminhostctl". Each room has a table of its own verbs and one of their options, and
+// Main.cpp joins the tables. Every other word is a command of a plug-in.
 
 #include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/RequestArguments.h"
 
 #include <cstddef>
+#include <functional>
+#include <map>
 #include <optional>
 #include <ostream>
 #include <span>
@@ -19,14 +21,28 @@ namespace adminhost::ctl {
 
 enum class Format { text, json, plist };
 
+/// An option that some verbs of a room have.
+struct VerbOption {
+    std::string_view name;      ///< "--group"
+    std::string_view argument;  ///< "FILE"; empty for an option without one
+    std::string_view help;
+    std::string_view excludes = {};  ///< the name of an option that must not be given with it
+};
+
 struct VerbOptions {
     Format format = Format::text;
-    std::string file;                 ///< of the whole request; empty for none
-    std::string passwordFile;         ///< of the secret setting of a desired state; empty for none
-    bool names = false;               ///< only names, one a line, for completion
-    bool group = false;               ///< short names are names of groups
-    std::optional<bool> isProtected;  ///< whether a property is to be protected
-    std::size_t width = 80;           ///< columns of the terminal
+    std::string file;        ///< of the whole request; empty for none
+    bool names = false;      ///< only names, one a line, for completion
+    std::size_t width = 80;  ///< columns of the terminal
+    /// The verbs' own options that were given, by name, with their arguments.
+    std::map<std::string, std::string, std::less<>> own;
+
+    [[nodiscard]] bool has(std::string_view name) const { return own.contains(name); }
+    /// The option's argument; empty if it was not given.
+    [[nodiscard]] std::string argumentOf(std::string_view name) const {
+        const auto found = own.find(name);
+        return found == own.end() ? std::string() : found->second;
+    }
 };
 
 struct Verb;

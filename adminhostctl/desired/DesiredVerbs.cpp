@@ -13,17 +13,19 @@ namespace {
 
 using Words = std::span<const std::string>;
 
+constexpr std::string_view passwordFileOption = "--password-file";
+
 /// The desired state from the file and the password file.
 Wanted wantedOf(const Context& context, const std::string& file, const CurrentState& current) {
     requireWhole(current);
     Wanted wanted = parseDesired(context.sources.read(file), file, current.form, current.state);
-    if (!context.options.passwordFile.empty()) {
+    if (const std::string passwordFile = context.options.argumentOf(passwordFileOption); !passwordFile.empty()) {
         if (current.form.secrets().size() != 1) {
             throw usageError("--password-file: the service has " + std::to_string(current.form.secrets().size()) +
                              " secret settings; use \"settings set\"");
         }
         const DescribedKey& key = current.form.secrets().front();
-        wanted.secrets[current.form.nameOf(key)] = textOfWord(key, '@' + context.options.passwordFile, context.sources);
+        wanted.secrets[current.form.nameOf(key)] = textOfWord(key, '@' + passwordFile, context.sources);
     }
     return wanted;
 }
@@ -116,10 +118,18 @@ constexpr std::array table = {
     Verb{"rollback", "NUMBER", "Restore the settings as they were before a change", 1, 1, &rollback},
 };
 
+constexpr std::array options = {
+    VerbOption{passwordFileOption, "FILE",
+               "With plan and apply: read the service's password from a file; - asks, or reads standard input"},
+};
+
 }  // namespace
 
 std::span<const Verb> desiredVerbs() noexcept {
     return table;
+}
+std::span<const VerbOption> desiredOptions() noexcept {
+    return options;
 }
 
 }  // namespace adminhost::ctl

@@ -9,5 +9,6 @@
 namespace adminhost::ctl {
 
 [[nodiscard]] std::span<const Verb> desiredVerbs() noexcept;
+[[nodiscard]] std::span<const VerbOption> desiredOptions() noexcept;
 
 }  // namespace adminhost::ctl

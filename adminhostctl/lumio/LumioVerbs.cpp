@@ -15,6 +15,10 @@ using Words = std::span<const std::string>;
 constexpr const char* cameras = "cameras";
 constexpr const char* properties = "properties";
 
+constexpr std::string_view groupOption = "--group";
+constexpr std::string_view protectOption = "--protect";
+constexpr std::string_view noProtectOption = "--no-protect";
+
 /// The list under the key of the command's answer. Throws Failure when the command returns an error.
 Array listOf(const Context& context, const CommandRef& command, const std::string& key) {
     const CommandAnswer answer = context.service.ask(command, {});
@@ -93,7 +97,7 @@ WantedElement wantedOf(const std::string& name) {
 
 ExitStatus cameraAllow(const Context& context, Words arguments) {
     WantedElement camera = wantedOf(arguments.front());
-    camera.lists[context.options.group ? "groups" : "users"] =
+    camera.lists[context.options.has(groupOption) ? "groups" : "users"] =
         std::vector<std::string>(arguments.begin() + 1, arguments.end());
     return changeCamera(context, std::move(camera));
 }
@@ -101,7 +105,7 @@ ExitStatus cameraAllow(const Context& context, Words arguments) {
 ExitStatus cameraDeny(const Context& context, Words arguments) {
     WantedElement camera = wantedOf(arguments.front());
     for (const std::string& name : arguments.subspan(1)) {
-        camera.denied.push_back({context.options.group ? "group" : "", name, ""});
+        camera.denied.push_back({context.options.has(groupOption) ? "group" : "", name, ""});
     }
     return changeCamera(context, std::move(camera));
 }
@@ -134,8 +138,10 @@ ExitStatus propertySet(const Context& context, Words arguments) {
     WantedElement property = wantedOf(arguments.front());
     property.writeSecret = true;
     const bool isProtected = stored != nullptr && stored->fields.get("protect") == Value(true);
-    const bool becomes = context.options.isProtected.value_or(isProtected);
-    if (context.options.isProtected) {
+    const bool protects = context.options.has(protectOption);
+    const bool isGiven = protects || context.options.has(noProtectOption);
+    const bool becomes = isGiven ? protects : isProtected;
+    if (isGiven) {
         property.fields.set("protect", becomes);
     }
     // Without a value, the stored value is kept and only its protection changes.
@@ -174,10 +180,19 @@ constexpr std::array table = {
     Verb{"property remove", "NAME", "Remove a property", 1, 1, &propertyRemove},
 };
 
+constexpr std::array options = {
+    VerbOption{groupOption, "", "With camera allow and camera deny: the names are names of groups"},
+    VerbOption{protectOption, "", "With property set: store the value encrypted"},
+    VerbOption{noProtectOption, "", "With property set: store the value unencrypted", protectOption},
+};
+
 }  // namespace
 
 std::span<const Verb> lumioVerbs() noexcept {
     return table;
+}
+std::span<const VerbOption> lumioOptions() noexcept {
+    return options;
 }
 
 }  // namespace adminhost::ctl

@@ -9,5 +9,6 @@
 namespace adminhost::ctl {
 
 [[nodiscard]] std::span<const Verb> lumioVerbs() noexcept;
+[[nodiscard]] std::span<const VerbOption> lumioOptions() noexcept;
 
 }  // namespace adminhost::ctl
