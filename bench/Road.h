@@ -89,15 +89,16 @@ inline std::size_t run(const Command& command) {
 /// The daemon on a sample root. The destructor stops it.
 class Daemon {
   public:
-    explicit Daemon(const SampleRoot& root) : _socket(root.directory() + "/s") {
+    explicit Daemon(const SampleRoot& root, const Command& options = {}) : _socket(root.directory() + "/s") {
         const auto build = std::filesystem::read_symlink("/proc/self/exe").parent_path().parent_path();
         posix_spawn_file_actions_t actions;
         ::posix_spawn_file_actions_init(&actions);
         const std::string log = root.directory() + "/log";
         ::posix_spawn_file_actions_addopen(&actions, 2, log.c_str(), O_WRONLY | O_CREAT, 0600);
-        _process = start({build / "bin/adminhostd", "--root", root.path(), "--socket", _socket, "--plugin",
-                          build / "lib/adminhost_lumio.so", "--log", "stderr"},
-                         &actions);
+        Command command{build / "bin/adminhostd",         "--root", root.path(), "--socket", _socket, "--plugin",
+                        build / "lib/adminhost_lumio.so", "--log",  "stderr"};
+        command.insert(command.end(), options.begin(), options.end());
+        _process = start(command, &actions);
         ::posix_spawn_file_actions_destroy(&actions);
         for (int i = 0; i < 1000 && !std::filesystem::exists(_socket); ++i) {
             ::usleep(10'000);

@@ -5,6 +5,7 @@
 #include "tests/support/SampleRoot.h"
 
 #include <chrono>
+#include <filesystem>
 #include <memory>
 #include <string>
 
@@ -22,13 +23,15 @@ constexpr auto margin = std::chrono::seconds(60);
 
 TEST(HangingSharedFileSystem, EndsTheRequestAtItsTimeLimitWhileTheFrontReplies) {
     const SampleRoot root;
-    auto hanging = std::make_unique<HangingMount>(root.disk("/mnt/media"));
     root.write("/Library/Preferences/com.brenn.lumioserverd.plist",
                "<plist><dict><key>shared_filesystem</key><string>/mnt/media</string></dict></plist>");
+    std::filesystem::create_directories(root.disk("/mnt/media"));
     const DaemonProcess daemon(
         {{"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"}, "", {}, true, {}});
+    EXPECT_EQ(daemon.connect().post("/v1/lumio/getState").status, 200);
+    auto hanging = std::make_unique<HangingMount>(root.disk("/mnt/media"));
     EXPECT_EQ(daemon.connect().post("/v1/lumio/getState").status, 200)
-        << "without details, the file system is not used";
+        << "without details, the shared file system is not used";
 
     UnixHttp client(daemon.socket(), ownLimit + margin);
     const auto start = Clock::now();
