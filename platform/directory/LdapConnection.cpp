@@ -8,7 +8,6 @@
 
 #include <fmt/format.h>
 #include <sasl/sasl.h>
-#include <sys/socket.h>
 #include <sys/time.h>
 
 namespace adminhost {
@@ -132,8 +131,10 @@ std::string LdapConnection::what(std::string_view action) const {
     return fmt::format("{}: {}", _uri, action);
 }
 
-Clock::time_point LdapConnection::operationEnd() const noexcept {
-    return std::min(Clock::now() + _settings.timeout, directoryDeadline());
+Clock::time_point LdapConnection::beginOperation() noexcept {
+    const Clock::time_point end = std::min({Clock::now() + _settings.timeout, directoryDeadline(), _openEnd});
+    _waitLimit.set(end);
+    return end;
 }
 
 bool LdapConnection::isProtected() const noexcept {
@@ -154,11 +155,13 @@ Result<std::unique_ptr<LdapConnection>> LdapConnection::open(const LdapNodeSetti
         }
         // The constructor is private, so make_unique cannot call it.
         std::unique_ptr<LdapConnection> connection(new LdapConnection(settings, uri));
-        auto connected = connection->connect(end);
+        connection->_openEnd = end;
+        auto connected = connection->connect();
         if (connected) {
             connected = connection->bind(credential, signIn);
         }
         if (connected) {
+            connection->_openEnd = Clock::time_point::max();
             return connection;
         }
         error = connected.error();
@@ -170,10 +173,10 @@ Result<std::unique_ptr<LdapConnection>> LdapConnection::open(const LdapNodeSetti
     return failure(std::move(error));
 }
 
-Result<void> LdapConnection::connect(Clock::time_point end) {
+Result<void> LdapConnection::connect() {
     const auto begin = Clock::now();
-    _connectEnd = std::min({end, begin + _settings.timeout, directoryDeadline()});
-    if (_connectEnd <= begin) {
+    const auto connectEnd = std::min({begin + _settings.timeout, directoryDeadline(), _openEnd});
+    if (connectEnd <= begin) {
         return failure(ldapError(LDAP_TIMEOUT, _uri, "the time for the directory is used up"));
     }
     LDAP* created = nullptr;
@@ -183,7 +186,7 @@ Result<void> LdapConnection::connect(Clock::time_point end) {
     _handle.reset(created);
     const int version = LDAP_VERSION3;
     const int never = LDAP_DEREF_NEVER;
-    const timeval limit = timevalOf(_connectEnd - begin);
+    const timeval limit = timevalOf(connectEnd - begin);
     ::ldap_set_option(created, LDAP_OPT_PROTOCOL_VERSION, &version);
     ::ldap_set_option(created, LDAP_OPT_DEREF, &never);
     ::ldap_set_option(created, LDAP_OPT_REFERRALS, LDAP_OPT_OFF);
@@ -192,18 +195,13 @@ Result<void> LdapConnection::connect(Clock::time_point end) {
     ::ldap_set_option(created, LDAP_OPT_X_SASL_NOCANON, LDAP_OPT_ON);
     ::ldap_set_option(created, LDAP_OPT_NETWORK_TIMEOUT, &limit);
     ::ldap_set_option(created, LDAP_OPT_TIMEOUT, &limit);
+    _waitLimit.set(connectEnd);
+    _waitLimit.applyTo(created);
     if (auto used = useCertificates(); !used) {
         return used;
     }
     if (const int status = ::ldap_connect(created); status != LDAP_SUCCESS) {
         return failure(ldapError(status, _uri, created));
-    }
-    // Half a message from a server that then stops must not hold us up.
-    int descriptor = -1;
-    if (::ldap_get_option(created, LDAP_OPT_DESC, &descriptor) == LDAP_OPT_SUCCESS && descriptor >= 0) {
-        const timeval wait = timevalOf(_settings.timeout);
-        ::setsockopt(descriptor, SOL_SOCKET, SO_RCVTIMEO, &wait, sizeof wait);
-        ::setsockopt(descriptor, SOL_SOCKET, SO_SNDTIMEO, &wait, sizeof wait);
     }
     if (_settings.startTls && !isProtected()) {
         if (const int status = ::ldap_start_tls_s(created, nullptr, nullptr); status != LDAP_SUCCESS) {
@@ -273,16 +271,18 @@ Result<void> LdapConnection::bind(KerberosCredential& credential, const LdapSign
 
 Result<void> LdapConnection::bindSimple(const std::string& dn, std::string_view password) {
     berval secret = bervalOf(password);
+    const auto end = beginOperation();
     int id = 0;
     const int status = ::ldap_sasl_bind(_handle.get(), dn.c_str(), LDAP_SASL_SIMPLE, &secret, nullptr, nullptr, &id);
-    return finish(status, id, dn.empty() ? "anonymous bind" : "bind as " + dn);
+    return finish(status, id, end, dn.empty() ? "anonymous bind" : "bind as " + dn);
 }
 
 Result<void> LdapConnection::bindExternal() {
     berval nobody = bervalOf("");
+    const auto end = beginOperation();
     int id = 0;
     const int status = ::ldap_sasl_bind(_handle.get(), nullptr, "EXTERNAL", &nobody, nullptr, nullptr, &id);
-    return finish(status, id, "bind with EXTERNAL");
+    return finish(status, id, end, "bind with EXTERNAL");
 }
 
 Result<void> LdapConnection::bindKerberos(KerberosCredential& credential) {
@@ -303,12 +303,13 @@ Result<void> LdapConnection::bindKerberos(KerberosCredential& credential) {
     int status = LDAP_SASL_BIND_IN_PROGRESS;
     while (status == LDAP_SASL_BIND_IN_PROGRESS) {
         int id = 0;
-        status = ::ldap_sasl_interactive_bind(ldap, nullptr, "GSSAPI", nullptr, nullptr, LDAP_SASL_AUTOMATIC,
+        _waitLimit.set(Clock::time_point::max());
+        status = ::ldap_sasl_interactive_bind(ldap, nullptr, "GSSAPI", nullptr, nullptr, LDAP_SASL_QUIET,
                                               &giveCredential, &negotiation, last.get(), &mechanism, &id);
         if (status != LDAP_SASL_BIND_IN_PROGRESS) {
             break;
         }
-        auto message = receive(id, LDAP_MSG_ALL, Clock::now() + _settings.timeout, action);
+        auto message = receive(id, LDAP_MSG_ALL, std::min(Clock::now() + _settings.timeout, _openEnd), action);
         if (!message) {
             return failure(message.error());
         }
@@ -318,6 +319,7 @@ Result<void> LdapConnection::bindKerberos(KerberosCredential& credential) {
 }
 
 Result<LdapMessage> LdapConnection::receive(int id, int all, Clock::time_point end, std::string_view action) {
+    _waitLimit.set(end);
     timeval wait = timevalOf(end - Clock::now());
     LDAPMessage* message = nullptr;
     const int type = ::ldap_result(_handle.get(), id, all, &wait, &message);
@@ -336,11 +338,11 @@ Result<LdapMessage> LdapConnection::receive(int id, int all, Clock::time_point e
     return failure(ldapError(status, what(action), _handle.get()));
 }
 
-Result<void> LdapConnection::finish(int status, int id, std::string_view action) {
+Result<void> LdapConnection::finish(int status, int id, Clock::time_point end, std::string_view action) {
     if (status != LDAP_SUCCESS) {
         return failure(ldapError(status, what(action), _handle.get()));
     }
-    const auto message = receive(id, LDAP_MSG_ALL, operationEnd(), action);
+    const auto message = receive(id, LDAP_MSG_ALL, end, action);
     if (!message) {
         return failure(message.error());
     }
@@ -355,6 +357,7 @@ Result<void> LdapConnection::finish(int status, int id, std::string_view action)
 }
 
 Result<int> LdapConnection::send(const LdapSearch& search, const std::string& cookie) {
+    beginOperation();
     std::vector<char*> attributes;
     attributes.reserve(search.attributes.size() + 1);
     for (const std::string& attribute : search.attributes) {
@@ -402,7 +405,7 @@ LdapEntry LdapConnection::entryOf(LDAPMessage* message) {
 }
 
 Result<std::optional<std::string>> LdapConnection::collect(int id, const LdapEntrySink& sink) {
-    const Clock::time_point end = operationEnd();
+    const Clock::time_point end = beginOperation();
     while (true) {
         const auto message = receive(id, LDAP_MSG_ONE, end, "search");
         if (!message) {
@@ -481,15 +484,17 @@ Result<void> LdapConnection::searchBoth(const LdapSearch& first, const LdapEntry
 
 Result<void> LdapConnection::add(const std::string& dn, const std::map<std::string, std::vector<std::string>>& values) {
     Modifications modifications(values);
+    const auto end = beginOperation();
     int id = 0;
     const int status = ::ldap_add_ext(_handle.get(), dn.c_str(), modifications.get(), nullptr, nullptr, &id);
-    return finish(status, id, "add " + dn);
+    return finish(status, id, end, "add " + dn);
 }
 
 Result<void> LdapConnection::remove(const std::string& dn) {
+    const auto end = beginOperation();
     int id = 0;
     const int status = ::ldap_delete_ext(_handle.get(), dn.c_str(), nullptr, nullptr, &id);
-    return finish(status, id, "delete " + dn);
+    return finish(status, id, end, "delete " + dn);
 }
 
 Result<void> LdapConnection::setPassword(const std::string& dn, std::string_view password) {
@@ -498,9 +503,10 @@ Result<void> LdapConnection::setPassword(const std::string& dn, std::string_view
     }
     berval user = bervalOf(dn);
     berval secret = bervalOf(password);
+    const auto end = beginOperation();
     int id = 0;
     const int status = ::ldap_passwd(_handle.get(), &user, nullptr, &secret, nullptr, nullptr, &id);
-    return finish(status, id, "set the password of " + dn);
+    return finish(status, id, end, "set the password of " + dn);
 }
 
 }  // namespace adminhost

@@ -8,6 +8,7 @@
 #include "platform/directory/LdapKerberos.h"
 #include "platform/directory/LdapLibrary.h"
 #include "platform/directory/LdapNode.h"
+#include "platform/directory/LdapWaitLimit.h"
 #include "platform/value/Result.h"
 
 #include <chrono>
@@ -71,7 +72,7 @@ class LdapConnection {
   private:
     LdapConnection(const LdapNodeSettings& settings, std::string uri) : _settings(settings), _uri(std::move(uri)) {}
 
-    [[nodiscard]] Result<void> connect(Clock::time_point end);
+    [[nodiscard]] Result<void> connect();
     [[nodiscard]] Result<void> useCertificates();
     [[nodiscard]] Result<void> bind(KerberosCredential& credential, const LdapSignIn* signIn);
     [[nodiscard]] Result<void> bindSimple(const std::string& dn, std::string_view password);
@@ -81,12 +82,12 @@ class LdapConnection {
     [[nodiscard]] std::string what(std::string_view action) const;
     /// True if nobody on the way can read what is sent: TLS, or a local socket.
     [[nodiscard]] bool isProtected() const noexcept;
-    /// When the operation that begins now must have ended.
-    [[nodiscard]] Clock::time_point operationEnd() const noexcept;
+    /// When the operation that begins now must have ended. No wait lasts longer.
+    Clock::time_point beginOperation() noexcept;
     /// The next message of the operation, or all of them.
     [[nodiscard]] Result<LdapMessage> receive(int id, int all, Clock::time_point end, std::string_view action);
     /// Waits for the result of an operation whose sending returned the status.
-    [[nodiscard]] Result<void> finish(int status, int id, std::string_view action);
+    [[nodiscard]] Result<void> finish(int status, int id, Clock::time_point end, std::string_view action);
     [[nodiscard]] Result<int> send(const LdapSearch& search, const std::string& cookie);
     /// Receives the entries of one search or page; the cookie of the next page, empty after the last. Nullopt if the
     /// sink ended it.
@@ -95,8 +96,9 @@ class LdapConnection {
 
     LdapNodeSettings _settings;
     std::string _uri;
+    Clock::time_point _openEnd = Clock::time_point::max();  ///< while it is being opened
+    LdapWaitLimit _waitLimit;
     LdapHandle _handle;
-    Clock::time_point _connectEnd{};
 };
 
 }  // namespace adminhost

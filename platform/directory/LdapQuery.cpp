@@ -1,6 +1,7 @@
 #include "platform/directory/LdapQuery.h"
 
 #include "platform/directory/LdapFilter.h"
+#include "platform/directory/LdapMembers.h"
 #include "platform/directory/LdapRecord.h"
 
 #include <algorithm>
@@ -48,6 +49,8 @@ class Query {
                 _kinds.push_back(kind);
             }
         }
+        _wantsMembers = std::find(query.attributes.begin(), query.attributes.end(), directory::groupMembership) !=
+                        query.attributes.end();
         // A few entries for each value need no pages, and two searches can be on their way at once.
         _paged = query.match != DirectoryQuery::Match::equal || !isUnique(query.attribute);
     }
@@ -59,6 +62,9 @@ class Query {
             if (auto searched = lookUp(std::span(values).subspan(begin, count)); !searched) {
                 return failure(searched.error());
             }
+        }
+        if (auto completed = completeMembers(); !completed) {
+            return failure(completed.error());
         }
         std::vector<DirectoryRecord> all;
         all.reserve(count());
@@ -82,9 +88,28 @@ class Query {
         if (kind == AccountKind::group && found(AccountKind::user).contains(entry.dn)) {
             return;
         }
-        if (auto record = ldapRecordOf(_mapping, kind, _node, entry, _query.attributes)) {
-            found(kind).try_emplace(entry.dn, *std::move(record));
+        auto record = ldapRecordOf(_mapping, kind, _node, entry, _query.attributes);
+        if (!record || !found(kind).try_emplace(entry.dn, *std::move(record)).second) {
+            return;
         }
+        if (kind == AccountKind::group && _wantsMembers) {
+            _groups.push_back(entry);
+        }
+    }
+
+    /// Adds the members that groups list by DN, once no other search is under way.
+    [[nodiscard]] Result<void> completeMembers() {
+        for (const LdapEntry& group : _groups) {
+            const auto members = ldapMembersByDn(_connection, _mapping, group);
+            if (!members) {
+                return failure(members.error());
+            }
+            if (!members->empty()) {
+                auto& all = found(AccountKind::group).at(group.dn).attributes[std::string(directory::groupMembership)];
+                all.insert(all.end(), members->begin(), members->end());
+            }
+        }
+        return {};
     }
 
     [[nodiscard]] LdapEntrySink sinkFor(AccountKind kind) {
@@ -191,7 +216,9 @@ class Query {
     const DirectoryQuery& _query;
     std::vector<AccountKind> _kinds;
     bool _paged = false;
+    bool _wantsMembers = false;
     std::array<Found, 2> _found;
+    std::vector<LdapEntry> _groups;  ///< if their members are asked for
 };
 
 }  // namespace

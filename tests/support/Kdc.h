@@ -4,12 +4,11 @@
 // temporary directory. Needs no privileges and never reads the machine's own configuration.
 
 #include "tests/support/Environment.h"
+#include "tests/support/ServerProcess.h"
 
 #include <filesystem>
 #include <string>
 #include <string_view>
-
-#include <sys/types.h>
 
 namespace support {
 
@@ -41,11 +40,10 @@ class Kdc {
     void createDatabase() const;
     /// Returns true if the KDC serves. It does not if another program has got the port in the meantime.
     [[nodiscard]] bool start(int port);
-    void stop() noexcept;
 
     std::string _realm;
     std::filesystem::path _directory;
-    pid_t _pid = 0;
+    ServerProcess _server;
 };
 
 }  // namespace support
