@@ -1,6 +1,7 @@
 // The connection against a server that a test plays: what is sent, and what happens when no answer comes.
 
 #include "adminhostctl/Connection.h"
+#include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Interrupt.h"
 
 #include <atomic>
@@ -21,11 +22,14 @@
 
 namespace {
 
+using adminhost::ctl::CommandAnswer;
 using adminhost::ctl::Connection;
+using adminhost::ctl::DaemonClient;
 using adminhost::ctl::DaemonReply;
 using adminhost::ctl::ExitStatus;
 using adminhost::ctl::Failure;
 using adminhost::ctl::LostConnection;
+using adminhost::ctl::ReportedGap;
 using testing::HasSubstr;
 using testing::Not;
 
@@ -110,6 +114,18 @@ TEST(Connection, SendsIdAndRevisionAndReadsTheHeadersOfTheAnswer) {
     EXPECT_THAT(server.requests()[0], HasSubstr("\r\nRequest-Id: THE-ID\r\n"));
     EXPECT_THAT(server.requests()[0], HasSubstr("\r\nIf-Match: \"r1\"\r\n"));
     EXPECT_FALSE(connection.get("/").revision.empty());
+}
+
+TEST(DaemonClient, PartsThatWereNotDoneDoNotLookDoneIfTheDaemonHasForgottenThem) {
+    const PlayedServer server([](const std::string&) { return ok(); });
+    DaemonClient client(server.path());
+    CommandAnswer answer{std::nullopt, "THE-ID", "", true};
+    const std::vector<ReportedGap> gaps = client.gapsOf(answer);
+    ASSERT_EQ(gaps.size(), 1U);
+    EXPECT_THAT(gaps[0].reason, HasSubstr("THE-ID"));
+    answer.notDone = false;
+    EXPECT_TRUE(client.gapsOf(answer).empty());
+    EXPECT_EQ(server.requests().size(), 1U) << "nothing is looked up for a whole answer";
 }
 
 TEST(Connection, RequestWhoseConnectionIsLostIsNotSentAgain) {
