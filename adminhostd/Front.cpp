@@ -459,7 +459,7 @@ void Front::operation(Exchange& exchange, const Target& target) {
         .request = record.id,
         .plugin = record.plugin,
         .command = record.command,
-        .caller = {record.peer.uid, record.peer.pid},
+        .caller = {record.peer.uid, record.peer.pid, record.peer.login},
         .received = record.received,
         .arguments = std::move(*request),
         .revisions = std::move(*revisions),

@@ -4,6 +4,7 @@
 // own loop drives.
 
 #include "adminhostd/ConnectionLimits.h"
+#include "adminhostd/Login.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/value/Value.h"
 
@@ -37,6 +38,7 @@ struct Peer {
     uid_t uid = static_cast<uid_t>(-1);
     gid_t gid = static_cast<gid_t>(-1);
     pid_t pid = 0;
+    uid_t login = noLogin;  ///< the account of its login session, read when the connection was accepted
 };
 
 /// The text of an answer, in the form that its client prefers (Exchange::wantsPropertyList()).

@@ -1,27 +1,19 @@
 #include "adminhostd/Login.h"
 
+#include "platform/files/FileDescriptor.h"
+
 #include <array>
 #include <charconv>
-#include <fstream>
-#include <iterator>
-#include <optional>
+#include <cstdio>
 
+#include <fcntl.h>
 #include <fmt/format.h>
 #include <pwd.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
-
-/// The value that the kernel shows for a process that no login session started.
-constexpr uid_t noSession = static_cast<uid_t>(-1);
-
-std::optional<uid_t> sessionOf(pid_t pid) {
-    std::ifstream file(fmt::format("/proc/{}/loginuid", pid));
-    const std::string text(std::istreambuf_iterator<char>(file), {});
-    uid_t uid = noSession;
-    const auto [end, failure] = std::from_chars(text.data(), text.data() + text.size(), uid);
-    return failure == std::errc() && uid != noSession ? std::optional(uid) : std::nullopt;
-}
 
 std::string accountText(uid_t uid) {
     std::array<char, 4096> room{};
@@ -35,9 +27,23 @@ std::string accountText(uid_t uid) {
 
 }  // namespace
 
-std::string loginText(uid_t uid, pid_t pid) {
-    const uid_t login = sessionOf(pid).value_or(uid);
-    return login == uid ? accountText(uid) : accountText(login) + ", as " + accountText(uid);
+uid_t loginOf(pid_t pid, uid_t uid) noexcept {
+    std::array<char, 32> path{};
+    std::snprintf(path.data(), path.size(), "/proc/%d/loginuid", static_cast<int>(pid));
+    const FileDescriptor file(::open(path.data(), O_RDONLY | O_CLOEXEC));
+    struct stat status {};
+    if (!file.isOpen() || ::fstat(file.get(), &status) != 0 || (status.st_uid != uid && status.st_uid != 0)) {
+        return noLogin;
+    }
+    std::array<char, 16> text{};
+    const ssize_t size = ::read(file.get(), text.data(), text.size());
+    uid_t login = noLogin;
+    const bool parsed = size > 0 && std::from_chars(text.data(), text.data() + size, login).ec == std::errc();
+    return parsed ? login : noLogin;
+}
+
+std::string loginText(uid_t uid, uid_t login) {
+    return login == noLogin || login == uid ? accountText(uid) : accountText(login) + ", as " + accountText(uid);
 }
 
 }  // namespace adminhost

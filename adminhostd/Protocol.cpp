@@ -30,7 +30,8 @@ template <class T>
 constexpr std::nullptr_t members = nullptr;
 
 template <>
-constexpr auto members<Caller> = std::tuple(member("caller.uid", &Caller::uid), member("caller.pid", &Caller::pid));
+constexpr auto members<Caller> = std::tuple(member("caller.uid", &Caller::uid), member("caller.pid", &Caller::pid),
+                                            member("caller.login", &Caller::login));
 template <>
 constexpr auto members<Configure> = std::tuple(
     member("configure.build", &Configure::build), member("configure.root", &Configure::root),

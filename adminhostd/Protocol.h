@@ -46,6 +46,7 @@ struct Caller {
     bool operator==(const Caller&) const = default;
 };
 
+    uid_t login = 0;  ///< of its login session; noLogin: none
 // From the front to the worker.
 
 /// First, and once. The nodes have no credentialsDirectory: the worker knows it.

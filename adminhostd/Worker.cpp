@@ -243,7 +243,7 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
         }
     }
     KeptWrite write(loaded, {{"when", order.received},
-                             {"who", loginText(order.caller.uid, order.caller.pid)},
+                             {"who", loginText(order.caller.uid, order.caller.login)},
                              {"uid", std::uint64_t{order.caller.uid}},
                              {"command", order.command},
                              {"request", order.request}});

@@ -23,6 +23,8 @@ class UnixHttp {
     using Headers = std::vector<std::string>;  ///< "Name: value"
 
     explicit UnixHttp(const std::string& path, std::chrono::milliseconds timeout = std::chrono::seconds(10));
+    /// Takes over a connected socket, whose waits are not bounded.
+    explicit UnixHttp(int socket) noexcept : _socket(socket) {}
     UnixHttp(UnixHttp&& other) noexcept;
     UnixHttp(const UnixHttp&) = delete;
     UnixHttp& operator=(const UnixHttp&) = delete;

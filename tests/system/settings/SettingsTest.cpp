@@ -14,8 +14,13 @@
 #include <iterator>
 #include <thread>
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
@@ -169,6 +174,48 @@ TEST_F(Settings, HistoryTellsWhatEachWriteChangedAndRollbackGoesBackThroughTheSa
     EXPECT_THAT(rollback.output, HasSubstr("has to be restarted"));
     EXPECT_EQ(ctl({"rollback", "1"}).output, "no change\n");
     EXPECT_THAT(ctl({"history"}).output, HasSubstr(R"("other" -> "lumiogrid")"));
+}
+
+TEST_F(Settings, HistoryNamesTheLoginOfAClientThatHasEndedBeforeItsRequestRuns) {
+    const int socket = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    int ends[2];
+    ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
+    const pid_t child = ::fork();
+    if (child == 0) {
+        constexpr std::string_view login = "54321";
+        const int file = ::open("/proc/self/loginuid", O_RDWR | O_CLOEXEC);
+        // Where the kernel does not allow it, the session that this test belongs to counts.
+        static_cast<void>(::write(file, login.data(), login.size()) == 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        daemon.socket().copy(address.sun_path, sizeof address.sun_path - 1);
+        const int connected = ::connect(socket, reinterpret_cast<const sockaddr*>(&address), sizeof address);
+        char text[16] = {};
+        const ssize_t size = ::pread(file, text, sizeof text, 0);
+        static_cast<void>(::write(ends[1], text, size > 0 ? static_cast<std::size_t>(size) : 0) == size);
+        char unused = 0;
+        static_cast<void>(::read(ends[1], &unused, 1) == 1);
+        ::_exit(connected);
+    }
+    char text[16] = {};
+    ASSERT_GT(::read(ends[0], text, sizeof text), 0);
+    EXPECT_EQ(daemon.connect().get("/v1/").status, 200) << "the earlier connection has been accepted too";
+    ASSERT_EQ(::write(ends[0], "x", 1), 1);
+    int status = -1;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    ASSERT_EQ(status, 0);
+    ::close(ends[0]);
+    ::close(ends[1]);
+    test::UnixHttp client(socket);
+    EXPECT_EQ(client.post("/v1/lumio/writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
+    const Value history = valueOf(daemon.connect().get("/v1/lumio/history"));
+    const std::string who = textOf(history.dictionary()->get("history").array()->front().dictionary()->get("who"));
+    const std::string login(text);
+    if (login != "4294967295" && login != std::to_string(::geteuid())) {
+        EXPECT_THAT(who, testing::StartsWith("uid " + login + ", as ")) << "no account has this number";
+    } else {
+        EXPECT_THAT(who, testing::EndsWith("(uid " + std::to_string(::geteuid()) + ")"));
+    }
 }
 
 TEST_F(Settings, RollbackThatDoesNotTakeIsNamed) {

@@ -13,7 +13,7 @@ Perform perform() {
     return {.request = "1-2",
             .plugin = "p",
             .command = "c",
-            .caller = {7, 8},
+            .caller = {7, 8, 9},
             .received = Date(90s),
             .arguments = Dictionary{{"a", Array{Value(1), Value(Dictionary{{"b", 2.5}})}}},
             .revisions = {"r1", ""},
@@ -195,7 +195,7 @@ TEST(Protocol, NumberOutsideTheRangeOfItsMemberIsAnError) {
         Frame frame = frameOf(perform());
         for (const DictionaryEntry& entry : Dictionary(*frame.payload.dictionary())) {
             const Dictionary* caller = entry.value.dictionary();
-            if (caller != nullptr && caller->size() == 2) {
+            if (caller != nullptr && caller->size() == 3) {
                 Dictionary changed;
                 for (const DictionaryEntry& one : *caller) {
                     changed.set(one.key, number);

@@ -1,4 +1,3 @@
-#include "adminhostd/Login.h"
 #include "adminhostd/SettingsHistory.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TemporaryRoot.h"
@@ -17,7 +16,6 @@ namespace {
 namespace fs = std::filesystem;
 using testing::ElementsAre;
 using testing::HasSubstr;
-using testing::MatchesRegex;
 
 constexpr const char* directory = "/var/lib/adminhostd/history/lumio";
 
@@ -280,11 +278,6 @@ TEST_F(HistoryTest, DirectoryThatCannotBeCreatedIsAnErrorWithTheReason) {
     ASSERT_FALSE(number);
     EXPECT_FALSE(number.error().description->empty());
     EXPECT_TRUE(history.keepResources({resourceChange("value", 1, 2)}, {}));
-}
-
-TEST(Login, NamesTheAccountAndItsNumber) {
-    EXPECT_THAT(loginText(0, ::getpid()), MatchesRegex(".*root \\(uid 0\\)"));
-    EXPECT_EQ(loginText(4123456789U, -1), "uid 4123456789");
 }
 
 }  // namespace
