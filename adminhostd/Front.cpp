@@ -326,6 +326,8 @@ std::variant<HttpAnswer, HttpServer::Serve> Front::head(Exchange& exchange) {
     if (stranger) {
         answer = errorAnswer(403, "NOT_PERMITTED",
                              fmt::format("The account with uid {} may not use this daemon.", exchange.peer().uid));
+    } else if (exchange.headProblem()) {
+        answer = exchange.headProblem();  // and its id stays unused: nothing in such a head is trusted
     } else {
         answer = adoptId(exchange, target);
     }

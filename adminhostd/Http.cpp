@@ -402,14 +402,15 @@ int HttpServer::begin(MHD_Connection* connection, const char* url, const char* m
     *place = exchange.release();
     ++_open;
     Exchange& begun = **place;
+    begun._headProblem = headRefusal(connection, version);
     auto decided = _head(begun);
     if (auto* refusal = std::get_if<HttpAnswer>(&decided)) {
         begun._refusal = std::move(*refusal);
     } else {
         begun._serve = std::move(std::get<Serve>(decided));
     }
-    if (auto refusal = begun._refusal ? std::nullopt : headRefusal(connection, version)) {
-        begun._answer = std::move(refusal);
+    if (begun._headProblem) {
+        begun._answer = std::move(begun._refusal ? begun._refusal : begun._headProblem);
         return send(begun);
     }
     const bool tooLarge = announcedLength(connection) > bodyMaximum;

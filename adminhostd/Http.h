@@ -70,6 +70,8 @@ class Exchange {
     [[nodiscard]] std::optional<std::string_view> header(const char* name) const;
     /// A value of the address's query, decoded; empty if the client did not send it.
     [[nodiscard]] std::string_view argument(const char* name) const;
+    /// The answer to a head that has an error or can be read in more than one way; nullopt if it is well-formed.
+    [[nodiscard]] const std::optional<HttpAnswer>& headProblem() const noexcept { return _headProblem; }
     /// Returns true if the answer's text is to be a property list, and false for JSON.
     [[nodiscard]] bool wantsPropertyList() const;
     /// Replaces the id by the client's own.
@@ -94,7 +96,8 @@ class Exchange {
     std::string _body;
     std::size_t _received = 0;
     std::function<void(Exchange&)> _serve;  ///< the function that head() returned
-    std::optional<HttpAnswer> _refusal;     ///< decided from the head, sent once the body has been read and dropped
+    std::optional<HttpAnswer> _headProblem;
+    std::optional<HttpAnswer> _refusal;  ///< decided from the head, sent once the body has been read and dropped
     std::optional<HttpAnswer> _answer;
     std::string _bytes;       ///< of the answer, while it is sent
     std::size_t _unread = 0;  ///< bytes of it that count as unread; 0 when it has been dropped
@@ -106,7 +109,8 @@ class HttpServer {
     /// Called with the whole request.
     using Serve = std::function<void(Exchange&)>;
     /// Called when the head of a request is there. Returns an answer to refuse it before its body is read, else the
-    /// function to be called with the whole request.
+    /// function to be called with the whole request. A request whose head has a problem is never served: the function
+    /// should return that problem as the answer, or one that says less.
     using Head = std::function<std::variant<HttpAnswer, Serve>(Exchange&)>;
 
     /// Takes ownership of the listening socket. A client that exceeds the time for a request, or for reading on, is

@@ -132,6 +132,20 @@ TEST_F(RequestIds, MalformedOneIs400AndNothingRuns) {
     EXPECT_EQ(client.post("/v1/fixture/look").headers.at("etag"), "\"r1\"");
 }
 
+TEST_F(RequestIds, OneInAMalformedHeadIsNotUsedUp) {
+    for (const char* rest :
+         {"Host: x\r\nContent-Length: 2\r\nContent-Length: 3\r\n\r\n{}", "Content-Length: 2\r\n\r\n{}",
+          "Host: x\r\nTransfer-Encoding: chunked\r\nContent-Length: 2\r\n\r\n{}"}) {
+        UnixHttp other = daemon.connect();
+        other.send("POST /v1/fixture/nothing HTTP/1.1\r\nRequest-Id: " + id + "\r\n" + rest);
+        const HttpReply reply = other.reply();
+        expectError(reply, 400, "MALFORMED_HEAD");
+        EXPECT_NE(reply.headers.at("request-id"), id);
+        EXPECT_TRUE(other.closedWithin(std::chrono::seconds(5)));
+    }
+    EXPECT_EQ(client.post("/v1/fixture/nothing", "{}", {"Request-Id: " + id}).status, 204);
+}
+
 TEST_F(RequestIds, StateIsWaitingRunningDoneOrUnknown) {
     const std::string second = "6ba7b811-9dad-11d1-80b4-00c04fd430c8";
     EXPECT_EQ(recordOf(daemon, id).get("state"), Value("unknown"));
