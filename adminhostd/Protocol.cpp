@@ -1,5 +1,6 @@
 #include "adminhostd/Protocol.h"
 
+#include <array>
 #include <limits>
 #include <map>
 #include <optional>
@@ -131,11 +132,46 @@ struct Word {
     std::string_view text;
 };
 
-constexpr Word<Outcome> outcomeWords[] = {
-    {Outcome::nothing, "nothing"}, {Outcome::answered, "answered"}, {Outcome::error, "error"},
-    {Outcome::refused, "refused"}, {Outcome::conflict, "conflict"}, {Outcome::overrun, "overrun"},
-    {Outcome::locked, "locked"},   {Outcome::broken, "broken"},     {Outcome::later, "later"},
-};
+/// Null for a number that is no outcome. The compiler rejects the switch if it lacks one.
+constexpr const char* wordOf(Outcome outcome) {
+    switch (outcome) {
+        case Outcome::nothing:
+            return "nothing";
+        case Outcome::answered:
+            return "answered";
+        case Outcome::error:
+            return "error";
+        case Outcome::later:
+            return "later";
+        case Outcome::refused:
+            return "refused";
+        case Outcome::conflict:
+            return "conflict";
+        case Outcome::overrun:
+            return "overrun";
+        case Outcome::locked:
+            return "locked";
+        case Outcome::broken:
+            return "broken";
+    }
+    return nullptr;
+}
+
+/// Every outcome: they count from 0 without a gap.
+constexpr auto outcomeWords = [] {
+    constexpr std::size_t count = [] {
+        std::size_t counted = 0;
+        while (wordOf(static_cast<Outcome>(counted)) != nullptr) {
+            ++counted;
+        }
+        return counted;
+    }();
+    std::array<Word<Outcome>, count> words{};
+    for (std::size_t i = 0; i < count; ++i) {
+        words[i] = {static_cast<Outcome>(i), wordOf(static_cast<Outcome>(i))};
+    }
+    return words;
+}();
 constexpr Word<BodyForm> formWords[] = {{BodyForm::json, "json"}, {BodyForm::propertyList, "propertyList"}};
 constexpr Word<Access> accessWords[] = {
     {Access::read, "read"}, {Access::write, "write"}, {Access::control, "control"}, {Access::account, "account"}};
@@ -449,6 +485,14 @@ Result<std::variant<Ts...>> decodedLike(Frame& frame, const std::variant<Ts...>*
 }
 
 }  // namespace
+
+std::vector<Outcome> outcomes() {
+    std::vector<Outcome> all;
+    for (const auto& word : outcomeWords) {
+        all.push_back(word.value);
+    }
+    return all;
+}
 
 Frame frameOf(ToWorker message) {
     return encodedFrame(std::move(message));

@@ -39,6 +39,9 @@ enum class Outcome {
     broken,    ///< message: the worker could not do it
 };
 
+/// Every outcome.
+[[nodiscard]] std::vector<Outcome> outcomes();
+
 /// The client, as the kernel knew it when it connected.
 struct Caller {
     uid_t uid = 0;

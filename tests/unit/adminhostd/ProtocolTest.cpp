@@ -99,8 +99,7 @@ std::vector<ToFront> messagesToFront() {
         Change{"cameras", "U", "Studio", "users", Value(1), Value("b"), true, Dictionary{{"k", 1}}},
         Change{"settings", "", "", "k", {}, {}, false, {}},
         NotDone{"configuration.a", "why", "words"}};
-    for (const Outcome outcome : {Outcome::nothing, Outcome::answered, Outcome::error, Outcome::refused,
-                                  Outcome::conflict, Outcome::overrun, Outcome::broken, Outcome::later}) {
+    for (const Outcome outcome : outcomes()) {
         messages.emplace_back(answer(outcome));
     }
     return messages;
