@@ -65,11 +65,15 @@ class Trial {
     std::optional<std::string> finish(Clock::time_point until);
 
   private:
-    /// Kills the rest of the process group, before its number can be another's, and reaps the child.
+    /// Kills the process group, or what is left of it, and reaps the child. The group's number cannot be another's
+    /// before the child is reaped; if that has happened elsewhere, no signal is sent.
     int end() {
         int status = 0;
         if (_child.pid > 0) {
-            ::kill(-_child.pid, SIGKILL);
+            siginfo_t ignored{};
+            if (::waitid(P_PIDFD, static_cast<id_t>(_child.exit.get()), &ignored, WEXITED | WNOHANG | WNOWAIT) == 0) {
+                ::kill(-_child.pid, SIGKILL);
+            }
             while (::waitpid(_child.pid, &status, 0) < 0 && errno == EINTR) {
             }
             _child.pid = 0;
