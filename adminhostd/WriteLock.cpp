@@ -87,6 +87,9 @@ Result<WriteLock::Held> WriteLock::tryToHold() {
     }
     FileDescriptor file(
         ::openat(directory->get(), lockFile, O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, S_IRUSR | S_IWUSR));
+    if (!file.isOpen() && errno == EROFS) {
+        file = FileDescriptor(::openat(directory->get(), lockFile, O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+    }
     if (!file.isOpen()) {
         return unusable();
     }
@@ -104,7 +107,7 @@ Result<WriteLock::Held> WriteLock::tryToHold() {
     const std::string self = std::to_string(::getpid()) + "\n";
     if (::ftruncate(file.get(), 0) != 0 ||
         ::pwrite(file.get(), self.data(), self.size(), 0) != static_cast<ssize_t>(self.size())) {
-        // On a full disk other processes do not see which one holds the lock. It is held all the same.
+        // On a full or read-only disk other processes do not see which one holds the lock. It is held all the same.
     }
     return Held(std::move(file));
 }

@@ -5,6 +5,10 @@
 //
 // It is a flock on a file of mode 0600 in /run/adminhostd/private, below the system root. That directory can be entered
 // by the daemon's account only, so nobody else can hold the lock. Tools do not inherit it. Reading needs no lock.
+//
+// The file is created when a worker starts. From then on the lock needs no space on the disk: it can be held when the
+// disk of /run is full or has become read-only, and a write whose files are elsewhere is carried out. Only if the file
+// could never be created do changes fail, with the reason: without the lock two workers could overwrite each other.
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/value/Result.h"

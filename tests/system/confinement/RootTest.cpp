@@ -1,9 +1,12 @@
 // With --root nothing outside the root is touched: the daemon runs in a mount namespace in which all file systems are
 // read-only, except the root and the directory of the test. What would leave the root fails there.
 
+#include "adminhostd/WriteLock.h"
+#include "platform/files/Path.h"
 #include "platform/json/Json.h"
 #include "platform/value/ValueText.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 
 #include <cerrno>
@@ -12,6 +15,7 @@
 #include <filesystem>
 #include <fstream>
 #include <string>
+#include <vector>
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -103,7 +107,7 @@ class Root : public testing::Test {
     }
 };
 
-TEST_F(Root, EveryKindOfRequestIsServedWithoutTouchingWhatIsOutside) {
+TEST_F(Root, WriteIsServedWithoutTouchingWhatIsOutside) {
     const test::SampleRoot root;
     const test::DaemonProcess daemon(options(root));
     const Dictionary answer = post(daemon, "writeSettings",
@@ -113,6 +117,158 @@ TEST_F(Root, EveryKindOfRequestIsServedWithoutTouchingWhatIsOutside) {
     EXPECT_EQ(answer.at("configuration.server_port"), Value(9001));
     EXPECT_EQ(root.sql("select count(*) from properties where name='n'"), "1\n");
     EXPECT_THAT(daemon.log(), Not(HasSubstr("Read-only file system")));
+}
+
+TEST_F(Root, EveryReadingCommandIsServedWithoutTouchingWhatIsOutside) {
+    const test::SampleRoot root;
+    const test::DaemonProcess daemon(options(root));
+    const auto described = parseJson(daemon.connect().get("/v1/lumio").body);
+    ASSERT_TRUE(described && described->array() != nullptr);
+    for (const Value& command : *described->array()) {
+        const std::string name = textOf(command.dictionary()->get("name"));
+        if (command.dictionary()->get("access") != Value("read")) {
+            continue;
+        }
+        SCOPED_TRACE(name);
+        const std::string example = jsonOf(command.dictionary()->at("example.request"));
+        for (const std::string& body :
+             {std::string("{}"), example, std::string(R"({"optionalArguments":{"languages":["de","en"]}})"),
+              std::string(R"({"optionalArguments":{"variant":"getConfig","languages":["fr"]}})")}) {
+            const test::HttpReply reply = daemon.connect().post("/v1/lumio/" + name, body);
+            EXPECT_LT(reply.status, 300) << reply.body;
+            const auto answer = reply.body.empty() ? std::nullopt : parseJson(reply.body);
+            const Dictionary* dictionary = answer ? answer->dictionary() : nullptr;
+            if (dictionary != nullptr && dictionary->contains("readStatus")) {
+                EXPECT_EQ(dictionary->get("readStatus"), Value(0)) << reply.body;
+            }
+        }
+    }
+    for (const char* address : {"/v1/", "/v1/lumio", "/v1/lumio/history", "/v1/directory", "/v1/directory?match=an",
+                                "/v1/directory?is=anna", "/v1/directory?is=editors"}) {
+        EXPECT_EQ(daemon.connect().get(address).status, 200) << address;
+    }
+    EXPECT_THAT(daemon.connect().get("/v1/directory?is=anna").body, HasSubstr("\"shortName\":\"anna\""));
+    EXPECT_THAT(daemon.log(), Not(HasSubstr("Read-only file system")));
+}
+
+/// Every verb of the command line, and writes that it has no verb for. Everything that may change is below the root.
+TEST_F(Root, EveryKindOfChangeIsMadeBelowTheRoot) {
+    for (const char* path : {"/Library/SorvaneProducer/Shared", "/elsewhere/media", "relative/media"}) {
+        SCOPED_TRACE(path);
+        const test::SampleRoot root;
+        const std::string shared = path[0] == '/' ? path : "/" + std::string(path);
+        if (shared != "/Library/SorvaneProducer/Shared") {
+            fs::create_directories(fs::path(root.disk(shared)).parent_path());
+            fs::rename(root.sharedFilesystemPath(), root.disk(shared));
+            useSharedFilesystem(root, path);
+        }
+        const test::DaemonProcess daemon(options(root));
+        const auto run = [&](std::vector<std::string> words, const std::string& expected = "") {
+            words.insert(words.begin(), {std::string(BINARY_DIR) + "/bin/adminhostctl", "--socket", daemon.socket()});
+            const test::ProgramResult result = test::runProgram(words, test::Errors::merge);
+            EXPECT_EQ(result.status, 0) << words[3] << ": " << result.output;
+            EXPECT_THAT(result.output, HasSubstr(expected));
+            return result.output;
+        };
+        const fs::path file = writable / "state.toml";
+        const fs::path secret = writable / "secret";
+        std::ofstream(secret) << "planted secret";
+        run({"export", file});
+        run({"settings", "set", "server_port", "9001"}, "9001");
+        run({"settings", "set", "nimbo_grid_id", "seven"}, "seven");
+        run({"settings", "set", "nimbo_client_password", "@" + secret.string()}, "(secret)");
+        EXPECT_THAT(run({"history"}), HasSubstr("9001"));
+        run({"rollback", "1"}, "9001");
+        run({"property", "set", "confined", "plain value"}, "plain value");
+        run({"property", "set", "confined", "--protect"}, "protect");
+        run({"property", "set", "confined", "@" + secret.string()}, "(secret)");
+        run({"property", "set", "confined", "--no-protect"}, "protect");
+        run({"property", "list"}, "confined");
+        run({"camera", "access", "Main hall", "off"}, "access_control");
+        run({"camera", "access", "Main hall", "on"}, "access_control");
+        run({"camera", "allow", "Main hall", "ben"}, "(not allowed) -> (allowed)");
+        run({"camera", "deny", "Main hall", "ben"}, "(allowed) -> (not allowed)");
+        run({"whois", "anna"}, "anna");
+        run({"settings", "set", "nimbo_grid_id", "eight"}, "eight");
+        run({"plan", file}, "eight");
+        run({"apply", file}, "eight");
+        run({"plan", file}, "no change");
+        run({"property", "remove", "confined"}, "confined");
+        run({"camera", "remove", "Main hall"}, "Main hall");
+        run({"camera", "list"});
+        run({"status"});
+        EXPECT_THAT(root.read(shared + "/Server/cluster_preferences.plist"), Not(HasSubstr("eight")));
+        EXPECT_THAT(daemon.log(), Not(HasSubstr("Read-only file system")));
+    }
+}
+
+TEST_F(Root, OtherCommandsTouchNothingOutsideWhetherTheySucceedOrFail) {
+    const test::SampleRoot root;
+    const test::DaemonProcess daemon(options(root));
+    const auto described = parseJson(daemon.connect().get("/v1/lumio").body);
+    ASSERT_TRUE(described && described->array() != nullptr);
+    for (const Value& command : *described->array()) {
+        const std::string name = textOf(command.dictionary()->get("name"));
+        if (command.dictionary()->get("access") == Value("read")) {
+            continue;
+        }
+        SCOPED_TRACE(name);
+        const test::HttpReply reply =
+            daemon.connect().post("/v1/lumio/" + name, jsonOf(command.dictionary()->at("example.request")));
+        EXPECT_LT(reply.status, 300) << reply.body;
+        EXPECT_THAT(reply.body, Not(HasSubstr("Read-only file system")));
+    }
+    EXPECT_THAT(daemon.log(), Not(HasSubstr("Read-only file system")));
+}
+
+TEST_F(Root, MoveToAnotherSharedFilesystemAndMemberIsMadeBelowTheRoot) {
+    const test::SampleRoot root;
+    const test::DaemonProcess daemon(options(root));
+    const Dictionary answer =
+        post(daemon, "writeSettings",
+             R"({"configuration":{"shared_filesystem":"/moved/media","member_uuid":"M-2","nimbo_grid_id":"moved"}})");
+    EXPECT_EQ(answer.get("writeStatus"), Value(0)) << textOf(Value(answer));
+    EXPECT_THAT(root.read("/moved/media/Server/cluster_preferences.plist"), HasSubstr("moved"));
+    EXPECT_EQ(
+        daemon.connect().post("/v1/lumio/writeSettings", R"({"configuration":{"shared_filesystem":"media"}})").status,
+        422)
+        << "a relative one is rejected";
+    EXPECT_THAT(daemon.log(), Not(HasSubstr("Read-only file system")));
+}
+
+TEST_F(Root, FullOrReadOnlyRunDirectoryStopsNoChange) {
+    const test::SampleRoot root;
+    const std::string run = root.disk("/run");
+    fs::create_directories(run);
+    ASSERT_EQ(::mount("none", run.c_str(), "tmpfs", 0, "size=64k,nr_inodes=16"), 0) << std::strerror(errno);
+    {
+        const test::DaemonProcess daemon(options(root));
+        const auto write = [&](int port) {
+            const Dictionary answer =
+                post(daemon, "writeSettings", R"({"configuration":{"server_port":)" + std::to_string(port) + "}}");
+            EXPECT_EQ(answer.get("writeStatus"), Value(0)) << textOf(Value(answer));
+            EXPECT_EQ(answer.at("configuration.server_port"), Value(port));
+        };
+        write(9001);
+        for (int i = 0; i < 64; ++i) {
+            std::ofstream(run + "/" + std::to_string(i)) << std::string(std::size_t{8} << 10U, 'x');
+        }
+        ASSERT_FALSE(std::ofstream(run + "/one more").is_open()) << "there is room for a file";
+        write(9002);
+        ASSERT_EQ(::mount(nullptr, run.c_str(), nullptr, MS_REMOUNT | MS_RDONLY, nullptr), 0) << std::strerror(errno);
+        write(9003);
+        const std::string before = systemRoot();
+        setSystemRoot(root.path());
+        {
+            const auto held = WriteLock::tryToHold();
+            ASSERT_TRUE(held) << textOf(held.error());
+            const auto second = WriteLock::tryToHold();
+            ASSERT_FALSE(second) << "two hold it";
+            EXPECT_EQ(second.error().domain, WriteLock::busy);
+        }
+        setSystemRoot(before);
+    }
+    ::umount2(run.c_str(), MNT_DETACH);
 }
 
 TEST_F(Root, RelativeSharedFilesystemAndStepsUpLeadBelowTheRoot) {

@@ -1,1 +1,2 @@
-set(TEST_DEPENDS adminhostd adminhost_lumio)
+set(TEST_LIBS host)
+set(TEST_DEPENDS adminhostd adminhostctl adminhost_lumio)
