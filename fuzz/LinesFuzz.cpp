@@ -1,5 +1,5 @@
-// Output of the database tool: its rows are equal to those of a second, simpler reader. The reader of exact rows
-// survives the same bytes.
+// Output of the database tool: its rows are equal to those of a second, simpler reader. The reader of exact rows has a
+// row for each of them, or none, that begins at the same line: an identifier never comes from another row.
 
 #include "settings/LineRows.h"
 #include "settings/QueryRunner.h"
@@ -71,7 +71,20 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
             require(found != expected[i].end() && entry.value == adminhost::Value(found->second));
         }
     }
-    const std::vector<std::string> columns = lumio::lineColumns(output);
-    static_cast<void>(lumio::rowsOfRecords(output, columns));
+    std::vector<std::size_t> begins{0};
+    const std::vector<std::string> lines = split(output, "\n");
+    for (std::size_t i = 0; i < lines.size(); ++i) {
+        if (lines[i].empty()) {
+            begins.push_back(i + 1);
+        }
+    }
+    const std::vector<std::string> inferred = lumio::lineColumns(output);
+    for (const std::vector<std::string>& columns : {inferred, std::vector<std::string>{"id", "name", "uuid"}}) {
+        const auto rows = lumio::rowsOfRecords(output, columns);
+        require(rows.size() == records.size());
+        for (std::size_t i = 0; i < rows.size(); ++i) {
+            require(!rows[i] || (rows[i]->line == begins[i] && rows[i]->values.size() == columns.size()));
+        }
+    }
     return 0;
 }

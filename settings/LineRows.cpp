@@ -235,9 +235,14 @@ std::vector<std::optional<LineRow>> rowsOfRecords(std::string_view output, std::
         }
         begins = lines[i].empty();
     }
-    // A last empty line closes a record and opens another one, which the end of the output closes.
-    if (begins && lines.count() != 0 && !lines.isCut()) {
-        found.emplace_back();
+    // A last empty line closes a record and opens another one, which the end of the output closes. Text behind the last
+    // line feed leaves the last record open, and an open record is not among them.
+    if (lines.count() != 0 && begins != lines.isCut()) {
+        if (begins) {
+            found.emplace_back();
+        } else {
+            found.pop_back();
+        }
     }
     return found;
 }

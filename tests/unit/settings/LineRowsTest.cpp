@@ -1,6 +1,8 @@
 #include "settings/LineRows.h"
 #include "settings/QueryRunner.h"
 
+#include <random>
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -84,6 +86,32 @@ TEST(LineRows, RowsOfRecordsMatchTheRecordsOfTheLineReading) {
         rowsOfRecords("     id = 1\n  value = a\nprotect = t\n\n     id = 1\n  value = b\nprotect = t\n", columns),
         std::vector<std::optional<LineRow>>(2))
         << "an id that comes twice belongs to neither";
+}
+
+TEST(LineRows, EveryOutputHasARowForEachRecordThatBeginsAtTheSameLine) {
+    const std::vector<std::string> pieces{
+        "\n",       "\n\n", "     id = 1\n", "     id = 2\n", "  value = a\n", "protect = t\n",
+        "id = 3\n", "text", " = ",           "     id = 4"};
+    std::mt19937 random(20260131);
+    for (int round = 0; round < 20'000; ++round) {
+        std::string output;
+        for (std::size_t n = random() % 14; n > 0; --n) {
+            output += pieces[random() % pieces.size()];
+        }
+        SCOPED_TRACE(output);
+        std::vector<std::size_t> begins{0};
+        std::size_t line = 0;
+        for (std::size_t at = 0, end = 0; (end = output.find('\n', at)) != std::string::npos; at = end + 1, ++line) {
+            if (at == end) {
+                begins.push_back(line + 1);
+            }
+        }
+        const auto rows = rowsOfRecords(output, columns);
+        ASSERT_EQ(rows.size(), recordsOfLineOutput(output).size());
+        for (std::size_t i = 0; i < rows.size(); ++i) {
+            ASSERT_TRUE(!rows[i] || rows[i]->line == begins[i]) << i;
+        }
+    }
 }
 
 }  // namespace
