@@ -7,7 +7,9 @@
 #include "settings/QueryRunner.h"
 
 #include <algorithm>
-#include <unordered_set>
+#include <charconv>
+#include <cstdint>
+#include <optional>
 
 namespace lumio {
 
@@ -42,15 +44,23 @@ Reading readingOf(const std::string& output) {
     return reading;
 }
 
-bool idsAreDifferent(const Reading& reading) {
+/// Returns true if the ids are numbers and each is greater than the one before: the table is listed in this order. A
+/// row that a value spells out has this only if its number is free and fits there.
+bool idsAscend(const Reading& reading) {
     const auto found = std::find(reading.columns.begin(), reading.columns.end(), "id");
     if (found == reading.columns.end()) {
         return true;
     }
     const auto id = static_cast<std::size_t>(found - reading.columns.begin());
-    std::unordered_set<std::string_view> ids;
-    return std::all_of(reading.rows.begin(), reading.rows.end(),
-                       [&](const LineRow& row) { return ids.insert(row.values[id]).second; });
+    std::optional<std::uint64_t> last;
+    return std::all_of(reading.rows.begin(), reading.rows.end(), [&](const LineRow& row) {
+        const std::string_view text = row.values[id];
+        std::uint64_t number = 0;
+        const auto [end, failure] = std::from_chars(text.data(), text.data() + text.size(), number);
+        const bool fits = failure == std::errc() && end == text.data() + text.size() && (!last || number > *last);
+        last = number;
+        return fits;
+    });
 }
 
 /// Returns true if the output can be read in one way only.
@@ -60,7 +70,7 @@ bool isCertain(const Reading& reading, const std::string& output) {
            output.find(replacementCharacter) == std::string::npos && !reading.rows.empty() &&
            std::none_of(reading.rows.begin(), reading.rows.end(),
                         [](const LineRow& row) { return row.values.empty(); }) &&
-           idsAreDifferent(reading);
+           idsAscend(reading);
 }
 
 std::optional<std::string> bytesOfHex(std::string_view digits) {

@@ -37,6 +37,11 @@ class PropertyText : public PropertyFixture {
             std::to_string(id) + "',cast(x'" + hexOf(value) + "' as text),'" + protect +
             "','2026-01-31 08:00:00','2026-01-31 08:00:00')");
     }
+    /// The tool's line output.
+    [[nodiscard]] std::string outputOf(const char* statement) const {
+        return adminhost::test::runProgram({"/usr/bin/sqlite3", "-line", root.path(databasePath).string(), statement})
+            .output;
+    }
     /// The value comes back from the listing and survives protection switched on and off.
     void expectKept(const std::string& value) {
         SCOPED_TRACE(value);
@@ -129,6 +134,39 @@ TEST_F(PropertyText, IdThatComesTwiceFetchesTheExactRows) {
     EXPECT_THAT(statements.take(), ElementsAre(everything, exact));
 }
 
+TEST_F(PropertyText, IdsOutOfOrderFetchTheExactRows) {
+    // One reading each, with an id that no row has.
+    for (const char* id : {"1", "9", "+3", "3x", "", "99999999999999999999"}) {
+        SCOPED_TRACE(id);
+        sql("delete from properties");
+        store(2, "x\n   protect = f\ncreated_at = a\nupdated_at = b\n\n        id = " + std::string(id) +
+                     "\n      name = y\n     value = z");
+        store(4, "y");
+        const adminhost::test::RecordedStatements statements(root);
+        EXPECT_EQ(listed().size(), 2U);
+        EXPECT_THAT(statements.take(), ElementsAre(everything, exact));
+    }
+}
+
+TEST_F(PropertyText, RowThatAValueSpellsOutWithAFreeIdInOrderIsNotNoticedBecauseTheOutputIsTheSameAsForTwoRows) {
+    store(1, "x");
+    store(3, "z");
+    const std::string two = outputOf(everything);
+    sql("delete from properties");
+    store(1,
+          "x\n   protect = f\ncreated_at = 2026-01-31 08:00:00\nupdated_at = 2026-01-31 08:00:00\n\n"
+          "        id = 3\n      name = n3\n     value = z");
+    ASSERT_EQ(outputOf(everything), two) << "no reader of this text can distinguish the two tables";
+    EXPECT_EQ(listed().size(), 2U);
+    // A change reads the row by its id, and so exactly: the value that is kept is the stored one.
+    const std::string stored = sql("select hex(value) from properties");
+    EXPECT_EQ(change({{"_id_", "1"}, {"protect", true}}), std::nullopt);
+    EXPECT_EQ(change({{"_id_", "1"}, {"protect", false}}), std::nullopt);
+    EXPECT_EQ(change({{"_id_", "3"}, {"value", "other"}}), std::nullopt);
+    EXPECT_EQ(Property::deletePropertyWithID("3"), std::nullopt);
+    EXPECT_EQ(sql("select hex(value) from properties"), stored);
+}
+
 TEST_F(PropertyText, ExactRowsThatCannotBeFetchedAreTheListingsFailure) {
     store(1, "x\n   protect = t");
     root.writeTool("/usr/bin/sqlite3",
@@ -185,12 +223,18 @@ TEST_F(PropertyText, RandomValuesAreReadBackByteForByte) {
     std::mt19937 random(20260131);
     for (int round = 0; round < rounds; ++round) {
         const std::size_t kinds = round % 4 == 0 ? pieces.size() : harmless;
+        // In some rounds a row spells out another one with a free id. Behind the last row that would be in order.
+        const int forged = round % 4 == 1 ? static_cast<int>(random() % (rows - 1)) : -1;
         std::string script = "begin; delete from properties;\n";
         std::vector<std::string> values;
         for (int i = 0; i < rows; ++i) {
             std::string value;
             for (std::size_t n = random() % 9; n > 0; --n) {
                 value += pieces[random() % kinds];
+            }
+            if (i == forged) {
+                value = "v\n   protect = f\ncreated_at = \nupdated_at = \n\n        id = " +
+                        std::to_string(rows + random() % rows) + "\n      name = n\n     value = w";
             }
             script += "insert into properties values(" + std::to_string(i) + ",'n',cast(x'" + hexOf(value) +
                       "' as text),'f','','');\n";
