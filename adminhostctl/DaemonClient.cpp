@@ -256,7 +256,8 @@ RequestReport DaemonClient::report(const std::string& requestId) {
     for (const Dictionary* change : dictionariesAt(*said, "changes")) {
         report.changes.push_back({rawTextAt(*change, "section"), rawTextAt(*change, "identity"),
                                   rawTextAt(*change, "name"), rawTextAt(*change, "key"), change->get("from"),
-                                  change->get("to"), change->get("secret").boolean().value_or(false)});
+                                  change->get("to"), change->get("secret").boolean().value_or(false),
+                                  change->get("unverified").boolean().value_or(false)});
     }
     for (const Dictionary* gap : dictionariesAt(*said, "notDone")) {
         report.notDone.push_back(

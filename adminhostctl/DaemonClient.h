@@ -36,6 +36,7 @@ struct ReportedChange {
     Value from;
     Value to;
     bool secret = false;
+    bool unverified = false;  ///< nothing was changed if the element does not exist
 };
 
 /// A part of a request that was not carried out, or was ignored.

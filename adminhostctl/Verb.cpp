@@ -32,7 +32,7 @@ std::string changeText(const ReportedChange& change) {
     };
     const std::string& name = change.name.empty() ? change.identity : change.name;
     return change.section + (name.empty() ? "" : '.' + name) + (change.key.empty() ? "" : '.' + change.key) + ": " +
-           valueText(change.from) + " -> " + valueText(change.to);
+           valueText(change.from) + " -> " + valueText(change.to) + (change.unverified ? " (if it existed)" : "");
 }
 
 ExitStatus perform(const Context& context, Words words) {

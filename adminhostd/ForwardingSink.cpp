@@ -43,14 +43,20 @@ void ForwardingSink::write(std::string_view event) noexcept {
 }
 
 void ForwardingSink::changed(Change change) {
-    if (change.secret && _former) {
-        _former->hide(change);
+    if (change.secret) {
+        becomesSecret({change.section, change.identity, change.key});
     }
     // Beyond the bound, secret ones are kept: their former values are hidden once more when the entry is added.
     if (change.secret || _changes.size() < changesMaximum) {
         _changes.push_back(change);
     }
     send(_descriptor, std::move(change));
+}
+
+void ForwardingSink::becomesSecret(const SecretPart& part) {
+    if (_former) {
+        _former->hide(part);
+    }
 }
 
 void ForwardingSink::notDone(NotDone part) {

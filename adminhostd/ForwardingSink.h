@@ -36,6 +36,7 @@ class ForwardingSink final : public LogSink, public ReportSink {
     /// A secret change first hides the former values in the plug-in's history: neither a worker that is killed in the
     /// middle of the operation nor the number of its changes may leave one readable.
     void changed(Change change) override;
+    void becomesSecret(const SecretPart& part) override;
     void notDone(NotDone part) override;
 
   private:

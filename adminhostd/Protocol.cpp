@@ -108,7 +108,8 @@ constexpr auto members<Change> = std::tuple(member("change.section", &Change::se
                                             member("change.name", &Change::name), member("change.key", &Change::key),
                                             member("change.from", &Change::from), member("change.to", &Change::to),
                                             member("change.secret", &Change::secret),
-                                            member("change.undo", &Change::undo));
+                                            member("change.undo", &Change::undo),
+                                            member("change.unverified", &Change::unverified));
 template <>
 constexpr auto members<NotDone> = std::tuple(member("notDone.keyPath", &NotDone::keyPath),
                                              member("notDone.reason", &NotDone::reason),

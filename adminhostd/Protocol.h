@@ -46,10 +46,10 @@ enum class Outcome {
 struct Caller {
     uid_t uid = 0;
     pid_t pid = 0;
+    uid_t login = 0;  ///< of its login session; noLogin: none
     bool operator==(const Caller&) const = default;
 };
 
-    uid_t login = 0;  ///< of its login session; noLogin: none
 // From the front to the worker.
 
 /// First, and once. The nodes have no credentialsDirectory: the worker knows it.

@@ -40,7 +40,8 @@ void RequestRecord::add(const Change& change) {
                               {"from", change.from},
                               {"to", change.to},
                               {"secret", change.secret},
-                              {"undo", change.undo}});
+                              {"undo", change.undo},
+                              {"unverified", change.unverified ? Value(true) : Value()}});
 }
 
 void RequestRecord::add(const NotDone& part) {

@@ -215,18 +215,18 @@ void logNewer(std::size_t count) {
     }
 }
 
-bool sameThing(const Dictionary& kept, const Change& change) {
-    return kept.get("section") == Value(change.section) && kept.get("identity") == Value(change.identity) &&
-           kept.get("key") == Value(change.key);
+bool isAbout(const Dictionary& kept, const SecretPart& part) {
+    return kept.get("section") == Value(part.section) && kept.get("identity") == Value(part.identity) &&
+           kept.get("key") == Value(part.key);
 }
 
 /// Replaces what the changes hold of these secrets by "(secret)"; returns true if there was anything to replace.
-bool hideIn(Array& changes, const std::vector<const Change*>& secret) {
+bool hideIn(Array& changes, const std::vector<SecretPart>& secret) {
     bool hid = false;
     for (Value& change : changes) {
         Dictionary* kept = change.dictionary();
         if (kept == nullptr || kept->get("secret") == Value(true) ||
-            std::none_of(secret.begin(), secret.end(), [&](const Change* one) { return sameThing(*kept, *one); })) {
+            std::none_of(secret.begin(), secret.end(), [&](const SecretPart& part) { return isAbout(*kept, part); })) {
             continue;
         }
         for (const std::string_view key : {"from", "to"}) {
@@ -250,6 +250,9 @@ Dictionary dictionaryOf(const Change& change) {
         }
     }
     kept.set("secret", change.secret);
+    if (change.unverified) {
+        kept.set("unverified", true);
+    }
     return kept;
 }
 
@@ -390,7 +393,7 @@ std::optional<Error> SettingsHistory::complete(std::uint64_t number, const Dicti
     return replacePlainly(*about, file);
 }
 
-std::optional<Error> SettingsHistory::hideFormerValues(const std::vector<const Change*>& secret) const {
+std::optional<Error> SettingsHistory::hideFormerValues(const std::vector<SecretPart>& secret) const {
     std::optional<Error> failed;
     for (const std::uint64_t number : secret.empty() ? std::vector<std::uint64_t>() : numbersIn(_resources)) {
         const HostPath file = resourceEntryOf(_resources, number);
@@ -408,11 +411,11 @@ std::optional<Error> SettingsHistory::hideFormerValues(const std::vector<const C
 }
 
 std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& changes, const Dictionary& about) const {
-    std::vector<const Change*> secret;
+    std::vector<SecretPart> secret;
     Array kept;
     for (const Change& change : changes) {
         if (change.secret && !change.identity.empty()) {
-            secret.push_back(&change);
+            secret.push_back({change.section, change.identity, change.key});
         }
         if (change.section != "settings") {
             kept.emplace_back(dictionaryOf(change));
@@ -504,7 +507,7 @@ void SettingsHistory::removeUnfinished() const {
 
 FormerValues::FormerValues(std::string_view plugin) : _resources(resourcesOf(directoryOf(plugin))) {}
 
-void FormerValues::hide(const Change& change) {
+void FormerValues::hide(const SecretPart& part) {
     if (!_plain) {
         // One reading for all changes of the operation: with all entries kept it takes a while.
         _plain.emplace();
@@ -520,15 +523,15 @@ void FormerValues::hide(const Change& change) {
             }
         }
     }
-    const auto found = _plain->find({change.section, change.identity, change.key});
-    if (change.identity.empty() || found == _plain->end()) {
+    const auto found = _plain->find({part.section, part.identity, part.key});
+    if (part.identity.empty() || found == _plain->end()) {
         return;
     }
     for (const std::uint64_t number : found->second) {
         const HostPath file = resourceEntryOf(_resources, number);
         auto entry = readDictionary(file);
         Value* list = entry ? entry->find("changes") : nullptr;
-        if (list != nullptr && list->array() != nullptr && hideIn(*list->array(), {&change})) {
+        if (list != nullptr && list->array() != nullptr && hideIn(*list->array(), {part})) {
             static_cast<void>(replacePlainly(*entry, file));
         }
     }

@@ -69,7 +69,7 @@ class SettingsHistory {
     [[nodiscard]] std::optional<Error> keepOutsideEdit(const Dictionary& snapshot, const Dictionary& about) const;
     [[nodiscard]] std::optional<Error> add(const std::vector<HostPath>& files, Dictionary about,
                                            std::uint64_t& number) const;
-    [[nodiscard]] std::optional<Error> hideFormerValues(const std::vector<const Change*>& secret) const;
+    [[nodiscard]] std::optional<Error> hideFormerValues(const std::vector<SecretPart>& secret) const;
 
     HostPath _directory;
     HostPath _resources;
@@ -82,9 +82,9 @@ class FormerValues {
   public:
     explicit FormerValues(std::string_view plugin);
 
-    /// Replaces the values of what this secret change is about by "(secret)" in all entries. An entry that cannot be
-    /// replaced is left as it is: keepResources() tries again and returns the error.
-    void hide(const Change& change);
+    /// Replaces the values of this part by "(secret)" in all entries. An entry that cannot be replaced is left as it
+    /// is: keepResources() tries again and returns the error.
+    void hide(const SecretPart& part);
 
   private:
     using Thing = std::array<std::string, 3>;  ///< section, identity, key

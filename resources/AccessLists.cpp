@@ -142,7 +142,8 @@ void Resource::setACLEnabled(bool enabled) {
     _aclEnabled = enabled;
     const Value before = _data && _data->contains(key) ? Value(booleanOf(_data->get(key))) : Value();
     if (before != Value(enabled)) {
-        reportChange(*uuid, key, before, enabled, {{key, !enabled}});
+        // Without the record, the statement succeeds also if no row has the uuid.
+        reportChange(*uuid, key, before, enabled, {{key, !enabled}}, !_data);
     }
 }
 

@@ -63,12 +63,13 @@ void makeUtf8(Dictionary& row) {
     }
 }
 
-void reportRemoved(const std::string& id, const std::string& name) {
+void reportRemoved(const std::string& id, const std::string& name, bool wasRead) {
     Change change;
     change.section = "properties";
     change.identity = id;
     change.name = name;
     change.from = name.empty() ? id : name;
+    change.unverified = !wasRead;
     adminhost::reportChange(std::move(change));
 }
 
@@ -201,7 +202,7 @@ std::optional<Error> Property::deletePropertyWithID(const Value& id) {
     if (error) {
         logEvent("error deleting property with ID:\n" + textOf(id) + "\n  error:: " + textOf(error));
     } else {
-        reportRemoved(textOf(id), {});
+        reportRemoved(textOf(id), {}, false);
     }
     return error;
 }
@@ -219,7 +220,7 @@ std::optional<Error> Property::delete_() {
                  "\n  error:: " + textOf(error));
         reportNotDone("", "not removed: the database refused it", toolWords(*error));
     } else {
-        reportRemoved(*id, adminhost::utf8Of(textOf(stored("name"))));
+        reportRemoved(*id, adminhost::utf8Of(textOf(stored("name"))), true);
     }
     return error;
 }
@@ -283,6 +284,9 @@ std::optional<Error> Property::write() {
         // No row matches, and every process on the machine can read a tool's arguments.
         cleanseValue(working);
         working.remove("value");
+    }
+    if (isUpdate && id && isProtected && !wasProtected) {
+        adminhost::announceSecret({section(), *id, "value"});
     }
     std::string statement = isUpdate ? updateStatement(working, id) : insertStatement(working);
     const adminhost::ScopedCleanse wipeStatement(statement);

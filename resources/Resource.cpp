@@ -177,8 +177,8 @@ void Resource::reportNotDone(std::string_view key, std::string reason, std::stri
     adminhost::reportNotDone({std::move(path), std::move(reason), std::move(toolMessage)});
 }
 
-void Resource::reportChange(std::string_view identity, std::string_view key, Value from, Value to,
-                            Dictionary undo) const {
+void Resource::reportChange(std::string_view identity, std::string_view key, Value from, Value to, Dictionary undo,
+                            bool unverified) const {
     adminhost::Change change;
     change.section = section();
     change.identity = identity;
@@ -187,6 +187,7 @@ void Resource::reportChange(std::string_view identity, std::string_view key, Val
     change.key = key;
     change.from = std::move(from);
     change.to = std::move(to);
+    change.unverified = unverified;
     if (!undo.empty()) {
         undo.set("_id_", identity);
         change.undo = Dictionary{{section(), adminhost::Array{std::move(undo)}}};

@@ -215,7 +215,7 @@ class Resource {
     void reportNotDone(std::string_view key, std::string reason, std::string toolMessage = {}) const;
     /// Reports a change. The undo is what the entry must hold beside "_id_" to undo it; empty if it cannot be undone.
     void reportChange(std::string_view identity, std::string_view key, adminhost::Value from, adminhost::Value to,
-                      adminhost::Dictionary undo) const;
+                      adminhost::Dictionary undo, bool unverified = false) const;
     /// The list in the configuration that resources of this type are in: "cameras".
     [[nodiscard]] virtual std::string section() const { return std::string(resourceType()) + "s"; }
 

@@ -62,8 +62,9 @@ std::string elementChangeText(const StateForm& form, const Dictionary& change) {
     const bool isKnown = list != form.lists().end();
     std::string entry = shown(isKnown ? list->section : textAt(change, "section")) + '.' +
                         tomlKey(name.empty() ? textAt(change, "identity") : name);
+    const std::string doubt = change.get("unverified") == Value(true) ? " (if it existed)" : "";
     if (key.empty()) {
-        return entry + (from.isNull() ? ": (not present) -> (present)" : ": (present) -> (not present)");
+        return entry + (from.isNull() ? ": (not present) -> (present)" : ": (present) -> (not present)") + doubt;
     }
     const FieldForm* field = isKnown ? list->fieldOf(key) : nullptr;
     entry += '.' + shown(field == nullptr ? key : field->inFile);
@@ -75,7 +76,7 @@ std::string elementChangeText(const StateForm& form, const Dictionary& change) {
                (from.isNull() ? ": (not allowed) -> (allowed)" : ": (allowed) -> (not allowed)");
     }
     // The service's tools change elements without reading them first.
-    return entry + ": " + valueText(from, "(not known)") + " -> " + valueText(to, "(not set)");
+    return entry + ": " + valueText(from, "(not known)") + " -> " + valueText(to, "(not set)") + doubt;
 }
 
 /// What an entry changed, a line each.

@@ -17,6 +17,12 @@ void reportChange(Change change) {
     }
 }
 
+void announceSecret(const SecretPart& part) {
+    if (theSink != nullptr) {
+        theSink->becomesSecret(part);
+    }
+}
+
 void reportNotDone(NotDone part) {
     if (theSink != nullptr) {
         theSink->notDone(std::move(part));

@@ -24,6 +24,9 @@ struct ADMINHOST_EXPORT Change {
     Value to;              ///< null: absent now, or secret
     bool secret = false;   ///< from and to are withheld
     Value undo;            ///< the part of a request's "configuration" that undoes it; null: cannot be undone
+    /// The element was not read before, and what changes it succeeds in the same way if it does not exist: then nothing
+    /// was changed.
+    bool unverified = false;
 
     bool operator==(const Change&) const = default;
 };
@@ -37,9 +40,19 @@ struct ADMINHOST_EXPORT NotDone {
     bool operator==(const NotDone&) const = default;
 };
 
+/// A part of an element whose value becomes a secret.
+struct ADMINHOST_EXPORT SecretPart {
+    std::string section;
+    std::string identity;
+    std::string key;
+
+    bool operator==(const SecretPart&) const = default;
+};
+
 class ADMINHOST_EXPORT ReportSink {
   public:
     virtual void changed(Change change) = 0;
+    virtual void becomesSecret(const SecretPart& part) = 0;
     virtual void notDone(NotDone part) = 0;
 
   protected:
@@ -50,5 +63,9 @@ class ADMINHOST_EXPORT ReportSink {
 ADMINHOST_EXPORT void setReportSink(ReportSink* sink) noexcept;
 ADMINHOST_EXPORT void reportChange(Change change);
 ADMINHOST_EXPORT void reportNotDone(NotDone part);
+/// Announces that the value is about to become a secret. Its former values are hidden before this returns, so that none
+/// stays readable if the process is killed between the change and its report. They stay hidden if the change then
+/// fails.
+ADMINHOST_EXPORT void announceSecret(const SecretPart& part);
 
 }  // namespace adminhost

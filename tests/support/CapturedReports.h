@@ -15,9 +15,11 @@ class CapturedReports final : public ReportSink {
     ~CapturedReports() { setReportSink(nullptr); }
 
     void changed(Change change) override { changes.push_back(std::move(change)); }
+    void becomesSecret(const SecretPart& part) override { announced.push_back(part); }
     void notDone(NotDone part) override { parts.push_back(std::move(part)); }
 
     std::vector<Change> changes;
+    std::vector<SecretPart> announced;
     std::vector<NotDone> parts;  ///< not carried out
 };
 

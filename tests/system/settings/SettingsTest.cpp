@@ -450,6 +450,33 @@ TEST_F(Settings, PropertyThatBecomesProtectedLeavesNoPlainValueInTheHistory) {
     EXPECT_THAT(ctl({"history"}).output, HasSubstr("properties.key.value: (secret) changed"));
 }
 
+TEST_F(Settings, PropertyThatWasProtectedByAKilledWorkerLeavesNoPlainValueInTheHistory) {
+    const auto change = [&](const std::string& entry) {
+        return post("writeSettings", R"({"configuration":{"properties":[)" + entry + "]}}").status;
+    };
+    ASSERT_EQ(change(R"({"_newid_":true,"name":"key","value":"planted-one"})"), 200);
+    const std::string id = root.sql("select id from properties where name='key'");
+    const std::string entry = R"({"_id_":")" + id.substr(0, id.find('\n')) + R"(",)";
+    ASSERT_EQ(change(entry + R"("value":"planted-two"})"), 200);
+    ASSERT_THAT(daemon.connect().get("/v1/lumio/history").body, HasSubstr("planted-two"));
+    // The statement is carried out, and the worker does not live to report it.
+    root.write("/usr/bin/sqlite3",
+               "#!/bin/sh\n/usr/bin/sqlite3 \"$@\" || exit\ncase \"$3\" in update*) kill -9 $PPID;; esac\n");
+    std::filesystem::permissions(root.disk("/usr/bin/sqlite3"), std::filesystem::perms(0755));
+    EXPECT_EQ(change(entry + R"("protect":true})"), 500);
+    EXPECT_EQ(root.sql("select protect from properties where name='key'"), "t\n");
+    EXPECT_THAT(daemon.connect().get("/v1/lumio/history").body, Not(HasSubstr("planted-")));
+}
+
+TEST_F(Settings, RemovalOfAPropertyThatDoesNotExistIsNotShownAsCertain) {
+    const HttpReply reply =
+        post("writeSettings", R"({"configuration":{"properties":[{"_id_":"9876","_obsoleteid_":true}]}})");
+    ASSERT_EQ(reply.status, 200);
+    const Value record = valueOf(daemon.connect().get("/v1/requests/" + reply.headers.at("request-id")));
+    EXPECT_EQ(record.dictionary()->get("changes").array()->front().dictionary()->get("unverified"), Value(true));
+    EXPECT_THAT(ctl({"history"}).output, HasSubstr("properties.9876: (present) -> (not present) (if it existed)\n"));
+}
+
 TEST_F(Settings, UnknownPluginHasNoHistory) {
     EXPECT_EQ(daemon.connect().get("/v1/other/history").status, 404);
     EXPECT_EQ(*valueOf(daemon.connect().get("/v1/lumio/history")).dictionary()->get("history").array(), Array{});

@@ -66,6 +66,19 @@ TEST_F(Forwarding, FormerValueIsHiddenBeforeTheFrontIsSentTheSecretChange) {
     }
 }
 
+TEST_F(Forwarding, FormerValueIsHiddenWhenItsSecretIsAnnounced) {
+    ASSERT_FALSE(history.keepResources({changeOf("3", "plain", false)}, {}));
+    ForwardingSink sink(ends[0]);
+    announceSecret({"properties", "3", "value"});
+    EXPECT_EQ(formerValue(), Value("plain")) << "no operation has begun";
+    sink.beginOperation("lumio");
+    announceSecret({"properties", "4", "value"});
+    EXPECT_EQ(formerValue(), Value("plain")) << "another property's";
+    announceSecret({"properties", "3", "value"});
+    EXPECT_EQ(formerValue(), Value("(secret)"));
+    EXPECT_TRUE(sink.takeChanges().empty()) << "an announcement is no change";
+}
+
 TEST_F(Forwarding, SecretChangeAfterTheMaximumOfChangesHidesTheFormerValuesAndIsKept) {
     ASSERT_FALSE(history.keepResources({changeOf("3", "plain", false)}, {}));
     std::thread front([&] {

@@ -96,7 +96,7 @@ std::vector<ToFront> messagesToFront() {
               .problems = {"none", ""}},
         Hello{},
         Log{"an event"},
-        Change{"cameras", "U", "Studio", "users", Value(1), Value("b"), true, Dictionary{{"k", 1}}},
+        Change{"cameras", "U", "Studio", "users", Value(1), Value("b"), true, Dictionary{{"k", 1}}, true},
         Change{"settings", "", "", "k", {}, {}, false, {}},
         NotDone{"configuration.a", "why", "words"}};
     for (const Outcome outcome : outcomes()) {

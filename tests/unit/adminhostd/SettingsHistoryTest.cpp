@@ -195,6 +195,35 @@ TEST_F(HistoryTest, ValueThatBecomesSecretIsReplacedInAllKeptEntries) {
     EXPECT_EQ(entries[1].dictionary()->get("changes").array()->front().dictionary()->get("from"), Value("of another"));
 }
 
+TEST_F(HistoryTest, OnlyTheValuesOfThePartThatBecomesSecretAreReplaced) {
+    const Change others[] = {resourceChange("name", "plain", "other"), resourceChange("note", "plain", "other")};
+    Change workflow = resourceChange("value", "plain", "other");
+    workflow.section = "workflows";
+    ASSERT_FALSE(
+        history.keepResources({resourceChange("value", "plain", "other"), others[0], others[1], workflow}, {}));
+    const auto changesOfFirst = [&] { return *history.resourceEntries()[0].dictionary()->get("changes").array(); };
+    const Array before = changesOfFirst();
+    ASSERT_FALSE(history.keepResources({resourceChange("value", nullptr, nullptr, true)}, {}));
+    const Array after = changesOfFirst();
+    EXPECT_EQ(after[0].dictionary()->get("from"), Value("(secret)"));
+    for (std::size_t i = 1; i < 4; ++i) {
+        EXPECT_EQ(after[i], before[i]) << "the same text elsewhere is not this secret";
+    }
+    FormerValues former("lumio");
+    former.hide({"properties", "3", "name"});
+    EXPECT_EQ(changesOfFirst()[1].dictionary()->get("from"), Value("(secret)"));
+    EXPECT_EQ(changesOfFirst()[2], before[2]);
+}
+
+TEST_F(HistoryTest, UnverifiedChangeIsKeptAsSuch) {
+    Change removal = resourceChange("", "3", nullptr);
+    removal.unverified = true;
+    ASSERT_FALSE(history.keepResources({removal, resourceChange("value", 1, 2)}, {}));
+    const Array changes = *history.resourceEntries()[0].dictionary()->get("changes").array();
+    EXPECT_EQ(changes[0].dictionary()->get("unverified"), Value(true));
+    EXPECT_FALSE(changes[1].dictionary()->contains("unverified"));
+}
+
 TEST_F(HistoryTest, ValueThatIsSetAndBecomesSecretInOneRequestIsNotKept) {
     ASSERT_FALSE(
         history.keepResources({resourceChange("value", "first plain", "second plain"),

@@ -6,6 +6,8 @@
 #include "tests/unit/resources/FixedDirectory.h"
 #include "tests/unit/resources/PropertyFixture.h"
 
+#include <functional>
+
 namespace lumio {
 namespace {
 
@@ -32,7 +34,7 @@ TEST_F(CameraReports, EachChangeOnDiskIsReportedWithItsUndo) {
         reports.changes,
         ElementsAre(
             Change{"cameras", "C-7", "", "access_control_enabled", nullptr, false, false,
-                   undoOf("cameras", {{"access_control_enabled", true}, {"_id_", "C-7"}})},
+                   undoOf("cameras", {{"access_control_enabled", true}, {"_id_", "C-7"}}), true},
             Change{"cameras", "C-7", "", "users", nullptr, "bo", false,
                    undoOf("cameras", {{"_id_", "C-7"},
                                       {"allowedUsersAndGroups",
@@ -43,6 +45,17 @@ TEST_F(CameraReports, EachChangeOnDiskIsReportedWithItsUndo) {
                            {"allowedUsersAndGroups",
                             Array{Dictionary{{"type", "group"}, {"shortName", "editors"}, {"_newid_", true}}}}})}));
     EXPECT_THAT(reports.parts, IsEmpty());
+}
+
+TEST_F(CameraReports, SwitchOfARecordThatWasNotReadIsUnverified) {
+    process({Dictionary{{"_id_", "no such camera"}, {"access_control_enabled", true}}});
+    ASSERT_EQ(reports.changes.size(), 1U);
+    EXPECT_TRUE(reports.changes[0].unverified);
+    const auto studio = Camera::initWithGUID("C-7");
+    ASSERT_NE(studio->data(), nullptr);
+    studio->setACLEnabled(false);
+    ASSERT_EQ(reports.changes.size(), 2U);
+    EXPECT_FALSE(reports.changes[1].unverified);
 }
 
 TEST_F(CameraReports, RemovalIsReportedAndCannotBeTakenBack) {
@@ -180,8 +193,52 @@ TEST_F(PropertyReports, ChangesOfAPropertyAreReportedWithTheirUndo) {
                                                     undoOf("properties", {{"_id_", "1"}, {"protect", false}})},
                                              Change{"properties", "1", "m", "value", nullptr, nullptr, true, nullptr},
                                              Change{"properties", "1", "m", "value", nullptr, nullptr, true, nullptr},
-                                             Change{"properties", "1", "", "", "1", nullptr, false, nullptr}));
+                                             Change{"properties", "1", "", "", "1", nullptr, false, nullptr, true}));
     EXPECT_THAT(reports.parts, IsEmpty());
+}
+
+TEST_F(PropertyReports, RemovalByAnIdIsUnverifiedBecauseTheRowIsNotRead) {
+    process({{"_id_", "77"}, {"_obsoleteid_", true}});
+    EXPECT_THAT(reports.changes, ElementsAre(Change{"properties", "77", "", "", "77", nullptr, false, nullptr, true}));
+    sql("insert into properties(id,name) values(1,'n')");
+    std::optional<Error> error;
+    EXPECT_EQ(Property::allPropertiesWithError(error)->front()->delete_(), std::nullopt);
+    EXPECT_EQ(reports.changes.back(), (Change{"properties", "1", "n", "", "n", nullptr, false, nullptr, false}));
+}
+
+/// Notes what is stored at the moment of each announcement.
+class StoredMeanwhile final : public adminhost::ReportSink {
+  public:
+    explicit StoredMeanwhile(std::function<std::string()> stored) : _stored(std::move(stored)) { setReportSink(this); }
+    StoredMeanwhile(const StoredMeanwhile&) = delete;
+    StoredMeanwhile& operator=(const StoredMeanwhile&) = delete;
+    ~StoredMeanwhile() { adminhost::setReportSink(nullptr); }
+    void changed(Change) override {}
+    void notDone(NotDone) override {}
+    void becomesSecret(const adminhost::SecretPart& part) override {
+        noted.push_back(part.section + '.' + part.identity + '.' + part.key + ": " + _stored());
+    }
+
+    std::vector<std::string> noted;
+
+  private:
+    std::function<std::string()> _stored;
+};
+
+TEST_F(PropertyReports, ValueIsAnnouncedAsSecretBeforeItIsProtectedAndAlsoIfThatFails) {
+    sql("insert into properties(id,name,value,protect) values(1,'a','v','f'),(2,'b','w','t')");
+    StoredMeanwhile sink([&] { return sql("select value,protect from properties where id=1"); });
+    process({{"_id_", "2"}, {"value", "other"}});
+    process({{"_id_", "1"}, {"name", "c"}});
+    process({{"_id_", "77"}, {"protect", true}});
+    EXPECT_THAT(sink.noted, IsEmpty());
+    process({{"_id_", "1"}, {"protect", true}});
+    EXPECT_THAT(sink.noted, ElementsAre("properties.1.value: v|f\n"));
+    sql("update properties set value='v',protect='f' where id=1;"
+        "create trigger refuse before update on properties begin select raise(abort,'no'); end");
+    process({{"_id_", "1"}, {"protect", true}, {"value", "x"}});
+    EXPECT_EQ(sql("select protect from properties where id=1"), "f\n");
+    EXPECT_EQ(sink.noted.size(), 2U);
 }
 
 TEST_F(PropertyReports, ValueThatBecomesProtectedIsReportedAsSecretOnceWhetherOrNotItIsSent) {
