@@ -170,7 +170,8 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
         }
     }
     if (configuration.tryOnly) {
-        for (const auto& problems : {nodeProblems, _plugins.needsThatAreNotUsable(), unreachableNodes()}) {
+        // The directory's servers are not tried: the check runs before each start, which must not wait for them.
+        for (const auto& problems : {nodeProblems, _plugins.needsThatAreNotUsable()}) {
             hello.problems.insert(hello.problems.end(), problems.begin(), problems.end());
         }
     }
