@@ -1,5 +1,6 @@
 // The state of a service as the service manager has it: with a real systemd if the test runs as root, else with a mock.
 
+#include "platform/files/Path.h"
 #include "platform/service/ServiceState.h"
 #include "tests/support/Environment.h"
 #include "tests/support/ServiceManager.h"
@@ -52,6 +53,15 @@ class ServiceState : public testing::Test {
   protected:
     void SetUp() override { setServiceManager(ServiceManager::systemd); }
 };
+
+TEST_F(ServiceState, SystemdIsTheDefaultWhereItIsTheMachinesServiceManager) {
+    // The mock has only its name on the bus.
+    EXPECT_EQ(defaultServiceManager(),
+              test::isRealServiceManager() ? ServiceManager::systemd : ServiceManager::pidFile);
+    setSystemRoot("/tmp");
+    EXPECT_EQ(defaultServiceManager(), ServiceManager::pidFile);
+    setSystemRoot("/");
+}
 
 TEST_F(ServiceState, ActiveUnitIsRunningAndStoppedOneIsNot) {
     addUnit("org.example.plain.service", unitThat("ExecStart=/bin/sleep 1000"));

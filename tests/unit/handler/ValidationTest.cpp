@@ -1,6 +1,7 @@
 #include "handler/LumioRequestHandler.h"
 #include "platform/directory/LocalAccounts.h"
 #include "tests/support/TemporaryRoot.h"
+#include "tests/unit/resources/FixedDirectory.h"
 
 #include <filesystem>
 #include <fstream>
@@ -119,6 +120,24 @@ TEST_F(Validation, EmptyUsernameIsAnOwnerThatCannotBeSet) {
 TEST_F(Validation, OwnerOfDigitsOnlyIsAnAccountName) {
     EXPECT_EQ(handler.validateSharedFilesystem("/shared", "12345"), 0U);
     EXPECT_EQ(handler.validateSharedFilesystem("/shared", std::to_string(::geteuid())), 3U) << "not a user id";
+}
+
+TEST_F(Validation, OwnerIsTheFirstRecordThatTheDirectoryFinds) {
+    const auto node = [](const std::string& name, const std::string& id) {
+        DirectoryRecord person = record(adminhost::directory::users, "twice", std::nullopt);
+        person.attributes[std::string(adminhost::directory::uniqueID)] = {id};
+        return adminhost::DirectoryNodeSource{
+            name, [person] { return std::make_unique<FixedNode>(std::vector<DirectoryRecord>{person}); }};
+    };
+    const std::string self = std::to_string(::geteuid());
+    adminhost::setDirectoryNodes({node("/A", self), node("/B", "not a number")});
+    EXPECT_EQ(handler.validateSharedFilesystem("/shared", "twice"), 0U);
+    adminhost::setDirectoryNodes({node("/B", "not a number"), node("/A", self)});
+    EXPECT_EQ(handler.validateSharedFilesystem("/shared", "twice"), 3U);
+    for (const char* id : {"-1", "4294967295", "99999999999", "", " 0", "0x0"}) {
+        adminhost::setDirectoryNodes({node("/A", id)});
+        EXPECT_EQ(handler.validateSharedFilesystem("/shared", "twice"), 3U) << "user id " << id;
+    }
 }
 
 TEST_F(Validation, DirectoryThatFailsMeansThatTheOwnerCannotBeSet) {
