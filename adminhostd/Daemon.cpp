@@ -1,6 +1,7 @@
 #include "adminhostd/Daemon.h"
 
 #include "adminhostd/Front.h"
+#include "adminhostd/FrontChecks.h"
 #include "adminhostd/ListeningSocket.h"
 #include "adminhostd/Notify.h"
 #include "adminhostd/PluginSelection.h"
@@ -50,7 +51,7 @@ class Daemon {
           _signals(stopSignals()),
           _front({workerConfiguration(options, plugins, tools.directory()), options.logToStandardError,
                   options.queueLimit, options.deadline},
-                 plugins.refused) {}
+                 plugins.refused, FrontChecks(options)) {}
 
     void run() {
         for (;;) {

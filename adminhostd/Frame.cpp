@@ -86,7 +86,7 @@ std::optional<Frame> FrameReader::next() {
     }
     std::memcpy(&header, bytes.data(), sizeof header);
     if (header.magic != magic || header.type < static_cast<std::uint32_t>(FrameType::configure) ||
-        header.type > static_cast<std::uint32_t>(FrameType::answer) || !fits(header)) {
+        header.type > static_cast<std::uint32_t>(FrameType::last) || !fits(header)) {
         _broken = true;
         return std::nullopt;
     }

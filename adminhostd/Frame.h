@@ -26,6 +26,9 @@ enum class FrameType : std::uint32_t {
     change,
     notDone,
     answer,
+    diagnose,
+    readLog,
+    last = readLog,
 };
 
 constexpr std::size_t frameMaximum = std::size_t{128} << 20U;  ///< bytes of payload and bytes together

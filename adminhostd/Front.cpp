@@ -5,8 +5,10 @@
 #include "platform/text/Utf8.h"
 
 #include <algorithm>
+#include <charconv>
 #include <functional>
 #include <memory>
+#include <system_error>
 #include <utility>
 
 #include <fmt/format.h>
@@ -18,6 +20,10 @@ namespace {
 
 constexpr const char* retrySeconds = "1";
 constexpr std::size_t keptName = 100;  ///< bytes of an unknown name that are remembered and logged
+constexpr std::string_view doctor = "doctor";
+constexpr auto doctorBound = std::chrono::seconds(60);
+constexpr auto doctorWait = std::chrono::seconds(20);  ///< for the worker, while it runs another operation
+constexpr auto logBound = std::chrono::seconds(10);
 
 HttpAnswer errorAnswer(unsigned status, std::string_view code, std::string_view message) {
     return {status, Dictionary{{"error", code}, {"message", message}}, {}};
@@ -136,6 +142,9 @@ HttpAnswer answerFor(protocol::Answer& answer) {
             return errorAnswer(504, "DEADLINE_EXCEEDED", "The command did not end in time and was stopped.");
         case Outcome::locked:
             return retryLater("WRITE_LOCKED", answer.message);
+        case Outcome::absent:
+            return errorAnswer(404, answer.error, answer.message);
+        case Outcome::checked:  // doctorAnswer()
         case Outcome::broken:
             break;
     }
@@ -153,6 +162,8 @@ HttpAnswer answerFor(const Unserved& unserved) {
             return retryLater("STOPPING", unserved.message);
         case Reason::abandoned:
             return retryLater("CLIENT_GONE", unserved.message);
+        case Reason::notBegun:
+            return retryLater("WORKER_BUSY", unserved.message);
         case Reason::failed:
         case Reason::tooLarge:
             break;
@@ -167,6 +178,9 @@ void close(RequestRecord& record, unsigned status, std::string_view code) {
     record.state = RequestRecord::State::done;
     record.status = status;
     record.error = code;
+    if (record.repeated && status < 300) {
+        return;
+    }
     // Names from an address come from the client: only printable ones may reach the log.
     std::string name = record.plugin + "/" + record.command;
     for (char& c : name) {
@@ -184,14 +198,32 @@ void close(RequestRecord& record, unsigned status, std::string_view code) {
                          record.milliseconds, reports));
 }
 
+/// Returns true for the checks of the installation. No plug-in serves them.
+bool isDoctor(const RequestRecord& record) {
+    return record.plugin.empty() && record.command == doctor;
+}
+
+std::string_view nameOf(Diagnosis::Health health) {
+    return health == Diagnosis::Health::ok ? "ok" : health == Diagnosis::Health::warning ? "warning" : "failure";
+}
+
+/// The number in an argument of an address; 0 without the argument, nullopt if it is not a number.
+std::optional<std::uint64_t> numberIn(std::string_view argument) {
+    std::uint64_t number = 0;
+    const char* const end = argument.data() + argument.size();
+    const auto [rest, failure] = std::from_chars(argument.data(), end, number);
+    return argument.empty() || (failure == std::errc() && rest == end) ? std::optional(number) : std::nullopt;
+}
+
 BodyForm wantedForm(const Exchange& exchange) {
     return exchange.wantsPropertyList() ? BodyForm::propertyList : BodyForm::json;
 }
 
 }  // namespace
 
-Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused)
-    : _refused(std::move(refused)),
+Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks)
+    : _checks(std::move(checks)),
+      _refused(std::move(refused)),
       _queue(std::move(settings), {[this](protocol::Hello hello) { welcome(std::move(hello)); },
                                    [](const std::string& event) { logEvent(event); },
                                    [this](const Operation& operation, OperationQueue::Ending ending) {
@@ -236,6 +268,12 @@ Front::Target Front::targetOf(std::string_view path) {
     }
     if (path == "directory") {
         return {Kind::directory, {}, first};
+    }
+    if (path == doctor) {
+        return {Kind::doctor, {}, first};
+    }
+    if (first == "logs") {
+        return {Kind::logs, {}, second};
     }
     if (second == "history") {
         return {Kind::history, first, second};
@@ -290,7 +328,7 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target&
     if (target.kind == Kind::unknown) {
         return errorAnswer(404, "UNKNOWN_ADDRESS",
                            "Known addresses: /v1/, /v1/PLUGIN, /v1/PLUGIN/COMMAND, /v1/PLUGIN/history, /v1/directory, "
-                           "/v1/requests/ID.");
+                           "/v1/doctor, /v1/logs, /v1/logs/NAME, /v1/requests/ID.");
     }
     if (target.kind == Kind::plugin || target.kind == Kind::command || target.kind == Kind::history) {
         if (auto answer = missing(target)) {
@@ -354,6 +392,8 @@ void Front::serve(Exchange& exchange, const Target& target) {
             return;
         case Target::Kind::directory:
         case Target::Kind::history:
+        case Target::Kind::doctor:
+        case Target::Kind::logs:
             query(exchange, target);
             return;
         case Target::Kind::plugin: {
@@ -419,6 +459,10 @@ void Front::end(const Operation& operation, HttpAnswer answer, std::string_view 
 
 void Front::enqueue(Operation operation) {
     if (_queue.full()) {
+        if (isDoctor(*operation.record)) {
+            finished(operation, Unserved{Unserved::Reason::notBegun, "Too many requests are waiting already."});
+            return;
+        }
         end(operation, retryLater("TOO_MANY_WAITING", fmt::format("{} requests wait already.", _queue.waiting())),
             "TOO_MANY_WAITING");
         return;
@@ -473,28 +517,98 @@ void Front::operation(Exchange& exchange, const Target& target) {
     enqueue(std::move(operation));
 }
 
-void Front::query(Exchange& exchange, const Target& target) {
-    Operation operation{&exchange, _log.add(exchange)};
-    operation.record->plugin = target.plugin;
-    operation.record->command = target.command;
-    for (const char* argument : {"match", "is"}) {
+std::optional<protocol::ToWorker> Front::orderFor(const Exchange& exchange, const Target& target,
+                                                  HttpAnswer& malformed) {
+    const auto refuse = [&](const char* what) {
+        malformed = errorAnswer(400, "MALFORMED_ADDRESS", what);
+        return std::nullopt;
+    };
+    for (const char* argument : {"match", "is", "plugin"}) {
         if (!isUtf8(exchange.argument(argument))) {
-            end(operation,
-                errorAnswer(400, "MALFORMED_ADDRESS", fmt::format("The text of \"{}\" is not UTF-8.", argument)),
-                "MALFORMED_ADDRESS");
-            return;
+            return refuse("The address has an argument that is not UTF-8.");
         }
     }
-    if (target.kind == Target::Kind::history) {
-        operation.order = protocol::ReadHistory{target.plugin, wantedForm(exchange)};
-    } else {
-        operation.order = protocol::FindAccounts{std::string(exchange.argument("match")),
-                                                 std::string(exchange.argument("is")), wantedForm(exchange)};
+    switch (target.kind) {
+        case Target::Kind::history:
+            return protocol::ReadHistory{target.plugin, wantedForm(exchange)};
+        case Target::Kind::doctor:
+            return protocol::Diagnose{};
+        case Target::Kind::logs: {
+            const auto inode = numberIn(exchange.argument("inode"));
+            const auto offset = numberIn(exchange.argument("offset"));
+            if (!inode || !offset || !isUtf8(target.command)) {
+                return refuse("The log's name must be UTF-8, and \"inode\" and \"offset\" decimal numbers.");
+            }
+            return protocol::ReadLog{.plugin = std::string(exchange.argument("plugin")),
+                                     .name = target.command,
+                                     .inode = *inode,
+                                     .offset = *offset,
+                                     .milliseconds = 0,
+                                     .form = wantedForm(exchange)};
+        }
+        default:
+            return protocol::FindAccounts{std::string(exchange.argument("match")), std::string(exchange.argument("is")),
+                                          wantedForm(exchange)};
+    }
+}
+
+void Front::query(Exchange& exchange, const Target& target) {
+    // A client that follows a log asks every second: that must not push other requests out of the log of requests.
+    const bool follows = target.kind == Target::Kind::logs && !exchange.argument("inode").empty();
+    Operation operation{&exchange, follows ? RequestLog::begin(exchange) : _log.add(exchange)};
+    operation.record->repeated = follows;
+    operation.record->plugin = target.plugin;
+    operation.record->command = target.kind == Target::Kind::logs ? "logs" : target.command;
+    HttpAnswer malformed;
+    auto order = orderFor(exchange, target, malformed);
+    if (!order) {
+        const std::string code(codeOf(malformed));
+        end(operation, std::move(malformed), code);
+        return;
+    }
+    operation.order = *std::move(order);
+    if (target.kind == Target::Kind::doctor) {
+        operation.deadline = doctorBound;
+        operation.beginBy = std::chrono::steady_clock::now() + doctorWait;
+    } else if (target.kind == Target::Kind::logs) {
+        operation.deadline = logBound;
     }
     enqueue(std::move(operation));
 }
 
+HttpAnswer Front::doctorAnswer(const OperationQueue::Ending& ending) const {
+    FrontChecks::Workers workers{_queue.workerPid(), _queue.workerProblem(), {}, refusedPlugins()};
+    if (_hello) {
+        for (const protocol::OfferedPlugin& plugin : _hello->plugins) {
+            workers.plugins.push_back(plugin.name + ' ' + plugin.version);
+        }
+    }
+    std::vector<Diagnosis> checks = _checks.run(workers);
+    const auto* answer = std::get_if<protocol::Answer>(&ending);
+    if (answer != nullptr && answer->outcome == protocol::Outcome::checked) {
+        checks.insert(checks.end(), answer->checks.begin(), answer->checks.end());
+    } else {
+        const auto* unserved = std::get_if<Unserved>(&ending);
+        const bool late = unserved != nullptr && unserved->reason == Unserved::Reason::overrun;
+        const std::string reason = late                  ? "They did not end in time and were stopped."
+                                   : unserved != nullptr ? unserved->message
+                                                         : answer->message;
+        checks.push_back({Diagnosis::Health::failure, "checks of the worker",
+                          "Local names, the directory and the plug-ins were not checked. " + reason,
+                          "run the check again; if it fails again, see the daemon's log"});
+    }
+    Array described;
+    for (const Diagnosis& check : checks) {
+        described.emplace_back(Dictionary{
+            {"name", check.name}, {"state", nameOf(check.health)}, {"found", check.found}, {"fix", check.fix}});
+    }
+    return {200, Dictionary{{"checks", std::move(described)}}, {}};
+}
+
 void Front::finished(const Operation& operation, OperationQueue::Ending ending) {
+    if (isDoctor(*operation.record)) {
+        return end(operation, doctorAnswer(ending), {});
+    }
     if (const auto* unserved = std::get_if<Unserved>(&ending)) {
         HttpAnswer http = answerFor(*unserved);
         const std::string code(codeOf(http));

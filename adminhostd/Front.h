@@ -2,6 +2,7 @@
 
 // The front: what each address serves, which clients are permitted, and the audit.
 
+#include "adminhostd/FrontChecks.h"
 #include "adminhostd/Http.h"
 #include "adminhostd/OperationQueue.h"
 #include "adminhostd/RequestLog.h"
@@ -18,7 +19,7 @@ class Front {
   public:
     /// `settings` configures the workers; `refused` are the plug-ins that are not even offered to them. Creates the
     /// queue, which starts a worker for the operations.
-    Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused);
+    Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks);
     Front(const Front&) = delete;
     Front& operator=(const Front&) = delete;
 
@@ -31,14 +32,15 @@ class Front {
 
   private:
     struct Target {
-        enum class Kind { unknown, overview, plugin, command, request, directory, history };
+        enum class Kind { unknown, overview, plugin, command, request, directory, history, doctor, logs };
         Kind kind = Kind::unknown;
         std::string plugin;
-        std::string command;  ///< for a request: its id
+        std::string command;  ///< for a request its id, for a log its name
 
         /// Returns true if the worker serves it. Such requests are recorded in the log of requests.
         [[nodiscard]] bool isOperation() const noexcept {
-            return kind == Kind::command || kind == Kind::directory || kind == Kind::history;
+            return kind == Kind::command || kind == Kind::directory || kind == Kind::history || kind == Kind::doctor ||
+                   kind == Kind::logs;
         }
     };
 
@@ -57,11 +59,17 @@ class Front {
     void operation(Exchange& exchange, const Target& target);
     /// Passes on a request that the worker serves without an operation of a plug-in.
     void query(Exchange& exchange, const Target& target);
+    /// The order for such a request; nullopt, with the answer, if its arguments are malformed.
+    [[nodiscard]] static std::optional<protocol::ToWorker> orderFor(const Exchange& exchange, const Target& target,
+                                                                    HttpAnswer& malformed);
     void enqueue(Operation operation);
     void finished(const Operation& operation, OperationQueue::Ending ending);
+    /// The front's own checks, and those of the worker or the reason why it made none.
+    [[nodiscard]] HttpAnswer doctorAnswer(const OperationQueue::Ending& ending) const;
     /// Sends an operation's answer and logs its end.
     static void end(const Operation& operation, HttpAnswer answer, std::string_view code);
 
+    FrontChecks _checks;
     RequestLog _log;
     std::vector<protocol::RefusedPlugin> _refused;  ///< before they were offered to a worker
     std::optional<protocol::Hello> _hello;          ///< of the latest worker

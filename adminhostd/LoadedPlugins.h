@@ -29,6 +29,7 @@ class LoadedPlugins {
     /// Loads a file, configures the plug-in and writes the files of its tools. The error's description names the file
     /// and what is wrong.
     [[nodiscard]] Result<LoadedPlugin> load(const DiskPath& file, const std::vector<std::string>& languages);
+    [[nodiscard]] const std::vector<LoadedPlugin>& all() const noexcept { return _plugins; }
     /// The loaded plug-in of that name; null if it is not found.
     [[nodiscard]] const LoadedPlugin* named(std::string_view name) const;
 

@@ -29,6 +29,10 @@ std::optional<pid_t> OperationQueue::workerPid() const {
     return _worker ? std::optional(_worker->pid()) : std::nullopt;
 }
 
+std::optional<std::string> OperationQueue::workerProblem() const {
+    return _state == State::paused ? std::optional(_startProblem) : std::nullopt;
+}
+
 void OperationQueue::add(Operation operation) {
     _waiting.push_back(std::move(operation));
     if (_stopping) {
@@ -51,8 +55,15 @@ void OperationQueue::addTo(std::vector<pollfd>& entries) const {
 }
 
 std::optional<OperationQueue::Clock::time_point> OperationQueue::due() const {
-    const auto other = _directoryProbe.due();
-    return _due && other ? std::min(_due, other) : _due ? _due : other;
+    std::optional<Clock::time_point> first = _due;
+    const auto consider = [&](const std::optional<Clock::time_point>& other) {
+        first = first && other ? std::min(first, other) : first ? first : other;
+    };
+    consider(_directoryProbe.due());
+    for (const Operation& operation : _waiting) {
+        consider(operation.beginBy);
+    }
+    return first;
 }
 
 void OperationQueue::start() {
@@ -94,6 +105,23 @@ void OperationQueue::run(std::span<const pollfd> polled) {
     std::erase_if(_dying, [&](const auto& worker) { return worker->mayHaveEnded(polled) && worker->ending(); });
     if (_due && Clock::now() >= *_due) {
         timeUp();
+    }
+    giveUpWaiting();
+}
+
+void OperationQueue::giveUpWaiting() {
+    const auto now = Clock::now();
+    std::vector<Operation> late;
+    for (auto one = _waiting.begin(); one != _waiting.end();) {
+        if (one->beginBy && now >= *one->beginBy) {
+            late.push_back(std::move(*one));
+            one = _waiting.erase(one);
+        } else {
+            ++one;
+        }
+    }
+    for (const Operation& operation : late) {
+        _events.finished(operation, Unserved{Unserved::Reason::notBegun, "The worker is busy with another request."});
     }
 }
 
@@ -262,10 +290,14 @@ void OperationQueue::begin(Operation operation) {
     if (!operation.until) {
         operation.until = now + (operation.deadline > 0ms ? operation.deadline : _settings.deadline);
     }
-    if (auto* perform = std::get_if<protocol::Perform>(&operation.order)) {
-        const auto left = std::chrono::ceil<std::chrono::milliseconds>(*operation.until - now);
-        perform->milliseconds = static_cast<std::uint64_t>(std::max<std::int64_t>(left.count(), 0));
-    }
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*operation.until - now);
+    std::visit(
+        [&](auto& order) {
+            if constexpr (requires { order.milliseconds; }) {
+                order.milliseconds = static_cast<std::uint64_t>(std::max<std::int64_t>(left.count(), 0));
+            }
+        },
+        operation.order);
     // Kept for a change, which may have to be sent again.
     const auto frame = protocol::frameOf(operation.changes ? operation.order : std::exchange(operation.order, {}));
     if (!_worker->send(frame)) {

@@ -33,6 +33,8 @@ struct Operation {
     std::optional<protocol::Answer> locked = {};  ///< of the last worker that did not get the lock
     /// The end of its time, counted from its first start.
     std::optional<std::chrono::steady_clock::time_point> until = {};
+    /// When it is given up unless it has begun.
+    std::optional<std::chrono::steady_clock::time_point> beginBy = {};
 };
 
 /// Why an operation ended without a worker's answer.
@@ -44,6 +46,7 @@ struct Unserved {
         unavailable,  ///< no worker could be started
         stopping,     ///< the daemon is stopping
         abandoned,    ///< the client went away before its turn
+        notBegun,     ///< it had to begin by a certain time, and another operation was still running
     };
     Reason reason = Reason::failed;
     std::string message;
@@ -75,6 +78,8 @@ class OperationQueue {
     [[nodiscard]] const Operation* running() const noexcept { return _running ? &*_running : nullptr; }
     [[nodiscard]] std::size_t waiting() const noexcept { return _waiting.size(); }
     [[nodiscard]] std::optional<pid_t> workerPid() const;
+    /// Why there is no worker that can serve now; nullopt if there is one, or if one is being started.
+    [[nodiscard]] std::optional<std::string> workerProblem() const;
     /// Returns true once the first worker has said hello, or has failed to.
     [[nodiscard]] bool settled() const noexcept { return _settled; }
 
@@ -106,6 +111,7 @@ class OperationQueue {
     void endWorker(const std::string& why);
     void workerEnded(const std::string& how);
     void timeUp();
+    void giveUpWaiting();
     void next();
     /// The first operation that may run now, or the end. While another process holds the lock for changes, a change and
     /// the changes behind it wait, and operations that only read go on.

@@ -62,10 +62,14 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
         if (problem) {
             throw std::runtime_error(*problem);
         }
-        if (!configuration.empty()) {
+        options.configurationIsNamed = !configuration.empty();
+        options.configuration = options.configurationIsNamed ? absolute(configuration)
+                                : exists(standard)           ? standard.text()
+                                                             : std::string();
+        if (options.configurationIsNamed) {
             readConfiguration(configuration, options);
-        } else if (exists(standard)) {
-            readConfiguration(standard.text(), options);
+        } else if (!options.configuration.empty()) {
+            readConfiguration(options.configuration, options);
         }
     } catch (const std::runtime_error& error) {
         std::cerr << "adminhostd: " << error.what() << '\n';

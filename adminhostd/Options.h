@@ -27,6 +27,8 @@ struct Options {
     std::chrono::milliseconds deadline{300'000};  ///< of one operation
     std::chrono::seconds clientTimeout{30};
     std::size_t queueLimit = 64;
+    std::string configuration;          ///< path on disk of the file that was read; empty: none
+    bool configurationIsNamed = false;  ///< on the command line
     bool logToStandardError = false;
     bool check = false;
 };

@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <iterator>
 #include <set>
 #include <utility>
 
@@ -212,7 +213,9 @@ Result<LoadedPlugin> loadPlugin(const DiskPath& file) {
     if (loaded->plugin == nullptr) {
         return refused(fmt::format("{} has an entry point that returns no plug-in", file.text()));
     }
-    if (!isAddressWord(loaded->name) || loaded->name == "requests" || loaded->name == "directory") {
+    constexpr std::string_view ownAddresses[] = {"requests", "directory", "doctor", "logs"};
+    if (!isAddressWord(loaded->name) ||
+        std::find(std::begin(ownAddresses), std::end(ownAddresses), loaded->name) != std::end(ownAddresses)) {
         return refused(
             fmt::format("{} has the name \"{}\", which cannot be part of an address", file.text(), loaded->name));
     }

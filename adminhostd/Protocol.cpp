@@ -81,6 +81,15 @@ template <>
 constexpr auto members<ReadHistory> = std::tuple(member("readHistory.plugin", &ReadHistory::plugin),
                                                  member("readHistory.form", &ReadHistory::form));
 template <>
+constexpr auto members<Diagnose> = std::tuple(member("diagnose.milliseconds", &Diagnose::milliseconds));
+template <>
+constexpr auto members<ReadLog> = std::tuple(member("readLog.plugin", &ReadLog::plugin),
+                                             member("readLog.name", &ReadLog::name),
+                                             member("readLog.inode", &ReadLog::inode),
+                                             member("readLog.offset", &ReadLog::offset),
+                                             member("readLog.milliseconds", &ReadLog::milliseconds),
+                                             member("readLog.form", &ReadLog::form));
+template <>
 constexpr auto members<Command> = std::tuple(member("command.name", &Command::name),
                                              member("command.access", &Command::access),
                                              member("command.showsRevision", &Command::showsRevision),
@@ -118,12 +127,18 @@ template <>
 constexpr auto members<Finding> = std::tuple(member("finding.keyPath", &Finding::keyPath),
                                              member("finding.rule", &Finding::rule),
                                              member("finding.advice", &Finding::advice));
+template <>
+constexpr auto members<Diagnosis> = std::tuple(member("check.health", &Diagnosis::health),
+                                               member("check.name", &Diagnosis::name),
+                                               member("check.found", &Diagnosis::found),
+                                               member("check.fix", &Diagnosis::fix));
 /// Answer::bytes is not among them: it follows the dictionary in the frame.
 template <>
 constexpr auto members<Answer> = std::tuple(member("answer.outcome", &Answer::outcome),
                                             member("answer.error", &Answer::error),
                                             member("answer.message", &Answer::message),
                                             member("answer.findings", &Answer::findings),
+                                            member("answer.checks", &Answer::checks),
                                             member("answer.revision", &Answer::revision),
                                             member("answer.form", &Answer::form));
 
@@ -154,6 +169,10 @@ constexpr const char* wordOf(Outcome outcome) {
             return "locked";
         case Outcome::broken:
             return "broken";
+        case Outcome::absent:
+            return "absent";
+        case Outcome::checked:
+            return "checked";
     }
     return nullptr;
 }
@@ -177,6 +196,12 @@ constexpr Word<BodyForm> formWords[] = {{BodyForm::json, "json"}, {BodyForm::pro
 constexpr Word<Access> accessWords[] = {
     {Access::read, "read"}, {Access::write, "write"}, {Access::control, "control"}, {Access::account, "account"}};
 
+constexpr Word<Diagnosis::Health> healthWords[] = {
+    {Diagnosis::Health::ok, "ok"}, {Diagnosis::Health::warning, "warning"}, {Diagnosis::Health::failure, "failure"}};
+
+constexpr auto& wordsOf(Diagnosis::Health) {
+    return healthWords;
+}
 constexpr auto& wordsOf(Access) {
     return accessWords;
 }
@@ -421,6 +446,10 @@ template <>
 constexpr FrameType typeOf<FindAccounts> = FrameType::findAccounts;
 template <>
 constexpr FrameType typeOf<ReadHistory> = FrameType::readHistory;
+template <>
+constexpr FrameType typeOf<Diagnose> = FrameType::diagnose;
+template <>
+constexpr FrameType typeOf<ReadLog> = FrameType::readLog;
 template <>
 constexpr FrameType typeOf<Hello> = FrameType::hello;
 template <>

@@ -37,6 +37,8 @@ enum class Outcome {
     overrun,   ///< the deadline passed
     locked,    ///< message: another process holds the lock for changes; nothing was done
     broken,    ///< message: the worker could not do it
+    absent,    ///< error, message: what the request names does not exist
+    checked,   ///< checks: of the installation
 };
 
 /// Every outcome.
@@ -99,7 +101,24 @@ struct ReadHistory {
     bool operator==(const ReadHistory&) const = default;
 };
 
-using ToWorker = std::variant<Configure, Perform, FindAccounts, ReadHistory>;
+/// Checks of the installation: the worker's own and those of its plug-ins.
+struct Diagnose {
+    std::uint64_t milliseconds = 0;  ///< until its deadline
+    bool operator==(const Diagnose&) const = default;
+};
+
+/// A piece of a log file of a plug-in or, without a name, the names and sizes of all logs.
+struct ReadLog {
+    std::string plugin;              ///< empty: the first that has a log of this name
+    std::string name;                ///< empty: all logs
+    std::uint64_t inode = 0;         ///< of the file that an earlier piece came from; 0: none
+    std::uint64_t offset = 0;        ///< of the first byte
+    std::uint64_t milliseconds = 0;  ///< until its deadline
+    BodyForm form = BodyForm::json;
+    bool operator==(const ReadLog&) const = default;
+};
+
+using ToWorker = std::variant<Configure, Perform, FindAccounts, ReadHistory, Diagnose, ReadLog>;
 
 // From the worker to the front.
 
@@ -131,12 +150,13 @@ struct Log {
     bool operator==(const Log&) const = default;
 };
 
-/// The reply to Perform, FindAccounts and ReadHistory.
+/// The reply to every message but Configure.
 struct Answer {
     Outcome outcome = Outcome::broken;
     std::string error;               ///< a code
     std::string message;             ///< a sentence
     std::vector<Finding> findings;   ///< of refused
+    std::vector<Diagnosis> checks;   ///< of checked
     std::string revision;            ///< after the operation; empty: not asked for, or not known
     BodyForm form = BodyForm::json;  ///< of bytes: JSON also where a property list cannot carry the answer
     std::string bytes;               ///< the whole body; the front passes it on unread

@@ -37,7 +37,8 @@ struct RequestRecord {
     std::chrono::steady_clock::time_point start;
     double milliseconds = 0;  ///< from arrival to answer
     unsigned status = 0;
-    std::string error;  ///< the code of an answer that is an error
+    std::string error;      ///< the code of an answer that is an error
+    bool repeated = false;  ///< one of many like it, which a client sends by itself: its success is not logged
 
     // Above these bounds, events and reports are only counted.
     void add(std::string_view event);

@@ -6,17 +6,18 @@
 #include "adminhostd/LoadedPlugins.h"
 #include "adminhostd/Login.h"
 #include "adminhostd/PluginCall.h"
+#include "adminhostd/PluginLogs.h"
 #include "adminhostd/PluginTrial.h"
 #include "adminhostd/PrivateDirectory.h"
 #include "adminhostd/Protocol.h"
 #include "adminhostd/ToolConfiguration.h"
+#include "adminhostd/WorkerAnswer.h"
+#include "adminhostd/WorkerChecks.h"
 #include "adminhostd/WorkerDirectory.h"
 #include "adminhostd/WriteLock.h"
 #include "platform/directory/DirectoryRequest.h"
 #include "platform/files/Path.h"
-#include "platform/json/Json.h"
 #include "platform/log/Log.h"
-#include "platform/plist/PropertyList.h"
 #include "platform/service/ServiceState.h"
 #include "platform/task/Task.h"
 #include "platform/value/ValueText.h"
@@ -66,6 +67,8 @@ class Worker {
     protocol::Answer answer(const protocol::Perform& order);
     protocol::Answer answer(const protocol::FindAccounts& order);
     protocol::Answer answer(const protocol::ReadHistory& order);
+    [[nodiscard]] protocol::Answer answer(const protocol::Diagnose& order) const;
+    [[nodiscard]] protocol::Answer answer(const protocol::ReadLog& order) const;
     protocol::Answer perform(const LoadedPlugin& loaded, const protocol::Perform& order);
 
     int _descriptor;
@@ -77,13 +80,6 @@ class Worker {
     bool _leftoversRemoved = false;
     bool _returnMemory = false;  ///< a large message has been freed
 };
-
-protocol::Answer broken(std::string message) {
-    protocol::Answer answer;
-    answer.outcome = Outcome::broken;
-    answer.message = std::move(message);
-    return answer;
-}
 
 /// Returns true if a command may change something: also one that the plug-in does not name, because it is not known to
 /// only read.
@@ -100,32 +96,6 @@ bool isClosed(int descriptor) {
 
 protocol::Answer notLoaded(const std::string& plugin) {
     return broken("The plug-in \"" + plugin + "\" is not loaded.");
-}
-
-/// The answer's text in the form that the client prefers; in JSON if a property list cannot carry it. Drops the
-/// dictionary, so that an answer is in memory in one form at a time.
-protocol::Answer written(Outcome outcome, Dictionary response, BodyForm form) {
-    protocol::Answer answer;
-    answer.outcome = outcome;
-    if (outcome == Outcome::error) {
-        answer.error = response.text("error");
-        answer.message = response.text("message");
-    }
-    const Value value(std::move(response));
-    if (form == BodyForm::propertyList) {
-        if (auto text = xmlPropertyList(value)) {
-            answer.form = form;
-            answer.bytes = *std::move(text);
-            return answer;
-        }
-    }
-    answer.form = BodyForm::json;
-    answer.bytes = jsonOf(value) + '\n';
-    return answer;
-}
-
-protocol::Answer errorAnswer(std::string_view code, std::string_view message, BodyForm form) {
-    return written(Outcome::error, Dictionary{{"error", code}, {"message", message}}, form);
 }
 
 /// The answer to a command if something that it needs is not usable, or not known to be.
@@ -317,6 +287,26 @@ protocol::Answer Worker::answer(const protocol::FindAccounts& order) {
         return errorAnswer("DIRECTORY_UNAVAILABLE", textOf(entries.error()), order.form);
     }
     return written(Outcome::answered, Dictionary{{"entries", *std::move(entries)}}, order.form);
+}
+
+protocol::Answer Worker::answer(const protocol::Diagnose& order) const {
+    const auto deadline = Clock::now() + std::chrono::milliseconds(order.milliseconds);
+    setTaskDeadline(deadline);
+    protocol::Answer answer;
+    answer.outcome = Outcome::checked;
+    answer.checks = workerChecks();
+    for (const LoadedPlugin& loaded : _plugins.all()) {
+        _plugins.enter(loaded);
+        setTaskDeadline(deadline);
+        for (Diagnosis& check : checksOf(loaded)) {
+            answer.checks.push_back(std::move(check));
+        }
+    }
+    return answer;
+}
+
+protocol::Answer Worker::answer(const protocol::ReadLog& order) const {
+    return logAnswer(_plugins.all(), order);
 }
 
 std::optional<int> Worker::serve(protocol::ToWorker message) {

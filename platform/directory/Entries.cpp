@@ -3,7 +3,9 @@
 #include "platform/text/Uuid.h"
 
 #include <set>
+#include <sstream>
 #include <tuple>
+#include <utility>
 
 namespace adminhost {
 namespace {
@@ -14,20 +16,39 @@ std::vector<std::string> entryAttributes() {
     return {std::string(directory::recordName), std::string(directory::realName), std::string(directory::generatedUID)};
 }
 
+/// The principal in the first authority of the kind Kerberos; null if there is none.
+Value kerberosPrincipalIn(const DirectoryRecord& record) {
+    constexpr std::size_t kindField = 1;
+    constexpr std::size_t principalField = 3;
+    for (const std::string& authority : record.values(directory::authenticationAuthority)) {
+        std::vector<std::string> fields;
+        std::istringstream text(authority);
+        for (std::string field; std::getline(text, field, ';');) {
+            fields.push_back(std::move(field));
+        }
+        if (fields.size() > kindField && fields[kindField] == "Kerberosv5") {
+            return fields.size() > principalField && !fields[principalField].empty() ? Value(fields[principalField])
+                                                                                     : Value();
+        }
+    }
+    return {};
+}
+
 Dictionary entryWithNode(const DirectoryRecord& record) {
     Dictionary entry = directoryEntryOf(record);
     entry.set("node", record.node);
+    entry.set("kerberosPrincipal", kerberosPrincipalIn(record));
     return entry;
 }
 
 Result<std::vector<DirectoryRecord>> find(std::string_view attribute, Match match, std::string_view value,
-                                          std::size_t limit) {
+                                          std::size_t limit, std::vector<std::string> attributes = entryAttributes()) {
     DirectoryQuery query;
     query.recordTypes = {std::string(directory::users), std::string(directory::groups)};
     query.attribute = attribute;
     query.match = match;
     query.values = {std::string(value)};
-    query.attributes = entryAttributes();
+    query.attributes = std::move(attributes);
     query.maximum = limit;
     return searchDirectory(query);
 }
@@ -74,7 +95,9 @@ Result<Array> directoryEntries(std::string_view matchText, std::size_t limit) {
 
 Result<Array> directoryEntriesOf(std::string_view nameOrUuid) {
     const auto attribute = uuidOf(nameOrUuid) ? directory::generatedUID : directory::recordName;
-    const auto records = find(attribute, Match::equal, nameOrUuid, 0);
+    std::vector<std::string> attributes = entryAttributes();
+    attributes.emplace_back(directory::authenticationAuthority);
+    const auto records = find(attribute, Match::equal, nameOrUuid, 0, std::move(attributes));
     if (!records) {
         return failure(records.error());
     }

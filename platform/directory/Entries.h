@@ -23,7 +23,7 @@ namespace adminhost {
 [[nodiscard]] ADMINHOST_EXPORT Result<Array> directoryEntries(std::string_view matchText, std::size_t limit);
 
 /// People and groups whose short name or UUID is the text: entries that also have "node", the name of the node that
-/// holds the record.
+/// holds the record, and "kerberosPrincipal", the principal in the first Kerberos authority of a person who has one.
 [[nodiscard]] ADMINHOST_EXPORT Result<Array> directoryEntriesOf(std::string_view nameOrUuid);
 
 /// The groups of which the people with that short name or UUID are members, directly or through other groups, in the

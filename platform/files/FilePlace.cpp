@@ -15,11 +15,6 @@ namespace {
 
 constexpr int mostLinks = 40;  // as many as the kernel follows
 
-/// Returns true if others than root and this process's user may create entries in the directory.
-bool othersMayWrite(const struct stat& directory) noexcept {
-    return (directory.st_mode & (S_IWGRP | S_IWOTH)) != 0 || (directory.st_uid != 0 && directory.st_uid != ::geteuid());
-}
-
 /// Walks from the current directory, or from "/", down to the directory that the text names.
 int walk(std::string text, FileDescriptor& directory) {
     int links = 0;
@@ -62,6 +57,10 @@ int walk(std::string text, FileDescriptor& directory) {
 }
 
 }  // namespace
+
+bool othersMayWrite(const struct stat& directory) noexcept {
+    return (directory.st_mode & (S_IWGRP | S_IWOTH)) != 0 || (directory.st_uid != 0 && directory.st_uid != ::geteuid());
+}
 
 int openPlace(const DiskPath& path, FilePlace& place) {
     const std::string& text = path.text();

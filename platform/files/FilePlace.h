@@ -8,6 +8,8 @@
 
 #include <string>
 
+#include <sys/stat.h>
+
 namespace adminhost {
 
 /// A file's directory, open for reading, and its name in it.
@@ -15,6 +17,9 @@ struct ADMINHOST_EXPORT FilePlace {
     FileDescriptor directory;
     std::string name;
 };
+
+/// Returns true if others than root and this process's user may create entries in the directory.
+[[nodiscard]] ADMINHOST_EXPORT bool othersMayWrite(const struct stat& directory) noexcept;
 
 /// Finds the place of a file, which need not exist. Links on the way are followed only where nobody but root and this
 /// process's own user can have created them: a link in a directory that others may write to is ELOOP. Returns the

@@ -70,6 +70,8 @@ struct ADMINHOST_EXPORT Diagnosis {
     std::string name;   ///< "database"
     std::string found;  ///< one sentence
     std::string fix;    ///< empty if there is nothing to fix
+
+    bool operator==(const Diagnosis&) const = default;
 };
 
 /// A setting whose history the host keeps: a key of Plugin::settings().

@@ -70,7 +70,11 @@ std::vector<ToWorker> messagesToWorker() {
                       .directoryMilliseconds = 9,
                       .tryOnly = true,
                       .probeDirectory = true},
-            perform(), FindAccounts{"ma", "is", BodyForm::propertyList}, ReadHistory{"p", BodyForm::propertyList}};
+            perform(),
+            FindAccounts{"ma", "is", BodyForm::propertyList},
+            ReadHistory{"p", BodyForm::propertyList},
+            Diagnose{7},
+            ReadLog{"p", "n", 1, 2, 3, BodyForm::propertyList}};
 }
 
 Answer answer(Outcome outcome) {
@@ -78,6 +82,9 @@ Answer answer(Outcome outcome) {
             .error = "CODE",
             .message = "A sentence.",
             .findings = {{"a.0", "is bad", "leave it out"}, {"b", "", ""}},
+            .checks = {{Diagnosis::Health::ok, "n", "f", ""},
+                       {Diagnosis::Health::warning, "o", "f", "fix"},
+                       {Diagnosis::Health::failure, "p", "", "fix"}},
             .revision = "r2",
             .form = BodyForm::propertyList,
             .bytes = "<plist/>"};

@@ -92,6 +92,14 @@ TEST_F(Entries, NameOrUuidIsFoundWithItsNode) {
     EXPECT_THAT(shortNames(directoryEntriesOf("nobody")), IsEmpty());
 }
 
+TEST_F(Entries, PersonWithAKerberosAuthorityIsFoundWithThePrincipal) {
+    EXPECT_FALSE(directoryEntriesOf("anna").value().at(0).dictionary()->contains("kerberosPrincipal"));
+    setDirectoryNodes({localAccounts(std::nullopt, "EXAMPLE.ORG")});
+    const auto entries = directoryEntriesOf("anna");
+    setDirectoryNodes({localAccounts()});
+    EXPECT_EQ(entries.value().at(0).dictionary()->get("kerberosPrincipal"), Value("anna@EXAMPLE.ORG"));
+}
+
 TEST_F(Entries, MembershipMapsUuidsToIdsWithTheirKind) {
     const auto uuid = mbr_string_to_uuid("81cef789-6423-555f-bb64-f7bd915968d3");
     ASSERT_TRUE(uuid);

@@ -1,0 +1,70 @@
+#pragma once
+
+// The checks of the installation that the front makes itself, so that they are answered also while no worker runs.
+//
+// They read the daemon's own files and the kernel's state. None of them waits for another program or for a file system
+// of the service.
+
+#include "adminhostd/Options.h"
+#include "adminhostd/Protocol.h"
+#include "platform/framework/Plugin.h"
+
+#include <chrono>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <sys/timex.h>
+#include <sys/types.h>
+
+namespace adminhost {
+
+class FrontChecks {
+  public:
+    /// What the front knows of its workers.
+    struct Workers {
+        std::optional<pid_t> pid;
+        std::optional<std::string> problem;  ///< why none can serve
+        std::vector<std::string> plugins;
+        std::vector<protocol::RefusedPlugin> refused;
+    };
+
+    /// Remembers socket and configuration as they are now. Created after the socket.
+    explicit FrontChecks(const Options& options);
+
+    [[nodiscard]] std::vector<Diagnosis> run(const Workers& workers) const;
+
+  private:
+    struct Seen {
+        std::string path;  ///< empty: there is none
+        dev_t device = 0;
+        ino_t inode = 0;
+        timespec modified = {};
+
+        [[nodiscard]] static Seen now(const std::string& path);
+        [[nodiscard]] bool operator==(const Seen& other) const noexcept;
+    };
+
+    [[nodiscard]] Diagnosis daemonCheck() const;
+    [[nodiscard]] Diagnosis socketCheck() const;
+    [[nodiscard]] Diagnosis configurationCheck() const;
+
+    std::string _root;
+    Seen _socket;
+    Seen _configuration;
+    bool _configurationIsNamed;  ///< on the command line: other rules apply to who may write to it
+    std::vector<std::pair<std::string, std::string>> _directories;  ///< what for, and the path on disk
+    std::chrono::system_clock::time_point _started = std::chrono::system_clock::now();
+};
+
+// The rules of single checks.
+
+/// The kernel's clock: `state` and `clock` are adjtimex()'s result and data.
+[[nodiscard]] Diagnosis clockCheck(int state, const timex& clock);
+/// The space that is left for a directory.
+[[nodiscard]] Diagnosis spaceCheck(const std::string& directory, const struct statvfs& space);
+
+}  // namespace adminhost

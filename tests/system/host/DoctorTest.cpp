@@ -1,0 +1,112 @@
+// The checks of the installation, with the daemon of this build and the fixture plug-in.
+
+#include "tests/system/host/Host.h"
+
+#include <csignal>
+#include <filesystem>
+#include <fstream>
+
+#include <gmock/gmock.h>
+
+namespace adminhost::test {
+namespace {
+
+using ::testing::HasSubstr;
+
+class Doctor : public ::testing::Test {
+  protected:
+    [[nodiscard]] Array checks() const {
+        UnixHttp client(daemon.socket(), std::chrono::seconds(90));
+        const HttpReply reply = client.get("/v1/doctor");
+        EXPECT_EQ(reply.status, 200) << reply.body;
+        const Dictionary answer = dictionaryOf(reply);
+        EXPECT_EQ(answer.size(), 1U);
+        return answer.get("checks").array() == nullptr ? Array() : *answer.get("checks").array();
+    }
+    /// The check of that name; empty if there is none.
+    [[nodiscard]] Dictionary check(const std::string& name) const {
+        for (const Value& one : checks()) {
+            if (one.dictionary()->get("name") == Value(name)) {
+                return *one.dictionary();
+            }
+        }
+        return {};
+    }
+    void makePlugin(const std::string& what) const {
+        std::ofstream(daemon.directory() / "root" / ("fixture-diagnose-" + what)) << "1";
+    }
+
+    const DaemonProcess daemon{withFixture()};
+};
+
+TEST_F(Doctor, EveryCheckHasItsFourKeysAndAStateOfThree) {
+    const Array all = checks();
+    EXPECT_GT(all.size(), 8U);
+    for (const Value& one : all) {
+        const Dictionary& check = *one.dictionary();
+        EXPECT_EQ(check.size(), 4U) << textAt(check, "name");
+        EXPECT_THAT(textAt(check, "state"), ::testing::AnyOf("ok", "warning", "failure"));
+        EXPECT_NE(textAt(check, "found"), "");
+        EXPECT_NE(check.get("fix").string(), nullptr);
+    }
+}
+
+TEST_F(Doctor, PlugInsOwnChecksHaveItsNameBeforeTheirs) {
+    const Dictionary found = check("fixture/sample");
+    EXPECT_EQ(textAt(found, "state"), "warning");
+    EXPECT_EQ(textAt(found, "found"), "The sample is old.");
+    EXPECT_EQ(textAt(found, "fix"), "renew it");
+}
+
+TEST_F(Doctor, PlugInThatThrowsIsAFailureAndTheOtherChecksAreThere) {
+    makePlugin("throw");
+    const Dictionary found = check("fixture");
+    EXPECT_EQ(textAt(found, "state"), "failure");
+    EXPECT_THAT(textAt(found, "found"), HasSubstr("cannot diagnose"));
+    EXPECT_EQ(textAt(check("worker"), "state"), "ok");
+}
+
+TEST_F(Doctor, WorkerThatDiesLeavesTheFrontsChecks) {
+    makePlugin("crash");
+    const Dictionary found = check("checks of the worker");
+    EXPECT_EQ(textAt(found, "state"), "failure");
+    EXPECT_THAT(textAt(found, "found"), HasSubstr("was killed by signal 11"));
+    EXPECT_EQ(textAt(check("socket"), "state"), "ok");
+}
+
+TEST_F(Doctor, SocketThatWasReplacedIsAFailure) {
+    UnixHttp client = daemon.connect();
+    std::filesystem::rename(daemon.socket(), daemon.socket() + ".old");
+    const HttpReply reply = client.get("/v1/doctor");
+    EXPECT_THAT(reply.body, HasSubstr("has been removed: new clients do not reach this daemon"));
+    std::filesystem::rename(daemon.socket() + ".old", daemon.socket());
+}
+
+TEST_F(Doctor, DaemonAndWorkerAreNamedWithTheirProcesses) {
+    EXPECT_THAT(textAt(check("daemon"), "found"), HasSubstr("process " + std::to_string(daemon.pid())));
+    EXPECT_THAT(textAt(check("daemon"), "found"), HasSubstr("Release " ADMINHOST_RELEASE));
+    EXPECT_THAT(textAt(check("worker"), "found"), HasSubstr(std::to_string(daemon.workerPid())));
+}
+
+TEST_F(Doctor, FrontAnswersWhileAnotherOperationHangs) {
+    UnixHttp busy = startSleeping(daemon, 40'000);
+    const auto before = std::chrono::steady_clock::now();
+    const Dictionary found = check("checks of the worker");
+    EXPECT_LT(std::chrono::steady_clock::now() - before, std::chrono::seconds(38));
+    EXPECT_THAT(textAt(found, "found"), HasSubstr("The worker is busy with another request."));
+    ::kill(daemon.workerPid(), SIGKILL);
+}
+
+TEST(DoctorWithoutWorker, FrontsChecksAreAnsweredWithTheReason) {
+    DaemonProcess::Options options;
+    options.arguments = {"--plugin", pluginFile("fixture_crashing_later")};
+    const DaemonProcess daemon(options);
+    const HttpReply reply = daemon.connect().get("/v1/doctor");
+    EXPECT_EQ(reply.status, 200);
+    EXPECT_THAT(reply.body, HasSubstr(R"("name":"worker","state":"failure")"));
+    EXPECT_THAT(reply.body, HasSubstr(R"("name":"socket","state":"ok")"));
+    EXPECT_THAT(reply.body, HasSubstr("Local names, the directory and the plug-ins were not checked."));
+}
+
+}  // namespace
+}  // namespace adminhost::test
