@@ -122,7 +122,7 @@ DaemonReply Connection::send(const std::string& path, const std::string* body, c
         if (isInterrupted()) {
             throw Failure(ExitStatus::failed, "interrupted; nothing was sent");
         }
-        throw Failure(ExitStatus::notReachable, "the daemon cannot be reached at " + _socketPath + ": " + why);
+        throw Unavailable(ExitStatus::notReachable, "the daemon cannot be reached at " + _socketPath + ": " + why);
     }
     curl_easy_getinfo(_transfer->get(), CURLINFO_RESPONSE_CODE, &answer.status);
     curl_header* header = nullptr;

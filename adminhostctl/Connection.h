@@ -29,7 +29,8 @@ struct PostHeaders {
     std::string revision;  ///< the daemon refuses the request (412) unless this is the current one; empty: no condition
 };
 
-/// One connection, kept open between requests. Throws Failure when the daemon cannot be reached (notReachable) or the
+/// One connection, kept open between requests. Throws Unavailable when the daemon cannot be reached (notReachable), and
+/// Failure when the
 /// socket may not be opened (notPermitted). post() throws LostConnection when the connection ends without an answer or
 /// isInterrupted() becomes true before the answer. There is no time limit here, because the daemon limits requests.
 class Connection {
@@ -44,7 +45,8 @@ class Connection {
     /// The body is JSON.
     [[nodiscard]] DaemonReply post(const std::string& path, const std::string& body, const PostHeaders& headers = {});
 
-    /// Escapes one segment of a path.
+    [[nodiscard]] const std::string& socketPath() const noexcept { return _socketPath; }
+    /// Escapes one segment of a path, or a value in its query.
     [[nodiscard]] static std::string escaped(const std::string& segment);
 
   private:

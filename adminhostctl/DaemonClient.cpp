@@ -17,6 +17,7 @@ constexpr long statusOk = 200;
 constexpr long statusNoContent = 204;
 constexpr long statusForbidden = 403;
 constexpr long statusInternal = 500;
+constexpr long statusUnavailable = 503;
 constexpr long statusTimeout = 504;
 
 std::string shownText(const Dictionary& dictionary, std::string_view key) {
@@ -122,6 +123,9 @@ void DaemonClient::fail(const DaemonReply& reply) {
     std::string message = messageOf(reply);
     if (reply.status == statusInternal && !reply.requestId.empty()) {
         message += logText(report(reply.requestId).log);
+    }
+    if (reply.status == statusUnavailable) {
+        throw Unavailable(ExitStatus::failed, message);
     }
     throw Failure(reply.status == statusForbidden ? ExitStatus::notPermitted : ExitStatus::failed, message);
 }

@@ -94,8 +94,8 @@ class DaemonClient {
     /// The command of that name, or "PLUGIN/COMMAND" if two plug-ins have it. Throws Failure(usage), which lists the
     /// known commands.
     [[nodiscard]] CommandRef command(const std::string& name);
-    /// The command that reads, or writes, the state that a file can describe: state is "read" or "write". Throws
-    /// Failure(usage) when no plug-in has one, or several have.
+    /// The command that reads, writes or tries the state that a file can describe: state is "read", "write" or "try".
+    /// Throws Failure(usage) when no plug-in has one, or several have.
     [[nodiscard]] CommandRef stateCommand(std::string_view state);
     /// Sends the request once and returns the answer. A request with a revision fails unless the revision is still
     /// current. Throws Failure with the daemon's message, its findings and, after a failure inside the service, the log
@@ -111,8 +111,9 @@ class DaemonClient {
     /// As report(), but waits up to ten seconds while the request is not done or the daemon cannot be reached.
     [[nodiscard]] RequestReport settledReport(const std::string& requestId);
 
-    /// The JSON value at an address of the daemon. Throws Failure as ask() does.
+    /// The JSON value at an address of the daemon. Throws Failure as ask() does, Unavailable if it may be there soon.
     [[nodiscard]] Value get(const std::string& path);
+    [[nodiscard]] const std::string& socketPath() const noexcept { return _connection.socketPath(); }
 
   private:
     [[noreturn]] void fail(const DaemonReply& answer);

@@ -67,6 +67,14 @@ Description::Description(const Dictionary& command)
       _text(command.text("description")),
       _changes(command.get("access") != Value("read")),
       _state(command.text("state")) {
+    if (const Array* trials = command.get("trials").array()) {
+        for (const Value& element : *trials) {
+            if (const Dictionary* trial = element.dictionary()) {
+                _trials.push_back({std::string(trial->text("name")), textsAt(*trial, "needs"), textsAt(*trial, "uses"),
+                                   std::string(trial->text("error")), std::string(trial->text("detail"))});
+            }
+        }
+    }
     if (const Array* keys = command.get("keys").array()) {
         for (const Value& key : *keys) {
             _keys.add(key);

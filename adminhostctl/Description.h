@@ -44,6 +44,15 @@ struct DescribedKey {
     std::string secretIf;                                    ///< of an element's key: secret while this key is true
 };
 
+/// One check of a command that tries settings (state "try").
+struct Trial {
+    std::string name;                ///< for people
+    std::vector<std::string> needs;  ///< keys of the request without which it is not made
+    std::vector<std::string> uses;   ///< further keys that it reads
+    std::string error;               ///< key of the answer: present if the trial failed
+    std::string detail;              ///< key of the answer that explains the error; empty: none
+};
+
 class Description {
   public:
     Description() = default;
@@ -55,8 +64,10 @@ class Description {
     [[nodiscard]] const std::string& text() const noexcept { return _text; }
     /// Whether the command may change something: it has another right than reading.
     [[nodiscard]] bool changes() const noexcept { return _changes; }
-    /// "read" if the command reads the state, "write" if it writes the state; empty for other commands.
+    /// "read" if the command reads the state, "write" if it writes it, "try" if it tries values before they are
+    /// written; empty for other commands.
     [[nodiscard]] const std::string& state() const noexcept { return _state; }
+    [[nodiscard]] const std::vector<Trial>& trials() const noexcept { return _trials; }
     /// A request that reads only this section of the state; empty if the description has none.
     [[nodiscard]] Dictionary partOf(const std::string& section) const;
     [[nodiscard]] const std::vector<DescribedKey>& keys() const noexcept { return _keys.all; }
@@ -82,6 +93,7 @@ class Description {
     std::string _text;
     bool _changes = false;
     std::string _state;
+    std::vector<Trial> _trials;
     Dictionary _parts;
     Keys _keys;
     Keys _answer;

@@ -14,6 +14,16 @@ enum class ExitStatus : int {
     notReachable = 3,  ///< no daemon at the socket
     notPermitted = 4,
     undetermined = 6,  ///< the answer to a write is missing, and whether everything was written cannot be determined
+
+    // Of "doctor", which has numbers of its own.
+    warnings = 1,
+    failures = 2,
+    notChecked = 3,  ///< the daemon cannot be asked
+
+    // Of "status": those that init scripts use.
+    runningWithIssue = 1,
+    stopped = 3,
+    unknown = 4,  ///< also if the daemon cannot be asked
 };
 
 /// Ends the program with a message for people and a status; caught in one place, main().
@@ -24,6 +34,12 @@ class Failure : public std::runtime_error {
 
   private:
     ExitStatus _status;
+};
+
+/// The daemon cannot be asked now; it may be possible soon.
+class Unavailable : public Failure {
+  public:
+    using Failure::Failure;
 };
 
 /// The failure of a command line that cannot be carried out.

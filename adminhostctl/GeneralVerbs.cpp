@@ -1,5 +1,7 @@
 #include "adminhostctl/GeneralVerbs.h"
 
+#include "adminhostctl/DoctorVerb.h"
+#include "adminhostctl/LogsVerb.h"
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
@@ -14,7 +16,7 @@ using Words = std::span<const std::string>;
 
 // The daemon itself
 
-ExitStatus status(const Context& context, Words) {
+ExitStatus daemon(const Context& context, Words) {
     writeValue(context, context.service.overview(), Description());
     return ExitStatus::done;
 }
@@ -147,13 +149,24 @@ ExitStatus whois(const Context& context, Words arguments) {
 }
 
 constexpr std::array table = {
-    Verb{"status", "", "Show the running request, the waiting ones and the plug-ins", 0, 0, &status},
+    Verb{"daemon", "", "Show the daemon's running request, the waiting ones and the plug-ins", 0, 0, &daemon},
     Verb{"commands", "[--names]", "List the commands", 0, 0, &commands},
     Verb{"help", "[COMMAND]", "List the verbs, or describe a command", 0, 1, &help},
+    Verb{"doctor", "", "Check the installation", 0, 0, &doctor},
+    Verb{"logs", "[-f] [-n LINES] [NAME]", "List the service's logs, or print the end of one", 0, 1, &logs},
     Verb{"whois", "NAME|UUID", "Show the people and groups with this name or UUID", 1, 1, &whois},
 };
 
+constexpr std::array options = {
+    VerbOption{followOption, "", "With logs: print also what is written from now on", {}, "-f"},
+    VerbOption{linesOption, "LINES", "With logs: print the last so many lines", {}, "-n"},
+};
+
 }  // namespace
+
+std::span<const VerbOption> generalOptions() noexcept {
+    return options;
+}
 
 std::span<const Verb> generalVerbs() noexcept {
     return table;

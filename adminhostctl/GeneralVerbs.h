@@ -9,5 +9,6 @@
 namespace adminhost::ctl {
 
 [[nodiscard]] std::span<const Verb> generalVerbs() noexcept;
+[[nodiscard]] std::span<const VerbOption> generalOptions() noexcept;
 
 }  // namespace adminhost::ctl

@@ -11,6 +11,7 @@
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/DesiredVerbs.h"
 #include "adminhostctl/lumio/LumioVerbs.h"
+#include "adminhostctl/lumio/ServiceVerbs.h"
 #include "platform/files/StandardDescriptors.h"
 
 #include <algorithm>
@@ -50,8 +51,8 @@ int statusOf(ExitStatus status) {
 /// In the order in which help lists them.
 std::vector<adminhost::ctl::Verb> allVerbs() {
     std::vector<adminhost::ctl::Verb> all;
-    for (const auto& table :
-         {adminhost::ctl::generalVerbs(), adminhost::ctl::lumioVerbs(), adminhost::ctl::desiredVerbs()}) {
+    for (const auto& table : {adminhost::ctl::serviceVerbs(), adminhost::ctl::generalVerbs(),
+                              adminhost::ctl::lumioVerbs(), adminhost::ctl::desiredVerbs()}) {
         all.insert(all.end(), table.begin(), table.end());
     }
     return all;
@@ -61,12 +62,13 @@ std::vector<adminhost::ctl::Verb> allVerbs() {
 void addOption(CLI::App& app, const adminhost::ctl::VerbOption& option, adminhost::ctl::VerbOptions& options) {
     const std::string name(option.name);
     const std::string help(option.help);
+    const std::string names = option.brief.empty() ? name : std::string(option.brief) + ',' + name;
     CLI::Option* const added =
         option.argument.empty()
             ? app.add_flag_callback(
-                  name, [&options, name] { options.own[name]; }, help)
+                  names, [&options, name] { options.own[name]; }, help)
             : app.add_option_function<std::string>(
-                     name, [&options, name](const std::string& text) { options.own[name] = text; }, help)
+                     names, [&options, name](const std::string& text) { options.own[name] = text; }, help)
                   ->type_name(std::string(option.argument));
     if (!option.excludes.empty()) {
         added->excludes(app.get_option(std::string(option.excludes)));
@@ -91,7 +93,8 @@ int runMain(int count, char** words) {
     app.add_flag("--names", options.names, "Print only names, one a line");
     bool clear = false;
     app.add_flag("--clear", clear, "Remove a stored secret: without this an empty secret is rejected");
-    for (const auto& table : {adminhost::ctl::lumioOptions(), adminhost::ctl::desiredOptions()}) {
+    for (const auto& table : {adminhost::ctl::generalOptions(), adminhost::ctl::lumioOptions(),
+                              adminhost::ctl::serviceOptions(), adminhost::ctl::desiredOptions()}) {
         for (const adminhost::ctl::VerbOption& option : table) {
             addOption(app, option, options);
         }
@@ -117,8 +120,9 @@ int runMain(int count, char** words) {
     options.width = outputWidth();
     try {
         adminhost::ctl::DaemonClient service(socket);
-        const adminhost::ctl::Sources sources{&adminhost::ctl::readSource, &adminhost::ctl::askSecret,
-                                              adminhost::ctl::inputIsTerminal(), clear};
+        const adminhost::ctl::Sources sources{&adminhost::ctl::readSource,       &adminhost::ctl::askSecret,
+                                              adminhost::ctl::inputIsTerminal(), clear,
+                                              &adminhost::ctl::askKnownSecret,   &adminhost::ctl::confirm};
         const std::vector<adminhost::ctl::Verb> verbs = allVerbs();
         const ExitStatus status = adminhost::ctl::run({service, options, sources, std::cout, std::cerr, verbs}, rest);
         std::cout.flush();

@@ -166,4 +166,19 @@ std::string askSecret(const std::string& key) {
     return first;
 }
 
+std::string askKnownSecret(const std::string& key) {
+    return askOnce(key, key + ": ");
+}
+
+bool confirm(const std::string& question) {
+    const std::string text = question + " [y/N] ";
+    static_cast<void>(!::write(STDERR_FILENO, text.data(), text.size()));
+    std::string reply;
+    char c = 0;
+    while (::read(STDIN_FILENO, &c, 1) == 1 && c != '\n') {
+        reply.push_back(c);
+    }
+    return reply == "y" || reply == "Y" || reply == "yes";
+}
+
 }  // namespace adminhost::ctl

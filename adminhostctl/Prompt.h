@@ -18,4 +18,10 @@ namespace adminhost::ctl {
 /// differ.
 [[nodiscard]] std::string askSecret(const std::string& key);
 
+/// Asks once for a secret that exists already, in the same way.
+[[nodiscard]] std::string askKnownSecret(const std::string& key);
+
+/// Asks a question on the terminal, and returns true if the reply is "y" or "yes".
+[[nodiscard]] bool confirm(const std::string& question);
+
 }  // namespace adminhost::ctl

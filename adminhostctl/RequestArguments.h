@@ -21,6 +21,10 @@ struct Sources {
     std::function<std::string(const std::string& key)> ask;
     bool terminal = false;  ///< standard input is a terminal
     bool clear = false;     ///< an empty secret is intended: it removes the stored one
+    /// Asks once for a secret that exists already, without showing what is typed.
+    std::function<std::string(const std::string& key)> askKnown = {};
+    /// Asks a question; true for yes. Only called when standard input is a terminal.
+    std::function<bool(const std::string& question)> confirm = {};
 };
 
 /// Builds the request. Each argument is KEY=TEXT (converted to the key's type), KEY:=JSON, KEY@FILE or KEY@- (standard

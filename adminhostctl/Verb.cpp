@@ -13,19 +13,6 @@ namespace {
 
 using Words = std::span<const std::string>;
 
-void printNotDone(const Context& context, const RequestReport& report) {
-    if (report.notDone.empty()) {
-        return;
-    }
-    context.err << "adminhostctl: these parts of the request were not carried out:\n";
-    for (const ReportedGap& gap : report.notDone) {
-        context.err << "  " << shownIndented(gapText(gap), 4) << '\n';
-    }
-    if (report.notDoneDropped > 0) {
-        context.err << "  and " << report.notDoneDropped << " more\n";
-    }
-}
-
 std::string changeText(const ReportedChange& change) {
     const auto valueText = [&](const Value& value) {
         return change.secret ? "(secret)" : value.isNull() ? "(not set)" : textOf(value);
@@ -43,24 +30,21 @@ ExitStatus perform(const Context& context, Words words) {
     }
     const Dictionary request =
         buildRequest(command.description, std::move(base), {words.begin() + 1, words.end()}, context.sources);
-    CommandAnswer answer;
-    try {
-        answer = context.service.ask(command, request);
-    } catch (const LostAnswer& lost) {
-        const RequestReport report = reportLost(context, lost);
-        return report.state == RequestReport::State::done ? ExitStatus::failed : ExitStatus::undetermined;
-    }
     ExitStatus status = ExitStatus::done;
-    if (!answer.value) {
-        context.out << (context.options.format == Format::text && !answer.notDone ? "done\n" : "");
+    const auto answer = askOnce(context, command, request, status);
+    if (!answer) {
+        return status;
+    }
+    if (!answer->value) {
+        context.out << (context.options.format == Format::text && !answer->notDone ? "done\n" : "");
     } else {
-        writeValue(context, *answer.value, command.description);
-        const Dictionary* dictionary = answer.value->dictionary();
+        writeValue(context, *answer->value, command.description);
+        const Dictionary* dictionary = answer->value->dictionary();
         status = reportAnswered(context, dictionary != nullptr ? errorOf(command.description, *dictionary) : "");
     }
-    if (answer.notDone) {
+    if (answer->notDone) {
         status = ExitStatus::failed;
-        printNotDone(context, context.service.report(answer.requestId));
+        printNotDone(context, context.service.report(answer->requestId));
     }
     return status;
 }
@@ -106,6 +90,30 @@ ExitStatus reportAnswered(const Context& context, const std::string& error) {
 std::string gapText(const ReportedGap& gap) {
     return gap.keyPath + (gap.keyPath.empty() ? "" : ": ") + gap.reason +
            (gap.toolMessage.empty() ? "" : " (" + gap.toolMessage + ")");
+}
+
+void printNotDone(const Context& context, const RequestReport& report) {
+    if (report.notDone.empty()) {
+        return;
+    }
+    context.err << "adminhostctl: these parts of the request were not carried out:\n";
+    for (const ReportedGap& gap : report.notDone) {
+        context.err << "  " << shownIndented(gapText(gap), 4) << '\n';
+    }
+    if (report.notDoneDropped > 0) {
+        context.err << "  and " << report.notDoneDropped << " more\n";
+    }
+}
+
+std::optional<CommandAnswer> askOnce(const Context& context, const CommandRef& command, const Dictionary& request,
+                                     ExitStatus& status) {
+    try {
+        return context.service.ask(command, request);
+    } catch (const LostAnswer& lost) {
+        const RequestReport report = reportLost(context, lost);
+        status = report.state == RequestReport::State::done ? ExitStatus::failed : ExitStatus::undetermined;
+        return std::nullopt;
+    }
 }
 
 RequestReport reportLost(const Context& context, const LostAnswer& lost) {

@@ -27,6 +27,7 @@ struct VerbOption {
     std::string_view argument;  ///< "FILE"; empty for an option without one
     std::string_view help;
     std::string_view excludes = {};  ///< the name of an option that must not be given with it
+    std::string_view brief = {};     ///< "-g"; empty for an option without a short form
 };
 
 struct VerbOptions {
@@ -76,6 +77,14 @@ void writeValue(const Context& context, const Value& value, const Description& d
 
 /// "list.0: reason (words of the tool)".
 [[nodiscard]] std::string gapText(const ReportedGap& gap);
+
+/// Prints which parts of a request were not carried out, and why.
+void printNotDone(const Context& context, const RequestReport& report);
+
+/// Sends a request once. If its answer is missing, prints why and what became of the request, as reportLost() does,
+/// sets the status and returns nullopt.
+[[nodiscard]] std::optional<CommandAnswer> askOnce(const Context& context, const CommandRef& command,
+                                                   const Dictionary& request, ExitStatus& status);
 
 /// Prints on standard error why the answer to a request is missing, and its outcome: what the daemon reports as changed
 /// and as not done, and the log lines. Does not send the request again. Returns the printed report.

@@ -47,7 +47,7 @@ ACCESS = {
     "account": "It handles accounts and their passwords.",
 }
 
-COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline_seconds", "shows_revision", "takes_revision", "state", "parts",
+COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline_seconds", "shows_revision", "takes_revision", "state", "parts", "trials",
                  "errors", "keys", "answer", "include", "example"}
 # Words for programs that compare and write a desired state (README.md).
 STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_file", "kind", "kinds", "secret_if", "file",
@@ -199,6 +199,11 @@ def load(directory):
             for section, text in command.get("parts", {}).items():
                 command["parts"][section] = json.loads(text, object_pairs_hook=from_json)
                 check_example(command["parts"][section], keys, "", f"part {section}")
+            need(("trials" in command) == (command.get("state") == "try"), "trials belong to state = \"try\"")
+            for trial in command.get("trials", []):
+                need({"name", "needs", "error"} <= set(trial) <= {"name", "needs", "uses", "error", "detail"}, f"trial {trial}: wrong words")
+                need(all(key in keys for key in trial["needs"] + trial.get("uses", [])), f"trial {trial['name']}: not a request key")
+                need(all(trial.get(word, trial["error"]) in command["all_answers"] for word in ("error", "detail")), f"trial {trial['name']}: not an answer key")
             need("request" in command.get("example", {}), "example.request is missing")
             for what, described in (("request", keys), ("answer", command["all_answers"])):
                 if what in command["example"]:
@@ -207,9 +212,9 @@ def load(directory):
                     command["example"][what] = value
         except Wrong as error:
             raise Wrong(f"{name}.toml: {error}") from error
-    for word in ("read", "write"):
+    for word in ("read", "write", "try"):
         need(sum(command.get("state") == word for command in commands.values()) <= 1, f"two commands have state = {word}")
-    need(all(command.get("state", "read") in ("read", "write") for command in commands.values()), "state is read or write")
+    need(all(command.get("state", "read") in ("read", "write", "try") for command in commands.values()), "state is read, write or try")
     by_order = {}
     for name, command in commands.items():
         other = by_order.setdefault(command["order"], name)
@@ -251,7 +256,7 @@ def describe(name, command):
         "name": name,
         "summary": command["summary"].strip(),
         "description": " ".join(command.get("description", command["summary"]).split()),
-        **{word: command[word] for word in ("state", "parts") if word in command},
+        **{word: command[word] for word in ("state", "parts", "trials") if word in command},
         "keys": [key_description(path, key) for path, key in command["all_keys"].items()],
         "answer": [key_description(path, key) for path, key in command["all_answers"].items()],
         "errors": command.get("errors", []),

@@ -4,6 +4,7 @@
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/DesiredFile.h"
 #include "adminhostctl/desired/LookingBack.h"
+#include "adminhostctl/desired/Trial.h"
 #include "adminhostctl/desired/Writing.h"
 
 #include <array>
@@ -13,7 +14,7 @@ namespace {
 
 using Words = std::span<const std::string>;
 
-constexpr std::string_view passwordFileOption = "--password-file";
+constexpr std::string_view validateOption = "--validate";
 
 /// The desired state from the file and the password file.
 Wanted wantedOf(const Context& context, const std::string& file, const CurrentState& current) {
@@ -74,7 +75,11 @@ ExitStatus settingsSet(const Context& context, Words arguments) {
         wanted.settings.set(name, valueOfWord(key, wordAt(arguments, 1), context.sources));
     }
     wanted.lookUp = true;
-    return carryOut(context, wanted, readState(context));
+    const CurrentState current = readState(context);
+    if (context.options.has(validateOption) && !passTrials(context, wanted, current)) {
+        throw Failure(ExitStatus::failed, "nothing was written, because the setting failed a trial");
+    }
+    return carryOut(context, wanted, current);
 }
 
 ExitStatus exportState(const Context& context, Words arguments) {
@@ -110,7 +115,8 @@ ExitStatus applyFile(const Context& context, Words arguments) {
 
 constexpr std::array table = {
     Verb{"settings get", "[KEY]", "Show the settings, or one of them", 0, 1, &settingsGet},
-    Verb{"settings set", "KEY [VALUE|@FILE|@-]", "Change a setting", 1, 2, &settingsSet},
+    Verb{"settings set", "KEY [VALUE|@FILE|@-] [--validate [--password-file FILE]]", "Change a setting", 1, 2,
+         &settingsSet},
     Verb{"export", "[FILE]", "Write settings and lists to a TOML file", 0, 1, &exportState},
     Verb{"plan", "FILE [--password-file FILE]", "Show what applying the file would change", 1, 1, &planFile},
     Verb{"apply", "FILE [--password-file FILE]", "Change what differs from the file", 1, 1, &applyFile},
@@ -120,7 +126,9 @@ constexpr std::array table = {
 
 constexpr std::array options = {
     VerbOption{passwordFileOption, "FILE",
-               "With plan and apply: read the service's password from a file; - asks, or reads standard input"},
+               "Read a password from a file; - asks, or reads standard input. With plan, apply and settings set "
+               "--validate the grid account's, with account create the directory administrator's"},
+    VerbOption{validateOption, "", "With settings set: try the setting before it is written"},
 };
 
 }  // namespace

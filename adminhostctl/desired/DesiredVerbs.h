@@ -5,8 +5,12 @@
 #include "adminhostctl/Verb.h"
 
 #include <span>
+#include <string_view>
 
 namespace adminhost::ctl {
+
+/// The option for a file with a password; "-" asks, or reads standard input.
+inline constexpr std::string_view passwordFileOption = "--password-file";
 
 [[nodiscard]] std::span<const Verb> desiredVerbs() noexcept;
 [[nodiscard]] std::span<const VerbOption> desiredOptions() noexcept;

@@ -208,8 +208,8 @@ TEST_F(Ctl, CommandsAndHelpComeFromTheDaemon) {
     EXPECT_EQ(run({"help", "fail", "--names"}).out, "status=\n");
 }
 
-TEST_F(Ctl, StatusListsPlugInsAndWaitingRequests) {
-    EXPECT_THAT(run({"status"}).out,
+TEST_F(Ctl, DaemonListsPlugInsAndWaitingRequests) {
+    EXPECT_THAT(run({"daemon"}).out,
                 AllOf(HasSubstr("waiting"), HasSubstr("plugins (1)\n"), HasSubstr("described  1.0.0")));
 }
 
@@ -226,7 +226,7 @@ TEST_F(Ctl, WrongNumbersOfArgumentsAreUsage) {
 }
 
 TEST(CtlReach, NoDaemonIsStatusThree) {
-    const Result result = runIn(program, {"status"}, "/nowhere/socket");
+    const Result result = runIn(program, {"daemon"}, "/nowhere/socket");
     EXPECT_EQ(result.status, 3);
     EXPECT_THAT(result.err, HasSubstr("cannot be reached at /nowhere/socket: No such file or directory"));
 }
@@ -235,8 +235,9 @@ TEST(CtlReach, VersionAndOptionsNeedNoDaemon) {
     EXPECT_EQ(runIn(program, {"--version"}, "/nowhere/socket").out, "adminhostctl " ADMINHOST_RELEASE "\n");
     const Result options = runIn(program, {"--help"}, "/nowhere/socket");
     EXPECT_EQ(options.status, 0);
-    for (const char* option : {"--socket", "--format", "--file", "--names", "--group", "--password-file", "--protect",
-                               "--no-protect", "--clear", "--version"}) {
+    for (const char* option :
+         {"--socket", "--format", "--file", "--names", "--group", "--password-file", "--protect", "--no-protect",
+          "--clear", "--follow", "--lines", "--validate", "--save", "--yes", "--version"}) {
         EXPECT_THAT(options.out, HasSubstr(option));
     }
 }
@@ -267,7 +268,7 @@ TEST(CtlReach, WhoMayNotUseTheDaemonGetsStatusFour) {
                                                 "--regid=65534",
                                                 "--clear-groups",
                                                 "./adminhostctl",
-                                                "status"};
+                                                "daemon"};
         std::filesystem::permissions(daemon.directory(), std::filesystem::perms(0755));
         std::filesystem::permissions(daemon.socket(), std::filesystem::perms(0666));
         const Result refused = runIn("/usr/bin/env", words, "socket");
@@ -277,7 +278,7 @@ TEST(CtlReach, WhoMayNotUseTheDaemonGetsStatusFour) {
         EXPECT_EQ(runIn("/usr/bin/env", words, "socket").status, 4);
     } else {
         std::filesystem::permissions(daemon.socket(), std::filesystem::perms(0000));
-        const Result closed = runIn(program, {"status"}, daemon.socket());
+        const Result closed = runIn(program, {"daemon"}, daemon.socket());
         EXPECT_EQ(closed.status, 4) << closed.err;
     }
 }

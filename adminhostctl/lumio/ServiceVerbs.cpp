@@ -1,0 +1,70 @@
+#include "adminhostctl/lumio/ServiceVerbs.h"
+
+#include "adminhostctl/lumio/AccountVerb.h"
+#include "adminhostctl/lumio/StatusVerb.h"
+
+#include <array>
+#include <string>
+
+namespace adminhost::ctl {
+namespace {
+
+using Words = std::span<const std::string>;
+
+/// Sends a command without arguments and reports that it has been carried out.
+ExitStatus control(const Context& context, const std::string& name, const char* done) {
+    const CommandRef command = context.service.command(name);
+    ExitStatus status = ExitStatus::done;
+    const auto answer = askOnce(context, command, {}, status);
+    if (!answer) {
+        return status;
+    }
+    if (context.options.format == Format::text) {
+        context.out << done << '\n';
+    } else if (answer->value) {
+        writeValue(context, *answer->value, command.description);
+    }
+    const Dictionary* dictionary = answer->value ? answer->value->dictionary() : nullptr;
+    return reportAnswered(context, dictionary == nullptr ? "" : errorOf(command.description, *dictionary));
+}
+
+ExitStatus start(const Context& context, Words) {
+    return control(context, "startService", "The service has been started.");
+}
+
+ExitStatus stop(const Context& context, Words) {
+    return control(context, "stopService", "The service has been stopped.");
+}
+
+/// The command is kept for clients that send it. Its success must not be read as a restart.
+ExitStatus recycle(const Context& context, Words) {
+    return control(context, "recycleService",
+                   "Nothing was done: recycleService does nothing. To restart the service, run \"adminhostctl stop\" "
+                   "and then \"adminhostctl start\".");
+}
+
+constexpr std::array table = {
+    Verb{"status", "", "Show the service's state, and the daemon's", 0, 0, &serviceStatus},
+    Verb{"start", "", "Start the service", 0, 0, &start},
+    Verb{"stop", "", "Stop the service", 0, 0, &stop},
+    Verb{"recycleService", "", "Do nothing: stop and start restart the service", 0, 1, &recycle},
+    Verb{"account create", "NODE ADMINISTRATOR [--password-file FILE] [--save [--yes]]",
+         "Create the grid account in a directory node", 2, 2, &accountCreate},
+};
+
+constexpr std::array options = {
+    VerbOption{saveOption, "", "With account create: write the account's name and password into the settings"},
+    VerbOption{yesOption, "", "With account create --save: do not ask"},
+};
+
+}  // namespace
+
+std::span<const VerbOption> serviceOptions() noexcept {
+    return options;
+}
+
+std::span<const Verb> serviceVerbs() noexcept {
+    return table;
+}
+
+}  // namespace adminhost::ctl
