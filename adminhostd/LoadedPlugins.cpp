@@ -3,6 +3,7 @@
 #include "adminhostd/PluginCall.h"
 #include "adminhostd/SettingsHistory.h"
 #include "adminhostd/ToolConfiguration.h"
+#include "platform/files/FilePlace.h"
 #include "platform/files/ReplaceFile.h"
 #include "platform/log/Log.h"
 #include "platform/task/Task.h"
@@ -16,6 +17,17 @@
 #include <unistd.h>
 
 namespace adminhost {
+namespace {
+
+/// Follows no link that another account may have created: it could lead to that account's choice of file.
+void removeLeftover(const HostPath& file) {
+    FilePlace place;
+    if (openPlace(diskPath(file), place) == 0) {
+        static_cast<void>(::unlinkat(place.directory.get(), place.name.c_str(), 0));
+    }
+}
+
+}  // namespace
 
 Result<LoadedPlugin> LoadedPlugins::load(const DiskPath& file, const std::vector<std::string>& languages) {
     const auto failed = [&](std::string_view what, const Error& error) {
@@ -119,7 +131,7 @@ void LoadedPlugins::removeLeftovers() const {
             adminhost::removeLeftovers(file);
         }
         for (const HostPath& file : *others) {
-            static_cast<void>(::unlink(diskPath(file).c_str()));
+            removeLeftover(file);
         }
         SettingsHistory(loaded.name, {}).removeUnfinished();
     }

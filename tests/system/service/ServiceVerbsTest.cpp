@@ -91,6 +91,42 @@ TEST_F(ServiceVerbs, RecycleServiceSaysThatNothingWasDoneAndNamesStopAndStart) {
                                      HasSubstr("adminhostctl start")));
 }
 
+class Leftovers : public ControlledService {
+  protected:
+    const std::string cache = "/var/lumio/server/adminhostd_krb_cc";
+
+    void replaceWorker() const {
+        const pid_t before = daemon.workerPid();
+        ASSERT_EQ(::kill(before, SIGKILL), 0);
+        // The request that meets the dying worker fails; the next worker removes the files before it serves one.
+        int status = 0;
+        for (int tries = 0; status != 200 && tries < 100; ++tries) {
+            status = daemon.connect().post("/v1/lumio/getLogPaths", "{}").status;
+        }
+        EXPECT_EQ(status, 200) << daemon.log();
+        EXPECT_NE(daemon.workerPid(), before);
+    }
+};
+
+TEST_F(Leftovers, TicketOfAWorkerThatWasKilledIsRemovedByTheNextOne) {
+    root.write(cache, "a ticket");
+    replaceWorker();
+    EXPECT_FALSE(std::filesystem::exists(root.disk(cache)));
+}
+
+TEST_F(Leftovers, FileBehindALinkThatOthersMayHaveCreatedStays) {
+    const std::filesystem::path elsewhere = root.disk("/var/elsewhere");
+    std::filesystem::rename(root.disk("/var/lumio/server"), elsewhere);
+    root.write("/var/elsewhere/adminhostd_krb_cc", "of somebody else");
+    std::filesystem::create_directory_symlink(elsewhere, root.disk("/var/lumio/server"));
+    replaceWorker();
+    EXPECT_FALSE(std::filesystem::exists(elsewhere / "adminhostd_krb_cc")) << "here only root could create the link";
+    root.write("/var/elsewhere/adminhostd_krb_cc", "of somebody else");
+    std::filesystem::permissions(root.disk("/var/lumio"), std::filesystem::perms(0777));
+    replaceWorker();
+    EXPECT_TRUE(std::filesystem::exists(elsewhere / "adminhostd_krb_cc"));
+}
+
 TEST(ServiceStatus, DaemonThatCannotBeReachedIsStatusFour) {
     const ProgramResult result = runProgram(
         {std::string(BINARY_DIR) + "/bin/adminhostctl", "--socket", "/nowhere/socket", "status"}, Errors::merge);
