@@ -127,11 +127,13 @@ void LoadedPlugins::removeLeftovers() const {
                                  loaded.name, textOf((files ? others : files).error().description)));
             continue;
         }
-        for (const HostPath& file : *files) {
-            adminhost::removeLeftovers(file);
-        }
+        // Settings files may be on a file system that hangs. What is left elsewhere, such as tickets, must not wait for
+        // it.
         for (const HostPath& file : *others) {
             removeLeftover(file);
+        }
+        for (const HostPath& file : *files) {
+            adminhost::removeLeftovers(file);
         }
         SettingsHistory(loaded.name, {}).removeUnfinished();
     }

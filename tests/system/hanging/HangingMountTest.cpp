@@ -11,6 +11,7 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 namespace adminhost::test {
 namespace {
@@ -43,9 +44,17 @@ TEST(HangingSharedFileSystem, EndsTheRequestAtItsTimeLimitWhileTheFrontReplies) 
     second.begin("POST", "/v1/lumio/getState", R"({"variant":"withDetails"})");
     EXPECT_THAT(daemon.connect().get("/v1/").body, HasSubstr("getState"));
 
+    // As a check that was interrupted would leave it.
+    const std::string cache = root.disk("/var/lumio/server/adminhostd_krb_cc");
+    root.write("/var/lumio/server/adminhostd_krb_cc", "tickets");
     EXPECT_EQ(client.reply().status, 504);
     EXPECT_GE(Clock::now() - start, ownLimit);
     EXPECT_LT(Clock::now() - start, ownLimit + margin);
+    const auto end = Clock::now();
+    while (std::filesystem::exists(cache) && Clock::now() - end < margin) {
+        ::usleep(10'000);
+    }
+    EXPECT_FALSE(std::filesystem::exists(cache)) << "the next worker removes it although the file system hangs still";
     hanging.reset();
     const HttpReply reply = second.reply();
     EXPECT_EQ(reply.status, 200) << reply.body;
