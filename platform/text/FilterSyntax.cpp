@@ -87,11 +87,7 @@ class FilterParser {
             case '!':
                 ++_at;
                 skipBlanks();
-                if (!filter(depth + 1)) {
-                    return false;
-                }
-                skipBlanks();
-                return pass(')', "a closing parenthesis");
+                return filter(depth + 1) && pass(')', "a closing parenthesis");
             default:
                 return item();
         }

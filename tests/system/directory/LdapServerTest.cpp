@@ -164,6 +164,29 @@ TEST_F(ServerWithPassword, WrongPasswordIsAFindingThatDoesNotShowIt) {
     EXPECT_THAT(daemon.log(), Not(HasSubstr("planted-password")));
 }
 
+/// A daemon that the service manager has given a credential.
+class ServerWithCredential : private SeededServer, public testing::Test {
+  protected:
+    [[nodiscard]] HttpReply annaWith(const std::string& password) const {
+        std::ofstream(server.directory() / "ldap-password") << password;
+        DaemonProcess::Options options;
+        options.configuration =
+            node("bind_dn = \"cn=admin,dc=nimbo,dc=test\"\nbind_password_credential = \"ldap-password\"\n");
+        options.arguments = {"--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"};
+        options.environment = {"CREDENTIALS_DIRECTORY=" + server.directory().string()};
+        return DaemonProcess(options).connect().get("/v1/directory?is=anna");
+    }
+};
+
+TEST_F(ServerWithCredential, IsSignedInToWithTheCredentialOfTheServiceManager) {
+    const HttpReply known = annaWith("adminpw");
+    EXPECT_EQ(known.status, 200);
+    EXPECT_THAT(known.body, HasSubstr("Anna of the Server"));
+    const HttpReply refused = annaWith("planted-password");
+    EXPECT_EQ(refused.status, 500);
+    EXPECT_THAT(refused.body, Not(HasSubstr("planted-password")));
+}
+
 class CheckedServer : private SeededServer, public testing::Test {
   protected:
     [[nodiscard]] ProgramResult check(const std::string& more = "") const {

@@ -1,3 +1,4 @@
+#include "platform/directory/LdapNode.h"
 #include "platform/text/FilterSyntax.h"
 
 #include <string>
@@ -17,7 +18,7 @@ TEST(FilterSyntax, FiltersOfEveryKindAreAccepted) {
                                "(|)",
                                "(&(a=b)(!(c=d)))",
                                "(| (a=b)\n (c>=d) )",
-                               "(! (a=b) )",
+                               "(! (a=b))",
                                "(a~=b)",
                                "(a<=b)",
                                "(cn;lang-de=x)",
@@ -33,6 +34,12 @@ TEST(FilterSyntax, FiltersOfEveryKindAreAccepted) {
                                "(userAccountControl:1.2.840.113556.1.4.803:=2)"}) {
         const auto problem = ldapFilterProblem(filter);
         EXPECT_FALSE(problem) << filter << " at " << (problem ? problem->offset : 0);
+        LdapNodeSettings settings;
+        settings.name = "/Example";
+        settings.uris = {"ldap://localhost"};
+        settings.base = "dc=example";
+        settings.userFilter = filter;
+        EXPECT_TRUE(checkLdapNodeSettings(settings)) << filter << ": the LDAP library does not accept it";
     }
 }
 
