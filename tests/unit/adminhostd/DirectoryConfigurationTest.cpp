@@ -3,8 +3,9 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <map>
-#include <set>
+#include <sstream>
 #include <stdexcept>
 #include <string>
 
@@ -15,7 +16,6 @@ namespace adminhost {
 namespace {
 
 using testing::ElementsAre;
-using testing::HasSubstr;
 using testing::Pair;
 using testing::StartsWith;
 
@@ -49,6 +49,11 @@ class DirectoryConfiguration : public testing::Test {
 
     std::string _file;
 };
+
+std::string contentOf(const std::string& file) {
+    std::ifstream stream(std::string(SOURCE_DIR) + '/' + file);
+    return {std::istreambuf_iterator<char>(stream), {}};
+}
 
 const char* const node = "[[directory.node]]\nname = \"/LDAP\"\nuri = [\"ldap://a\"]\nbase = \"dc=a\"\n";
 
@@ -237,16 +242,40 @@ TEST_F(DirectoryConfiguration, WrongValueOfEveryKeyIsAnErrorAtItsPlace) {
     }
 }
 
-TEST_F(DirectoryConfiguration, EveryKnownKeyHasAWrongValueInThisTest) {
+TEST_F(DirectoryConfiguration, EveryKnownKeyIsDocumentedAndHasAWrongValueInThisTest) {
     const std::string message = mistakeIn(std::string(node) + "usr_base = \"ou=u\"\n");
     EXPECT_THAT(message, StartsWith("line 5, column 1: unknown key \"directory.node.usr_base\"; known keys: "));
+    const std::string manual = contentOf("packaging/man/adminhostd.8");
+    const std::string reference = contentOf("docs/directory.md");
     std::string known = message.substr(message.rfind(": ") + 2) + ", ";
     std::size_t count = 0;
     for (std::size_t end = 0; (end = known.find(", ")) != std::string::npos; known.erase(0, end + 2)) {
-        EXPECT_TRUE(wrongValues.contains(known.substr(0, end))) << known.substr(0, end);
+        const std::string key = known.substr(0, end);
+        EXPECT_TRUE(wrongValues.contains(key)) << key;
+        EXPECT_NE(manual.find("\n.Va " + key), std::string::npos) << key;
+        EXPECT_TRUE(reference.find('`' + key + '`') != std::string::npos ||
+                    reference.find("[directory.node." + key) != std::string::npos)
+            << key;
         ++count;
     }
     EXPECT_GT(count, 20U);
+}
+
+TEST_F(DirectoryConfiguration, ExamplesOfTheDocumentationAreAccepted) {
+    std::istringstream lines(contentOf("docs/directory.md"));
+    std::string example;
+    std::size_t nodes = 0;
+    for (std::string line; std::getline(lines, line);) {
+        if (line.empty() || line.starts_with("    ")) {
+            example += line.empty() ? "\n" : line.substr(4) + '\n';
+            continue;
+        }
+        if (example.find("[[directory.node]]") != std::string::npos) {
+            EXPECT_NO_THROW(nodes += read(example).nodes.size()) << example;
+        }
+        example.clear();
+    }
+    EXPECT_GE(nodes, 5U);
 }
 
 TEST_F(DirectoryConfiguration, MistakesInTablesAndBetweenKeysAreNamedWithTheirPlaces) {
