@@ -5,9 +5,6 @@
 #include "platform/value/ValueText.h"
 #include "settings/SettingsStore.h"
 
-#include <filesystem>
-#include <system_error>
-
 namespace lumio {
 
 using adminhost::Bundle;
@@ -16,24 +13,6 @@ using adminhost::DiskPath;
 using adminhost::Error;
 using adminhost::HostPath;
 using adminhost::Value;
-
-namespace {
-
-/// Returns true for a place below the system root, after all links on the way. A place that does not exist is not below
-/// it.
-bool isBelowRoot(const DiskPath& path) {
-    namespace fs = std::filesystem;
-    std::error_code error;
-    const fs::path place = fs::canonical(path.text(), error);
-    if (error) {
-        return false;
-    }
-    const fs::path root = fs::canonical(adminhost::systemRoot(), error);
-    const fs::path way = place.lexically_relative(root);
-    return !error && !way.empty() && *way.begin() != "..";
-}
-
-}  // namespace
 
 std::optional<std::vector<std::unique_ptr<Workflow>>> Workflow::allWorkflowsWithError(std::optional<Error>& error) {
     // The tool would create a missing database as an empty file.
@@ -55,7 +34,7 @@ std::optional<Bundle> Workflow::bundle() {
         return std::nullopt;
     }
     const HostPath place(SettingsStore::sharedFilesystemPath() + "/" + textOf(*path));
-    return isBelowRoot(diskPath(place)) ? Bundle::open(place) : std::nullopt;
+    return adminhost::isBelowSystemRoot(diskPath(place)) ? Bundle::open(place) : std::nullopt;
 }
 
 std::optional<Dictionary> Workflow::uncachedInfoDictionary() {
@@ -64,7 +43,8 @@ std::optional<Dictionary> Workflow::uncachedInfoDictionary() {
         return std::nullopt;
     }
     const DiskPath file = diskPath(HostPath(opened->path().text() + "/Contents/Info.plist"));
-    const auto bytes = isBelowRoot(file) ? adminhost::readFile(file, informationMaximumSize) : std::string();
+    const auto bytes =
+        adminhost::isBelowSystemRoot(file) ? adminhost::readFile(file, informationMaximumSize) : std::string();
     auto value = bytes ? adminhost::parsePropertyList(*bytes) : adminhost::failure(bytes.error());
     Dictionary* information = value ? value->dictionary() : nullptr;
     return information == nullptr ? std::nullopt : std::optional(std::move(*information));

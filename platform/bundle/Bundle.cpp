@@ -27,7 +27,11 @@ bool isDirectory(const fs::path& path) {
 
 }  // namespace
 
-Bundle::Bundle(HostPath path) : _path(std::move(path)) {
+const std::vector<Bundle::Localization>& Bundle::listed() const {
+    if (_localizations) {
+        return *_localizations;
+    }
+    std::vector<Localization> all;
     const fs::path directory = diskPath(_path).text();
     for (const fs::path& place : {directory / "Contents/Resources", directory / "Resources", directory}) {
         std::error_code error;
@@ -36,13 +40,15 @@ Bundle::Bundle(HostPath path) : _path(std::move(path)) {
              entry.increment(error), ++seen) {
             std::error_code failed;
             std::string name = entry->path().stem().string();
-            if (entry->is_directory(failed) && isLanguage(name)) {
-                _localizations.push_back({std::move(name), DiskPath(entry->path().string())});
+            DiskPath path(entry->path().string());
+            if (isLanguage(name) && entry->is_directory(failed) && isBelowSystemRoot(path)) {
+                all.push_back({std::move(name), std::move(path)});
             }
         }
     }
-    std::stable_sort(_localizations.begin(), _localizations.end(),
+    std::stable_sort(all.begin(), all.end(),
                      [](const Localization& a, const Localization& b) { return a.name < b.name; });
+    return _localizations.emplace(std::move(all));
 }
 
 std::optional<Bundle> Bundle::open(const HostPath& path) {
@@ -54,7 +60,7 @@ std::optional<Bundle> Bundle::open(const HostPath& path) {
 
 std::vector<std::string> Bundle::localizations() const {
     std::vector<std::string> names;
-    for (const Localization& localization : _localizations) {
+    for (const Localization& localization : listed()) {
         if (names.empty() || names.back() != localization.name) {
             names.push_back(localization.name);
         }
@@ -63,10 +69,10 @@ std::vector<std::string> Bundle::localizations() const {
 }
 
 std::optional<DiskPath> Bundle::stringsTable(std::string_view table, std::string_view localization) const {
-    for (const Localization& candidate : _localizations) {
+    for (const Localization& candidate : listed()) {
         if (candidate.name == localization) {
             DiskPath path(candidate.directory.text() + "/" + std::string(table) + ".strings");
-            if (exists(path)) {
+            if (isBelowSystemRoot(path)) {
                 return path;
             }
         }

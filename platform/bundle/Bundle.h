@@ -4,7 +4,8 @@
 //
 // A bundle's localizations are the subdirectories of its "Contents/Resources", of its "Resources" and of itself that
 // are named after a language (Language.h), with or without an extension. A strings table is a file TABLE.strings in one
-// of them. A bundle may be on a file system that others write to: reads are bounded, and a pipe is never waited for.
+// of them. A bundle may be on a file system that others write to: reads are bounded, a pipe is never waited for, and
+// localizations and tables that links lead to outside the system root count as missing.
 
 #include "platform/bundle/StringsTable.h"
 #include "platform/files/Path.h"
@@ -36,10 +37,12 @@ class ADMINHOST_EXPORT Bundle {
         DiskPath directory;
     };
 
-    explicit Bundle(HostPath path);
+    explicit Bundle(HostPath path) : _path(std::move(path)) {}
+    /// By name, then in search order. Lists the directories on the first call: opening a bundle is cheap.
+    [[nodiscard]] const std::vector<Localization>& listed() const;
 
     HostPath _path;
-    std::vector<Localization> _localizations;  ///< by name, then in search order
+    mutable std::optional<std::vector<Localization>> _localizations;
 };
 
 /// Reads a strings table of any form: XML, binary or quoted text. Fails if it cannot be read, is not a dictionary or is

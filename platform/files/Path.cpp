@@ -1,9 +1,16 @@
 #include "platform/files/Path.h"
 
+#include "platform/files/FileDescriptor.h"
+
 #include <algorithm>
+#include <array>
+#include <climits>
+#include <optional>
 #include <string_view>
 
+#include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
@@ -33,6 +40,19 @@ std::string withinRoot(std::string_view path) {
     return kept;
 }
 
+/// The path of the place without links; nullopt if it does not exist or cannot be known.
+std::optional<std::string> placeOf(const char* path) {
+    // Only the place is opened, which also works for files that this process may not read, and never waits for a pipe.
+    const FileDescriptor place(::open(path, O_PATH | O_CLOEXEC));
+    std::array<char, PATH_MAX> text;
+    const ssize_t length =
+        place.isOpen() ? ::readlink(("/proc/self/fd/" + std::to_string(place.get())).c_str(), text.data(), text.size())
+                       : -1;
+    return length <= 0 || static_cast<std::size_t>(length) == text.size()
+               ? std::nullopt
+               : std::optional<std::string>(std::in_place, text.data(), static_cast<std::size_t>(length));
+}
+
 }  // namespace
 
 void setSystemRoot(std::string directory) {
@@ -60,6 +80,15 @@ HostPath hostPath(const DiskPath& path) {
         return HostPath(text);
     }
     return HostPath(text.substr(root.size()));
+}
+
+bool isBelowSystemRoot(const DiskPath& path) {
+    if (root == "/") {
+        return exists(path);
+    }
+    const auto place = path.text().find('\0') == std::string::npos ? placeOf(path.c_str()) : std::nullopt;
+    const auto top = place ? placeOf(root.c_str()) : std::nullopt;
+    return top && place->starts_with(*top) && (place->size() == top->size() || (*place)[top->size()] == '/');
 }
 
 bool exists(const DiskPath& path) noexcept {

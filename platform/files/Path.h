@@ -52,4 +52,8 @@ ADMINHOST_EXPORT void setSystemRoot(std::string directory);
 /// Returns true if a file system entry exists there (a link is followed). Returns false also if it cannot be known.
 [[nodiscard]] ADMINHOST_EXPORT bool exists(const DiskPath& path) noexcept;
 
+/// Returns true if the place that the path leads to, after all links, is below the system root, or the root itself.
+/// Returns false for a place that does not exist, or that cannot be known.
+[[nodiscard]] ADMINHOST_EXPORT bool isBelowSystemRoot(const DiskPath& path);
+
 }  // namespace adminhost

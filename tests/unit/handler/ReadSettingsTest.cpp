@@ -269,6 +269,32 @@ TEST_F(ReadSettings, VariantGetConfigHasNeitherCamerasNorWorkflows) {
     EXPECT_FALSE(config.contains("workflows"));
 }
 
+TEST_F(ReadSettings, EachVariantAnswersItsSections) {
+    writeSettings();
+    writeDatabase();
+    struct Row {
+        std::optional<std::string_view> variant;
+        bool settings;
+        bool cameras;
+        bool workflows;
+        bool properties;
+    };
+    for (const Row& row : {Row{std::nullopt, true, true, true, true}, Row{"getConfig", true, false, false, true},
+                           Row{"getCameras", false, true, false, false}, Row{"getWorkflows", false, false, true, false},
+                           Row{"getProperties", false, false, false, true}, Row{"other", false, false, false, false}}) {
+        const Dictionary config = read(row.variant);
+        const std::string_view name = row.variant.value_or("(none)");
+        for (const char* setting : {"member_uuid", "server_host", "nimbo_controller", "library_version"}) {
+            EXPECT_EQ(config.contains(setting), row.settings) << name << ' ' << setting;
+        }
+        EXPECT_EQ(config.contains("cameras"), row.cameras) << name;
+        EXPECT_EQ(config.contains("workflows"), row.workflows) << name;
+        EXPECT_EQ(config.contains("properties"), row.properties) << name;
+        EXPECT_TRUE(config.contains("default_shared_filesystem")) << name;
+    }
+    EXPECT_EQ(read("getWorkflows").get("workflows").array()->front().dictionary()->get("_id_"), Value("W-1"));
+}
+
 TEST_F(ReadSettings, VariantsAreExactAndCaseSensitive) {
     writeSettings();
     writeDatabase();

@@ -51,10 +51,11 @@ TEST_F(BundleTest, LiesBelowTheSystemRoot) {
     table("System/x.bundle/en/InfoPlist.strings", "english");
     setSystemRoot(_directory.string());
     const auto opened = Bundle::open(HostPath("/System/x.bundle"));
+    const auto found = opened ? localizedTable(*opened, "InfoPlist", {}) : std::nullopt;
     setSystemRoot("/");
     ASSERT_TRUE(opened);
     EXPECT_EQ(opened->path().text(), "/System/x.bundle");
-    EXPECT_TRUE(localizedTable(*opened, "InfoPlist", {}));
+    EXPECT_TRUE(found);
 }
 
 TEST_F(BundleTest, LocalizationsAreTheLanguageDirectoriesOfAllThreePlaces) {

@@ -6,6 +6,7 @@
 
 #include <gtest/gtest.h>
 #include <stdlib.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace {
@@ -89,6 +90,35 @@ TEST_F(Path, ExistsFollowsLinks) {
     std::filesystem::create_directory(place + "/missing");
     EXPECT_TRUE(exists(DiskPath(place + "/link")));
     std::filesystem::remove_all(place);
+}
+
+TEST_F(Path, PlaceBelowTheSystemRootIsKnownAfterAllLinks) {
+    namespace fs = std::filesystem;
+    std::string place = fs::temp_directory_path() / "path-XXXXXX";
+    ASSERT_NE(::mkdtemp(place.data()), nullptr);
+    fs::create_directories(place + "/root/inner");
+    fs::create_directories(place + "/rooted");
+    fs::create_directory_symlink(place + "/root", place + "/link");
+    fs::create_directory_symlink("../rooted", place + "/root/out");
+    fs::create_directory_symlink(place + "/root/inner", place + "/root/in");
+    ASSERT_EQ(::mkfifo((place + "/root/pipe").c_str(), 0000), 0);
+    const auto isBelow = [&](const std::string& path) { return isBelowSystemRoot(DiskPath(place + path)); };
+    for (const std::string& root : {place + "/root", place + "/link"}) {
+        setSystemRoot(root);
+        EXPECT_TRUE(isBelow("/root"));
+        EXPECT_TRUE(isBelow("/root/inner"));
+        EXPECT_TRUE(isBelow("/root/in"));
+        EXPECT_TRUE(isBelow("/root/pipe")) << "it is not opened";
+        EXPECT_FALSE(isBelow("/root/out"));
+        EXPECT_FALSE(isBelow("/root/missing"));
+        EXPECT_FALSE(isBelow("/rooted"));
+        EXPECT_FALSE(isBelow("/root/inner/../.."));
+        EXPECT_FALSE(isBelow("/root" + std::string("\0x", 2)));
+    }
+    setSystemRoot("/");
+    EXPECT_TRUE(isBelow("/rooted"));
+    EXPECT_FALSE(isBelow("/missing"));
+    fs::remove_all(place);
 }
 
 TEST_F(Path, PathsCompareAsTheirTexts) {
