@@ -22,6 +22,20 @@ std::vector<Command> camerasFloor(const SampleRoot& root) {
     return floor;
 }
 
+/// The listing, and an access list for each workflow. The reading of bundles is not part of the floor.
+std::vector<Command> workflowsFloor(const SampleRoot& root) {
+    const std::string enabled = " from workflows where (disabled != 't' OR disabled is NULL)";
+    std::vector<Command> floor{query(root, "select *" + enabled)};
+    std::istringstream ids(root.sql("select id" + enabled));
+    for (std::string id; std::getline(ids, id);) {
+        floor.push_back(query(
+            root,
+            "select record_uuid from access_control_entries where resource_type = 'Workflow' and resource_id = '" + id +
+                "'"));
+    }
+    return floor;
+}
+
 SampleSizes sizes(const benchmark::State& state) {
     SampleSizes sizes;
     sizes.cameras = static_cast<int>(state.range(0));
@@ -34,6 +48,16 @@ void getCameras(benchmark::State& state) {
     const Daemon daemon(root);
     const std::vector<Command> floor = camerasFloor(root);
     compare(state, "getCameras", "{}", daemon, [&] { runAll(floor); });
+}
+
+void getWorkflows(benchmark::State& state) {
+    SampleSizes sizes;
+    sizes.workflows = static_cast<int>(state.range(0));
+    sizes.accessEntries = 5;
+    const SampleRoot root(sizes);
+    const Daemon daemon(root);
+    const std::vector<Command> floor = workflowsFloor(root);
+    compare(state, "getWorkflows", R"({"optionalArguments": {"languages": ["de"]}})", daemon, [&] { runAll(floor); });
 }
 
 /// All of the settings with their revision: the setup script, cameras, properties, and the revision's one statement.
@@ -53,6 +77,7 @@ void readSettings(benchmark::State& state) {
 }
 
 BENCHMARK(getCameras)->Arg(10)->Arg(100)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond)->MinTime(2);
+BENCHMARK(getWorkflows)->Arg(10)->Arg(100)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond)->MinTime(2);
 BENCHMARK(readSettings)->Arg(10)->Arg(100)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond)->MinTime(2);
 
 }  // namespace

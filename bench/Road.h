@@ -111,6 +111,8 @@ class Daemon {
         ::waitpid(_process, nullptr, 0);
     }
 
+    [[nodiscard]] pid_t process() const noexcept { return _process; }
+
     /// Sends one request on a connection of its own and returns the whole answer.
     [[nodiscard]] std::string request(const std::string& command, const std::string& body) const {
         const int connection = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
