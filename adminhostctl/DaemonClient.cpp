@@ -206,7 +206,10 @@ CommandRef DaemonClient::stateCommand(std::string_view state) {
                                    : "several plug-ins have a state that can be written; use their commands");
 }
 
-CommandAnswer DaemonClient::ask(const CommandRef& command, const Dictionary& request, const std::string& revision) {
+CommandAnswer DaemonClient::ask(const CommandRef& command, Dictionary request, const std::string& revision) {
+    if (_languages) {
+        addLanguages(request, command.description, *_languages);
+    }
     const std::string path =
         "/v1/" + Connection::escaped(command.plugin) + '/' + Connection::escaped(command.description.name());
     const PostHeaders headers{textOf(randomUuid()), revision};
@@ -298,6 +301,28 @@ RequestReport DaemonClient::settledReport(const std::string& requestId) {
             return found;
         }
         std::this_thread::sleep_for(pause);
+    }
+}
+
+void addLanguages(Dictionary& request, const Description& command, const std::vector<std::string>& languages) {
+    for (const DescribedKey& key : command.keys()) {
+        if (key.filledWith != "languages" || key.path.find('[') != std::string::npos) {
+            continue;
+        }
+        Dictionary* above = &request;
+        std::string_view name = key.path;
+        for (std::size_t dot = name.find('.'); above != nullptr && dot != std::string_view::npos;
+             dot = name.find('.')) {
+            if (!above->contains(name.substr(0, dot))) {
+                above->set(name.substr(0, dot), Dictionary());
+            }
+            // A request that has something else there is the service's to reject.
+            above = above->find(name.substr(0, dot))->dictionary();
+            name.remove_prefix(dot + 1);
+        }
+        if (above != nullptr && !above->contains(name)) {
+            above->set(name, Array(languages.begin(), languages.end()));
+        }
     }
 }
 

@@ -85,7 +85,9 @@ struct CommandAnswer {
 
 class DaemonClient {
   public:
-    explicit DaemonClient(std::string socketPath) : _connection(std::move(socketPath)) {}
+    /// With languages, they are sent with every request of a command that describes where (DescribedKey::filledWith).
+    explicit DaemonClient(std::string socketPath, std::optional<std::vector<std::string>> languages = std::nullopt)
+        : _connection(std::move(socketPath)), _languages(std::move(languages)) {}
 
     /// The daemon's overview: the running request, how many wait, and the plug-ins.
     [[nodiscard]] Value overview();
@@ -100,8 +102,7 @@ class DaemonClient {
     /// Sends the request once and returns the answer. A request with a revision fails unless the revision is still
     /// current. Throws Failure with the daemon's message, its findings and, after a failure inside the service, the log
     /// lines of the request. Throws LostAnswer if the command may change something and its answer is missing.
-    [[nodiscard]] CommandAnswer ask(const CommandRef& command, const Dictionary& request,
-                                    const std::string& revision = {});
+    [[nodiscard]] CommandAnswer ask(const CommandRef& command, Dictionary request, const std::string& revision = {});
     /// Returns the daemon's current record of a request. A daemon that cannot be reached is a state of the report, not
     /// a Failure.
     [[nodiscard]] RequestReport report(const std::string& requestId);
@@ -119,8 +120,13 @@ class DaemonClient {
     [[noreturn]] void fail(const DaemonReply& answer);
 
     Connection _connection;
+    std::optional<std::vector<std::string>> _languages;
     std::optional<std::vector<PluginInfo>> _plugins;
 };
+
+/// Adds the languages to the request, under the key that the description fills with languages, unless the request has
+/// that key.
+void addLanguages(Dictionary& request, const Description& command, const std::vector<std::string>& languages);
 
 /// Returns the failure in an answer as one sentence; empty if there is none. A failure is a key that the description
 /// lists under its errors, unless its value is null or the number 0.

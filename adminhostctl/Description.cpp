@@ -25,6 +25,7 @@ void Description::Keys::add(const Value& described) {
     description.path = key->text("path");
     description.type = key->text("type");
     description.enteredAs = key->text("enteredAs");
+    description.filledWith = key->text("filledWith");
     description.unit = key->text("unit");
     description.column = key->text("column");
     description.help = key->text("help");
@@ -42,6 +43,8 @@ void Description::Keys::add(const Value& described) {
     description.identity = key->text("identity");
     description.label = key->text("label");
     description.byIdentity = key->get("byIdentity").boolean().value_or(false);
+    description.localized = key->get("localized").boolean().value_or(false);
+    description.otherNames = textsAt(*key, "otherNames");
     description.addedBy = key->text("addedBy");
     description.removedBy = key->text("removedBy");
     description.unlisted = key->text("unlisted");

@@ -17,6 +17,7 @@ struct DescribedKey {
     std::string path;  ///< "list[].name"
     std::string type;  ///< "text", "integer", "boolean", "list", "dictionary", "scalar", ...
     std::string enteredAs;
+    std::string filledWith;  ///< of a list: "languages" if the caller's are sent where a request has none
     std::string unit;
     std::string column;  ///< heading in tables; empty: not shown in one
     std::string help;
@@ -27,18 +28,20 @@ struct DescribedKey {
     std::vector<std::string> title;  ///< keys of the element; the first with a text is shown for it
     std::string kind;                ///< key of the element that holds "user", "group", ...
     // Parts of a state that can be written; empty if they do not apply.
-    std::string section;               ///< table of a file: of plain values, of a list's elements
-    std::string file;                  ///< of a setting: the settings file that holds it
-    std::vector<std::string> locates;  ///< of a setting: files that move when it changes
-    std::vector<std::string> restart;  ///< of a setting: commands to run for it to take effect
-    std::string lookedUp;              ///< of a setting: which values a write replaces
-    std::string shownBy;               ///< of a secret setting: the key that shows whether it is set
-    std::string identity;              ///< of an element: the key that a write names it by
-    std::string label;                 ///< of an element: the key that people name it by
-    bool byIdentity = false;           ///< of an element: people may name it by identity too
-    std::string addedBy;               ///< of an element: the flag that adds one
-    std::string removedBy;             ///< of an element: the flag that removes one
-    std::string unlisted;              ///< of an element: the switch that removes unlisted elements
+    std::string section;                  ///< table of a file: of plain values, of a list's elements
+    std::string file;                     ///< of a setting: the settings file that holds it
+    std::vector<std::string> locates;     ///< of a setting: files that move when it changes
+    std::vector<std::string> restart;     ///< of a setting: commands to run for it to take effect
+    std::string lookedUp;                 ///< of a setting: which values a write replaces
+    std::string shownBy;                  ///< of a secret setting: the key that shows whether it is set
+    std::string identity;                 ///< of an element: the key that a write names it by
+    std::string label;                    ///< of an element: the key that people name it by
+    bool byIdentity = false;              ///< of an element: people may name it by identity too
+    bool localized = false;               ///< of an element: the label depends on languages, so files use the identity
+    std::vector<std::string> otherNames;  ///< of an element: more keys that people name it by
+    std::string addedBy;                  ///< of an element: the flag that adds one
+    std::string removedBy;                ///< of an element: the flag that removes one
+    std::string unlisted;                 ///< of an element: the switch that removes unlisted elements
     std::vector<std::pair<std::string, std::string>> kinds;  ///< of an element: its name in a file for each kind
     std::string inFile;                                      ///< of an element's key: its name in a file
     std::string secretIf;                                    ///< of an element's key: secret while this key is true

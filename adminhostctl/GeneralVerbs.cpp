@@ -59,6 +59,7 @@ std::string keyList(const std::vector<DescribedKey>& keys, std::size_t width) {
             help += (i == 0 ? " One of " : ", ") + key.allowed[i] + (i + 1 == key.allowed.size() ? "." : "");
         }
         help += key.required ? " Required." : "";
+        help += key.filledWith == "languages" ? " Without it, adminhostctl sends yours." : "";
         help += key.secret ? " Secret: " + key.path + "@FILE or " + key.path + "@-." : "";
         text += "  " + shown(key.path) + " (" + shown(typeText(key)) + ")\n";
         for (const std::string& line : wrapped(shown(help), width - indent)) {

@@ -1,6 +1,7 @@
 // adminhostctl: the service's command line, through its daemon. Only this file names all of its rooms: the generic
 // client, the desired state and the verbs of this one service.
 
+#include "adminhostctl/CallerLanguages.h"
 #include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/GeneralVerbs.h"
@@ -91,6 +92,11 @@ int runMain(int count, char** words) {
     app.add_option("--file", options.file, "Read the request from a file, JSON or property list; - is standard input")
         ->type_name("FILE");
     app.add_flag("--names", options.names, "Print only names, one a line");
+    std::optional<std::string> languages;
+    app.add_option("--languages", languages,
+                   "Languages of names and descriptions, the preferred one first: de,fr (by default those of LANGUAGE, "
+                   "LC_ALL, LC_MESSAGES and LANG)")
+        ->type_name("LIST");
     bool clear = false;
     app.add_flag("--clear", clear, "Remove a stored secret: without this an empty secret is rejected");
     for (const auto& table : {adminhost::ctl::generalOptions(), adminhost::ctl::lumioOptions(),
@@ -119,7 +125,8 @@ int runMain(int count, char** words) {
     options.format = format == "json" ? Format::json : format == "plist" ? Format::plist : Format::text;
     options.width = outputWidth();
     try {
-        adminhost::ctl::DaemonClient service(socket);
+        adminhost::ctl::DaemonClient service(
+            socket, languages ? adminhost::ctl::languagesOfText(*languages) : adminhost::ctl::callerLanguages());
         const adminhost::ctl::Sources sources{&adminhost::ctl::readSource,       &adminhost::ctl::askSecret,
                                               adminhost::ctl::inputIsTerminal(), clear,
                                               &adminhost::ctl::askKnownSecret,   &adminhost::ctl::confirm};

@@ -42,7 +42,4 @@ struct Options {
 /// description.
 void readConfiguration(const std::string& file, Options& options);
 
-/// The languages that the environment names, the preferred one first.
-[[nodiscard]] Array languagesOfEnvironment();
-
 }  // namespace adminhost

@@ -2,6 +2,7 @@
 
 #include "adminhostd/ToolConfiguration.h"
 #include "platform/framework/BuildNote.h"
+#include "platform/text/EnvironmentLanguages.h"
 
 #include <cstdint>
 #include <vector>
@@ -29,7 +30,7 @@ protocol::Configure workerConfiguration(const Options& options, const PluginSele
     for (const DiskPath& file : plugins.files) {
         configuration.plugins.push_back(file.text());
     }
-    configuration.languages = textsOf(options.languages ? *options.languages : languagesOfEnvironment());
+    configuration.languages = options.languages ? textsOf(*options.languages) : languagesOfEnvironment();
     configuration.accountUuids = options.accountUuids;
     configuration.serviceManager = options.serviceManager;
     configuration.directory = options.directory.nodes;

@@ -51,10 +51,10 @@ COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline
                  "errors", "keys", "answer", "include", "example"}
 # Words for programs that compare and write a desired state (README.md).
 STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_file", "kind", "kinds", "secret_if", "file",
-               "locates", "restart", "looked_up", "shown_by"}
+               "localized", "other_names", "locates", "restart", "looked_up", "shown_by"}
 # Unit and sensible range of a setting's number; described where the setting is read.
 RANGE_WORDS = {"unit", "minimum", "maximum"}
-KEY_WORDS = {"type", "entered_as", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"} | STATE_WORDS | RANGE_WORDS
+KEY_WORDS = {"type", "entered_as", "filled_with", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"} | STATE_WORDS | RANGE_WORDS
 ANSWER_WORDS = {"type", "secret", "column", "help", "title", "kind"} | RANGE_WORDS
 ENTRY_WORDS = {"added_by", "removed_by", "first", "leading_zeros", "otherwise", "added_kinds", "columns", "together"}
 
@@ -94,6 +94,8 @@ def check_keys(keys, words, what, names):
             need(word not in key or f"{path}.{key[word]}" in keys, f"{where}: {word} is not described")
         need(all(f"{path}.{below}" in keys for below in key.get("title", [])), f"{where}: title is not described")
         need(set(key.get("restart", [])) <= names, f"{where}: restart names an unknown command")
+        need(key.get("filled_with", "languages") == "languages", f"{where}: unknown word in filled_with")
+        need("filled_with" not in key or key["type"] == "list", f"{where}: filled_with needs a list")
         need("secret_if" not in key or f"{parent(path)}.{key['secret_if']}" in keys, f"{where}: secret_if is not described")
         need(key.get("looked_up", "local_name") == "local_name", f"{where}: unknown word in looked_up")
         above = parent(path)
@@ -192,6 +194,10 @@ def load(directory):
                         key.setdefault(word, command["all_answers"][path][word])
             check_keys(keys, KEY_WORDS, "key", set(commands))
             command["all_keys"] = in_tree_order(keys)
+            for path, key in keys.items():  # texts of an element that people name it by are those that reading shows
+                shown = [key[word] for word in ("label",) if word in key] + key.get("other_names", [])
+                need(all(f"{path}.{name}" in keys | command["all_answers"] for name in shown),
+                     f"key {path}: label or other_names is not described")
             check_keys(command["all_answers"], ANSWER_WORDS, "answer", set(commands))
             for error in command.get("errors", []):
                 need(set(error) in ({"key", "meaning"}, {"code", "meaning"}), "an error has key or code, and meaning")
@@ -226,8 +232,9 @@ def load(directory):
 
 def key_description(path, key):
     described = {"path": path, "type": key["type"], "help": key["help"].strip()}
-    if key.get("entered_as"):
-        described["enteredAs"] = key["entered_as"]
+    for word in ("entered_as", "filled_with"):
+        if key.get(word):
+            described[camel(word)] = key[word]
     for word in ("secret", "required"):
         if key.get(word):
             described[word] = True

@@ -54,23 +54,28 @@ std::string listText(const std::vector<std::string>& texts) {
     return '[' + list + ']';
 }
 
-/// The name of the element in a file: its label, or its identity if the label is not unique; nullopt if neither can be
-/// used.
+/// The name of the element in a file: its label, or its identity if the label is not unique or is localized; nullopt if
+/// neither can be used.
 std::optional<std::string> nameOf(const State& state, const ListForm& list, const Element& element) {
     try {
-        if (!element.label.empty() && findElement(state, list, element.label) == &element) {
+        if (!list.localized && !element.label.empty() && findElement(state, list, element.label) == &element) {
             return element.label;
         }
     } catch (const Failure&) {
         // several have the label
     }
-    return list.byIdentity ? std::optional(element.identity) : std::nullopt;
+    // Two rows may have one identity; a file can name only the first.
+    return list.byIdentity && findElement(state, list, element.identity) == &element ? std::optional(element.identity)
+                                                                                     : std::nullopt;
 }
 
 void appendElement(std::string& text, const ListForm& list, const std::string& name, const Element& element) {
     text += "\n[" + tomlKey(list.section) + '.' + tomlKey(name) + "]\n";
-    if (name != element.label) {
+    if (!element.label.empty() && name != element.label) {
         text += comment("name: " + tomlText(element.label));
+    }
+    for (std::size_t i = 0; element.label.empty() && i < element.otherNames.size(); ++i) {
+        text += comment(list.otherNames[i] + ": " + tomlText(element.otherNames[i]));
     }
     for (const FieldForm& field : list.fields) {
         const Value& value = element.fields.get(field.key);
@@ -258,7 +263,9 @@ void parseSection(Wanted& wanted, const ListForm& list, const Node& table, const
         wanted.elements[list.section].push_back(parseElement(list, name, node));
         const Element* element = findElement(state, list, name);
         if (element == nullptr && list.addedBy.empty()) {
-            node.fail("not found in the service; \"adminhostctl export\" lists the names");
+            node.fail(list.localized ? "not found in the service; a file names " + list.section +
+                                           " by their identities, which \"adminhostctl export\" lists"
+                                     : "not found in the service; \"adminhostctl export\" lists the names");
         }
         if (element != nullptr && !present.insert(element).second) {
             node.fail("is in the file twice, by its name and by its identity");

@@ -9,7 +9,7 @@
 //     [SETTINGS]
 //     KEY = 8170
 //
-//     [SECTION."Main hall"]    # label, or identity if people may use it
+//     [SECTION."Main hall"]    # label, or identity if people may use it; identity only where labels are localized
 //     FIELD = true
 //     PEOPLE = ["anna"]
 //

@@ -112,7 +112,7 @@ class Section {
         : _plan(plan), _list(list), _state(state), _path(form.root() + '.' + list.key + '.') {}
 
     void change(const WantedElement& wanted, const std::set<std::string>& removeUnlisted) {
-        _entry = _list.section + '.' + tomlKey(wanted.name);
+        _entry = _list.section + '.' + tomlKey(wanted.shownAs.empty() ? wanted.name : wanted.shownAs);
         _element = findElement(_state, _list, wanted.name);
         if (wanted.remove) {
             remove();

@@ -25,6 +25,7 @@ struct WantedElement {
     /// Write a text that is a secret already. It cannot be compared, so a file, which may be applied many times, does
     /// not set this.
     bool writeSecret = false;
+    std::string shownAs{};  ///< what changes call it; empty: its name
 };
 
 struct Wanted {

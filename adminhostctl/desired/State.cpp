@@ -46,7 +46,37 @@ Element elementOf(const ListForm& list, const Dictionary& listed) {
     for (const PeopleForm& people : list.people) {
         element.people[people.key] = peopleOf(people, listed);
     }
+    for (const std::string& key : list.otherNames) {
+        element.otherNames.push_back(textAt(listed, key));
+    }
     return element;
+}
+
+/// The element with the identity, if people may use it, or else the only one that has the name.
+template <typename HasName>
+const Element* find(const State& state, const ListForm& list, const std::string& name, const HasName& hasName) {
+    const Element* found = nullptr;
+    std::string identities;
+    int count = 0;
+    for (const Element& element : elementsOf(state, list)) {
+        if (list.byIdentity && sameInAnyCase(element.identity, name)) {
+            return &element;
+        }
+        if (hasName(element)) {
+            found = &element;
+            identities += "\n  " + element.identity;
+            for (const std::string& other : element.otherNames) {
+                identities += other.empty() ? "" : "  " + other;
+            }
+            ++count;
+        }
+    }
+    if (count > 1) {
+        throw usageError(list.section + ": several have the name " + tomlText(name) +
+                         (list.byIdentity ? "; use one of these instead:" : "; remove all but one of these:") +
+                         identities);
+    }
+    return found;
 }
 
 }  // namespace
@@ -87,25 +117,23 @@ const std::vector<Element>& elementsOf(const State& state, const ListForm& list)
 }
 
 const Element* findElement(const State& state, const ListForm& list, const std::string& name) {
-    const Element* found = nullptr;
-    std::string identities;
-    int count = 0;
-    for (const Element& element : elementsOf(state, list)) {
-        if (list.byIdentity && sameInAnyCase(element.identity, name)) {
-            return &element;
-        }
-        if (element.label == name) {
-            found = &element;
-            identities += "\n  " + element.identity;
-            ++count;
-        }
+    return find(state, list, name, [&](const Element& element) { return !list.localized && element.label == name; });
+}
+
+std::string nameForPeople(const Element& element) {
+    std::string name = element.label;
+    for (const std::string& other : element.otherNames) {
+        name = name.empty() ? other : name;
     }
-    if (count > 1) {
-        throw usageError(list.section + ": several have the name " + tomlText(name) +
-                         (list.byIdentity ? "; use one of these instead:" : "; remove all but one of these:") +
-                         identities);
-    }
-    return found;
+    return name;
+}
+
+const Element* findByAnyName(const State& state, const ListForm& list, const std::string& name) {
+    return find(state, list, name, [&](const Element& element) {
+        return !name.empty() &&
+               (element.label == name ||
+                std::find(element.otherNames.begin(), element.otherNames.end(), name) != element.otherNames.end());
+    });
 }
 
 }  // namespace adminhost::ctl

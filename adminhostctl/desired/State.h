@@ -25,6 +25,7 @@ struct Element {
     std::string label;
     Dictionary fields;                                  ///< texts and booleans by their key; a secret text is absent
     std::map<std::string, std::vector<Person>> people;  ///< by the key of the list
+    std::vector<std::string> otherNames{};              ///< in the order of their keys; empty for a missing one
 };
 
 struct State {
@@ -44,8 +45,15 @@ struct State {
 /// The elements of a section. Throws Failure(failed) if the service did not list the section.
 [[nodiscard]] const std::vector<Element>& elementsOf(const State& state, const ListForm& list);
 
-/// The element with this identity, in upper or lower case (if people may use identities), or else with this label; null
-/// if there is none. Throws Failure if several have the label (usage) or the section is not listed (failed).
+/// The element that a file means by the name: the one with this identity, in upper or lower case (if people may use
+/// identities), or else with this label (unless labels are localized). Null if there is none. Throws Failure if several
+/// have the label (usage) or the section is not listed (failed).
 [[nodiscard]] const Element* findElement(const State& state, const ListForm& list, const std::string& name);
+
+/// The label of the element, else the first of its other names that is not empty; empty if it has none.
+[[nodiscard]] std::string nameForPeople(const Element& element);
+
+/// The element that a person means by the name: as above, but also by a localized label and by its other names.
+[[nodiscard]] const Element* findByAnyName(const State& state, const ListForm& list, const std::string& name);
 
 }  // namespace adminhost::ctl

@@ -59,6 +59,8 @@ void StateForm::addList(const Description& write, const DescribedKey& element) {
     list.identity = element.identity;
     list.label = element.label;
     list.byIdentity = element.byIdentity;
+    list.localized = element.localized;
+    list.otherNames = element.otherNames;
     list.addedBy = element.addedBy;
     list.removedBy = element.removedBy;
     list.unlisted = element.unlisted;
@@ -94,13 +96,18 @@ const ListForm& StateForm::list(std::string_view section) const {
 
 std::vector<std::string> StateForm::switches() const {
     std::vector<std::string> all;
+    const auto add = [&](const std::string& name) {
+        // Several lists may share a switch.
+        if (!name.empty() && std::find(all.begin(), all.end(), name) == all.end()) {
+            all.push_back(name);
+        }
+    };
     for (const ListForm& list : _lists) {
-        all.push_back(list.unlisted);
+        add(list.unlisted);
         for (const PeopleForm& people : list.people) {
-            all.push_back(people.unlisted);
+            add(people.unlisted);
         }
     }
-    std::erase(all, "");
     return all;
 }
 

@@ -39,7 +39,9 @@ struct ListForm {
     std::string identity;
     std::string label;
     bool byIdentity = false;
-    std::string addedBy;  ///< empty: only the service adds elements
+    bool localized = false;               ///< the label depends on languages: files name elements by identity only
+    std::vector<std::string> otherNames;  ///< further keys that people name an element by
+    std::string addedBy;                  ///< empty: only the service adds elements
     std::string removedBy;
     std::string unlisted;
     std::vector<FieldForm> fields;

@@ -1,6 +1,6 @@
 #pragma once
 
-// The verbs of this one service: its cameras and its workflow properties.
+// The verbs of this one service: its cameras, workflows and workflow properties.
 
 #include "adminhostctl/Verb.h"
 

@@ -31,10 +31,18 @@ class Moving : public ControlledService {
         EXPECT_EQ(ctl({"export"}).output, _text);
     }
 
+    /// Lets the new shared file system have the workflow bundles, whose names are comments in the file.
+    void linkWorkflows() const {
+        std::filesystem::create_directories(root.disk("/Library/Moved"));
+        std::filesystem::create_directory_symlink("../SorvaneProducer/Shared/Workflows",
+                                                  root.disk("/Library/Moved/Workflows"));
+    }
+
     std::string _text = ctl({"export"}).output;
 };
 
 TEST_F(Moving, AnotherSharedFileSystemGetsEverySettingOfTheFileInOneApply) {
+    linkWorkflows();
     replaceSetting("shared_filesystem", "\"/Library/Moved\"");
     settlesAtOnce();
     const std::string cluster = read(root.path() + "/Library/Moved/Server/cluster_preferences.plist");
@@ -50,6 +58,7 @@ TEST_F(Moving, AnotherMemberGetsEverySettingOfTheMembersFileInOneApply) {
 }
 
 TEST_F(Moving, ListsAreChangedTogetherWithTheMove) {
+    linkWorkflows();
     replaceSetting("shared_filesystem", "\"/Library/Moved\"");
     replaceSetting("server_port", "8180");
     const std::size_t at = _text.find("value = \"de\"");

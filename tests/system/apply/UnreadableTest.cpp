@@ -33,6 +33,11 @@ TEST_F(Unreadable, BrokenDatabaseIsNotExported) {
     exportFails("the service does not list its properties: its database is missing or cannot be read");
 }
 
+TEST_F(Unreadable, MissingTableOfWorkflowsIsNotExported) {
+    root.sql("alter table workflows rename to gone");
+    exportFails("the service does not list its workflows");
+}
+
 TEST_F(Unreadable, MissingTableOfCamerasIsNotExported) {
     root.sql("alter table cameras rename to gone");
     exportFails("the service does not list its cameras");
@@ -46,9 +51,22 @@ TEST_F(Unreadable, AccessListsThatCannotBeReadAreNotExportedAsEmpty) {
     EXPECT_EQ(ctl({"settings", "set", "server_port", "8180"}).status, 0) << "which has nothing to do with them";
 }
 
+TEST_F(Unreadable, AccessListsThatCannotBeReadAreNotListedAsEmpty) {
+    root.sql("alter table access_control_entries rename to gone");
+    for (const std::vector<std::string>& words : {std::vector<std::string>{"camera", "list"},
+                                                  {"camera", "show", "Main hall"},
+                                                  {"workflow", "list"},
+                                                  {"workflow", "show", "Workflows/Publish.workflow"}}) {
+        const ProgramResult list = ctl(words);
+        EXPECT_EQ(list.status, 1) << words.front();
+        EXPECT_THAT(list.output, HasSubstr("parts of the list could not be read:\n  an access list cannot be read ("));
+        EXPECT_THAT(list.output, testing::AnyOf(HasSubstr("Main hall"), HasSubstr("Publish"))) << "with the rest";
+    }
+}
+
 TEST_F(Unreadable, ListsOfABrokenDatabaseFailInTheSameWords) {
     std::ofstream(root.databasePath()) << std::string(4096, 'x');
-    for (const std::string& what : {std::string("camera"), std::string("property")}) {
+    for (const std::string what : {"camera", "workflow", "property"}) {
         const ProgramResult list = ctl({what, "list"});
         EXPECT_EQ(list.status, 1) << what;
         EXPECT_THAT(list.output, HasSubstr(": its database is missing or cannot be read (readStatus is 26)\n"));

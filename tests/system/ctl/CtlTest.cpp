@@ -200,12 +200,36 @@ TEST_F(Ctl, AnUnknownCommandIsUsageAndTheKnownOnesAreListed) {
 }
 
 TEST_F(Ctl, CommandsAndHelpComeFromTheDaemon) {
-    EXPECT_EQ(run({"commands", "--names"}).out, "echoTyped\nmeasure\nfail\nbreakDown\nnothing\ngetCameras\n");
+    EXPECT_EQ(run({"commands", "--names"}).out,
+              "echoTyped\nmeasure\nfail\nbreakDown\nnothing\ntranslate\ngetCameras\n");
     EXPECT_THAT(run({"commands"}).out, HasSubstr("echoTyped   described  Serves echoTyped.\n"));
     EXPECT_THAT(run({"help", "echoTyped"}).out,
                 AllOf(HasSubstr("echoTyped: Serves echoTyped."), HasSubstr("\n  count (whole number)\n      A key.\n"),
                       HasSubstr("Secret: password@FILE or password@-.")));
     EXPECT_EQ(run({"help", "fail", "--names"}).out, "status=\n");
+}
+
+TEST_F(Ctl, LanguagesOfTheEnvironmentOrOfTheOptionAreSentWhereTheDescriptionHasThem) {
+    const auto wanted = [](const std::vector<std::string>& environment, std::vector<std::string> words) {
+        std::vector<std::string> all = {"-u", "LANGUAGE", "-u", "LC_ALL", "-u", "LC_MESSAGES", "-u", "LANG"};
+        all.insert(all.end(), environment.begin(), environment.end());
+        words.insert(words.begin(), {program, "--format", "json"});
+        all.insert(all.end(), words.begin(), words.end());
+        const Result result = runIn("/usr/bin/env", all, daemon->socket());
+        EXPECT_EQ(result.status, 0) << result.err;
+        return result.value();
+    };
+    const auto languages = [](Array list) {
+        return Value(Dictionary{{"options", Dictionary{{"wanted", std::move(list)}}}});
+    };
+    EXPECT_EQ(wanted({"LANGUAGE=fr:de", "LANG=en_GB.UTF-8"}, {"translate"}), languages({"fr", "de"}));
+    EXPECT_EQ(wanted({"LANG=ja_JP.UTF-8"}, {"translate"}), languages({"ja_JP"}));
+    EXPECT_EQ(wanted({"LANG=ja_JP.UTF-8"}, {"translate", "--languages", "it,en"}), languages({"it", "en"}));
+    EXPECT_EQ(wanted({"LANG=ja_JP.UTF-8"}, {"translate", "--languages", ""}), languages({}));
+    EXPECT_EQ(wanted({"LANG=ja_JP.UTF-8"}, {"translate", R"(options.wanted:=["de"])"}), languages({"de"}));
+    EXPECT_EQ(wanted({"LC_ALL=C", "LANGUAGE=fr"}, {"translate"}), languages({}));
+    EXPECT_EQ(wanted({}, {"translate"}), Value(Dictionary()));
+    EXPECT_EQ(wanted({"LANG=ja_JP.UTF-8"}, {"echoTyped"}), Value(Dictionary()));
 }
 
 TEST_F(Ctl, DaemonListsPlugInsAndWaitingRequests) {
@@ -236,8 +260,8 @@ TEST(CtlReach, VersionAndOptionsNeedNoDaemon) {
     const Result options = runIn(program, {"--help"}, "/nowhere/socket");
     EXPECT_EQ(options.status, 0);
     for (const char* option :
-         {"--socket", "--format", "--file", "--names", "--group", "--password-file", "--protect", "--no-protect",
-          "--clear", "--follow", "--lines", "--validate", "--save", "--yes", "--version"}) {
+         {"--socket", "--format", "--file", "--names", "--group", "--languages", "--password-file", "--protect",
+          "--no-protect", "--clear", "--follow", "--lines", "--validate", "--save", "--yes", "--version"}) {
         EXPECT_THAT(options.out, HasSubstr(option));
     }
 }

@@ -38,6 +38,14 @@ Value camera(const char* uuid, const char* name, bool restricted = false, Array 
                       {"access_control_enabled", restricted},
                       {"allowedUsersAndGroups", std::move(allowed)}};
 }
+Value workflow(const char* uuid, const char* name, const char* path, Array allowed = {}) {
+    Dictionary listed{{"_id_", uuid},
+                      {"bundle_path", path},
+                      {"access_control_enabled", true},
+                      {"allowedUsersAndGroups", std::move(allowed)}};
+    listed.set("name", name == nullptr ? Value() : Value(name));
+    return listed;
+}
 Value person(const char* kind, const char* name, const char* uuid) {
     return Dictionary{{"type", kind}, {"shortName", name}, {"_id_", uuid}};
 }
@@ -56,7 +64,9 @@ Dictionary sample() {
             {"cameras", Array{camera("AAAA-1", "Hall", true,
                                      {person("user", "ben", "U-2"), person("user", "anna", "U-1"),
                                       person("group", "staff", "G-1"), person("user", "", "U-3")}),
-                              camera("AAAA-2", "Lab")}}};
+                              camera("AAAA-2", "Lab")}},
+            {"workflows", Array{workflow("BBBB-2", "Publier", "W/Publish.workflow", {person("group", "staff", "G-1")}),
+                                workflow("BBBB-1", "", "W/Gone.workflow")}}};
 }
 Dictionary sampleWith(const char* list, std::vector<Value> more) {
     Dictionary root = sample();
@@ -109,6 +119,18 @@ TEST(Export, HoldsWritableSettingsPropertiesAndAccessListsInAFixedForm) {
                                              "# value = (secret)\n"
                                              "protect = true\n"
                                              "\n"
+                                             "[workflows.BBBB-1]\n"
+                                             "# bundle_path: \"W/Gone.workflow\"\n"
+                                             "access_control = true\n"
+                                             "users = []\n"
+                                             "groups = []\n"
+                                             "\n"
+                                             "[workflows.BBBB-2]\n"
+                                             "# name: \"Publier\"\n"
+                                             "access_control = true\n"
+                                             "users = []\n"
+                                             "groups = [\"staff\"]\n"
+                                             "\n"
                                              "[cameras.Hall]\n"
                                              "access_control = true\n"
                                              "users = [\"anna\", \"ben\"]\n"
@@ -126,7 +148,7 @@ TEST(Export, ReadAgainIsNoChange) {
 }
 
 TEST(Export, EveryWritableSettingIsManagedHereAndNothingElse) {
-    Dictionary root{{"cameras", Array{}}, {"properties", Array{}}};
+    Dictionary root{{"cameras", Array{}}, {"workflows", Array{}}, {"properties", Array{}}};
     std::vector<std::string> writable;
     for (const DescribedKey& key : writeSettings().keys()) {
         constexpr std::string_view prefix = "configuration.";
@@ -169,7 +191,7 @@ TEST(Export, WhatHasNoNameOfItsOwnIsAComment) {
 }
 
 TEST(Export, FailsWhenTheServiceDoesNotListASection) {
-    for (const char* list : {"properties", "cameras"}) {
+    for (const char* list : {"properties", "workflows", "cameras"}) {
         Dictionary root = sample();
         root.remove(list);
         try {
@@ -180,6 +202,34 @@ TEST(Export, FailsWhenTheServiceDoesNotListASection) {
             EXPECT_THAT(failure.what(), HasSubstr(std::string("does not list its ") + list));
         }
     }
+}
+
+TEST(Export, LocalizedNamesAreCommentsAndTheIdentityNamesTheElement) {
+    Dictionary french = sample();
+    Dictionary english = sample();
+    english.find("workflows")->array()->front() =
+        workflow("BBBB-2", "Publish", "W/Publish.workflow", {person("group", "staff", "G-1")});
+    EXPECT_NE(exported(french), exported(english)) << "the comment";
+    EXPECT_THAT(planOf(parse(exported(french), english), english).changes, IsEmpty());
+    EXPECT_THAT(planOf(parse(exported(english), french), french).changes, IsEmpty());
+}
+
+TEST(Export, SecondElementOfAnIdentityIsAComment) {
+    const Dictionary root = sampleWith("workflows", {workflow("BBBB-1", "Other", "W/Other.workflow")});
+    const std::string text = exported(root);
+    EXPECT_THAT(text, HasSubstr("# workflows.Other, BBBB-1: not managed here"));
+    EXPECT_THAT(planOf(parse(text, root), root).changes, IsEmpty());
+}
+
+TEST(Desired, FileNamesALocalizedElementByItsIdentityOnly) {
+    EXPECT_THAT(parse("[workflows.bbbb-2]\nusers = [\"anna\"]\n").elements.at("workflows").front().lists.at("users"),
+                ElementsAre("anna"));
+    for (const char* name : {"Publier", "W/Publish.workflow", "BBBB-3"}) {
+        EXPECT_THAT(refused(std::string("[workflows.\"") + name + "\"]\n"),
+                    HasSubstr("not found in the service; a file names workflows by their identities"))
+            << name;
+    }
+    EXPECT_THAT(refused("[workflows.bbbb-2]\n[workflows.BBBB-2]\n"), HasSubstr("is in the file twice"));
 }
 
 TEST(Desired, FileIsReadWithAllItsTables) {
@@ -253,7 +303,8 @@ TEST(Desired, EveryRefusalNamesThePlace) {
                       Not(HasSubstr("planted"))));
     EXPECT_THAT(refused("[settings]\nweb_app_url = \"x\"\n"), HasSubstr("is not a setting that can be written"));
     EXPECT_THAT(refused("[settings]\nnimbo_controller_resolve_name = true\n"), HasSubstr("is not a setting"));
-    EXPECT_THAT(refused("[setting]\n"), HasSubstr("setting is unknown; the tables are settings, properties, cameras"));
+    EXPECT_THAT(refused("[setting]\n"),
+                HasSubstr("setting is unknown; the tables are settings, properties, workflows, cameras"));
     EXPECT_THAT(refused("properties = []\n"), HasSubstr("properties must be a table: [properties]"));
     EXPECT_THAT(refused("[properties]\nx = 1\n"), HasSubstr("properties.x must be a table"));
     EXPECT_THAT(refused("[properties.x]\nname = \"y\"\n"), HasSubstr("properties.x.name is unknown"));

@@ -83,7 +83,7 @@ std::vector<PlannedChange> failedOf(const PlanOutcome& outcome) {
 TEST(StateForm, IsLearntFromTheDescriptionOfTheWritingCommand) {
     EXPECT_EQ(form().root(), "configuration");
     EXPECT_EQ(form().settingsSection(), "settings");
-    EXPECT_EQ(form().lists().size(), 2U);
+    EXPECT_EQ(form().lists().size(), 3U);
     EXPECT_THAT(form().switches(), ElementsAre("properties", "access"));
     EXPECT_NE(form().secret("nimbo_client_password"), nullptr);
     EXPECT_EQ(form().setting("nimbo_client_password"), nullptr);

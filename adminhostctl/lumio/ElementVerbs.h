@@ -1,0 +1,45 @@
+#pragma once
+
+// What the verbs of cameras, workflows and properties have in common. A person names an element by its name (a
+// workflow's in the caller's language), its UUID or, for a workflow, the path of its bundle. A name that several
+// elements have is a usage error that lists their UUIDs.
+
+#include "adminhostctl/Verb.h"
+
+#include <span>
+#include <string>
+#include <string_view>
+
+namespace adminhost::ctl {
+
+/// The option with which names are names of groups.
+inline constexpr std::string_view groupOption = "--group";
+
+/// A kind of elements, by the words that are used for it.
+struct ElementKind {
+    const char* word;     ///< "camera"
+    const char* section;  ///< of the state, and the list's key in the answer of the listing
+    const char* listing;  ///< the command that lists them
+};
+
+/// The usage error for a name that no element has.
+[[nodiscard]] Failure notFound(const ElementKind& kind, const std::string& name);
+
+/// Prints all elements, or with --names one name of each.
+[[nodiscard]] ExitStatus listElements(const Context& context, const ElementKind& kind);
+[[nodiscard]] ExitStatus showElement(const Context& context, const ElementKind& kind, const std::string& name);
+
+// These change one element, which must exist.
+
+/// Adds users, or with --group groups, to the access list.
+[[nodiscard]] ExitStatus allowPeople(const Context& context, const ElementKind& kind, const std::string& name,
+                                     std::span<const std::string> people);
+/// Removes users and groups, or with --group groups only, from the access list.
+[[nodiscard]] ExitStatus denyPeople(const Context& context, const ElementKind& kind, const std::string& name,
+                                    std::span<const std::string> people);
+/// Restricts the element to its list ("on"), or opens it to everyone ("off").
+[[nodiscard]] ExitStatus switchAccess(const Context& context, const ElementKind& kind, const std::string& name,
+                                      const std::string& onOrOff);
+[[nodiscard]] ExitStatus removeElement(const Context& context, const ElementKind& kind, const std::string& name);
+
+}  // namespace adminhost::ctl
