@@ -1,4 +1,10 @@
-"""Bundles: the workflows on the shared file system, and the service's descriptions of properties."""
+"""Bundles: the workflows on the shared file system, and the service's descriptions of properties.
+
+Between them they have every form that such files may have: XML and binary information files; tables of quoted text in
+UTF-8 and UTF-16 and as XML and binary property lists; localizations named in English and by code.
+"""
+
+import plistlib
 
 import library
 import names
@@ -16,9 +22,18 @@ def strings_table(entries, comment):
     return "\n".join(lines) + "\n"
 
 
-def write_strings(root, bundle, language, table, entries, encoding="utf-8"):
+# How the tables of a localization are written; others are quoted text in UTF-8. "utf-16" writes a byte-order mark.
+ENCODINGS = {"French": "utf-16"}
+PROPERTY_LISTS = {"ja": plistlib.FMT_XML, "fr": plistlib.FMT_BINARY}
+BINARY_INFORMATION = ["AudioEpisode.workflow", "TwoCameras.workflow"]
+
+
+def write_strings(root, bundle, language, table, entries):
     path = settings.below(root, f"{bundle}/Contents/Resources/{language}.lproj/{table}.strings")
-    path.write_text(strings_table(entries, f"{table}, {language}"), encoding=encoding)
+    if language in PROPERTY_LISTS:
+        path.write_bytes(plistlib.dumps(entries, fmt=PROPERTY_LISTS[language]))
+    else:
+        path.write_text(strings_table(entries, f"{table}, {language}"), encoding=ENCODINGS.get(language, "utf-8"))
 
 
 def write(root, workflows):
@@ -27,11 +42,10 @@ def write(root, workflows):
             continue
         bundle = f"{settings.SHARED}/Workflows/{directory}"
         uuid = names.uuid_of("workflow", directory)
-        settings.write_plist(root, bundle + "/Contents/Info.plist", dict(information, UUID=uuid))
+        form = plistlib.FMT_BINARY if directory in BINARY_INFORMATION else plistlib.FMT_XML
+        settings.write_plist(root, bundle + "/Contents/Info.plist", dict(information, UUID=uuid), form)
         for language, (name, description) in languages.items():
             write_strings(root, bundle, language, "InfoPlist", {"Name": name, "Description": description})
     settings.write_plist(root, LOCALIZATIONS + "/Contents/Info.plist", {"Name": "Server localizations"})
     for language, entries in library.DESCRIPTIONS.items():
-        # One table has the other encoding that such tables may have ("utf-16" writes a byte-order mark).
-        encoding = "utf-16" if language == "French" else "utf-8"
-        write_strings(root, LOCALIZATIONS, language, "PropertyDescriptions", entries, encoding)
+        write_strings(root, LOCALIZATIONS, language, "PropertyDescriptions", entries)

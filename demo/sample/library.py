@@ -16,20 +16,24 @@ CAMERAS = [
     ("Workshop", "capturing", "t", "t", ["user:ben"], "ben"),
 ]
 
-# directory name, disabled, access control, access list, last user, information file, strings by language
+# directory name, disabled, access control, access list, last user, information file, strings by localization
 WORKFLOWS = [
     ("Publish.workflow", None, "t", ["group:lecturers", "group:editors"], "anna",
      {"Name": "Publish", "Description": "Publishes a recording to the catalog", "Notes": "Version 2.4"},
      {"English": ("Publish to Catalog", "Encodes a recording and publishes it in the catalog."),
       "German": ("Im Katalog veröffentlichen", "Kodiert eine Aufnahme und veröffentlicht sie im Katalog."),
-      "French": ("Publier au catalogue", "Encode un enregistrement et le publie au catalogue.")}),
-    ("Podcast.workflow", "f", "f", [], "ben",
-     {"Name": "Podcast", "Description": "Makes an audio episode"},
-     {"English": ("Podcast", "Takes the sound of a recording and makes an episode of it."),
-      "German": ("Podcast", "Macht aus dem Ton einer Aufnahme eine Folge.")}),
+      "French": ("Publier au catalogue", "Encode un enregistrement et le publie au catalogue."),
+      "ja": ("カタログに公開", "録画をエンコードしてカタログに公開します。")}),
+    ("AudioEpisode.workflow", "f", "f", [], "ben",
+     {"Name": "Audio Episode", "Description": "Makes an audio episode"},
+     {"English": ("Audio Episode", "Takes the sound of a recording and makes an episode of it."),
+      "German": ("Hörfolge", "Macht aus dem Ton einer Aufnahme eine Folge."),
+      "fr": ("Épisode sonore", "Fait un épisode du son d'un enregistrement."),
+      "ja": ("音声エピソード", "録画の音声からエピソードを作ります。")}),
     ("TwoCameras.workflow", "f", "t", ["user:juergen"], "juergen",
      {"Name": "Two Cameras", "Notes": "Needs two recordings of one event"},
-     {"English": ("Picture in Picture", "Lays the second camera over the first one.")}),
+     {"English": ("Picture in Picture", "Lays the second camera over the first one."),
+      "de": ("Bild im Bild", "Legt die zweite Kamera über die erste.")}),
     ("Archive.workflow", None, None, [], None, {"Name": "Archive", "Description": "Copies to the archive"}, {}),
     ("Nameless.workflow", "f", "f", [], None, {}, {}),
     ("Removed.workflow", "f", "f", [], None, None, {}),
@@ -45,7 +49,7 @@ PROPERTIES = [
     ("intro_movie", "/Library/SorvaneProducer/Shared/Media/intro.mov", False),
     ("mail_sender", "recordings@media1.example.org", False),
     ("mail_password", "correct horse battery staple, and a good deal more than one line of text", True),
-    ("podcast_author", "Academy of Examples", False),
+    ("episode_author", "Academy of Examples", False),
     ("upload_token", "0123456789abcdef0123456789abcdef", True),
     ("watermark", "", False),
 ]
@@ -59,7 +63,7 @@ DESCRIPTIONS = {
         "intro_movie": "Movie shown before each recording",
         "mail_sender": "Sender of the service's mail",
         "mail_password": "Password of the mail account",
-        "podcast_author": "Author of every episode",
+        "episode_author": "Author of every episode",
     },
     "German": {
         "catalog_title": "Titel über dem Katalog",

@@ -73,9 +73,9 @@ def below(root, path):
     return disk
 
 
-def write_plist(root, path, value):
+def write_plist(root, path, value, form=plistlib.FMT_XML):
     with open(below(root, path), "wb") as out:
-        plistlib.dump(value, out, sort_keys=False)
+        plistlib.dump(value, out, fmt=form, sort_keys=False)
 
 
 def write(root):

@@ -31,7 +31,13 @@ def database_path(root):
 def is_account(root, record_type, name):
     file = root + ("/etc/passwd" if record_type == "user" else "/etc/group")
     with open(file, encoding="utf-8") as lines:
-        return any(line.split(":", 1)[0] == name for line in lines)
+        if any(line.split(":", 1)[0] == name for line in lines):
+            return True
+    try:  # people of a directory server
+        with open(root + "/etc/demo/directory", encoding="utf-8") as lines:
+            return any(line.rstrip("\n") == f"{record_type}:{name}" for line in lines)
+    except FileNotFoundError:
+        return False
 
 
 def resource_id(database, resource_type, uuid):

@@ -100,6 +100,21 @@ TEST(MakeRoot, WorkflowBundlesAreThereExceptTheRemovedOne) {
     EXPECT_FALSE(fs::exists(root.disk(workflows + "Workflows/Removed.workflow")));
 }
 
+TEST(MakeRoot, WorkflowBundlesHaveEveryFormOfInformationFilesAndTables) {
+    const SampleRoot root;
+    const std::string workflows = "/Library/SorvaneProducer/Shared/Workflows/";
+    const auto beginning = [&](const std::string& path) { return root.read(workflows + path).substr(0, 8); };
+    const std::string table = ".lproj/InfoPlist.strings";
+    EXPECT_THAT(beginning("Publish.workflow/Contents/Info.plist"), testing::StartsWith("<?xml"));
+    EXPECT_EQ(beginning("AudioEpisode.workflow/Contents/Info.plist"), "bplist00");
+    EXPECT_THAT(beginning("Publish.workflow/Contents/Resources/German" + table), testing::StartsWith("/*"));
+    EXPECT_THAT(beginning("Publish.workflow/Contents/Resources/French" + table), testing::StartsWith("\xFF\xFE/"));
+    EXPECT_THAT(beginning("Publish.workflow/Contents/Resources/ja" + table), testing::StartsWith("<?xml"));
+    EXPECT_EQ(beginning("AudioEpisode.workflow/Contents/Resources/fr" + table), "bplist00");
+    EXPECT_FALSE(fs::exists(root.disk(workflows + "Archive.workflow/Contents/Resources")));
+    EXPECT_THAT(plistText(root, workflows + "TwoCameras.workflow/Contents/Info.plist"), HasSubstr("'Two Cameras'"));
+}
+
 TEST(MakeRoot, PropertyDescriptionsComeInThreeLanguages) {
     const SampleRoot root;
     const std::string bundle =

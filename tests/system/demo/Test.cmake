@@ -1,0 +1,1 @@
+set(TEST_DEPENDS adminhostd adminhostctl adminhost_lumio)
