@@ -12,6 +12,7 @@
 #include <csignal>
 #include <cstdlib>
 #include <fstream>
+#include <set>
 
 #include <fcntl.h>
 #include <ldap.h>
@@ -76,6 +77,18 @@ class LdapConnections : public testing::Test {
         return namesOf(ask(ldapNode(settings), anna()));
     }
     static std::string unusedUri() { return "ldap://127.0.0.1:" + std::to_string(support::freePort()); }
+
+    /// Where the library puts caches in files.
+    static std::set<std::string> cacheFiles() {
+        std::set<std::string> names;
+        for (const auto& entry : std::filesystem::directory_iterator("/tmp")) {
+            const std::string name = entry.path().filename();
+            if (name.starts_with("krb5cc") || name.starts_with("tkt")) {
+                names.insert(name);
+            }
+        }
+        return names;
+    }
 
     [[nodiscard]] HostPath file(const std::string& text, mode_t mode = 0600) {
         const std::filesystem::path path = _directory / ("file" + std::to_string(++_files));
@@ -173,12 +186,15 @@ TEST_F(LdapConnections, KerberosBindUsesTheKeytabAndLeavesNoTraceInTheEnvironmen
     settings.uris = {server.namedUri()};
     settings.sasl = LdapNodeSettings::Sasl::gssapi;
     settings.keytab = HostPath((kdc.directory() / "node.keytab").string());
-    const auto before = kdc.environment().at("KRB5CCNAME").value();
-    EXPECT_THAT(found(settings), ElementsAre("anna"));
+    const auto cacheName = kdc.environment().at("KRB5CCNAME").value();
+    const auto cachesBefore = cacheFiles();
+    const DirectoryNodeSource source = ldapNode(settings);
+    EXPECT_THAT(namesOf(ask(source, anna())), ElementsAre("anna"));
     settings.principal = "anna@NIMBO.TEST";
     EXPECT_THAT(found(settings), ElementsAre("anna"));
-    EXPECT_EQ(std::getenv("KRB5CCNAME"), before);
+    EXPECT_EQ(std::getenv("KRB5CCNAME"), cacheName);
     EXPECT_FALSE(std::filesystem::exists(kdc.directory() / "cc")) << "the default cache is not written";
+    EXPECT_EQ(cacheFiles(), cachesBefore) << "the ticket is in memory only";
     settings.principal = "writer@NIMBO.TEST";
     const Error error = errorOf(ask(ldapNode(settings), anna()));
     EXPECT_EQ(error.code, -2);
