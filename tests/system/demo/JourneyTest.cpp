@@ -28,6 +28,17 @@ TEST(Journey, ShowsTheMainTasksOnTheSampleService) {
     EXPECT_THAT(demo.output, HasSubstr("The daemon has stopped."));
 }
 
+TEST(Journey, ShowsTheSameWithThePeopleInAnLdapServer) {
+    const ProgramResult demo = runProgram({script, "--ldap", "--built", BINARY_DIR}, Errors::merge);
+    EXPECT_EQ(demo.status, 0) << demo.output;
+    EXPECT_THAT(demo.output, ContainsRegex("node +/LDAP\n"));
+    EXPECT_THAT(demo.output,
+                AllOf(HasSubstr("Anna Lindqvist (user)"),
+                      HasSubstr("workflows.\"Publish to Catalog\".users.ben: (not allowed) -> (allowed)\n"),
+                      HasSubstr(".groups.editors: (allowed) -> (not allowed)\n"),
+                      ContainsRegex("workflows +Publish to Catalog +in its list, through the group lecturers\n")));
+}
+
 TEST(Journey, UnknownOptionIsAUsageError) {
     const ProgramResult demo = runProgram({script, "--no-such-option"}, Errors::merge);
     EXPECT_EQ(demo.status, 2);
