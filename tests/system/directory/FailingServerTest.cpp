@@ -61,18 +61,22 @@ TEST_F(ServerThatIsDown, ExportFailsAndLeavesTheLastGoodFile) {
 TEST_F(ServerThatIsDown, VerbsThatChangeAccessOrCompareItFailAndWriteNothing) {
     root.recordToolCalls();
     const std::string desired = file("desired.toml", "[cameras.\"Main hall\"]\nusers = []\n");
-    const std::string before = root.sql("select * from access_control_entries; select * from cameras");
+    const std::string before =
+        root.sql("select * from access_control_entries; select * from cameras; select * from workflows");
     for (const std::vector<std::string>& words : {std::vector<std::string>{"plan", desired},
                                                   {"apply", desired},
                                                   {"camera", "allow", "Main hall", "ben"},
                                                   {"camera", "deny", "Main hall", "ben"},
-                                                  {"camera", "access", "Main hall", "off"}}) {
+                                                  {"camera", "access", "Main hall", "off"},
+                                                  {"workflow", "allow", "Workflows/Publish.workflow", "ben"},
+                                                  {"workflow", "deny", "Workflows/Publish.workflow", "editors"},
+                                                  {"workflow", "access", "Workflows/Publish.workflow", "off"}}) {
         const ProgramResult result = ctl(words);
         EXPECT_EQ(result.status, 1) << words.front() << ": " << result.output;
         EXPECT_THAT(result.output, HasSubstr(reason)) << words.front();
     }
     EXPECT_THAT(configurationRuns(), IsEmpty());
-    EXPECT_EQ(root.sql("select * from access_control_entries; select * from cameras"), before);
+    EXPECT_EQ(root.sql("select * from access_control_entries; select * from cameras; select * from workflows"), before);
 }
 
 TEST_F(ServerThatIsDown, RollbackFailsAndSettingsCanStillBeSet) {
