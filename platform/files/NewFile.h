@@ -18,9 +18,10 @@ namespace adminhost {
 
 class ADMINHOST_EXPORT NewFile {
   public:
-    /// Creates a file of mode 0644 that holds these bytes, on disk. A file or link of that name is removed first, never
-    /// followed or written to; a directory of that name is an error, and stays. Links on the way are followed only
-    /// where openPlace() allows it. On failure no new file is left. The error has the system's number.
+    /// Creates a file of mode 0644 that holds these bytes; they are not flushed to the disk. A file or link of that
+    /// name is removed first, never followed or written to; a directory of that name is an error, and stays. Links on
+    /// the way are followed only where openPlace() allows it. On failure no new file is left. The error has the
+    /// system's number.
     [[nodiscard]] static Result<NewFile> create(const DiskPath& path, std::string_view bytes);
 
     /// Sets the owner of this very file, whatever has its name by now. The group stays.

@@ -145,7 +145,6 @@ TEST_F(Validation, DirectoryThatFailsMeansThatTheOwnerCannotBeSet) {
     EXPECT_EQ(handler.validateSharedFilesystem("/shared", "grid"), 3U);
 }
 
-/// The tool that the account data come from is not asked for: only the directory counts.
 TEST_F(Validation, OwnerOfTheTestFileIsTheAccountsUserId) {
     if (::geteuid() != 0) {
         EXPECT_EQ(handler.validateSharedFilesystem("/shared", "other"), 3U) << "only the superuser can do that";
