@@ -78,42 +78,5 @@ TEST_F(CameraRequests, FailedListingAnswersOnlyItsCode) {
     EXPECT_EQ(handler.getCamerasWithRequest({}).dictionary(), (Dictionary{{"readStatus", 1}}));
 }
 
-// A tool whose access-list queries take a while, fail for one camera, and are killed for another.
-class SlowTool : public AccessLists {
-  protected:
-    void SetUp() override {
-        AccessLists::SetUp();
-        std::string rows;
-        for (int id = 100; id < 108; ++id) {
-            const std::string number = std::to_string(id);
-            rows += "insert into cameras(id,name,uuid,access_control_enabled) values(" + number + ",'Camera " + number +
-                    "','C-" + number + "','t');insert into access_control_entries values('" +
-                    uuidOf(id % 2 == 0 ? "user:anna" : "group:editors") + "','Camera'," + number + ");";
-        }
-        root.sql(database, rows);
-        std::filesystem::remove(root.path("/usr/bin/sqlite3"));
-        root.writeTool("/usr/bin/sqlite3",
-                       "#!/bin/bash\ncase $3 in\n*\"resource_id = '103'\") exit 7 ;;\n"
-                       "*\"resource_id = '105'\") kill -KILL $$ ;;\n"
-                       "*access_control_entries*) sleep 0.0$((RANDOM % 6)) ;;\nesac\n"
-                       "exec /usr/bin/sqlite3 \"$@\"\n");
-    }
-};
-
-TEST_F(SlowTool, ListingHasTheAnswersAndLogLinesOfOneQueryAfterTheOther) {
-    Array expected;
-    std::optional<Error> error;
-    auto cameras = Camera::allCamerasWithError(error);
-    ASSERT_TRUE(cameras);
-    for (const auto& each : *cameras) {
-        expected.emplace_back(*each->dictionary());
-    }
-    const std::vector<std::string> lines = std::exchange(log.lines, {});
-    ASSERT_EQ(lines.size(), 2U);
-
-    EXPECT_EQ(handler.getCamerasWithRequest({}).dictionary().get("cameras"), Value(std::move(expected)));
-    EXPECT_EQ(log.lines, lines);
-}
-
 }  // namespace
 }  // namespace lumio
