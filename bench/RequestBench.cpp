@@ -76,7 +76,7 @@ void readSettings(benchmark::State& state) {
     compare(state, "readSettings", "{}", daemon, [&] { runAll(floor); });
 }
 
-BENCHMARK(getCameras)->Arg(10)->Arg(100)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond)->MinTime(2);
+BENCHMARK(getCameras)->Arg(1)->Arg(10)->Arg(100)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond)->MinTime(2);
 BENCHMARK(getWorkflows)->Arg(10)->Arg(100)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond)->MinTime(2);
 BENCHMARK(readSettings)->Arg(10)->Arg(100)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond)->MinTime(2);
 
