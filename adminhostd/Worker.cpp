@@ -213,17 +213,24 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
             return answer;
         }
     }
-    KeptWrite write(loaded, {{"when", order.received},
-                             {"who", loginText(order.caller.uid, order.caller.login)},
-                             {"uid", std::uint64_t{order.caller.uid}},
-                             {"command", order.command},
-                             {"request", order.request}});
-    if (order.keepsHistory) {
-        write.begin();
+    // Only a command that may change something has a history: the name of a reader is not looked up.
+    std::optional<KeptWrite> write;
+    if (held) {
+        write.emplace(loaded, Dictionary{{"when", order.received},
+                                         {"who", loginText(order.caller.uid, order.caller.login)},
+                                         {"uid", std::uint64_t{order.caller.uid}},
+                                         {"command", order.command},
+                                         {"request", order.request}});
+    }
+    if (write && order.keepsHistory) {
+        write->begin();
     }
     _sink.beginOperation(loaded.name);
     auto response = callPlugin([&] { return plugin.perform(order.command, order.arguments); });
-    write.complete(_sink.takeChanges());
+    const std::vector<Change> reported = _sink.takeChanges();
+    if (write) {
+        write->complete(reported);
+    }
     if (!response) {
         return failed(response.error());
     }

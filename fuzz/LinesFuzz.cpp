@@ -78,9 +78,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
             begins.push_back(i + 1);
         }
     }
-    const std::vector<std::string> inferred = lumio::lineColumns(output);
+    const std::vector<std::string> inferred = lumio::lineColumns(lumio::OutputLines(output));
     for (const std::vector<std::string>& columns : {inferred, std::vector<std::string>{"id", "name", "uuid"}}) {
-        const auto rows = lumio::rowsOfRecords(output, columns);
+        const auto rows = lumio::rowsOfRecords(lumio::OutputLines(output), columns);
         require(rows.size() == records.size());
         for (std::size_t i = 0; i < rows.size(); ++i) {
             require(!rows[i] || (rows[i]->line == begins[i] && rows[i]->values.size() == columns.size()));

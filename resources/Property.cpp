@@ -14,6 +14,7 @@
 #include "settings/SettingsStore.h"
 
 #include <algorithm>
+#include <array>
 #include <chrono>
 #include <cstdlib>
 
@@ -55,10 +56,10 @@ class ScopedValueCleanse {
 
 /// Makes the texts fit a response, which can only carry UTF-8.
 void makeUtf8(Dictionary& row) {
-    for (const std::string& column : Property::tableColumnNames()) {
-        Value* value = row.find(column);
-        if (value != nullptr && value->string() != nullptr && !adminhost::isUtf8(*value->string())) {
-            *value = adminhost::utf8Of(*value->string());
+    for (const DictionaryEntry& entry : row) {
+        const std::string* text = entry.value.string();
+        if (text != nullptr && !adminhost::isUtf8(*text)) {
+            *row.find(entry.key) = adminhost::utf8Of(*text);
         }
     }
 }
@@ -103,20 +104,21 @@ const std::vector<std::string>& Property::tableColumnNames() {
     return names;
 }
 
-std::vector<std::string_view> Property::listOfResourceDateKeys() const {
-    return {"updated_at", "created_at"};
+std::span<const std::string_view> Property::listOfResourceDateKeys() const {
+    static constexpr std::array<std::string_view, 2> keys{"updated_at", "created_at"};
+    return keys;
 }
 
 void Property::readRow(Dictionary row) {
     Resource::readRow(std::move(row));
     _changeValues.reset();
-    const bool isProtected = _data->get("protect") == Value("t");
+    const bool isProtected = _data->text("protect") == "t";
     _data->set("protect", isProtected);
     if (isProtected) {
         _data->remove("value");
     }
-    if (_data->contains("id")) {
-        _data->set("_id_", _data->get("id"));
+    if (const Value* id = _data->find("id")) {
+        _data->set("_id_", *id);
     }
 }
 

@@ -78,7 +78,7 @@ class Property final : public ResourceClass<Property> {
 
   protected:
     [[nodiscard]] std::string_view className() const noexcept override { return "Property"; }
-    [[nodiscard]] std::vector<std::string_view> listOfResourceDateKeys() const override;
+    [[nodiscard]] std::span<const std::string_view> listOfResourceDateKeys() const override;
     void readRow(adminhost::Dictionary row) override;
     [[nodiscard]] std::string section() const override { return "properties"; }
 

@@ -36,10 +36,11 @@ struct Reading {
 };
 
 Reading readingOf(const std::string& output) {
-    Reading reading{lineColumns(output), {}, {}};
+    const OutputLines lines(output);
+    Reading reading{lineColumns(lines), {}, {}};
     std::erase_if(reading.columns, [](const std::string& name) { return !isColumn(name); });
-    reading.rows = readLineRows(output, reading.columns);
-    reading.further = lineColumnsOfEvery(output, reading.rows);
+    reading.rows = readLineRows(lines, reading.columns);
+    reading.further = lineColumnsOfEvery(lines, reading.rows);
     std::erase_if(reading.further, isColumn);
     return reading;
 }
@@ -90,12 +91,13 @@ std::optional<std::string> bytesOfHex(std::string_view digits) {
 /// Adds the columns that the table has besides its own ones, as the ordinary output shows them. A line that is part of
 /// the value is not a column.
 void addFurtherColumns(std::vector<Dictionary>& rows, const Reading& reading, const std::string& output) {
-    Names shown = lineColumns(output);
+    const OutputLines all(output);
+    Names shown = lineColumns(all);
     std::erase_if(shown, [&](const std::string& name) {
         return !isColumn(name) &&
                std::find(reading.further.begin(), reading.further.end(), name) == reading.further.end();
     });
-    const std::vector<LineRow> read = readLineRows(output, shown);
+    const std::vector<LineRow> read = readLineRows(all, shown);
     if (reading.further.empty() || read.size() != rows.size()) {
         return;
     }
@@ -124,7 +126,7 @@ Result<std::vector<Dictionary>> exactRows(const Reading& reading, const std::str
         return adminhost::failure(digits.error());
     }
     std::vector<Dictionary> rows;
-    for (const LineRow& read : readLineRows(*digits, selected)) {
+    for (const LineRow& read : readLineRows(OutputLines(*digits), selected)) {
         Dictionary& row = rows.emplace_back();
         for (std::size_t i = 0; i < columns.size(); ++i) {
             std::optional<std::string> text = read.values.empty() ? std::nullopt : bytesOfHex(read.values[i]);
@@ -159,7 +161,7 @@ Result<std::vector<Dictionary>> propertyRows(const std::string& columns, const s
     for (const LineRow& read : reading.rows) {
         Dictionary& row = rows.emplace_back();
         for (std::size_t i = 0; i < reading.columns.size(); ++i) {
-            row.set(reading.columns[i], read.values[i]);
+            row.append(reading.columns[i], read.values[i]);
         }
     }
     return rows;

@@ -9,6 +9,7 @@
 #include "settings/LineRows.h"
 
 #include <algorithm>
+#include <array>
 
 namespace lumio {
 
@@ -55,8 +56,9 @@ std::optional<Dictionary> Resource::localizationsForResourceNamed(std::string_vi
     return adminhost::localizedTable(bundle, name, preferredLanguages);
 }
 
-std::vector<std::string_view> Resource::listOfResourceDateKeys() const {
-    return {"updated_at", "created_at", "used_at"};
+std::span<const std::string_view> Resource::listOfResourceDateKeys() const {
+    static constexpr std::array<std::string_view, 3> keys{"updated_at", "created_at", "used_at"};
+    return keys;
 }
 
 void Resource::readRow(Dictionary row) {
@@ -149,9 +151,10 @@ adminhost::Result<std::vector<Resource::RowWithIdentity>> Resource::rowsWithIden
     for (Dictionary& record : recordsOfLineOutput(*output)) {
         rows.push_back({std::move(record), {}});
     }
+    const OutputLines lines(*output);
     std::vector<std::string> inferred;
     if (columns.empty()) {
-        inferred = lineColumns(*output);
+        inferred = lineColumns(lines);
         columns = inferred;
     }
     const auto indexOf = [&](std::string_view name) {
@@ -159,7 +162,7 @@ adminhost::Result<std::vector<Resource::RowWithIdentity>> Resource::rowsWithIden
     };
     const std::size_t id = indexOf("id");
     const std::size_t uuid = indexOf("uuid");
-    const auto raw = rowsOfRecords(*output, columns);
+    const auto raw = rowsOfRecords(lines, columns);
     for (std::size_t i = 0; i < std::min(raw.size(), rows.size()); ++i) {
         if (raw[i] && id < columns.size()) {
             rows[i].identity.id = raw[i]->values[id];

@@ -153,7 +153,7 @@ class Resource {
 
     [[nodiscard]] virtual std::string_view className() const noexcept { return "Resource"; }
     /// The columns whose local times become dates when a row is read.
-    [[nodiscard]] virtual std::vector<std::string_view> listOfResourceDateKeys() const;
+    [[nodiscard]] virtual std::span<const std::string_view> listOfResourceDateKeys() const;
     /// The part of initWithDictionary that reads the row.
     virtual void readRow(adminhost::Dictionary row);
 

@@ -11,32 +11,6 @@ namespace {
 constexpr std::string_view separator = " = ";
 constexpr std::size_t minimumWidth = 5;
 
-/// The whole lines of an output.
-class Lines {
-  public:
-    explicit Lines(std::string_view output) : _output(output) {
-        _begins.push_back(0);
-        for (std::size_t at = output.find('\n'); at != std::string_view::npos; at = output.find('\n', at + 1)) {
-            _begins.push_back(at + 1);
-        }
-    }
-
-    [[nodiscard]] std::size_t count() const noexcept { return _begins.size() - 1; }
-    /// Returns true if there is text after the last line feed.
-    [[nodiscard]] bool isCut() const noexcept { return _begins.back() != _output.size(); }
-    [[nodiscard]] std::string_view operator[](std::size_t i) const noexcept {
-        return _output.substr(_begins[i], _begins[i + 1] - 1 - _begins[i]);
-    }
-    /// The lines [begin, end) as one text, without the first `skip` bytes and the last line feed.
-    [[nodiscard]] std::string_view text(std::size_t begin, std::size_t end, std::size_t skip) const noexcept {
-        return _output.substr(_begins[begin] + skip, _begins[end] - 1 - _begins[begin] - skip);
-    }
-
-  private:
-    std::string_view _output;
-    std::vector<std::size_t> _begins;  ///< of each line, and the end of the last one
-};
-
 std::vector<std::string> prefixesOf(std::span<const std::string> columns) {
     std::size_t width = minimumWidth;
     for (const std::string& column : columns) {
@@ -60,12 +34,12 @@ std::string_view wordOf(std::string_view line, std::size_t width) noexcept {
     return word.find(' ') == std::string_view::npos ? word : std::string_view();
 }
 
-std::size_t widthOf(const Lines& lines) noexcept {
+std::size_t widthOf(const OutputLines& lines) noexcept {
     return lines.count() == 0 ? std::string_view::npos : lines[0].find(separator, minimumWidth);
 }
 
 /// The words of a row's lines, each once.
-std::vector<std::string> wordsOf(const Lines& lines, const LineRow& row, std::size_t width) {
+std::vector<std::string> wordsOf(const OutputLines& lines, const LineRow& row, std::size_t width) {
     std::vector<std::string> words;
     std::unordered_set<std::string_view> seen;
     std::size_t next = 0;
@@ -87,7 +61,8 @@ std::vector<std::string> wordsOf(const Lines& lines, const LineRow& row, std::si
 
 /// Returns true if a row's lines have all the words in this order. A row for which this is false may have them all the
 /// same.
-bool hasInOrder(const Lines& lines, const LineRow& row, std::size_t width, const std::vector<std::string>& words) {
+bool hasInOrder(const OutputLines& lines, const LineRow& row, std::size_t width,
+                const std::vector<std::string>& words) {
     auto wanted = words.begin();
     for (std::size_t i = row.line; i < row.end && wanted != words.end(); ++i) {
         if (wordOf(lines[i], width) == *wanted) {
@@ -98,65 +73,66 @@ bool hasInOrder(const Lines& lines, const LineRow& row, std::size_t width, const
 }
 
 /// Divides the lines [begin, end) of one row among the columns; empty unless there is exactly one way.
-std::vector<std::string_view> valuesOf(const Lines& lines, std::size_t begin, std::size_t end,
+std::vector<std::string_view> valuesOf(const OutputLines& lines, std::size_t begin, std::size_t end,
                                        const std::vector<std::string>& prefixes) {
     const std::size_t skip = prefixes.front().size();
-    std::vector<std::size_t> starts;
-    starts.reserve(prefixes.size() + 1);
+    std::vector<std::string_view> values;
+    values.reserve(prefixes.size());
     // Nearly every row has one line for each column: then there is no other way to divide them.
     if (end - begin == prefixes.size()) {
         for (std::size_t i = 0; i < prefixes.size(); ++i) {
-            if (!lines[begin + i].starts_with(prefixes[i])) {
+            const std::string_view line = lines[begin + i];
+            if (!line.starts_with(prefixes[i])) {
                 return {};
             }
-            starts.push_back(begin + i);
+            values.push_back(line.substr(skip));
         }
-    } else {
-        // ways[j]: in how many ways the lines so far can end within column j; 2 means more than one.
-        std::vector<unsigned> ways(prefixes.size(), 0);
-        struct Candidate {
-            std::size_t line;
-            std::size_t column;
-        };
-        std::vector<Candidate> candidates;
-        for (std::size_t i = begin; i < end; ++i) {
-            const auto found = std::find_if(prefixes.begin(), prefixes.end(),
-                                            [&](const std::string& prefix) { return lines[i].starts_with(prefix); });
-            const auto column = static_cast<std::size_t>(found - prefixes.begin());
-            if (i == begin) {
-                if (column != 0) {
-                    return {};
-                }
-                ways[0] = 1;
-                candidates.push_back({i, 0});
-            } else if (found != prefixes.end() && column != 0 && ways[column - 1] != 0) {
-                ways[column] = std::min(2U, ways[column] + ways[column - 1]);
-                candidates.push_back({i, column});
-            }
-        }
-        if (ways.back() != 1) {
-            return {};
-        }
-        // The one way, from its end: each column begins at its last candidate before the next column's.
-        std::size_t wanted = prefixes.size();
-        for (auto candidate = candidates.rbegin(); candidate != candidates.rend(); ++candidate) {
-            if (candidate->column + 1 == wanted) {
-                starts.push_back(candidate->line);
-                --wanted;
-            }
-        }
-        std::reverse(starts.begin(), starts.end());
+        return values;
     }
+    std::vector<std::size_t> starts;
+    starts.reserve(prefixes.size() + 1);
+    // ways[j]: in how many ways the lines so far can end within column j; 2 means more than one.
+    std::vector<unsigned> ways(prefixes.size(), 0);
+    struct Candidate {
+        std::size_t line;
+        std::size_t column;
+    };
+    std::vector<Candidate> candidates;
+    for (std::size_t i = begin; i < end; ++i) {
+        const auto found = std::find_if(prefixes.begin(), prefixes.end(),
+                                        [&](const std::string& prefix) { return lines[i].starts_with(prefix); });
+        const auto column = static_cast<std::size_t>(found - prefixes.begin());
+        if (i == begin) {
+            if (column != 0) {
+                return {};
+            }
+            ways[0] = 1;
+            candidates.push_back({i, 0});
+        } else if (found != prefixes.end() && column != 0 && ways[column - 1] != 0) {
+            ways[column] = std::min(2U, ways[column] + ways[column - 1]);
+            candidates.push_back({i, column});
+        }
+    }
+    if (ways.back() != 1) {
+        return {};
+    }
+    // The one way, from its end: each column begins at its last candidate before the next column's.
+    std::size_t wanted = prefixes.size();
+    for (auto candidate = candidates.rbegin(); candidate != candidates.rend(); ++candidate) {
+        if (candidate->column + 1 == wanted) {
+            starts.push_back(candidate->line);
+            --wanted;
+        }
+    }
+    std::reverse(starts.begin(), starts.end());
     starts.push_back(end);
-    std::vector<std::string_view> values;
-    values.reserve(prefixes.size());
     for (std::size_t j = 0; j < prefixes.size(); ++j) {
         values.push_back(lines.text(starts[j], starts[j + 1], skip));
     }
     return values;
 }
 
-std::vector<LineRow> rowsOf(const Lines& lines, std::span<const std::string> columns) {
+std::vector<LineRow> rowsOf(const OutputLines& lines, std::span<const std::string> columns) {
     std::vector<LineRow> rows;
     if (columns.empty() || lines.count() == 0) {
         return rows;
@@ -182,18 +158,23 @@ std::vector<LineRow> rowsOf(const Lines& lines, std::span<const std::string> col
 
 }  // namespace
 
-std::vector<LineRow> readLineRows(std::string_view output, std::span<const std::string> columns) {
-    return rowsOf(Lines(output), columns);
+OutputLines::OutputLines(std::string_view output) : _output(output) {
+    _begins.push_back(0);
+    for (std::size_t at = output.find('\n'); at != std::string_view::npos; at = output.find('\n', at + 1)) {
+        _begins.push_back(at + 1);
+    }
 }
 
-std::vector<std::string> lineColumns(std::string_view output) {
-    const Lines lines(output);
+std::vector<LineRow> readLineRows(const OutputLines& lines, std::span<const std::string> columns) {
+    return rowsOf(lines, columns);
+}
+
+std::vector<std::string> lineColumns(const OutputLines& lines) {
     const LineRow all{0, lines.count(), {}};
     return wordsOf(lines, all, widthOf(lines));
 }
 
-std::vector<std::string> lineColumnsOfEvery(std::string_view output, std::span<const LineRow> rows) {
-    const Lines lines(output);
+std::vector<std::string> lineColumnsOfEvery(const OutputLines& lines, std::span<const LineRow> rows) {
     const std::size_t width = widthOf(lines);
     std::vector<std::string> common;
     for (std::size_t i = 0; i < rows.size() && (i == 0 || !common.empty()); ++i) {
@@ -212,8 +193,7 @@ std::vector<std::string> lineColumnsOfEvery(std::string_view output, std::span<c
     return common;
 }
 
-std::vector<std::optional<LineRow>> rowsOfRecords(std::string_view output, std::span<const std::string> columns) {
-    const Lines lines(output);
+std::vector<std::optional<LineRow>> rowsOfRecords(const OutputLines& lines, std::span<const std::string> columns) {
     std::vector<LineRow> rows = rowsOf(lines, columns);
     std::unordered_map<std::string_view, int> seen;
     for (const LineRow& row : rows) {

@@ -20,6 +20,27 @@
 
 namespace lumio {
 
+/// The whole lines of an output, found once for all readers of it. Refers to the output, which must outlive it.
+class OutputLines {
+  public:
+    explicit OutputLines(std::string_view output);
+
+    [[nodiscard]] std::size_t count() const noexcept { return _begins.size() - 1; }
+    /// Returns true if there is text after the last line feed.
+    [[nodiscard]] bool isCut() const noexcept { return _begins.back() != _output.size(); }
+    [[nodiscard]] std::string_view operator[](std::size_t i) const noexcept {
+        return _output.substr(_begins[i], _begins[i + 1] - 1 - _begins[i]);
+    }
+    /// The lines [begin, end) as one text, without the first `skip` bytes and the last line feed.
+    [[nodiscard]] std::string_view text(std::size_t begin, std::size_t end, std::size_t skip) const noexcept {
+        return _output.substr(_begins[begin] + skip, _begins[end] - 1 - _begins[begin] - skip);
+    }
+
+  private:
+    std::string_view _output;
+    std::vector<std::size_t> _begins;  ///< of each line, and the end of the last one
+};
+
 struct LineRow {
     std::size_t line = 0;                  ///< index of the row's first line in the output
     std::size_t end = 0;                   ///< index of the line after its last one
@@ -30,18 +51,18 @@ struct LineRow {
 
 /// The rows of an output whose columns have these names, in this order. An output that does not end in a line feed was
 /// cut off; its last row is left out.
-[[nodiscard]] std::vector<LineRow> readLineRows(std::string_view output, std::span<const std::string> columns);
+[[nodiscard]] std::vector<LineRow> readLineRows(const OutputLines& lines, std::span<const std::string> columns);
 
 /// The names on all lines that look like columns, each once, in the order of their first lines. Lines of values may be
 /// among them.
-[[nodiscard]] std::vector<std::string> lineColumns(std::string_view output);
+[[nodiscard]] std::vector<std::string> lineColumns(const OutputLines& lines);
 
 /// Those of them that every one of the rows has.
-[[nodiscard]] std::vector<std::string> lineColumnsOfEvery(std::string_view output, std::span<const LineRow> rows);
+[[nodiscard]] std::vector<std::string> lineColumnsOfEvery(const OutputLines& lines, std::span<const LineRow> rows);
 
 /// For each record that recordsOfLineOutput reads, the row that begins at the same line and is known; none for a record
 /// that is only a piece of a row, and for rows whose first column occurs twice.
-[[nodiscard]] std::vector<std::optional<LineRow>> rowsOfRecords(std::string_view output,
+[[nodiscard]] std::vector<std::optional<LineRow>> rowsOfRecords(const OutputLines& lines,
                                                                 std::span<const std::string> columns);
 
 }  // namespace lumio

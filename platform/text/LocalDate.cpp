@@ -21,15 +21,15 @@ long zoneOffsetAt(std::chrono::sys_days midnight) {
 /// Returns true if the zone may have changed since the last call. The daemon keeps running while its machine's zone is
 /// changed; checking once a second is enough to notice.
 bool zoneMayHaveChanged() {
-    using Clock = std::chrono::steady_clock;
-    static std::optional<Clock::time_point> last;
+    static std::optional<std::time_t> last;
     static long lastOffset = 0;
-    const Clock::time_point now = Clock::now();
-    if (last && ::timezone == lastOffset && now - *last < std::chrono::seconds(1)) {
+    timespec now{};
+    ::clock_gettime(CLOCK_MONOTONIC_COARSE, &now);  // asked for each date of a list, and far cheaper than the exact one
+    if (last && ::timezone == lastOffset && now.tv_sec == *last) {
         return false;
     }
     ::tzset();
-    last = now;
+    last = now.tv_sec;
     lastOffset = ::timezone;
     return true;
 }

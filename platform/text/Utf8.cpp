@@ -30,6 +30,10 @@ bool isUtf8(std::string_view text) noexcept {
                 continue;
             }
         }
+        if (static_cast<unsigned char>(text.front()) < 0x80) {
+            text.remove_prefix(1);
+            continue;
+        }
         const Utf8Character character = firstCharacterOf(text);
         if (!character.wellFormed) {
             return false;

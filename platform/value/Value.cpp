@@ -107,6 +107,10 @@ void Dictionary::set(std::string_view key, Value value) {
         _entries[index].value = std::move(value);
         return;
     }
+    append(key, std::move(value));
+}
+
+void Dictionary::append(std::string_view key, Value value) {
     if (_entries.empty()) {
         _entries.reserve(8);  // most dictionaries have several entries, and moving them costs more than room for them
     }

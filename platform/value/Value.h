@@ -60,6 +60,8 @@ class ADMINHOST_EXPORT Dictionary {
 
     /// Stores the value; an existing key keeps its place. A null value removes the key.
     void set(std::string_view key, Value value);
+    /// Stores the value under a key that is known not to be there, without looking for it. The value is not null.
+    void append(std::string_view key, Value value);
     /// Removes the key. Returns false if it is not there.
     bool remove(std::string_view key);
     void clear() noexcept;

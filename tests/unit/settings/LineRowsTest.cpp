@@ -17,7 +17,7 @@ const std::vector<std::string> columns{"id", "value", "protect"};
 /// The values of all rows; "?" for a row that is not known.
 std::vector<std::vector<std::string>> read(std::string_view output, const std::vector<std::string>& names = columns) {
     std::vector<std::vector<std::string>> rows;
-    for (const LineRow& row : readLineRows(output, names)) {
+    for (const LineRow& row : readLineRows(OutputLines(output), names)) {
         rows.emplace_back(row.values.begin(), row.values.end());
         if (row.values.empty()) {
             rows.back().emplace_back("?");
@@ -62,11 +62,11 @@ TEST(LineRows, NamesOfColumnsAreThoseOnLinesWithTheSameSeparator) {
     const std::string output =
         "     id = 1\n  value = a\n   word = b\nother word = c\n x = d\nprotect = t\n\n     id = 2\n"
         "  value = a\nprotect = t\n";
-    EXPECT_THAT(lineColumns(output), ElementsAre("id", "value", "word", "protect"));
-    const std::vector<LineRow> rows = readLineRows(output, columns);
-    EXPECT_THAT(lineColumnsOfEvery(output, rows), ElementsAre("id", "value", "protect"));
-    EXPECT_THAT(lineColumns(""), IsEmpty());
-    EXPECT_THAT(lineColumns("no separator\n"), IsEmpty());
+    EXPECT_THAT(lineColumns(OutputLines(output)), ElementsAre("id", "value", "word", "protect"));
+    const std::vector<LineRow> rows = readLineRows(OutputLines(output), columns);
+    EXPECT_THAT(lineColumnsOfEvery(OutputLines(output), rows), ElementsAre("id", "value", "protect"));
+    EXPECT_THAT(lineColumns(OutputLines("")), IsEmpty());
+    EXPECT_THAT(lineColumns(OutputLines("no separator\n")), IsEmpty());
 }
 
 TEST(LineRows, RowsOfRecordsMatchTheRecordsOfTheLineReading) {
@@ -74,7 +74,7 @@ TEST(LineRows, RowsOfRecordsMatchTheRecordsOfTheLineReading) {
         "     id = 1\n  value = a\n\nb\nprotect = t\n\n     id = 2\n  value = c\nprotect = t\n\n     id = 3\n  value = "
         "d\n"
         "protect = t\n\n";
-    const auto rows = rowsOfRecords(output, columns);
+    const auto rows = rowsOfRecords(OutputLines(output), columns);
     ASSERT_EQ(rows.size(), recordsOfLineOutput(output).size());
     ASSERT_EQ(rows.size(), 5U);
     EXPECT_EQ(rows[0]->values[1], "a\n\nb");
@@ -83,7 +83,8 @@ TEST(LineRows, RowsOfRecordsMatchTheRecordsOfTheLineReading) {
     EXPECT_EQ(rows[3]->values[2], "t\n");
     EXPECT_EQ(rows[4], std::nullopt);
     EXPECT_EQ(
-        rowsOfRecords("     id = 1\n  value = a\nprotect = t\n\n     id = 1\n  value = b\nprotect = t\n", columns),
+        rowsOfRecords(OutputLines("     id = 1\n  value = a\nprotect = t\n\n     id = 1\n  value = b\nprotect = t\n"),
+                      columns),
         std::vector<std::optional<LineRow>>(2))
         << "an id that comes twice belongs to neither";
 }
@@ -106,7 +107,7 @@ TEST(LineRows, EveryOutputHasARowForEachRecordThatBeginsAtTheSameLine) {
                 begins.push_back(line + 1);
             }
         }
-        const auto rows = rowsOfRecords(output, columns);
+        const auto rows = rowsOfRecords(OutputLines(output), columns);
         ASSERT_EQ(rows.size(), recordsOfLineOutput(output).size());
         for (std::size_t i = 0; i < rows.size(); ++i) {
             ASSERT_TRUE(!rows[i] || rows[i]->line == begins[i]) << i;

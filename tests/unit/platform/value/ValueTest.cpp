@@ -34,6 +34,18 @@ TEST(Value, MayBeAssignedFromAValueInsideItself) {
     EXPECT_EQ(b, Value(Array{Value(1)}));
 }
 
+TEST(Dictionary, AppendedKeysAreFoundHoweverManyThereAre) {
+    Dictionary dictionary;
+    for (int i = 0; i < 40; ++i) {
+        dictionary.append("key " + std::to_string(i), i);
+        EXPECT_EQ(dictionary.get("key 0"), Value(0)) << i;
+        EXPECT_EQ(dictionary.get("key " + std::to_string(i)), Value(i));
+    }
+    dictionary.set("key 39", "new");
+    EXPECT_EQ(dictionary.size(), 40U);
+    EXPECT_EQ(dictionary.get("key 39"), Value("new"));
+}
+
 TEST(Dictionary, KeepsInsertionOrderAndAnExistingKeysPlace) {
     Dictionary d;
     for (int i = 0; i < 100; ++i) {
