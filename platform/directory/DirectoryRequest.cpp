@@ -64,6 +64,11 @@ Clock::time_point directoryDeadline() noexcept {
     return request() ? std::min(deadline, request()->end) : deadline;
 }
 
+bool isDirectoryTimeUsedUp() noexcept {
+    constexpr auto tooLittle = std::chrono::milliseconds(10);
+    return directoryDeadline() - tooLittle <= Clock::now();
+}
+
 std::optional<Error> failureInRequest(std::string_view node) {
     if (!request()) {
         return std::nullopt;

@@ -50,6 +50,9 @@ struct ADMINHOST_EXPORT UnreachableNode {
 /// the maximum for none.
 [[nodiscard]] std::chrono::steady_clock::time_point directoryDeadline() noexcept;
 
+/// True when that moment has come, or is so near that nothing more can be done: the library's waits end a little early.
+[[nodiscard]] bool isDirectoryTimeUsedUp() noexcept;
+
 /// The error with which the node failed in this request, if it is not to be tried again.
 [[nodiscard]] std::optional<Error> failureInRequest(std::string_view node);
 /// Remembers that the node is not to be tried again in this request. Does nothing outside a request.

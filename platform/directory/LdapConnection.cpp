@@ -1,6 +1,7 @@
 #include "platform/directory/LdapConnection.h"
 
 #include "platform/directory/DirectoryRequest.h"
+#include "platform/directory/LdapCertificate.h"
 #include "platform/directory/LdapPassword.h"
 
 #include <algorithm>
@@ -157,6 +158,9 @@ Result<std::unique_ptr<LdapConnection>> LdapConnection::open(const LdapNodeSetti
         std::unique_ptr<LdapConnection> connection(new LdapConnection(settings, uri));
         connection->_openEnd = end;
         auto connected = connection->connect();
+        if (!connected) {
+            connection->explain(connected.error());
+        }
         if (connected) {
             connected = connection->bind(credential, signIn);
         }
@@ -209,6 +213,35 @@ Result<void> LdapConnection::connect() {
         }
     }
     return {};
+}
+
+void LdapConnection::explain(Error& error) const {
+    const bool usesTls = _settings.startTls || ::ldap_is_ldaps_url(_uri.c_str()) != 0;
+    if (!usesTls || _settings.verify == LdapNodeSettings::Verify::never || _waitLimit.end() <= Clock::now() ||
+        !isUnreachable(error.code)) {
+        return;
+    }
+    // Connects once more to see the certificate. Nothing is sent on this connection.
+    LdapNodeSettings settings = _settings;
+    settings.verify = LdapNodeSettings::Verify::never;
+    LdapConnection unverified(settings, _uri);
+    unverified._openEnd = _waitLimit.end();
+    berval certificate{};
+    if (!unverified.connect() ||
+        ::ldap_get_option(unverified._handle.get(), LDAP_OPT_X_TLS_PEERCERT, &certificate) != LDAP_OPT_SUCCESS) {
+        return;
+    }
+    const std::string bytes = textOf(certificate);
+    ::ber_memfree(certificate.bv_val);
+    LDAPURLDesc* parsed = nullptr;
+    if (::ldap_url_parse(_uri.c_str(), &parsed) != LDAP_URL_SUCCESS) {
+        return;
+    }
+    const LdapUrl owned(parsed);
+    const std::string authorities = _settings.caFile ? diskPath(*_settings.caFile).text() : systemCertificates;
+    if (const std::string problem = certificateProblem(bytes, parsed->lud_host, authorities); !problem.empty()) {
+        error.description = fmt::format("{}: {}", _uri, problem);
+    }
 }
 
 Result<void> LdapConnection::useCertificates() {
@@ -328,7 +361,7 @@ Result<LdapMessage> LdapConnection::receive(int id, int all, Clock::time_point e
     }
     if (type == 0) {
         ::ldap_abandon_ext(_handle.get(), id, nullptr, nullptr);
-        const bool usedUp = directoryDeadline() <= Clock::now();
+        const bool usedUp = isDirectoryTimeUsedUp();
         return failure(ldapError(LDAP_TIMEOUT, what(action),
                                  usedUp ? std::string_view("the time for the directory is used up")
                                         : std::string_view("the server does not respond")));

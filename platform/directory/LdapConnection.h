@@ -74,6 +74,8 @@ class LdapConnection {
 
     [[nodiscard]] Result<void> connect();
     [[nodiscard]] Result<void> useCertificates();
+    /// Replaces the error of a failed connect by a reason why the server's certificate is not trusted, if there is one.
+    void explain(Error& error) const;
     [[nodiscard]] Result<void> bind(KerberosCredential& credential, const LdapSignIn* signIn);
     [[nodiscard]] Result<void> bindSimple(const std::string& dn, std::string_view password);
     [[nodiscard]] Result<void> bindExternal();

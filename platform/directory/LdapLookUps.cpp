@@ -22,7 +22,7 @@ Result<void> LdapLookUps::open(Clock::time_point end) {
     if (const auto error = failureInRequest(_settings.name)) {
         return failure(*error);
     }
-    if (directoryDeadline() <= Clock::now()) {
+    if (isDirectoryTimeUsedUp()) {
         return failure(ldapError(LDAP_TIMEOUT, _settings.name, "the time for the directory is used up"));
     }
     if (_kept) {

@@ -19,6 +19,7 @@
 #include <netinet/in.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 namespace adminhost {
@@ -32,6 +33,7 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::Not;
 using testing::SizeIs;
+using testing::StartsWith;
 
 /// A port that accepts connections, and never sends anything.
 class BlackHole {
@@ -242,10 +244,14 @@ TEST_F(LdapConnections, CertificateThatIsNotTrustedExpiredOrForAnotherNameIsRefu
         const char* subject;
         std::chrono::hours valid;
         const TestAuthority& trusted;
+        std::string words;
     };
-    for (const Case& wrong : {Case{"IP:127.0.0.1", std::chrono::hours(24), otherAuthority},
-                              Case{"IP:127.0.0.1", std::chrono::hours(-24), authority},
-                              Case{"DNS:elsewhere.test", std::chrono::hours(24), authority}}) {
+    for (const Case& wrong :
+         {Case{"IP:127.0.0.1", std::chrono::hours(24), otherAuthority,
+               "is not trusted by " + otherAuthority.file().string()},
+          Case{"IP:127.0.0.1", std::chrono::hours(-24), authority, "the server's certificate expired on "},
+          Case{"DNS:elsewhere.test", std::chrono::hours(24), authority,
+               "is not for 127.0.0.1, but for DNS:elsewhere.test"}}) {
         support::Slapd::Options options;
         options.certificates = authority.issue(wrong.subject, wrong.valid);
         support::Slapd server(options);
@@ -257,7 +263,8 @@ TEST_F(LdapConnections, CertificateThatIsNotTrustedExpiredOrForAnotherNameIsRefu
             settings.caFile = HostPath(wrong.trusted.file().string());
             const Error error = errorOf(ask(ldapNode(settings), anna()));
             EXPECT_TRUE(error.code == -1 || error.code == -11) << error.code;
-            EXPECT_THAT(error.description.value_or(""), HasSubstr(settings.uris[0]));
+            EXPECT_THAT(error.description.value_or(""), StartsWith(settings.uris[0] + ": "));
+            EXPECT_THAT(error.description.value_or(""), HasSubstr(wrong.words));
             settings.verify = LdapNodeSettings::Verify::never;
             EXPECT_THAT(found(settings), ElementsAre("anna"));
         }
@@ -475,6 +482,9 @@ TEST_F(LdapConnections, KeptConnectionThatNoLongerRespondsFailsAtTheTimeOutAndIs
     const DirectoryNodeSource source = ldapNode(settings);
     EXPECT_THAT(namesOf(ask(source, anna())), ElementsAre("anna"));
     ASSERT_EQ(::kill(server.pid(), SIGSTOP), 0);
+    int status = 0;
+    ASSERT_EQ(::waitpid(server.pid(), &status, WUNTRACED), server.pid());
+    ASSERT_TRUE(WIFSTOPPED(status)) << "all its threads have stopped";
     EXPECT_EQ(errorOf(ask(source, anna())).code, -5);
     ASSERT_EQ(::kill(server.pid(), SIGCONT), 0);
     EXPECT_THAT(namesOf(ask(source, anna())), ElementsAre("anna"));
