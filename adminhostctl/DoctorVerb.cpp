@@ -84,9 +84,11 @@ std::string besideColumn(const std::string& text, std::size_t column, std::size_
 
 void printPage(const Context& context, const Array& checks) {
     constexpr std::size_t stateWidth = 9;
+    constexpr std::size_t widestName = 32;  // a longer one has a line of its own
     std::size_t nameWidth = 0;
     for (const Value& one : checks) {
-        nameWidth = std::max(nameWidth, widthOf(shown(one.dictionary()->text("name"))));
+        const std::size_t width = widthOf(shown(one.dictionary()->text("name")));
+        nameWidth = width > widestName ? nameWidth : std::max(nameWidth, width);
     }
     for (const Value& one : checks) {
         const std::string name = shown(one.dictionary()->text("name"));
@@ -94,8 +96,9 @@ void printPage(const Context& context, const Array& checks) {
         const std::string shownState = state == okState ? "ok" : state == warningState ? "WARNING" : "FAILURE";
         const std::string fix = shown(one.dictionary()->text("fix"));
         const std::size_t column = stateWidth + nameWidth + 2;
+        const std::size_t width = widthOf(name);
         context.out << shownState << std::string(stateWidth - shownState.size(), ' ') << name
-                    << std::string(nameWidth + 2 - widthOf(name), ' ')
+                    << (width > nameWidth ? '\n' + std::string(column, ' ') : std::string(nameWidth + 2 - width, ' '))
                     << besideColumn(shown(one.dictionary()->text("found")), column, context.options.width);
         if (!fix.empty()) {
             context.out << std::string(column, ' ') << besideColumn("fix: " + fix, column, context.options.width);

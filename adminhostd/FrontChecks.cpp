@@ -95,7 +95,7 @@ Diagnosis directoryCheck(const std::string& what, const std::string& path) {
             ""};
 }
 
-Diagnosis spaceOf(const std::string& path) {
+Diagnosis spaceOf(const std::string& what, const std::string& path) {
     // The nearest directory that exists.
     std::filesystem::path place = path;
     std::error_code ignored;
@@ -104,9 +104,9 @@ Diagnosis spaceOf(const std::string& path) {
     }
     struct statvfs space {};
     if (::statvfs(place.c_str(), &space) != 0) {
-        return {Health::warning, "free space " + path, path + ": " + errorText(errno) + '.', "check the file system"};
+        return {Health::warning, "free space, " + what, path + ": " + errorText(errno) + '.', "check the file system"};
     }
-    return spaceCheck(path, space);
+    return spaceCheck("free space, " + what, path, space);
 }
 
 Diagnosis unitCheck() {
@@ -214,7 +214,7 @@ std::vector<Diagnosis> FrontChecks::run(const Workers& workers) const {
     }
     for (const auto& [what, path] : _directories) {
         if (what != "plug-in directory") {
-            checks.push_back(spaceOf(path));
+            checks.push_back(spaceOf(what, path));
         }
     }
     checks.push_back(unitCheck());
@@ -239,9 +239,8 @@ Diagnosis clockCheck(int state, const timex& clock) {
     return {Health::ok, "clock", "The clock is synchronised.", ""};
 }
 
-Diagnosis spaceCheck(const std::string& directory, const struct statvfs& space) {
+Diagnosis spaceCheck(const std::string& name, const std::string& directory, const struct statvfs& space) {
     const std::uint64_t bytes = std::uint64_t{space.f_bavail} * space.f_frsize;
-    const std::string name = "free space " + directory;
     const bool countsFiles = space.f_files > 0;
     const std::string found = fmt::format("{} MB are free for {}{}.", bytes / megabyte, directory,
                                           countsFiles ? fmt::format(", and {} files", space.f_favail) : "");

@@ -64,7 +64,7 @@ class FrontChecks {
 
 /// The kernel's clock: `state` and `clock` are adjtimex()'s result and data.
 [[nodiscard]] Diagnosis clockCheck(int state, const timex& clock);
-/// The space that is left for a directory.
-[[nodiscard]] Diagnosis spaceCheck(const std::string& directory, const struct statvfs& space);
+/// The space that is left for a directory; `name` is the check's.
+[[nodiscard]] Diagnosis spaceCheck(const std::string& name, const std::string& directory, const struct statvfs& space);
 
 }  // namespace adminhost

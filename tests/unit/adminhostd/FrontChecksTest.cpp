@@ -159,19 +159,19 @@ TEST(SpaceCheck, LittleSpaceIsAWarningAndNoneAFailure) {
     space.f_files = 1'000'000;
     space.f_favail = 500'000;
     space.f_bavail = 1'000'000;
-    EXPECT_EQ(spaceCheck("/var/x", space).health, Health::ok);
-    EXPECT_EQ(spaceCheck("/var/x", space).found, "4096 MB are free for /var/x, and 500000 files.");
+    EXPECT_EQ(spaceCheck("space", "/var/x", space).health, Health::ok);
+    EXPECT_EQ(spaceCheck("space", "/var/x", space).found, "4096 MB are free for /var/x, and 500000 files.");
     space.f_bavail = 20'000;
-    EXPECT_EQ(spaceCheck("/var/x", space).health, Health::warning);
+    EXPECT_EQ(spaceCheck("space", "/var/x", space).health, Health::warning);
     space.f_bavail = 100;
-    EXPECT_EQ(spaceCheck("/var/x", space).health, Health::failure);
+    EXPECT_EQ(spaceCheck("space", "/var/x", space).health, Health::failure);
     space.f_bavail = 1'000'000;
     space.f_favail = 10;
-    EXPECT_EQ(spaceCheck("/var/x", space).health, Health::warning);
+    EXPECT_EQ(spaceCheck("space", "/var/x", space).health, Health::warning);
     space.f_favail = 0;
-    EXPECT_EQ(spaceCheck("/var/x", space).health, Health::failure);
+    EXPECT_EQ(spaceCheck("space", "/var/x", space).health, Health::failure);
     space.f_files = 0;
-    EXPECT_EQ(spaceCheck("/var/x", space).health, Health::ok) << "a file system that does not count files";
+    EXPECT_EQ(spaceCheck("space", "/var/x", space).health, Health::ok) << "a file system that does not count files";
 }
 
 }  // namespace
