@@ -134,7 +134,7 @@ ExitStatus whois(const Context& context, Words arguments) {
     const Value answer = context.service.get("/v1/directory?is=" + Connection::escaped(arguments.front()));
     const Array* entries = answer.dictionary() == nullptr ? nullptr : answer.dictionary()->get("entries").array();
     if (entries == nullptr || entries->empty()) {
-        throw usageError("no person or group in the directory has the name or UUID " + arguments.front());
+        throw usageError("user or group not found: " + arguments.front());
     }
     if (context.options.format != Format::text) {
         writeValue(context, *entries, Description());

@@ -313,7 +313,7 @@ std::optional<HttpAnswer> Front::missing(const Target& target) const {
     if (plugin == nullptr) {
         return errorAnswer(
             404, "UNKNOWN_PLUGIN",
-            fmt::format("There is no plug-in \"{}\". Known plug-ins: {}.", target.plugin, namesIn(_hello->plugins)));
+            fmt::format("Plug-in not found: {}. Known plug-ins: {}.", target.plugin, namesIn(_hello->plugins)));
     }
     if (target.kind == Target::Kind::command && elementNamed(plugin->commands, target.command) == nullptr) {
         return errorAnswer(404, "UNKNOWN_COMMAND",

@@ -11,7 +11,7 @@ namespace adminhost {
 namespace {
 
 Error noSuchNodeError(std::string_view node) {
-    return {directory::errorDomain, directory::noSuchNode, fmt::format("there is no directory node {}", node)};
+    return {directory::errorDomain, directory::noSuchNode, fmt::format("directory node not found: {}", node)};
 }
 
 /// All nodes of a session as one.

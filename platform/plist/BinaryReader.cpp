@@ -54,7 +54,7 @@ class BinaryReader {
 
     bool readTrailer() {
         if (_bytes.size() < headerSize + trailerSize + 1 || !_bytes.starts_with("bplist00")) {
-            fail(0, "no binary property list of version 00");
+            fail(0, "not a binary property list of version 00");
             return false;
         }
         const std::size_t trailer = _bytes.size() - trailerSize;
@@ -209,7 +209,7 @@ class BinaryReader {
             }
             const std::uint8_t marker = byteAt(at + 1);
             if (marker < 0x10 || marker > 0x13) {
-                return fail(at + 1, "a count that is no integer");
+                return fail(at + 1, "a count that is not an integer");
             }
             const std::size_t size = std::size_t{1} << (marker & 0x0FU);
             if (!holds(at + 1, size)) {
@@ -298,7 +298,7 @@ class BinaryReader {
                 return std::nullopt;
             }
             if (key->string() == nullptr) {
-                return fail(at, "a key that is no text");
+                return fail(at, "a key that is not a text");
             }
             const auto target = reference(values + i * _referenceSize);
             auto value = target ? countedObject(*target, depth + 1) : std::nullopt;

@@ -327,7 +327,7 @@ class XmlReader {
         }
         if (!value) {
             // Without the text itself: a list may hold values that must not appear in an error message.
-            return fail(fmt::format("this text is no <{}>", nameOf(element)));
+            return fail(fmt::format("this text is not a valid <{}>", nameOf(element)));
         }
         store(std::move(*value));
     }

@@ -185,9 +185,9 @@ TEST(BinaryReader, TextsOfBothKinds) {
 TEST(BinaryReader, CountsOfTheirOwnMayHaveEightBytes) {
     EXPECT_EQ(valueOf(binary({"\x5F\x10\x02"s + "ab"})), Value("ab"));
     EXPECT_EQ(valueOf(binary({"\x5F\x13"s + bigEndian(2, 8) + "ab"})), Value("ab"));
-    EXPECT_EQ(errorOf(binary({"\x5F\x51"s + "ab"})), "byte 9: a count that is no integer");
+    EXPECT_EQ(errorOf(binary({"\x5F\x51"s + "ab"})), "byte 9: a count that is not an integer");
     EXPECT_EQ(errorOf(binary({"\x5F\x14"s + bigEndian(0, 8) + bigEndian(2, 8) + "ab"})),
-              "byte 9: a count that is no integer");
+              "byte 9: a count that is not an integer");
 }
 
 TEST(BinaryReader, ObjectsThatReachBeyondTheOthersAreRefused) {
@@ -264,7 +264,7 @@ TEST(BinaryReader, ReferencesAndOffsetsToNothingAreRefused) {
 }
 
 TEST(BinaryReader, KeysAreTextsThatStandOnce) {
-    EXPECT_EQ(errorOf(binary({"\xD1\x01\x01"s, "\x10\x01"s})), "byte 8: a key that is no text");
+    EXPECT_EQ(errorOf(binary({"\xD1\x01\x01"s, "\x10\x01"s})), "byte 8: a key that is not a text");
     EXPECT_EQ(errorOf(binary({"\xD2\x01\x01\x01\x01"s, "\x51k"s})), "byte 8: a key that occurs twice");
 }
 
@@ -273,8 +273,8 @@ TEST(BinaryReader, WideReferencesAreRead) {
 }
 
 TEST(BinaryReader, TrailerThatDoesNotFitIsRefused) {
-    EXPECT_EQ(errorOf("bplist00"), "byte 0: no binary property list of version 00");
-    EXPECT_EQ(errorOf("bplist01" + binary({"\x51x"}).substr(8)), "byte 0: no binary property list of version 00");
+    EXPECT_EQ(errorOf("bplist00"), "byte 0: not a binary property list of version 00");
+    EXPECT_EQ(errorOf("bplist01" + binary({"\x51x"}).substr(8)), "byte 0: not a binary property list of version 00");
     const std::string good = binary({"\x51x"});
     const std::size_t trailer = good.size() - 32;
     const auto changed = [&](std::size_t at, char byte) {

@@ -269,8 +269,8 @@ TEST(XmlReader, TextBetweenElementsIsRefused) {
 }
 
 TEST(XmlReader, BooleansAreEmpty) {
-    EXPECT_EQ(errorOf("<plist><true>1</true></plist>"), "line 1, column 15: this text is no <true>");
-    EXPECT_EQ(errorOf("<plist><false> </false></plist>"), "line 1, column 16: this text is no <false>");
+    EXPECT_EQ(errorOf("<plist><true>1</true></plist>"), "line 1, column 15: this text is not a valid <true>");
+    EXPECT_EQ(errorOf("<plist><false> </false></plist>"), "line 1, column 16: this text is not a valid <false>");
 }
 
 TEST(XmlReader, IntegersSpanTheSignedAndTheUnsignedRange) {
@@ -279,16 +279,17 @@ TEST(XmlReader, IntegersSpanTheSignedAndTheUnsignedRange) {
     EXPECT_EQ(valueOf(plist("<integer>9223372036854775807</integer>")), Value(INT64_MAX));
     EXPECT_EQ(valueOf(plist("<integer>9223372036854775808</integer>")), Value(9223372036854775808U));
     EXPECT_EQ(errorOf(plist("<integer>-9223372036854775809</integer>")),
-              "line 1, column 51: this text is no <integer>");
+              "line 1, column 51: this text is not a valid <integer>");
     EXPECT_EQ(errorOf(plist("<integer>18446744073709551616</integer>")),
-              "line 1, column 51: this text is no <integer>");
+              "line 1, column 51: this text is not a valid <integer>");
 }
 
 TEST(XmlReader, IntegersAreDecimalWithASignAndWhiteSpaceAround) {
     EXPECT_EQ(valueOf(plist("<integer>\n +007 </integer>")), Value(7));
     EXPECT_EQ(valueOf(plist("<integer>-0</integer>")), Value(0));
     for (const char* text : {"", " ", "12x", "0x10", "1.0", "1 2", "+-1", "--1", "+", "-", "1e3", "\u0661"}) {
-        EXPECT_THAT(errorOf(plist("<integer>"s + text + "</integer>")), testing::EndsWith("is no <integer>")) << text;
+        EXPECT_THAT(errorOf(plist("<integer>"s + text + "</integer>")), testing::EndsWith("is not a valid <integer>"))
+            << text;
     }
 }
 
@@ -300,7 +301,7 @@ TEST(XmlReader, Reals) {
     EXPECT_TRUE(std::isnan(valueOf(plist("<real>nan</real>")).real().value_or(0)));
     EXPECT_EQ(valueOf(plist("<real>4.9406564584124654e-324</real>")), Value(4.9406564584124654e-324));
     for (const char* text : {"", "abc", "1,5", "1.5x", "0x1p3", "nan(1)", "1e999", "+-1", "1 2"}) {
-        EXPECT_THAT(errorOf(plist("<real>"s + text + "</real>")), testing::EndsWith("is no <real>")) << text;
+        EXPECT_THAT(errorOf(plist("<real>"s + text + "</real>")), testing::EndsWith("is not a valid <real>")) << text;
     }
 }
 
@@ -313,7 +314,7 @@ TEST(XmlReader, DatesAreOfTheCalendar) {
           "2026-01-00T00:00:00Z", "2026-01-01T24:00:00Z", "2026-01-01T00:60:00Z", "2026-01-01T00:00:60Z",
           "2026-01-01T00:00:00", "2026-01-01T00:00:00+01:00", "2026-01-01 00:00:00Z", "2026-1-1T00:00:00Z",
           "12026-01-01T00:00:00Z", "2026-01-01T00:00:00.5Z", "2026-01-01T00:00:00z"}) {
-        EXPECT_THAT(errorOf(plist("<date>"s + text + "</date>")), testing::EndsWith("is no <date>")) << text;
+        EXPECT_THAT(errorOf(plist("<date>"s + text + "</date>")), testing::EndsWith("is not a valid <date>")) << text;
     }
 }
 
@@ -323,7 +324,7 @@ TEST(XmlReader, DataIsPaddedBase64WithWhiteSpace) {
     EXPECT_EQ(valueOf(plist("<data>+/8=</data>")), Value(Data{0xFB, 0xFF}));
     for (const char* text : {"Z", "Zm", "Zm9", "Zm9v=", "Zg=", "Zg===", "=", "====", "Zg==Zg==", "Zm9-",
                              "Zh==", "Zm9vYmF=", "Z===", "Zg=a"}) {
-        EXPECT_THAT(errorOf(plist("<data>"s + text + "</data>")), testing::EndsWith("is no <data>")) << text;
+        EXPECT_THAT(errorOf(plist("<data>"s + text + "</data>")), testing::EndsWith("is not a valid <data>")) << text;
     }
 }
 
