@@ -1,2 +1,1 @@
 set(TEST_LIBS adminhostctl_desired commands)
-set(TEST_ENVIRONMENT "TZ=Europe/Berlin")
