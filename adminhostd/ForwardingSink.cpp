@@ -57,6 +57,7 @@ void ForwardingSink::becomesSecret(const SecretPart& part) {
     if (_former) {
         _former->hide(part);
     }
+    send(_descriptor, part);
 }
 
 void ForwardingSink::notDone(NotDone part) {

@@ -28,7 +28,8 @@ enum class FrameType : std::uint32_t {
     answer,
     diagnose,
     readLog,
-    last = readLog,
+    secretPart,
+    last = secretPart,
 };
 
 constexpr std::size_t frameMaximum = std::size_t{128} << 20U;  ///< bytes of payload and bytes together

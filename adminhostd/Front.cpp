@@ -224,11 +224,12 @@ BodyForm wantedForm(const Exchange& exchange) {
 Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks)
     : _checks(std::move(checks)),
       _refused(std::move(refused)),
-      _queue(std::move(settings), {[this](protocol::Hello hello) { welcome(std::move(hello)); },
-                                   [](const std::string& event) { logEvent(event); },
-                                   [this](const Operation& operation, OperationQueue::Ending ending) {
-                                       finished(operation, std::move(ending));
-                                   }}) {}
+      _queue(std::move(settings),
+             {[this](protocol::Hello hello) { welcome(std::move(hello)); },
+              [](const std::string& event) { logEvent(event); }, [this](const SecretPart& part) { _log.hide(part); },
+              [this](const Operation& operation, OperationQueue::Ending ending) {
+                  finished(operation, std::move(ending));
+              }}) {}
 
 std::vector<protocol::RefusedPlugin> Front::refusedPlugins() const {
     std::vector<protocol::RefusedPlugin> refused = _refused;

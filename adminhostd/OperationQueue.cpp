@@ -180,6 +180,13 @@ bool OperationQueue::take(const NotDone& part) {
     return _running.has_value();
 }
 
+bool OperationQueue::take(const SecretPart& part) {
+    if (_running) {
+        _events.becomesSecret(part);
+    }
+    return _running.has_value();
+}
+
 bool OperationQueue::take(protocol::Hello hello) {
     if (_state != State::starting) {
         return false;

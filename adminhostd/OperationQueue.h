@@ -64,6 +64,7 @@ class OperationQueue {
     struct Events {
         std::function<void(protocol::Hello)> hello;
         std::function<void(const std::string&)> log;  ///< an event of the plug-ins or of the queue, for the system log
+        std::function<void(const SecretPart&)> becomesSecret;  ///< reported by the running operation
         std::function<void(const Operation&, Ending)> finished;
     };
 
@@ -107,6 +108,7 @@ class OperationQueue {
     bool take(const protocol::Log& log);
     bool take(const Change& change);
     bool take(const NotDone& part);
+    bool take(const SecretPart& part);
     bool take(protocol::Answer answer);
     void endWorker(const std::string& why);
     void workerEnded(const std::string& how);

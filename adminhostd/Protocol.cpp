@@ -124,6 +124,10 @@ constexpr auto members<NotDone> = std::tuple(member("notDone.keyPath", &NotDone:
                                              member("notDone.reason", &NotDone::reason),
                                              member("notDone.toolMessage", &NotDone::toolMessage));
 template <>
+constexpr auto members<SecretPart> = std::tuple(member("secretPart.section", &SecretPart::section),
+                                                member("secretPart.identity", &SecretPart::identity),
+                                                member("secretPart.key", &SecretPart::key));
+template <>
 constexpr auto members<Finding> = std::tuple(member("finding.keyPath", &Finding::keyPath),
                                              member("finding.rule", &Finding::rule),
                                              member("finding.advice", &Finding::advice));
@@ -458,6 +462,8 @@ template <>
 constexpr FrameType typeOf<Change> = FrameType::change;
 template <>
 constexpr FrameType typeOf<NotDone> = FrameType::notDone;
+template <>
+constexpr FrameType typeOf<SecretPart> = FrameType::secretPart;
 template <>
 constexpr FrameType typeOf<Answer> = FrameType::answer;
 

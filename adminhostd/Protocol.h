@@ -143,8 +143,8 @@ struct Hello {
     bool operator==(const Hello&) const = default;
 };
 
-/// One event for the system log. Log, Change and NotDone are sent when they happen; while an operation runs they belong
-/// to it.
+/// One event for the system log. Log, Change, NotDone and SecretPart are sent when they happen; while an operation runs
+/// they belong to it.
 struct Log {
     std::string event;
     bool operator==(const Log&) const = default;
@@ -163,7 +163,7 @@ struct Answer {
     bool operator==(const Answer&) const = default;
 };
 
-using ToFront = std::variant<Hello, Log, Change, NotDone, Answer>;
+using ToFront = std::variant<Hello, Log, Change, NotDone, SecretPart, Answer>;
 
 [[nodiscard]] Frame frameOf(ToWorker message);
 [[nodiscard]] Frame frameOf(ToFront message);

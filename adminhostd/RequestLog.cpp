@@ -48,6 +48,19 @@ void RequestRecord::add(const NotDone& part) {
     keep(_notDone, Dictionary{{"keyPath", part.keyPath}, {"reason", part.reason}, {"toolMessage", part.toolMessage}});
 }
 
+void RequestRecord::hide(const SecretPart& part) {
+    for (Value& value : _changes.kept) {
+        Dictionary& change = *value.dictionary();
+        if (!part.identity.empty() && change.get("section") == Value(part.section) &&
+            change.get("identity") == Value(part.identity) && change.get("key") == Value(part.key)) {
+            for (const char* key : {"from", "to", "undo"}) {
+                change.set(key, Value());
+            }
+            change.set("secret", true);
+        }
+    }
+}
+
 void RequestRecord::keep(Reports& reports, Dictionary report) {
     ++reports.reported;
     std::string bytes;
@@ -123,6 +136,12 @@ const RequestRecord* RequestLog::find(std::string_view id) const {
     const auto found =
         std::find_if(_records.begin(), _records.end(), [&](const auto& record) { return sameId(record->id, id); });
     return found == _records.end() ? nullptr : found->get();
+}
+
+void RequestLog::hide(const SecretPart& part) {
+    for (const auto& record : _records) {
+        record->hide(part);
+    }
 }
 
 bool RequestLog::use(std::string_view id) {

@@ -44,6 +44,8 @@ struct RequestRecord {
     void add(std::string_view event);
     void add(const Change& change);
     void add(const NotDone& part);
+    /// Withholds the values of kept changes of this part.
+    void hide(const SecretPart& part);
 
     /// The number of reports, including those that were not kept.
     [[nodiscard]] std::size_t changes() const noexcept { return _changes.reported; }
@@ -83,6 +85,9 @@ class RequestLog {
     void add(std::shared_ptr<RequestRecord> record);
     /// Finds a record by its id; upper and lower case are equal.
     [[nodiscard]] const RequestRecord* find(std::string_view id) const;
+
+    /// Withholds the values of this part, which becomes a secret, in all records.
+    void hide(const SecretPart& part);
 
     /// Marks a client's id as used. Returns false if it was used already.
     [[nodiscard]] bool use(std::string_view id);

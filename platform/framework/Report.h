@@ -63,9 +63,9 @@ class ADMINHOST_EXPORT ReportSink {
 ADMINHOST_EXPORT void setReportSink(ReportSink* sink) noexcept;
 ADMINHOST_EXPORT void reportChange(Change change);
 ADMINHOST_EXPORT void reportNotDone(NotDone part);
-/// Announces that the value is about to become a secret. Its former values are hidden before this returns, so that none
-/// stays readable if the process is killed between the change and its report. They stay hidden if the change then
-/// fails.
+/// Announces that the value is about to become a secret. Its former values in the history are hidden before this
+/// returns, so that none stays readable if the process is killed between the change and its report. They stay hidden if
+/// the change then fails.
 ADMINHOST_EXPORT void announceSecret(const SecretPart& part);
 
 }  // namespace adminhost

@@ -95,8 +95,10 @@ TEST_F(Settings, TwoWritersComeOneAfterTheOtherAndNothingIsMixed) {
                 R"({"configuration":{"server_host":"one","tunnel_server_host":"one"}})");
     second.begin("POST", "/v1/lumio/writeSettings",
                  R"({"configuration":{"server_host":"two","tunnel_server_host":"two"}})");
-    EXPECT_EQ(first.reply().status, 200);
-    EXPECT_EQ(second.reply().status, 200);
+    for (test::UnixHttp* writer : {&first, &second}) {
+        const HttpReply reply = writer->reply();
+        EXPECT_EQ(reply.status, 200) << reply.body << daemon.log();
+    }
     const Value read = valueOf(post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})"));
     const Dictionary& config = *read.dictionary()->get("configuration").dictionary();
     EXPECT_EQ(config.get("server_host"), config.get("tunnel_server_host"));
@@ -457,7 +459,12 @@ TEST_F(Settings, PropertyThatWasProtectedByAKilledWorkerLeavesNoPlainValueInTheH
     ASSERT_EQ(change(R"({"_newid_":true,"name":"key","value":"planted-one"})"), 200);
     const std::string id = root.sql("select id from properties where name='key'");
     const std::string entry = R"({"_id_":")" + id.substr(0, id.find('\n')) + R"(",)";
-    ASSERT_EQ(change(entry + R"("value":"planted-two"})"), 200);
+    const std::string record = "/v1/requests/6ba7b810-9dad-11d1-80b4-00c04fd430c8";
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"properties":[)" + entry + R"("value":"planted-two"}]}})",
+                   {"Request-Id: 6ba7b810-9dad-11d1-80b4-00c04fd430c8"})
+                  .status,
+              200);
+    ASSERT_THAT(daemon.connect().get(record).body, HasSubstr("planted-two"));
     ASSERT_THAT(daemon.connect().get("/v1/lumio/history").body, HasSubstr("planted-two"));
     // The statement is carried out, and the worker does not live to report it.
     root.write("/usr/bin/sqlite3",
@@ -466,6 +473,7 @@ TEST_F(Settings, PropertyThatWasProtectedByAKilledWorkerLeavesNoPlainValueInTheH
     EXPECT_EQ(change(entry + R"("protect":true})"), 500);
     EXPECT_EQ(root.sql("select protect from properties where name='key'"), "t\n");
     EXPECT_THAT(daemon.connect().get("/v1/lumio/history").body, Not(HasSubstr("planted-")));
+    EXPECT_THAT(daemon.connect().get(record).body, Not(HasSubstr("planted-")));
 }
 
 TEST_F(Settings, RemovalOfAPropertyThatDoesNotExistIsNotShownAsCertain) {

@@ -60,6 +60,9 @@ TEST_F(Forwarding, FormerValueIsHiddenBeforeTheFrontIsSentTheSecretChange) {
     reportChange(changeOf("3", nullptr, true));
     EXPECT_EQ(formerValue(), Value("(secret)")) << "although the worker may die before its operation ends";
     for (const char* const identity : {"4", "3"}) {
+        const auto part = received();
+        ASSERT_TRUE(part && std::holds_alternative<SecretPart>(*part)) << "the front hides it too";
+        EXPECT_EQ(std::get<SecretPart>(*part), (SecretPart{"properties", identity, "value"}));
         const auto message = received();
         ASSERT_TRUE(message && std::holds_alternative<Change>(*message));
         EXPECT_EQ(std::get<Change>(*message).identity, identity);

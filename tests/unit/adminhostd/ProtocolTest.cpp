@@ -105,7 +105,8 @@ std::vector<ToFront> messagesToFront() {
         Log{"an event"},
         Change{"cameras", "U", "Studio", "users", Value(1), Value("b"), true, Dictionary{{"k", 1}}, true},
         Change{"settings", "", "", "k", {}, {}, false, {}},
-        NotDone{"configuration.a", "why", "words"}};
+        NotDone{"configuration.a", "why", "words"},
+        SecretPart{"properties", "3", "value"}};
     for (const Outcome outcome : outcomes()) {
         messages.emplace_back(answer(outcome));
     }

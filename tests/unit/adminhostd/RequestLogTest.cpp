@@ -38,6 +38,30 @@ TEST(RequestRecord, LargeReportsAreCountedOnlyBeyondTheirBound) {
     EXPECT_LE(record.reportBytes(), RequestRecord::reportBytesMaximum);
 }
 
+TEST(RequestLog, ValuesOfAPartThatBecomesSecretAreWithheldInEveryRecord) {
+    RequestLog log;
+    for (const char* id : {"a", "b"}) {
+        auto record = std::make_shared<RequestRecord>();
+        record->id = id;
+        record->add(Change{"properties", "3", "n", "value", "one", "two", false, Dictionary{{"value", "one"}}});
+        record->add(Change{"properties", "3", "n", "name", "one", "two", false, Dictionary{{"name", "one"}}});
+        record->add(Change{"settings", "", "", "value", "one", "two", false, {}});
+        log.add(std::move(record));
+    }
+    log.hide({"properties", "3", "value"});
+    log.hide({"settings", "", "value"});
+    for (const char* id : {"a", "b"}) {
+        const Array changes = *log.find(id)->describe(true).get("changes").array();
+        for (const char* key : {"from", "to", "undo"}) {
+            EXPECT_TRUE(changes[0].dictionary()->get(key).isNull()) << key;
+            EXPECT_EQ(changes[1].dictionary()->get(key).isNull(), false) << "another part's " << key;
+        }
+        EXPECT_EQ(changes[0].dictionary()->get("secret"), Value(true));
+        EXPECT_EQ(changes[1].dictionary()->get("secret"), Value(false));
+        EXPECT_EQ(changes[2].dictionary()->get("from"), Value("one")) << "only elements are hidden, by their identity";
+    }
+}
+
 std::shared_ptr<RequestRecord> recordNamed(const std::string& id) {
     auto record = std::make_shared<RequestRecord>();
     record->id = id;
