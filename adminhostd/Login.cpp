@@ -29,7 +29,7 @@ std::string accountText(uid_t uid) {
 
 uid_t loginOf(pid_t pid, uid_t uid) noexcept {
     std::array<char, 32> path{};
-    std::snprintf(path.data(), path.size(), "/proc/%d/loginuid", static_cast<int>(pid));
+    static_cast<void>(std::snprintf(path.data(), path.size(), "/proc/%d/loginuid", static_cast<int>(pid)));
     const FileDescriptor file(::open(path.data(), O_RDONLY | O_CLOEXEC));
     struct stat status {};
     if (!file.isOpen() || ::fstat(file.get(), &status) != 0 || (status.st_uid != uid && status.st_uid != 0)) {

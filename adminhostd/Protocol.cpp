@@ -524,6 +524,7 @@ Result<std::variant<Ts...>> decodedLike(Frame& frame, const std::variant<Ts...>*
 
 std::vector<Outcome> outcomes() {
     std::vector<Outcome> all;
+    all.reserve(outcomeWords.size());
     for (const auto& word : outcomeWords) {
         all.push_back(word.value);
     }
