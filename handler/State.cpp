@@ -9,11 +9,12 @@
 #include "platform/task/Task.h"
 #include "platform/value/ValueText.h"
 #include "resources/Camera.h"
+#include "resources/CountStatement.h"
 
 #include <charconv>
 #include <cmath>
-#include <cstdlib>
 #include <string>
+#include <vector>
 
 namespace lumio {
 
@@ -62,15 +63,14 @@ std::int32_t control(std::string_view verb) {
     return status;
 }
 
-/// The number in the last row of the result; 0 without a row.
-std::uint64_t jobCount(const std::string& statement, std::string_view what) {
-    std::optional<Error> error;
-    const auto rows = Camera::querySorvaneDatabase<Dictionary>(statement, error);
-    if (error) {
-        adminhost::logEvent("adminhost_lumio: error getting " + std::string(what) + " jobs count: " + textOf(*error));
-    }
-    const std::string* number = rows && !rows->empty() ? rows->back().get("count(*)").string() : nullptr;
-    return number == nullptr ? 0 : static_cast<std::uint64_t>(std::strtoll(number->c_str(), nullptr, 10));
+CountStatement runningJobs() {
+    return {"select count(*) from jobs where nimbo_job_status=\"Running\";",
+            "adminhost_lumio: error getting running jobs count: "};
+}
+
+CountStatement totalJobs() {
+    return {"select count(*) from jobs where nimbo_job_id is not NULL",
+            "adminhost_lumio: error getting total jobs count: "};
 }
 
 template <class Number>
@@ -128,11 +128,14 @@ Response LumioRequestHandler::getStateWithRequest(const Dictionary& request) {
                                             : getStateOfSharedFileSystemPath(path, username));
     answer.set("nimboControllerState", getStateOfNimboController(controller, username, password));
     if (dbPathExists()) {
-        answer.set("totalCameras", Camera::getTotalCameraCount());
-        answer.set("onlineCameras", Camera::getOnlineCameraCount());
-        answer.set("capturingCameras", Camera::getRunningCameraCount());
-        answer.set("currentJobs", getRunningJobs());
-        answer.set("totalJobs", getTotalJobs());
+        std::vector<CountStatement> counts = Camera::counts();
+        counts.push_back(runningJobs());
+        counts.push_back(totalJobs());
+        const std::vector<std::uint64_t> numbers = rowCounts(counts);
+        auto number = numbers.begin();
+        for (const char* key : {"totalCameras", "onlineCameras", "capturingCameras", "currentJobs", "totalJobs"}) {
+            answer.set(key, *number++);
+        }
     }
     return answer;
 }
@@ -166,11 +169,11 @@ std::optional<adminhost::Date> LumioRequestHandler::getStartTime() {
 }
 
 std::uint64_t LumioRequestHandler::getTotalJobs() {
-    return jobCount("select count(*) from jobs where nimbo_job_id is not NULL", "total");
+    return rowCounts({totalJobs()}).front();
 }
 
 std::uint64_t LumioRequestHandler::getRunningJobs() {
-    return jobCount("select count(*) from jobs where nimbo_job_status=\"Running\";", "running");
+    return rowCounts({runningJobs()}).front();
 }
 
 Response LumioRequestHandler::getLogPathsWithRequest(const Dictionary&) {

@@ -6,27 +6,12 @@
 #include "resources/ToolWords.h"
 #include "settings/SettingsStore.h"
 
-#include <cstdlib>
-
 namespace lumio {
 
 using adminhost::Dictionary;
 using adminhost::Error;
 
 namespace {
-
-std::uint64_t count(const std::string& statement, std::string_view what) {
-    std::optional<Error> error;
-    const auto rows = Camera::querySorvaneDatabase<Dictionary>(statement, error);
-    if (error) {
-        adminhost::logEvent(std::string("Error getting ").append(what) + " camera count: " + textOf(*error));
-    }
-    if (!rows || rows->empty()) {
-        return 0;
-    }
-    const std::string* number = rows->back().get("count(*)").string();
-    return number == nullptr ? 0 : static_cast<std::uint64_t>(std::strtoll(number->c_str(), nullptr, 10));
-}
 
 std::string joined(const std::vector<std::string>& words) {
     std::string text;
@@ -81,22 +66,27 @@ std::optional<Error> Camera::delete_() {
     return std::nullopt;
 }
 
+std::vector<CountStatement> Camera::counts() {
+    return {{"select count(*) from cameras where (disabled != 't' OR disabled is NULL);",
+             "Error getting total camera count: "},
+            {"select count(*) from cameras where ((recording_status!=\"offline\") AND (disabled != 't' OR disabled is "
+             "NULL));",
+             "Error getting online camera count: "},
+            {"select count(*) from cameras where ((recording_status like \"capturing%\" OR "
+             "recording_status=\"paused\") AND (disabled != 't' OR disabled is NULL));",
+             "Error getting running camera count: "}};
+}
+
 std::uint64_t Camera::getTotalCameraCount() {
-    return count("select count(*) from cameras where (disabled != 't' OR disabled is NULL);", "total");
+    return rowCounts({counts().at(0)}).front();
 }
 
 std::uint64_t Camera::getOnlineCameraCount() {
-    return count(
-        "select count(*) from cameras where ((recording_status!=\"offline\") AND (disabled != 't' OR disabled is "
-        "NULL));",
-        "online");
+    return rowCounts({counts().at(1)}).front();
 }
 
 std::uint64_t Camera::getRunningCameraCount() {
-    return count(
-        "select count(*) from cameras where ((recording_status like \"capturing%\" OR recording_status=\"paused\") AND "
-        "(disabled != 't' OR disabled is NULL));",
-        "running");
+    return rowCounts({counts().at(2)}).front();
 }
 
 }  // namespace lumio
