@@ -330,6 +330,8 @@ TEST_F(Workflows, AnInformationFileThatIsNoFileOrTooLargeCountsAsMissing) {
     whole.resize(Workflow::informationMaximumSize, ' ');
     root.write(std::string(shared) + "/A/Contents/Info.plist", whole);
     EXPECT_EQ(texts(), texts("n", "", ""));
+    root.write(std::string(shared) + "/A/Contents/Info.plist", whole + ' ');
+    EXPECT_EQ(texts(), texts("", "", "")) << "one byte more";
 }
 
 TEST_F(Workflows, AnInformationFileThatIsCutAnywhereCountsAsMissing) {
