@@ -225,7 +225,8 @@ class LocalAccountsNode : public DirectoryNode {
 
 }  // namespace
 
-DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile, std::string kerberosRealm, std::string name) {
+DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile, std::string kerberosRealm,
+                                  const std::string& name) {
     auto files = std::make_shared<AccountFiles>(std::move(uuidFile));
     return {name, [files, realm = std::move(kerberosRealm), name] {
                 return std::make_unique<LocalAccountsNode>(files, realm, name);

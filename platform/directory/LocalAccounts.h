@@ -22,8 +22,8 @@ inline constexpr std::string_view localAccountsNodeName = "/Local";
 /// not change. With a file of UUIDs ("user:NAME UUID" or "group:NAME UUID" on each line), an account has the UUID in
 /// that file or none, and a query fails if the file cannot be read. Without such a file, accounts have name-based
 /// UUIDs. With a Kerberos realm, each user has the authentication authority of the principal NAME@REALM.
-[[nodiscard]] ADMINHOST_EXPORT DirectoryNodeSource localAccounts(std::optional<HostPath> uuidFile = std::nullopt,
-                                                                 std::string kerberosRealm = {},
-                                                                 std::string name = std::string(localAccountsNodeName));
+[[nodiscard]] ADMINHOST_EXPORT DirectoryNodeSource
+localAccounts(std::optional<HostPath> uuidFile = std::nullopt, std::string kerberosRealm = {},
+              const std::string& name = std::string(localAccountsNodeName));
 
 }  // namespace adminhost
