@@ -19,7 +19,6 @@
 namespace lumio {
 
 using adminhost::Dictionary;
-using adminhost::Error;
 using adminhost::HostPath;
 using adminhost::Response;
 using adminhost::Value;
