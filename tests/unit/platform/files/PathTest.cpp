@@ -96,27 +96,27 @@ TEST_F(Path, PlaceBelowTheSystemRootIsKnownAfterAllLinks) {
     namespace fs = std::filesystem;
     std::string place = fs::temp_directory_path() / "path-XXXXXX";
     ASSERT_NE(::mkdtemp(place.data()), nullptr);
-    fs::create_directories(place + "/root/inner");
-    fs::create_directories(place + "/rooted");
-    fs::create_directory_symlink(place + "/root", place + "/link");
-    fs::create_directory_symlink("../rooted", place + "/root/out");
-    fs::create_directory_symlink(place + "/root/inner", place + "/root/in");
-    ASSERT_EQ(::mkfifo((place + "/root/pipe").c_str(), 0000), 0);
+    fs::create_directories(place + "/top/inner");
+    fs::create_directories(place + "/topped");
+    fs::create_directory_symlink(place + "/top", place + "/link");
+    fs::create_directory_symlink("../topped", place + "/top/out");
+    fs::create_directory_symlink(place + "/top/inner", place + "/top/in");
+    ASSERT_EQ(::mkfifo((place + "/top/pipe").c_str(), 0000), 0);
     const auto isBelow = [&](const std::string& path) { return isBelowSystemRoot(DiskPath(place + path)); };
-    for (const std::string& root : {place + "/root", place + "/link"}) {
+    for (const std::string& root : {place + "/top", place + "/link"}) {
         setSystemRoot(root);
-        EXPECT_TRUE(isBelow("/root"));
-        EXPECT_TRUE(isBelow("/root/inner"));
-        EXPECT_TRUE(isBelow("/root/in"));
-        EXPECT_TRUE(isBelow("/root/pipe")) << "it is not opened";
-        EXPECT_FALSE(isBelow("/root/out"));
-        EXPECT_FALSE(isBelow("/root/missing"));
-        EXPECT_FALSE(isBelow("/rooted"));
-        EXPECT_FALSE(isBelow("/root/inner/../.."));
-        EXPECT_FALSE(isBelow("/root" + std::string("\0x", 2)));
+        EXPECT_TRUE(isBelow("/top"));
+        EXPECT_TRUE(isBelow("/top/inner"));
+        EXPECT_TRUE(isBelow("/top/in"));
+        EXPECT_TRUE(isBelow("/top/pipe")) << "it is not opened";
+        EXPECT_FALSE(isBelow("/top/out"));
+        EXPECT_FALSE(isBelow("/top/missing"));
+        EXPECT_FALSE(isBelow("/topped"));
+        EXPECT_FALSE(isBelow("/top/inner/../.."));
+        EXPECT_FALSE(isBelow("/top" + std::string("\0x", 2)));
     }
     setSystemRoot("/");
-    EXPECT_TRUE(isBelow("/rooted"));
+    EXPECT_TRUE(isBelow("/topped"));
     EXPECT_FALSE(isBelow("/missing"));
     fs::remove_all(place);
 }
