@@ -39,6 +39,15 @@ TEST(Journey, ShowsTheSameWithThePeopleInAnLdapServer) {
                       ContainsRegex("workflows +Publish to Catalog +in its list, through the group lecturers\n")));
 }
 
+TEST(Journey, ReachesTheGridWithAnAccountThatItCreates) {
+    const ProgramResult demo = runProgram({script, "--full", "--built", BINARY_DIR}, Errors::merge);
+    EXPECT_EQ(demo.status, 0) << demo.output;
+    EXPECT_THAT(demo.output, AllOf(HasSubstr("grid controller: passed\n"),
+                                   ContainsRegex("grid controller +controller.test.example: available\n"),
+                                   HasSubstr("\"nimboControllerState\": \"kNimboAvailable\"")));
+    EXPECT_THAT(demo.output, HasSubstr("The daemon has stopped."));
+}
+
 TEST(Journey, UnknownOptionIsAUsageError) {
     const ProgramResult demo = runProgram({script, "--no-such-option"}, Errors::merge);
     EXPECT_EQ(demo.status, 2);
