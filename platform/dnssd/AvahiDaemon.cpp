@@ -30,7 +30,7 @@ class BusError {
     }
 
   private:
-    sd_bus_error _error = SD_BUS_ERROR_NULL;
+    sd_bus_error _error{};
 };
 
 }  // namespace
