@@ -1,5 +1,6 @@
 #include "adminhostd/Daemon.h"
 
+#include "adminhostd/ClearedStack.h"
 #include "adminhostd/Front.h"
 #include "adminhostd/FrontChecks.h"
 #include "adminhostd/ListeningSocket.h"
@@ -68,6 +69,7 @@ class Daemon {
             _front.queue().run(_entries);
             if (_server) {
                 _server->run();
+                clearUnusedStack();  // of what has been served in this turn
             }
         }
     }

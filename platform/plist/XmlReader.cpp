@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
+#include <cstdlib>
 #include <cstring>
 #include <exception>
 #include <memory>
@@ -16,6 +17,7 @@
 
 #include <expat.h>
 #include <fmt/format.h>
+#include <malloc.h>
 
 namespace adminhost::plist {
 namespace {
@@ -131,10 +133,32 @@ std::optional<Value> dateOf(std::string_view text) {
     return date && hasFourDigitYear(*date) ? std::optional<Value>(*date) : std::nullopt;
 }
 
+// expat's memory holds the text of the list, which may have secrets: it is cleared before it is freed.
+
+void clearAndFree(void* block) {
+    if (block != nullptr) {
+        ::explicit_bzero(block, ::malloc_usable_size(block));
+        std::free(block);
+    }
+}
+
+/// Unlike realloc, leaves no copy behind.
+void* resize(void* block, std::size_t size) {
+    void* const larger = std::malloc(size);
+    if (larger != nullptr && block != nullptr) {
+        std::memcpy(larger, block, std::min(size, ::malloc_usable_size(block)));
+        clearAndFree(block);
+    }
+    return larger;
+}
+
+constexpr XML_Memory_Handling_Suite clearedMemory = {&std::malloc, &resize, &clearAndFree};
+
 class XmlReader {
   public:
     XmlReader(const char* encoding, std::size_t valuesMaximum)
-        : _parser(::XML_ParserCreate(encoding), &::XML_ParserFree), _valuesMaximum(valuesMaximum) {
+        : _parser(::XML_ParserCreate_MM(encoding, &clearedMemory, nullptr), &::XML_ParserFree),
+          _valuesMaximum(valuesMaximum) {
         if (!_parser) {
             throw std::bad_alloc();
         }
