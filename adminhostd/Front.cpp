@@ -219,6 +219,13 @@ BodyForm wantedForm(const Exchange& exchange) {
     return exchange.wantsPropertyList() ? BodyForm::propertyList : BodyForm::json;
 }
 
+HttpAnswer unknownRequest(std::string_view id) {
+    HttpAnswer answer = errorAnswer(
+        404, "UNKNOWN_REQUEST", fmt::format("The request \"{}\" is not among the latest {}.", id, RequestLog::length));
+    answer.body->dictionary()->set("state", "unknown");
+    return answer;
+}
+
 }  // namespace
 
 Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks)
@@ -337,11 +344,7 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target&
         }
     }
     if (target.kind == Kind::request && _log.find(target.command) == nullptr) {
-        HttpAnswer answer = errorAnswer(
-            404, "UNKNOWN_REQUEST",
-            fmt::format("The request \"{}\" is not among the latest {}.", target.command, RequestLog::length));
-        answer.body->dictionary()->set("state", "unknown");
-        return answer;
+        return unknownRequest(target.command);
     }
     const bool post = target.kind == Kind::command;
     const bool allowed = post ? exchange.method() == "POST" : exchange.method() == "GET" || exchange.method() == "HEAD";
@@ -404,6 +407,10 @@ void Front::serve(Exchange& exchange, const Target& target) {
         }
         case Target::Kind::request: {
             const RequestRecord* record = _log.find(target.command);
+            if (record == nullptr) {  // forgotten while the body was being received
+                exchange.answer(unknownRequest(target.command));
+                return;
+            }
             const bool withReports = exchange.peer().uid == record->peer.uid || permitted(exchange.peer());
             exchange.answer({200, record->describe(withReports), {}});
             return;

@@ -224,6 +224,8 @@ void LdapConnection::explain(Error& error) const {
     // Connects once more to see the certificate. Nothing is sent on this connection.
     LdapNodeSettings settings = _settings;
     settings.verify = LdapNodeSettings::Verify::never;
+    settings.certFile.reset();  // not for a server that is not trusted
+    settings.keyFile.reset();
     LdapConnection unverified(settings, _uri);
     unverified._openEnd = _waitLimit.end();
     berval certificate{};

@@ -11,6 +11,7 @@ Result<std::vector<DirectoryRecord>> LdapLookUps::records(const DirectoryQuery& 
 }
 
 Result<void> LdapLookUps::reach(std::chrono::milliseconds limit) {
+    _kept.reset();  // that it was good earlier proves nothing
     return open(Clock::now() + limit);
 }
 

@@ -71,7 +71,7 @@ std::optional<ProcessStatus> statusOf(pid_t pid) {
     if (!ticks) {
         return std::nullopt;
     }
-    status.started = nanoseconds(std::chrono::seconds(*ticks)) / ::sysconf(_SC_CLK_TCK);
+    status.started = nanoseconds(std::chrono::seconds(1)) / ::sysconf(_SC_CLK_TCK) * *ticks;
     return status;
 }
 

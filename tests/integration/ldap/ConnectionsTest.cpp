@@ -511,5 +511,16 @@ TEST_F(LdapConnections, UnreachableNodesAreNamedWithinTheLimitForAllTogether) {
     EXPECT_THAT(unreachable[1].reason, HasSubstr("Can't contact LDAP server"));
 }
 
+TEST_F(LdapConnections, NodeWithAKeptConnectionIsUnreachableWhenItsServerHasEnded) {
+    support::Slapd server;
+    server.add(people());
+    const DirectoryNodeSource source = ldapNode(settingsFor(server));
+    const SessionWith session({source});
+    EXPECT_THAT(namesOf(ask(source, anna())), ElementsAre("anna"));
+    EXPECT_THAT(unreachableDirectoryNodes(milliseconds(2000)), IsEmpty());
+    server.stop();
+    EXPECT_THAT(unreachableDirectoryNodes(milliseconds(2000)), SizeIs(1));
+}
+
 }  // namespace
 }  // namespace adminhost

@@ -146,6 +146,18 @@ TEST_F(RequestIds, OneInAMalformedHeadIsNotUsedUp) {
     EXPECT_EQ(client.post("/v1/fixture/nothing", "{}", {"Request-Id: " + id}).status, 204);
 }
 
+TEST_F(RequestIds, RecordThatIsForgottenBeforeTheBodyEndsIsUnknown) {
+    EXPECT_EQ(client.post("/v1/fixture/nothing", "{}", {"Request-Id: " + id}).status, 204);
+    UnixHttp slow = daemon.connect();
+    slow.send("GET /v1/requests/" + id + " HTTP/1.1\r\nHost: x\r\nContent-Length: 1\r\n\r\n");
+    constexpr int kept = 200;
+    for (int i = 0; i < kept; ++i) {
+        EXPECT_EQ(client.post("/v1/fixture/nothing", "{}").status, 204);
+    }
+    slow.send(" ");
+    expectError(slow.reply(), 404, "UNKNOWN_REQUEST");
+}
+
 TEST_F(RequestIds, StateIsWaitingRunningDoneOrUnknown) {
     const std::string second = "6ba7b811-9dad-11d1-80b4-00c04fd430c8";
     EXPECT_EQ(recordOf(daemon, id).get("state"), Value("unknown"));
