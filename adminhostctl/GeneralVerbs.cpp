@@ -160,7 +160,7 @@ constexpr std::array table = {
 
 constexpr std::array options = {
     VerbOption{followOption, "", "With logs: print also what is written from now on", {}, "-f"},
-    VerbOption{linesOption, "LINES", "With logs: print the last so many lines", {}, "-n"},
+    VerbOption{linesOption, "LINES", "With logs: print only the last LINES lines (10 if not given)", {}, "-n"},
 };
 
 }  // namespace

@@ -86,8 +86,7 @@ protocol::Answer logAnswer(const std::vector<LoadedPlugin>& plugins, const proto
         protocol::Answer answer;
         answer.outcome = protocol::Outcome::absent;
         answer.error = "UNKNOWN_LOG";
-        answer.message =
-            fmt::format("There is no log \"{}\". Known logs: {}.", order.name, names.empty() ? "none" : names);
+        answer.message = fmt::format("log not found: {}. Known logs: {}.", order.name, names.empty() ? "none" : names);
         return answer;
     }
     auto piece = readLogPiece(found->log.path, order.inode, order.offset);

@@ -115,7 +115,7 @@ ExitStatus applyFile(const Context& context, Words arguments) {
 
 constexpr std::array table = {
     Verb{"settings get", "[KEY]", "Show the settings, or one of them", 0, 1, &settingsGet},
-    Verb{"settings set", "KEY [VALUE|@FILE|@-] [--validate [--password-file FILE]]", "Change a setting", 1, 2,
+    Verb{"settings set", "KEY [VALUE|@FILE|@-] [--clear] [--validate [--password-file FILE]]", "Change a setting", 1, 2,
          &settingsSet},
     Verb{"export", "[FILE]", "Write settings and lists to a TOML file", 0, 1, &exportState},
     Verb{"plan", "FILE [--password-file FILE]", "Show what applying the file would change", 1, 1, &planFile},

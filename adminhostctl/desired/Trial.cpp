@@ -108,6 +108,9 @@ bool passTrials(const Context& context, const Wanted& wanted, const CurrentState
         passed = passed && failure.empty();
         context.err << shown(trial->name) << ": " << (failure.empty() ? "passed" : "failed: " + shown(failure)) << '\n';
     }
+    for (const ReportedGap& gap : context.service.gapsOf(answer)) {
+        context.err << "  " << shownIndented(gapText(gap), 4) << '\n';
+    }
     if (!passed) {
         for (const std::string& line : context.service.report(answer.requestId).log) {
             context.err << "  " << shownIndented(line, 4) << '\n';

@@ -4,7 +4,9 @@
 #include "adminhostctl/desired/DesiredVerbs.h"
 #include "adminhostctl/desired/Writing.h"
 
+#include <exception>
 #include <optional>
+#include <vector>
 
 namespace adminhost::ctl {
 namespace {
@@ -47,11 +49,17 @@ bool isAgreed(const Context& context) {
 }
 
 /// The account in the settings, compared afterwards as every other change is. Its password is shown as "(secret)".
-ExitStatus save(const Context& context, const NewAccount& account) {
+/// Returns false if that fails: the password is then lost.
+bool isSaved(const Context& context, const NewAccount& account, const CurrentState& current) {
     Wanted wanted;
     wanted.settings.set(usernameSetting, account.name);
     wanted.secrets[passwordSetting] = account.password;
-    return carryOut(context, wanted, readState(context));
+    try {
+        return carryOut(context, wanted, current) == ExitStatus::done;
+    } catch (const std::exception& failure) {
+        context.err << "adminhostctl: " << shownIndented(failure.what(), 4) << '\n';
+        return false;
+    }
 }
 
 /// The user's entry in the directory; nullopt if the directory does not find one.
@@ -67,20 +75,22 @@ std::optional<Dictionary> entryOf(const Context& context, const std::string& nam
 }
 
 /// Tries the account at the grid. Returns true if the grid accepts it; prints the log lines of the request otherwise.
+/// Throws Failure if the trial itself failed.
 bool isAccepted(const Context& context, const NewAccount& account, const std::string& controller) {
     const CommandRef command = context.service.command("validateSettings");
-    ExitStatus status = ExitStatus::done;
-    const auto answer =
-        askOnce(context, command,
-                {{usernameSetting, account.name}, {passwordSetting, account.password}, {controllerSetting, controller}},
-                status);
-    if (!answer || !answer->value || answer->value->dictionary() == nullptr) {
-        return false;
+    const CommandAnswer answer = context.service.ask(
+        command,
+        {{usernameSetting, account.name}, {passwordSetting, account.password}, {controllerSetting, controller}});
+    if (!answer.value || answer.value->dictionary() == nullptr) {
+        throw Failure(ExitStatus::failed, "the service did not return a dictionary");
     }
-    if (errorOf(command.description, *answer->value->dictionary()).empty()) {
+    if (errorOf(command.description, *answer.value->dictionary()).empty()) {
         return true;
     }
-    for (const std::string& line : context.service.report(answer->requestId).log) {
+    if (const std::vector<ReportedGap> gaps = context.service.gapsOf(answer); !gaps.empty()) {
+        throw Failure(ExitStatus::failed, gapText(gaps.front()));
+    }
+    for (const std::string& line : context.service.report(answer.requestId).log) {
         context.err << "  " << shownIndented(line, 4) << '\n';
     }
     return false;
@@ -112,15 +122,22 @@ std::string stepLeft(const Context& context, const NewAccount& account, const st
     return {};
 }
 
-void reportStep(const Context& context, const NewAccount& account, const std::string& node) {
+void reportStep(const Context& context, const NewAccount& account, const std::string& node, bool saved) {
     std::string left;
     try {
         left = stepLeft(context, account, node);
     } catch (const Failure& failure) {
         left = "whether the account can sign in could not be checked: " + std::string(failure.what());
     }
-    context.err << (left.empty() ? std::string("The grid accepts the account.") : "Left to do: " + shown(left) + '.')
-                << '\n';
+    if (left.empty()) {
+        context.err << "The grid accepts the account.\n";
+        if (saved) {
+            return;
+        }
+        left = "store the account: adminhostctl settings set " + std::string(usernameSetting) + ' ' + account.name +
+               ", then adminhostctl settings set " + passwordSetting;
+    }
+    context.err << "Left to do: " << shown(left) << ".\n";
 }
 
 }  // namespace
@@ -134,6 +151,11 @@ ExitStatus accountCreate(const Context& context, std::span<const std::string> ar
     if (!isAgreed(context)) {
         context.err << "Nothing was done.\n";
         return ExitStatus::failed;
+    }
+    // Before the account is created: its password would be lost if the state cannot be read.
+    std::optional<CurrentState> current;
+    if (context.options.has(saveOption)) {
+        current = readState(context);
     }
     ExitStatus status = ExitStatus::done;
     const auto answer =
@@ -154,18 +176,22 @@ ExitStatus accountCreate(const Context& context, std::span<const std::string> ar
     if (account.name.empty() || account.password.empty()) {
         throw Failure(ExitStatus::failed, "the service did not return the account's name and password");
     }
-    if (context.options.has(saveOption)) {
+    if (current) {
         if (context.options.format == Format::text) {
             context.out << "created " << shown(account.name) << " in " << shown(arguments[0]) << '\n';
         }
-        status = save(context, account);
+        if (!isSaved(context, account, *current)) {
+            context.err << "adminhostctl: the account was created, but its name and password were not stored; run "
+                           "account create again\n";
+            return ExitStatus::failed;
+        }
     } else {
         writeValue(context, Dictionary{{"username", account.name}, {"password", account.password}},
                    command.description);
     }
     context.out.flush();
-    reportStep(context, account, arguments[0]);
-    return status;
+    reportStep(context, account, arguments[0], current.has_value());
+    return ExitStatus::done;
 }
 
 }  // namespace adminhost::ctl

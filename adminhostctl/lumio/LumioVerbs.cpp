@@ -115,7 +115,8 @@ constexpr std::array table = {
 };
 
 constexpr std::array options = {
-    VerbOption{groupOption, "", "With allow, deny and access: the names are names of groups"},
+    VerbOption{groupOption, "",
+               "With camera and workflow allow or deny, and with access NAME: the names are names of groups"},
     VerbOption{protectOption, "", "With property set: store the value encrypted"},
     VerbOption{noProtectOption, "", "With property set: store the value unencrypted", protectOption},
 };

@@ -36,7 +36,11 @@ void askService(const Context& context, Found& found) {
     for (const Dictionary& request : {Dictionary{{"variant", "withDetails"}}, Dictionary()}) {
         try {
             const CommandRef command = context.service.command("getState");
-            found.service = dictionaryOf(context.service.ask(command, request).value);
+            CommandAnswer answer = context.service.ask(command, request);
+            for (const ReportedGap& gap : context.service.gapsOf(answer)) {
+                found.problems.push_back(gapText(gap));
+            }
+            found.service = dictionaryOf(std::move(answer.value));
             return;
         } catch (const Unavailable& failure) {
             found.problems.emplace_back(failure.what());

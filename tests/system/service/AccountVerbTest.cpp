@@ -5,11 +5,17 @@
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 #include "tests/support/Slapd.h"
+#include "tests/system/directory/SilentServer.h"
 
+#include <chrono>
+#include <csignal>
+#include <filesystem>
 #include <fstream>
+#include <future>
 #include <iterator>
 #include <optional>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include <gmock/gmock.h>
@@ -128,6 +134,34 @@ TEST_F(AccountVerb, SavedAccountIsShownNowhereAndAcceptedOnceItsPrincipalExists)
 TEST_F(AccountVerb, AccountWithoutAKerberosAuthorityIsNamed) {
     startDaemon("");
     EXPECT_THAT(create().output, HasSubstr("Left to do: the account has no Kerberos authority"));
+}
+
+TEST_F(AccountVerb, AccountThatCannotBeStoredIsAnErrorAndHasToBeCreatedAgain) {
+    const std::filesystem::path preferences = root.memberPreferencesPath();
+    std::filesystem::remove(preferences);
+    std::filesystem::create_directories(preferences / "in the way");
+    const ProgramResult result = create({"--save", "--yes"});
+    EXPECT_EQ(result.status, 1) << result.output;
+    EXPECT_THAT(result.output, AllOf(HasSubstr("the account was created, but its name and password were not stored; "
+                                               "run account create again\n"),
+                                     Not(HasSubstr("Left to do"))));
+}
+
+TEST_F(AccountVerb, CheckWhoseAnswerIsLostIsNotSaidToRejectTheAccount) {
+    const SilentServer silent;
+    std::ofstream(kdc.configuration()) << support::Kdc::clientConfiguration(kdc.realm(), silent.port());
+    auto created = std::async(std::launch::async, [this] { return create(); });
+    const auto isChecked = [this] {
+        return daemon->connect().get("/v1/").body.find("\"command\":\"validateSettings\"") != std::string::npos;
+    };
+    for (int tries = 0; tries < 500 && !isChecked(); ++tries) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    EXPECT_EQ(::kill(daemon->workerPid(), SIGKILL), 0);
+    const ProgramResult result = created.get();
+    EXPECT_EQ(result.status, 0) << result.output;
+    EXPECT_THAT(result.output, AllOf(HasSubstr("Left to do: whether the account can sign in could not be checked: "),
+                                     Not(HasSubstr("does not accept"))));
 }
 
 TEST_F(AccountVerb, WrongPasswordIsTheDirectorysErrorAndNothingIsChecked) {

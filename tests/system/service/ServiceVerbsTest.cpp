@@ -127,6 +127,28 @@ TEST_F(Leftovers, FileBehindALinkThatOthersMayHaveCreatedStays) {
     EXPECT_TRUE(std::filesystem::exists(elsewhere / "adminhostd_krb_cc"));
 }
 
+class ServiceWithoutItsDirectory : public ControlledService {
+  protected:
+    ServiceWithoutItsDirectory()
+        : ControlledService(
+              "[[directory.node]]\nname = \"/Example\"\nuri = [\"ldap://127.0.0.1:1\"]\nbase = \"dc=example\"\n") {}
+    static constexpr const char* reason = "the directory node \"/Example\" failed";
+};
+
+TEST_F(ServiceWithoutItsDirectory, StatusShowsWhyTheGridControllerIsNotAvailable) {
+    const ProgramResult result = ctl({"status"});
+    EXPECT_EQ(result.status, 3);
+    EXPECT_THAT(result.output, AllOf(HasSubstr("NOT AVAILABLE"), HasSubstr(std::string("adminhostctl: ") + reason)));
+}
+
+TEST_F(ServiceWithoutItsDirectory, TrialOfTheGridShowsWhyItFails) {
+    const std::string password = file("password", "planted-password\n");
+    const ProgramResult result =
+        ctl({"settings", "set", "nimbo_controller", "grid2.example.org", "--validate", "--password-file", password});
+    EXPECT_EQ(result.status, 1);
+    EXPECT_THAT(result.output, AllOf(HasSubstr("grid controller: failed: "), HasSubstr(reason)));
+}
+
 TEST(ServiceStatus, DaemonThatCannotBeReachedIsStatusFour) {
     const ProgramResult result = runProgram(
         {std::string(BINARY_DIR) + "/bin/adminhostctl", "--socket", "/nowhere/socket", "status"}, Errors::merge);
