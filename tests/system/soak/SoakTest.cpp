@@ -67,9 +67,17 @@ TEST(Soak, EightClientsForAMinuteAreAllAnsweredInOrderAndNothingLeaks) {
         answered += tally.answered;
     }
     EXPECT_EQ(daemon.workerPid(), worker) << "the worker was replaced";
-    // The front closes the descriptors of closed connections when it runs the next time.
-    (void)daemon.connect().get("/v1/");
-    EXPECT_LE(test::descriptorsOf(daemon.pid()), frontBefore + 1);
+    // The front closes the descriptors of closed connections when it runs the next time, or the time after.
+    std::size_t frontAfter = 0;
+    for (int i = 0; i < 50; ++i) {
+        (void)daemon.connect().get("/v1/");
+        frontAfter = test::descriptorsOf(daemon.pid());
+        if (frontAfter <= frontBefore + 1) {
+            break;
+        }
+        std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    }
+    EXPECT_LE(frontAfter, frontBefore + 1);
     EXPECT_EQ(test::descriptorsOf(worker), workerBefore);
     daemon.signal(SIGTERM);
     EXPECT_EQ(daemon.wait(), 0);
