@@ -44,13 +44,6 @@ std::string settingChangeText(const Dictionary& change) {
     return key + ": " + valueText(change.get("from"), "(not set)") + " -> " + valueText(change.get("to"), "(not set)");
 }
 
-bool isPeople(const ListForm& list, std::string_view key) {
-    return std::any_of(list.people.begin(), list.people.end(), [&](const PeopleForm& people) {
-        return std::any_of(people.kinds.begin(), people.kinds.end(),
-                           [&](const auto& kind) { return kind.second == key; });
-    });
-}
-
 /// What became of an element of a list, named as plans name it: "SECTION.NAME.LIST.anna: (not allowed) -> (allowed)".
 std::string elementChangeText(const StateForm& form, const Dictionary& change) {
     const std::string key = textAt(change, "key");
@@ -71,7 +64,7 @@ std::string elementChangeText(const StateForm& form, const Dictionary& change) {
     if (change.get("secret") == Value(true)) {
         return entry + ": (secret) changed";
     }
-    if (isKnown && isPeople(*list, key)) {
+    if (isKnown && list->isPeople(key)) {
         return entry + '.' + tomlKey(textOf(from.isNull() ? to : from)) +
                (from.isNull() ? ": (not allowed) -> (allowed)" : ": (allowed) -> (not allowed)");
     }

@@ -10,6 +10,8 @@ namespace adminhost::ctl {
 namespace {
 
 constexpr std::string_view secretText = "(secret)";
+constexpr const char* allowedText = "(allowed)";
+constexpr const char* notAllowedText = "(not allowed)";
 
 std::string valueText(const Value& value) {
     return value.isNull() ? "(not set)" : tomlValue(value).value_or("(" + std::string(nameOf(value.type())) + ")");
@@ -278,7 +280,7 @@ class Section {
                     bool allowed) {
         const std::string entry = _entry + '.' + list + '.' + tomlKey(name);
         const PlannedChange change{
-            entry, allowed ? "(not allowed)" : "(allowed)", allowed ? "(allowed)" : "(not allowed)", {}, false, {}, {}};
+            entry, allowed ? notAllowedText : allowedText, allowed ? allowedText : notAllowedText, {}, false, {}, {}};
         if (contains(_plan.changes, change)) {
             return false;
         }
@@ -319,6 +321,22 @@ bool isReported(const StateForm& form, const PlannedChange& change, const Reques
         return one.key == change.key &&
                (isSetting ? one.section == form.settingsSection()
                           : one.section != form.settingsSection() && one.identity == change.identity);
+    });
+}
+
+bool concernsPeople(const StateForm& form, const PlannedChange& change) {
+    return !change.identity.empty() && std::any_of(form.lists().begin(), form.lists().end(),
+                                                   [&](const ListForm& list) { return list.isPeople(change.key); });
+}
+
+/// Whether the daemon reports the change of this person, whose name is the end of the entry.
+bool isPersonReported(const PlannedChange& change, const RequestReport& report) {
+    return std::any_of(report.changes.begin(), report.changes.end(), [&](const ReportedChange& one) {
+        const bool isRemoval = one.to.isNull();
+        const std::string* name = (isRemoval ? one.from : one.to).string();
+        return name != nullptr && one.key == change.key && one.identity == change.identity &&
+               isRemoval == (change.to == notAllowedText) &&
+               change.entry.ends_with('.' + one.key + '.' + tomlKey(*name));
     });
 }
 
@@ -408,9 +426,14 @@ PlanOutcome outcomeOf(const StateForm& form, const Wanted& wanted, const Plan& p
         const auto fail = [&](const PlannedChange& what) {
             outcome.failed.push_back({what, gap != nullptr ? reasonOf(*gap) : ""});
         };
-        if (still != remaining.end()) {
+        const bool isPerson = concernsPeople(form, change);
+        const bool isUnread = isPerson && after && after->peopleUnread;
+        if (isUnread && gap == nullptr) {
+            (isPersonReported(change, report) ? outcome.applied : outcome.undetermined).push_back(change);
+        } else if (still != remaining.end()) {
             fail(*still);
-        } else if (change.hidden && gap != nullptr) {
+        } else if ((change.hidden || isPerson) && gap != nullptr) {
+            // A list without a person may be one for which the directory failed.
             fail(change);
         } else if (!isReadable) {
             outcome.undetermined.push_back(change);
@@ -426,7 +449,7 @@ PlanOutcome outcomeOf(const StateForm& form, const Wanted& wanted, const Plan& p
     for (const PlannedChange& change : remaining) {
         const bool isPlanned = std::any_of(plan.changes.begin(), plan.changes.end(),
                                            [&](const PlannedChange& one) { return one.entry == change.entry; });
-        if (!isPlanned) {
+        if (!isPlanned && !(after->peopleUnread && concernsPeople(form, change))) {
             outcome.failed.push_back({change, ""});
         }
     }

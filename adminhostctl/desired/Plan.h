@@ -81,7 +81,8 @@ struct PlanOutcome {
 
 /// Returns which changes of the plan were applied. `after` is the state that was read afterwards, nullopt if it cannot
 /// be read. `answered`: the writing command returned no error. The state decides; for values that reading does not
-/// show, the daemon's report of what was not carried out decides.
+/// show, and for people if their lists were not read completely, the daemon's report decides. People whose change is
+/// reported as not carried out count as such, whatever their lists show.
 [[nodiscard]] PlanOutcome outcomeOf(const StateForm& form, const Wanted& wanted, const Plan& plan, const State& before,
                                     const std::optional<State>& after, bool answered, const RequestReport& report);
 

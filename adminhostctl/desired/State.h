@@ -33,6 +33,7 @@ struct State {
     /// By section, in the service's order. A section is missing if the service did not list it, because its database is
     /// missing or cannot be read.
     std::map<std::string, std::vector<Element>> lists;
+    bool peopleUnread = false;  ///< the lists of people may lack some, because the directory failed for instance
 };
 
 /// Builds the state from an answer. Elements without identity are left out; a value of an unexpected type counts as

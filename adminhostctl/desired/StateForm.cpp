@@ -32,6 +32,12 @@ const FieldForm* ListForm::fieldInFile(std::string_view name) const noexcept {
     return findIn(fields, [&](const FieldForm& field) { return field.inFile == name; });
 }
 
+bool ListForm::isPeople(std::string_view name) const noexcept {
+    return std::any_of(people.begin(), people.end(), [&](const PeopleForm& form) {
+        return std::any_of(form.kinds.begin(), form.kinds.end(), [&](const auto& kind) { return kind.second == name; });
+    });
+}
+
 StateForm::StateForm(const Description& write) : _command(write.name()) {
     for (const DescribedKey& key : write.keys()) {
         if (!key.section.empty() && key.type == "dictionary" && !key.path.ends_with("[]")) {

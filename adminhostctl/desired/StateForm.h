@@ -50,6 +50,8 @@ struct ListForm {
     /// Null if there is none.
     [[nodiscard]] const FieldForm* fieldOf(std::string_view key) const noexcept;
     [[nodiscard]] const FieldForm* fieldInFile(std::string_view name) const noexcept;
+    /// Whether it is the name that a file gives to a list of people.
+    [[nodiscard]] bool isPeople(std::string_view name) const noexcept;
 };
 
 class StateForm {

@@ -41,6 +41,30 @@ void showFailed(std::ostream& err, const std::vector<FailedChange>& failed) {
     }
 }
 
+std::string linesOf(const std::vector<ReportedGap>& gaps) {
+    std::string lines;
+    for (const ReportedGap& gap : gaps) {
+        lines += "\n  " + shownIndented(gapText(gap), 4);
+    }
+    return lines;
+}
+
+/// Failures within a request that belong to none of its entries: of a directory node for instance, for which lists of
+/// people are shortened, also those that the answer returns.
+std::vector<ReportedGap> generalGaps(const RequestReport& report) {
+    std::vector<ReportedGap> gaps;
+    for (const ReportedGap& gap : report.notDone) {
+        if (gap.keyPath.empty()) {
+            gaps.push_back(gap);
+        }
+    }
+    if (report.notDoneDropped > 0) {
+        gaps.push_back(
+            {"", "and " + std::to_string(report.notDoneDropped) + " more, which the daemon did not keep", ""});
+    }
+    return gaps;
+}
+
 /// Prints the names that the write has looked up, and the stored results.
 void showLookedUp(const Context& context, const StateForm& form, const Plan& plan, const State& after) {
     for (const DescribedKey& key : form.settings()) {
@@ -122,10 +146,15 @@ class PlannedWrite {
         }
         const Dictionary& said = dictionaryOf(answer.value);
         const std::string error = errorOf(_command.description, said);
-        const RequestReport report = _context.service.report(answer.requestId);
+        RequestReport report = _context.service.report(answer.requestId);
+        if (report.notDone.empty()) {
+            report.notDone = _context.service.gapsOf(answer);
+        }
+        const std::vector<ReportedGap> gaps = generalGaps(report);
         std::optional<State> after;
         if (const Dictionary* root = said.get(_current.form.root()).dictionary()) {
             after = stateOf(_current.form, *root);
+            after->peopleUnread = !gaps.empty();
         }
         const PlanOutcome outcome =
             outcomeOf(_current.form, _wanted, _plan, _current.state, after, error.empty(), report);
@@ -138,6 +167,9 @@ class PlannedWrite {
         showLines(_context.err, "it could not be determined whether these changes were applied:", outcome.undetermined);
         if (status == ExitStatus::done && outcome.failed.empty() && outcome.undetermined.empty()) {
             return ExitStatus::done;
+        }
+        if (!gaps.empty()) {
+            _context.err << "adminhostctl: other failures within the request:" << linesOf(gaps) << '\n';
         }
         _context.err << (report.log.empty() ? "the request logged nothing\n" : "log lines of the request:\n");
         for (const std::string& line : report.log) {
@@ -154,7 +186,13 @@ class PlannedWrite {
         // While the request is running, reading would only wait for it, and the state is not final.
         if (report.state == RequestReport::State::done || report.state == RequestReport::State::unknown) {
             try {
-                after = readState(_context).state;
+                CurrentState current = readState(_context);
+                if (current.unread.empty()) {
+                    after = std::move(current.state);
+                } else {
+                    _context.err << "adminhostctl: parts of the state could not be read:" << linesOf(current.unread)
+                                 << '\n';
+                }
             } catch (const Failure& failure) {
                 _context.err << "adminhostctl: reading back: " << shown(failure.what()) << '\n';
             }
@@ -206,6 +244,7 @@ ExitStatus carryOutWith(const Context& context, const Wanted& wanted, const Curr
     elements.settings = {};
     elements.secrets.clear();
     const CurrentState moved = readState(context);
+    requireWhole(moved);
     Plan second = planOf(moved.form, elements, moved.state);
     if (second.changes.empty()) {
         return ExitStatus::done;

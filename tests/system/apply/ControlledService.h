@@ -6,9 +6,11 @@
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 
+#include <chrono>
 #include <fstream>
 #include <sstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include <gmock/gmock.h>
@@ -42,6 +44,17 @@ class ControlledService : public testing::Test {
         std::ostringstream content;
         content << std::ifstream(path).rdbuf();
         return content.str();
+    }
+    /// Waits until a write is running in the daemon.
+    void waitForWrite() const {
+        for (int i = 0; i < 1000; ++i) {
+            if (daemon.connect().get("/v1/").body.find("writeSettings\",\"since") != std::string::npos ||
+                daemon.connect().get("/v1/").body.find("\"command\":\"writeSettings\"") != std::string::npos) {
+                return;
+            }
+            std::this_thread::sleep_for(std::chrono::milliseconds(10));
+        }
+        FAIL() << "no write runs: " << daemon.connect().get("/v1/").body;
     }
 
   private:

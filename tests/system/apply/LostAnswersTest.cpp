@@ -3,9 +3,7 @@
 #include "tests/system/apply/ControlledService.h"
 
 #include <array>
-#include <chrono>
 #include <csignal>
-#include <thread>
 
 #include <sys/wait.h>
 #include <unistd.h>
@@ -67,17 +65,6 @@ class RunningCtl {
 class LostAnswers : public ControlledService {
   protected:
     explicit LostAnswers(const std::string& configuration = {}) : ControlledService(configuration) {}
-    /// Waits until a write is running in the daemon.
-    void waitForWrite() const {
-        for (int i = 0; i < 1000; ++i) {
-            if (daemon.connect().get("/v1/").body.find("writeSettings\",\"since") != std::string::npos ||
-                daemon.connect().get("/v1/").body.find("\"command\":\"writeSettings\"") != std::string::npos) {
-                return;
-            }
-            std::this_thread::sleep_for(std::chrono::milliseconds(10));
-        }
-        FAIL() << "no write runs: " << daemon.connect().get("/v1/").body;
-    }
     [[nodiscard]] std::size_t writes() const {
         std::size_t count = 0;
         for (const ToolCall& call : root.toolCalls()) {
@@ -123,6 +110,21 @@ TEST_F(LostAnswers, KilledWorkerIsReportedAndNothingIsWrittenTwice) {
     EXPECT_THAT(result.output, AllOf(HasSubstr("WORKER_FAILED"), HasSubstr("has ended; it was not repeated"),
                                      HasSubstr("not applied:\n  settings.server_port: 8170 -> 8180")));
     EXPECT_LE(writes(), 1U);
+}
+
+TEST_F(LostAnswers, StateThatCannotBeReadBackCompletelyLeavesItUndetermined) {
+    root.setSwitch("setup_library.sleep", "30");
+    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    waitForWrite();
+    root.sql("alter table access_control_entries rename to gone");
+    ::kill(daemon.workerPid(), SIGKILL);
+    const ProgramResult result = set.wait();
+    EXPECT_EQ(result.status, 6);
+    EXPECT_THAT(result.output,
+                AllOf(HasSubstr("parts of the state could not be read:\n  not read: the access list ("),
+                      HasSubstr("could not be determined whether these changes were applied:\n  settings.server_port: "
+                                "8170 -> 8180"),
+                      Not(HasSubstr("not applied:"))));
 }
 
 TEST_F(LostAnswers, DaemonThatIsGoneLeavesItUndetermined) {

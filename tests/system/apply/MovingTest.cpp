@@ -4,6 +4,7 @@
 #include "tests/system/apply/ControlledService.h"
 
 #include <filesystem>
+#include <future>
 
 namespace adminhost::test {
 namespace {
@@ -78,6 +79,22 @@ TEST_F(Moving, BothStepsAreOneDocumentForPrograms) {
     const auto document = parseJson(apply.output);
     ASSERT_TRUE(document) << apply.output;
     EXPECT_THAT(apply.output, AllOf(HasSubstr("settings.shared_filesystem"), HasSubstr("properties.default_language")));
+}
+
+TEST_F(Moving, ListsAreNotChangedWhenTheStateIsNotReadCompletelyAfterTheMove) {
+    replaceSetting("member_uuid", "\"0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1EFF\"");
+    const std::size_t at = _text.find("value = \"de\"");
+    ASSERT_NE(at, std::string::npos);
+    _text.replace(at, 12, "value = \"fr\"");
+    const std::string desired = file("desired.toml", _text);
+    root.setSwitch("setup_library.sleep", "2");
+    std::future<ProgramResult> apply = std::async(std::launch::async, [&] { return ctl({"apply", desired}); });
+    waitForWrite();
+    root.sql("alter table access_control_entries rename to gone");
+    const ProgramResult result = apply.get();
+    EXPECT_EQ(result.status, 1);
+    EXPECT_THAT(result.output, HasSubstr("parts of the state could not be read:\n  not read: the access list ("));
+    EXPECT_EQ(root.sql("select value from properties where name='default_language'"), "de\n");
 }
 
 TEST_F(Moving, PlanNamesWhatTheNewFilesNeedNotHave) {

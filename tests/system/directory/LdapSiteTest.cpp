@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cctype>
 #include <chrono>
+#include <future>
 
 namespace adminhost::test {
 namespace {
@@ -98,6 +99,24 @@ TEST_F(LdapSite, DesiredStateIsExportedAndSettlesAtOnce) {
     EXPECT_EQ(ctl({"apply", desired}).status, 0);
     EXPECT_EQ(ctl({"apply", desired}).output, "no change\n");
     EXPECT_THAT(ctl({"export"}).output, HasSubstr("users = [\"anna\", \"greta\"]\ngroups = [\"filmers\"]\n"));
+}
+
+TEST_F(LdapSite, PeopleAreNotShownAsRemovedWhenTheServerFailsWithinTheWrite) {
+    const std::string uuid = SampleRoot::uuidOf("workflow", "Archive.workflow");
+    ASSERT_EQ(ctl({"workflow", "allow", uuid, "greta"}).status, 0);
+    const std::string before = listOf("Workflow", uuid);
+    ASSERT_THAT(before, HasSubstr(greta));
+    const std::string desired =
+        file("desired.toml", "[settings]\nserver_port = 8180\n[remove_unlisted]\naccess = true\n[workflows." + uuid +
+                                 "]\nusers = []\n");
+    root.setSwitch("setup_library.sleep", "3");
+    std::future<ProgramResult> apply = std::async(std::launch::async, [&] { return ctl({"apply", desired}); });
+    waitForWrite();
+    slapd.stop();
+    const ProgramResult result = apply.get();
+    EXPECT_EQ(result.status, 1);
+    EXPECT_THAT(result.output, ContainsRegex("not applied:\n  workflows[^\n]*users.greta: [^\n]*not removed"));
+    EXPECT_THAT(listOf("Workflow", uuid), HasSubstr(greta));
 }
 
 TEST_F(LdapSite, RequestWhileTheServerIsDownIsReportedAndTheNextOneIsWhole) {

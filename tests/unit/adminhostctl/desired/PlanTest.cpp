@@ -225,6 +225,75 @@ TEST(Outcome, WhatIsStillDifferentAfterwardsWasNotApplied) {
     EXPECT_THAT(outcome.undetermined, IsEmpty());
 }
 
+/// Denies the user anna and allows the user ben, in this order in the request: ben is entry 0, anna entry 1.
+Wanted otherPeople() {
+    Wanted wanted;
+    WantedElement camera = element("Hall");
+    camera.lists["users"] = {"ben"};
+    camera.denied = {{"user", "anna", ""}};
+    wanted.elements["cameras"].push_back(camera);
+    return wanted;
+}
+
+TEST(Outcome, PersonWhoIsReportedAsNotRemovedWasNotRemovedAlthoughTheListIsEmpty) {
+    Wanted wanted;
+    WantedElement camera = element("Hall");
+    camera.denied = {{"user", "anna", ""}};
+    wanted.elements["cameras"].push_back(camera);
+    const Plan plan = planOf(form(), wanted, sample());
+    State after = sample();
+    after.lists["cameras"].front().people.clear();
+    const PlanOutcome outcome =
+        outcomeOf(form(), wanted, plan, sample(), after, true,
+                  done({{"configuration.cameras.0.allowedUsersAndGroups.0", "not removed: the directory failed", ""}}));
+    EXPECT_EQ(failedOf(outcome), plan.changes);
+    ASSERT_EQ(outcome.failed.size(), 1U);
+    EXPECT_EQ(outcome.failed.front().reason, "not removed: the directory failed");
+    EXPECT_THAT(outcome.applied, IsEmpty());
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), after, true, done()).applied, plan.changes);
+}
+
+TEST(Outcome, ListsOfPeopleThatWereNotReadCompletelyDecideNothing) {
+    const Wanted wanted = otherPeople();
+    const Plan plan = planOf(form(), wanted, sample());
+    ASSERT_EQ(plan.changes.size(), 2U);
+    State after = sample();
+    after.lists["cameras"].front().people.clear();
+    after.peopleUnread = true;
+    RequestReport report = done({{"", "the directory node \"/Example\" failed", ""}});
+    const PlanOutcome unknown = outcomeOf(form(), wanted, plan, sample(), after, true, report);
+    EXPECT_EQ(unknown.undetermined, plan.changes);
+    EXPECT_THAT(unknown.failed, IsEmpty());
+    EXPECT_THAT(unknown.applied, IsEmpty());
+
+    report.changes.push_back({"cameras", "AAAA-1", "Hall", "users", "anna", Value(), false});
+    const PlanOutcome reported = outcomeOf(form(), wanted, plan, sample(), after, true, report);
+    EXPECT_THAT(reported.applied, ElementsAre(plan.changes[1])) << "the daemon reports it";
+    EXPECT_THAT(reported.undetermined, ElementsAre(plan.changes[0]));
+
+    report.notDone.push_back({"configuration.cameras.0.allowedUsersAndGroups.0", "not added", "tool 5"});
+    EXPECT_EQ(failedOf(outcomeOf(form(), wanted, plan, sample(), after, true, report)),
+              (std::vector<PlannedChange>{plan.changes[0]}));
+}
+
+TEST(Outcome, ListsOfPeopleThatWereNotReadCompletelyDoNotConcernOtherChanges) {
+    Wanted wanted;
+    wanted.settings = {{"server_port", 1}};
+    WantedElement camera = element("Hall");
+    camera.lists["users"] = {"anna"};  // who is in the list already
+    wanted.elements["cameras"].push_back(camera);
+    const Plan plan = planOf(form(), wanted, sample());
+    ASSERT_EQ(plan.changes.size(), 1U);
+    State after = sample();
+    after.settings.set("server_port", 1);
+    after.lists["cameras"].front().people.clear();
+    after.peopleUnread = true;
+    const PlanOutcome outcome = outcomeOf(form(), wanted, plan, sample(), after, true, done());
+    EXPECT_EQ(outcome.applied, plan.changes);
+    EXPECT_THAT(outcome.failed, IsEmpty());
+    EXPECT_THAT(outcome.undetermined, IsEmpty());
+}
+
 TEST(Outcome, NothingIsKnownOfAStateThatCannotBeRead) {
     Wanted wanted;
     wanted.settings = {{"server_port", 1}};
