@@ -29,8 +29,8 @@ struct ADMINHOST_EXPORT PosixId {
 /// The UUID of a text of 36 characters, in either case; nullopt for any other text.
 [[nodiscard]] ADMINHOST_EXPORT std::optional<Uuid> mbr_string_to_uuid(std::string_view text) noexcept;
 
-/// The user or group id of the first record with the UUID (users before groups). Returns nullopt if there is no such
-/// record or it has no numeric id.
+/// The user or group id of the first record with the UUID (users before groups). Returns nullopt if the
+/// record is not found or has no numeric id.
 [[nodiscard]] ADMINHOST_EXPORT Result<std::optional<PosixId>> mbr_uuid_to_id(const Uuid& uuid);
 
 /// The login or group name of an id, from the node of the id, as getpwuid and getgrgid: if several records have the id,

@@ -49,7 +49,7 @@ TEST_F(FileSystem, CreationDateDoesNotFollowLaterWrites) {
     if ((status.stx_mask & STATX_BTIME) != 0) {
         EXPECT_NEAR(static_cast<double>(date->time_since_epoch().count()), static_cast<double>(now), 5);
     } else {
-        EXPECT_EQ(date->time_since_epoch().count(), 1'000'000) << "the modification date stands in for it";
+        EXPECT_EQ(date->time_since_epoch().count(), 1'000'000) << "the modification date is used instead";
     }
 }
 
