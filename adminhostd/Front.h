@@ -6,6 +6,7 @@
 #include "adminhostd/Http.h"
 #include "adminhostd/OperationQueue.h"
 #include "adminhostd/RequestLog.h"
+#include "adminhostd/Target.h"
 
 #include <optional>
 #include <string>
@@ -14,6 +15,9 @@
 #include <vector>
 
 namespace adminhost {
+
+/// The commands as clients see them.
+[[nodiscard]] Array describe(const std::vector<Command>& commands);
 
 class Front {
   public:
@@ -31,22 +35,10 @@ class Front {
     [[nodiscard]] std::variant<HttpAnswer, HttpServer::Serve> head(Exchange& exchange);
 
   private:
-    struct Target {
-        enum class Kind { unknown, overview, plugin, command, request, directory, history, doctor, logs };
-        Kind kind = Kind::unknown;
-        std::string plugin;
-        std::string command;  ///< for a request its id, for a log its name
-
-        /// Returns true if the worker serves it. Such requests are recorded in the log of requests.
-        [[nodiscard]] bool isOperation() const noexcept {
-            return kind == Kind::command || kind == Kind::directory || kind == Kind::history || kind == Kind::doctor ||
-                   kind == Kind::logs;
-        }
-    };
-
     void welcome(protocol::Hello hello);
-    [[nodiscard]] static Target targetOf(std::string_view path);
     [[nodiscard]] const protocol::OfferedPlugin* pluginNamed(std::string_view name) const;
+    /// The command that the target names; null if the worker offers none of that name.
+    [[nodiscard]] const Command* commandOf(const Target& target) const;
     [[nodiscard]] std::vector<protocol::RefusedPlugin> refusedPlugins() const;
 
     /// Uses the id that the client may have sent as the exchange's. Returns an answer if that id is rejected.

@@ -1,9 +1,12 @@
 #include "adminhostd/RequestLog.h"
 
+#include "platform/log/Log.h"
 #include "platform/value/ValueCodec.h"
 
 #include <algorithm>
 #include <utility>
+
+#include <fmt/format.h>
 
 namespace adminhost {
 namespace {
@@ -72,6 +75,30 @@ void RequestRecord::keep(Reports& reports, Dictionary report) {
     }
     _reportBytes += bytes.size();
     reports.kept.emplace_back(std::move(report));
+}
+
+void RequestRecord::close(unsigned answered, std::string_view code) {
+    const std::chrono::duration<double, std::milli> duration = std::chrono::steady_clock::now() - arrival;
+    milliseconds = duration.count();
+    state = State::done;
+    status = answered;
+    error = code;
+    if (repeated && status < 300) {
+        return;
+    }
+    // Names from an address come from the client: only printable ones may reach the log.
+    std::string name = plugin + "/" + command;
+    for (char& c : name) {
+        c = c < 0x21 || c > 0x7e ? '?' : c;
+    }
+    std::string reports;
+    for (const auto& [what, count] : {std::pair("changes", changes()), std::pair("not done", notDone())}) {
+        if (count > 0) {
+            reports += fmt::format(", {}: {}", what, count);
+        }
+    }
+    logEvent(fmt::format("adminhostd: request {} {} by uid {} pid {}: {}{}{} in {:.1f} ms{}", id, name, peer.uid,
+                         peer.pid, status, error.empty() ? "" : " ", error, milliseconds, reports));
 }
 
 Dictionary RequestRecord::describe(bool withReports) const {

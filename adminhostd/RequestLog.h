@@ -47,6 +47,9 @@ struct RequestRecord {
     /// Withholds the values of kept changes of this part.
     void hide(const SecretPart& part);
 
+    /// Completes the record with the status of the answer and the code of its error, and logs the end of the request.
+    void close(unsigned answered, std::string_view code);
+
     /// The number of reports, including those that were not kept.
     [[nodiscard]] std::size_t changes() const noexcept { return _changes.reported; }
     [[nodiscard]] std::size_t notDone() const noexcept { return _notDone.reported; }

@@ -1,0 +1,190 @@
+// The requests that the worker serves: how they are passed on to it, and how they end.
+
+#include "adminhostd/Front.h"
+#include "adminhostd/FrontAnswers.h"
+#include "adminhostd/RequestBody.h"
+#include "platform/text/Utf8.h"
+
+#include <charconv>
+#include <string>
+#include <system_error>
+#include <utility>
+
+#include <fmt/format.h>
+
+namespace adminhost {
+namespace {
+
+constexpr auto doctorBound = std::chrono::seconds(60);
+constexpr auto doctorWait = std::chrono::seconds(20);  ///< for the worker, while it runs another operation
+constexpr auto logBound = std::chrono::seconds(10);
+
+/// Returns true for the checks of the installation. No plug-in serves them.
+bool isDoctor(const RequestRecord& record) {
+    return record.plugin.empty() && record.command == "doctor";
+}
+
+/// The number in an argument of an address; 0 without the argument, nullopt if it is not a number.
+std::optional<std::uint64_t> numberIn(std::string_view argument) {
+    std::uint64_t number = 0;
+    const char* const end = argument.data() + argument.size();
+    const auto [rest, failure] = std::from_chars(argument.data(), end, number);
+    return argument.empty() || (failure == std::errc() && rest == end) ? std::optional(number) : std::nullopt;
+}
+
+BodyForm wantedForm(const Exchange& exchange) {
+    return exchange.wantsPropertyList() ? BodyForm::propertyList : BodyForm::json;
+}
+
+}  // namespace
+
+void Front::operation(Exchange& exchange, const Target& target) {
+    Operation operation{&exchange, _log.add(exchange)};
+    RequestRecord& record = *operation.record;
+    record.plugin = target.plugin;
+    record.command = target.command;
+    const auto refuse = [&](HttpAnswer answer) {
+        const std::string code(codeOf(answer));
+        end(operation, std::move(answer), code);
+    };
+
+    // A new worker may have loaded other plug-ins since the head arrived.
+    if (auto answer = missing(target)) {
+        return refuse(std::move(*answer));
+    }
+    const Command& command = *commandOf(target);
+    BodyProblem problem;
+    auto request = requestOf(exchange.body(), *bodyFormOf(exchange.header("Content-Type").value_or("")), problem);
+    exchange.dropBody();
+    if (!request) {
+        return refuse(problem.tooManyValues ? errorAnswer(413, "BODY_TOO_LARGE", problem.text)
+                                            : errorAnswer(400, "MALFORMED_BODY", problem.text));
+    }
+    const auto ifMatch = exchange.header("If-Match");
+    auto revisions = revisionsOf(ifMatch.value_or("*"));
+    if (ifMatch && (!revisions || !command.takesRevision)) {
+        return refuse(errorAnswer(400, "PRECONDITION_NOT_UNDERSTOOD",
+                                  "If-Match must list quoted revisions, and is for commands that depend on the "
+                                  "revision only."));
+    }
+    operation.deadline = command.deadline;
+    operation.changes = command.access != Access::read;
+    operation.order = protocol::Perform{
+        .request = record.id,
+        .plugin = record.plugin,
+        .command = record.command,
+        .caller = {record.peer.uid, record.peer.pid, record.peer.login},
+        .received = record.received,
+        .arguments = std::move(*request),
+        .revisions = std::move(*revisions),
+        .showsRevision = command.showsRevision,
+        .keepsHistory = command.takesRevision,
+        .milliseconds = 0,
+        .form = wantedForm(exchange),
+    };
+    enqueue(std::move(operation));
+}
+
+std::optional<protocol::ToWorker> Front::orderFor(const Exchange& exchange, const Target& target,
+                                                  HttpAnswer& malformed) {
+    const auto refuse = [&](const char* what) {
+        malformed = errorAnswer(400, "MALFORMED_ADDRESS", what);
+        return std::nullopt;
+    };
+    for (const char* argument : {"match", "is", "plugin"}) {
+        if (!isUtf8(exchange.argument(argument))) {
+            return refuse("The address has an argument that is not UTF-8.");
+        }
+    }
+    switch (target.kind) {
+        case Target::Kind::history:
+            return protocol::ReadHistory{target.plugin, wantedForm(exchange)};
+        case Target::Kind::doctor:
+            return protocol::Diagnose{};
+        case Target::Kind::logs: {
+            const auto inode = numberIn(exchange.argument("inode"));
+            const auto offset = numberIn(exchange.argument("offset"));
+            if (!inode || !offset || !isUtf8(target.command)) {
+                return refuse("The log's name must be UTF-8, and \"inode\" and \"offset\" decimal numbers.");
+            }
+            return protocol::ReadLog{.plugin = std::string(exchange.argument("plugin")),
+                                     .name = target.command,
+                                     .inode = *inode,
+                                     .offset = *offset,
+                                     .milliseconds = 0,
+                                     .form = wantedForm(exchange)};
+        }
+        default:
+            return protocol::FindAccounts{std::string(exchange.argument("match")), std::string(exchange.argument("is")),
+                                          wantedForm(exchange)};
+    }
+}
+
+void Front::query(Exchange& exchange, const Target& target) {
+    // A client that follows a log asks every second: that must not push other requests out of the log of requests.
+    const bool follows = target.kind == Target::Kind::logs && !exchange.argument("inode").empty();
+    Operation operation{&exchange, follows ? RequestLog::begin(exchange) : _log.add(exchange)};
+    operation.record->repeated = follows;
+    operation.record->plugin = target.plugin;
+    operation.record->command = target.kind == Target::Kind::logs ? "logs" : target.command;
+    HttpAnswer malformed;
+    auto order = orderFor(exchange, target, malformed);
+    if (!order) {
+        const std::string code(codeOf(malformed));
+        end(operation, std::move(malformed), code);
+        return;
+    }
+    operation.order = *std::move(order);
+    if (target.kind == Target::Kind::doctor) {
+        operation.deadline = doctorBound;
+        operation.beginBy = std::chrono::steady_clock::now() + doctorWait;
+    } else if (target.kind == Target::Kind::logs) {
+        operation.deadline = logBound;
+    }
+    enqueue(std::move(operation));
+}
+
+void Front::enqueue(Operation operation) {
+    if (_queue.full()) {
+        if (isDoctor(*operation.record)) {
+            finished(operation, Unserved{Unserved::Reason::notBegun, "Too many requests are waiting already."});
+            return;
+        }
+        end(operation, retryLater("TOO_MANY_WAITING", fmt::format("{} requests wait already.", _queue.waiting())),
+            "TOO_MANY_WAITING");
+        return;
+    }
+    _queue.add(std::move(operation));
+}
+
+void Front::finished(const Operation& operation, OperationQueue::Ending ending) {
+    if (isDoctor(*operation.record)) {
+        return end(operation, doctorAnswer(ending), {});
+    }
+    if (const auto* unserved = std::get_if<Unserved>(&ending)) {
+        HttpAnswer http = answerFor(*unserved);
+        const std::string code(codeOf(http));
+        return end(operation, std::move(http), code);
+    }
+    auto& answer = std::get<protocol::Answer>(ending);
+    HttpAnswer http = answerFor(answer);
+    if (http.status < 300 && !answer.revision.empty()) {
+        http.headers.emplace_back("ETag", fmt::format("\"{}\"", answer.revision));
+    }
+    const std::string code(http.text ? answer.error : codeOf(http));
+    end(operation, std::move(http), code);
+}
+
+void Front::end(const Operation& operation, HttpAnswer answer, std::string_view code) {
+    RequestRecord& record = *operation.record;
+    record.close(answer.status, code);
+    for (const auto& [name, count] :
+         {std::pair("Adminhost-Changes", record.changes()), std::pair("Adminhost-Not-Done", record.notDone())}) {
+        if (count > 0) {
+            answer.headers.emplace_back(name, std::to_string(count));
+        }
+    }
+    operation.exchange->answer(std::move(answer));
+}
+
+}  // namespace adminhost
