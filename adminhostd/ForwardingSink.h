@@ -5,7 +5,7 @@
 // Events and reports are passed on to the front when they happen. The front writes the system log and keeps both with
 // the request's record. They are lost only together with the front itself.
 
-#include "adminhostd/SettingsHistory.h"
+#include "adminhostd/FormerValues.h"
 #include "platform/framework/Report.h"
 #include "platform/log/Log.h"
 

@@ -1,7 +1,7 @@
 #include "adminhostd/SettingsHistory.h"
 
+#include "adminhostd/HistoryFiles.h"
 #include "platform/crypto/Digest.h"
-#include "platform/files/CreateMissing.h"
 #include "platform/files/File.h"
 #include "platform/files/ReplaceFile.h"
 #include "platform/log/Log.h"
@@ -10,9 +10,7 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <charconv>
 #include <filesystem>
-#include <fstream>
 #include <string>
 
 #include <fmt/format.h>
@@ -29,96 +27,15 @@ constexpr std::string_view unfinished = "unfinished-";
 constexpr std::string_view hidden = "(secret)";
 constexpr std::string_view hiddenChange = "(secret) changed";
 
-HostPath below(const HostPath& directory, std::string_view name) {
-    return HostPath(directory.text() + '/' + std::string(name));
-}
-
-HostPath directoryOf(std::string_view plugin) {
-    return HostPath("/var/lib/adminhostd/history/" + std::string(plugin));
-}
-
-HostPath resourcesOf(const HostPath& directory) {
-    return below(directory, "resources");
-}
-
-HostPath entryOf(const HostPath& directory, std::uint64_t number) {
-    return below(directory, fmt::format("{:08}", number));
-}
-
-HostPath resourceEntryOf(const HostPath& directory, std::uint64_t number) {
-    return below(directory, fmt::format("{:08}.plist", number));
-}
-
-OwnerAndMode mine() {
-    return {::geteuid(), ::getegid(), 0700};
-}
-
-/// The numbers of the entries, in order. Other files in the directory are skipped.
-std::vector<std::uint64_t> numbersIn(const HostPath& directory) {
-    std::vector<std::uint64_t> numbers;
-    std::error_code error;
-    for (fs::directory_iterator at(diskPath(directory).text(), error), end; !error && at != end; at.increment(error)) {
-        const std::string name = at->path().filename();
-        std::uint64_t number = 0;
-        const auto [rest, failure] = std::from_chars(name.data(), name.data() + name.size(), number);
-        const std::string_view behind(rest, static_cast<std::size_t>(name.data() + name.size() - rest));
-        if (failure == std::errc() && (behind.empty() || behind == ".plist")) {
-            numbers.push_back(number);
-        }
-    }
-    std::sort(numbers.begin(), numbers.end());
-    return numbers;
-}
-
-std::uint64_t nextAfter(const std::vector<std::uint64_t>& numbers) {
-    return numbers.empty() ? 1 : numbers.back() + 1;
-}
-
-void removeAll(const HostPath& path) {
-    std::error_code ignored;
-    fs::remove_all(diskPath(path).text(), ignored);
-}
-
-Error failed(const char* step, const std::error_code& code) {
-    return Error{"posix", code.value(), std::string(step) + ": " + code.message()};
-}
-
-/// Writes a file of a new entry without a flush, so that no administrator waits for the disk. An entry that a power cut
-/// damages is left out when it is read.
-std::optional<Error> writePlainly(std::string_view bytes, const HostPath& path) {
-    errno = 0;
-    std::ofstream file(diskPath(path).text(), std::ios::binary);
-    file << bytes;
-    file.close();
-    if (!file) {
-        return failed("cannot write the entry", std::error_code(errno, std::generic_category()));
-    }
-    return std::nullopt;
-}
-
-std::optional<Error> writePlainly(const Dictionary& dictionary, const HostPath& path) {
-    const auto text = xmlPropertyList(dictionary);
-    return text ? writePlainly(*text, path) : text.error();
-}
-
-/// Replaces a file of an entry. A reader sees either the old file or the new one.
-std::optional<Error> replacePlainly(const Dictionary& dictionary, const HostPath& path) {
-    const HostPath fresh(path.text() + ".new");
-    if (auto error = writePlainly(dictionary, fresh)) {
-        return error;
-    }
-    std::error_code error;
-    fs::rename(diskPath(fresh).text(), diskPath(path).text(), error);
-    return error ? std::optional(failed("cannot replace the entry", error)) : std::nullopt;
-}
-
-std::optional<Dictionary> readDictionary(const HostPath& path) {
-    auto value = readPropertyList(diskPath(path));
-    return value && value->dictionary() != nullptr ? std::optional(std::move(*value->dictionary())) : std::nullopt;
-}
-
 std::int64_t formatOf(const Dictionary& about) {
     return about.get("format").integer().value_or(std::int64_t{1});
+}
+
+void logNewer(std::size_t count) {
+    if (count > 0) {
+        logEvent(fmt::format(
+            "adminhostd: {} entries of the history were written by a newer release; they are not shown", count));
+    }
 }
 
 const Dictionary& dictionaryAt(const Dictionary& from, std::string_view key) {
@@ -208,39 +125,6 @@ Dictionary settingsOfFiles(const HostPath& entry, const Dictionary& about, const
     return values;
 }
 
-void logNewer(std::size_t count) {
-    if (count > 0) {
-        logEvent(fmt::format(
-            "adminhostd: {} entries of the history were written by a newer release; they are not shown", count));
-    }
-}
-
-bool isAbout(const Dictionary& kept, const SecretPart& part) {
-    return kept.get("section") == Value(part.section) && kept.get("identity") == Value(part.identity) &&
-           kept.get("key") == Value(part.key);
-}
-
-/// Replaces what the changes hold of these secrets by "(secret)"; returns true if there was anything to replace.
-bool hideIn(Array& changes, const std::vector<SecretPart>& secret) {
-    bool hid = false;
-    for (Value& change : changes) {
-        Dictionary* kept = change.dictionary();
-        if (kept == nullptr || kept->get("secret") == Value(true) ||
-            std::none_of(secret.begin(), secret.end(), [&](const SecretPart& part) { return isAbout(*kept, part); })) {
-            continue;
-        }
-        for (const std::string_view key : {"from", "to"}) {
-            if (kept->contains(key)) {
-                kept->set(key, hidden);
-            }
-        }
-        kept->remove("undo");
-        kept->set("secret", true);
-        hid = true;
-    }
-    return hid;
-}
-
 Dictionary dictionaryOf(const Change& change) {
     Dictionary kept{
         {"section", change.section}, {"identity", change.identity}, {"name", change.name}, {"key", change.key}};
@@ -259,7 +143,7 @@ Dictionary dictionaryOf(const Change& change) {
 }  // namespace
 
 SettingsHistory::SettingsHistory(std::string_view plugin, std::vector<Setting> settings)
-    : _directory(directoryOf(plugin)), _resources(resourcesOf(_directory)), _settings(std::move(settings)) {}
+    : _directory(historyDirectoryOf(plugin)), _resources(resourcesOf(_directory)), _settings(std::move(settings)) {}
 
 Result<std::string> SettingsHistory::digestKey() const {
     constexpr std::size_t size = 32;
@@ -269,7 +153,7 @@ Result<std::string> SettingsHistory::digestKey() const {
     }
     std::string key(size, '\0');
     if (::getrandom(key.data(), key.size(), 0) != static_cast<ssize_t>(size)) {
-        return failure(failed("no random bytes", std::error_code(errno, std::generic_category())));
+        return failure(stepFailed("no random bytes", std::error_code(errno, std::generic_category())));
     }
     if (auto written = replaceFile(key, file, 0600); !written) {
         return failure(std::move(written.error()));
@@ -302,7 +186,7 @@ std::optional<Error> SettingsHistory::add(const std::vector<HostPath>& files, Di
     std::vector<std::uint64_t> numbers = numbersIn(_directory);
     number = nextAfter(numbers);
     const HostPath making = below(_directory, std::string(unfinished) + std::to_string(number));
-    if (auto created = createDirectories(diskPath(making), mine()); !created) {
+    if (auto created = createDirectories(diskPath(making), historyOwner()); !created) {
         return std::move(created.error());
     }
     Array kept;
@@ -316,7 +200,7 @@ std::optional<Error> SettingsHistory::add(const std::vector<HostPath>& files, Di
         std::error_code code;
         fs::rename(diskPath(making).text(), diskPath(entryOf(_directory, number)).text(), code);
         if (code) {
-            error = failed("cannot name the entry", code);
+            error = stepFailed("cannot name the entry", code);
         }
     }
     if (error) {
@@ -353,7 +237,7 @@ std::optional<Error> SettingsHistory::keepOutsideEdit(const Dictionary& snapshot
 
 Result<std::uint64_t> SettingsHistory::keep(const std::vector<HostPath>& files, const Dictionary& values,
                                             const Dictionary& about) const {
-    if (auto created = createDirectories(diskPath(_directory), mine()); !created) {
+    if (auto created = createDirectories(diskPath(_directory), historyOwner()); !created) {
         return failure(std::move(created.error()));
     }
     removeUnfinished();
@@ -380,7 +264,7 @@ std::optional<Error> SettingsHistory::complete(std::uint64_t number, const Dicti
     auto about = readDictionary(file);
     auto snapshot = snapshotOf(values);
     if (!about || !snapshot) {
-        return snapshot ? failed("the entry cannot be read", std::make_error_code(std::errc::io_error))
+        return snapshot ? stepFailed("the entry cannot be read", std::make_error_code(std::errc::io_error))
                         : snapshot.error();
     }
     Array changes = changesBetween(*about, *snapshot, _settings);
@@ -426,9 +310,9 @@ std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& c
         return notHidden;
     }
     // The same request may have set a plain value first.
-    hideIn(kept, secret);
+    static_cast<void>(hideIn(kept, secret));
     for (const HostPath& directory : {_directory, _resources}) {
-        if (auto created = createDirectories(diskPath(directory), mine()); !created) {
+        if (auto created = createDirectories(diskPath(directory), historyOwner()); !created) {
             return std::move(created.error());
         }
     }
@@ -503,39 +387,6 @@ void SettingsHistory::removeUnfinished() const {
             removeAll(below(_directory, name));
         }
     }
-}
-
-FormerValues::FormerValues(std::string_view plugin) : _resources(resourcesOf(directoryOf(plugin))) {}
-
-void FormerValues::hide(const SecretPart& part) {
-    if (!_plain) {
-        // One reading for all changes of the operation: with all entries kept it takes a while.
-        _plain.emplace();
-        for (const std::uint64_t number : numbersIn(_resources)) {
-            const auto entry = readDictionary(resourceEntryOf(_resources, number));
-            const Array* changes = entry ? entry->get("changes").array() : nullptr;
-            for (std::size_t i = 0; changes != nullptr && i < changes->size(); ++i) {
-                const Dictionary* kept = (*changes)[i].dictionary();
-                if (kept != nullptr && kept->get("secret") != Value(true)) {
-                    (*_plain)[{textOf(kept->get("section")), textOf(kept->get("identity")), textOf(kept->get("key"))}]
-                        .insert(number);
-                }
-            }
-        }
-    }
-    const auto found = _plain->find({part.section, part.identity, part.key});
-    if (part.identity.empty() || found == _plain->end()) {
-        return;
-    }
-    for (const std::uint64_t number : found->second) {
-        const HostPath file = resourceEntryOf(_resources, number);
-        auto entry = readDictionary(file);
-        Value* list = entry ? entry->find("changes") : nullptr;
-        if (list != nullptr && list->array() != nullptr && hideIn(*list->array(), {part})) {
-            static_cast<void>(replacePlainly(*entry, file));
-        }
-    }
-    _plain->erase(found);
 }
 
 }  // namespace adminhost

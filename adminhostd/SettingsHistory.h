@@ -18,12 +18,9 @@
 #include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
-#include <array>
 #include <cstddef>
 #include <cstdint>
-#include <map>
 #include <optional>
-#include <set>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -74,23 +71,6 @@ class SettingsHistory {
     HostPath _directory;
     HostPath _resources;
     std::vector<Setting> _settings;
-};
-
-/// Hides kept values of resources when they become secret, while the operation is still running: its worker may be
-/// killed before keepResources(). For one operation: entries that are added after the first call are not seen.
-class FormerValues {
-  public:
-    explicit FormerValues(std::string_view plugin);
-
-    /// Replaces the values of this part by "(secret)" in all entries. An entry that cannot be replaced is left as it
-    /// is: keepResources() tries again and returns the error.
-    void hide(const SecretPart& part);
-
-  private:
-    using Thing = std::array<std::string, 3>;  ///< section, identity, key
-
-    HostPath _resources;
-    std::optional<std::map<Thing, std::set<std::uint64_t>>> _plain;  ///< the entries that show a value of a thing
 };
 
 }  // namespace adminhost

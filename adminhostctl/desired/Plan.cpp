@@ -6,6 +6,8 @@
 
 #include <algorithm>
 
+#include <fmt/format.h>
+
 namespace adminhost::ctl {
 namespace {
 
@@ -100,9 +102,9 @@ void planSettings(Plan& plan, const StateForm& form, const Wanted& wanted, const
         const std::string name = form.nameOf(key);
         if (moved.count(key.file) > 0 && wanted.secrets.count(name) == 0 &&
             booleanOf(state.settings.get(key.shownBy))) {
-            plan.notes.push_back(form.settingsSection() + '.' + name +
-                                 ": a secret, read from another file then; \"settings set " + name +
-                                 "\" sets it there");
+            plan.notes.push_back(
+                fmt::format("{}.{}: a secret, read from another file then; \"settings set {}\" sets it there",
+                            form.settingsSection(), name, name));
         }
     }
 }
@@ -428,19 +430,21 @@ PlanOutcome outcomeOf(const StateForm& form, const Wanted& wanted, const Plan& p
         };
         const bool isPerson = concernsPeople(form, change);
         const bool isUnread = isPerson && after && after->peopleUnread;
+        // A list without a person may be one for which the directory failed.
+        const bool isRefused = (change.hidden || isPerson) && gap != nullptr;
+        const bool lacksSecret =
+            isReadable && secret != nullptr &&
+            booleanOf(after->settings.get(secret->shownBy)) == wanted.secrets.at(change.key).empty();
+        // The report on this change may be among those that the daemon did not keep.
+        const bool isWhole = isDone && answered && report.notDoneDropped == 0;
+        const bool isUnproven = change.hidden && !isWhole && !isReported(form, change, report);
         if (isUnread && gap == nullptr) {
             (isPersonReported(change, report) ? outcome.applied : outcome.undetermined).push_back(change);
         } else if (still != remaining.end()) {
             fail(*still);
-        } else if ((change.hidden || isPerson) && gap != nullptr) {
-            // A list without a person may be one for which the directory failed.
+        } else if (isRefused || lacksSecret) {
             fail(change);
-        } else if (!isReadable) {
-            outcome.undetermined.push_back(change);
-        } else if (secret != nullptr &&
-                   booleanOf(after->settings.get(secret->shownBy)) == wanted.secrets.at(change.key).empty()) {
-            fail(change);
-        } else if (change.hidden && !(isDone && answered) && !isReported(form, change, report)) {
+        } else if (!isReadable || isUnproven) {
             outcome.undetermined.push_back(change);
         } else {
             outcome.applied.push_back(change);

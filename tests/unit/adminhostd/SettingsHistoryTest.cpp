@@ -1,3 +1,4 @@
+#include "adminhostd/FormerValues.h"
 #include "adminhostd/SettingsHistory.h"
 #include "tests/support/CapturedLog.h"
 #include "tests/support/TemporaryRoot.h"

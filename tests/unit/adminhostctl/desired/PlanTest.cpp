@@ -330,6 +330,17 @@ TEST(Outcome, SecretThatWasAppliedIsToldFromTheReportOfWhatWasNot) {
     EXPECT_EQ(outcome(reported, false).undetermined.size(), 1U);
 }
 
+TEST(Outcome, SecretIsUndeterminedIfItsReportMayBeAmongThoseThatTheDaemonDropped) {
+    Wanted wanted;
+    wanted.elements["properties"].push_back(secretly(element("token", {{"value", "new"}})));
+    const Plan plan = planOf(form(), wanted, sample());
+    RequestReport report = done();
+    report.notDoneDropped = 1;
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), sample(), true, report).undetermined, plan.changes);
+    report.changes.push_back({"properties", "4", "token", "value", {}, {}, true});
+    EXPECT_EQ(outcomeOf(form(), wanted, plan, sample(), sample(), true, report).applied, plan.changes);
+}
+
 TEST(Outcome, ProtectionThatWasSwitchedOffWithoutItsTextWasNotApplied) {
     Wanted wanted;
     wanted.elements["properties"].push_back(element("token", {{"protect", false}}));
