@@ -112,6 +112,7 @@ class Daemon {
     }
 
     [[nodiscard]] pid_t process() const noexcept { return _process; }
+    [[nodiscard]] const std::string& socket() const noexcept { return _socket; }
 
     /// Sends one request on a connection of its own and returns the whole answer.
     [[nodiscard]] std::string request(const std::string& command, const std::string& body) const {

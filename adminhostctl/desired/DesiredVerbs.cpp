@@ -40,7 +40,7 @@ ExitStatus settingsGet(const Context& context, Words arguments) {
                              "\" shows whether it is set");
         }
     }
-    const Dictionary settings = readState(context, form.settingsSection()).state.settings;
+    const Dictionary settings = readSettings(context).state.settings;
     if (arguments.empty()) {
         writeValue(context, settings, command.description, form.root());
         return ExitStatus::done;
@@ -75,7 +75,7 @@ ExitStatus settingsSet(const Context& context, Words arguments) {
         wanted.settings.set(name, valueOfWord(key, wordAt(arguments, 1), context.sources));
     }
     wanted.lookUp = true;
-    const CurrentState current = readState(context);
+    const CurrentState current = readSettings(context);
     if (context.options.has(validateOption) && !passTrials(context, wanted, current)) {
         throw Failure(ExitStatus::failed, "nothing was written, because the setting failed a trial");
     }

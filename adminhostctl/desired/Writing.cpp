@@ -140,7 +140,7 @@ class PlannedWrite {
     ExitStatus perform() {
         CommandAnswer answer;
         try {
-            answer = _context.service.ask(_command, {{_current.form.root(), _plan.root}}, _current.revision);
+            answer = _context.service.ask(_command, request(), _current.revision);
         } catch (const LostAnswer& lost) {
             return afterLost(lost);
         }
@@ -179,6 +179,17 @@ class PlannedWrite {
     }
 
   private:
+    /// The write, which returns only the section that was read before: the others may be much larger.
+    [[nodiscard]] Dictionary request() const {
+        Dictionary request{{_current.form.root(), _plan.root}};
+        for (const DictionaryEntry& entry :
+             _context.service.stateCommand("read").description.partOf(_current.section)) {
+            if (_command.description.key(entry.key) != nullptr) {
+                request.set(entry.key, entry.value);
+            }
+        }
+        return request;
+    }
     /// Nothing is sent again: reading and the daemon's report show what was written.
     ExitStatus afterLost(const LostAnswer& lost) {
         const RequestReport report = reportLost(_context, lost);
@@ -186,7 +197,7 @@ class PlannedWrite {
         // While the request is running, reading would only wait for it, and the state is not final.
         if (report.state == RequestReport::State::done || report.state == RequestReport::State::unknown) {
             try {
-                CurrentState current = readState(_context);
+                CurrentState current = readState(_context, _current.section);
                 if (current.unread.empty()) {
                     after = std::move(current.state);
                 } else {
@@ -264,7 +275,11 @@ CurrentState readState(const Context& context, const std::string& section) {
     }
     State state = stateOf(form, *root);
     std::vector<ReportedGap> unread = context.service.gapsOf(answer);
-    return {std::move(form), std::move(state), answer.revision, std::move(unread)};
+    return {std::move(form), std::move(state), answer.revision, std::move(unread), section};
+}
+
+CurrentState readSettings(const Context& context) {
+    return readState(context, StateForm(context.service.stateCommand("write").description).settingsSection());
 }
 
 void requireWhole(const CurrentState& current) {

@@ -15,10 +15,15 @@ struct CurrentState {
     State state;
     std::string revision;
     std::vector<ReportedGap> unread;  ///< parts that the service could not read: they look empty
+    std::string section;              ///< the only section that was read; empty: all of them
 };
 
-/// Reads the state, or only one section of it. Throws Failure if the service does not return it.
+/// Reads the state, or only one section of it. A write that depends on it may then change only this section, and reads
+/// only this section back. Throws Failure if the service does not return it.
 [[nodiscard]] CurrentState readState(const Context& context, const std::string& section = {});
+
+/// Reads the section of the settings only.
+[[nodiscard]] CurrentState readSettings(const Context& context);
 
 /// Throws Failure(failed) with the reasons if parts of the state could not be read.
 void requireWhole(const CurrentState& current);

@@ -40,7 +40,7 @@ ExitStatus reportUnread(const Context& context, const Listing& listing) {
 
 /// Changes one element, which the person has named.
 ExitStatus change(const Context& context, const ElementKind& kind, const std::string& name, WantedElement wanted) {
-    const CurrentState current = readState(context);
+    const CurrentState current = readState(context, kind.section);
     requireWhole(current);
     const Element* element = findByAnyName(current.state, current.form.list(kind.section), name);
     if (element == nullptr) {

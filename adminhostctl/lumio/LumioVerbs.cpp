@@ -31,7 +31,7 @@ ExitStatus changeProperty(const Context& context, WantedElement element, const C
 }
 
 ExitStatus propertySet(const Context& context, Words arguments) {
-    const CurrentState current = readState(context);
+    const CurrentState current = readState(context, property.section);
     const ListForm& list = current.form.list(property.section);
     const Element* stored = findElement(current.state, list, arguments.front());
     WantedElement wanted = wantedOf(arguments.front());
@@ -55,7 +55,7 @@ ExitStatus propertySet(const Context& context, Words arguments) {
 }
 
 ExitStatus propertyRemove(const Context& context, Words arguments) {
-    const CurrentState current = readState(context);
+    const CurrentState current = readState(context, property.section);
     if (findElement(current.state, current.form.list(property.section), arguments.front()) == nullptr) {
         throw notFound(property, arguments.front());
     }
