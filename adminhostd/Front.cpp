@@ -111,6 +111,11 @@ std::optional<HttpAnswer> Front::missing(const Target& target) const {
                            fmt::format("The plug-in \"{}\" has no command \"{}\". Known commands: {}.", target.plugin,
                                        target.command, namesIn(plugin->commands)));
     }
+    if (target.kind == Target::Kind::command && !commandOf(target)->served) {
+        return errorAnswer(501, "NOT_SERVED",
+                           fmt::format("The plug-in \"{}\" describes the command \"{}\", but does not serve it yet.",
+                                       target.plugin, target.command));
+    }
     return std::nullopt;
 }
 
@@ -136,6 +141,14 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target&
                                         fmt::format("This address is for {} only.", post ? "POST" : "GET and HEAD"));
         answer.headers.emplace_back("Allow", post ? "POST" : "GET, HEAD");
         return answer;
+    }
+    if (const auto deadline = exchange.header("Request-Deadline"); deadline && !deadlineOf(*deadline)) {
+        return errorAnswer(400, "MALFORMED_DEADLINE",
+                           "Request-Deadline must be a whole number of seconds, at least 1.");
+    }
+    if (exchange.hasArgument("check") && (!post || exchange.argument("check") != "1")) {
+        return errorAnswer(400, "MALFORMED_ADDRESS",
+                           "The argument \"check\" must be 1 and is for commands only: then only the check runs.");
     }
     if (post && !bodyFormOf(exchange.header("Content-Type").value_or(""))) {
         return errorAnswer(415, "UNSUPPORTED_TYPE",

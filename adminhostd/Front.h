@@ -43,7 +43,7 @@ class Front {
 
     /// Uses the id that the client may have sent as the exchange's. Returns an answer if that id is rejected.
     std::optional<HttpAnswer> adoptId(Exchange& exchange, const Target& target);
-    /// Returns the answer if the plug-in or its command does not exist.
+    /// Returns the answer if the plug-in or its command does not exist, or if the command is not served.
     [[nodiscard]] std::optional<HttpAnswer> missing(const Target& target) const;
     [[nodiscard]] std::optional<HttpAnswer> refusal(const Exchange& exchange, const Target& target) const;
     void serve(Exchange& exchange, const Target& target);

@@ -81,7 +81,9 @@ HttpAnswer answerFor(const Unserved& unserved) {
     using Reason = Unserved::Reason;
     switch (unserved.reason) {
         case Reason::overrun:
-            return errorAnswer(504, "DEADLINE_EXCEEDED", "The command did not end in time and was stopped.");
+            return errorAnswer(
+                504, "DEADLINE_EXCEEDED",
+                unserved.message.empty() ? "The command did not end in time and was stopped." : unserved.message);
         case Reason::unavailable:
             return retryLater("WORKER_UNAVAILABLE", unserved.message);
         case Reason::stopping:

@@ -36,6 +36,14 @@ BodyForm wantedForm(const Exchange& exchange) {
     return exchange.wantsPropertyList() ? BodyForm::propertyList : BodyForm::json;
 }
 
+/// When the request must have ended, if its client has sent a bound. It counts from the arrival, so that the time in
+/// the queue is part of it.
+std::optional<std::chrono::steady_clock::time_point> endByOf(const Exchange& exchange, const RequestRecord& record) {
+    const auto header = exchange.header("Request-Deadline");
+    const auto deadline = header ? deadlineOf(*header) : std::nullopt;
+    return deadline ? std::optional(record.arrival + *deadline) : std::nullopt;
+}
+
 }  // namespace
 
 void Front::operation(Exchange& exchange, const Target& target) {
@@ -68,7 +76,9 @@ void Front::operation(Exchange& exchange, const Target& target) {
                                   "revision only."));
     }
     operation.deadline = command.deadline;
-    operation.changes = command.access != Access::read;
+    operation.endBy = endByOf(exchange, record);
+    const bool checkOnly = exchange.argument("check") == "1";
+    operation.changes = command.access != Access::read && !checkOnly;
     operation.order = protocol::Perform{
         .request = record.id,
         .plugin = record.plugin,
@@ -77,8 +87,10 @@ void Front::operation(Exchange& exchange, const Target& target) {
         .received = record.received,
         .arguments = std::move(*request),
         .revisions = std::move(*revisions),
-        .showsRevision = command.showsRevision,
+        // A client that has written goes on with the revision that its own write left.
+        .showsRevision = command.showsRevision || command.takesRevision,
         .keepsHistory = command.takesRevision,
+        .checkOnly = checkOnly,
         .milliseconds = 0,
         .form = wantedForm(exchange),
     };
@@ -135,6 +147,7 @@ void Front::query(Exchange& exchange, const Target& target) {
         return;
     }
     operation.order = *std::move(order);
+    operation.endBy = endByOf(exchange, *operation.record);
     if (target.kind == Target::Kind::doctor) {
         operation.deadline = doctorBound;
         operation.beginBy = std::chrono::steady_clock::now() + doctorWait;

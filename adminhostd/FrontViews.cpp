@@ -11,6 +11,9 @@
 namespace adminhost {
 namespace {
 
+/// The version of the addresses and answers. Raised when a client could break; additions do not raise it.
+constexpr int interfaceVersion = 1;
+
 std::string_view nameOf(Access access) {
     switch (access) {
         case Access::read:
@@ -36,6 +39,9 @@ Dictionary describe(const Command& command) {
     described.set("showsRevision", command.showsRevision);
     described.set("takesRevision", command.takesRevision);
     described.set("needs", Array(command.needs.begin(), command.needs.end()));
+    if (!command.served) {
+        described.set("served", false);
+    }
     if (command.deadline.count() > 0) {
         described.set("deadlineSeconds", command.deadline.count());
     }
@@ -72,7 +78,10 @@ HttpAnswer Front::overview() const {
     for (const protocol::RefusedPlugin& plugin : refusedPlugins()) {
         refused.emplace_back(Dictionary{{"file", plugin.file}, {"reason", plugin.reason}});
     }
-    Dictionary text{{"release", ADMINHOST_RELEASE}, {"plugins", std::move(plugins)}};
+    Dictionary text{{"release", ADMINHOST_RELEASE},
+                    {"interface", interfaceVersion},
+                    {"deadlineSeconds", std::chrono::duration<double>(_queue.deadline()).count()},
+                    {"plugins", std::move(plugins)}};
     text.set("refusedPlugins", refused.empty() ? Value() : Value(std::move(refused)));
     if (const Operation* running = _queue.running()) {
         Dictionary description = running->record->describe(false);

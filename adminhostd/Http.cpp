@@ -80,6 +80,13 @@ std::string_view Exchange::argument(const char* name) const {
     return value == nullptr ? std::string_view() : std::string_view(value);
 }
 
+bool Exchange::hasArgument(std::string_view name) const {
+    const char* value = nullptr;
+    std::size_t size = 0;
+    return ::MHD_lookup_connection_value_n(_connection, MHD_GET_ARGUMENT_KIND, name.data(), name.size(), &value,
+                                           &size) == MHD_YES;
+}
+
 bool Exchange::clientGone() const noexcept {
     // The library gives up a client that has closed only its sending half, too.
     pollfd entry{_socket, POLLRDHUP, 0};

@@ -72,6 +72,8 @@ class Exchange {
     [[nodiscard]] std::string_view argument(const char* name) const;
     /// The answer to a head that has an error or can be read in more than one way; nullopt if it is well-formed.
     [[nodiscard]] const std::optional<HttpAnswer>& headProblem() const noexcept { return _headProblem; }
+    /// Returns true if the address's query has this name, with or without a value.
+    [[nodiscard]] bool hasArgument(std::string_view name) const;
     /// Returns true if the answer's text is to be a property list, and false for JSON.
     [[nodiscard]] bool wantsPropertyList() const;
     /// Replaces the id by the client's own.

@@ -65,8 +65,8 @@ constexpr auto members<Perform> = std::tuple(
     member("perform.command", &Perform::command), member("perform.caller", &Perform::caller),
     member("perform.received", &Perform::received), member("perform.arguments", &Perform::arguments),
     member("perform.revisions", &Perform::revisions), member("perform.showsRevision", &Perform::showsRevision),
-    member("perform.keepsHistory", &Perform::keepsHistory), member("perform.milliseconds", &Perform::milliseconds),
-    member("perform.form", &Perform::form));
+    member("perform.keepsHistory", &Perform::keepsHistory), member("perform.checkOnly", &Perform::checkOnly),
+    member("perform.milliseconds", &Perform::milliseconds), member("perform.form", &Perform::form));
 template <>
 constexpr auto members<FindAccounts> = std::tuple(member("findAccounts.match", &FindAccounts::match),
                                                   member("findAccounts.is", &FindAccounts::is),
@@ -84,13 +84,11 @@ constexpr auto members<ReadLog> = std::tuple(member("readLog.plugin", &ReadLog::
                                              member("readLog.milliseconds", &ReadLog::milliseconds),
                                              member("readLog.form", &ReadLog::form));
 template <>
-constexpr auto members<Command> = std::tuple(member("command.name", &Command::name),
-                                             member("command.access", &Command::access),
-                                             member("command.showsRevision", &Command::showsRevision),
-                                             member("command.takesRevision", &Command::takesRevision),
-                                             member("command.needs", &Command::needs),
-                                             member("command.deadline", &Command::deadline),
-                                             member("command.description", &Command::description));
+constexpr auto members<Command> = std::tuple(
+    member("command.name", &Command::name), member("command.access", &Command::access),
+    member("command.showsRevision", &Command::showsRevision), member("command.takesRevision", &Command::takesRevision),
+    member("command.needs", &Command::needs), member("command.deadline", &Command::deadline),
+    member("command.served", &Command::served), member("command.description", &Command::description));
 template <>
 constexpr auto members<OfferedPlugin> = std::tuple(member("offered.name", &OfferedPlugin::name),
                                                    member("offered.version", &OfferedPlugin::version),

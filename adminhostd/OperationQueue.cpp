@@ -62,6 +62,7 @@ std::optional<OperationQueue::Clock::time_point> OperationQueue::due() const {
     consider(_directoryProbe.due());
     for (const Operation& operation : _waiting) {
         consider(operation.beginBy);
+        consider(operation.endBy);
     }
     return first;
 }
@@ -113,7 +114,8 @@ void OperationQueue::giveUpWaiting() {
     const auto now = Clock::now();
     std::vector<Operation> late;
     for (auto one = _waiting.begin(); one != _waiting.end();) {
-        if (one->beginBy && now >= *one->beginBy) {
+        // A change that did not get the lock says so itself (next()).
+        if ((one->beginBy && now >= *one->beginBy) || (one->endBy && !one->locked && now >= *one->endBy)) {
             late.push_back(std::move(*one));
             one = _waiting.erase(one);
         } else {
@@ -121,7 +123,14 @@ void OperationQueue::giveUpWaiting() {
         }
     }
     for (const Operation& operation : late) {
-        _events.finished(operation, Unserved{Unserved::Reason::notBegun, "The worker is busy with another request."});
+        if (operation.endBy && now >= *operation.endBy) {
+            _events.finished(operation,
+                             Unserved{Unserved::Reason::overrun,
+                                      "The deadline passed while the request was waiting; nothing was done."});
+        } else {
+            _events.finished(operation,
+                             Unserved{Unserved::Reason::notBegun, "The worker is busy with another request."});
+        }
     }
 }
 
@@ -295,7 +304,11 @@ void OperationQueue::next() {
 void OperationQueue::begin(Operation operation) {
     const auto now = Clock::now();
     if (!operation.until) {
-        operation.until = now + (operation.deadline > 0ms ? operation.deadline : _settings.deadline);
+        operation.until =
+            now + (operation.deadline > 0ms ? std::min(operation.deadline, _settings.deadline) : _settings.deadline);
+        if (operation.endBy) {
+            operation.until = std::min(*operation.until, *operation.endBy);
+        }
     }
     const auto left = std::chrono::ceil<std::chrono::milliseconds>(*operation.until - now);
     std::visit(

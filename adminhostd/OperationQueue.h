@@ -28,13 +28,15 @@ struct Operation {
     Exchange* exchange;
     std::shared_ptr<RequestRecord> record;
     protocol::ToWorker order = {};                ///< without the time that is left
-    std::chrono::milliseconds deadline = {};      ///< its own; zero: the queue's
+    std::chrono::milliseconds deadline = {};      ///< its own, if it is shorter than the queue's; zero: none
     bool changes = false;                         ///< the worker runs it only while it holds the lock for changes
     std::optional<protocol::Answer> locked = {};  ///< of the last worker that did not get the lock
     /// The end of its time, counted from its first start.
     std::optional<std::chrono::steady_clock::time_point> until = {};
     /// When it is given up unless it has begun.
     std::optional<std::chrono::steady_clock::time_point> beginBy = {};
+    /// When it must have ended, whatever its deadline: the client's own bound.
+    std::optional<std::chrono::steady_clock::time_point> endBy = {};
 };
 
 /// Why an operation ended without a worker's answer.
@@ -78,6 +80,8 @@ class OperationQueue {
     void add(Operation operation);
     [[nodiscard]] const Operation* running() const noexcept { return _running ? &*_running : nullptr; }
     [[nodiscard]] std::size_t waiting() const noexcept { return _waiting.size(); }
+    /// The longest time that an operation may run.
+    [[nodiscard]] std::chrono::milliseconds deadline() const noexcept { return _settings.deadline; }
     [[nodiscard]] std::optional<pid_t> workerPid() const;
     /// Why there is no worker that can serve now; nullopt if there is one, or if one is being started.
     [[nodiscard]] std::optional<std::string> workerProblem() const;

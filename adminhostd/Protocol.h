@@ -81,6 +81,7 @@ struct Perform {
     std::vector<std::string> revisions;  ///< one of them must be the present one; empty: no condition
     bool showsRevision = false;          ///< the answer is to carry the revision
     bool keepsHistory = false;           ///< the settings are to be kept before it runs
+    bool checkOnly = false;              ///< only the plug-in's check is to run
     std::uint64_t milliseconds = 0;      ///< until its deadline
     BodyForm form = BodyForm::json;      ///< that the client prefers
     bool operator==(const Perform&) const = default;

@@ -5,6 +5,8 @@
 
 #include <algorithm>
 #include <charconv>
+#include <cstdint>
+#include <system_error>
 
 #include <fmt/format.h>
 #include <strings.h>
@@ -99,6 +101,19 @@ bool prefersPropertyList(std::string_view accept) {
         }
     }
     return list > 0 && list >= (jsonIsNamed ? json : other);
+}
+
+std::optional<std::chrono::seconds> deadlineOf(std::string_view requestDeadline) {
+    constexpr std::uint64_t longest = 1'000'000;
+    const std::string_view digits = trimmed(requestDeadline);
+    std::uint64_t seconds = 0;
+    const auto [rest, failure] = std::from_chars(digits.data(), digits.data() + digits.size(), seconds);
+    if (failure == std::errc::result_out_of_range && rest == digits.data() + digits.size()) {
+        seconds = longest;
+    } else if (failure != std::errc() || rest != digits.data() + digits.size() || seconds == 0) {
+        return std::nullopt;
+    }
+    return std::chrono::seconds(std::min(seconds, longest));
 }
 
 std::optional<std::vector<std::string>> revisionsOf(std::string_view ifMatch) {

@@ -4,6 +4,7 @@
 
 #include "platform/value/Value.h"
 
+#include <chrono>
 #include <cstddef>
 #include <optional>
 #include <string>
@@ -36,5 +37,9 @@ struct BodyProblem {
 /// The revisions that an If-Match header lists; an empty list for "*". Returns nullopt if the header is malformed or
 /// empty.
 [[nodiscard]] std::optional<std::vector<std::string>> revisionsOf(std::string_view ifMatch);
+
+/// The time that a Request-Deadline header allows: a whole number of seconds, at least 1. Returns nullopt if it is
+/// malformed. A very long time is shortened, because no operation may run that long.
+[[nodiscard]] std::optional<std::chrono::seconds> deadlineOf(std::string_view requestDeadline);
 
 }  // namespace adminhost

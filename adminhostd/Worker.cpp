@@ -182,6 +182,9 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
         answer.findings = *std::move(findings);
         return answer;
     }
+    if (order.checkOnly) {
+        return written(Outcome::answered, Dictionary{{"findings", Array()}}, order.form);
+    }
     const auto deadline = Clock::now() + std::chrono::milliseconds(order.milliseconds);
     if (const auto unmet = _plugins.unmetNeed(loaded, order.command, std::chrono::milliseconds(order.milliseconds))) {
         return unmetAnswer(*unmet, order.form);
@@ -234,19 +237,21 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
     if (!response) {
         return failed(response.error());
     }
-    std::string revision;
-    if (order.showsRevision && response->kind() != Response::Kind::error) {
-        if (auto now = callPlugin([&] { return plugin.revision(); })) {
-            revision = *std::move(now);
-        } else {
-            logEvent(fmt::format("adminhostd: {} failed to give its revision: {}", loaded.name,
-                                 textOf(now.error().description)));
-        }
-    }
     // If a tool was killed at the deadline, the answer would mislead: only the overrun is reported.
     if (Clock::now() >= deadline) {
         answer.outcome = Outcome::overrun;
         return answer;
+    }
+    std::string revision;
+    if (order.showsRevision && response->kind() != Response::Kind::error) {
+        auto now = callPlugin([&] { return plugin.revision(); });
+        // Past the deadline its tools were killed, and it may be the revision of half of the settings.
+        if (now && Clock::now() < deadline) {
+            revision = *std::move(now);
+        } else {
+            logEvent(fmt::format("adminhostd: {} failed to give its revision: {}", loaded.name,
+                                 now ? "the deadline has passed" : textOf(now.error().description)));
+        }
     }
     switch (response->kind()) {
         case Response::Kind::nothing:

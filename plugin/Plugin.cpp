@@ -90,6 +90,7 @@ class LumioPlugin final : public adminhost::Plugin {
             command.takesRevision = row.takesRevision;
             command.needs.assign(row.needs.begin(), row.needs.end());
             command.deadline = std::chrono::seconds(row.deadlineSeconds);
+            command.served = operationNamed(row.name) != nullptr;
             command.description = *(*described.array())[all.size()].dictionary();
             all.push_back(std::move(command));
         }

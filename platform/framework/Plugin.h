@@ -38,7 +38,8 @@ struct ADMINHOST_EXPORT Command {
     bool showsRevision = false;       ///< its response includes revision()
     bool takesRevision = false;       ///< accepts If-Match, and changes settings(): the host keeps their history
     std::vector<std::string> needs;   ///< names for probe(); each must be usable before perform() is called
-    std::chrono::seconds deadline{};  ///< its own bound; zero: the daemon's
+    std::chrono::seconds deadline{};  ///< its own bound, if it is shorter than the daemon's; zero: none
+    bool served = true;               ///< false: described for clients, but perform() has no operation for it yet
     /// For clients: summary, keys, answer, errors, example (commands/README.md). The host adds the members above.
     Dictionary description;
 

@@ -19,6 +19,7 @@ Perform perform() {
             .revisions = {"r1", ""},
             .showsRevision = true,
             .keepsHistory = true,
+            .checkOnly = true,
             .milliseconds = 300'000,
             .form = BodyForm::propertyList};
 }
@@ -92,13 +93,14 @@ Answer answer(Outcome outcome) {
 
 std::vector<ToFront> messagesToFront() {
     std::vector<ToFront> messages{
-        Hello{.plugins = {{.name = "p",
-                           .version = "1",
-                           .file = "/p.so",
-                           .commands = {{"c", Access::control, true, true, {"n"}, 5s, Dictionary{{"summary", "s"}}},
-                                        {"d", Access::read, {}, {}, {}, {}, {}},
-                                        {"e", Access::write, {}, {}, {}, {}, {}},
-                                        {"f", Access::account, {}, {}, {}, {}, {}}}}},
+        Hello{.plugins =
+                  {{.name = "p",
+                    .version = "1",
+                    .file = "/p.so",
+                    .commands = {{"c", Access::control, true, true, {"n"}, 5s, false, Dictionary{{"summary", "s"}}},
+                                 {"d", Access::read, {}, {}, {}, {}, true, {}},
+                                 {"e", Access::write, {}, {}, {}, {}, true, {}},
+                                 {"f", Access::account, {}, {}, {}, {}, true, {}}}}},
               .refused = {{"/q.so", "why"}},
               .problems = {"none", ""}},
         Hello{},

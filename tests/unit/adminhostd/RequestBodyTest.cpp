@@ -87,5 +87,14 @@ TEST(RevisionsOf, ReadsAListOfQuotedTexts) {
     }
 }
 
+TEST(RequestDeadline, IsAWholeNumberOfSecondsFromOne) {
+    EXPECT_EQ(deadlineOf("1"), std::chrono::seconds(1));
+    EXPECT_EQ(deadlineOf(" 300 "), std::chrono::seconds(300));
+    EXPECT_EQ(deadlineOf("18446744073709551616"), std::chrono::seconds(1'000'000)) << "longer than any operation";
+    for (const char* text : {"", " ", "0", "00", "-1", "+1", "1.5", "1s", "1 2", "soon"}) {
+        EXPECT_FALSE(deadlineOf(text)) << text;
+    }
+}
+
 }  // namespace
 }  // namespace adminhost
