@@ -1,6 +1,7 @@
 #include "adminhostd/ConfigurationEntry.h"
 #include "adminhostd/DirectoryConfiguration.h"
 #include "adminhostd/Options.h"
+#include "adminhostd/PermissionConfiguration.h"
 #include "platform/files/File.h"
 
 #include <cmath>
@@ -27,7 +28,8 @@ constexpr std::string_view knownKeys[] = {"plugins",
                                           "client_timeout_seconds",
                                           "queue_limit",
                                           "log",
-                                          "directory"};
+                                          "directory",
+                                          "permission"};
 
 void apply(const ConfigurationEntry& entry, Options& options) {
     constexpr std::int64_t longestQueue = 10'000;
@@ -59,6 +61,8 @@ void apply(const ConfigurationEntry& entry, Options& options) {
         options.logToStandardError = entry.choice<bool>({{"syslog", false}, {"stderr", true}});
     } else if (entry.key() == "directory") {
         readDirectory(entry, options.directory);
+    } else if (entry.key() == "permission") {
+        readPermissions(entry, options.permissions);
     } else {
         entry.rejectAsUnknown(knownKeys);
     }

@@ -19,6 +19,7 @@
 
 #include <fmt/format.h>
 #include <sys/signalfd.h>
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
@@ -52,7 +53,8 @@ class Daemon {
           _signals(stopSignals()),
           _front({workerConfiguration(options, plugins, tools.directory()), options.logToStandardError,
                   options.queueLimit, options.deadline},
-                 plugins.refused, FrontChecks(options)) {}
+                 plugins.refused, FrontChecks(options),
+                 Permissions(options.permissions, ::geteuid(), configurationFile(options))) {}
 
     void run() {
         for (;;) {

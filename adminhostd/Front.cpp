@@ -11,16 +11,31 @@
 
 #include <fmt/format.h>
 #include <fmt/ranges.h>
-#include <unistd.h>
 
 namespace adminhost {
 namespace {
 
 constexpr std::size_t keptName = 100;  ///< bytes of an unknown name that are remembered and logged
 
-/// These accounts also see the reports of others' requests.
-bool permitted(const Peer& peer) {
-    return peer.uid == 0 || peer.uid == ::geteuid();
+/// The class that a target needs; nullopt if any class will do. A command that does not exist needs none: a client with
+/// any right may know which ones there are.
+std::optional<Right> neededFor(const Target& target, const Command* command) {
+    using Kind = Target::Kind;
+    switch (target.kind) {
+        case Kind::command:
+            return command == nullptr ? std::nullopt : std::optional(rightFor(command->access));
+        case Kind::directory:
+        case Kind::history:
+        case Kind::doctor:
+        case Kind::logs:
+            return Right::read;
+        case Kind::unknown:
+        case Kind::overview:
+        case Kind::plugin:
+        case Kind::request:
+            break;
+    }
+    return std::nullopt;
 }
 
 /// The names of plug-ins or commands, for a message.
@@ -40,15 +55,21 @@ const auto* elementNamed(const auto& named, std::string_view name) {
 
 }  // namespace
 
-Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks)
+Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks,
+             Permissions permissions)
     : _checks(std::move(checks)),
+      _permissions(std::move(permissions)),
       _refused(std::move(refused)),
       _queue(std::move(settings),
              {[this](protocol::Hello hello) { welcome(std::move(hello)); },
               [](const std::string& event) { logEvent(event); }, [this](const SecretPart& part) { _log.hide(part); },
               [this](const Operation& operation, OperationQueue::Ending ending) {
                   finished(operation, std::move(ending));
-              }}) {}
+              }}) {
+    for (const std::string& problem : _permissions.problems()) {
+        logEvent("adminhostd: " + problem);
+    }
+}
 
 std::vector<protocol::RefusedPlugin> Front::refusedPlugins() const {
     std::vector<protocol::RefusedPlugin> refused = _refused;
@@ -119,6 +140,22 @@ std::optional<HttpAnswer> Front::missing(const Target& target) const {
     return std::nullopt;
 }
 
+std::optional<HttpAnswer> Front::forbidden(const Exchange& exchange, const Target& target) {
+    const Peer& peer = exchange.peer();
+    const Rights rights = _permissions.of(peer);
+    const std::optional<Right> needed = rights.any() ? neededFor(target, commandOf(target)) : Right::read;
+    if (!needed || rights.has(*needed)) {
+        return std::nullopt;
+    }
+    return errorAnswer(403, "NOT_PERMITTED", _permissions.refusal(peer, _names.of(peer.uid), *needed));
+}
+
+const RequestRecord* Front::requestFor(const Peer& peer, std::string_view id) const {
+    const RequestRecord* record = _log.find(id);
+    const bool visible = record != nullptr && (record->peer.uid == peer.uid || _permissions.of(peer).has(Right::read));
+    return visible ? record : nullptr;
+}
+
 std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target& target) const {
     using Kind = Target::Kind;
     if (target.kind == Kind::unknown) {
@@ -159,14 +196,11 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target&
 
 std::variant<HttpAnswer, HttpServer::Serve> Front::head(Exchange& exchange) {
     const Target target = targetOf(exchange.path());
-    const bool stranger = !permitted(exchange.peer());
-    std::optional<HttpAnswer> answer;
-    if (stranger) {
-        answer = errorAnswer(403, "NOT_PERMITTED",
-                             fmt::format("The account with uid {} may not use this daemon.", exchange.peer().uid));
-    } else if (exchange.headProblem()) {
+    std::optional<HttpAnswer> answer = forbidden(exchange, target);
+    const bool stranger = answer.has_value();
+    if (!answer && exchange.headProblem()) {
         answer = exchange.headProblem();  // and its id stays unused: nothing in such a head is trusted
-    } else {
+    } else if (!answer) {
         answer = adoptId(exchange, target);
     }
     if (!answer) {
@@ -202,12 +236,12 @@ void Front::serve(Exchange& exchange, const Target& target) {
             return;
         }
         case Target::Kind::request: {
-            const RequestRecord* record = _log.find(target.command);
+            const RequestRecord* record = requestFor(exchange.peer(), target.command);
             if (record == nullptr) {  // forgotten while the body was being received
                 exchange.answer(unknownRequest(target.command));
                 return;
             }
-            const bool withReports = exchange.peer().uid == record->peer.uid || permitted(exchange.peer());
+            const bool withReports = exchange.peer().uid == record->peer.uid || _permissions.isOwn(exchange.peer());
             exchange.answer({200, record->describe(withReports), {}});
             return;
         }

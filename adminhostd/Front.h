@@ -2,9 +2,11 @@
 
 // The front: what each address serves, which clients are permitted, and the audit.
 
+#include "adminhostd/AccountNames.h"
 #include "adminhostd/FrontChecks.h"
 #include "adminhostd/Http.h"
 #include "adminhostd/OperationQueue.h"
+#include "adminhostd/Permissions.h"
 #include "adminhostd/RequestLog.h"
 #include "adminhostd/Target.h"
 
@@ -23,7 +25,8 @@ class Front {
   public:
     /// `settings` configures the workers; `refused` are the plug-ins that are not even offered to them. Creates the
     /// queue, which starts a worker for the operations.
-    Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks);
+    Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks,
+          Permissions permissions);
     Front(const Front&) = delete;
     Front& operator=(const Front&) = delete;
 
@@ -45,6 +48,11 @@ class Front {
     std::optional<HttpAnswer> adoptId(Exchange& exchange, const Target& target);
     /// Returns the answer if the plug-in or its command does not exist, or if the command is not served.
     [[nodiscard]] std::optional<HttpAnswer> missing(const Target& target) const;
+    /// Returns the answer if the client lacks the right to what the target names. It is the same for every target to a
+    /// client without any right, which must not find out what exists.
+    [[nodiscard]] std::optional<HttpAnswer> forbidden(const Exchange& exchange, const Target& target);
+    /// The request of this id, if the client may know of it: its own, or with the right to read, any; null if not.
+    [[nodiscard]] const RequestRecord* requestFor(const Peer& peer, std::string_view id) const;
     [[nodiscard]] std::optional<HttpAnswer> refusal(const Exchange& exchange, const Target& target) const;
     void serve(Exchange& exchange, const Target& target);
     [[nodiscard]] HttpAnswer overview() const;
@@ -62,6 +70,8 @@ class Front {
     static void end(const Operation& operation, HttpAnswer answer, std::string_view code);
 
     FrontChecks _checks;
+    Permissions _permissions;
+    AccountNames _names;
     RequestLog _log;
     std::vector<protocol::RefusedPlugin> _refused;  ///< before they were offered to a worker
     std::optional<protocol::Hello> _hello;          ///< of the latest worker

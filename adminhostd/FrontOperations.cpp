@@ -57,8 +57,10 @@ void Front::operation(Exchange& exchange, const Target& target) {
     };
 
     // A new worker may have loaded other plug-ins since the head arrived.
-    if (auto answer = missing(target)) {
-        return refuse(std::move(*answer));
+    for (auto answer : {missing(target), forbidden(exchange, target)}) {
+        if (answer) {
+            return refuse(std::move(*answer));
+        }
     }
     const Command& command = *commandOf(target);
     BodyProblem problem;

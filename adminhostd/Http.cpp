@@ -242,11 +242,8 @@ bool HttpServer::acceptOne() {
             return true;
         }
     }
-    // Now, because the process may have ended when its request runs.
-    const uid_t login = loginOf(credentials.pid, credentials.uid);
     try {
-        _clients.push_back(
-            {socket.get(), {credentials.uid, credentials.gid, credentials.pid, login}, true, Clock::now()});
+        _clients.push_back({socket.get(), peerOf(socket.get(), credentials), true, Clock::now()});
     } catch (...) {
         _limits.remove(credentials.uid);
         throw;

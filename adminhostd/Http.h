@@ -4,7 +4,7 @@
 // own loop drives.
 
 #include "adminhostd/ConnectionLimits.h"
-#include "adminhostd/Login.h"
+#include "adminhostd/Peer.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/value/Value.h"
 
@@ -32,14 +32,6 @@ constexpr std::size_t bodyMaximum = std::size_t{8} << 20U;  ///< bytes of a requ
 /// Bytes of all answers that clients have not read yet. Above it, the oldest of them is dropped with its connection.
 /// The newest never is, so that an answer of any size arrives.
 constexpr std::size_t unreadMaximum = std::size_t{64} << 20U;
-
-/// The process at the other end, as the kernel knew it when it connected.
-struct Peer {
-    uid_t uid = static_cast<uid_t>(-1);
-    gid_t gid = static_cast<gid_t>(-1);
-    pid_t pid = 0;
-    uid_t login = noLogin;  ///< the account of its login session, read when the connection was accepted
-};
 
 /// The text of an answer, in the form that its client prefers (Exchange::wantsPropertyList()).
 struct AnswerText {

@@ -94,4 +94,8 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
     return options;
 }
 
+std::string configurationFile(const Options& options) {
+    return options.configuration.empty() ? diskPath(HostPath(defaultConfiguration)).text() : options.configuration;
+}
+
 }  // namespace adminhost

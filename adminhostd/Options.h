@@ -3,6 +3,7 @@
 // The daemon's options: its command line and its configuration file.
 
 #include "adminhostd/DirectoryOptions.h"
+#include "adminhostd/Permissions.h"
 #include "platform/files/Path.h"
 #include "platform/value/Value.h"
 
@@ -27,6 +28,7 @@ struct Options {
     std::chrono::milliseconds deadline{300'000};  ///< of one operation
     std::chrono::seconds clientTimeout{30};
     std::size_t queueLimit = 64;
+    std::vector<PermissionOptions> permissions;
     std::string configuration;          ///< path on disk of the file that was read; empty: none
     bool configurationIsNamed = false;  ///< on the command line
     bool logToStandardError = false;
@@ -41,5 +43,8 @@ struct Options {
 /// Applies a configuration file to the options. Throws std::runtime_error with the file, the line, the column and a
 /// description.
 void readConfiguration(const std::string& file, Options& options);
+
+/// The path on disk of the configuration file that was read or, without one, where it would be.
+[[nodiscard]] std::string configurationFile(const Options& options);
 
 }  // namespace adminhost

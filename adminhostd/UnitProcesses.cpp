@@ -19,20 +19,6 @@ std::string textOf(const std::string& path) {
     return {std::istreambuf_iterator<char>(file), {}};
 }
 
-/// The process's control group in the one hierarchy of version 2, or in the manager's own of version 1.
-std::string groupOf(const KernelPlaces& places, pid_t pid) {
-    std::istringstream lines(textOf(fmt::format("{}/{}/cgroup", places.processes, pid)));
-    std::string found;
-    for (std::string line; std::getline(lines, line);) {
-        for (const std::string_view hierarchy : {"0::", "1:name=systemd:"}) {
-            if (line.starts_with(hierarchy) && (found.empty() || found == "/")) {
-                found = line.substr(hierarchy.size());
-            }
-        }
-    }
-    return found;
-}
-
 std::string membersOf(const KernelPlaces& places, const std::string& group) {
     for (const char* hierarchy : {"", "/unified", "/systemd"}) {
         std::string members = textOf(places.groups + hierarchy + group + "/cgroup.procs");
@@ -78,8 +64,21 @@ bool descendsFrom(const KernelPlaces& places, pid_t pid, pid_t ancestor) {
 
 }  // namespace
 
+std::string controlGroupOf(pid_t pid, const KernelPlaces& places) {
+    std::istringstream lines(textOf(fmt::format("{}/{}/cgroup", places.processes, pid)));
+    std::string found;
+    for (std::string line; std::getline(lines, line);) {
+        for (const std::string_view hierarchy : {"0::", "1:name=systemd:"}) {
+            if (line.starts_with(hierarchy) && (found.empty() || found == "/")) {
+                found = line.substr(hierarchy.size());
+            }
+        }
+    }
+    return found;
+}
+
 UnitProcesses unitProcesses(pid_t self, const std::string& mainProcess, const KernelPlaces& places) {
-    const std::string group = groupOf(places, self);
+    const std::string group = controlGroupOf(self, places);
     const std::string unit = group.substr(group.rfind('/') + 1);
     if (!unit.ends_with(".service") || mainProcess != std::to_string(self)) {
         return {};

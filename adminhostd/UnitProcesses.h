@@ -29,6 +29,10 @@ struct KernelPlaces {
     std::string groups = "/sys/fs/cgroup";
 };
 
+/// The path of the process's control group in the one hierarchy of version 2, or in the manager's own of version 1;
+/// empty if it cannot be read.
+[[nodiscard]] std::string controlGroupOf(pid_t pid, const KernelPlaces& places = {});
+
 /// The processes of the unit whose main process is this one, without it and its descendants. `mainProcess` is the
 /// manager's word for the unit's main process (the environment's SYSTEMD_EXEC_PID); empty: none.
 [[nodiscard]] UnitProcesses unitProcesses(pid_t self, const std::string& mainProcess, const KernelPlaces& places = {});

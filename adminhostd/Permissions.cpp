@@ -1,0 +1,104 @@
+#include "adminhostd/Permissions.h"
+
+#include <algorithm>
+#include <cerrno>
+
+#include <fmt/format.h>
+#include <grp.h>
+#include <pwd.h>
+
+namespace adminhost {
+namespace {
+
+constexpr std::size_t accountRoom = std::size_t{64} << 10U;  ///< bytes of an account's entry
+constexpr std::size_t largestRoom = std::size_t{16} << 20U;  ///< a group may have very many members
+
+/// The number of a name, by one of the C library's look-ups; nullopt if it is not found.
+template <class Entry, class LookUp, class Number>
+std::optional<id_t> numberOf(const std::string& name, LookUp lookUp, Number number) {
+    std::vector<char> room(accountRoom);
+    Entry entry{};
+    Entry* found = nullptr;
+    int failure = 0;
+    while ((failure = lookUp(name.c_str(), &entry, room.data(), room.size(), &found)) == ERANGE &&
+           room.size() < largestRoom) {
+        room.resize(room.size() * 4);
+    }
+    return failure == 0 && found != nullptr ? std::optional<id_t>(entry.*number) : std::nullopt;
+}
+
+std::optional<id_t> userNumber(const std::string& name) {
+    return numberOf<passwd>(name, &::getpwnam_r, &passwd::pw_uid);
+}
+
+std::optional<id_t> groupNumber(const std::string& name) {
+    return numberOf<group>(name, &::getgrnam_r, &group::gr_gid);
+}
+
+}  // namespace
+
+std::string_view nameOf(Right right) noexcept {
+    return rightWords[static_cast<std::size_t>(right)].first;
+}
+
+Right rightFor(Access access) noexcept {
+    switch (access) {
+        case Access::read:
+            return Right::read;
+        case Access::write:
+            return Right::write;
+        case Access::control:
+            return Right::control;
+        case Access::account:
+            break;
+    }
+    return Right::account;
+}
+
+Permissions::Permissions(const std::vector<PermissionOptions>& options, uid_t own, std::string file)
+    : _own(own), _file(std::move(file)) {
+    for (const PermissionOptions& table : options) {
+        Grant& grant = _grants.emplace_back(Grant{{}, {}, table.rights});
+        const auto resolve = [&](const std::vector<ConfiguredAccount>& accounts, std::string_view kind, auto lookUp,
+                                 auto& numbers) {
+            for (const ConfiguredAccount& account : accounts) {
+                if (const auto number = account.id ? account.id : lookUp(account.name)) {
+                    numbers.push_back(*number);
+                } else {
+                    _problems.push_back(fmt::format(
+                        "{}: {} not found: \"{}\"; create the {}, or correct the name, and reload the daemon",
+                        account.place, kind, account.name, kind));
+                }
+            }
+        };
+        resolve(table.users, "user", &userNumber, grant.users);
+        resolve(table.groups, "group", &groupNumber, grant.groups);
+    }
+}
+
+Rights Permissions::of(const Peer& peer) const {
+    if (isOwn(peer)) {
+        return Rights::all();
+    }
+    Rights rights;
+    for (const Grant& grant : _grants) {
+        const bool named = std::find(grant.users.begin(), grant.users.end(), peer.uid) != grant.users.end();
+        if (named ||
+            std::any_of(grant.groups.begin(), grant.groups.end(), [&](gid_t group) { return peer.isInGroup(group); })) {
+            rights.add(grant.rights);
+        }
+    }
+    return rights;
+}
+
+std::string Permissions::refusal(const Peer& peer, const std::string& name, Right right) const {
+    const std::string account = name.empty() ? fmt::format("The account with uid {}", peer.uid)
+                                             : fmt::format("The user \"{}\" (uid {})", name, peer.uid);
+    const std::string entry = name.empty() ? std::to_string(peer.uid) : '"' + name + '"';
+    return fmt::format(
+        "{} lacks the class \"{}\", which this needs. To grant it, root adds to {} the lines \"[[permission]]\", "
+        "'users = [{}]' and 'classes = [\"{}\"]', and runs \"systemctl reload adminhostd\".",
+        account, nameOf(right), _file, entry, nameOf(right));
+}
+
+}  // namespace adminhost
