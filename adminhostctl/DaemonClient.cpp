@@ -1,6 +1,7 @@
 #include "adminhostctl/DaemonClient.h"
 
 #include "adminhostctl/Interrupt.h"
+#include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
 #include "platform/json/Json.h"
 #include "platform/text/Uuid.h"
@@ -46,14 +47,16 @@ std::string logText(const std::vector<std::string>& lines) {
     return text;
 }
 
-std::string joined(const std::vector<PluginInfo>& plugins) {
-    std::string text;
+Failure unknownCommand(const std::string& name, const std::vector<PluginInfo>& plugins,
+                       std::vector<std::string> known) {
+    std::string list;
     for (const PluginInfo& plugin : plugins) {
         for (const Description& command : plugin.commands) {
-            text += (text.empty() ? "" : ", ") + command.name();
+            known.push_back(command.name());
+            list += (list.empty() ? "" : ", ") + command.name();
         }
     }
-    return text;
+    return usageError("command not found: " + name + didYouMean(name, known) + "; the commands are " + list);
 }
 
 std::string rawTextAt(const Dictionary& dictionary, std::string_view key) {
@@ -161,7 +164,7 @@ const std::vector<PluginInfo>& DaemonClient::plugins() {
     return *_plugins;
 }
 
-CommandRef DaemonClient::command(const std::string& name) {
+CommandRef DaemonClient::command(const std::string& name, const std::vector<std::string>& others) {
     const std::size_t slash = name.find('/');
     const std::string wanted = slash == std::string::npos ? name : name.substr(slash + 1);
     std::vector<CommandRef> found;
@@ -182,7 +185,7 @@ CommandRef DaemonClient::command(const std::string& name) {
         throw noPlugin();
     }
     if (found.empty()) {
-        throw usageError("command not found: " + name + "; the commands are " + joined(plugins()));
+        throw unknownCommand(name, plugins(), others);
     }
     throw usageError("several plug-ins have a command " + wanted + "; use " + found.front().plugin + '/' + wanted);
 }

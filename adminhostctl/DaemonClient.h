@@ -94,8 +94,8 @@ class DaemonClient {
     /// Every plug-in with its commands.
     [[nodiscard]] const std::vector<PluginInfo>& plugins();
     /// The command of that name, or "PLUGIN/COMMAND" if two plug-ins have it. Throws Failure(usage), which lists the
-    /// known commands.
-    [[nodiscard]] CommandRef command(const std::string& name);
+    /// known commands and suggests one of them or of the other words that would have been known.
+    [[nodiscard]] CommandRef command(const std::string& name, const std::vector<std::string>& others = {});
     /// The command that reads, writes or tries the state that a file can describe: state is "read", "write" or "try".
     /// Throws Failure(usage) when no plug-in has one, or several have.
     [[nodiscard]] CommandRef stateCommand(std::string_view state);

@@ -1,6 +1,7 @@
 #include "adminhostctl/GeneralVerbs.h"
 
 #include "adminhostctl/DoctorVerb.h"
+#include "adminhostctl/Help.h"
 #include "adminhostctl/LogsVerb.h"
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Table.h"
@@ -35,80 +36,6 @@ ExitStatus commands(const Context& context, Words) {
     if (!context.options.names) {
         writeValue(context, all, Description());
     }
-    return ExitStatus::done;
-}
-
-// Help
-
-std::string typeText(const DescribedKey& key) {
-    const std::string type = key.enteredAs.empty() ? key.type : key.enteredAs;
-    return type == "integer"                   ? "whole number"
-           : type == "real"                    ? "number"
-           : type == "boolean"                 ? "yes or no"
-           : type == "scalar" || type == "any" ? "text"
-                                               : type;
-}
-
-/// Key paths are long and cannot be broken: each has a line of its own, with its meaning below.
-std::string keyList(const std::vector<DescribedKey>& keys, std::size_t width) {
-    constexpr std::size_t indent = 6;
-    std::string text;
-    for (const DescribedKey& key : keys) {
-        std::string help = key.help;
-        for (std::size_t i = 0; i < key.allowed.size(); ++i) {
-            help += (i == 0 ? " One of " : ", ") + key.allowed[i] + (i + 1 == key.allowed.size() ? "." : "");
-        }
-        help += key.required ? " Required." : "";
-        help += key.filledWith == "languages" ? " Without it, adminhostctl sends yours." : "";
-        help += key.secret ? " Secret: " + key.path + "@FILE or " + key.path + "@-." : "";
-        text += "  " + shown(key.path) + " (" + shown(typeText(key)) + ")\n";
-        for (const std::string& line : wrapped(shown(help), width - indent)) {
-            text.append(indent, ' ').append(line + '\n');
-        }
-    }
-    return text;
-}
-
-void helpOfCommand(const Context& context, const std::string& name) {
-    const CommandRef command = context.service.command(name);
-    const Description& description = command.description;
-    if (context.options.names) {
-        for (const DescribedKey& key : description.keys()) {
-            context.out << key.path << (key.secret ? "@" : "=") << '\n';
-        }
-        return;
-    }
-    context.out << shown(description.name()) << ": " << shown(description.summary()) << "\n\n";
-    for (const std::string& line : wrapped(shown(description.text()), context.options.width)) {
-        context.out << line << '\n';
-    }
-    context.out << "\nadminhostctl " << shown(description.name())
-                << " [KEY=TEXT | KEY:=JSON | KEY@FILE | KEY@-]... [--file FILE|-]\n";
-    if (!description.keys().empty()) {
-        context.out << "\nKeys:\n" << keyList(description.keys(), context.options.width);
-    }
-    if (!description.answerKeys().empty()) {
-        context.out << "\nAnswer:\n" << keyList(description.answerKeys(), context.options.width);
-    }
-    if (!description.errors().empty()) {
-        context.out << "\nErrors:\n" << Reading(Description(), context.options.width).text(description.errors());
-    }
-    context.out << "\nExample of a request (as with --file):\n"
-                << shownJson(jsonOf(description.example().get("request"), true)) << '\n';
-}
-
-ExitStatus help(const Context& context, Words arguments) {
-    if (!arguments.empty()) {
-        helpOfCommand(context, arguments.front());
-        return ExitStatus::done;
-    }
-    Table table({"verb", "", "meaning"});
-    for (const Verb& verb : context.verbs) {
-        table.addRow({std::string(verb.words), std::string(verb.arguments), std::string(verb.summary)});
-    }
-    context.out << table.text(context.options.width, 0)
-                << "\nEvery other word is a command of the service: adminhostctl commands lists them,\n"
-                   "adminhostctl help COMMAND describes one.\n";
     return ExitStatus::done;
 }
 
@@ -150,12 +77,36 @@ ExitStatus whois(const Context& context, Words arguments) {
 }
 
 constexpr std::array table = {
-    Verb{"daemon", "", "Show the daemon's running request, the waiting ones and the plug-ins", 0, 0, &daemon},
-    Verb{"commands", "[--names]", "List the commands", 0, 0, &commands},
-    Verb{"help", "[COMMAND]", "List the verbs, or describe a command", 0, 1, &help},
-    Verb{"doctor", "", "Check the installation", 0, 0, &doctor},
-    Verb{"logs", "[-f] [-n LINES] [NAME]", "List the service's logs, or print the end of one", 0, 1, &logs},
-    Verb{"whois", "NAME|UUID", "Show the people and groups with this name or UUID", 1, 1, &whois},
+    Verb{"daemon",
+         "",
+         "Show the daemon's running request, the waiting ones and the plug-ins",
+         0,
+         0,
+         &daemon,
+         {{"daemon", "--format json daemon"}}},
+    Verb{"commands", "[--names]", "List the commands", 0, 0, &commands, {{"commands", "--format json commands"}}},
+    Verb{"help",
+         "[VERB | COMMAND] [--names]",
+         "List the verbs, or describe a verb or a command",
+         0,
+         2,
+         &help,
+         {{"help settings set", "help readSettings"}}},
+    Verb{"doctor", "", "Check the installation", 0, 0, &doctor, {{"doctor", "--format json doctor"}}},
+    Verb{"logs",
+         "[-f] [-n LINES] [--names] [NAME]",
+         "List the service's logs, or print the end of one",
+         0,
+         1,
+         &logs,
+         {{"logs", "logs -f -n 50 application_log"}}},
+    Verb{"whois",
+         "NAME|UUID",
+         "Show the people and groups with this name or UUID",
+         1,
+         1,
+         &whois,
+         {{"whois anna", "--format json whois studio"}}},
 };
 
 constexpr std::array options = {

@@ -5,6 +5,7 @@
 #include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/GeneralVerbs.h"
+#include "adminhostctl/Help.h"
 #include "adminhostctl/Interrupt.h"
 #include "adminhostctl/Prompt.h"
 #include "adminhostctl/RequestArguments.h"
@@ -59,6 +60,36 @@ std::vector<adminhost::ctl::Verb> allVerbs() {
     return all;
 }
 
+/// In the order in which help lists them.
+std::vector<adminhost::ctl::VerbOption> allOptions() {
+    std::vector<adminhost::ctl::VerbOption> all{
+        {"--file",
+         "FILE",
+         "Read the request of a command from a file, JSON or property list; - is standard input",
+         {},
+         {},
+         true},
+        {"--names", "", "Print only names, one a line"},
+        {"--clear", "", "Remove a stored secret: without this an empty secret is rejected", {}, {}, true},
+    };
+    for (const auto& table : {adminhost::ctl::generalOptions(), adminhost::ctl::lumioOptions(),
+                              adminhost::ctl::serviceOptions(), adminhost::ctl::desiredOptions()}) {
+        all.insert(all.end(), table.begin(), table.end());
+    }
+    return all;
+}
+
+/// The help of the verb or the command that the words begin with; further words are its arguments.
+ExitStatus helpOf(const adminhost::ctl::Context& context, std::vector<std::string> words) {
+    const bool isOfTwo =
+        words.size() > 1 && std::any_of(context.verbs.begin(), context.verbs.end(), [&](const auto& verb) {
+            return verb.words.find(' ') != std::string_view::npos &&
+                   adminhost::ctl::beginsWith(verb, std::span(words).first(1));
+        });
+    words.resize(isOfTwo ? 2 : 1);
+    return adminhost::ctl::help(context, words);
+}
+
 /// An excluded option must have been added before.
 void addOption(CLI::App& app, const adminhost::ctl::VerbOption& option, adminhost::ctl::VerbOptions& options) {
     const std::string name(option.name);
@@ -89,22 +120,18 @@ int runMain(int count, char** words) {
     app.add_option("--format", format, "Format of the answer: text (for reading), json or plist")
         ->check(CLI::IsMember({"text", "json", "plist"}))
         ->type_name("FORMAT");
-    app.add_option("--file", options.file, "Read the request from a file, JSON or property list; - is standard input")
-        ->type_name("FILE");
-    app.add_flag("--names", options.names, "Print only names, one a line");
     std::optional<std::string> languages;
     app.add_option("--languages", languages,
                    "Languages of names and descriptions, the preferred one first: de,fr (by default those of LANGUAGE, "
                    "LC_ALL, LC_MESSAGES and LANG)")
         ->type_name("LIST");
-    bool clear = false;
-    app.add_flag("--clear", clear, "Remove a stored secret: without this an empty secret is rejected");
-    for (const auto& table : {adminhost::ctl::generalOptions(), adminhost::ctl::lumioOptions(),
-                              adminhost::ctl::serviceOptions(), adminhost::ctl::desiredOptions()}) {
-        for (const adminhost::ctl::VerbOption& option : table) {
-            addOption(app, option, options);
-        }
+    const std::vector<adminhost::ctl::VerbOption> verbOptions = allOptions();
+    for (const adminhost::ctl::VerbOption& option : verbOptions) {
+        addOption(app, option, options);
     }
+    bool isHelp = false;
+    app.set_help_flag();
+    app.add_flag("-h,--help", isHelp, "Describe the verb or the command, or these options");
     app.add_option("words", rest, "A verb or a command, and its arguments: KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-")
         ->type_name("WORD");
     app.set_version_flag("--version", std::string("adminhostctl ") + ADMINHOST_RELEASE);
@@ -113,10 +140,14 @@ int runMain(int count, char** words) {
     } catch (const CLI::ParseError& error) {
         std::ostringstream out;
         std::ostringstream err;
-        const bool isHelp = app.exit(error, out, err) == 0;
+        const bool isVersion = app.exit(error, out, err) == 0;
         std::cout << out.str();
         std::cerr << adminhost::ctl::shown(err.str());  // it repeats words of the command line
-        return isHelp ? statusOf(ExitStatus::done) : statusOf(ExitStatus::usage);
+        return isVersion ? statusOf(ExitStatus::done) : statusOf(ExitStatus::usage);
+    }
+    if (isHelp && rest.empty()) {
+        std::cout << app.help();
+        return statusOf(ExitStatus::done);
     }
     if (rest.empty()) {
         std::cerr << "adminhostctl: a verb or a command is missing; adminhostctl help lists them\n";
@@ -124,14 +155,17 @@ int runMain(int count, char** words) {
     }
     options.format = format == "json" ? Format::json : format == "plist" ? Format::plist : Format::text;
     options.width = outputWidth();
+    options.file = options.argumentOf("--file");
+    options.names = options.has("--names");
     try {
         adminhost::ctl::DaemonClient service(
             socket, languages ? adminhost::ctl::languagesOfText(*languages) : adminhost::ctl::callerLanguages());
         const adminhost::ctl::Sources sources{&adminhost::ctl::readSource,       &adminhost::ctl::askSecret,
-                                              adminhost::ctl::inputIsTerminal(), clear,
+                                              adminhost::ctl::inputIsTerminal(), options.has("--clear"),
                                               &adminhost::ctl::askKnownSecret,   &adminhost::ctl::confirm};
         const std::vector<adminhost::ctl::Verb> verbs = allVerbs();
-        const ExitStatus status = adminhost::ctl::run({service, options, sources, std::cout, std::cerr, verbs}, rest);
+        const adminhost::ctl::Context context{service, options, sources, std::cout, std::cerr, verbs, verbOptions};
+        const ExitStatus status = isHelp ? helpOf(context, rest) : adminhost::ctl::run(context, rest);
         std::cout.flush();
         adminhost::ctl::endIfInterrupted();
         if (!std::cout) {

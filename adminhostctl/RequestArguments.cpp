@@ -1,6 +1,7 @@
 #include "adminhostctl/RequestArguments.h"
 
 #include "adminhostctl/Failure.h"
+#include "adminhostctl/Similar.h"
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
 #include "platform/text/LocalDate.h"
@@ -244,6 +245,15 @@ Value valueOfFile(const DescribedKey& key, const std::string& path, const Source
     return notEmpty(key, withoutLineEnd(std::move(bytes)), sources);
 }
 
+/// didYouMean() for a key of the command.
+std::string suggestion(const Description& command, const std::string& key) {
+    std::vector<std::string> known;
+    for (const DescribedKey& described : command.keys()) {
+        known.push_back(described.path);
+    }
+    return didYouMean(key, known);
+}
+
 }  // namespace
 
 Value valueOfText(const DescribedKey& key, const std::string& text) {
@@ -329,8 +339,9 @@ Dictionary buildRequest(const Description& command, Dictionary base, const std::
             key = &any;
         }
         if (key == nullptr && argument.form != Form::json) {
-            throw usageError(command.name() + " has no key " + argument.key + "; adminhostctl help " + command.name() +
-                             " lists its keys, " + argument.key + ":=JSON sends it nevertheless");
+            throw usageError(command.name() + " has no key " + argument.key + suggestion(command, argument.key) +
+                             "; adminhostctl help " + command.name() + " lists its keys, " + argument.key +
+                             ":=JSON sends it nevertheless");
         }
         Value value;
         if (argument.form == Form::file) {

@@ -1,6 +1,7 @@
 #include "adminhostctl/Verb.h"
 
 #include "adminhostctl/Reading.h"
+#include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
@@ -22,8 +23,16 @@ std::string changeText(const ReportedChange& change) {
            valueText(change.from) + " -> " + valueText(change.to) + (change.unverified ? " (if it existed)" : "");
 }
 
+std::vector<std::string> splitWords(std::string_view words) {
+    const std::size_t blank = words.find(' ');
+    if (blank == std::string_view::npos) {
+        return {std::string(words)};
+    }
+    return {std::string(words.substr(0, blank)), std::string(words.substr(blank + 1))};
+}
+
 ExitStatus perform(const Context& context, Words words) {
-    const CommandRef command = context.service.command(words.front());
+    const CommandRef command = context.service.command(words.front(), firstWords(context.verbs));
     Dictionary base;
     if (!context.options.file.empty()) {
         base = parseRequest(context.sources.read(context.options.file), context.options.file);
@@ -49,12 +58,21 @@ ExitStatus perform(const Context& context, Words words) {
     return status;
 }
 
-std::vector<std::string> splitWords(std::string_view words) {
-    const std::size_t blank = words.find(' ');
-    if (blank == std::string_view::npos) {
-        return {std::string(words)};
+/// Throws Failure(usage) if an option was given that the verb does not have. Null stands for a command.
+void requireOwnOptions(const Context& context, const Verb* verb, const std::string& command) {
+    for (const VerbOption& option : context.verbOptions) {
+        if (!context.options.has(option.name) || (verb != nullptr ? belongsTo(option, *verb) : option.ofCommands)) {
+            continue;
+        }
+        std::string verbs;
+        for (const Verb& other : context.verbs) {
+            verbs += belongsTo(option, other) ? (verbs.empty() ? "" : ", ") + std::string(other.words) : "";
+        }
+        throw usageError("\"" + (verb != nullptr ? std::string(verb->words) : command) +
+                         "\" does not have the option " + std::string(option.name) + "; it belongs to " +
+                         (option.ofCommands ? "commands" : "") + (option.ofCommands && !verbs.empty() ? ", " : "") +
+                         verbs);
     }
-    return {std::string(words.substr(0, blank)), std::string(words.substr(blank + 1))};
 }
 
 }  // namespace
@@ -149,27 +167,69 @@ std::optional<std::string> wordAt(Words arguments, std::size_t index) {
     return index < arguments.size() ? std::optional(arguments[index]) : std::nullopt;
 }
 
-ExitStatus run(const Context& context, const std::vector<std::string>& words) {
-    std::string known;
-    for (const Verb& verb : context.verbs) {
+std::vector<std::string> firstWords(std::span<const Verb> verbs) {
+    std::vector<std::string> words;
+    for (const Verb& verb : verbs) {
+        words.push_back(splitWords(verb.words).front());
+    }
+    return words;
+}
+
+bool beginsWith(const Verb& verb, Words words) {
+    const std::vector<std::string> own = splitWords(verb.words);
+    return words.size() <= own.size() && std::equal(words.begin(), words.end(), own.begin());
+}
+
+bool belongsTo(const VerbOption& option, const Verb& verb) {
+    const auto isNamed = [&](std::string_view name) {
+        for (std::size_t at = verb.arguments.find(name); !name.empty() && at != std::string_view::npos;
+             at = verb.arguments.find(name, at + 1)) {
+            const std::size_t end = at + name.size();
+            if (end == verb.arguments.size() ||
+                std::string_view(" ]|").find(verb.arguments[end]) != std::string_view::npos) {
+                return true;
+            }
+        }
+        return false;
+    };
+    return isNamed(option.name) || isNamed(option.brief);
+}
+
+const Verb* verbOf(std::span<const Verb> verbs, const std::vector<std::string>& words) {
+    std::vector<std::string> known;
+    std::string list;
+    for (const Verb& verb : verbs) {
         const std::vector<std::string> own = splitWords(verb.words);
+        if (own.size() <= words.size() && std::equal(own.begin(), own.end(), words.begin())) {
+            return &verb;
+        }
         if (own.front() == words.front()) {
-            known += (known.empty() ? "" : ", ") + std::string(verb.words);
+            known.emplace_back(verb.words);
+            list += (list.empty() ? "" : ", ") + known.back();
         }
-        if (own.size() > words.size() || !std::equal(own.begin(), own.end(), words.begin())) {
-            continue;
-        }
-        const Words arguments = Words(words).subspan(own.size());
-        if (arguments.size() < verb.least || arguments.size() > verb.most) {
-            throw usageError("usage: adminhostctl " + std::string(verb.words) +
-                             (verb.arguments.empty() ? "" : " " + std::string(verb.arguments)));
-        }
-        return verb.run(context, arguments);
     }
-    if (!known.empty()) {
-        throw usageError("\"" + words.front() + "\" needs another word: " + known);
+    if (known.empty()) {
+        return nullptr;
     }
-    return perform(context, words);
+    if (words.size() == 1) {
+        throw usageError("\"" + words.front() + "\" needs another word: " + list);
+    }
+    const std::string typed = words[0] + ' ' + words[1];
+    throw usageError("not a verb: \"" + typed + '"' + didYouMean(typed, known) + "; the verbs are " + list);
+}
+
+ExitStatus run(const Context& context, const std::vector<std::string>& words) {
+    const Verb* verb = verbOf(context.verbs, words);
+    requireOwnOptions(context, verb, words.front());
+    if (verb == nullptr) {
+        return perform(context, words);
+    }
+    const Words arguments = Words(words).subspan(splitWords(verb->words).size());
+    if (arguments.size() < verb->least || arguments.size() > verb->most) {
+        throw usageError("usage: adminhostctl " + std::string(verb->words) + (verb->arguments.empty() ? "" : " ") +
+                         std::string(verb->arguments));
+    }
+    return verb->run(context, arguments);
 }
 
 }  // namespace adminhost::ctl

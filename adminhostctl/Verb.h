@@ -7,6 +7,7 @@
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/RequestArguments.h"
 
+#include <array>
 #include <cstddef>
 #include <functional>
 #include <map>
@@ -28,6 +29,7 @@ struct VerbOption {
     std::string_view help;
     std::string_view excludes = {};  ///< the name of an option that must not be given with it
     std::string_view brief = {};     ///< "-g"; empty for an option without a short form
+    bool ofCommands = false;         ///< commands have it too
 };
 
 struct VerbOptions {
@@ -55,17 +57,32 @@ struct Context {
     const Sources& sources;
     std::ostream& out;
     std::ostream& err;
-    std::span<const Verb> verbs;  ///< all of them
+    std::span<const Verb> verbs;              ///< all of them
+    std::span<const VerbOption> verbOptions;  ///< all of them
 };
 
 struct Verb {
     std::string_view words;      ///< "camera list"
-    std::string_view arguments;  ///< for people: "NAME|UUID"
+    std::string_view arguments;  ///< for people: "NAME|UUID [--group]"; the verb has the options that are named here
     std::string_view summary;
     std::size_t least;  ///< how many arguments
     std::size_t most;
     ExitStatus (*run)(const Context& context, std::span<const std::string> arguments);
+    std::array<std::string_view, 2> examples;  ///< without the program's name, for a shell
 };
+
+/// The first words of all verbs.
+[[nodiscard]] std::vector<std::string> firstWords(std::span<const Verb> verbs);
+
+/// Whether the words, which may be fewer than the verb's, are the beginning of the verb.
+[[nodiscard]] bool beginsWith(const Verb& verb, std::span<const std::string> words);
+
+/// Whether the arguments of the verb name the option.
+[[nodiscard]] bool belongsTo(const VerbOption& option, const Verb& verb);
+
+/// The verb at the beginning of the words; null if the first word is not one of a verb. Throws Failure(usage) if only
+/// the second word is missing or wrong.
+[[nodiscard]] const Verb* verbOf(std::span<const Verb> verbs, const std::vector<std::string>& words);
 
 /// Writes a value in the requested format. In text format it is shown as the value at this path of the command's
 /// answer. Throws Failure.

@@ -1,6 +1,7 @@
 #include "adminhostctl/desired/DesiredVerbs.h"
 
 #include "adminhostctl/OutputFile.h"
+#include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/DesiredFile.h"
 #include "adminhostctl/desired/LookingBack.h"
@@ -31,6 +32,20 @@ Wanted wantedOf(const Context& context, const std::string& file, const CurrentSt
     return wanted;
 }
 
+/// The settings that can be written, and those of the dictionary.
+std::vector<std::string> settingNames(const StateForm& form, const Dictionary& others) {
+    std::vector<std::string> names;
+    for (const std::vector<DescribedKey>* keys : {&form.settings(), &form.secrets()}) {
+        for (const DescribedKey& key : *keys) {
+            names.push_back(form.nameOf(key));
+        }
+    }
+    for (const DictionaryEntry& entry : others) {
+        names.push_back(entry.key);
+    }
+    return names;
+}
+
 ExitStatus settingsGet(const Context& context, Words arguments) {
     const CommandRef command = context.service.stateCommand("read");
     const StateForm form(context.service.stateCommand("write").description);
@@ -52,7 +67,8 @@ ExitStatus settingsGet(const Context& context, Words arguments) {
         return ExitStatus::done;
     }
     if (command.description.answerKey(form.root() + '.' + key) == nullptr) {
-        throw usageError("setting not found: " + key + "; \"adminhostctl settings get\" lists them");
+        throw usageError("setting not found: " + key + didYouMean(key, settingNames(form, settings)) +
+                         "; \"adminhostctl settings get\" lists them");
     }
     throw Failure(ExitStatus::failed, key + " is not set");
 }
@@ -63,8 +79,8 @@ ExitStatus settingsSet(const Context& context, Words arguments) {
     const DescribedKey* secret = form.secret(name);
     const DescribedKey* described = secret != nullptr ? secret : form.setting(name);
     if (described == nullptr) {
-        throw usageError("not a setting that can be written: " + name + "; \"adminhostctl help " + form.command() +
-                         "\" lists them below " + form.root());
+        throw usageError("not a setting that can be written: " + name + didYouMean(name, settingNames(form, {})) +
+                         "; \"adminhostctl help " + form.command() + "\" lists them below " + form.root());
     }
     DescribedKey key = *described;
     key.path = name;
@@ -114,14 +130,55 @@ ExitStatus applyFile(const Context& context, Words arguments) {
 }
 
 constexpr std::array table = {
-    Verb{"settings get", "[KEY]", "Show the settings, or one of them", 0, 1, &settingsGet},
-    Verb{"settings set", "KEY [VALUE|@FILE|@-] [--clear] [--validate [--password-file FILE]]", "Change a setting", 1, 2,
-         &settingsSet},
-    Verb{"export", "[FILE]", "Write settings and lists to a TOML file", 0, 1, &exportState},
-    Verb{"plan", "FILE [--password-file FILE]", "Show what applying the file would change", 1, 1, &planFile},
-    Verb{"apply", "FILE [--password-file FILE]", "Change what differs from the file", 1, 1, &applyFile},
-    Verb{"history", "", "List the latest changes: when, who and what was changed", 0, 0, &history},
-    Verb{"rollback", "NUMBER", "Restore the settings as they were before a change", 1, 1, &rollback},
+    Verb{"settings get",
+         "[KEY]",
+         "Show the settings, or one of them",
+         0,
+         1,
+         &settingsGet,
+         {{"settings get", "settings get server_port"}}},
+    Verb{"settings set",
+         "KEY [VALUE|@FILE|@-] [--clear] [--validate [--password-file FILE]]",
+         "Change a setting",
+         1,
+         2,
+         &settingsSet,
+         {{"settings set server_port 8170", "settings set nimbo_client_password @password.txt --validate"}}},
+    Verb{"export",
+         "[FILE]",
+         "Write settings and lists to a TOML file",
+         0,
+         1,
+         &exportState,
+         {{"export", "export host.toml"}}},
+    Verb{"plan",
+         "FILE [--password-file FILE]",
+         "Show what applying the file would change",
+         1,
+         1,
+         &planFile,
+         {{"plan host.toml", "plan host.toml --password-file grid.txt"}}},
+    Verb{"apply",
+         "FILE [--password-file FILE]",
+         "Change what differs from the file",
+         1,
+         1,
+         &applyFile,
+         {{"apply host.toml", "apply host.toml --password-file grid.txt"}}},
+    Verb{"history",
+         "",
+         "List the latest changes: when, who and what was changed",
+         0,
+         0,
+         &history,
+         {{"history", "--format json history"}}},
+    Verb{"rollback",
+         "NUMBER",
+         "Restore the settings as they were before a change",
+         1,
+         1,
+         &rollback,
+         {{"rollback 7", "--format json rollback 7"}}},
 };
 
 constexpr std::array options = {

@@ -1,5 +1,6 @@
 #include "adminhostctl/lumio/ElementVerbs.h"
 
+#include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/State.h"
 #include "adminhostctl/desired/Writing.h"
@@ -44,7 +45,7 @@ ExitStatus change(const Context& context, const ElementKind& kind, const std::st
     requireWhole(current);
     const Element* element = findByAnyName(current.state, current.form.list(kind.section), name);
     if (element == nullptr) {
-        throw notFound(kind, name);
+        throw notFound(kind, name, current.state, current.form.list(kind.section));
     }
     wanted.name = element->identity;
     wanted.shownAs = name;
@@ -55,9 +56,13 @@ ExitStatus change(const Context& context, const ElementKind& kind, const std::st
 
 }  // namespace
 
-Failure notFound(const ElementKind& kind, const std::string& name) {
-    return usageError(std::string(kind.word) + " not found: " + name + "; \"adminhostctl " + kind.word +
-                      " list\" shows the names");
+Failure notFound(const ElementKind& kind, const std::string& name, const State& state, const ListForm& list) {
+    std::vector<std::string> names;
+    for (const Element& element : elementsOf(state, list)) {
+        names.push_back(nameForPeople(element));
+    }
+    return usageError(std::string(kind.word) + " not found: " + name + didYouMean(name, names) + "; \"adminhostctl " +
+                      kind.word + " list\" shows the names");
 }
 
 ExitStatus listElements(const Context& context, const ElementKind& kind) {
@@ -84,7 +89,7 @@ ExitStatus showElement(const Context& context, const ElementKind& kind, const st
     const ListForm& list = form.list(kind.section);
     const Element* element = findByAnyName(state, list, name);
     if (element == nullptr) {
-        throw notFound(kind, name);
+        throw notFound(kind, name, state, list);
     }
     for (const Value& listed : listing.elements) {
         if (listed.dictionary() != nullptr && listed.dictionary()->get(list.identity) == Value(element->identity)) {

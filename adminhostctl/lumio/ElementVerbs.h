@@ -5,6 +5,7 @@
 // elements have is a usage error that lists their UUIDs.
 
 #include "adminhostctl/Verb.h"
+#include "adminhostctl/desired/State.h"
 
 #include <span>
 #include <string>
@@ -22,8 +23,9 @@ struct ElementKind {
     const char* listing;  ///< the command that lists them
 };
 
-/// The usage error for a name that no element has.
-[[nodiscard]] Failure notFound(const ElementKind& kind, const std::string& name);
+/// The usage error for a name that no element of the list has; it suggests a similar one.
+[[nodiscard]] Failure notFound(const ElementKind& kind, const std::string& name, const State& state,
+                               const ListForm& list);
 
 /// Prints all elements, or with --names one name of each.
 [[nodiscard]] ExitStatus listElements(const Context& context, const ElementKind& kind);

@@ -44,12 +44,30 @@ ExitStatus recycle(const Context& context, Words) {
 }
 
 constexpr std::array table = {
-    Verb{"status", "", "Show the service's state, and the daemon's", 0, 0, &serviceStatus},
-    Verb{"start", "", "Start the service", 0, 0, &start},
-    Verb{"stop", "", "Stop the service", 0, 0, &stop},
-    Verb{"recycleService", "", "Do nothing: stop and start restart the service", 0, 1, &recycle},
-    Verb{"account create", "NODE ADMINISTRATOR [--password-file FILE] [--save [--yes]]",
-         "Create the grid account in a directory node", 2, 2, &accountCreate},
+    Verb{"status",
+         "",
+         "Show the service's state, and the daemon's",
+         0,
+         0,
+         &serviceStatus,
+         {{"status", "--format json status"}}},
+    Verb{"start", "", "Start the service", 0, 0, &start, {{"start", "start --format json"}}},
+    Verb{"stop", "", "Stop the service", 0, 0, &stop, {{"stop", "stop --format json"}}},
+    Verb{"recycleService",
+         "",
+         "Do nothing: stop and start restart the service",
+         0,
+         1,
+         &recycle,
+         {{"recycleService", "recycleService --format json"}}},
+    Verb{"account create",
+         "NODE ADMINISTRATOR [--password-file FILE] [--save [--yes]]",
+         "Create the grid account in a directory node",
+         2,
+         2,
+         &accountCreate,
+         {{"account create /Example diradmin",
+           "account create /Example diradmin --password-file admin.txt --save --yes"}}},
 };
 
 constexpr std::array options = {

@@ -196,7 +196,9 @@ TEST_F(Ctl, NothingReachesTheTerminalThatItWouldActOn) {
 TEST_F(Ctl, AnUnknownCommandIsUsageAndTheKnownOnesAreListed) {
     const Result result = run({"ecoTyped"});
     EXPECT_EQ(result.status, 2);
-    EXPECT_THAT(result.err, HasSubstr("command not found: ecoTyped; the commands are echoTyped, measure, "));
+    EXPECT_THAT(result.err, HasSubstr("command not found: ecoTyped; did you mean \"echoTyped\"?; the commands are "
+                                      "echoTyped, measure, "));
+    EXPECT_THAT(run({"whoiss", "anna"}).err, HasSubstr("command not found: whoiss; did you mean \"whois\"?"));
 }
 
 TEST_F(Ctl, CommandsAndHelpComeFromTheDaemon) {
