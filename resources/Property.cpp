@@ -157,18 +157,19 @@ std::unique_ptr<Property> Property::initWithChangeRequest(const Dictionary& requ
 
 std::optional<std::vector<std::unique_ptr<Property>>> Property::allPropertiesWithError(std::optional<Error>& error) {
     // The tool would create a missing database as an empty file.
-    auto rows =
-        SettingsStore::dbPathExists() ? propertyRows("*", " from properties;") : adminhost::failure(missingDatabase());
-    if (!rows) {
-        error = std::move(rows.error());
+    std::vector<std::unique_ptr<Property>> properties;
+    const PropertyRowReceiver receiver{[&](Dictionary row) {
+                                           makeUtf8(row);
+                                           properties.push_back(initWithDictionary(std::move(row)));
+                                       },
+                                       [&] { properties.clear(); }};
+    const auto read = SettingsStore::dbPathExists()
+                          ? readPropertyRows("*", " from properties;", RowCount::any, receiver)
+                          : adminhost::failure(missingDatabase());
+    if (!read) {
+        error = read.error();
         logEvent("Error getting Sorvane workflow properties: " + textOf(error));
         return std::nullopt;
-    }
-    std::vector<std::unique_ptr<Property>> properties;
-    properties.reserve(rows->size());
-    for (Dictionary& row : *rows) {
-        makeUtf8(row);
-        properties.push_back(initWithDictionary(std::move(row)));
     }
     return properties;
 }

@@ -3,6 +3,7 @@
 #include "platform/text/Hex.h"
 #include "platform/value/ValueText.h"
 #include "resources/Property.h"
+#include "settings/EarlyRows.h"
 #include "settings/LineRows.h"
 #include "settings/QueryRunner.h"
 
@@ -10,6 +11,8 @@
 #include <charconv>
 #include <cstdint>
 #include <optional>
+#include <span>
+#include <utility>
 
 namespace lumio {
 
@@ -45,23 +48,37 @@ Reading readingOf(const std::string& output) {
     return reading;
 }
 
-/// Returns true if the ids are numbers and each is greater than the one before: the table is listed in this order. A
-/// row that a value spells out has this only if its number is free and fits there.
-bool idsAscend(const Reading& reading) {
-    const auto found = std::find(reading.columns.begin(), reading.columns.end(), "id");
-    if (found == reading.columns.end()) {
-        return true;
-    }
-    const auto id = static_cast<std::size_t>(found - reading.columns.begin());
-    std::optional<std::uint64_t> last;
-    return std::all_of(reading.rows.begin(), reading.rows.end(), [&](const LineRow& row) {
-        const std::string_view text = row.values[id];
+/// The order of the ids. The table is listed in ascending order; a row that a value spells out has this only if its
+/// number is free and fits there.
+class AscendingIds {
+  public:
+    explicit AscendingIds(std::span<const std::string> columns)
+        : _column(static_cast<std::size_t>(std::find(columns.begin(), columns.end(), "id") - columns.begin())) {}
+
+    /// Returns true if the row's id is a number that is greater than the one before, or there is no such column.
+    [[nodiscard]] bool accept(std::span<const std::string_view> values) {
+        if (_column >= values.size()) {
+            return true;
+        }
+        const std::string_view text = values[_column];
         std::uint64_t number = 0;
         const auto [end, failure] = std::from_chars(text.data(), text.data() + text.size(), number);
-        const bool fits = failure == std::errc() && end == text.data() + text.size() && (!last || number > *last);
-        last = number;
+        const bool fits = failure == std::errc() && end == text.data() + text.size() && (_isFirst || number > _last);
+        _last = number;
+        _isFirst = false;
         return fits;
-    });
+    }
+
+  private:
+    std::size_t _column;
+    bool _isFirst = true;
+    std::uint64_t _last = 0;
+};
+
+bool idsAscend(const Reading& reading) {
+    AscendingIds ids(reading.columns);
+    return std::all_of(reading.rows.begin(), reading.rows.end(),
+                       [&](const LineRow& row) { return ids.accept(row.values); });
 }
 
 /// Returns true if the output can be read in one way only.
@@ -72,6 +89,14 @@ bool isCertain(const Reading& reading, const std::string& output) {
            std::none_of(reading.rows.begin(), reading.rows.end(),
                         [](const LineRow& row) { return row.values.empty(); }) &&
            idsAscend(reading);
+}
+
+Dictionary rowOf(std::span<const std::string> columns, std::span<const std::string_view> values) {
+    Dictionary row;
+    for (std::size_t i = 0; i < columns.size(); ++i) {
+        row.append(columns[i], values[i]);
+    }
+    return row;
 }
 
 std::optional<std::string> bytesOfHex(std::string_view digits) {
@@ -143,28 +168,58 @@ Result<std::vector<Dictionary>> exactRows(const Reading& reading, const std::str
 
 }  // namespace
 
-Result<std::vector<Dictionary>> propertyRows(const std::string& columns, const std::string& rest, RowCount count) {
-    const auto output = statementOutput("select " + columns + rest);
+Result<void> readPropertyRows(const std::string& columns, const std::string& rest, RowCount count,
+                              const PropertyRowReceiver& receiver) {
+    std::optional<AscendingIds> ids;
+    std::size_t added = 0;
+    EarlyRows early(Property::tableColumnNames(),
+                    [&](std::span<const std::string> names, std::span<const std::string_view> values) {
+                        if (!ids) {
+                            ids.emplace(names);
+                        }
+                        if ((count == RowCount::atMostOne && added > 0) || !ids->accept(values)) {
+                            return false;
+                        }
+                        receiver.add(rowOf(names, values));
+                        ++added;
+                        return true;
+                    });
+    const auto output = statementOutput("select " + columns + rest, [&](std::string_view soFar) { early.read(soFar); });
+    if (output && early.complete(*output)) {
+        return {};
+    }
+    if (added > 0) {
+        receiver.discard();
+    }
     if (!output) {
         return adminhost::failure(output.error());
     }
-    std::vector<Dictionary> rows;
     if (output->find('\n') == std::string::npos) {
-        return rows;
+        return {};
     }
     const Reading reading = readingOf(*output);
     const bool tooMany = count == RowCount::atMostOne && reading.rows.size() > 1;
     if (tooMany || !isCertain(reading, *output)) {
-        return exactRows(reading, *output, rest);
-    }
-    rows.reserve(reading.rows.size());
-    for (const LineRow& read : reading.rows) {
-        Dictionary& row = rows.emplace_back();
-        for (std::size_t i = 0; i < reading.columns.size(); ++i) {
-            row.append(reading.columns[i], read.values[i]);
+        auto rows = exactRows(reading, *output, rest);
+        if (!rows) {
+            return adminhost::failure(std::move(rows.error()));
         }
+        for (Dictionary& row : *rows) {
+            receiver.add(std::move(row));
+        }
+        return {};
     }
-    return rows;
+    for (const LineRow& read : reading.rows) {
+        receiver.add(rowOf(reading.columns, read.values));
+    }
+    return {};
+}
+
+Result<std::vector<Dictionary>> propertyRows(const std::string& columns, const std::string& rest, RowCount count) {
+    std::vector<Dictionary> rows;
+    return readPropertyRows(columns, rest, count,
+                            {[&](Dictionary row) { rows.push_back(std::move(row)); }, [&] { rows.clear(); }})
+        .map([&] { return std::move(rows); });
 }
 
 }  // namespace lumio

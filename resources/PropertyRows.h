@@ -5,6 +5,7 @@
 #include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -28,5 +29,14 @@ enum class RowCount { any, atMostOne };
 [[nodiscard]] adminhost::Result<std::vector<adminhost::Dictionary>> propertyRows(const std::string& columns,
                                                                                  const std::string& rest,
                                                                                  RowCount count = RowCount::any);
+
+/// Receives the rows of propertyRows() one by one, the first ones while the tool is still writing the others.
+struct PropertyRowReceiver {
+    std::function<void(adminhost::Dictionary)> add;
+    /// The rows so far do not count: the same statement's rows follow, read in another way, or its failure.
+    std::function<void()> discard;
+};
+[[nodiscard]] adminhost::Result<void> readPropertyRows(const std::string& columns, const std::string& rest,
+                                                       RowCount count, const PropertyRowReceiver& receiver);
 
 }  // namespace lumio

@@ -8,43 +8,19 @@
 namespace lumio {
 namespace {
 
-constexpr std::string_view separator = " = ";
 constexpr std::size_t minimumWidth = 5;
 
-std::vector<std::string> prefixesOf(std::span<const std::string> columns) {
-    std::size_t width = minimumWidth;
-    for (const std::string& column : columns) {
-        width = std::max(width, column.size());
-    }
-    std::vector<std::string> prefixes;
-    prefixes.reserve(columns.size());
-    for (const std::string& column : columns) {
-        prefixes.push_back(std::string(width - column.size(), ' ') + column + std::string(separator));
-    }
-    return prefixes;
-}
-
-/// The word of a line "   word = ..." whose separator begins at the width; empty if the line has another form.
-std::string_view wordOf(std::string_view line, std::size_t width) noexcept {
-    if (line.size() < width + separator.size() || line.substr(width, separator.size()) != separator) {
-        return {};
-    }
-    std::string_view word = line.substr(0, width);
-    word.remove_prefix(std::min(word.find_first_not_of(' '), word.size()));
-    return word.find(' ') == std::string_view::npos ? word : std::string_view();
-}
-
-std::size_t widthOf(const OutputLines& lines) noexcept {
-    return lines.count() == 0 ? std::string_view::npos : lines[0].find(separator, minimumWidth);
+std::optional<std::size_t> widthOf(const OutputLines& lines) noexcept {
+    return lines.count() == 0 ? std::nullopt : widthOfNames(lines[0]);
 }
 
 /// The words of a row's lines, each once.
-std::vector<std::string> wordsOf(const OutputLines& lines, const LineRow& row, std::size_t width) {
+std::vector<std::string> wordsOf(const OutputLines& lines, const LineRow& row, std::optional<std::size_t> width) {
     std::vector<std::string> words;
     std::unordered_set<std::string_view> seen;
     std::size_t next = 0;
-    for (std::size_t i = row.line; i < row.end && width != std::string_view::npos; ++i) {
-        const std::string_view word = wordOf(lines[i], width);
+    for (std::size_t i = row.line; width && i < row.end; ++i) {
+        const std::string_view word = wordOf(lines[i], *width);
         // Nearly every row repeats the words of the one before it in their order.
         if (next == words.size()) {
             next = 0;
@@ -61,11 +37,11 @@ std::vector<std::string> wordsOf(const OutputLines& lines, const LineRow& row, s
 
 /// Returns true if a row's lines have all the words in this order. A row for which this is false may have them all the
 /// same.
-bool hasInOrder(const OutputLines& lines, const LineRow& row, std::size_t width,
+bool hasInOrder(const OutputLines& lines, const LineRow& row, std::optional<std::size_t> width,
                 const std::vector<std::string>& words) {
     auto wanted = words.begin();
-    for (std::size_t i = row.line; i < row.end && wanted != words.end(); ++i) {
-        if (wordOf(lines[i], width) == *wanted) {
+    for (std::size_t i = row.line; width && i < row.end && wanted != words.end(); ++i) {
+        if (wordOf(lines[i], *width) == *wanted) {
             ++wanted;
         }
     }
@@ -158,6 +134,33 @@ std::vector<LineRow> rowsOf(const OutputLines& lines, std::span<const std::strin
 
 }  // namespace
 
+std::vector<std::string> prefixesOf(std::span<const std::string> columns) {
+    std::size_t width = minimumWidth;
+    for (const std::string& column : columns) {
+        width = std::max(width, column.size());
+    }
+    std::vector<std::string> prefixes;
+    prefixes.reserve(columns.size());
+    for (const std::string& column : columns) {
+        prefixes.push_back(std::string(width - column.size(), ' ') + column + std::string(columnSeparator));
+    }
+    return prefixes;
+}
+
+std::optional<std::size_t> widthOfNames(std::string_view firstLine) noexcept {
+    const std::size_t width = firstLine.find(columnSeparator, minimumWidth);
+    return width == std::string_view::npos ? std::nullopt : std::optional(width);
+}
+
+std::string_view wordOf(std::string_view line, std::size_t width) noexcept {
+    if (!hasSeparatorAt(line, width)) {
+        return {};
+    }
+    std::string_view word = line.substr(0, width);
+    word.remove_prefix(std::min(word.find_first_not_of(' '), word.size()));
+    return word.find(' ') == std::string_view::npos ? word : std::string_view();
+}
+
 OutputLines::OutputLines(std::string_view output) : _output(output) {
     _begins.push_back(0);
     for (std::size_t at = output.find('\n'); at != std::string_view::npos; at = output.find('\n', at + 1)) {
@@ -175,7 +178,7 @@ std::vector<std::string> lineColumns(const OutputLines& lines) {
 }
 
 std::vector<std::string> lineColumnsOfEvery(const OutputLines& lines, std::span<const LineRow> rows) {
-    const std::size_t width = widthOf(lines);
+    const std::optional<std::size_t> width = widthOf(lines);
     std::vector<std::string> common;
     for (std::size_t i = 0; i < rows.size() && (i == 0 || !common.empty()); ++i) {
         if (i > 0 && hasInOrder(lines, rows[i], width, common)) {

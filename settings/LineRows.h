@@ -20,6 +20,21 @@
 
 namespace lumio {
 
+// The form of a line that begins a column.
+
+constexpr std::string_view columnSeparator = " = ";  ///< between a column's padded name and its value
+
+/// The beginnings of the columns' lines, with their separator.
+[[nodiscard]] std::vector<std::string> prefixesOf(std::span<const std::string> columns);
+/// The length of the padded names, from the first line of an output; nullopt if the line does not begin a column.
+[[nodiscard]] std::optional<std::size_t> widthOfNames(std::string_view firstLine) noexcept;
+[[nodiscard]] inline bool hasSeparatorAt(std::string_view line, std::size_t width) noexcept {
+    return line.size() >= width + columnSeparator.size() &&
+           line.substr(width, columnSeparator.size()) == columnSeparator;
+}
+/// The word of a line "   word = ..." whose separator begins at the width; empty if the line has another form.
+[[nodiscard]] std::string_view wordOf(std::string_view line, std::size_t width) noexcept;
+
 /// The whole lines of an output, found once for all readers of it. Refers to the output, which must outlive it.
 class OutputLines {
   public:

@@ -1,6 +1,7 @@
 #include "settings/QueryRunner.h"
 
 #include "platform/task/Task.h"
+#include "settings/LineRows.h"
 #include "settings/SettingsStore.h"
 
 namespace lumio {
@@ -11,12 +12,11 @@ using adminhost::Error;
 namespace {
 
 constexpr const char* failed = "Can't execute sqlite3 query: ";
-constexpr std::string_view separator = " = ";
 
 /// The place where the first separator begins. Searches for its middle, because lines begin with blanks.
 std::size_t separatorIn(std::string_view line) noexcept {
     for (std::size_t at = line.find('=', 1); at < line.size(); at = line.find('=', at + 1)) {
-        if (line.substr(at - 1, separator.size()) == separator) {
+        if (line.substr(at - 1, columnSeparator.size()) == columnSeparator) {
             return at - 1;
         }
     }
@@ -59,7 +59,7 @@ std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
         // A line without separator, such as the second line of a value, is its own value.
         const bool splits = split != std::string_view::npos;
         std::string_view key = splits ? line.substr(0, split) : line;
-        const std::string_view value = splits ? line.substr(split + separator.size()) : line;
+        const std::string_view value = splits ? line.substr(split + columnSeparator.size()) : line;
         // Column names are padded on the left; one that holds a blank itself keeps only its last word.
         if (const std::size_t blank = key.rfind(' '); blank != std::string_view::npos) {
             key.remove_prefix(blank + 1);
@@ -84,14 +84,17 @@ adminhost::Result<std::vector<Dictionary>> rowsOf(adminhost::TaskResult result) 
     return outputOf(std::move(result)).map([](const std::string& output) { return recordsOfLineOutput(output); });
 }
 
-adminhost::Result<std::string> statementOutput(const std::string& statement) {
+adminhost::Result<std::string> statementOutput(const std::string& statement,
+                                               std::function<void(std::string_view)> outputGrows) {
     const adminhost::HostPath database = SettingsStore::dbPath();
     if (beginsWithHyphen(database)) {
         return adminhost::failure(
             Error{"sqliteQuery", 1, failed + ("Error: the database path begins with a hyphen: " + database.text())});
     }
     adminhost::TaskGroup tool;
-    return outputOf(tool.collect(tool.start(planFor(database, statement))));
+    adminhost::TaskPlan plan = planFor(database, statement);
+    plan.outputGrows = std::move(outputGrows);
+    return outputOf(tool.collect(tool.start(std::move(plan))));
 }
 
 Error missingDatabase() {

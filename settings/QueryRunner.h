@@ -9,6 +9,7 @@
 #include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
+#include <functional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -18,7 +19,9 @@ namespace lumio {
 /// Runs the statement on the database at SettingsStore::dbPath() and returns what the tool printed, or the error:
 /// domain "sqliteQuery", the tool's exit status (-1 if it could not be started) and its error text. A database path
 /// that begins with a hyphen is a failure with code 1 and runs no tool, which would read it as an option.
-[[nodiscard]] adminhost::Result<std::string> statementOutput(const std::string& statement);
+/// `outputGrows` is called as a TaskPlan's.
+[[nodiscard]] adminhost::Result<std::string> statementOutput(const std::string& statement,
+                                                             std::function<void(std::string_view)> outputGrows = {});
 
 /// Runs the statement likewise. Returns the rows in output order, each a dictionary of texts by column name (NULL is
 /// the empty text); empty if the statement prints nothing. Rows printed before a failure are dropped.

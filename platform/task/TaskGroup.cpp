@@ -58,9 +58,9 @@ class WithoutSigpipe {
 /// The captured bytes of one of the tool's streams.
 class Capture {
   public:
-    /// `held` counts the bytes of the whole group.
-    Capture(FileDescriptor& stream, bool kept, std::size_t& held) noexcept
-        : _stream(stream), _kept(kept), _held(held) {}
+    /// `held` counts the bytes of the whole group. `grows` is called with all bytes so far.
+    Capture(FileDescriptor& stream, bool kept, std::size_t& held, std::function<void(std::string_view)> grows = {})
+        : _stream(stream), _kept(kept), _held(held), _grows(std::move(grows)) {}
 
     [[nodiscard]] bool isOpen() const noexcept { return _stream.isOpen(); }
     [[nodiscard]] int descriptor() const noexcept { return _stream.get(); }  ///< -1, which poll skips, after the end
@@ -75,6 +75,9 @@ class Capture {
             _held += static_cast<std::size_t>(count);
             if (_kept && _held <= bound) {
                 _bytes.append(buffer.data(), static_cast<std::size_t>(count));
+                if (_grows) {
+                    _grows(_bytes);
+                }
             }
         } else if (count == 0 || (errno != EAGAIN && errno != EINTR)) {
             _stream.close();
@@ -106,6 +109,7 @@ class Capture {
     FileDescriptor& _stream;
     bool _kept;
     std::size_t& _held;
+    std::function<void(std::string_view)> _grows;
     std::string _bytes;
     std::size_t _count = 0;
 };
@@ -148,7 +152,7 @@ class TaskGroup::RunningTask {
         : _tool(std::move(plan.tool)),
           _bound(bound),
           _held(held),
-          _output(_child.output, plan.keepsOutput, held),
+          _output(_child.output, plan.keepsOutput, held, std::move(plan.outputGrows)),
           _error(_child.error, plan.keepsError, held),
           _input(plan.input.value_or("")),
           _rest(_input),

@@ -13,10 +13,12 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include <poll.h>
@@ -30,6 +32,10 @@ struct ADMINHOST_EXPORT TaskPlan {
     std::map<std::string, std::string> environment = {};  ///< added to the daemon's
     bool keepsOutput = true;                              ///< otherwise it is read and dropped
     bool keepsError = true;
+    /// Called with everything that the tool has written to its standard output so far, whenever more of it has been
+    /// read: the output can be used while the tool is still writing. Bytes that are not UTF-8 are still among it. What
+    /// was passed does not count if the tool fails.
+    std::function<void(std::string_view)> outputGrows = {};
 };
 
 struct ADMINHOST_EXPORT TaskResult {

@@ -7,8 +7,11 @@
 namespace adminhost {
 namespace {
 
-/// Up to this many keys a look-up compares keys one by one, which is faster than hashing and needs no index.
-constexpr std::size_t linearLimit = 16;
+/// Up to this many keys a look-up compares keys one by one. An index would be as fast, but needs more memory than the
+/// entries of a database row.
+constexpr std::size_t linearLimit = 32;
+/// Entries by which a dictionary grows up to that limit. Doubling would leave half of the memory of many rows unused.
+constexpr std::size_t growth = 8;
 constexpr std::size_t notFound = static_cast<std::size_t>(-1);
 const Value nullValue;
 
@@ -111,10 +114,13 @@ void Dictionary::set(std::string_view key, Value value) {
 }
 
 void Dictionary::append(std::string_view key, Value value) {
-    if (_entries.empty()) {
-        _entries.reserve(8);  // most dictionaries have several entries, and moving them costs more than room for them
+    if (_entries.size() == _entries.capacity() && _entries.size() < linearLimit) {
+        _entries.reserve(_entries.size() + growth);
     }
-    _entries.push_back({std::string(key), std::move(value)});
+    std::string copiedKey(key);
+    DictionaryEntry& entry = _entries.emplace_back();
+    entry.key = std::move(copiedKey);
+    entry.value = std::move(value);
     if (_entries.size() == linearLimit + 1) {
         rebuildIndex();
     } else if (_entries.size() > linearLimit) {

@@ -2,6 +2,8 @@
 // - pidfd_open(2): returns a descriptor that becomes readable when the child has exited, and does not reap the child.
 // - execve(2) that fails with E2BIG. Valgrind checks the program's file itself, and ends the child when the call fails
 //   for another reason.
+// - execve(2) of /proc/self/exe, which is valgrind's own program. Valgrind shows the program under test as the link's
+//   target.
 
 #include <array>
 #include <cerrno>
@@ -39,24 +41,37 @@ int readableAfterExitOf(pid_t child) noexcept {
     return pipe[0];
 }
 
-template <class Function>
-Function realFunction(Function /*mine*/, const char* name) noexcept {
-    return reinterpret_cast<Function>(::dlsym(RTLD_NEXT, name));
-}
+/// The link's target. It is read before the first child is started: a child shares our memory and must not write to it.
+class OwnProgram {
+  public:
+    OwnProgram() noexcept {
+        const ssize_t size = ::readlink(link, _path.data(), _path.size() - 1);
+        if (size > 0) {
+            _path[static_cast<std::size_t>(size)] = '\0';
+        }
+    }
 
-}  // namespace
+    [[nodiscard]] const char* inPlaceOf(const char* path) const noexcept {
+        return std::strcmp(path, link) == 0 ? _path.data() : path;
+    }
 
-extern "C" int execve(const char* path, char* const* argv, char* const* envp) noexcept {
+  private:
+    static constexpr const char* link = "/proc/self/exe";
+    std::array<char, 4096> _path{};
+};
+const OwnProgram ownProgram;
+
+bool hasTooLongArgument(char* const* argv) noexcept {
     constexpr std::size_t longestArgument = 32 * 4096 - 1;
     for (char* const* argument = argv; *argument != nullptr; ++argument) {
         if (std::strlen(*argument) > longestArgument) {
-            errno = E2BIG;
-            return -1;
+            return true;
         }
     }
-    static const auto real = realFunction(&execve, "execve");
-    return real(path, argv, envp);
+    return false;
 }
+
+}  // namespace
 
 extern "C" long syscall(long number, ...) noexcept {
     std::array<long, 6> arguments{};
@@ -69,6 +84,13 @@ extern "C" long syscall(long number, ...) noexcept {
     if (number == SYS_pidfd_open) {
         return readableAfterExitOf(static_cast<pid_t>(arguments[0]));
     }
-    static const auto real = realFunction(&syscall, "syscall");
+    if (number == SYS_execve) {
+        if (hasTooLongArgument(reinterpret_cast<char* const*>(arguments[1]))) {
+            errno = E2BIG;
+            return -1;
+        }
+        arguments[0] = reinterpret_cast<long>(ownProgram.inPlaceOf(reinterpret_cast<const char*>(arguments[0])));
+    }
+    static const auto real = reinterpret_cast<decltype(&syscall)>(::dlsym(RTLD_NEXT, "syscall"));
     return real(number, arguments[0], arguments[1], arguments[2], arguments[3], arguments[4], arguments[5]);
 }

@@ -177,6 +177,25 @@ TEST_F(PropertyText, ExactRowsThatCannotBeFetchedAreTheListingsFailure) {
     EXPECT_EQ(error, (Error{"sqliteQuery", 5, "Can't execute sqlite3 query: Error: busy\n"}));
 }
 
+TEST_F(PropertyText, RowsPrintedBeforeTheToolFailsAreNotListed) {
+    root.writeTool("/usr/bin/sqlite3",
+                   "#!/bin/sh\nprintf '   id = 1\\nvalue = x\\n\\n   id = 2\\nvalue = y\\n'\n"
+                   "sleep 0.1; echo 'Error: busy' >&2; exit 5\n");
+    std::optional<Error> error;
+    EXPECT_FALSE(Property::allPropertiesWithError(error));
+    EXPECT_EQ(error, (Error{"sqliteQuery", 5, "Can't execute sqlite3 query: Error: busy\n"}));
+}
+
+TEST_F(PropertyText, RowsReadBeforeTheDoubtfulOneAreListedOnce) {
+    store(1, "a");
+    store(2, "b");
+    store(3, "x\n   protect = t");
+    const std::vector<Dictionary> records = listed();
+    ASSERT_EQ(records.size(), 3U);
+    EXPECT_EQ(records[0].get("value"), Value("a"));
+    EXPECT_EQ(records[2].get("value"), Value("x\n   protect = t"));
+}
+
 TEST_F(PropertyText, BytesThatAreNotUtf8AreProtectedAsTheyAre) {
     store(1, "caf\xE9\nlatin");
     const adminhost::test::RecordedStatements statements(root);

@@ -103,6 +103,29 @@ TEST_F(TaskGroupOf, ResultsAreTheSequentialOnesHoweverLongEachToolTakes) {
     }
 }
 
+TEST_F(TaskGroupOf, OutputIsPassedOnWhileTheToolIsStillWriting) {
+    TaskPlan plan = shell("echo begun; until [ -e " + place("seen") + " ]; do sleep 0.01; done; echo done");
+    std::vector<std::string> seen;
+    plan.outputGrows = [&](std::string_view soFar) {
+        seen.emplace_back(soFar);
+        std::ofstream(place("seen")) << soFar;
+    };
+    TaskGroup group;
+    const TaskResult result = group.collect(group.start(std::move(plan)));
+    EXPECT_EQ(result.output, "begun\ndone\n");
+    EXPECT_EQ(seen, (std::vector<std::string>{"begun\n", "begun\ndone\n"}));
+}
+
+TEST_F(TaskGroupOf, OutputAboveTheBoundIsNotPassedOn) {
+    setTaskOutputBound(10);
+    TaskPlan plan = shell("echo 12345; sleep 0.1; echo 67890");
+    std::vector<std::string> seen;
+    plan.outputGrows = [&](std::string_view soFar) { seen.emplace_back(soFar); };
+    TaskGroup group;
+    EXPECT_EQ(group.collect(group.start(std::move(plan))).status, -1);
+    EXPECT_EQ(seen, std::vector<std::string>{"12345\n"});
+}
+
 TEST_F(TaskGroupOf, ResultsCanBeCollectedInAnyOrderAndToolsStartedInBetween) {
     TaskGroup group;
     const auto first = group.start(shell("echo 1"));
