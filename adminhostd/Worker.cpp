@@ -79,6 +79,9 @@ class Worker {
     FileDescriptor _toolConfiguration;  ///< open: the directory stays if the front is killed and another one starts
     bool _leftoversRemoved = false;
     bool _returnMemory = false;  ///< a large message has been freed
+    /// What the answer was written from. It is freed once the answer has been sent, because freeing and clearing a long
+    /// listing takes as long as writing it.
+    Value _spent;
 };
 
 /// Returns true if a command may change something: also one that the plug-in does not name, because it is not known to
@@ -258,10 +261,12 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
             answer.outcome = Outcome::nothing;
             break;
         case Response::Kind::dictionary:
-            answer = written(Outcome::answered, std::move(response->dictionary()), order.form);
+            _spent = std::move(response->dictionary());
+            answer = written(Outcome::answered, _spent, order.form);
             break;
         case Response::Kind::error:
-            answer = written(Outcome::error, std::move(response->dictionary()), order.form);
+            _spent = std::move(response->dictionary());
+            answer = written(Outcome::error, _spent, order.form);
             break;
     }
     answer.revision = std::move(revision);
@@ -362,6 +367,7 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
     _returnMemory |= frame.bytes.size() >= largeMessage;
     const bool sent =
         writeFrame(_descriptor, frame) || send(_descriptor, broken("The answer is too large to be sent."));
+    _spent = Value();
     return sent ? std::nullopt : std::optional(1);
 }
 

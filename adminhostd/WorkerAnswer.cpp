@@ -14,23 +14,22 @@ protocol::Answer broken(std::string message) {
     return answer;
 }
 
-protocol::Answer written(protocol::Outcome outcome, Dictionary response, BodyForm form) {
+protocol::Answer written(protocol::Outcome outcome, const Value& response, BodyForm form) {
     protocol::Answer answer;
     answer.outcome = outcome;
     if (outcome == protocol::Outcome::error) {
-        answer.error = response.text("error");
-        answer.message = response.text("message");
+        answer.error = response.dictionary()->text("error");
+        answer.message = response.dictionary()->text("message");
     }
-    const Value value(std::move(response));
     if (form == BodyForm::propertyList) {
-        if (auto text = xmlPropertyList(value)) {
+        if (auto text = xmlPropertyList(response)) {
             answer.form = form;
             answer.bytes = *std::move(text);
             return answer;
         }
     }
     answer.form = BodyForm::json;
-    answer.bytes = jsonOf(value) + '\n';
+    answer.bytes = jsonOf(response) + '\n';
     return answer;
 }
 

@@ -14,9 +14,8 @@ namespace adminhost {
 /// The worker could not do it.
 [[nodiscard]] protocol::Answer broken(std::string message);
 
-/// The answer's text in the form that the client prefers; in JSON if a property list cannot carry it. Drops the
-/// dictionary, so that an answer is in memory in one form at a time.
-[[nodiscard]] protocol::Answer written(protocol::Outcome outcome, Dictionary response, BodyForm form);
+/// The answer's text in the form that the client prefers; in JSON if a property list cannot carry it.
+[[nodiscard]] protocol::Answer written(protocol::Outcome outcome, const Value& response, BodyForm form);
 
 [[nodiscard]] protocol::Answer errorAnswer(std::string_view code, std::string_view message, BodyForm form);
 

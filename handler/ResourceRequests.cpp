@@ -126,16 +126,11 @@ Response LumioRequestHandler::getWorkflowsWithRequest(const Dictionary& request)
 
 Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary& request) {
     std::optional<Error> error;
-    const auto properties = Property::allPropertiesUsingLocalizations(languagesOf(request), error);
-    if (!properties) {
+    auto records = Property::recordsUsingLocalizations(languagesOf(request), error);
+    if (!records) {
         return failedListing(error);
     }
-    Array list;
-    list.reserve(properties->size());
-    for (const auto& property : *properties) {
-        std::move(*property).addDataDictionaryToMutableArray(list);
-    }
-    return listing("getProperties", "properties", std::move(list));
+    return listing("getProperties", "properties", *std::move(records));
 }
 
 Response LumioRequestHandler::setWorkflowACLWithRequest(const Array* changes) {

@@ -155,40 +155,63 @@ std::unique_ptr<Property> Property::initWithChangeRequest(const Dictionary& requ
     return property;
 }
 
-std::optional<std::vector<std::unique_ptr<Property>>> Property::allPropertiesWithError(std::optional<Error>& error) {
+bool Property::readAll(const Receiver& receiver, std::optional<Error>& error) {
+    const PropertyRowReceiver rows{[&](Dictionary row) {
+                                       makeUtf8(row);
+                                       receiver.add(initWithDictionary(std::move(row)));
+                                   },
+                                   receiver.discard};
     // The tool would create a missing database as an empty file.
-    std::vector<std::unique_ptr<Property>> properties;
-    const PropertyRowReceiver receiver{[&](Dictionary row) {
-                                           makeUtf8(row);
-                                           properties.push_back(initWithDictionary(std::move(row)));
-                                       },
-                                       [&] { properties.clear(); }};
-    const auto read = SettingsStore::dbPathExists()
-                          ? readPropertyRows("*", " from properties;", RowCount::any, receiver)
-                          : adminhost::failure(missingDatabase());
+    const auto read = SettingsStore::dbPathExists() ? readPropertyRows("*", " from properties;", RowCount::any, rows)
+                                                    : adminhost::failure(missingDatabase());
     if (!read) {
         error = read.error();
         logEvent("Error getting Sorvane workflow properties: " + textOf(error));
-        return std::nullopt;
     }
-    return properties;
+    return read.has_value();
 }
 
-std::optional<std::vector<std::unique_ptr<Property>>> Property::allPropertiesUsingLocalizations(
-    const std::vector<std::string>& languages, std::optional<Error>& error) {
-    auto properties = allPropertiesWithError(error);
-    if (!properties) {
-        return std::nullopt;
-    }
-    if (const std::optional<Dictionary> descriptions = descriptionsForLocalizations(languages)) {
-        for (const auto& property : *properties) {
-            const Value& description = descriptions->get(textOf(property->_data->get("name")));
+bool Property::readAllLocalized(const std::vector<std::string>& languages, const Receiver& receiver,
+                                std::optional<Error>& error) {
+    // Loaded for the first property, while the tool is still writing the others.
+    std::optional<std::optional<Dictionary>> descriptions;
+    const auto add = [&](std::unique_ptr<Property> property) {
+        if (!descriptions) {
+            descriptions.emplace(descriptionsForLocalizations(languages));
+        }
+        if (*descriptions) {
+            const Value& description = (*descriptions)->get(textOf(property->_data->get("name")));
             if (!description.isNull()) {
                 property->_data->set("description", description);
             }
         }
-    }
-    return properties;
+        receiver.add(std::move(property));
+    };
+    return readAll({add, receiver.discard}, error);
+}
+
+std::optional<std::vector<std::unique_ptr<Property>>> Property::allPropertiesWithError(std::optional<Error>& error) {
+    std::vector<std::unique_ptr<Property>> all;
+    const auto add = [&](std::unique_ptr<Property> property) { all.push_back(std::move(property)); };
+    return readAll({add, [&] { all.clear(); }}, error) ? std::optional(std::move(all)) : std::nullopt;
+}
+
+std::optional<std::vector<std::unique_ptr<Property>>> Property::allPropertiesUsingLocalizations(
+    const std::vector<std::string>& languages, std::optional<Error>& error) {
+    std::vector<std::unique_ptr<Property>> all;
+    const auto add = [&](std::unique_ptr<Property> property) { all.push_back(std::move(property)); };
+    return readAllLocalized(languages, {add, [&] { all.clear(); }}, error) ? std::optional(std::move(all))
+                                                                           : std::nullopt;
+}
+
+std::optional<Array> Property::recordsUsingLocalizations(const std::vector<std::string>& languages,
+                                                         std::optional<Error>& error) {
+    Array records;
+    const auto add = [&](std::unique_ptr<Property> property) {
+        std::move(*property).addDataDictionaryToMutableArray(records);
+    };
+    return readAllLocalized(languages, {add, [&] { records.clear(); }}, error) ? std::optional(std::move(records))
+                                                                               : std::nullopt;
 }
 
 std::optional<Dictionary> Property::descriptionsForLocalizations(const std::vector<std::string>& languages) {

@@ -11,6 +11,8 @@
 
 #include "resources/Resource.h"
 
+#include <functional>
+
 namespace lumio {
 
 class Property final : public ResourceClass<Property> {
@@ -32,6 +34,10 @@ class Property final : public ResourceClass<Property> {
         std::optional<adminhost::Error>& error);
     /// The same, each with its "description" where the service has one in the languages (most preferred first).
     [[nodiscard]] static std::optional<std::vector<std::unique_ptr<Property>>> allPropertiesUsingLocalizations(
+        const std::vector<std::string>& languages, std::optional<adminhost::Error>& error);
+    /// The records of these properties. Each is complete as soon as its row has been read, the first ones while the
+    /// tool is still writing the others.
+    [[nodiscard]] static std::optional<adminhost::Array> recordsUsingLocalizations(
         const std::vector<std::string>& languages, std::optional<adminhost::Error>& error);
     /// Descriptions by property name; empty if the service's bundle or a table in it is missing.
     [[nodiscard]] static std::optional<adminhost::Dictionary> descriptionsForLocalizations(
@@ -83,6 +89,15 @@ class Property final : public ResourceClass<Property> {
     [[nodiscard]] std::string section() const override { return "properties"; }
 
   private:
+    /// Receives the properties one by one, the first ones while the tool is still writing the others.
+    struct Receiver {
+        std::function<void(std::unique_ptr<Property>)> add;
+        std::function<void()> discard;  ///< those so far do not count
+    };
+    /// Return false, with the error and a log line, on failure.
+    [[nodiscard]] static bool readAll(const Receiver& receiver, std::optional<adminhost::Error>& error);
+    [[nodiscard]] static bool readAllLocalized(const std::vector<std::string>& languages, const Receiver& receiver,
+                                               std::optional<adminhost::Error>& error);
     [[nodiscard]] std::optional<adminhost::Error> nameError(const adminhost::Value& name,
                                                             std::optional<adminhost::Error>& toolError) const;
     /// Puts the stored value into the changes, as switching protection on or off needs it. Returns the error if the

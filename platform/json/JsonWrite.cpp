@@ -8,6 +8,8 @@
 #include <array>
 #include <charconv>
 #include <cmath>
+#include <cstdint>
+#include <cstring>
 #include <utility>
 
 namespace adminhost {
@@ -68,9 +70,23 @@ constexpr std::array<bool, 256> standForThemselves = [] {
     return plain;
 }();
 
+/// Returns true if all of these bytes stand for themselves.
+bool isPlain(std::string_view bytes) noexcept {
+    // Eight at a time. A byte that does not stand for itself sets its highest bit in one of the terms.
+    constexpr std::uint64_t each = 0x0101010101010101;
+    for (std::uint64_t eight = 0; bytes.size() >= sizeof eight; bytes.remove_prefix(sizeof eight)) {
+        std::memcpy(&eight, bytes.data(), sizeof eight);
+        const auto equals = [&](std::uint64_t byte) { return (eight ^ each * byte) - each; };
+        if (((eight | (eight - each * 0x20) | equals('"') | equals('\\') | equals(0x7f)) & each * 0x80) != 0) {
+            return false;
+        }
+    }
+    return std::all_of(bytes.begin(), bytes.end(),
+                       [](char c) { return standForThemselves[static_cast<unsigned char>(c)]; });
+}
+
 void Writer::writeString(std::string_view bytes) {
-    if (std::all_of(bytes.begin(), bytes.end(),
-                    [](char c) { return standForThemselves[static_cast<unsigned char>(c)]; })) {
+    if (isPlain(bytes)) {
         _text += '"';
         _text += bytes;
         _text += '"';

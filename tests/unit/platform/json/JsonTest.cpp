@@ -57,6 +57,23 @@ TEST(JsonOf, BytesThatAreNotUtf8BecomeReplacementCharacters) {
     EXPECT_EQ(jsonOf(Value("a\xff")), "\"a\xEF\xBF\xBD\"");
 }
 
+TEST(JsonOf, EveryCharacterIsWrittenTheSameWayWhereverItIs) {
+    for (int code = 0; code < 0x80; ++code) {
+        const char character = static_cast<char>(code);
+        const std::string alone = jsonOf(std::string(1, character));
+        EXPECT_EQ(alone == '"' + std::string(1, character) + '"',
+                  code >= 0x20 && code < 0x7f && character != '"' && character != '\\');
+        const std::string written = alone.substr(1, alone.size() - 2);
+        for (std::size_t before = 0; before < 18; ++before) {
+            for (const std::size_t behind : {0U, 3U, 8U}) {
+                const std::string left(before, '!');
+                const std::string right(behind, '~');
+                EXPECT_EQ(jsonOf(left + character + right), '"' + left + written + right + '"');
+            }
+        }
+    }
+}
+
 TEST(JsonRoundTrip, KeepsEveryValue) {
     const Value values[] = {
         Value(Dictionary{{"$", 1}, {"$date", "x"}, {"$$data", Array{Value(true)}}, {"", "empty"}}),
