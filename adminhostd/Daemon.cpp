@@ -3,12 +3,10 @@
 #include "adminhostd/ClearedStack.h"
 #include "adminhostd/Front.h"
 #include "adminhostd/FrontChecks.h"
-#include "adminhostd/ListeningSocket.h"
+#include "adminhostd/FrontStart.h"
+#include "adminhostd/MonitorLink.h"
 #include "adminhostd/Notify.h"
 #include "adminhostd/PluginSelection.h"
-#include "adminhostd/PrivateDirectory.h"
-#include "adminhostd/RunDirectory.h"
-#include "adminhostd/ToolConfiguration.h"
 #include "adminhostd/WorkerConfiguration.h"
 #include "platform/log/Log.h"
 
@@ -46,13 +44,13 @@ FileDescriptor stopSignals() {
 
 class Daemon {
   public:
-    Daemon(const Options& options, const PluginSelection& plugins, const ToolConfiguration& tools,
-           ListeningSocket& socket)
+    Daemon(const Options& options, const PluginSelection& plugins, const std::string& toolDirectory,
+           FileDescriptor link, FileDescriptor listener)
         : _options(options),
-          _socket(socket),
+          _monitor(std::move(link)),
+          _listener(std::move(listener)),
           _signals(stopSignals()),
-          _front({workerConfiguration(options, plugins, tools.directory()), options.logToStandardError,
-                  options.queueLimit, options.deadline},
+          _front({workerConfiguration(options, plugins, toolDirectory), _monitor, options.queueLimit, options.deadline},
                  plugins.refused, FrontChecks(options),
                  Permissions(options.permissions, ::geteuid(), configurationFile(options))) {}
 
@@ -60,7 +58,7 @@ class Daemon {
         for (;;) {
             // Clients that connect before the first worker is ready wait in the socket's backlog.
             if (!_server && _front.queue().settled() && !_stopping) {
-                _server.emplace(_socket.take(), _options.clientTimeout,
+                _server.emplace(std::move(_listener), _options.clientTimeout,
                                 [this](Exchange& exchange) { return _front.head(exchange); });
                 notify("READY=1");
             }
@@ -69,6 +67,9 @@ class Daemon {
             }
             wait();
             _front.queue().run(_entries);
+            if (_signalled || _monitor.closed()) {
+                stop();
+            }
             if (_server) {
                 _server->run();
                 clearUnusedStack();  // of what has been served in this turn
@@ -97,20 +98,24 @@ class Daemon {
         }
         ::poll(_entries.data(), _entries.size(), timeout);
         if (_entries.front().revents != 0) {
-            stop();
+            readSignals();
         }
     }
 
-    void stop() {
+    void readSignals() {
         signalfd_siginfo ignored{};
         while (::read(_signals.get(), &ignored, sizeof ignored) > 0) {
         }
+        _signalled = true;
+    }
+
+    void stop() {
         if (_stopping) {
             return;
         }
         _stopping = true;
         notify("STOPPING=1");
-        _socket.remove();
+        _listener.close();
         if (_server) {
             _server->quiesce();
         }
@@ -134,10 +139,12 @@ class Daemon {
     }
 
     const Options& _options;
-    ListeningSocket& _socket;
+    MonitorLink _monitor;
+    FileDescriptor _listener;  ///< until there is a server
     FileDescriptor _signals;
     Front _front;
     std::optional<HttpServer> _server;
+    bool _signalled = false;
     bool _stopping = false;
     std::optional<Clock::time_point> _stopBy;  ///< the end of the wait for clients, once no operation runs
     std::vector<pollfd> _entries;
@@ -145,13 +152,10 @@ class Daemon {
 
 }  // namespace
 
-int runDaemon(const Options& options) {
+int runDaemon(const Options& options, FileDescriptor link, FileDescriptor listener, const std::string& toolDirectory) {
     setLogSink(options.logToStandardError ? standardErrorSink() : syslogSink());
-    ListeningSocket socket(socketPath(options), groupOf(options.socketGroup));
-    removeAbandonedDirectories(privateParent(options));
-    const ToolConfiguration tools(privateParent(options));
     const PluginSelection plugins = selectPlugins(options);
-    Daemon(options, plugins, tools, socket).run();
+    Daemon(options, plugins, toolDirectory, std::move(link), std::move(listener)).run();
     for (const auto end = Clock::now() + logBound; !flushLog() && Clock::now() < end;) {
         std::this_thread::sleep_for(10ms);
     }

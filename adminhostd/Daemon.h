@@ -1,12 +1,18 @@
 #pragma once
 
-// The daemon's life: from the socket to the last answer.
+// The front's life: from its start by the monitor to the last answer.
 
 #include "adminhostd/Options.h"
+#include "platform/files/FileDescriptor.h"
+
+#include <string>
 
 namespace adminhost {
 
-/// Serves until SIGTERM or SIGINT, then finishes the running operation within ten seconds. Returns the exit status.
-[[nodiscard]] int runDaemon(const Options& options);
+/// Serves the listening socket until SIGTERM or SIGINT, or until the monitor at the other end of the link ends. Then it
+/// finishes the running operation: one that only reads within ten seconds. Returns the exit status; throws
+/// std::exception if the front cannot start.
+[[nodiscard]] int runDaemon(const Options& options, FileDescriptor link, FileDescriptor listener,
+                            const std::string& toolDirectory);
 
 }  // namespace adminhost

@@ -11,14 +11,14 @@ constexpr auto bound = std::chrono::seconds(8);
 
 }  // namespace
 
-void DirectoryProbe::start(protocol::Configure configuration, bool outputToStandardError) {
+void DirectoryProbe::start(protocol::Configure configuration, MonitorLink& monitor) {
     const bool remote = std::any_of(configuration.directory.begin(), configuration.directory.end(),
                                     [](const DirectoryNodeOptions& node) { return !node.local; });
     if (_process || !remote) {
         return;
     }
     configuration.probeDirectory = true;
-    _process = WorkerProcess::start(outputToStandardError);
+    _process = WorkerProcess::start(monitor);
     if (_process && !_process->send(protocol::frameOf(std::move(configuration)))) {
         _process.reset();
     }
@@ -40,7 +40,7 @@ void DirectoryProbe::run(std::span<const pollfd> polled, const std::function<voi
         return;
     }
     // Checked first: then everything that the process sent before its end is still read below.
-    const bool ended = _process->mayHaveEnded(polled) && _process->ending();
+    const bool ended = _process->ending().has_value();
     bool more = false;
     if (ended || _process->mayConverse(polled)) {
         more = _process->converse();

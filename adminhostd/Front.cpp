@@ -120,7 +120,8 @@ std::optional<HttpAnswer> Front::adoptId(Exchange& exchange, const Target& targe
 std::optional<HttpAnswer> Front::missing(const Target& target) const {
     const protocol::OfferedPlugin* plugin = pluginNamed(target.plugin);
     if (plugin == nullptr && !_hello) {
-        return retryLater("WORKER_UNAVAILABLE", "No worker has started yet, so that no plug-in is known.");
+        return retryLater("WORKER_UNAVAILABLE",
+                          _queue.workerProblem().value_or("No worker has started yet, so that no plug-in is known."));
     }
     if (plugin == nullptr) {
         return errorAnswer(

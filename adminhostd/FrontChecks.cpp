@@ -111,7 +111,7 @@ Diagnosis spaceOf(const std::string& what, const std::string& path) {
 
 Diagnosis unitCheck() {
     const char* const mainProcess = std::getenv("SYSTEMD_EXEC_PID");
-    const UnitProcesses unit = unitProcesses(::getpid(), mainProcess == nullptr ? "" : mainProcess);
+    const UnitProcesses unit = unitProcesses(::getppid(), mainProcess == nullptr ? "" : mainProcess);
     if (unit.unit.empty()) {
         return {Health::ok, "unit", "The daemon does not run as a unit of systemd.", ""};
     }
@@ -158,11 +158,12 @@ FrontChecks::FrontChecks(const Options& options)
 }
 
 Diagnosis FrontChecks::daemonCheck() const {
-    return {Health::ok, "daemon",
-            fmt::format("Release " ADMINHOST_RELEASE ", process {}, as {}, since {:%Y-%m-%d %H:%M:%S} UTC{}.",
-                        ::getpid(), ownerText(::geteuid()), fmt::gmtime(std::chrono::system_clock::to_time_t(_started)),
-                        _root == "/" ? "" : ", below " + _root),
-            ""};
+    return {
+        Health::ok, "daemon",
+        fmt::format("Release " ADMINHOST_RELEASE ", process {}, as {}, since {:%Y-%m-%d %H:%M:%S} UTC{}.", ::getppid(),
+                    ownerText(::geteuid()), fmt::gmtime(std::chrono::system_clock::to_time_t(_started)),
+                    _root == "/" ? "" : ", below " + _root),
+        ""};
 }
 
 Diagnosis FrontChecks::socketCheck() const {

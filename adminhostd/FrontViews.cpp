@@ -90,6 +90,9 @@ HttpAnswer Front::overview() const {
         text.set("running", std::move(description));
     }
     text.set("waiting", _queue.waiting());
+    if (const auto problem = _queue.workerProblem()) {
+        text.set("workerProblem", *problem);
+    }
     if (const auto pid = _queue.workerPid()) {
         text.set("workerPid", *pid);
     }

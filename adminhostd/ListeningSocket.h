@@ -28,8 +28,9 @@ class ListeningSocket {
     ListeningSocket& operator=(const ListeningSocket&) = delete;
     ~ListeningSocket() { remove(); }
 
-    /// Returns the descriptor and gives up its ownership; the path stays this object's.
-    [[nodiscard]] FileDescriptor take() { return std::move(_socket); }
+    [[nodiscard]] int descriptor() const noexcept { return _socket.get(); }
+    /// Stops listening, in this process.
+    void close() noexcept { _socket.close(); }
     /// Removes the path, unless another daemon has taken it over.
     void remove() noexcept;
 

@@ -26,18 +26,18 @@ OperationQueue::OperationQueue(Settings settings, Events events)
 }
 
 std::optional<pid_t> OperationQueue::workerPid() const {
-    return _worker ? std::optional(_worker->pid()) : std::nullopt;
+    return _worker ? _worker->pid() : std::nullopt;
 }
 
 std::optional<std::string> OperationQueue::workerProblem() const {
-    return _state == State::paused ? std::optional(_startProblem) : std::nullopt;
+    return _state == State::paused || _waitsForLeft ? std::optional(_startProblem) : std::nullopt;
 }
 
 void OperationQueue::add(Operation operation) {
     _waiting.push_back(std::move(operation));
     if (_stopping) {
         failWaiting(Unserved::Reason::stopping, "The daemon is being stopped.");
-    } else if (_state == State::paused) {
+    } else if (_state == State::paused || _waitsForLeft) {
         failWaiting(Unserved::Reason::unavailable, _startProblem);
     } else if (_state == State::idle) {
         next();
@@ -45,11 +45,9 @@ void OperationQueue::add(Operation operation) {
 }
 
 void OperationQueue::addTo(std::vector<pollfd>& entries) const {
+    _settings.monitor.addTo(entries);
     if (_worker) {
         _worker->addTo(entries);
-    }
-    for (const auto& worker : _dying) {
-        worker->addTo(entries);
     }
     _directoryProbe.addTo(entries);
 }
@@ -69,13 +67,30 @@ std::optional<OperationQueue::Clock::time_point> OperationQueue::due() const {
 
 void OperationQueue::start() {
     ++_starts;
-    _worker = WorkerProcess::start(_settings.outputToStandardError);
+    _worker = WorkerProcess::start(_settings.monitor);
     if (!_worker || !_worker->send(protocol::frameOf(_settings.configuration))) {
         startFailed(fmt::format("cannot be started: {}", std::strerror(errno)));
         return;
     }
     _state = State::starting;
     _due = Clock::now() + startBound;
+}
+
+void OperationQueue::noteStart() {
+    if (_worker && _worker->waitsFor() && !_waitsForLeft) {
+        _waitsForLeft = true;
+        _settled = true;
+        _due.reset();
+        _startProblem = fmt::format(
+            "The worker of a front that has died (process {}) is finishing its request. The next worker is started "
+            "when it has ended.",
+            *_worker->waitsFor());
+        _events.log("adminhostd: " + _startProblem);
+        failWaiting(Unserved::Reason::unavailable, _startProblem);
+    } else if (_waitsForLeft && (!_worker || !_worker->waitsFor())) {
+        _waitsForLeft = false;
+        _due = Clock::now() + startBound;
+    }
 }
 
 void OperationQueue::startFailed(const std::string& reason) {
@@ -99,11 +114,12 @@ void OperationQueue::failWaiting(Unserved::Reason reason, const std::string& mes
 }
 
 void OperationQueue::run(std::span<const pollfd> polled) {
+    _settings.monitor.run();
+    noteStart();
     if (_worker) {
         converse(polled);
     }
     _directoryProbe.run(polled, _events.log);
-    std::erase_if(_dying, [&](const auto& worker) { return worker->mayHaveEnded(polled) && worker->ending(); });
     if (_due && Clock::now() >= *_due) {
         timeUp();
     }
@@ -136,7 +152,7 @@ void OperationQueue::giveUpWaiting() {
 
 void OperationQueue::converse(std::span<const pollfd> polled) {
     // Checked first: then everything that the worker sent before its end is still read below.
-    const bool ended = _worker->mayHaveEnded(polled) && _worker->ending();
+    const bool ended = _worker->ending().has_value();
     if (!ended && !_worker->mayConverse(polled)) {
         return;
     }
@@ -205,7 +221,7 @@ bool OperationQueue::take(protocol::Hello hello) {
     _settled = true;
     _due.reset();
     _pause = 0ms;
-    _directoryProbe.start(_settings.configuration, _settings.outputToStandardError);
+    _directoryProbe.start(_settings.configuration, _settings.monitor);
     next();
     return true;
 }
@@ -235,12 +251,10 @@ void OperationQueue::endWorker(const std::string& why) {
 void OperationQueue::workerEnded(const std::string& how) {
     const State state = std::exchange(_state, State::paused);
     _due.reset();
-    if (!_worker->ending()) {
-        _dying.push_back(std::move(_worker));
-    }
+    const bool started = _worker->pid().has_value();
     _worker.reset();
     if (state == State::starting) {
-        startFailed(how + " before it was ready");
+        startFailed(started ? how + " before it was ready" : how);
         return;
     }
     _events.log("adminhostd: the worker " + how);

@@ -57,8 +57,8 @@ struct Unserved {
 class OperationQueue {
   public:
     struct Settings {
-        protocol::Configure configuration;   ///< sent to every worker first
-        bool outputToStandardError = false;  ///< of the worker
+        protocol::Configure configuration;  ///< sent to every worker first
+        MonitorLink& monitor;               ///< starts the workers
         std::size_t limit = 64;
         std::chrono::milliseconds deadline{300'000};
     };
@@ -85,7 +85,8 @@ class OperationQueue {
     [[nodiscard]] std::optional<pid_t> workerPid() const;
     /// Why there is no worker that can serve now; nullopt if there is one, or if one is being started.
     [[nodiscard]] std::optional<std::string> workerProblem() const;
-    /// Returns true once the first worker has said hello, or has failed to.
+    /// Returns true once the first worker has said hello, has failed to, or has to wait for the worker of an earlier
+    /// front.
     [[nodiscard]] bool settled() const noexcept { return _settled; }
 
     /// Fails the waiting operations. A running operation that changes something keeps its whole time, because half of a
@@ -104,6 +105,7 @@ class OperationQueue {
     enum class State { paused, starting, idle, busy };
 
     void start();
+    void noteStart();
     void startFailed(const std::string& reason);
     void converse(std::span<const pollfd> polled);
     void receive(Frame frame);
@@ -131,7 +133,6 @@ class OperationQueue {
     Events _events;
     State _state = State::paused;
     std::unique_ptr<WorkerProcess> _worker;
-    std::vector<std::unique_ptr<WorkerProcess>> _dying;  ///< killed, but the kernel has not ended them yet
     DirectoryProbe _directoryProbe;
     std::deque<Operation> _waiting;
     std::optional<Operation> _running;
@@ -139,7 +140,8 @@ class OperationQueue {
     std::optional<Clock::time_point> _due;          ///< when timeUp() has to act
     std::chrono::milliseconds _pause{0};
     std::string _startProblem;
-    unsigned long _starts = 0;  ///< distinguishes one worker from the next
+    unsigned long _starts = 0;   ///< distinguishes one worker from the next
+    bool _waitsForLeft = false;  ///< the worker's start waits for the end of an earlier front's worker
     bool _settled = false;
     bool _stopping = false;
 };

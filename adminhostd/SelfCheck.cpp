@@ -1,13 +1,16 @@
 #include "adminhostd/SelfCheck.h"
 
+#include "adminhostd/Frame.h"
 #include "adminhostd/ListeningSocket.h"
 #include "adminhostd/PluginSelection.h"
 #include "adminhostd/RunDirectory.h"
 #include "adminhostd/ToolConfiguration.h"
 #include "adminhostd/WorkerConfiguration.h"
-#include "adminhostd/WorkerProcess.h"
+#include "adminhostd/WorkerStart.h"
+#include "platform/value/Result.h"
 
 #include <cerrno>
+#include <csignal>
 #include <cstring>
 #include <filesystem>
 #include <iostream>
@@ -15,6 +18,10 @@
 #include <vector>
 
 #include <fmt/format.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/time.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 namespace adminhost {
@@ -22,30 +29,42 @@ namespace {
 
 /// The worker's first message. If there is none, `problem` describes why.
 protocol::Hello helloOf(const protocol::Configure& configuration, std::string& problem) {
-    const auto worker = WorkerProcess::start(true);
-    if (!worker || !worker->send(protocol::frameOf(configuration))) {
-        problem = fmt::format("The worker cannot be started: {}", std::strerror(errno));
+    auto worker = startWorker(true);
+    if (!worker) {
+        problem = fmt::format("The worker cannot be started: {}", worker.error().description.value_or(""));
         return {};
     }
-    for (int waited = 0; waited < 300; ++waited) {
-        std::vector<pollfd> entries;
-        worker->addTo(entries);
-        ::poll(entries.data(), entries.size(), 100);
-        static_cast<void>(worker->converse());
-        while (auto frame = worker->next()) {
-            auto message = protocol::toFront(std::move(*frame));
-            if (auto* hello = message ? std::get_if<protocol::Hello>(&*message) : nullptr) {
-                worker->finish(1000);
-                return std::move(*hello);
-            }
-        }
-        if (worker->ending()) {
-            problem = "The worker " + *worker->ending() + " before it was ready.";
-            return {};
+    const int socket = worker->conversation.get();
+    const timeval bound{30, 0};
+    ::setsockopt(socket, SOL_SOCKET, SO_RCVTIMEO, &bound, sizeof bound);
+    protocol::Hello hello;
+    bool ready = writeFrame(socket, protocol::frameOf(configuration));
+    FrameReader reader;
+    for (bool said = false; ready && !said;) {
+        auto frame = readFrame(socket, reader);
+        auto message = frame ? protocol::toFront(std::move(*frame)) : failure(Error{});
+        ready = message.has_value();
+        if (auto* here = message ? std::get_if<protocol::Hello>(&*message) : nullptr) {
+            hello = std::move(*here);
+            said = true;
         }
     }
-    problem = "The worker is not ready in time: a plug-in hangs while it is loaded.";
-    return {};
+    // It ends by itself, but one that hangs does not.
+    worker->conversation.close();
+    pollfd entry{worker->process.get(), POLLIN, 0};
+    const bool hangs = ::poll(&entry, 1, 1000) == 0;
+    if (hangs) {
+        ::kill(worker->pid, SIGKILL);
+    }
+    int status = 0;
+    while (::waitpid(worker->pid, &status, 0) < 0 && errno == EINTR) {
+    }
+    worker->tools.killRemaining();
+    if (!ready) {
+        problem = hangs ? "The worker is not ready in time: a plug-in hangs while it is loaded."
+                        : "The worker " + endingText(status) + " before it was ready.";
+    }
+    return hello;
 }
 
 }  // namespace

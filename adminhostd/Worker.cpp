@@ -20,6 +20,7 @@
 #include "platform/log/Log.h"
 #include "platform/service/ServiceState.h"
 #include "platform/task/Task.h"
+#include "platform/task/ToolRegister.h"
 #include "platform/value/ValueText.h"
 
 #include <algorithm>
@@ -43,6 +44,16 @@ using protocol::Outcome;
 
 /// Bytes of a message after which freed memory is returned to the system.
 constexpr std::size_t largeMessage = std::size_t{1} << 20U;
+
+/// For an order that has no deadline: the front ends it earlier.
+constexpr std::chrono::milliseconds undatedBound = std::chrono::minutes(5);
+
+/// Shows the monitor until when an operation runs, so that it can end one whose front has died.
+void setDeadline(std::optional<Clock::time_point> deadline) {
+    if (ToolRegister* const shared = toolRegister()) {
+        shared->setDeadline(deadline);
+    }
+}
 
 bool send(int descriptor, protocol::ToFront message) {
     return writeFrame(descriptor, protocol::frameOf(std::move(message)));
@@ -352,6 +363,11 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
     try {
         answered = std::visit(
             [&]<class Order>(const Order& order) {
+                auto bound = undatedBound;
+                if constexpr (requires { order.milliseconds; }) {
+                    bound = std::chrono::milliseconds(order.milliseconds);
+                }
+                setDeadline(Clock::now() + bound);
                 if constexpr (std::is_same_v<Order, protocol::Configure>) {
                     return broken({});
                 } else {
@@ -363,6 +379,7 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
         answered = broken(exception.what());
     }
     setTaskDeadline(std::nullopt);
+    setDeadline(std::nullopt);
     const Frame frame = protocol::frameOf(std::move(answered));
     _returnMemory |= frame.bytes.size() >= largeMessage;
     const bool sent =

@@ -2,8 +2,8 @@
 
 // The worker: the process that loads the plug-ins and runs their operations, one at a time.
 //
-// The front starts it on the other end of an inherited socket pair. It has one thread, and ends when the front closes
-// its end. Protocol.h describes their messages.
+// The monitor starts it on one end of a socket pair, whose other end the front has. It has one thread, and ends when
+// the front closes its end. Protocol.h describes their messages.
 
 namespace adminhost {
 

@@ -1,4 +1,4 @@
-// adminhostd-worker: started by the front, with the conversation as descriptor 3 and the register of tools as 4.
+// adminhostd-worker: started by the monitor, with the conversation as descriptor 3 and the register of tools as 4.
 
 #include "adminhostd/PluginTrial.h"
 #include "adminhostd/ProcessStart.h"

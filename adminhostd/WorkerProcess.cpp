@@ -1,36 +1,21 @@
 #include "adminhostd/WorkerProcess.h"
 
-#include "platform/task/StartChild.h"
+#include "adminhostd/WorkerStart.h"
 
 #include <algorithm>
 #include <cerrno>
-#include <csignal>
 #include <cstring>
 #include <utility>
-#include <vector>
 
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 namespace adminhost {
 namespace {
 
 /// Bytes that are read in one go. A worker that sends without end must not keep the front from its clients.
 constexpr std::size_t readMaximum = std::size_t{1} << 20U;
-
-/// The worker's program: beside this one in a build, in the library directory next to ours when installed.
-std::string workerProgram() {
-    char buffer[4096];
-    const ssize_t length = ::readlink("/proc/self/exe", buffer, sizeof buffer);
-    const std::string self(buffer, length < 0 ? 0 : static_cast<std::size_t>(length));
-    const std::string directory = self.substr(0, self.rfind('/') + 1);
-    std::string beside = directory + "adminhostd-worker";
-    return ::access(beside.c_str(), X_OK) == 0 ? beside : directory + "../lib/adminhostd/adminhostd-worker";
-}
 
 bool isReady(std::span<const pollfd> polled, int descriptor) noexcept {
     return std::any_of(polled.begin(), polled.end(),
@@ -39,58 +24,45 @@ bool isReady(std::span<const pollfd> polled, int descriptor) noexcept {
 
 }  // namespace
 
-std::unique_ptr<WorkerProcess> WorkerProcess::start(bool outputToStandardError) {
-    int ends[2];
-    if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
-        return nullptr;
-    }
-    auto tools = ToolRegister::create();
-    if (!tools) {
-        errno = static_cast<int>(tools.error().code);
-        return nullptr;
-    }
-    std::unique_ptr<WorkerProcess> worker(new WorkerProcess(*std::move(tools)));
-    worker->_socket = FileDescriptor(ends[0]);
-    const FileDescriptor other(ends[1]);
-    ::fcntl(ends[0], F_SETFL, O_NONBLOCK);
+std::unique_ptr<WorkerProcess> WorkerProcess::start(MonitorLink& monitor) {
+    std::unique_ptr<WorkerProcess> worker(new WorkerProcess(monitor));
+    worker->_number = monitor.start([self = worker.get()](ReceivedMessage& received) { self->receive(received); });
+    return worker->_number == 0 ? nullptr : std::move(worker);
+}
 
-    ChildPlan plan;
-    plan.program = workerProgram();
-    plan.arguments = {"adminhostd-worker"};
-    plan.environment = processEnvironment();
-    plan.descriptors = {-1, outputToStandardError ? STDERR_FILENO : STDOUT_FILENO, STDERR_FILENO, other.get(),
-                        worker->_tools.descriptor()};
-    plan.directory = "/";
-    plan.fileModeMask = S_IWGRP | S_IWOTH;
-    auto started = startChild(plan);
-    if (!started) {
-        errno = static_cast<int>(started.error().code);
-        return nullptr;
+void WorkerProcess::receive(ReceivedMessage& received) {
+    const MonitorMessage& message = received.message;
+    if (message.kind == MonitorMessage::Kind::ended) {
+        _ending = endingText(message.status);
+    } else if (message.kind == MonitorMessage::Kind::start && message.status == EBUSY) {
+        _waitsFor = message.process;
+    } else if (message.kind == MonitorMessage::Kind::start && message.status != 0) {
+        _ending = fmt::format("cannot be started: {}", std::strerror(message.status));
+    } else if (message.kind == MonitorMessage::Kind::start && !_pid) {
+        _waitsFor.reset();
+        _pid = message.process;
+        _socket = std::move(received.descriptors[0]);
+        _process = std::move(received.descriptors[1]);
+        ::fcntl(_socket.get(), F_SETFL, O_NONBLOCK);
+        write();
     }
-    worker->_pid = started->pid;
-    worker->_process = std::move(started->exit);
-    return worker;
 }
 
 WorkerProcess::~WorkerProcess() {
-    if (_pid > 0 && !ending()) {
+    if (_number != 0) {
         kill();
-        finish(100);
+        _monitor.forget(_number);
     }
 }
 
 void WorkerProcess::addTo(std::vector<pollfd>& entries) const {
     entries.push_back(
         {_closed ? -1 : _socket.get(), static_cast<short>(_unsent.empty() ? POLLIN : POLLIN | POLLOUT), 0});
-    entries.push_back({_process.get(), POLLIN, 0});
+    entries.push_back({_monitor.closed() && !_ending ? _process.get() : -1, POLLIN, 0});
 }
 
 bool WorkerProcess::mayConverse(std::span<const pollfd> polled) const noexcept {
-    return !_closed && isReady(polled, _socket.get());
-}
-
-bool WorkerProcess::mayHaveEnded(std::span<const pollfd> polled) const noexcept {
-    return _ending || !_process.isOpen() || isReady(polled, _process.get());
+    return !_closed && _socket.isOpen() && isReady(polled, _socket.get());
 }
 
 bool WorkerProcess::send(const Frame& frame) {
@@ -109,7 +81,7 @@ bool WorkerProcess::send(const Frame& frame) {
 }
 
 void WorkerProcess::write() {
-    while (_sent < _unsent.size()) {
+    while (_socket.isOpen() && _sent < _unsent.size()) {
         const ssize_t written = ::send(_socket.get(), _unsent.data() + _sent, _unsent.size() - _sent, MSG_NOSIGNAL);
         if (written < 0 && errno == EINTR) {
             continue;
@@ -132,7 +104,7 @@ bool WorkerProcess::converse() {
     }
     char buffer[64 << 10];
     std::size_t taken = 0;
-    while (!_closed && taken < readMaximum) {
+    while (_socket.isOpen() && !_closed && taken < readMaximum) {
         const ssize_t count = ::recv(_socket.get(), buffer, sizeof buffer, 0);
         if (count > 0) {
             _reader.append({buffer, static_cast<std::size_t>(count)});
@@ -147,41 +119,24 @@ bool WorkerProcess::converse() {
             return false;
         }
     }
-    return !_closed;
+    return _socket.isOpen() && !_closed;
 }
 
 const std::optional<std::string>& WorkerProcess::ending() {
-    if (_ending) {
-        return _ending;
-    }
-    int status = 0;
-    const pid_t waited = ::waitpid(_pid, &status, WNOHANG);
-    if (waited < 0 && errno == ECHILD) {
-        _ending = "ended, and the system does not know how";
-    } else if (waited == _pid && WIFSIGNALED(status)) {
-        _ending = fmt::format("was killed by signal {} ({})", WTERMSIG(status), ::strsignal(WTERMSIG(status)));
-    } else if (waited == _pid) {
-        _ending = fmt::format("ended with status {}", WEXITSTATUS(status));
-    }
-    if (_ending) {
-        _tools.killRemaining();
+    // The monitor reports how a worker ended. Without a monitor only the end itself can be seen.
+    if (!_ending && _monitor.closed()) {
+        pollfd entry{_process.get(), POLLIN, 0};
+        if (!_process.isOpen() || ::poll(&entry, 1, 0) > 0) {
+            _ending = "ended, and the system does not know how";
+        }
     }
     return _ending;
 }
 
 void WorkerProcess::kill() noexcept {
     if (!_ending) {
-        ::kill(_pid, SIGKILL);
+        _monitor.kill(_number);
     }
-}
-
-void WorkerProcess::finish(int milliseconds) {
-    _socket.close();
-    _closed = true;
-    pollfd entry{_process.get(), POLLIN, 0};
-    while (::poll(&entry, 1, milliseconds) < 0 && errno == EINTR) {
-    }
-    static_cast<void>(ending());
 }
 
 }  // namespace adminhost

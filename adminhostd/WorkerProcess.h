@@ -1,16 +1,17 @@
 #pragma once
 
-// The front's side of a worker: the child process and the buffered conversation with it, which never blocks.
+// The front's side of a worker: the process, which the monitor starts and ends, and the buffered conversation with it,
+// which never blocks.
 
 #include "adminhostd/Frame.h"
+#include "adminhostd/MonitorLink.h"
 #include "platform/files/FileDescriptor.h"
-#include "platform/task/ToolRegister.h"
 
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <span>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include <poll.h>
@@ -20,23 +21,23 @@ namespace adminhost {
 
 class WorkerProcess {
   public:
-    /// Starts a worker. Operations print to its standard output, which is ours (a service manager keeps it), or our
-    /// standard error if the log goes there. Returns null, with errno, if it cannot be started.
-    [[nodiscard]] static std::unique_ptr<WorkerProcess> start(bool outputToStandardError);
+    /// Asks the monitor for a worker; what is sent to it meanwhile is kept. Returns null, with errno, if the monitor
+    /// cannot be asked. The link must outlive the object.
+    [[nodiscard]] static std::unique_ptr<WorkerProcess> start(MonitorLink& monitor);
 
     WorkerProcess(const WorkerProcess&) = delete;
     WorkerProcess& operator=(const WorkerProcess&) = delete;
-    /// A worker that is still running is killed. One that the kernel cannot end yet (a dead mount) is left to the next
-    /// parent.
+    /// A worker that is still running is killed.
     ~WorkerProcess();
 
-    [[nodiscard]] pid_t pid() const noexcept { return _pid; }
-    /// Adds the descriptors to poll: first the conversation, then the end of the process.
+    /// The process; nullopt before the monitor has started it.
+    [[nodiscard]] std::optional<pid_t> pid() const noexcept { return _pid; }
+    /// The worker of an earlier front whose end the monitor waits for before it starts this one.
+    [[nodiscard]] std::optional<pid_t> waitsFor() const noexcept { return _waitsFor; }
     void addTo(std::vector<pollfd>& entries) const;
 
-    /// After a poll of these entries: returns true if converse() has something to do, or if the process may have ended.
+    /// After a poll of these entries: returns true if converse() has something to do.
     [[nodiscard]] bool mayConverse(std::span<const pollfd> polled) const noexcept;
-    [[nodiscard]] bool mayHaveEnded(std::span<const pollfd> polled) const noexcept;
 
     /// Queues a frame and sends what can be sent. Returns false if it is too large.
     [[nodiscard]] bool send(const Frame& frame);
@@ -47,21 +48,22 @@ class WorkerProcess {
     [[nodiscard]] std::optional<Frame> next() { return _reader.next(); }
     /// Returns true if the worker has sent bytes that are not a frame.
     [[nodiscard]] bool broken() const noexcept { return _reader.broken(); }
-    /// How the process ended ("was killed by signal 11 (Segmentation fault)"); nullopt while it is running. Ends the
-    /// tools that it ran, but not a service that they have started.
+    /// How the process ended ("was killed by signal 11 (Segmentation fault)"), or why it could not be started; nullopt
+    /// while it is running. The monitor has ended the tools that it ran, but not a service that they have started.
     [[nodiscard]] const std::optional<std::string>& ending();
     void kill() noexcept;
-    /// Makes the worker end by closing the conversation, and waits for it, at most for the milliseconds.
-    void finish(int milliseconds);
 
   private:
-    explicit WorkerProcess(ToolRegister tools) : _tools(std::move(tools)) {}
+    explicit WorkerProcess(MonitorLink& monitor) : _monitor(monitor) {}
+    void receive(ReceivedMessage& received);
     void write();
 
-    pid_t _pid = -1;
-    ToolRegister _tools;  ///< that the worker runs
+    MonitorLink& _monitor;
+    std::uint32_t _number = 0;
+    std::optional<pid_t> _pid;
+    std::optional<pid_t> _waitsFor;
     FileDescriptor _socket;
-    FileDescriptor _process;
+    FileDescriptor _process;  ///< needed once the monitor has ended
     FrameReader _reader;
     std::string _unsent;
     std::size_t _sent = 0;  ///< how much of it has been sent

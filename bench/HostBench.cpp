@@ -222,7 +222,7 @@ void residentMemory(benchmark::State& state) {
     const DaemonProcess daemon(fixture());
     const pid_t worker = daemon.workerPid();
     const auto megabytes = [&] {
-        return static_cast<double>(residentKilobytesOf(daemon.pid()) + residentKilobytesOf(worker)) / 1024;
+        return static_cast<double>(residentKilobytesOf(daemon.frontPid()) + residentKilobytesOf(worker)) / 1024;
     };
     Client client(daemon.socket());
     const auto serve = [&](int count) {
@@ -235,7 +235,7 @@ void residentMemory(benchmark::State& state) {
         state.counters["mb_after_1000"] = megabytes();
         serve(9'000);
         state.counters["mb_after_10000"] = megabytes();
-        state.counters["mb_front"] = static_cast<double>(residentKilobytesOf(daemon.pid())) / 1024;
+        state.counters["mb_front"] = static_cast<double>(residentKilobytesOf(daemon.frontPid())) / 1024;
     }
 }
 BENCHMARK(residentMemory)->Iterations(1)->Unit(benchmark::kMillisecond);

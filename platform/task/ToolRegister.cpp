@@ -21,8 +21,6 @@ constexpr std::size_t size = 4096;
 constexpr pid_t claimed = -1;  ///< by a tool that has not entered its id yet
 constexpr int stopTries = 20;  ///< milliseconds
 
-static_assert(sizeof(std::atomic<pid_t>) * ToolRegister::capacity <= size);
-
 std::atomic<ToolRegister*> registerOfProcess = nullptr;
 
 tl::unexpected<Error> failed() {
@@ -98,6 +96,7 @@ Result<ToolRegister> ToolRegister::open(FileDescriptor descriptor) {
         errno = EINVAL;
         return failed();
     }
+    static_assert(sizeof(Places) <= size && std::atomic<std::int64_t>::is_always_lock_free);
     void* memory = ::mmap(nullptr, size, PROT_READ | PROT_WRITE, MAP_SHARED, descriptor.get(), 0);
     if (memory == MAP_FAILED) {
         return failed();
@@ -115,7 +114,7 @@ ToolRegister::~ToolRegister() {
 }
 
 std::atomic<pid_t>* ToolRegister::claim() noexcept {
-    for (std::atomic<pid_t>& place : *_places) {
+    for (std::atomic<pid_t>& place : _places->tools) {
         pid_t free = 0;
         if (place.compare_exchange_strong(free, claimed)) {
             return &place;
@@ -125,12 +124,22 @@ std::atomic<pid_t>* ToolRegister::claim() noexcept {
 }
 
 void ToolRegister::killRemaining() noexcept {
-    for (std::atomic<pid_t>& place : *_places) {
+    for (std::atomic<pid_t>& place : _places->tools) {
         const pid_t pid = place.exchange(0);
         if (pid > 1) {
             killGroup(pid);
         }
     }
+}
+
+void ToolRegister::setDeadline(std::optional<std::chrono::steady_clock::time_point> deadline) noexcept {
+    _places->deadline = deadline ? deadline->time_since_epoch().count() : 0;
+}
+
+std::optional<std::chrono::steady_clock::time_point> ToolRegister::deadline() const noexcept {
+    using Clock = std::chrono::steady_clock;
+    const std::int64_t count = _places->deadline;
+    return count == 0 ? std::nullopt : std::optional(Clock::time_point(Clock::duration(count)));
 }
 
 void setToolRegister(ToolRegister* toolRegister) noexcept {

@@ -1,7 +1,7 @@
 #pragma once
 
-// The process ids of the tools that a process runs, in memory that it shares with its parent. If the process dies, its
-// parent ends the tools from it.
+// The process ids of the tools that a process runs, and the deadline of its operation, in memory that it shares with
+// its parent. If the process dies, its parent ends the tools from it.
 //
 // A tool enters its own id before it executes its program (StartChild.h). The id is removed when the exit of the tool
 // is seen, before the tool is reaped: so an id in the register never belongs to another process while its owner lives.
@@ -12,7 +12,10 @@
 
 #include <array>
 #include <atomic>
+#include <chrono>
 #include <cstddef>
+#include <cstdint>
+#include <optional>
 #include <utility>
 
 #include <sys/types.h>
@@ -43,8 +46,15 @@ class ADMINHOST_EXPORT ToolRegister {
     /// tool has started. Waits for at most some milliseconds for each tool.
     void killRemaining() noexcept;
 
+    /// The deadline of the operation that the process runs; nullopt while it runs none.
+    void setDeadline(std::optional<std::chrono::steady_clock::time_point> deadline) noexcept;
+    [[nodiscard]] std::optional<std::chrono::steady_clock::time_point> deadline() const noexcept;
+
   private:
-    using Places = std::array<std::atomic<pid_t>, capacity>;
+    struct Places {
+        std::array<std::atomic<pid_t>, capacity> tools;
+        std::atomic<std::int64_t> deadline;  ///< nanoseconds of the steady clock; 0: none
+    };
 
     ToolRegister(FileDescriptor descriptor, Places* places) noexcept
         : _descriptor(std::move(descriptor)), _places(places) {}

@@ -112,7 +112,11 @@ DaemonProcess::~DaemonProcess() {
 void DaemonProcess::end() {
     if (_pid > 0 && !_status) {
         // Its worker ends by itself when the socket pair is closed.
+        const pid_t front = frontPid();
         ::kill(_pid, SIGKILL);
+        if (front > 0) {
+            ::kill(front, SIGKILL);
+        }
         wait();
     }
     // A worker that is still ending may create and remove files meanwhile.
@@ -120,6 +124,17 @@ void DaemonProcess::end() {
     for (int tries = 0; std::filesystem::remove_all(_directory, error), error && tries < 500; ++tries) {
         ::usleep(10'000);
     }
+}
+
+pid_t DaemonProcess::frontPid() const {
+    const std::string self = std::to_string(_pid);
+    std::ifstream children("/proc/" + self + "/task/" + self + "/children");
+    for (pid_t pid = 0; children >> pid;) {
+        if (readWhole("/proc/" + std::to_string(pid) + "/comm").starts_with("adminhostd-fron")) {
+            return pid;
+        }
+    }
+    return -1;
 }
 
 pid_t DaemonProcess::workerPid() const {

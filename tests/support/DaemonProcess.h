@@ -34,7 +34,10 @@ class DaemonProcess {
     /// Kills it if it is still running.
     ~DaemonProcess();
 
+    /// The process id of the monitor.
     [[nodiscard]] pid_t pid() const noexcept { return _pid; }
+    /// The process id of the front; -1 while none is running.
+    [[nodiscard]] pid_t frontPid() const;
     [[nodiscard]] const std::filesystem::path& directory() const noexcept { return _directory; }
     [[nodiscard]] const std::string& socket() const noexcept { return _socket; }
     [[nodiscard]] UnixHttp connect() const { return UnixHttp(socket()); }

@@ -132,7 +132,9 @@ TEST_F(LostAnswers, DaemonThatIsGoneLeavesItUndetermined) {
     root.setSwitch("setup_library.sleep", "30");
     RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
     waitForWrite();
+    const pid_t front = daemon.frontPid();
     daemon.signal(SIGKILL);
+    ::kill(front, SIGKILL);
     const ProgramResult result = set.wait();
     EXPECT_EQ(result.status, 6);
     EXPECT_THAT(result.output,

@@ -132,10 +132,10 @@ TEST(Connections, ShortOfDescriptorsTheDaemonWaitsInsteadOfSpinning) {
             EXPECT_FALSE(daemon.log().empty()) << descriptors << ": it says why it does not start";
             continue;
         }
-        const long before = processorMilliseconds(daemon.pid());
+        const long before = processorMilliseconds(daemon.frontPid());
         std::this_thread::sleep_for(std::chrono::seconds(1));
-        EXPECT_LT(processorMilliseconds(daemon.pid()) - before, 300) << descriptors << " descriptors:\n"
-                                                                     << daemon.log().substr(0, 2000);
+        EXPECT_LT(processorMilliseconds(daemon.frontPid()) - before, 300) << descriptors << " descriptors:\n"
+                                                                          << daemon.log().substr(0, 2000);
     }
 }
 
@@ -144,7 +144,7 @@ TEST(Connections, TwelveClientsThatDoNotReadCostOneFormOfTheirAnswersAndItIsRetu
     options.environment = {"ASAN_OPTIONS=quarantine_size_mb=1"};  // otherwise a sanitizer keeps freed memory
     const DaemonProcess daemon(options);
     const std::string body = largeBody();
-    const std::size_t before = residentKilobytesOf(daemon.pid());
+    const std::size_t before = residentKilobytesOf(daemon.frontPid());
     {
         std::vector<UnixHttp> clients;
         for (int i = 0; i < 12; ++i) {
@@ -155,13 +155,14 @@ TEST(Connections, TwelveClientsThatDoNotReadCostOneFormOfTheirAnswersAndItIsRetu
             const Dictionary overview = dictionaryOf(daemon.connect().get("/v1/"));
             return overview.get("waiting") == Value(0) && !overview.contains("running");
         }));
-        EXPECT_LT(residentKilobytesOf(daemon.pid()), before + 110'000) << "kilobytes, of 12 answers of five megabytes";
+        EXPECT_LT(residentKilobytesOf(daemon.frontPid()), before + 110'000)
+            << "kilobytes, of 12 answers of five megabytes";
     }
     EXPECT_TRUE(eventually([&] {
         EXPECT_EQ(daemon.connect().get("/v1/").status, 200);
-        return residentKilobytesOf(daemon.pid()) < before + 30'000;
+        return residentKilobytesOf(daemon.frontPid()) < before + 30'000;
     })) << "kilobytes before: "
-        << before << ", after: " << residentKilobytesOf(daemon.pid());
+        << before << ", after: " << residentKilobytesOf(daemon.frontPid());
 }
 
 TEST(Connections, AnswersThatNobodyReadsAreBoundedInTotalAndTheOldestIsDropped) {

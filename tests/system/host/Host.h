@@ -56,6 +56,18 @@ inline bool eventually(const std::function<bool()>& condition) {
     return false;
 }
 
+/// A client whose write has begun. It ends when the file "go" exists in the directory, and writes the text to "data".
+inline UnixHttp startHeldWrite(const DaemonProcess& daemon, const std::filesystem::path& directory,
+                               const std::string& text) {
+    const auto place = [&](const char* name) { return (directory / name).string(); };
+    UnixHttp client = daemon.connect();
+    client.begin("POST", "/v1/fixture/runWrite",
+                 R"({"script": "touch )" + place("begun") + "; until [ -e " + place("go") +
+                     " ]; do sleep 0.01; done; echo " + text + " > " + place("data") + "\"}");
+    EXPECT_TRUE(eventually([&] { return std::filesystem::exists(place("begun")); }));
+    return client;
+}
+
 /// A client whose operation is running when this returns.
 inline UnixHttp startSleeping(const DaemonProcess& daemon, int milliseconds) {
     const std::string mark = (daemon.directory() / "running").string();

@@ -58,10 +58,11 @@ class MemoryAfterAnAnswer : public ::testing::Test {
   protected:
     void expectNothingLeft() {
         client.close();
-        for (const pid_t pid : {daemon.pid(), daemon.workerPid()}) {
+        for (const pid_t pid : {daemon.frontPid(), daemon.workerPid()}) {
             // The answer arrives before the worker has freed it, and the end of the connection is noticed later.
             EXPECT_TRUE(eventually([&] { return placesOf(secret, pid).empty(); }))
-                << (pid == daemon.pid() ? "the front" : "the worker") << testing::PrintToString(placesOf(secret, pid));
+                << (pid == daemon.frontPid() ? "the front" : "the worker")
+                << testing::PrintToString(placesOf(secret, pid));
         }
     }
     [[nodiscard]] std::string request() const {

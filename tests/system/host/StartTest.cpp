@@ -448,7 +448,7 @@ TEST_F(Start, WhatTheParentLeftOpenReachesNoTool) {
     ::close(ends[0]);
 }
 
-TEST_F(Start, SignalsThatTheParentIgnoredOrBlockedAreAtTheirDefaultInBothProcesses) {
+TEST_F(Start, SignalsThatTheParentIgnoredOrBlockedAreAtTheirDefaultInAllProcesses) {
     sigset_t blocked{};
     sigset_t unblocked{};
     ::sigemptyset(&blocked);
@@ -458,7 +458,7 @@ TEST_F(Start, SignalsThatTheParentIgnoredOrBlockedAreAtTheirDefaultInBothProcess
     DaemonProcess daemon(withFixture());
     static_cast<void>(std::signal(SIGCHLD, before));
     ::pthread_sigmask(SIG_SETMASK, &unblocked, nullptr);
-    for (const pid_t pid : {daemon.pid(), daemon.workerPid()}) {
+    for (const pid_t pid : {daemon.pid(), daemon.frontPid(), daemon.workerPid()}) {
         EXPECT_EQ(signalsOf(pid, "SigIgn") & bitOf(SIGCHLD), 0U);
         EXPECT_EQ(signalsOf(pid, "SigBlk") & bitOf(SIGUSR2), 0U);
     }
@@ -506,7 +506,7 @@ TEST_F(Start, OtherProcessesOfTheAccountCannotInspectFrontAndWorkerOnlyTheirTool
                                  "; read line < /dev/zero\"}");
                 pid_t tool = 0;
                 status = eventually([&] { return fs::exists(mark); }) && std::ifstream(mark) >> tool ? 0 : 2;
-                status += inspects(daemon.pid()) == expected ? 0 : 10;
+                status += inspects(daemon.pid()) == expected && inspects(daemon.frontPid()) == expected ? 0 : 10;
                 status += inspects(worker) == expected ? 0 : 20;
                 status += inspects(tool) ? 0 : 40;
                 ::kill(tool, SIGKILL);

@@ -111,13 +111,13 @@ TEST(WorkerTrouble, WorkerThatNeverStopsTalkingFillsNoMemoryAndKeepsNobodyWaitin
     auto options = withFixture();
     options.environment = {"ASAN_OPTIONS=quarantine_size_mb=1"};  // else a sanitizer keeps what was given back
     DaemonProcess daemon(options);
-    const std::size_t before = residentKilobytesOf(daemon.pid());
+    const std::size_t before = residentKilobytesOf(daemon.frontPid());
     UnixHttp talker = daemon.connect();
     talker.begin("POST", "/v1/fixture/flood", R"({"lines": 60, "bytes": 1000000})");
     std::size_t most = 0;
     ASSERT_TRUE(eventually([&] {
         EXPECT_EQ(daemon.connect().get("/v1/").status, 200);
-        most = std::max(most, residentKilobytesOf(daemon.pid()));
+        most = std::max(most, residentKilobytesOf(daemon.frontPid()));
         return std::filesystem::file_size(daemon.directory() / "log") >= 60'000'000;
     }));
     EXPECT_EQ(talker.reply().status, 204);
@@ -152,7 +152,7 @@ TEST(WorkerTrouble, WorkerThatCannotStartIsAClearAnswerAndTriedAgain) {
 TEST(Clients, ParallelOnesAreAllAnsweredEachInOrderAndNoDescriptorLeaks) {
     DaemonProcess daemon(withFixture());
     const pid_t worker = daemon.workerPid();
-    const std::size_t front = descriptorsOf(daemon.pid());  // perhaps with the connection just closed
+    const std::size_t front = descriptorsOf(daemon.frontPid());  // perhaps with the connection just closed
     const std::size_t back = descriptorsOf(worker);
     std::atomic<int> answered = 0;
     std::vector<std::thread> clients;
@@ -174,7 +174,7 @@ TEST(Clients, ParallelOnesAreAllAnsweredEachInOrderAndNoDescriptorLeaks) {
         client.join();
     }
     EXPECT_EQ(answered, 8 * 5 * 40);
-    EXPECT_TRUE(eventually([&] { return descriptorsOf(daemon.pid()) <= front; }));
+    EXPECT_TRUE(eventually([&] { return descriptorsOf(daemon.frontPid()) <= front; }));
     EXPECT_EQ(descriptorsOf(worker), back);
     EXPECT_EQ(daemon.workerPid(), worker);
 }

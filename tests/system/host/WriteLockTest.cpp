@@ -39,14 +39,8 @@ class TwoDaemons : public ::testing::Test {
         std::ifstream file(place(name));
         return {std::istreambuf_iterator<char>(file), {}};
     }
-    /// A client whose write has begun and ends when the file "go" exists; it then writes the text to the file "data".
-    UnixHttp startWrite(const DaemonProcess& daemon, const std::string& text) const {
-        UnixHttp client = daemon.connect();
-        client.begin("POST", "/v1/fixture/runWrite",
-                     body("touch " + place("begun") + "; until [ -e " + place("go") + " ]; do sleep 0.01; done; echo " +
-                          text + " > " + place("data")));
-        EXPECT_TRUE(eventually([&] { return fs::exists(place("begun")); }));
-        return client;
+    [[nodiscard]] UnixHttp startWrite(const DaemonProcess& daemon, const std::string& text) const {
+        return startHeldWrite(daemon, _directory, text);
     }
     [[nodiscard]] static std::string body(const std::string& script) { return "{\"script\": \"" + script + "\"}"; }
     void go() const { std::ofstream(place("go")).put('\n'); }
@@ -136,8 +130,11 @@ TEST_F(TwoDaemons, AWorkerThatSleptThroughTheEndOfItsFrontDoesNotWriteAnyMore) {
     UnixHttp lost = old.connect();
     lost.begin("POST", "/v1/fixture/runWrite", body("echo old > " + place("data")));
     ASSERT_TRUE(eventually([&] { return !dictionaryOf(old.connect().get("/v1/")).get("running").isNull(); }));
+    const pid_t oldFront = old.frontPid();
     old.signal(SIGKILL);
+    ::kill(oldFront, SIGKILL);
     EXPECT_EQ(old.wait(), 128 + SIGKILL);
+    EXPECT_EQ(::waitpid(oldFront, nullptr, 0), oldFront);
     DaemonProcess daemon(options());
     EXPECT_EQ(daemon.connect().post("/v1/fixture/runWrite", body("echo new > " + place("data"))).status, 200);
     ::kill(oldWorker, SIGCONT);

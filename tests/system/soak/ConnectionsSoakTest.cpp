@@ -10,13 +10,13 @@ TEST(ConnectionsSoak, AfterEachOfTwoHundredBurstsAtSixtyFourDescriptorsTheNextRe
     options.descriptors = 64;
     const DaemonProcess daemon(options);
     ASSERT_NO_FATAL_FAILURE(burst(daemon, 200, 400));
-    EXPECT_TRUE(eventually([&] { return descriptorsOf(daemon.pid()) < 16; })) << "no descriptor is left behind";
+    EXPECT_TRUE(eventually([&] { return descriptorsOf(daemon.frontPid()) < 16; })) << "no descriptor is left behind";
 }
 
 TEST(ConnectionsSoak, AfterEachOfAHundredBurstsBeyondTheMaximumTheNextRequestIsAnsweredWithinASecond) {
     const DaemonProcess daemon(withFixture());
     ASSERT_NO_FATAL_FAILURE(burst(daemon, 100, 400));
-    EXPECT_TRUE(eventually([&] { return descriptorsOf(daemon.pid()) < 16; })) << "no descriptor is left behind";
+    EXPECT_TRUE(eventually([&] { return descriptorsOf(daemon.frontPid()) < 16; })) << "no descriptor is left behind";
 }
 
 }  // namespace

@@ -48,7 +48,7 @@ TEST(Soak, EightClientsForAMinuteAreAllAnsweredInOrderAndNothingLeaks) {
     test::DaemonProcess daemon(options);
     ASSERT_EQ(daemon.connect().post("/v1/lumio/getCameras", "{}").status, 200);
     const pid_t worker = daemon.workerPid();
-    const std::size_t frontBefore = test::descriptorsOf(daemon.pid());
+    const std::size_t frontBefore = test::descriptorsOf(daemon.frontPid());
     const std::size_t workerBefore = test::descriptorsOf(worker);
 
     std::array<Tally, clientCount> tallies;
@@ -71,7 +71,7 @@ TEST(Soak, EightClientsForAMinuteAreAllAnsweredInOrderAndNothingLeaks) {
     std::size_t frontAfter = 0;
     for (int i = 0; i < 50; ++i) {
         (void)daemon.connect().get("/v1/");
-        frontAfter = test::descriptorsOf(daemon.pid());
+        frontAfter = test::descriptorsOf(daemon.frontPid());
         if (frontAfter <= frontBefore + 1) {
             break;
         }

@@ -1,0 +1,341 @@
+#include "adminhostd/Monitor.h"
+
+#include "adminhostd/FrontStart.h"
+#include "adminhostd/ListeningSocket.h"
+#include "adminhostd/MonitorMessage.h"
+#include "adminhostd/PrivateDirectory.h"
+#include "adminhostd/RunDirectory.h"
+#include "adminhostd/ToolConfiguration.h"
+#include "adminhostd/WorkerStart.h"
+#include "platform/log/Log.h"
+#include "platform/task/StartChild.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <csignal>
+#include <cstdint>
+#include <list>
+#include <optional>
+#include <stdexcept>
+#include <thread>
+#include <utility>
+
+#include <fmt/format.h>
+#include <poll.h>
+#include <sys/signalfd.h>
+#include <sys/wait.h>
+
+namespace adminhost {
+namespace {
+
+using namespace std::chrono_literals;
+using Clock = std::chrono::steady_clock;
+
+constexpr std::size_t workerMaximum = 16;  ///< at the same time; a front in order has two
+constexpr auto firstPause = 100ms;         ///< until a front that has died is started again
+constexpr auto longestPause = 30s;
+constexpr auto stableTime = 10s;      ///< a front that has run for so long has not died at its start
+constexpr auto overrunGrace = 5s;     ///< in which worker or front end an operation that overruns its deadline
+constexpr auto overrunInterval = 5s;  ///< at which the monitor looks for such an operation
+constexpr int endingWait = 20;        ///< milliseconds for a killed worker
+constexpr auto logPause = 100ms;      ///< until the next try while the log cannot be written
+constexpr auto logBound = 200ms;      ///< for the log's last events at the end
+
+FileDescriptor monitorSignals() {
+    sigset_t signals;
+    ::sigemptyset(&signals);
+    for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGCHLD}) {
+        ::sigaddset(&signals, signal);
+    }
+    ::sigprocmask(SIG_BLOCK, &signals, nullptr);
+    static_cast<void>(std::signal(SIGPIPE, SIG_IGN));
+    return FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
+}
+
+class Monitor {
+  public:
+    Monitor(const Options& options, std::vector<std::string> arguments, ListeningSocket& socket,
+            const std::string& toolDirectory)
+        : _options(options), _arguments(std::move(arguments)), _socket(socket), _toolDirectory(toolDirectory) {}
+
+    int run();
+
+  private:
+    struct Worker {
+        std::uint32_t number;
+        StartedWorker process;
+        bool left;  ///< by a front that has died
+    };
+
+    void startFront();
+    void frontEnded(int status);
+    void signalled();
+    void stop();
+    void reap();
+    void receive();
+    void start(std::uint32_t number);
+    void startNow(std::uint32_t number);
+    void startWaiting();
+    void kill(Worker& worker);
+    bool collect(Worker& worker);
+    void endOverruns();
+    void sendToFront(const MonitorMessage& message, std::span<const int> descriptors = {});
+    [[nodiscard]] int timeout() const;
+
+    const Options& _options;
+    std::vector<std::string> _arguments;
+    ListeningSocket& _socket;
+    const std::string& _toolDirectory;
+    FileDescriptor _signals = monitorSignals();
+    pid_t _front = 0;  ///< 0 while none is running
+    FileDescriptor _link;
+    Clock::time_point _frontSince;
+    bool _served = false;  ///< a front has come so far as to ask for a worker
+    std::optional<Clock::time_point> _frontDue;
+    std::chrono::milliseconds _pause{0};
+    std::list<Worker> _workers;
+    std::vector<std::uint32_t> _waiting;  ///< that the front has asked for, while the last front's worker is running
+    bool _stopping = false;
+    int _status = 0;
+};
+
+int Monitor::run() {
+    startFront();
+    while (!_stopping || _front != 0 || !_workers.empty()) {
+        pollfd entries[] = {{_signals.get(), POLLIN, 0}, {_link.get(), POLLIN, 0}};
+        ::poll(entries, std::size(entries), timeout());
+        if (entries[1].revents != 0) {
+            receive();
+        }
+        if (entries[0].revents != 0) {
+            signalled();
+        }
+        endOverruns();
+        if (_frontDue && Clock::now() >= *_frontDue) {
+            startFront();
+        }
+    }
+    return _status;
+}
+
+int Monitor::timeout() const {
+    std::optional<Clock::time_point> due = _frontDue;
+    const auto consider = [&](Clock::time_point time) { due = due ? std::min(*due, time) : time; };
+    for (const Worker& worker : _workers) {
+        // A worker does not announce its operations here: those that begin later are found at the next interval.
+        const auto deadline = worker.process.tools.deadline();
+        consider(deadline ? std::min(*deadline + overrunGrace, Clock::now() + overrunInterval)
+                          : Clock::now() + overrunInterval);
+    }
+    if (!flushLog()) {
+        consider(Clock::now() + logPause);
+    }
+    if (!due) {
+        return -1;
+    }
+    return static_cast<int>(
+        std::max<std::int64_t>(std::chrono::ceil<std::chrono::milliseconds>(*due - Clock::now()).count(), 0));
+}
+
+void Monitor::startFront() {
+    _frontDue.reset();
+    auto [ours, fronts] = monitorSocketPair();
+    ChildPlan plan;
+    plan.program = programOfDaemon("adminhostd-front");
+    plan.arguments = _arguments;
+    plan.arguments.front() = "adminhostd-front";
+    plan.environment = processEnvironment();
+    plan.environment.push_back(std::string(toolDirectoryVariable) + "=" + _toolDirectory);
+    plan.descriptors = {-1, STDOUT_FILENO, STDERR_FILENO, fronts.get(), _socket.descriptor()};
+    auto started = startChild(plan);
+    if (!started) {
+        throw std::runtime_error(fmt::format("{} cannot be started: {}; install the daemon again", plan.program,
+                                             started.error().description.value_or("")));
+    }
+    _front = started->pid;
+    _link = std::move(ours);
+    _frontSince = Clock::now();
+}
+
+void Monitor::frontEnded(int status) {
+    _front = 0;
+    _link.close();
+    _waiting.clear();
+    for (Worker& worker : _workers) {
+        worker.left = true;
+        // One that runs an operation finishes it; another one, such as a probe of the directory, has nothing to finish.
+        if (!worker.process.tools.deadline()) {
+            kill(worker);
+        }
+    }
+    if (_stopping) {
+        return;
+    }
+    if (!_served && WIFEXITED(status)) {
+        // It has printed why it cannot start, and another one could not start either.
+        _status = WEXITSTATUS(status);
+        stop();
+        return;
+    }
+    if (Clock::now() - _frontSince >= stableTime) {
+        _pause = 0ms;
+    }
+    _pause = std::clamp<std::chrono::milliseconds>(_pause * 2, firstPause, longestPause);
+    _frontDue = Clock::now() + _pause;
+    logEvent(
+        fmt::format("adminhostd: the front {}; the next one is started in {} ms", endingText(status), _pause.count()));
+}
+
+void Monitor::stop() {
+    _stopping = true;
+    _frontDue.reset();
+    _socket.remove();
+    _socket.close();
+    if (_front != 0) {
+        ::kill(_front, SIGTERM);
+    }
+}
+
+void Monitor::signalled() {
+    signalfd_siginfo signal{};
+    while (::read(_signals.get(), &signal, sizeof signal) > 0) {
+        if (signal.ssi_signo != SIGCHLD && !_stopping) {
+            stop();
+        }
+    }
+    reap();
+}
+
+void Monitor::reap() {
+    int status = 0;
+    if (_front != 0 && ::waitpid(_front, &status, WNOHANG) == _front) {
+        receive();  // what it asked for before its end does not matter any more, but a worker must be known
+        frontEnded(status);
+    }
+    std::erase_if(_workers, [&](Worker& worker) { return collect(worker); });
+    startWaiting();
+}
+
+bool Monitor::collect(Worker& worker) {
+    int status = 0;
+    if (::waitpid(worker.process.pid, &status, WNOHANG) != worker.process.pid) {
+        return false;
+    }
+    worker.process.tools.killRemaining();
+    if (worker.left) {
+        logEvent(fmt::format("adminhostd: the worker of the last front {}", endingText(status)));
+    } else {
+        sendToFront({MonitorMessage::Kind::ended, worker.number, worker.process.pid, status});
+    }
+    return true;
+}
+
+void Monitor::receive() {
+    using Kind = ReceivedMessage::Kind;
+    while (_link.isOpen()) {
+        const ReceivedMessage received = receiveMonitorMessage(_link.get());
+        if (received.kind == Kind::none) {
+            return;
+        }
+        if (received.kind == Kind::closed) {
+            _link.close();
+            return;
+        }
+        const std::uint32_t number = received.message.worker;
+        const auto found = std::find_if(_workers.begin(), _workers.end(),
+                                        [&](const Worker& worker) { return worker.number == number && !worker.left; });
+        if (received.kind == Kind::message && received.message.kind == MonitorMessage::Kind::start && _front != 0 &&
+            found == _workers.end()) {
+            start(number);
+        } else if (received.kind == Kind::message && received.message.kind == MonitorMessage::Kind::kill) {
+            std::erase(_waiting, number);
+            if (found != _workers.end()) {
+                kill(*found);
+                if (collect(*found)) {
+                    _workers.erase(found);
+                }
+            }
+        } else {
+            logEvent("adminhostd: the front sent what it may not send, and is ended");
+            ::kill(_front, SIGKILL);
+            return;
+        }
+    }
+}
+
+void Monitor::start(std::uint32_t number) {
+    _served = true;
+    const auto left = std::find_if(_workers.begin(), _workers.end(), [](const Worker& worker) { return worker.left; });
+    if (_workers.size() + _waiting.size() >= workerMaximum) {
+        sendToFront({MonitorMessage::Kind::start, number, 0, EAGAIN});
+    } else if (left != _workers.end()) {
+        _waiting.push_back(number);
+        sendToFront({MonitorMessage::Kind::start, number, left->process.pid, EBUSY});
+    } else {
+        startNow(number);
+    }
+}
+
+void Monitor::startWaiting() {
+    if (std::none_of(_workers.begin(), _workers.end(), [](const Worker& worker) { return worker.left; })) {
+        for (const std::uint32_t number : std::exchange(_waiting, {})) {
+            startNow(number);
+        }
+    }
+}
+
+void Monitor::startNow(std::uint32_t number) {
+    auto started = startWorker(_options.logToStandardError);
+    if (!started) {
+        sendToFront({MonitorMessage::Kind::start, number, 0, static_cast<std::int32_t>(started.error().code)});
+        return;
+    }
+    const int descriptors[] = {started->conversation.get(), started->process.get()};
+    sendToFront({MonitorMessage::Kind::start, number, started->pid, 0}, descriptors);
+    started->conversation.close();  // the worker must see the front's end
+    _workers.push_back({number, *std::move(started), false});
+}
+
+void Monitor::kill(Worker& worker) {
+    ::kill(worker.process.pid, SIGKILL);
+    // Its tools must have ended before the next operation. A worker that the kernel cannot end yet, because it waits
+    // for a dead mount, is reaped later.
+    pollfd entry{worker.process.process.get(), POLLIN, 0};
+    ::poll(&entry, 1, endingWait);
+}
+
+void Monitor::endOverruns() {
+    for (Worker& worker : _workers) {
+        const auto deadline = worker.process.tools.deadline();
+        if (deadline && Clock::now() >= *deadline + overrunGrace) {
+            worker.process.tools.setDeadline(std::nullopt);
+            logEvent(
+                fmt::format("adminhostd: the worker {} has overrun its deadline, and is killed", worker.process.pid));
+            kill(worker);
+        }
+    }
+}
+
+void Monitor::sendToFront(const MonitorMessage& message, std::span<const int> descriptors) {
+    if (_link.isOpen() && !sendMonitorMessage(_link.get(), message, descriptors)) {
+        // It does not read: without this message it would wait for ever.
+        ::kill(_front, SIGKILL);
+    }
+}
+
+}  // namespace
+
+int runMonitor(const Options& options, std::vector<std::string> arguments) {
+    setLogSink(options.logToStandardError ? standardErrorSink() : syslogSink());
+    ListeningSocket socket(socketPath(options), groupOf(options.socketGroup));
+    removeAbandonedDirectories(privateParent(options));
+    const ToolConfiguration tools(privateParent(options));
+    const int status = Monitor(options, std::move(arguments), socket, tools.directory()).run();
+    for (const auto end = Clock::now() + logBound; !flushLog() && Clock::now() < end;) {
+        std::this_thread::sleep_for(10ms);
+    }
+    return status;
+}
+
+}  // namespace adminhost

@@ -1,0 +1,43 @@
+#include "adminhostd/MonitorLink.h"
+
+#include <cerrno>
+#include <utility>
+
+namespace adminhost {
+
+std::uint32_t MonitorLink::start(Receiver receiver) {
+    if (closed()) {
+        errno = EPIPE;
+        return 0;
+    }
+    const std::uint32_t number = ++_last;
+    if (!sendMonitorMessage(_socket.get(), {MonitorMessage::Kind::start, number, 0, 0})) {
+        return 0;
+    }
+    _receivers.emplace(number, std::move(receiver));
+    return number;
+}
+
+void MonitorLink::kill(std::uint32_t worker) noexcept {
+    // One that cannot be sent is not lost: the monitor also kills a worker that overruns its deadline.
+    static_cast<void>(sendMonitorMessage(_socket.get(), {MonitorMessage::Kind::kill, worker, 0, 0}));
+}
+
+void MonitorLink::run() {
+    while (!closed()) {
+        ReceivedMessage received = receiveMonitorMessage(_socket.get());
+        if (received.kind == ReceivedMessage::Kind::none) {
+            return;
+        }
+        if (received.kind != ReceivedMessage::Kind::message) {
+            _socket.close();
+            return;
+        }
+        const auto found = _receivers.find(received.message.worker);
+        if (found != _receivers.end()) {
+            found->second(received);
+        }
+    }
+}
+
+}  // namespace adminhost
