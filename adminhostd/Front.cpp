@@ -38,6 +38,18 @@ std::optional<Right> neededFor(const Target& target, const Command* command) {
     return std::nullopt;
 }
 
+/// Returns true if the method is in the value of an Allow header.
+bool lists(std::string_view allowed, std::string_view method) {
+    while (!allowed.empty()) {
+        const std::size_t end = std::min(allowed.find(", "), allowed.size());
+        if (allowed.substr(0, end) == method) {
+            return true;
+        }
+        allowed.remove_prefix(std::min(end + 2, allowed.size()));
+    }
+    return false;
+}
+
 /// The names of plug-ins or commands, for a message.
 std::string namesIn(const auto& named) {
     std::vector<std::string_view> names;
@@ -173,11 +185,11 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target&
         return unknownRequest(target.command);
     }
     const bool post = target.kind == Kind::command;
-    const bool allowed = post ? exchange.method() == "POST" : exchange.method() == "GET" || exchange.method() == "HEAD";
-    if (!allowed) {
-        HttpAnswer answer = errorAnswer(405, "METHOD_NOT_ALLOWED",
-                                        fmt::format("This address is for {} only.", post ? "POST" : "GET and HEAD"));
-        answer.headers.emplace_back("Allow", post ? "POST" : "GET, HEAD");
+    const char* const allowed = post ? "POST" : target.kind == Kind::request ? "GET, HEAD, DELETE" : "GET, HEAD";
+    if (!lists(allowed, exchange.method())) {
+        HttpAnswer answer =
+            errorAnswer(405, "METHOD_NOT_ALLOWED", fmt::format("The methods of this address: {}.", allowed));
+        answer.headers.emplace_back("Allow", allowed);
         return answer;
     }
     if (const auto deadline = exchange.header("Request-Deadline"); deadline && !deadlineOf(*deadline)) {
@@ -240,6 +252,10 @@ void Front::serve(Exchange& exchange, const Target& target) {
             const RequestRecord* record = requestFor(exchange.peer(), target.command);
             if (record == nullptr) {  // forgotten while the body was being received
                 exchange.answer(unknownRequest(target.command));
+                return;
+            }
+            if (exchange.method() == "DELETE") {
+                exchange.answer(cancel(exchange.peer(), *record));
                 return;
             }
             const bool withReports = exchange.peer().uid == record->peer.uid || _permissions.isOwn(exchange.peer());

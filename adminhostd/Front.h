@@ -55,6 +55,7 @@ class Front {
     [[nodiscard]] const RequestRecord* requestFor(const Peer& peer, std::string_view id) const;
     [[nodiscard]] std::optional<HttpAnswer> refusal(const Exchange& exchange, const Target& target) const;
     void serve(Exchange& exchange, const Target& target);
+    HttpAnswer cancel(const Peer& peer, const RequestRecord& record);
     [[nodiscard]] HttpAnswer overview() const;
     void operation(Exchange& exchange, const Target& target);
     /// Passes on a request that the worker serves without an operation of a plug-in.

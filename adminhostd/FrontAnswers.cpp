@@ -26,8 +26,9 @@ HttpAnswer findingsAnswer(const std::vector<Finding>& findings) {
 
 HttpAnswer textAnswer(unsigned status, protocol::Answer& answer) {
     HttpAnswer http{status, std::nullopt, {}};
-    http.text = AnswerText{std::move(answer.bytes), answer.form == BodyForm::json ? "application/json"  //
-                                                                                  : "application/x-plist"};
+    http.text = AnswerText{std::make_shared<const std::string>(std::move(answer.bytes)), answer.form == BodyForm::json
+                                                                                             ? "application/json"  //
+                                                                                             : "application/x-plist"};
     return http;
 }
 
@@ -88,6 +89,8 @@ HttpAnswer answerFor(const Unserved& unserved) {
             return retryLater("WORKER_UNAVAILABLE", unserved.message);
         case Reason::stopping:
             return retryLater("STOPPING", unserved.message);
+        case Reason::cancelled:
+            return errorAnswer(503, "CANCELLED", "The request was cancelled before it ended (DELETE /v1/requests/ID).");
         case Reason::abandoned:
             return retryLater("CLIENT_GONE", unserved.message);
         case Reason::notBegun:

@@ -81,6 +81,7 @@ void Front::operation(Exchange& exchange, const Target& target) {
     operation.endBy = endByOf(exchange, record);
     const bool checkOnly = exchange.argument("check") == "1";
     operation.changes = command.access != Access::read && !checkOnly;
+    operation.urgent = command.access == Access::control && !checkOnly;
     operation.order = protocol::Perform{
         .request = record.id,
         .plugin = record.plugin,
@@ -161,6 +162,9 @@ void Front::query(Exchange& exchange, const Target& target) {
 
 void Front::enqueue(Operation operation) {
     if (_queue.full()) {
+        _queue.dropAbandoned();
+    }
+    if (_queue.full()) {
         if (isDoctor(*operation.record)) {
             finished(operation, Unserved{Unserved::Reason::notBegun, "Too many requests are waiting already."});
             return;
@@ -173,21 +177,49 @@ void Front::enqueue(Operation operation) {
 }
 
 void Front::finished(const Operation& operation, OperationQueue::Ending ending) {
-    if (isDoctor(*operation.record)) {
+    const auto* unserved = std::get_if<Unserved>(&ending);
+    const bool cancelled = unserved != nullptr && unserved->reason == Unserved::Reason::cancelled;
+    if (isDoctor(*operation.record) && !cancelled) {
         return end(operation, doctorAnswer(ending), {});
     }
-    if (const auto* unserved = std::get_if<Unserved>(&ending)) {
-        HttpAnswer http = answerFor(*unserved);
-        const std::string code(codeOf(http));
-        return end(operation, std::move(http), code);
+    HttpAnswer http;
+    std::string code;
+    if (unserved != nullptr) {
+        http = answerFor(*unserved);
+        code = codeOf(http);
+    } else {
+        auto& answer = std::get<protocol::Answer>(ending);
+        http = answerFor(answer);
+        if (http.status < 300 && !answer.revision.empty()) {
+            http.headers.emplace_back("ETag", fmt::format("\"{}\"", answer.revision));
+        }
+        code = http.text ? answer.error : codeOf(http);
     }
-    auto& answer = std::get<protocol::Answer>(ending);
-    HttpAnswer http = answerFor(answer);
-    if (http.status < 300 && !answer.revision.empty()) {
-        http.headers.emplace_back("ETag", fmt::format("\"{}\"", answer.revision));
+    if (http.text) {
+        http.text->clients = 1 + operation.sharers.size();
     }
-    const std::string code(http.text ? answer.error : codeOf(http));
+    for (const Operation& sharer : operation.sharers) {
+        end(sharer, http, code);
+    }
     end(operation, std::move(http), code);
+}
+
+HttpAnswer Front::cancel(const Peer& peer, const RequestRecord& record) {
+    const std::string id = record.id;  // the record may be dropped when its request ends
+    if (peer.uid != record.peer.uid && !_permissions.isOwn(peer)) {
+        return errorAnswer(403, "NOT_PERMITTED", "Only the account that sent the request, and root, may cancel it.");
+    }
+    if (record.state == RequestRecord::State::done) {
+        return errorAnswer(409, "REQUEST_ENDED", fmt::format("The request {} has ended already.", id));
+    }
+    const bool running = record.state == RequestRecord::State::running;
+    if (!_queue.cancel(record)) {
+        return errorAnswer(409, "CHANGE_RUNNING",
+                           fmt::format("The request {} is changing something. It is not interrupted, because half of a "
+                                       "change is worse than none; it ends by itself, at its deadline at the latest.",
+                                       id));
+    }
+    return {200, Dictionary{{"request", id}, {"state", running ? "running" : "waiting"}, {"cancelled", true}}, {}};
 }
 
 void Front::end(const Operation& operation, HttpAnswer answer, std::string_view code) {

@@ -121,7 +121,8 @@ struct HttpServer::Callbacks {
     static void completed(void* context, MHD_Connection* connection, void** place, MHD_RequestTerminationCode) {
         auto& server = *static_cast<HttpServer*>(context);
         if (auto* const exchange = static_cast<Exchange*>(*place)) {
-            server._returnMemory |= exchange->_bytes.size() >= largeBuffer || exchange->_received >= largeBuffer;
+            server._returnMemory |=
+                (exchange->_bytes && exchange->_bytes->size() >= largeBuffer) || exchange->_received >= largeBuffer;
             server.forgetAnswer(*exchange);
             delete exchange;
             *place = nullptr;
@@ -397,7 +398,9 @@ void HttpServer::dropOldAnswers(const Exchange& newest) {
 int HttpServer::send(Exchange& exchange) {
     HttpAnswer& answer = *exchange._answer;
     const char* type = nullptr;
+    std::size_t clients = 1;
     if (answer.text) {
+        clients = answer.text->clients;
         exchange._bytes = std::move(answer.text->bytes);
         type = answer.text->type;
         answer.text.reset();
@@ -416,18 +419,20 @@ int HttpServer::send(Exchange& exchange) {
             type = "application/json";
         }
         answer.body.reset();  // one form in memory is enough, for as long as the client takes to read it
-        exchange._bytes = std::move(*text);
-        exchange._bytes.shrink_to_fit();
+        text->shrink_to_fit();
+        exchange._bytes = std::make_shared<const std::string>(*std::move(text));
     }
-    if (!exchange._bytes.empty()) {
+    const std::string_view bytes = exchange._bytes ? std::string_view(*exchange._bytes) : std::string_view();
+    if (!bytes.empty()) {
         _sending.push_back(&exchange);
-        exchange._unread = exchange._bytes.size();
+        exchange._unread = std::max<std::size_t>(bytes.size() / clients, 1);
         _unread += exchange._unread;
         _returnMemory |= exchange._unread >= largeBuffer;
         dropOldAnswers(exchange);
     }
+    // The library does not write to a persistent buffer.
     MHD_Response* response =
-        ::MHD_create_response_from_buffer(exchange._bytes.size(), exchange._bytes.data(), MHD_RESPMEM_PERSISTENT);
+        ::MHD_create_response_from_buffer(bytes.size(), const_cast<char*>(bytes.data()), MHD_RESPMEM_PERSISTENT);
     if (response == nullptr) {
         return MHD_NO;
     }

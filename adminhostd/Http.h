@@ -35,8 +35,9 @@ constexpr std::size_t unreadMaximum = std::size_t{64} << 20U;
 
 /// The text of an answer, in the form that its client prefers (Exchange::wantsPropertyList()).
 struct AnswerText {
-    std::string bytes;
+    std::shared_ptr<const std::string> bytes;  ///< identical requests have one text
     const char* type = "application/json";
+    std::size_t clients = 1;  ///< to which this text is sent; each counts as a holder of its part
 };
 
 struct HttpAnswer {
@@ -93,8 +94,8 @@ class Exchange {
     std::optional<HttpAnswer> _headProblem;
     std::optional<HttpAnswer> _refusal;  ///< decided from the head, sent once the body has been read and dropped
     std::optional<HttpAnswer> _answer;
-    std::string _bytes;       ///< of the answer, while it is sent
-    std::size_t _unread = 0;  ///< bytes of it that count as unread; 0 when it has been dropped
+    std::shared_ptr<const std::string> _bytes;  ///< of the answer, while it is sent
+    std::size_t _unread = 0;                    ///< bytes of it that count as unread; 0 when it has been dropped
     bool _suspended = false;
 };
 

@@ -27,6 +27,11 @@ void removeLeftover(const HostPath& file) {
     }
 }
 
+void logNamingFailure(const LoadedPlugin& loaded, const Error& error) {
+    logEvent(fmt::format("adminhostd: the plug-in {} failed to name what interrupted operations left: {}", loaded.name,
+                         textOf(error.description)));
+}
+
 }  // namespace
 
 Result<LoadedPlugin> LoadedPlugins::load(const DiskPath& file, const std::vector<std::string>& languages) {
@@ -120,22 +125,26 @@ std::vector<std::string> LoadedPlugins::needsThatAreNotUsable() const {
 
 void LoadedPlugins::removeLeftovers() const {
     for (const LoadedPlugin& loaded : _plugins) {
-        const auto files = callPlugin([&] { return loaded.plugin->settingsFiles(); });
-        const auto others = callPlugin([&] { return loaded.plugin->leftovers(); });
-        if (!files || !others) {
-            logEvent(fmt::format("adminhostd: the plug-in {} failed to name what interrupted operations left: {}",
-                                 loaded.name, textOf((files ? others : files).error().description)));
-            continue;
-        }
-        // Settings files may be on a file system that hangs. What is left elsewhere, such as tickets, must not wait for
-        // it.
-        for (const HostPath& file : *others) {
-            removeLeftover(file);
-        }
-        for (const HostPath& file : *files) {
-            adminhost::removeLeftovers(file);
+        if (const auto files = callPlugin([&] { return loaded.plugin->leftovers(); })) {
+            for (const HostPath& file : *files) {
+                removeLeftover(file);
+            }
+        } else {
+            logNamingFailure(loaded, files.error());
         }
         SettingsHistory(loaded.name, {}).removeUnfinished();
+    }
+}
+
+void LoadedPlugins::removeSettingsLeftovers() const {
+    for (const LoadedPlugin& loaded : _plugins) {
+        if (const auto files = callPlugin([&] { return loaded.plugin->settingsFiles(); })) {
+            for (const HostPath& file : *files) {
+                adminhost::removeLeftovers(file);
+            }
+        } else {
+            logNamingFailure(loaded, files.error());
+        }
     }
 }
 

@@ -50,6 +50,8 @@ class LoadedPlugins {
     /// Removes files of workers that were killed in the middle of a write. Only for a worker that holds the lock for
     /// changes: another process may be writing a file that looks left over.
     void removeLeftovers() const;
+    /// Removes what interrupted writes left beside the settings files, which may be on a file system that hangs.
+    void removeSettingsLeftovers() const;
 
   private:
     [[nodiscard]] Probe ask(const LoadedPlugin& loaded, const std::string& need, std::chrono::milliseconds bound) const;

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <utility>
 
 #include <fmt/format.h>
 
@@ -14,7 +15,8 @@ using namespace std::chrono_literals;
 constexpr auto startBound = 30s;
 /// A worker kills its tools at the deadline and reports the overrun; one that does not is killed itself.
 constexpr auto overrunGrace = 2s;
-constexpr auto lockPause = 50ms;  ///< until the lock for changes is tried again
+constexpr auto lockPause = 50ms;     ///< until the lock for changes is tried again
+constexpr auto abandonedPause = 1s;  ///< between two looks for clients that have gone
 constexpr auto firstPause = 100ms;
 constexpr auto longestPause = 30s;
 
@@ -34,7 +36,10 @@ std::optional<std::string> OperationQueue::workerProblem() const {
 }
 
 void OperationQueue::add(Operation operation) {
-    _waiting.push_back(std::move(operation));
+    _waiting.add(std::move(operation));
+    if (!_abandonedFrom) {
+        _abandonedFrom = Clock::now() + abandonedPause;
+    }
     if (_stopping) {
         failWaiting(Unserved::Reason::stopping, "The daemon is being stopped.");
     } else if (_state == State::paused || _waitsForLeft) {
@@ -58,10 +63,8 @@ std::optional<OperationQueue::Clock::time_point> OperationQueue::due() const {
         first = first && other ? std::min(first, other) : first ? first : other;
     };
     consider(_directoryProbe.due());
-    for (const Operation& operation : _waiting) {
-        consider(operation.beginBy);
-        consider(operation.endBy);
-    }
+    consider(_waiting.due());
+    consider(_abandonedFrom);
     return first;
 }
 
@@ -106,9 +109,7 @@ void OperationQueue::startFailed(const std::string& reason) {
 }
 
 void OperationQueue::failWaiting(Unserved::Reason reason, const std::string& message) {
-    while (!_waiting.empty()) {
-        const Operation operation = std::move(_waiting.front());
-        _waiting.pop_front();
+    for (const Operation& operation : _waiting.takeAll()) {
         _events.finished(operation, Unserved{reason, message});
     }
 }
@@ -128,17 +129,11 @@ void OperationQueue::run(std::span<const pollfd> polled) {
 
 void OperationQueue::giveUpWaiting() {
     const auto now = Clock::now();
-    std::vector<Operation> late;
-    for (auto one = _waiting.begin(); one != _waiting.end();) {
-        // A change that did not get the lock says so itself (next()).
-        if ((one->beginBy && now >= *one->beginBy) || (one->endBy && !one->locked && now >= *one->endBy)) {
-            late.push_back(std::move(*one));
-            one = _waiting.erase(one);
-        } else {
-            ++one;
-        }
+    if (_abandonedFrom && now >= *_abandonedFrom) {
+        dropAbandoned();
+        _abandonedFrom = _waiting.empty() ? std::nullopt : std::optional(now + abandonedPause);
     }
-    for (const Operation& operation : late) {
+    for (const Operation& operation : _waiting.takeLate(now)) {
         if (operation.endBy && now >= *operation.endBy) {
             _events.finished(operation,
                              Unserved{Unserved::Reason::overrun,
@@ -183,25 +178,34 @@ void OperationQueue::receive(Frame frame) {
     }
 }
 
-bool OperationQueue::take(const protocol::Log& log) {
-    if (_running) {
-        _running->record->add(log.event);
+void OperationQueue::dropAbandoned() {
+    for (const Operation& operation : _waiting.takeAbandoned()) {
+        _events.finished(operation, Unserved{Unserved::Reason::abandoned, "The client went away before its turn."});
     }
+}
+
+void OperationQueue::forEachRecord(const std::function<void(RequestRecord&)>& function) {
+    if (_running) {
+        function(*_running->record);
+        for (const Operation& sharer : _running->sharers) {
+            function(*sharer.record);
+        }
+    }
+}
+
+bool OperationQueue::take(const protocol::Log& log) {
+    forEachRecord([&](RequestRecord& record) { record.add(log.event); });
     _events.log(log.event);
     return true;
 }
 
 bool OperationQueue::take(const Change& change) {
-    if (_running) {
-        _running->record->add(change);
-    }
+    forEachRecord([&](RequestRecord& record) { record.add(change); });
     return _running.has_value();
 }
 
 bool OperationQueue::take(const NotDone& part) {
-    if (_running) {
-        _running->record->add(part);
-    }
+    forEachRecord([&](RequestRecord& record) { record.add(part); });
     return _running.has_value();
 }
 
@@ -289,28 +293,22 @@ void OperationQueue::timeUp() {
     }
 }
 
-std::deque<Operation>::iterator OperationQueue::nextToRun() {
-    const bool locked = _changesFrom && Clock::now() < *_changesFrom;
-    return std::find_if(_waiting.begin(), _waiting.end(),
-                        [&](const Operation& operation) { return !locked || !operation.changes; });
-}
-
 void OperationQueue::next() {
     while (_state == State::idle && !_stopping && !_waiting.empty()) {
-        const auto found = nextToRun();
-        if (found == _waiting.end()) {
+        const bool locked = _changesFrom && Clock::now() < *_changesFrom;
+        auto operation = _waiting.takeNext(locked);
+        if (!operation) {
             _due = _changesFrom;
             return;
         }
-        Operation operation = std::move(*found);
-        _waiting.erase(found);
-        if (operation.exchange->clientGone()) {
-            _events.finished(operation, Unserved{Unserved::Reason::abandoned, "The client went away before its turn."});
-        } else if (operation.locked && Clock::now() >= *operation.until) {
-            auto answer = *std::move(operation.locked);
-            _events.finished(operation, std::move(answer));
+        if (operation->exchange->clientGone()) {
+            _events.finished(*operation,
+                             Unserved{Unserved::Reason::abandoned, "The client went away before its turn."});
+        } else if (operation->locked && Clock::now() >= *operation->until) {
+            auto answer = *std::move(operation->locked);
+            _events.finished(*operation, std::move(answer));
         } else {
-            begin(std::move(operation));
+            begin(*std::move(operation));
         }
     }
 }
@@ -318,12 +316,9 @@ void OperationQueue::next() {
 void OperationQueue::begin(Operation operation) {
     const auto now = Clock::now();
     if (!operation.until) {
-        operation.until =
-            now + (operation.deadline > 0ms ? std::min(operation.deadline, _settings.deadline) : _settings.deadline);
-        if (operation.endBy) {
-            operation.until = std::min(*operation.until, *operation.endBy);
-        }
+        operation.until = operation.endIfBegun(now, _settings.deadline);
     }
+    operation.sharers = _waiting.takeSharers(operation, now, _settings.deadline);
     const auto left = std::chrono::ceil<std::chrono::milliseconds>(*operation.until - now);
     std::visit(
         [&](auto& order) {
@@ -334,15 +329,19 @@ void OperationQueue::begin(Operation operation) {
         operation.order);
     // Kept for a change, which may have to be sent again.
     const auto frame = protocol::frameOf(operation.changes ? operation.order : std::exchange(operation.order, {}));
-    if (!_worker->send(frame)) {
-        _events.finished(operation, Unserved{Unserved::Reason::tooLarge, "The request is too large to be passed on."});
-        return;
-    }
-    operation.record->state = RequestRecord::State::running;
-    operation.record->since = std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now());
-    operation.record->start = now;
+    const bool sent = _worker->send(frame);
     _due = *operation.until + overrunGrace;
     _running = std::move(operation);
+    if (!sent) {
+        _due.reset();
+        finish(Unserved{Unserved::Reason::tooLarge, "The request is too large to be passed on."});
+        return;
+    }
+    forEachRecord([&](RequestRecord& record) {
+        record.state = RequestRecord::State::running;
+        record.since = std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now());
+        record.start = now;
+    });
     _state = State::busy;
 }
 
@@ -351,13 +350,49 @@ void OperationQueue::waitForLock(protocol::Answer answer) {
     operation.record->state = RequestRecord::State::waiting;
     operation.locked = std::move(answer);
     _changesFrom = std::min(Clock::now() + lockPause, *operation.until);
-    _waiting.push_front(std::move(operation));
+    _waiting.addAgain(std::move(operation));
 }
 
 void OperationQueue::finish(Ending ending) {
     const Operation operation = std::move(*_running);
     _running.reset();
     _events.finished(operation, std::move(ending));
+}
+
+bool OperationQueue::cancel(const RequestRecord& request) {
+    if (const auto operation = _waiting.take(request)) {
+        _events.finished(*operation, Unserved{Unserved::Reason::cancelled, {}});
+        return true;
+    }
+    return _running && !_running->changes && cancelRunning(request);
+}
+
+bool OperationQueue::cancelRunning(const RequestRecord& request) {
+    const Unserved cancelled{Unserved::Reason::cancelled, {}};
+    std::vector<Operation>& sharers = _running->sharers;
+    const auto sharer =
+        std::find_if(sharers.begin(), sharers.end(), [&](const auto& one) { return one.record.get() == &request; });
+    if (sharer != sharers.end()) {
+        const Operation operation = std::move(*sharer);
+        sharers.erase(sharer);
+        _events.finished(operation, cancelled);
+        return true;
+    }
+    if (_running->record.get() != &request) {
+        return false;
+    }
+    if (!sharers.empty()) {  // one of them goes on in its place
+        Operation first = std::move(sharers.front());
+        sharers.erase(sharers.begin());
+        first.until = _running->until;
+        first.sharers = std::move(sharers);
+        const Operation operation = std::exchange(*_running, std::move(first));
+        _events.finished(operation, cancelled);
+        return true;
+    }
+    finish(cancelled);
+    endWorker("was ended because its request was cancelled");
+    return true;
 }
 
 void OperationQueue::stop(std::chrono::milliseconds bound) {

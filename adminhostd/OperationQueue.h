@@ -1,19 +1,19 @@
 #pragma once
 
-// The queue of operations and the worker that runs them: one at a time, in the order of their arrival. Operations that
-// only read overtake changes only while another process holds the lock for changes (WriteLock.h).
+// The queue of operations and the worker that runs them: one at a time, in the order of WaitingOperations.h. Operations
+// that only read overtake changes only while another process holds the lock for changes (WriteLock.h).
 //
 // If a worker crashes, overruns the deadline or breaks the protocol, the operation that it was running fails; the next
 // worker runs the others. If a worker does not even start, all waiting operations fail, and the next start follows
 // after a pause that grows.
 
 #include "adminhostd/DirectoryProbe.h"
+#include "adminhostd/Operation.h"
 #include "adminhostd/Protocol.h"
-#include "adminhostd/RequestLog.h"
+#include "adminhostd/WaitingOperations.h"
 #include "adminhostd/WorkerProcess.h"
 
 #include <chrono>
-#include <deque>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -23,21 +23,6 @@
 #include <vector>
 
 namespace adminhost {
-
-struct Operation {
-    Exchange* exchange;
-    std::shared_ptr<RequestRecord> record;
-    protocol::ToWorker order = {};                ///< without the time that is left
-    std::chrono::milliseconds deadline = {};      ///< its own, if it is shorter than the queue's; zero: none
-    bool changes = false;                         ///< the worker runs it only while it holds the lock for changes
-    std::optional<protocol::Answer> locked = {};  ///< of the last worker that did not get the lock
-    /// The end of its time, counted from its first start.
-    std::optional<std::chrono::steady_clock::time_point> until = {};
-    /// When it is given up unless it has begun.
-    std::optional<std::chrono::steady_clock::time_point> beginBy = {};
-    /// When it must have ended, whatever its deadline: the client's own bound.
-    std::optional<std::chrono::steady_clock::time_point> endBy = {};
-};
 
 /// Why an operation ended without a worker's answer.
 struct Unserved {
@@ -49,6 +34,7 @@ struct Unserved {
         stopping,     ///< the daemon is stopping
         abandoned,    ///< the client went away before its turn
         notBegun,     ///< it had to begin by a certain time, and another operation was still running
+        cancelled,    ///< a client asked for its end
     };
     Reason reason = Reason::failed;
     std::string message;
@@ -66,8 +52,8 @@ class OperationQueue {
     struct Events {
         std::function<void(protocol::Hello)> hello;
         std::function<void(const std::string&)> log;  ///< an event of the plug-ins or of the queue, for the system log
-        std::function<void(const SecretPart&)> becomesSecret;  ///< reported by the running operation
-        std::function<void(const Operation&, Ending)> finished;
+        std::function<void(const SecretPart&)> becomesSecret;    ///< reported by the running operation
+        std::function<void(const Operation&, Ending)> finished;  ///< also its sharers are finished
     };
 
     OperationQueue(Settings settings, Events events);
@@ -78,6 +64,11 @@ class OperationQueue {
         return !runsAtOnce && _waiting.size() >= _settings.limit;
     }
     void add(Operation operation);
+    /// Ends the waiting operations whose clients have closed their connections.
+    void dropAbandoned();
+    /// Ends the operation of this request if it waits, or if it is running and only reads: then its worker is ended,
+    /// unless others share the run. Returns false if it changes something now or is not in the queue.
+    [[nodiscard]] bool cancel(const RequestRecord& request);
     [[nodiscard]] const Operation* running() const noexcept { return _running ? &*_running : nullptr; }
     [[nodiscard]] std::size_t waiting() const noexcept { return _waiting.size(); }
     /// The longest time that an operation may run.
@@ -121,9 +112,9 @@ class OperationQueue {
     void timeUp();
     void giveUpWaiting();
     void next();
-    /// The first operation that may run now, or the end. While another process holds the lock for changes, a change and
-    /// the changes behind it wait, and operations that only read go on.
-    [[nodiscard]] std::deque<Operation>::iterator nextToRun();
+    /// Calls the function for the record of the running operation and those of its sharers.
+    void forEachRecord(const std::function<void(RequestRecord&)>& function);
+    bool cancelRunning(const RequestRecord& request);
     void begin(Operation operation);
     void waitForLock(protocol::Answer answer);
     void finish(Ending ending);
@@ -134,7 +125,8 @@ class OperationQueue {
     State _state = State::paused;
     std::unique_ptr<WorkerProcess> _worker;
     DirectoryProbe _directoryProbe;
-    std::deque<Operation> _waiting;
+    WaitingOperations _waiting;
+    std::optional<Clock::time_point> _abandonedFrom;  ///< when clients that have gone are looked for
     std::optional<Operation> _running;
     std::optional<Clock::time_point> _changesFrom;  ///< when the lock for changes is to be tried again
     std::optional<Clock::time_point> _due;          ///< when timeUp() has to act

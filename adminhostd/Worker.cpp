@@ -72,8 +72,9 @@ class Worker {
     std::optional<int> serve(protocol::ToWorker message);
     protocol::Hello configure(const protocol::Configure& configuration);
     static void probeDirectory(const protocol::Configure& configuration);
-    /// Runs once, and only in a worker that holds the lock for changes.
+    /// Each runs once, and only in a worker that holds the lock for changes.
     void removeLeftovers();
+    void removeSettingsLeftovers();
 
     protocol::Answer answer(const protocol::Perform& order);
     protocol::Answer answer(const protocol::FindAccounts& order);
@@ -89,6 +90,7 @@ class Worker {
     LoadedPlugins _plugins;
     FileDescriptor _toolConfiguration;  ///< open: the directory stays if the front is killed and another one starts
     bool _leftoversRemoved = false;
+    bool _settingsLeftoversRemoved = false;
     bool _returnMemory = false;  ///< a large message has been freed
     /// What the answer was written from. It is freed once the answer has been sent, because freeing and clearing a long
     /// listing takes as long as writing it.
@@ -177,6 +179,12 @@ void Worker::removeLeftovers() {
     }
 }
 
+void Worker::removeSettingsLeftovers() {
+    if (!std::exchange(_settingsLeftoversRemoved, true)) {
+        _plugins.removeSettingsLeftovers();
+    }
+}
+
 protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Perform& order) {
     Plugin& plugin = *loaded.plugin;
     const auto failed = [&](const Error& error) {
@@ -217,6 +225,7 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
             return broken("The daemon that sent the request has ended.");
         }
         removeLeftovers();
+        removeSettingsLeftovers();
     }
     _plugins.enter(loaded);
     setTaskDeadline(deadline);
@@ -351,8 +360,9 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
             return 1;
         }
         if (!configuration->tryOnly) {
-            // Not earlier: a shared file system that hangs may hold up requests, but not the start. If another process
-            // holds the lock, the first write does it.
+            // Tickets and the like must not wait for a write. What is beside settings files does: they may be on a
+            // shared file system that hangs, which must not hold up requests that do not use it. If another process
+            // holds the lock, the first write removes both.
             if (const auto lock = WriteLock::tryToHold()) {
                 removeLeftovers();
             }

@@ -135,7 +135,9 @@ class ADMINHOST_EXPORT Plugin {
     [[nodiscard]] virtual std::vector<HostPath> settingsFiles() { return {}; }
 
     [[nodiscard]] virtual std::vector<LogFile> logs() { return {}; }
-    /// Files that an interrupted operation may have left. The host removes them after a worker's start.
+    /// Files that an interrupted operation may have left, on a local file system: one that hangs would hold up every
+    /// request. The host removes them after a worker's start, and what is left beside settingsFiles() before the first
+    /// command that may change something.
     [[nodiscard]] virtual std::vector<HostPath> leftovers() { return {}; }
     /// The host writes these files before the first tool is run, in a private directory.
     [[nodiscard]] virtual std::vector<ToolFile> toolFiles() { return {}; }

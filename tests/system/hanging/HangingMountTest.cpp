@@ -5,6 +5,7 @@
 #include "tests/support/SampleRoot.h"
 
 #include <chrono>
+#include <csignal>
 #include <filesystem>
 #include <memory>
 #include <string>
@@ -59,6 +60,20 @@ TEST(HangingSharedFileSystem, EndsTheRequestAtItsTimeLimitWhileTheFrontReplies) 
     const HttpReply reply = second.reply();
     EXPECT_EQ(reply.status, 200) << reply.body;
     EXPECT_THAT(reply.body, HasSubstr("\"sharedFileSystemPath\":\"/mnt/media\""));
+}
+
+TEST(HangingSharedFileSystem, DoesNotKeepANewWorkerFromReadsThatDoNotUseIt) {
+    const SampleRoot root;
+    root.write("/Library/Preferences/com.brenn.lumioserverd.plist",
+               "<plist><dict><key>shared_filesystem</key><string>/mnt/media</string></dict></plist>");
+    std::filesystem::create_directories(root.disk("/mnt/media"));
+    const DaemonProcess daemon(
+        {{"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"}, "", {}, true, {}});
+    const HangingMount hanging(root.disk("/mnt/media"));
+    const pid_t first = daemon.workerPid();
+    ASSERT_EQ(::kill(first, SIGKILL), 0);
+    ASSERT_TRUE(daemon.waitForLog("was killed by signal 9"));
+    EXPECT_EQ(daemon.connect().post("/v1/lumio/getState").status, 200);
 }
 
 }  // namespace

@@ -125,7 +125,7 @@ TEST_F(Settings, WriterOfAMemberKeyAndWriterOfAClusterKeyKeepEachOthersValues) {
     }
 }
 
-TEST_F(Settings, NextStartRemovesWhatKilledWorkersLeftAndNothingElse) {
+TEST_F(Settings, NextWriteRemovesWhatKilledWorkersLeftAndNothingElse) {
     const std::string server = "/Library/SorvaneProducer/Shared/Server/";
     const std::vector<std::string> leftovers{
         "/Library/Preferences/.com.brenn.lumioserverd.plist.adminhost-0123456789abcdef",
@@ -142,6 +142,9 @@ TEST_F(Settings, NextStartRemovesWhatKilledWorkersLeftAndNothingElse) {
     ASSERT_TRUE(daemon.waitForLog("was killed by signal 9"));
     EXPECT_EQ(post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})").status, 200);
     EXPECT_NE(daemon.workerPid(), first);
+    EXPECT_TRUE(std::filesystem::exists(root.disk(leftovers[1])))
+        << "a read does not touch the shared file system for it";
+    EXPECT_EQ(post("writeSettings", R"({"configuration":{"server_host":"host"}})").status, 200);
     for (const std::string& leftover : leftovers) {
         EXPECT_FALSE(std::filesystem::exists(root.disk(leftover))) << leftover;
     }
