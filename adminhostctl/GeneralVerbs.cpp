@@ -41,8 +41,12 @@ ExitStatus commands(const Context& context, Words) {
 
 // The directory
 
-/// The entry with the names of its groups in place of their entries.
+/// The entry as people read it: each value once, and the names of its groups in place of their entries.
 Dictionary withGroupNames(Dictionary entry) {
+    entry.remove("_id_");  // the UUID again
+    if (entry.get("longName") == entry.get("shortName")) {
+        entry.remove("longName");
+    }
     const Array* groups = entry.get("groups").array();
     if (groups == nullptr) {
         return entry;

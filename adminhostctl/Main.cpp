@@ -102,6 +102,9 @@ void addOption(CLI::App& app, const adminhost::ctl::VerbOption& option, adminhos
             : app.add_option_function<std::string>(
                      names, [&options, name](const std::string& text) { options.own[name] = text; }, help)
                   ->type_name(std::string(option.argument));
+    if (option.argument.starts_with('[')) {
+        added->expected(0, 1);
+    }
     if (!option.excludes.empty()) {
         added->excludes(app.get_option(std::string(option.excludes)));
     }

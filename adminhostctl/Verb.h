@@ -25,7 +25,7 @@ enum class Format { text, json, plist };
 /// An option that some verbs of a room have.
 struct VerbOption {
     std::string_view name;      ///< "--group"
-    std::string_view argument;  ///< "FILE"; empty for an option without one
+    std::string_view argument;  ///< "FILE", "[GROUP]" if it may be left out; empty for none
     std::string_view help;
     std::string_view excludes = {};  ///< the name of an option that must not be given with it
     std::string_view brief = {};     ///< "-g"; empty for an option without a short form

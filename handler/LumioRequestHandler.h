@@ -78,6 +78,10 @@ class LumioRequestHandler : public adminhost::PluginRequestHandler, public Setti
     /// "command", the list and "readStatus" 0; on failure only "readStatus", the error's code.
     [[nodiscard]] Response getWorkflowsWithRequest(const Dictionary& request);
     [[nodiscard]] Response getCamerasWithRequest(const Dictionary& request);
+    /// "resources": every camera and workflow with its access list as the database has it (resources/AccessOverview.h).
+    [[nodiscard]] Response getAccessWithRequest(const Dictionary& request);
+    /// Removes an account that the directory does not know from access lists; "removed" and "writeStatus".
+    [[nodiscard]] Response removeAccessWithRequest(const Dictionary& request);
     [[nodiscard]] Response getPropertiesWithRequest(const Dictionary& request);
     // Each applies an array of change records, entry by entry; null does nothing. They return no response.
     Response setWorkflowACLWithRequest(const Array* changes);

@@ -2,6 +2,7 @@
 #include "platform/framework/Report.h"
 #include "platform/log/Log.h"
 #include "platform/value/ValueText.h"
+#include "resources/AccessOverview.h"
 #include "resources/Camera.h"
 #include "resources/Property.h"
 #include "resources/ToolWords.h"
@@ -90,6 +91,34 @@ Response LumioRequestHandler::getCamerasWithRequest(const Dictionary&) {
         list.emplace_back(*std::move(*camera).takeDictionary());
     }
     return listing("getCameras", "cameras", std::move(list));
+}
+
+Response LumioRequestHandler::getAccessWithRequest(const Dictionary& request) {
+    auto resources = accessOverview(languagesOf(request));
+    if (!resources) {
+        logEvent("adminhost_lumio: could not read who may use what: " + textOf(resources.error()));
+        return failedListing(resources.error());
+    }
+    return Dictionary{{"resources", *std::move(resources)}, {"readStatus", 0}};
+}
+
+Response LumioRequestHandler::removeAccessWithRequest(const Dictionary& request) {
+    std::vector<std::string> resources;
+    const Array* named = request.get("resources").array();
+    for (const Value& resource : named != nullptr ? *named : Array()) {
+        resources.push_back(textOf(resource));
+    }
+    if (named != nullptr && resources.empty()) {
+        return Dictionary{{"removed", 0}, {"writeStatus", 0}};  // without names, all would be meant
+    }
+    const auto outcome = removeUnknownAccount(textOf(request.get("uuid")), resources);
+    if (!outcome) {
+        logEvent("adminhost_lumio: could not remove access: " + textOf(outcome.error()));
+        return Dictionary{{"removed", 0},
+                          {"writeStatus", 1},
+                          {"errorDescription", outcome.error().description.value_or(textOf(outcome.error()))}};
+    }
+    return Dictionary{{"removed", outcome->removed}, {"writeStatus", outcome->left == 0 ? 0 : 1}};
 }
 
 Response LumioRequestHandler::processCameraChangesWithRequest(const Array* changes) {

@@ -52,6 +52,8 @@ constexpr TableRow operations[] = {
      [](LumioRequestHandler& h, const Dictionary& r) { return h.createNimboAccountWithRequest(r); }},
     {"getWorkflows", [](LumioRequestHandler& h, const Dictionary& r) { return h.getWorkflowsWithRequest(r); }},
     {"getCameras", [](LumioRequestHandler& h, const Dictionary& r) { return h.getCamerasWithRequest(r); }},
+    {"getAccess", [](LumioRequestHandler& h, const Dictionary& r) { return h.getAccessWithRequest(r); }},
+    {"removeAccess", [](LumioRequestHandler& h, const Dictionary& r) { return h.removeAccessWithRequest(r); }},
     {"getProperties", [](LumioRequestHandler& h, const Dictionary& r) { return h.getPropertiesWithRequest(r); }},
 };
 

@@ -242,7 +242,6 @@ void Resource::expandColumns() {
 }
 
 void Resource::expandList(const std::vector<std::string>& uuids) {
-    _aclsAreExpanded = true;
     std::vector<Dictionary> entries;
     if (!uuids.empty()) {
         entries = getDirectoryDetailsForUUIDs(uuids);
@@ -251,9 +250,13 @@ void Resource::expandList(const std::vector<std::string>& uuids) {
             dropDuplicates(entries);
         }
     }
+    setAllowed(Array(std::make_move_iterator(entries.begin()), std::make_move_iterator(entries.end())));
+}
+
+void Resource::setAllowed(Array entries) {
+    _aclsAreExpanded = true;
     if (_data) {
-        _data->set("allowedUsersAndGroups",
-                   Array(std::make_move_iterator(entries.begin()), std::make_move_iterator(entries.end())));
+        _data->set("allowedUsersAndGroups", std::move(entries));
     }
 }
 

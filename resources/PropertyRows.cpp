@@ -100,16 +100,11 @@ Dictionary rowOf(std::span<const std::string> columns, std::span<const std::stri
 }
 
 std::optional<std::string> bytesOfHex(std::string_view digits) {
-    if (digits.size() % 2 != 0 || digits.find_first_not_of("0123456789ABCDEF") != std::string_view::npos) {
-        return std::nullopt;
+    auto bytes = adminhost::textOfHex(digits);
+    if (bytes) {
+        // The tool's ordinary output ends a text there too.
+        bytes->resize(std::min(bytes->find('\0'), bytes->size()));
     }
-    std::string bytes;
-    bytes.reserve(digits.size() / 2);
-    for (std::size_t i = 0; i < digits.size(); i += 2) {
-        bytes += static_cast<char>(adminhost::hexValueOf(digits[i]) * 16 + adminhost::hexValueOf(digits[i + 1]));
-    }
-    // The tool's ordinary output ends a text there too.
-    bytes.resize(std::min(bytes.find('\0'), bytes.size()));
     return bytes;
 }
 

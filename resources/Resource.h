@@ -73,6 +73,8 @@ class Resource {
     /// The record. If there is none yet, loads the row of the UUID, raw (dates as text, no "_id_"), if the database has
     /// exactly one. Null otherwise; the next call tries again.
     [[nodiscard]] const adminhost::Dictionary* data();
+    /// Sets the access list of the record, which is then not read from the database.
+    void setAllowed(adminhost::Array entries);
     /// Replaces the record; nullopt clears it.
     void setData(std::optional<adminhost::Dictionary> data) {
         _data = std::move(data);

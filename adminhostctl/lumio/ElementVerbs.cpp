@@ -4,6 +4,12 @@
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/State.h"
 #include "adminhostctl/desired/Writing.h"
+#include "adminhostctl/lumio/AccessVerb.h"
+#include "adminhostctl/lumio/People.h"
+#include "platform/text/Uuid.h"
+
+#include <algorithm>
+#include <cctype>
 
 namespace adminhost::ctl {
 namespace {
@@ -39,19 +45,66 @@ ExitStatus reportUnread(const Context& context, const Listing& listing) {
     return listing.unread.empty() ? ExitStatus::done : ExitStatus::failed;
 }
 
-/// Changes one element, which the person has named.
-ExitStatus change(const Context& context, const ElementKind& kind, const std::string& name, WantedElement wanted) {
+/// The name as a word for a shell.
+std::string shellWord(const std::string& name) {
+    const bool isPlain = !name.empty() && std::all_of(name.begin(), name.end(), [](unsigned char c) {
+        return std::isalnum(c) != 0 || c == '_' || c == '-' || c == '.' || c == '/';
+    });
+    if (isPlain) {
+        return name;
+    }
+    std::string word = "'";
+    for (const char c : name) {
+        word += c == '\'' ? std::string("'\\''") : std::string(1, c);
+    }
+    return word + '\'';
+}
+
+/// What the person may not expect of the change.
+void addNotes(std::vector<std::string>& notes, const ElementKind& kind, const std::string& name, const Element& element,
+              const WantedElement& wanted) {
+    const Value& restricts = wanted.fields.get("access_control_enabled");
+    const bool isEmpty = std::all_of(element.people.begin(), element.people.end(),
+                                     [](const auto& people) { return people.second.empty(); });
+    std::string note;
+    if (!wanted.lists.empty() && element.fields.get("access_control_enabled") != Value(true)) {
+        note = name + " is open to everyone; its list counts after \"adminhostctl " + kind.word + " access " +
+               shellWord(name) + " on\"";
+    } else if (restricts == Value(true) && isEmpty) {
+        note = "the list of " + name + " is empty, so nobody may use it now; \"adminhostctl " + kind.word +
+               " allow\" adds people";
+    }
+    if (!note.empty() && std::find(notes.begin(), notes.end(), note) == notes.end()) {
+        notes.push_back(std::move(note));
+    }
+}
+
+/// Changes elements that the person has named, each in the same ways, in one write. A way of its own for each person:
+/// the service's tool, which is run once for each, refuses all names if it does not know one of them.
+ExitStatus change(const Context& context, const ElementKind& kind, std::span<const std::string> names,
+                  const std::vector<WantedElement>& ways) {
     const CurrentState current = readState(context, kind.section);
     requireWhole(current);
-    const Element* element = findByAnyName(current.state, current.form.list(kind.section), name);
-    if (element == nullptr) {
-        throw notFound(kind, name, current.state, current.form.list(kind.section));
-    }
-    wanted.name = element->identity;
-    wanted.shownAs = name;
+    const ListForm& list = current.form.list(kind.section);
     Wanted all;
-    all.elements[kind.section].push_back(std::move(wanted));
-    return carryOut(context, all, current);
+    std::vector<std::string> notes;
+    for (const std::string& name : names) {
+        const Element* element = findByAnyName(current.state, list, name);
+        if (element == nullptr) {
+            throw notFound(kind, name, current.state, list);
+        }
+        for (WantedElement wanted : ways) {
+            addNotes(notes, kind, name, *element, wanted);
+            wanted.name = element->identity;
+            wanted.shownAs = name;
+            all.elements[kind.section].push_back(std::move(wanted));
+        }
+    }
+    const ExitStatus status = carryOut(context, all, current);
+    for (const std::string& note : notes) {
+        context.err << shown(note) << '\n';
+    }
+    return status;
 }
 
 }  // namespace
@@ -99,21 +152,47 @@ ExitStatus showElement(const Context& context, const ElementKind& kind, const st
     return reportUnread(context, listing);
 }
 
-ExitStatus allowPeople(const Context& context, const ElementKind& kind, const std::string& name,
+ExitStatus allowPeople(const Context& context, const ElementKind& kind, std::span<const std::string> elements,
                        std::span<const std::string> people) {
-    WantedElement wanted;
-    wanted.lists[context.options.has(groupOption) ? "groups" : "users"] =
-        std::vector<std::string>(people.begin(), people.end());
-    return change(context, kind, name, std::move(wanted));
+    const bool groups = context.options.has(groupOption);
+    std::vector<WantedElement> ways;
+    for (const std::string& name : shortNamesOf(context, people, groups)) {
+        WantedElement wanted;
+        wanted.lists[groups ? "groups" : "users"] = {name};
+        ways.push_back(std::move(wanted));
+    }
+    return change(context, kind, elements, ways);
 }
 
-ExitStatus denyPeople(const Context& context, const ElementKind& kind, const std::string& name,
+ExitStatus denyPeople(const Context& context, const ElementKind& kind, std::span<const std::string> elements,
                       std::span<const std::string> people) {
-    WantedElement wanted;
-    for (const std::string& person : people) {
-        wanted.denied.push_back({context.options.has(groupOption) ? "group" : "", person, ""});
+    // An account that the directory does not know is only in the lists as the database has them.
+    if (people.size() == 1 && elements.size() == 1 && uuidOf(people.front())) {
+        const CurrentState current = readState(context, kind.section);
+        const ListForm& list = current.form.list(kind.section);
+        const Element* element = findByAnyName(current.state, list, elements.front());
+        if (element == nullptr) {
+            throw notFound(kind, elements.front(), current.state, list);
+        }
+        if (isUnknownEntry(context, people.front(), element->identity)) {
+            return removeUnknown(context, people.front(), element->identity);
+        }
     }
-    return change(context, kind, name, std::move(wanted));
+    const bool groups = context.options.has(groupOption);
+    std::vector<WantedElement> ways;
+    for (const std::string& name : people) {
+        const std::vector<Dictionary> entries = entriesNamed(context, name);
+        if (entries.empty()) {
+            throw unknownName(context, groups ? "group" : "person or group", name);
+        }
+        if (groups) {
+            (void)shortNamesOf(context, std::span(&name, 1), true);
+        }
+        WantedElement wanted;
+        wanted.denied.push_back({groups ? "group" : "", std::string(entries.front().text("shortName")), ""});
+        ways.push_back(std::move(wanted));
+    }
+    return change(context, kind, elements, ways);
 }
 
 ExitStatus switchAccess(const Context& context, const ElementKind& kind, const std::string& name,
@@ -123,13 +202,13 @@ ExitStatus switchAccess(const Context& context, const ElementKind& kind, const s
     }
     WantedElement wanted;
     wanted.fields.set("access_control_enabled", onOrOff == "on");
-    return change(context, kind, name, std::move(wanted));
+    return change(context, kind, std::span(&name, 1), {wanted});
 }
 
 ExitStatus removeElement(const Context& context, const ElementKind& kind, const std::string& name) {
     WantedElement wanted;
     wanted.remove = true;
-    return change(context, kind, name, std::move(wanted));
+    return change(context, kind, std::span(&name, 1), {wanted});
 }
 
 }  // namespace adminhost::ctl

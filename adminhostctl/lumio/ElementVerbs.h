@@ -13,9 +13,6 @@
 
 namespace adminhost::ctl {
 
-/// The option with which names are names of groups.
-inline constexpr std::string_view groupOption = "--group";
-
 /// A kind of elements, by the words that are used for it.
 struct ElementKind {
     const char* word;     ///< "camera"
@@ -31,14 +28,17 @@ struct ElementKind {
 [[nodiscard]] ExitStatus listElements(const Context& context, const ElementKind& kind);
 [[nodiscard]] ExitStatus showElement(const Context& context, const ElementKind& kind, const std::string& name);
 
-// These change one element, which must exist.
+// These change elements that the service lists. The names of people and groups are looked up before anything is sent:
+// Failure(usage) if the directory does not have one, or if it is a group's and --group was not given.
 
-/// Adds users, or with --group groups, to the access list.
-[[nodiscard]] ExitStatus allowPeople(const Context& context, const ElementKind& kind, const std::string& name,
-                                     std::span<const std::string> people);
-/// Removes users and groups, or with --group groups only, from the access list.
-[[nodiscard]] ExitStatus denyPeople(const Context& context, const ElementKind& kind, const std::string& name,
-                                    std::span<const std::string> people);
+/// Adds users, or with --group groups, to the access lists of the elements, in one write. A name that the service does
+/// not accept does not keep the others from being added.
+[[nodiscard]] ExitStatus allowPeople(const Context& context, const ElementKind& kind,
+                                     std::span<const std::string> elements, std::span<const std::string> people);
+/// Removes users and groups, or with --group groups only, from the access lists. A single UUID of an account that the
+/// directory does not know removes the entries of that account.
+[[nodiscard]] ExitStatus denyPeople(const Context& context, const ElementKind& kind,
+                                    std::span<const std::string> elements, std::span<const std::string> people);
 /// Restricts the element to its list ("on"), or opens it to everyone ("off").
 [[nodiscard]] ExitStatus switchAccess(const Context& context, const ElementKind& kind, const std::string& name,
                                       const std::string& onOrOff);

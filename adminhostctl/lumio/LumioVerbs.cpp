@@ -5,7 +5,9 @@
 #include "adminhostctl/desired/Writing.h"
 #include "adminhostctl/lumio/AccessVerb.h"
 #include "adminhostctl/lumio/ElementVerbs.h"
+#include "adminhostctl/lumio/People.h"
 
+#include <algorithm>
 #include <array>
 
 namespace adminhost::ctl {
@@ -73,13 +75,39 @@ template <const ElementKind& kind>
 ExitStatus showVerb(const Context& context, Words words) {
     return showElement(context, kind, words.front());
 }
+struct ElementsAndPeople {
+    std::vector<std::string> elements;
+    std::vector<std::string> people;
+};
+
+/// "ELEMENT NAME... [--group]", or "--group GROUP ELEMENT...".
+ElementsAndPeople elementsAndPeople(const Context& context, const ElementKind& kind, Words words) {
+    std::vector<std::string> all(words.begin(), words.end());
+    if (std::string group = context.options.argumentOf(groupOption); !group.empty()) {
+        const std::vector<Dictionary> entries = entriesNamed(context, group);
+        if (std::any_of(entries.begin(), entries.end(),
+                        [](const Dictionary& entry) { return entry.text("type") == "group"; }) ||
+            all.size() > 1) {
+            return {std::move(all), {std::move(group)}};
+        }
+        all.insert(all.begin(), std::move(group));  // "--group ELEMENT NAME"
+    }
+    if (all.size() < 2) {
+        throw usageError(std::string("a name is missing: adminhostctl ") + kind.word + " allow|deny " +
+                         std::string(kind.word) + " NAME..., or --group GROUP " + kind.word + "...");
+    }
+    return {{all.front()}, {all.begin() + 1, all.end()}};
+}
+
 template <const ElementKind& kind>
 ExitStatus allowVerb(const Context& context, Words words) {
-    return allowPeople(context, kind, words.front(), words.subspan(1));
+    const auto [elements, people] = elementsAndPeople(context, kind, words);
+    return allowPeople(context, kind, elements, people);
 }
 template <const ElementKind& kind>
 ExitStatus denyVerb(const Context& context, Words words) {
-    return denyPeople(context, kind, words.front(), words.subspan(1));
+    const auto [elements, people] = elementsAndPeople(context, kind, words);
+    return denyPeople(context, kind, elements, people);
 }
 template <const ElementKind& kind>
 ExitStatus accessVerb(const Context& context, Words words) {
@@ -106,19 +134,19 @@ constexpr std::array table = {
          &showVerb<camera>,
          {{"camera show 'Lecture hall 1'", "--format json camera show Roof"}}},
     Verb{"camera allow",
-         "CAMERA NAME... [--group]",
+         "CAMERA NAME... [--group] | --group GROUP CAMERA...",
          "Allow users, or groups, to use a camera",
-         2,
+         1,
          1000,
          &allowVerb<camera>,
-         {{"camera allow 'Lecture hall 1' anna ben", "camera allow Roof studio --group"}}},
+         {{"camera allow 'Lecture hall 1' anna ben", "camera allow --group studio 'Main hall' Roof"}}},
     Verb{"camera deny",
-         "CAMERA NAME... [--group]",
+         "CAMERA NAME... [--group] | --group GROUP CAMERA...",
          "Remove users and groups from a camera's list",
-         2,
+         1,
          1000,
          &denyVerb<camera>,
-         {{"camera deny 'Lecture hall 1' anna", "camera deny Roof studio --group"}}},
+         {{"camera deny 'Lecture hall 1' anna", "camera deny --group studio 'Main hall' Roof"}}},
     Verb{"camera access",
          "CAMERA on|off",
          "Restrict a camera to its list, or open it to everyone",
@@ -148,19 +176,19 @@ constexpr std::array table = {
          &showVerb<workflow>,
          {{"workflow show 'Publish to Catalog'", "workflow show Workflows/Archive.workflow"}}},
     Verb{"workflow allow",
-         "WORKFLOW NAME... [--group]",
+         "WORKFLOW NAME... [--group] | --group GROUP WORKFLOW...",
          "Allow users, or groups, to use a workflow",
-         2,
+         1,
          1000,
          &allowVerb<workflow>,
-         {{"workflow allow 'Publish to Catalog' anna ben", "workflow allow Archive studio --group"}}},
+         {{"workflow allow 'Publish to Catalog' anna ben", "workflow allow --group studio 'Audio Episode' Archive"}}},
     Verb{"workflow deny",
-         "WORKFLOW NAME... [--group]",
+         "WORKFLOW NAME... [--group] | --group GROUP WORKFLOW...",
          "Remove users and groups from a workflow's list",
-         2,
+         1,
          1000,
          &denyVerb<workflow>,
-         {{"workflow deny 'Publish to Catalog' anna", "workflow deny Archive studio --group"}}},
+         {{"workflow deny 'Publish to Catalog' anna", "workflow deny --group studio 'Audio Episode' Archive"}}},
     Verb{"workflow access",
          "WORKFLOW on|off",
          "Restrict a workflow to its list, or open it to everyone",
@@ -169,12 +197,12 @@ constexpr std::array table = {
          &accessVerb<workflow>,
          {{"workflow access Archive on", "workflow access Archive off"}}},
     Verb{"access",
-         "NAME|UUID [--group]",
-         "Show what a person or a group may use",
-         1,
+         "NAME|UUID [--group] [--revoke]",
+         "Show what a person or a group may use, or remove it from all lists",
+         0,
          1,
          &accessOf,
-         {{"access anna", "access studio --group"}}},
+         {{"access anna", "access --group studio --revoke"}}},
     Verb{"property list",
          "[--names]",
          "List the workflow properties",
@@ -199,8 +227,10 @@ constexpr std::array table = {
 };
 
 constexpr std::array options = {
-    VerbOption{groupOption, "",
-               "With camera and workflow allow or deny, and with access NAME: the names are names of groups"},
+    VerbOption{groupOption, "[GROUP]",
+               "The names are names of groups; with allow and deny, also: one group for all cameras or workflows that "
+               "follow"},
+    VerbOption{revokeOption, "", "Show the entries of the person or group itself, and remove them from all lists"},
     VerbOption{protectOption, "", "With property set: store the value encrypted"},
     VerbOption{noProtectOption, "", "With property set: store the value unencrypted", protectOption},
 };

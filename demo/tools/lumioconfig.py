@@ -4,6 +4,7 @@ Statuses: 0 done, 2 no such resource or person (nothing is changed), 64 usage, 7
 """
 
 import os
+import re
 import sqlite3
 import sys
 
@@ -61,7 +62,9 @@ def change_access(database, root, command, options):
         if command == "--add_access" and not is_account(root, record_type, name):
             fail(2, f"lumioconfig: no {record_type} {name}")
     for name in options["--shortname"]:
-        entry = (names.uuid_of(record_type, name), resource, row)
+        # An account that is gone is named by its UUID.
+        is_uuid = command == "--remove_access" and re.fullmatch(r"[0-9A-Fa-f]{8}(-[0-9A-Fa-f]{4}){3}-[0-9A-Fa-f]{12}", name)
+        entry = (name.upper() if is_uuid else names.uuid_of(record_type, name), resource, row)
         if command == "--remove_access":
             database.execute("DELETE FROM access_control_entries WHERE upper(record_uuid) = ?"
                              " AND resource_type = ? AND resource_id = ?", entry)

@@ -3,6 +3,7 @@
 // Hexadecimal digits.
 
 #include <cstdint>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
@@ -35,6 +36,24 @@ inline void appendHex(std::string& text, std::uint8_t byte, std::string_view dig
         appendHex(text, byte);
     }
     return text;
+}
+
+/// The bytes of pairs of digits in either case; nullopt if it is anything else.
+[[nodiscard]] inline std::optional<std::string> textOfHex(std::string_view digits) {
+    if (digits.size() % 2 != 0) {
+        return std::nullopt;
+    }
+    std::string bytes;
+    bytes.reserve(digits.size() / 2);
+    for (std::size_t i = 0; i < digits.size(); i += 2) {
+        const int high = hexValueOf(digits[i]);
+        const int low = hexValueOf(digits[i + 1]);
+        if (high < 0 || low < 0) {
+            return std::nullopt;
+        }
+        bytes += static_cast<char>(high * 16 + low);
+    }
+    return bytes;
 }
 
 }  // namespace adminhost
