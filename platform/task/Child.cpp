@@ -1,6 +1,5 @@
 #include "platform/task/Child.h"
 
-#include "platform/task/StartChild.h"
 #include "platform/task/ToolRegister.h"
 
 #include <cerrno>
@@ -44,8 +43,7 @@ Child::~Child() {
     (void)wait();
 }
 
-int Child::start(const std::string& tool, const std::vector<std::string>& arguments,
-                 std::vector<std::string> environment, bool withInput) {
+int Child::start(ChildPlan plan, bool withInput) {
     FileDescriptor childInput;
     FileDescriptor childOutput;
     FileDescriptor childError;
@@ -58,12 +56,6 @@ int Child::start(const std::string& tool, const std::vector<std::string>& argume
     if (const int failure = makePipe(error, childError, true); failure != 0) {
         return failure;
     }
-    ChildPlan plan;
-    plan.program = tool;
-    plan.arguments.reserve(arguments.size() + 1);
-    plan.arguments.push_back(tool);
-    plan.arguments.insert(plan.arguments.end(), arguments.begin(), arguments.end());
-    plan.environment = std::move(environment);
     plan.descriptors = {childInput.get(), childOutput.get(), childError.get()};
     if (ToolRegister* known = toolRegister(); known != nullptr) {
         plan.registration = known->claim();

@@ -6,11 +6,10 @@
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/framework/Export.h"
+#include "platform/task/StartChild.h"
 
 #include <atomic>
 #include <cstdint>
-#include <string>
-#include <vector>
 
 #include <sys/types.h>
 
@@ -23,10 +22,9 @@ class ADMINHOST_EXPORT Child {
     Child& operator=(const Child&) = delete;
     ~Child();
 
-    /// Starts the tool in a process group of its own. Its standard input is a pipe if `withInput` is true, else
-    /// /dev/null. Returns the system's error number, 0 for success. Called once.
-    [[nodiscard]] int start(const std::string& tool, const std::vector<std::string>& arguments,
-                            std::vector<std::string> environment, bool withInput);
+    /// Starts the tool of the plan in a process group of its own, with pipes as its descriptors. Its standard input is
+    /// a pipe if `withInput` is true, else /dev/null. Returns the system's error number, 0 for success. Called once.
+    [[nodiscard]] int start(ChildPlan plan, bool withInput);
 
     /// Sends SIGKILL to the child's process group, unless the child itself has exited: a process that it left in its
     /// group is a daemon that must go on.

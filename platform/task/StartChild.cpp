@@ -39,6 +39,8 @@ struct ChildSide {
     const ChildRights* rights;
     const gid_t* groups;
     std::size_t groupCount;
+    bool noNewPrivileges;
+    int confinement;
     std::atomic<pid_t>* registration;
     pid_t parent;
 };
@@ -61,7 +63,16 @@ NOT_INSTRUMENTED bool enter(const ChildSide& side) {
     return ::syscall(SYS_prctl, PR_SET_PDEATHSIG, 0, 0, 0, 0) == 0;
 }
 
-/// The descriptors, the directory and the umask. The sources are all above the numbers that they go to.
+/// No later step opens a file.
+NOT_INSTRUMENTED bool confine(const ChildSide& side) {
+    if (side.noNewPrivileges && ::syscall(SYS_prctl, PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
+        return false;
+    }
+    return side.confinement < 0 || ::syscall(SYS_landlock_restrict_self, side.confinement, 0) == 0;
+}
+
+/// The descriptors, the confinement, the directory and the umask. The sources are all above the numbers that they go
+/// to.
 NOT_INSTRUMENTED bool place(const ChildSide& side) {
     for (int number = 0; number < side.descriptorCount; ++number) {
         int source = side.descriptors[number];
@@ -71,6 +82,9 @@ NOT_INSTRUMENTED bool place(const ChildSide& side) {
         if (source < 0 || (source != number && ::syscall(SYS_dup3, source, number, 0) < 0)) {
             return false;
         }
+    }
+    if (!confine(side)) {
+        return false;
     }
     // Ours are all close-on-exec; this is for those that a library opened without it.
     if (side.failure > side.descriptorCount &&
@@ -200,6 +214,13 @@ Result<StartedChild> startChild(const ChildPlan& plan) {
             }
         }
     }
+    int confinement = plan.confinement;
+    if (confinement >= 0 && confinement < count) {
+        confinement = duplicates.emplace_back(lifted(confinement, count)).get();
+        if (confinement < 0) {
+            return failed(errno);
+        }
+    }
     int ends[2];
     if (::pipe2(ends, O_CLOEXEC) != 0) {
         return failed(errno);
@@ -226,6 +247,8 @@ Result<StartedChild> startChild(const ChildPlan& plan) {
     side.rights = plan.rights ? &*plan.rights : nullptr;
     side.groups = plan.rights ? plan.rights->groups.data() : nullptr;
     side.groupCount = plan.rights ? plan.rights->groups.size() : 0;
+    side.noNewPrivileges = plan.noNewPrivileges;
+    side.confinement = confinement;
     side.registration = plan.registration;
     side.parent = ::getpid();
     const int dumpable = ::prctl(PR_GET_DUMPABLE);

@@ -41,6 +41,10 @@ struct ADMINHOST_EXPORT ChildPlan {
     /// before it reaps the child.
     std::atomic<pid_t>* registration = nullptr;
     std::optional<ChildRights> rights;  ///< without them, the child keeps ours
+    bool noNewPrivileges = false;       ///< no program that the child executes gets more rights than the child has
+    /// What confines the child (Confinement::descriptor()), or -1. Needs noNewPrivileges. The program, and its loader,
+    /// must be allowed.
+    int confinement = -1;
 };
 
 struct ADMINHOST_EXPORT StartedChild {

@@ -136,6 +136,18 @@ std::vector<std::string> environmentWith(const TaskEnvironment& added) {
     return all;
 }
 
+ChildPlan childPlanOf(TaskPlan& plan) {
+    ChildPlan child;
+    child.program = plan.tool.text();
+    child.arguments = std::move(plan.arguments);
+    child.arguments.insert(child.arguments.begin(), child.program);
+    child.environment = environmentWith(plan.environment);
+    child.rights = std::move(plan.rights);
+    child.noNewPrivileges = plan.noNewPrivileges;
+    child.confinement = plan.confinement ? plan.confinement->descriptor() : -1;
+    return child;
+}
+
 bool namesVariables(const TaskEnvironment& environment) {
     return std::none_of(environment.begin(), environment.end(), [](const auto& variable) {
         return variable.first.empty() || variable.first.find('=') != std::string::npos;
@@ -149,7 +161,7 @@ class TaskGroup::RunningTask {
     static constexpr std::size_t entryCount = 4;
 
     RunningTask(TaskPlan plan, std::size_t bound, std::size_t& held)
-        : _tool(std::move(plan.tool)),
+        : _tool(plan.tool),
           _bound(bound),
           _held(held),
           _output(_child.output, plan.keepsOutput, held, std::move(plan.outputGrows)),
@@ -161,10 +173,12 @@ class TaskGroup::RunningTask {
             fail("not started: the time allowed for the request is over");
             return;
         }
+        if (!plan.refusal.empty()) {
+            fail(plan.refusal);
+            return;
+        }
         const int number =
-            !namesVariables(plan.environment)
-                ? EINVAL
-                : _child.start(_tool.text(), plan.arguments, environmentWith(plan.environment), plan.input.has_value());
+            !namesVariables(plan.environment) ? EINVAL : _child.start(childPlanOf(plan), plan.input.has_value());
         if (number != 0) {
             fail(std::generic_category().message(number));
         } else if (_rest.empty()) {

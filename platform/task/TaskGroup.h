@@ -9,6 +9,8 @@
 
 #include "platform/files/Path.h"
 #include "platform/framework/Export.h"
+#include "platform/task/Confinement.h"
+#include "platform/task/StartChild.h"
 
 #include <chrono>
 #include <cstddef>
@@ -36,6 +38,10 @@ struct ADMINHOST_EXPORT TaskPlan {
     /// read: the output can be used while the tool is still writing. Bytes that are not UTF-8 are still among it. What
     /// was passed does not count if the tool fails.
     std::function<void(std::string_view)> outputGrows = {};
+    std::optional<ChildRights> rights = std::nullopt;          ///< without them, the tool runs as the daemon does
+    bool noNewPrivileges = false;                              ///< as in ChildPlan
+    std::shared_ptr<const Confinement> confinement = nullptr;  ///< null: not confined
+    std::string refusal = {};                                  ///< why the tool must not be started, if so
 };
 
 struct ADMINHOST_EXPORT TaskResult {
