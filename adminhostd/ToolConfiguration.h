@@ -15,8 +15,8 @@ namespace adminhost {
 /// The variable that names the directory for the tools. Each plug-in's tools get a subdirectory of it.
 constexpr const char* toolConfigurationVariable = "XDG_CONFIG_HOME";
 
-/// A private directory below the given one, used in place of the account's: files of an account could change the output
-/// of tools. Removed with this object.
+/// A directory below the given one that only this process's account can write and list, used in place of an account's
+/// own: files of an account could change the output of tools. Removed with this object.
 class ToolConfiguration {
   public:
     /// Throws std::system_error if the directory cannot be created.
@@ -32,7 +32,8 @@ class ToolConfiguration {
     FileDescriptor _held;
 };
 
-/// Creates the directory and writes the files in it, replacing those of an earlier worker. Fails if a path is not below
+/// Creates the directory and writes the files in it, replacing those of an earlier worker. Every account can read them,
+/// because a tool may run as another account. Fails if a path is not below
 /// the directory, or cannot be written.
 [[nodiscard]] Result<void> writeToolFiles(const std::string& directory, const std::vector<ToolFile>& files);
 

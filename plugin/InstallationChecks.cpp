@@ -10,6 +10,7 @@
 #include "platform/text/IsoDate.h"
 #include "platform/value/ValueText.h"
 #include "resources/Property.h"
+#include "settings/DatabaseAccess.h"
 #include "settings/DatabaseTool.h"
 #include "settings/SettingsStore.h"
 
@@ -117,7 +118,24 @@ Diagnosis startFileCheck() {
     if (const auto problem = DatabaseTool().startFileProblem()) {
         return failed(name, problem->reason + '.', problem->fix);
     }
-    return ok(name, "The daemon's account has no .sqliterc.");
+    return ok(name, "The tool reads no .sqliterc of its account.");
+}
+
+Diagnosis databaseCheck() {
+    const std::string name = "database";
+    const HostPath database = SettingsStore::dbPath();
+    if (!SettingsStore::dbPathExists()) {
+        return warning(name, database.text() + " does not exist.", "start the service once, which creates it");
+    }
+    const auto access = DatabaseAccess::of(database);
+    if (!access) {
+        return failed(name, "The database tool does not run: " + access.error().reason + '.', access.error().fix);
+    }
+    const auto confinement = access->confine(adminhost::diskPath(HostPath("/usr/bin/sqlite3")));
+    return ok(name, fmt::format("{} exists. The database tool runs as the user id {}, {}.", database.text(),
+                                access->account() ? access->account()->user : ::geteuid(),
+                                confinement && *confinement ? "confined to the database's directory"
+                                                            : "not confined to the database's directory"));
 }
 
 Diagnosis directoryCheck(const std::string& name, const HostPath& path, const char* fix) {
@@ -284,10 +302,7 @@ std::vector<Diagnosis> installationChecks() {
                                        "start the service once, which creates it"));
     checks.push_back(keyFileCheck(shared.text()));
     checks.push_back(certificateCheck(SettingsStore::memberPreferences().value_or(Dictionary())));
-    const HostPath database = SettingsStore::dbPath();
-    checks.push_back(SettingsStore::dbPathExists() ? ok("database", database.text() + " exists.")
-                                                   : warning("database", database.text() + " does not exist.",
-                                                             "start the service once, which creates it"));
+    checks.push_back(databaseCheck());
     return checks;
 }
 

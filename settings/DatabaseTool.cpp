@@ -3,6 +3,8 @@
 #include "platform/files/Path.h"
 #include "platform/task/Task.h"
 #include "platform/task/TaskBounds.h"
+#include "platform/value/ValueText.h"
+#include "settings/DatabaseAccess.h"
 #include "settings/SettingsStore.h"
 
 #include <array>
@@ -10,9 +12,11 @@
 #include <chrono>
 #include <csignal>
 #include <cstring>
+#include <filesystem>
 #include <optional>
 #include <string_view>
-#include <vector>
+#include <system_error>
+#include <utility>
 
 #include <pwd.h>
 #include <unistd.h>
@@ -65,17 +69,48 @@ std::string firstLine(const std::string& text) {
 
 }  // namespace
 
-std::string DatabaseTool::homeOfAccount() {
+adminhost::TaskPlan databaseToolPlan(const adminhost::HostPath& database, std::vector<std::string> arguments) {
+    adminhost::TaskPlan plan{.tool = adminhost::diskPath(adminhost::HostPath(toolPath)),
+                             .arguments = std::move(arguments),
+                             .environment = adminhost::toolFileVariables(),
+                             .noNewPrivileges = true};
+    const auto access = DatabaseAccess::of(database);
+    if (!access) {
+        plan.refusal = "not started: " + access.error().reason + "; " + access.error().fix;
+        return plan;
+    }
+    plan.rights = access->account();
+    auto confinement = access->confine(plan.tool);
+    if (!confinement) {
+        plan.refusal =
+            "not started, because it cannot be confined: " + adminhost::textOf(confinement.error().description);
+        return plan;
+    }
+    plan.confinement = *std::move(confinement);
+    if (plan.confinement) {
+        // The tool can read neither the account database nor, in that directory, a start file.
+        plan.environment["HOME"] = "/";
+        if (std::string directory = access->directory(); !directory.empty()) {
+            plan.environment["SQLITE_TMPDIR"] = std::move(directory);  // the usual ones are not allowed
+        }
+    }
+    return plan;
+}
+
+std::string DatabaseTool::homeOf(uid_t account) {
     passwd entry{};
     passwd* found = nullptr;
     std::array<char, 16384> buffer{};
-    const int failure = ::getpwuid_r(::geteuid(), &entry, buffer.data(), buffer.size(), &found);
+    const int failure = ::getpwuid_r(account, &entry, buffer.data(), buffer.size(), &found);
     return failure == 0 && found != nullptr ? std::string(entry.pw_dir) : std::string();
 }
 
 Probe DatabaseTool::probe() {
     if (!SettingsStore::dbPathExists()) {
         return {};
+    }
+    if (const auto access = DatabaseAccess::of(SettingsStore::dbPath()); !access) {
+        return {Probe::State::unusable, access.error().reason, access.error().fix};
     }
     if (auto problem = startFileProblem()) {
         return *std::move(problem);
@@ -86,9 +121,22 @@ Probe DatabaseTool::probe() {
 }
 
 std::optional<Probe> DatabaseTool::startFileProblem() const {
-    const std::string startFile = _home + "/.sqliterc";
+    const auto access = DatabaseAccess::of(SettingsStore::dbPath());
+    if (!access) {
+        return std::nullopt;  // the tool does not run at all
+    }
+    const std::string home = _home ? *_home : homeOf(access->account() ? access->account()->user : ::geteuid());
+    const std::string startFile = home + "/.sqliterc";
     if (::access(startFile.c_str(), F_OK) != 0) {
         return std::nullopt;
+    }
+    const auto confinement = access->confine(adminhost::diskPath(adminhost::HostPath(toolPath)));
+    if (confinement && *confinement) {
+        std::error_code unknown;
+        const std::string place = std::filesystem::canonical(startFile, unknown).string();
+        if (!unknown && !place.starts_with(access->directory() + '/')) {
+            return std::nullopt;
+        }
     }
     return Probe{Probe::State::unusable, startFile + " can change what " + toolPath + " prints",
                  "remove the file, or move it away"};
@@ -96,11 +144,9 @@ std::optional<Probe> DatabaseTool::startFileProblem() const {
 
 Probe DatabaseTool::tryTool() const {
     const adminhost::HostPath tool(toolPath);
-    std::string output;
-    std::string error;
-    const std::int32_t status = adminhost::launch_task_with_input_and_environment(
-        adminhost::diskPath(tool), {"-line", ":memory:", statement}, std::nullopt, &output, &error,
-        adminhost::toolFileVariables());
+    adminhost::TaskGroup run;
+    const auto [status, output, error] =
+        run.collect(run.start(databaseToolPlan(SettingsStore::dbPath(), {"-line", ":memory:", statement})));
     if (status != 0 && isPassing(status, error)) {
         return {Probe::State::unknown,
                 status == diedBySignal + SIGKILL ? tool.text() + " was ended before it had finished" : firstLine(error),

@@ -1,34 +1,47 @@
 #pragma once
 
-// The check of the database tool: whether it prints rows in the form that this plug-in reads.
+// The database tool: how it is run, and the check whether it prints rows in the form that this plug-in reads.
 
+#include "platform/files/Path.h"
 #include "platform/framework/Plugin.h"
+#include "platform/task/TaskGroup.h"
 
 #include <optional>
 #include <string>
+#include <utility>
+#include <vector>
+
+#include <sys/types.h>
 
 namespace lumio {
 
+/// The plan of a run of the tool with the rights that it has on this database (DatabaseAccess.h). A run that is refused
+/// is a tool that is not started.
+[[nodiscard]] adminhost::TaskPlan databaseToolPlan(const adminhost::HostPath& database,
+                                                   std::vector<std::string> arguments);
+
 class DatabaseTool {
   public:
-    /// The home directory of the daemon's account, as the account database has it. The tool looks there for its start
-    /// file, whatever HOME says. Empty if the account is unknown.
-    [[nodiscard]] static std::string homeOfAccount();
+    /// The home directory of an account, as the account database has it. The tool looks there for its start file,
+    /// whatever HOME says. Empty if the account is unknown.
+    [[nodiscard]] static std::string homeOf(uid_t account);
 
-    explicit DatabaseTool(std::string home = homeOfAccount()) : _home(std::move(home)) {}
+    /// Tests give the home directory of every account.
+    explicit DatabaseTool(std::optional<std::string> home = std::nullopt) : _home(std::move(home)) {}
 
-    /// Unusable while the account has a start file of the tool: it can change the output of every run, also if it is
-    /// created later, so it is looked for each time. Otherwise the tool is tried once, with a statement whose output is
-    /// known. The result "usable" is kept; after any other result the tool is tried again. If there is no database
-    /// file, no command needs the tool, and it is not tried.
+    /// Unusable while the tool must not run on the database, or reads a start file of its account: that can change the
+    /// output of every run. Both are looked at each time. Otherwise the tool is tried once, with a statement whose
+    /// output is known. The result "usable" is kept; after any other result the tool is tried again. If there is no
+    /// database file, no command needs the tool, and it is not tried.
     [[nodiscard]] adminhost::Probe probe();
-    /// The start file of the tool that the account has; nullopt if there is none.
+    /// The start file that the tool reads in the home directory of its account; nullopt if there is none. A confined
+    /// tool can read none, unless it is in the database's directory.
     [[nodiscard]] std::optional<adminhost::Probe> startFileProblem() const;
     /// Tries the tool, whether or not there is a database file.
     [[nodiscard]] adminhost::Probe tryTool() const;
 
   private:
-    std::string _home;
+    std::optional<std::string> _home;
     bool _usable = false;
 };
 

@@ -1,6 +1,6 @@
 #include "settings/QueryRunner.h"
 
-#include "platform/task/Task.h"
+#include "settings/DatabaseTool.h"
 #include "settings/LineRows.h"
 #include "settings/SettingsStore.h"
 
@@ -29,11 +29,8 @@ bool beginsWithHyphen(const adminhost::HostPath& database) noexcept {
 }
 
 adminhost::TaskPlan planFor(const adminhost::HostPath& database, const std::string& statement) {
-    static const adminhost::HostPath tool("/usr/bin/sqlite3");
     const std::string file = adminhost::diskPath(database).text();
-    return {.tool = adminhost::diskPath(tool),
-            .arguments = {"-line", (file.starts_with('-') ? "./" : "") + file, statement},
-            .environment = adminhost::toolFileVariables()};
+    return databaseToolPlan(database, {"-line", (file.starts_with('-') ? "./" : "") + file, statement});
 }
 
 }  // namespace

@@ -18,8 +18,8 @@ namespace adminhost {
 /// Returns true if owner, group and mode let the account create files in the directory. Access lists do not count.
 [[nodiscard]] ADMINHOST_EXPORT bool mayCreateFiles(const ChildRights& account, const struct stat& directory) noexcept;
 
-/// Returns true if the owner is root, or certainly an account outside of this process's user namespace, over whose files
-/// its root has no power.
+/// Returns true if the owner is root, or certainly an account outside of this process's user namespace, over whose
+/// files its root has no power.
 [[nodiscard]] ADMINHOST_EXPORT bool isOfRoot(const struct stat& file) noexcept;
 /// The same, also if the owner is only possibly outside: the kernel shows all such owners as one user id, which can be
 /// that of an account inside too.

@@ -270,11 +270,12 @@ TEST_F(DatabaseNeed, MissingDatabaseRefusesNothing) {
 
 TEST_F(DatabaseNeed, StartFileInTheHomeDirectoryOfTheAccountIsNamedBeforeEachRequest) {
     ASSERT_EQ(namespaceProblem(), "");
-    // The account database of a mount namespace has another home directory for the account.
-    const std::string home = root.disk("/home-of-account");
+    // The account database of a mount namespace has another home directory for the account. It is the one directory in
+    // which a confined tool could read the file.
+    const std::string home = root.disk("/var/lumio/server/db");
     const std::string accounts = root.disk("/passwd");
     root.write("/passwd", "root:x:0:0::" + home + ":/bin/sh\n");
-    root.write("/home-of-account/.sqliterc", ".nullvalue NULL\n");
+    root.write("/var/lumio/server/db/.sqliterc", ".nullvalue NULL\n");
     const std::string command = "mount --bind '" + accounts + "' /etc/passwd && exec '" + BINARY_DIR +
                                 "/bin/adminhostd' --check --root '" + root.path() + "' --plugin '" + BINARY_DIR +
                                 "/lib/adminhost_lumio.so' --socket '" + root.directory() + "/socket'";

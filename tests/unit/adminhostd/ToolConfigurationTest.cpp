@@ -7,6 +7,7 @@
 #include <string>
 
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 namespace adminhost {
 namespace {
@@ -18,11 +19,16 @@ std::string contentOf(const fs::path& path) {
     return {std::istreambuf_iterator<char>(file), {}};
 }
 
-TEST(ToolConfiguration, DirectoryIsPrivateAndRemovedWithTheObject) {
+TEST(ToolConfiguration, OthersCanReadTheFilesAndWriteNothingUntilAllIsRemovedWithTheObject) {
     std::optional<ToolConfiguration> tools(std::in_place, fs::temp_directory_path().string());
     const fs::path directory = tools->directory();
-    EXPECT_EQ(fs::status(directory).permissions(), fs::perms::owner_all);
+    const mode_t before = ::umask(077);
     ASSERT_TRUE(writeToolFiles(directory / "plugin", {{"tool/rc", "text\n"}}));
+    ::umask(before);
+    for (const fs::path& part : {directory, directory / "plugin", directory / "plugin/tool"}) {
+        EXPECT_EQ(fs::status(part).permissions(), fs::perms(0711)) << part;
+    }
+    EXPECT_EQ(fs::status(directory / "plugin/tool/rc").permissions(), fs::perms(0644));
     tools.reset();
     EXPECT_FALSE(fs::exists(directory));
 }
@@ -34,7 +40,7 @@ TEST(ToolConfiguration, FilesOfAnEarlierWorkerAreReplaced) {
     ASSERT_TRUE(writeToolFiles(directory, {{"tool/rc", "short\n"}}));
     EXPECT_EQ(contentOf(directory / "tool/rc"), "short\n");
     EXPECT_EQ(contentOf(directory / "other"), "x");
-    EXPECT_EQ(fs::status(directory).permissions(), fs::perms::owner_all);
+    EXPECT_EQ(fs::status(directory).permissions(), fs::perms(0711));
 }
 
 TEST(ToolConfiguration, PathOutsideTheDirectoryIsAnError) {

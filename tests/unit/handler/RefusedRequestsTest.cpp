@@ -61,11 +61,13 @@ class RefusedRequests : public testing::Test {
 };
 
 TEST_F(RefusedRequests, DoubleQuoteInANameWouldRunTheDatabaseToolsFileFunctions) {
-    const std::string planted = root.path("/planted").string();
+    // The one directory that a confined tool can write.
+    constexpr std::string_view place = "/Library/SorvaneProducer/Shared/Server/planted";
+    const std::string planted = root.path(place).string();
     const Dictionary entry{{"_newid_", true}, {"name", "x\" or writefile('" + planted + "','rootshell') or \""}};
     EXPECT_EQ(refused("properties", entry), path("configuration.properties.0.name"));
     changeProperty(entry);
-    EXPECT_EQ(root.read("/planted"), "rootshell");
+    EXPECT_EQ(root.read(place), "rootshell");
 }
 
 TEST_F(RefusedRequests, DoubleQuoteInAValueWouldEndTheTextAndSetOtherColumns) {

@@ -56,9 +56,10 @@ TEST_F(ForgedRows, IdInANameIsNotTheCamerasId) {
 }
 
 TEST_F(ForgedRows, StatementInANameIsNotRun) {
-    nameHall("x|  id = 0' union select writefile('" + root.path("/written").string() + "','x');--");
+    nameHall("x|  id = 0' union select writefile('" +
+             root.path("/Library/SorvaneProducer/Shared/Server/written").string() + "','x');--");
     EXPECT_THAT(queries(), UnorderedElementsAre(accessListOf + std::string("'7'"), accessListOf + std::string("'8'")));
-    EXPECT_FALSE(std::filesystem::exists(root.path("/written")));
+    EXPECT_FALSE(std::filesystem::exists(root.path("/Library/SorvaneProducer/Shared/Server/written")));
 }
 
 TEST_F(ForgedRows, PaddedIdInANameIsNotTheCamerasId) {

@@ -1,3 +1,4 @@
+#include "platform/task/Confinement.h"
 #include "platform/task/Task.h"
 #include "settings/DatabaseTool.h"
 #include "settings/SettingsStore.h"
@@ -133,15 +134,31 @@ TEST_F(DatabaseToolTest, LackOfMemoryProcessesOrDescriptorsIsUnknown) {
     }
 }
 
-TEST_F(DatabaseToolTest, StartFileOfTheAccountIsLookedForEachTime) {
-    EXPECT_EQ(tool.probe().state, State::usable);
-    std::ofstream(home() + "/.sqliterc") << ".nullvalue NULL\n";
-    const Probe probe = tool.probe();
+TEST_F(DatabaseToolTest, StartFileThatTheToolCanReadIsLookedForEachTime) {
+    // In the database's directory, which the tool can read also when it is confined.
+    const std::string place = root.path("/Library/SorvaneProducer/Shared/Server").string();
+    DatabaseTool here{place};
+    EXPECT_EQ(here.probe().state, State::usable);
+    std::ofstream(place + "/.sqliterc") << ".nullvalue NULL\n";
+    const Probe probe = here.probe();
     EXPECT_EQ(probe.state, State::unusable);
-    EXPECT_EQ(probe.reason, home() + "/.sqliterc can change what /usr/bin/sqlite3 prints");
+    EXPECT_EQ(probe.reason, place + "/.sqliterc can change what /usr/bin/sqlite3 prints");
     EXPECT_EQ(probe.fix, "remove the file, or move it away");
-    std::filesystem::remove(home() + "/.sqliterc");
-    EXPECT_EQ(tool.probe().state, State::usable);
+    std::filesystem::remove(place + "/.sqliterc");
+    EXPECT_EQ(here.probe().state, State::usable);
+    std::ofstream(home() + "/elsewhere") << ".nullvalue NULL\n";
+    std::filesystem::create_symlink(place + "/.sqliterc", home() + "/.sqliterc");
+    std::filesystem::rename(home() + "/elsewhere", place + "/.sqliterc");
+    EXPECT_EQ(tool.probe().state, State::unusable) << "a link into that directory";
+}
+
+TEST_F(DatabaseToolTest, StartFileElsewhereMattersOnlyIfTheToolIsNotConfined) {
+    std::ofstream(home() + "/.sqliterc") << ".nullvalue NULL\n";
+    EXPECT_EQ(tool.probe().state, adminhost::Confinement::isAvailable() ? State::usable : State::unusable);
+    replaceTool("exec /usr/bin/sqlite3 \"$@\"\n");
+    const Probe probe = tool.probe();
+    EXPECT_EQ(probe.state, State::unusable) << "a script is not confined";
+    EXPECT_EQ(probe.reason, home() + "/.sqliterc can change what /usr/bin/sqlite3 prints");
 }
 
 TEST_F(DatabaseToolTest, HomeIsThatOfTheAccountDatabaseWhateverTheEnvironmentSays) {
@@ -150,7 +167,7 @@ TEST_F(DatabaseToolTest, HomeIsThatOfTheAccountDatabaseWhateverTheEnvironmentSay
     const char* before = std::getenv("HOME");
     const std::string kept = before == nullptr ? "" : before;
     ::setenv("HOME", home().c_str(), 1);
-    EXPECT_EQ(DatabaseTool::homeOfAccount(), entry->pw_dir);
+    EXPECT_EQ(DatabaseTool::homeOf(::geteuid()), entry->pw_dir);
     ::setenv("HOME", kept.c_str(), 1);
 }
 
