@@ -1,6 +1,7 @@
 // The daemon's own share of a request: against a bare echo over a Unix socket, through the worker, at start, in memory.
 // Compared programs are timed in turn in one run, so that disturbances on the machine affect both equally.
 
+#include "bench/HostClient.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Program.h"
 
@@ -22,20 +23,10 @@
 
 namespace {
 
+using namespace bench;
 using adminhost::test::DaemonProcess;
 using adminhost::test::residentKilobytesOf;
 using Clock = std::chrono::steady_clock;
-
-constexpr std::string_view overviewRequest = "GET /v1/ HTTP/1.1\r\nHost: localhost\r\n\r\n";
-constexpr std::string_view nothingRequest =
-    "POST /v1/fixture/nothing HTTP/1.1\r\nHost: localhost\r\nContent-Length: 2\r\n\r\n{}";
-
-sockaddr_un addressOf(const std::string& path) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    path.copy(address.sun_path, sizeof address.sun_path - 1);
-    return address;
-}
 
 /// A minimal client, so that the server is measured and not the client.
 class Client {
@@ -117,24 +108,6 @@ class EchoServer {
     std::string _path;
     pid_t _child = -1;
 };
-
-DaemonProcess::Options fixture() {
-    DaemonProcess::Options options;
-    options.arguments = {"--plugin", std::string(FIXTURE_PLUGINS) + "/fixture_good.so"};
-    return options;
-}
-
-double microsecondsOf(const auto& work) {
-    const auto start = Clock::now();
-    work();
-    return std::chrono::duration<double, std::micro>(Clock::now() - start).count();
-}
-
-double quantile(std::vector<double>& times, double share) {
-    const auto at = times.begin() + static_cast<std::ptrdiff_t>(share * static_cast<double>(times.size() - 1));
-    std::nth_element(times.begin(), at, times.end());
-    return *at;
-}
 
 /// The overview, with a connection of its own or on a kept one, against an echo of as many bytes.
 void overview(benchmark::State& state, bool kept) {
