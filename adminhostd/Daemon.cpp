@@ -67,6 +67,7 @@ class Daemon {
             }
             wait();
             _front.queue().run(_entries);
+            _front.events().run();
             if (_signalled || _monitor.closed()) {
                 stop();
             }
@@ -89,7 +90,7 @@ class Daemon {
         if (!flushLog()) {
             timeout = timeout < 0 ? logPause : std::min(timeout, logPause);
         }
-        for (const auto& due : {_front.queue().due(), _stopBy}) {
+        for (const auto& due : {_front.queue().due(), _front.events().due(), _stopBy}) {
             if (due) {
                 const auto left = std::chrono::ceil<std::chrono::milliseconds>(*due - Clock::now()).count();
                 const int bounded = static_cast<int>(std::clamp<std::int64_t>(left, 0, 60'000));
@@ -119,6 +120,7 @@ class Daemon {
         if (_server) {
             _server->quiesce();
         }
+        _front.events().stop();
         _front.queue().stop(runningBound);
         if (const auto due = _front.queue().due()) {
             // A write may run longer than the unit's time for a stop.

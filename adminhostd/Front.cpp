@@ -28,7 +28,9 @@ std::optional<Right> neededFor(const Target& target, const Command* command) {
         case Kind::history:
         case Kind::doctor:
         case Kind::logs:
+        case Kind::metrics:
             return Right::read;
+        case Kind::events:
         case Kind::unknown:
         case Kind::overview:
         case Kind::plugin:
@@ -174,7 +176,7 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target&
     if (target.kind == Kind::unknown) {
         return errorAnswer(404, "UNKNOWN_ADDRESS",
                            "Known addresses: /v1/, /v1/PLUGIN, /v1/PLUGIN/COMMAND, /v1/PLUGIN/history, /v1/directory, "
-                           "/v1/doctor, /v1/logs, /v1/logs/NAME, /v1/requests/ID.");
+                           "/v1/doctor, /v1/events, /v1/logs, /v1/logs/NAME, /v1/metrics, /v1/requests/ID.");
     }
     if (target.kind == Kind::plugin || target.kind == Kind::command || target.kind == Kind::history) {
         if (auto answer = missing(target)) {
@@ -228,6 +230,10 @@ std::variant<HttpAnswer, HttpServer::Serve> Front::head(Exchange& exchange) {
         record->plugin = target.plugin.substr(0, keptName);
         record->command = target.command.substr(0, keptName);
         record->close(answer->status, codeOf(*answer));
+        // Only names that exist: a client must not be able to fill the memory with others.
+        const bool known = !stranger && commandOf(target) != nullptr;
+        _metrics.requestEnded(known ? target.plugin : "", known ? target.command : "", answer->status, codeOf(*answer),
+                              record->milliseconds / 1000);
     }
     return std::move(*answer);
 }
@@ -262,6 +268,12 @@ void Front::serve(Exchange& exchange, const Target& target) {
             exchange.answer({200, record->describe(withReports), {}});
             return;
         }
+        case Target::Kind::events:
+            _events.serve(exchange, _permissions.isOwn(exchange.peer()));
+            return;
+        case Target::Kind::metrics:
+            exchange.answer(metrics());
+            return;
         case Target::Kind::overview:
         case Target::Kind::unknown:
             exchange.answer(overview());

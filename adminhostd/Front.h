@@ -3,9 +3,12 @@
 // The front: what each address serves, which clients are permitted, and the audit.
 
 #include "adminhostd/AccountNames.h"
+#include "adminhostd/EventClients.h"
 #include "adminhostd/FrontChecks.h"
 #include "adminhostd/Http.h"
+#include "adminhostd/Metrics.h"
 #include "adminhostd/OperationQueue.h"
+#include "adminhostd/OwnMemory.h"
 #include "adminhostd/Permissions.h"
 #include "adminhostd/RequestLog.h"
 #include "adminhostd/Target.h"
@@ -31,6 +34,8 @@ class Front {
     Front& operator=(const Front&) = delete;
 
     [[nodiscard]] OperationQueue& queue() noexcept { return _queue; }
+    /// The clients that wait for events.
+    [[nodiscard]] EventClients& events() noexcept { return _events; }
 
     /// Handles a request whose head has arrived. Returns the answer if it needs no body (not permitted, not found,
     /// malformed), else the function that serves it once its body is there: at once, or, for an operation, after it has
@@ -57,6 +62,7 @@ class Front {
     void serve(Exchange& exchange, const Target& target);
     HttpAnswer cancel(const Peer& peer, const RequestRecord& record);
     [[nodiscard]] HttpAnswer overview() const;
+    [[nodiscard]] HttpAnswer metrics() const;
     void operation(Exchange& exchange, const Target& target);
     /// Passes on a request that the worker serves without an operation of a plug-in.
     void query(Exchange& exchange, const Target& target);
@@ -68,12 +74,15 @@ class Front {
     /// The front's own checks, and those of the worker or the reason why it made none.
     [[nodiscard]] HttpAnswer doctorAnswer(const OperationQueue::Ending& ending) const;
     /// Sends an operation's answer and logs its end.
-    static void end(const Operation& operation, HttpAnswer answer, std::string_view code);
+    void end(const Operation& operation, HttpAnswer answer, std::string_view code);
 
     FrontChecks _checks;
     Permissions _permissions;
     AccountNames _names;
     RequestLog _log;
+    EventClients _events;
+    Metrics _metrics;
+    OwnMemory _memory;
     std::vector<protocol::RefusedPlugin> _refused;  ///< before they were offered to a worker
     std::optional<protocol::Hello> _hello;          ///< of the latest worker
     OperationQueue _queue;

@@ -5,9 +5,7 @@
 #include "adminhostd/RequestBody.h"
 #include "platform/text/Utf8.h"
 
-#include <charconv>
 #include <string>
-#include <system_error>
 #include <utility>
 
 #include <fmt/format.h>
@@ -22,14 +20,6 @@ constexpr auto logBound = std::chrono::seconds(10);
 /// Returns true for the checks of the installation. No plug-in serves them.
 bool isDoctor(const RequestRecord& record) {
     return record.plugin.empty() && record.command == "doctor";
-}
-
-/// The number in an argument of an address; 0 without the argument, nullopt if it is not a number.
-std::optional<std::uint64_t> numberIn(std::string_view argument) {
-    std::uint64_t number = 0;
-    const char* const end = argument.data() + argument.size();
-    const auto [rest, failure] = std::from_chars(argument.data(), end, number);
-    return argument.empty() || (failure == std::errc() && rest == end) ? std::optional(number) : std::nullopt;
 }
 
 BodyForm wantedForm(const Exchange& exchange) {
@@ -117,8 +107,8 @@ std::optional<protocol::ToWorker> Front::orderFor(const Exchange& exchange, cons
         case Target::Kind::doctor:
             return protocol::Diagnose{};
         case Target::Kind::logs: {
-            const auto inode = numberIn(exchange.argument("inode"));
-            const auto offset = numberIn(exchange.argument("offset"));
+            const auto inode = numberOf(exchange.argument("inode"));
+            const auto offset = numberOf(exchange.argument("offset"));
             if (!inode || !offset || !isUtf8(target.command)) {
                 return refuse("The log's name must be UTF-8, and \"inode\" and \"offset\" decimal numbers.");
             }
@@ -189,6 +179,7 @@ void Front::finished(const Operation& operation, OperationQueue::Ending ending) 
         code = codeOf(http);
     } else {
         auto& answer = std::get<protocol::Answer>(ending);
+        _metrics.workDone(answer.toolRuns, answer.directoryLookups, answer.residentBytes);
         http = answerFor(answer);
         if (http.status < 300 && !answer.revision.empty()) {
             http.headers.emplace_back("ETag", fmt::format("\"{}\"", answer.revision));
@@ -225,6 +216,10 @@ HttpAnswer Front::cancel(const Peer& peer, const RequestRecord& record) {
 void Front::end(const Operation& operation, HttpAnswer answer, std::string_view code) {
     RequestRecord& record = *operation.record;
     record.close(answer.status, code);
+    _metrics.requestEnded(record.plugin, record.command, answer.status, code, record.milliseconds / 1000);
+    if (!record.repeated || answer.status >= 300) {
+        _events.add(record);
+    }
     for (const auto& [name, count] :
          {std::pair("Adminhost-Changes", record.changes()), std::pair("Adminhost-Not-Done", record.notDone())}) {
         if (count > 0) {

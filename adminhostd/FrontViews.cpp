@@ -99,6 +99,20 @@ HttpAnswer Front::overview() const {
     return {200, std::move(text), {}};
 }
 
+HttpAnswer Front::metrics() const {
+    HttpAnswer answer;
+    answer.text = AnswerText{std::make_shared<const std::string>(_metrics.text(
+                                 {.waiting = _queue.waiting(),
+                                  .running = _queue.running() != nullptr,
+                                  .queueLimit = _queue.limit(),
+                                  .deadlineSeconds = std::chrono::duration<double>(_queue.deadline()).count(),
+                                  .eventClients = _events.waiting(),
+                                  .workerStarts = _queue.starts(),
+                                  .frontBytes = _memory.bytes()})),
+                             "text/plain; version=0.0.4; charset=utf-8"};
+    return answer;
+}
+
 HttpAnswer Front::doctorAnswer(const OperationQueue::Ending& ending) const {
     FrontChecks::Workers workers{_queue.workerPid(), _queue.workerProblem(), {}, refusedPlugins()};
     if (_hello) {

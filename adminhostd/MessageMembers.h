@@ -130,12 +130,12 @@ constexpr auto members<Diagnosis> = std::tuple(member("check.health", &Diagnosis
                                                member("check.fix", &Diagnosis::fix));
 /// Answer::bytes is not among them: it follows the dictionary in the frame.
 template <>
-constexpr auto members<Answer> = std::tuple(member("answer.outcome", &Answer::outcome),
-                                            member("answer.error", &Answer::error),
-                                            member("answer.message", &Answer::message),
-                                            member("answer.findings", &Answer::findings),
-                                            member("answer.checks", &Answer::checks),
-                                            member("answer.revision", &Answer::revision),
-                                            member("answer.form", &Answer::form));
+constexpr auto members<Answer> =
+    std::tuple(member("answer.outcome", &Answer::outcome), member("answer.error", &Answer::error),
+               member("answer.message", &Answer::message), member("answer.findings", &Answer::findings),
+               member("answer.checks", &Answer::checks), member("answer.revision", &Answer::revision),
+               member("answer.form", &Answer::form), member("answer.toolRuns", &Answer::toolRuns),
+               member("answer.directoryLookups", &Answer::directoryLookups),
+               member("answer.residentBytes", &Answer::residentBytes));
 
 }  // namespace adminhost::protocol

@@ -71,6 +71,10 @@ class OperationQueue {
     [[nodiscard]] bool cancel(const RequestRecord& request);
     [[nodiscard]] const Operation* running() const noexcept { return _running ? &*_running : nullptr; }
     [[nodiscard]] std::size_t waiting() const noexcept { return _waiting.size(); }
+    /// How many operations may wait.
+    [[nodiscard]] std::size_t limit() const noexcept { return _settings.limit; }
+    /// How many workers have been started.
+    [[nodiscard]] unsigned long starts() const noexcept { return _starts; }
     /// The longest time that an operation may run.
     [[nodiscard]] std::chrono::milliseconds deadline() const noexcept { return _settings.deadline; }
     [[nodiscard]] std::optional<pid_t> workerPid() const;

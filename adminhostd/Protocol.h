@@ -161,6 +161,10 @@ struct Answer {
     std::string revision;            ///< after the operation; empty: not asked for, or not known
     BodyForm form = BodyForm::json;  ///< of bytes: JSON also where a property list cannot carry the answer
     std::string bytes;               ///< the whole body; the front passes it on unread
+    // What the request took, for the metrics.
+    std::uint64_t toolRuns = 0;
+    std::uint64_t directoryLookups = 0;
+    std::uint64_t residentBytes = 0;  ///< of the worker; 0: not known
     bool operator==(const Answer&) const = default;
 };
 

@@ -103,6 +103,13 @@ bool prefersPropertyList(std::string_view accept) {
     return list > 0 && list >= (jsonIsNamed ? json : other);
 }
 
+std::optional<std::uint64_t> numberOf(std::string_view argument) {
+    std::uint64_t number = 0;
+    const char* const end = argument.data() + argument.size();
+    const auto [rest, failure] = std::from_chars(argument.data(), end, number);
+    return argument.empty() || (failure == std::errc() && rest == end) ? std::optional(number) : std::nullopt;
+}
+
 std::optional<std::chrono::seconds> deadlineOf(std::string_view requestDeadline) {
     constexpr std::uint64_t longest = 1'000'000;
     const std::string_view digits = trimmed(requestDeadline);

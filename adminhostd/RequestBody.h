@@ -6,6 +6,7 @@
 
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -37,6 +38,9 @@ struct BodyProblem {
 /// The revisions that an If-Match header lists; an empty list for "*". Returns nullopt if the header is malformed or
 /// empty.
 [[nodiscard]] std::optional<std::vector<std::string>> revisionsOf(std::string_view ifMatch);
+
+/// The number in an argument of an address; 0 if the argument is empty, nullopt if it is not a decimal number.
+[[nodiscard]] std::optional<std::uint64_t> numberOf(std::string_view argument);
 
 /// The time that a Request-Deadline header allows: a whole number of seconds, at least 1. Returns nullopt if it is
 /// malformed. A very long time is shortened, because no operation may run that long.

@@ -4,6 +4,7 @@
 #include "platform/value/ValueCodec.h"
 
 #include <algorithm>
+#include <set>
 #include <utility>
 
 #include <fmt/format.h>
@@ -99,6 +100,21 @@ void RequestRecord::close(unsigned answered, std::string_view code) {
     }
     logEvent(fmt::format("adminhostd: request {} {} by uid {} pid {}: {}{}{} in {:.1f} ms{}", id, name, peer.uid,
                          peer.pid, status, error.empty() ? "" : " ", error, milliseconds, reports));
+}
+
+std::map<std::string, std::vector<std::string>> RequestRecord::changedKeys(std::size_t maximum) const {
+    std::map<std::string, std::set<std::string>> keys;
+    for (const Value& change : _changes.kept) {
+        std::set<std::string>& section = keys[std::string(change.dictionary()->text("section"))];
+        if (section.size() < maximum) {
+            section.emplace(change.dictionary()->text("key"));
+        }
+    }
+    std::map<std::string, std::vector<std::string>> listed;
+    for (auto& [section, names] : keys) {
+        listed[section].assign(names.begin(), names.end());
+    }
+    return listed;
 }
 
 Dictionary RequestRecord::describe(bool withReports) const {

@@ -9,6 +9,7 @@
 #include <chrono>
 #include <cstddef>
 #include <deque>
+#include <map>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -49,6 +50,9 @@ struct RequestRecord {
 
     /// Completes the record with the status of the answer and the code of its error, and logs the end of the request.
     void close(unsigned answered, std::string_view code);
+
+    /// The names of the keys that the kept changes name, by section, at most so many of each.
+    [[nodiscard]] std::map<std::string, std::vector<std::string>> changedKeys(std::size_t maximum) const;
 
     /// The number of reports, including those that were not kept.
     [[nodiscard]] std::size_t changes() const noexcept { return _changes.reported; }

@@ -27,6 +27,12 @@ Target targetOf(std::string_view path) {
     if (path == "doctor") {
         return {Kind::doctor, {}, first};
     }
+    if (path == "events") {
+        return {Kind::events, {}, first};
+    }
+    if (path == "metrics") {
+        return {Kind::metrics, {}, first};
+    }
     if (first == "logs") {
         return {Kind::logs, {}, second};
     }

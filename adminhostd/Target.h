@@ -8,7 +8,7 @@
 namespace adminhost {
 
 struct Target {
-    enum class Kind { unknown, overview, plugin, command, request, directory, history, doctor, logs };
+    enum class Kind { unknown, overview, plugin, command, request, directory, history, doctor, logs, events, metrics };
     Kind kind = Kind::unknown;
     std::string plugin;
     std::string command;  ///< for a request its id, for a log its name

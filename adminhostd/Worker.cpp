@@ -5,6 +5,7 @@
 #include "adminhostd/KeptWrite.h"
 #include "adminhostd/LoadedPlugins.h"
 #include "adminhostd/Login.h"
+#include "adminhostd/OwnMemory.h"
 #include "adminhostd/PluginCall.h"
 #include "adminhostd/PluginLogs.h"
 #include "adminhostd/PluginTrial.h"
@@ -20,6 +21,7 @@
 #include "platform/log/Log.h"
 #include "platform/service/ServiceState.h"
 #include "platform/task/Task.h"
+#include "platform/task/TaskBounds.h"
 #include "platform/task/ToolRegister.h"
 #include "platform/value/ValueText.h"
 
@@ -87,6 +89,7 @@ class Worker {
     ForwardingSink _sink;
     FrameReader _reader;
     std::chrono::milliseconds _directoryTime{};  ///< for all directory work of a request
+    OwnMemory _memory;
     LoadedPlugins _plugins;
     FileDescriptor _toolConfiguration;  ///< open: the directory stays if the front is killed and another one starts
     bool _leftoversRemoved = false;
@@ -370,6 +373,8 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
         return std::nullopt;
     }
     protocol::Answer answered;
+    const std::uint64_t toolsBefore = startedTasks();
+    const std::uint64_t lookupsBefore = directoryLookups();
     try {
         answered = std::visit(
             [&]<class Order>(const Order& order) {
@@ -390,6 +395,9 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
     }
     setTaskDeadline(std::nullopt);
     setDeadline(std::nullopt);
+    answered.toolRuns = startedTasks() - toolsBefore;
+    answered.directoryLookups = directoryLookups() - lookupsBefore;
+    answered.residentBytes = _memory.bytes().value_or(0);
     const Frame frame = protocol::frameOf(std::move(answered));
     _returnMemory |= frame.bytes.size() >= largeMessage;
     const bool sent =

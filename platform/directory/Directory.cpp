@@ -25,6 +25,7 @@ class SearchNode : public DirectoryNode {
         std::vector<DirectoryRecord> all;
         DirectoryQuery rest = query;
         for (const auto& node : _nodes) {
+            noteDirectoryLookup();
             auto some = node->records(rest);
             if (!some) {
                 reportFailure(node->name(), some.error());
@@ -45,6 +46,7 @@ class SearchNode : public DirectoryNode {
                                                   const std::vector<std::string>& attributes) override {
         for (const auto& node : _nodes) {
             if (node->name() == person.node) {
+                noteDirectoryLookup();
                 return node->groupsOf(person, attributes);
             }
         }

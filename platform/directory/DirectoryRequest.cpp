@@ -27,6 +27,8 @@ std::optional<Request>& request() {
     return current;
 }
 
+std::uint64_t lookUps = 0;
+
 }  // namespace
 
 void beginDirectoryRequest(std::optional<std::chrono::milliseconds> budget) {
@@ -108,6 +110,14 @@ void dropFromRequest(const void* object) noexcept {
 
 bool inDirectoryRequest() noexcept {
     return request().has_value();
+}
+
+std::uint64_t directoryLookups() noexcept {
+    return lookUps;
+}
+
+void noteDirectoryLookup() noexcept {
+    ++lookUps;
 }
 
 }  // namespace adminhost

@@ -9,6 +9,7 @@
 #include "platform/value/Error.h"
 
 #include <chrono>
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
@@ -44,7 +45,13 @@ struct ADMINHOST_EXPORT UnreachableNode {
 [[nodiscard]] ADMINHOST_EXPORT std::vector<UnreachableNode> unreachableDirectoryNodes(
     std::chrono::milliseconds limit = std::chrono::seconds(5));
 
+/// How many look-ups this process has made in the nodes of the directory.
+[[nodiscard]] ADMINHOST_EXPORT std::uint64_t directoryLookups() noexcept;
+
 // For back ends.
+
+/// Counts a look-up.
+void noteDirectoryLookup() noexcept;
 
 /// When directory work must end: the end of the budget or the deadline of the request's tools, whichever comes first;
 /// the maximum for none.

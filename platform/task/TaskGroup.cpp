@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <array>
+#include <atomic>
 #include <cerrno>
 #include <csignal>
 #include <ctime>
@@ -22,6 +23,8 @@
 
 namespace adminhost {
 namespace {
+
+std::atomic<std::uint64_t> started = 0;
 
 using Clock = TaskGroup::Clock;
 
@@ -297,11 +300,16 @@ class TaskGroup::RunningTask {
     TaskResult _result;
 };
 
+std::uint64_t startedTasks() noexcept {
+    return started;
+}
+
 TaskGroup::TaskGroup() noexcept : _bound(taskOutputBound()) {}
 
 TaskGroup::~TaskGroup() = default;
 
 TaskGroup::Id TaskGroup::start(TaskPlan plan) {
+    ++started;
     _tasks.push_back(std::make_unique<RunningTask>(std::move(plan), _bound, _held));
     return _tasks.size() - 1;
 }

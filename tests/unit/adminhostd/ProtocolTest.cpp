@@ -88,7 +88,10 @@ Answer answer(Outcome outcome) {
                        {Diagnosis::Health::failure, "p", "", "fix"}},
             .revision = "r2",
             .form = BodyForm::propertyList,
-            .bytes = "<plist/>"};
+            .bytes = "<plist/>",
+            .toolRuns = 3,
+            .directoryLookups = 4,
+            .residentBytes = 5};
 }
 
 std::vector<ToFront> messagesToFront() {
