@@ -32,8 +32,9 @@ TEST(EventRing, EndOfARequestIsAnEvent) {
     const Dictionary text = ring.since(0, "", owner, false);
     EXPECT_EQ(text.get("last"), Value(1));
     EXPECT_EQ(text.get("missed"), Value(false));
-    ASSERT_EQ(eventsOf(text).size(), 1U);
-    const Dictionary& event = *eventsOf(text).front().dictionary();
+    const Array events = eventsOf(text);
+    ASSERT_EQ(events.size(), 1U);
+    const Dictionary& event = *events.front().dictionary();
     EXPECT_EQ(event.get("kind"), Value("requestEnded"));
     EXPECT_EQ(event.get("command"), Value("c"));
     EXPECT_EQ(event.get("status"), Value(200));
