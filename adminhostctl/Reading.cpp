@@ -148,8 +148,14 @@ void Reading::appendTable(std::string& text, const Array& rows, const std::strin
     std::vector<std::string> keys;
     std::vector<std::string> headings;
     const std::string element = path + "[].";
+    for (const std::string& key : indent == 0 ? _columns : std::vector<std::string>()) {
+        const DescribedKey* described = _description.answerKey(element + key);
+        keys.push_back(key);
+        headings.push_back(described == nullptr || described->column.empty() ? shown(key) : described->column);
+    }
+    const bool isChosen = !keys.empty();
     for (const DescribedKey& key : _description.answerKeys()) {
-        if (!key.column.empty() && key.path.starts_with(element) &&
+        if (!isChosen && !key.column.empty() && key.path.starts_with(element) &&
             key.path.find('.', element.size()) == std::string::npos) {
             keys.push_back(key.path.substr(element.size()));
             headings.push_back(key.column);

@@ -7,6 +7,8 @@
 
 #include <cstddef>
 #include <string>
+#include <utility>
+#include <vector>
 
 namespace adminhost::ctl {
 
@@ -14,7 +16,10 @@ namespace adminhost::ctl {
 /// according to their type.
 class Reading {
   public:
-    Reading(const Description& description, std::size_t width) noexcept : _description(description), _width(width) {}
+    /// With columns, which are keys of its elements, a list that is the whole value is shown with these columns instead
+    /// of those that the description names.
+    Reading(const Description& description, std::size_t width, std::vector<std::string> columns = {}) noexcept
+        : _description(description), _width(width), _columns(std::move(columns)) {}
 
     /// The text of the value at the path of the answer; "" is the whole answer. Ends in a line feed.
     [[nodiscard]] std::string text(const Value& value, const std::string& path = {}) const;
@@ -30,6 +35,7 @@ class Reading {
 
     const Description& _description;
     std::size_t _width;
+    std::vector<std::string> _columns;
 };
 
 /// "1.2 TB": decimal units.

@@ -5,6 +5,7 @@
 #include "adminhostctl/desired/State.h"
 #include "adminhostctl/desired/Writing.h"
 #include "adminhostctl/lumio/AccessVerb.h"
+#include "adminhostctl/lumio/Listing.h"
 #include "adminhostctl/lumio/People.h"
 #include "platform/text/Uuid.h"
 
@@ -121,12 +122,13 @@ Failure notFound(const ElementKind& kind, const std::string& name, const State& 
 ExitStatus listElements(const Context& context, const ElementKind& kind) {
     const CommandRef command = context.service.command(kind.listing);
     const Listing listing = listingOf(context, command, kind);
+    const Array chosen = chosenElements(context, kind, command.description, listing.elements);
     if (!context.options.names) {
-        writeValue(context, listing.elements, command.description, kind.section);
+        writeElements(context, kind, command.description, chosen);
         return reportUnread(context, listing);
     }
     const StateForm form(context.service.stateCommand("write").description);
-    const State state = stateOf(form, {{kind.section, listing.elements}});
+    const State state = stateOf(form, {{kind.section, chosen}});
     for (const Element& element : elementsOf(state, form.list(kind.section))) {
         const std::string name = nameForPeople(element);
         context.out << (name.empty() ? "" : shown(name) + '\n');
@@ -146,7 +148,7 @@ ExitStatus showElement(const Context& context, const ElementKind& kind, const st
     }
     for (const Value& listed : listing.elements) {
         if (listed.dictionary() != nullptr && listed.dictionary()->get(list.identity) == Value(element->identity)) {
-            writeValue(context, listed, command.description, std::string(kind.section) + "[]");
+            writeElement(context, kind, command.description, *listed.dictionary());
         }
     }
     return reportUnread(context, listing);

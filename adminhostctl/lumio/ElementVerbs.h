@@ -24,7 +24,7 @@ struct ElementKind {
 [[nodiscard]] Failure notFound(const ElementKind& kind, const std::string& name, const State& state,
                                const ListForm& list);
 
-/// Prints all elements, or with --names one name of each.
+/// Prints the elements that the options of lists leave (Listing.h), or with --names one name of each.
 [[nodiscard]] ExitStatus listElements(const Context& context, const ElementKind& kind);
 [[nodiscard]] ExitStatus showElement(const Context& context, const ElementKind& kind, const std::string& name);
 

@@ -5,6 +5,7 @@
 #include "adminhostctl/desired/Writing.h"
 #include "adminhostctl/lumio/AccessVerb.h"
 #include "adminhostctl/lumio/ElementVerbs.h"
+#include "adminhostctl/lumio/Listing.h"
 #include "adminhostctl/lumio/People.h"
 
 #include <algorithm>
@@ -120,12 +121,13 @@ ExitStatus cameraRemove(const Context& context, Words words) {
 
 constexpr std::array table = {
     Verb{"camera list",
+         "[--match GLOB] [--status STATUS] [--allowed NAME] [--restricted] [--sort COLUMN] [--columns LIST] [--wide] "
          "[--names]",
          "List the cameras and who may use them",
          0,
          0,
          &listVerb<camera>,
-         {{"camera list", "--format json camera list"}}},
+         {{"camera list", "camera list --status 'capturing*' --sort 'last used'"}}},
     Verb{"camera show",
          "NAME|UUID",
          "Show everything about a camera",
@@ -162,12 +164,12 @@ constexpr std::array table = {
          &cameraRemove,
          {{"camera remove Roof", "camera remove 0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1E01"}}},
     Verb{"workflow list",
-         "[--names]",
+         "[--match GLOB] [--allowed NAME] [--restricted] [--sort COLUMN] [--columns LIST] [--wide] [--names]",
          "List the workflows and who may use them",
          0,
          0,
          &listVerb<workflow>,
-         {{"workflow list", "workflow list --languages de"}}},
+         {{"workflow list", "workflow list --allowed anna --columns name,allowed --wide"}}},
     Verb{"workflow show",
          "NAME|UUID|PATH",
          "Show everything about a workflow",
@@ -204,12 +206,12 @@ constexpr std::array table = {
          &accessOf,
          {{"access anna", "access --group studio --revoke"}}},
     Verb{"property list",
-         "[--names]",
+         "[--match GLOB] [--sort COLUMN] [--columns LIST] [--wide] [--names]",
          "List the workflow properties",
          0,
          0,
          &listVerb<property>,
-         {{"property list", "--format json property list"}}},
+         {{"property list", "property list --match 'mail_*' --sort name"}}},
     Verb{"property set",
          "NAME [VALUE|@FILE|@-] [--protect|--no-protect]",
          "Add or change a property",
@@ -231,6 +233,13 @@ constexpr std::array options = {
                "The names are names of groups; with allow and deny, also: one group for all cameras or workflows that "
                "follow"},
     VerbOption{revokeOption, "", "Show the entries of the person or group itself, and remove them from all lists"},
+    VerbOption{matchOption, "GLOB", "Only those whose name matches the pattern, in any case"},
+    VerbOption{statusOption, "STATUS", "Only those with this status, which may be a pattern"},
+    VerbOption{allowedOption, "NAME", "Only those that this person or group may use"},
+    VerbOption{restrictedOption, "", "Only those that are restricted to their list"},
+    VerbOption{sortOption, "COLUMN", "In the order of this column"},
+    VerbOption{columnsOption, "LIST", "Show these columns, separated by commas"},
+    VerbOption{wideOption, "", "Show long lists in full, and do not fit the table to the terminal"},
     VerbOption{protectOption, "", "With property set: store the value encrypted"},
     VerbOption{noProtectOption, "", "With property set: store the value unencrypted", protectOption},
 };
