@@ -21,6 +21,7 @@ constexpr std::string_view knownKeys[] = {"plugins",
                                           "plugin_directory",
                                           "socket",
                                           "socket_group",
+                                          "account",
                                           "languages",
                                           "account_uuids",
                                           "service_manager",
@@ -44,6 +45,8 @@ void apply(const ConfigurationEntry& entry, Options& options) {
         options.socket = diskPath(HostPath(entry.text()));
     } else if (entry.key() == "socket_group") {
         options.socketGroup = entry.text();
+    } else if (entry.key() == "account") {
+        options.account = entry.name();
     } else if (entry.key() == "languages") {
         const std::vector<std::string> texts = entry.texts();
         options.languages = Array(texts.begin(), texts.end());

@@ -3,6 +3,7 @@
 #include "adminhostd/ClearedStack.h"
 #include "adminhostd/Front.h"
 #include "adminhostd/FrontChecks.h"
+#include "adminhostd/FrontRights.h"
 #include "adminhostd/FrontStart.h"
 #include "adminhostd/MonitorLink.h"
 #include "adminhostd/Notify.h"
@@ -44,15 +45,14 @@ FileDescriptor stopSignals() {
 
 class Daemon {
   public:
-    Daemon(const Options& options, const PluginSelection& plugins, const std::string& toolDirectory,
-           FileDescriptor link, FileDescriptor listener)
+    Daemon(const Options& options, const PluginSelection& plugins, const std::string& toolDirectory, FrontChecks checks,
+           Permissions permissions, FileDescriptor link, FileDescriptor listener)
         : _options(options),
           _monitor(std::move(link)),
           _listener(std::move(listener)),
           _signals(stopSignals()),
           _front({workerConfiguration(options, plugins, toolDirectory), _monitor, options.queueLimit, options.deadline},
-                 plugins.refused, FrontChecks(options),
-                 Permissions(options.permissions, ::geteuid(), configurationFile(options))) {}
+                 plugins.refused, std::move(checks), std::move(permissions)) {}
 
     void run() {
         for (;;) {
@@ -156,8 +156,14 @@ class Daemon {
 
 int runDaemon(const Options& options, FileDescriptor link, FileDescriptor listener, const std::string& toolDirectory) {
     setLogSink(options.logToStandardError ? standardErrorSink() : syslogSink());
+    const auto account = frontAccount(options);
     const PluginSelection plugins = selectPlugins(options);
-    Daemon(options, plugins, toolDirectory, std::move(link), std::move(listener)).run();
+    FrontChecks checks(options);
+    Permissions permissions(options.permissions, ::geteuid(), configurationFile(options));
+    dropFrontRights(account, options);
+    Daemon(options, plugins, toolDirectory, std::move(checks), std::move(permissions), std::move(link),
+           std::move(listener))
+        .run();
     for (const auto end = Clock::now() + logBound; !flushLog() && Clock::now() < end;) {
         std::this_thread::sleep_for(10ms);
     }

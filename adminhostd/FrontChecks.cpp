@@ -158,12 +158,12 @@ FrontChecks::FrontChecks(const Options& options)
 }
 
 Diagnosis FrontChecks::daemonCheck() const {
-    return {
-        Health::ok, "daemon",
-        fmt::format("Release " ADMINHOST_RELEASE ", process {}, as {}, since {:%Y-%m-%d %H:%M:%S} UTC{}.", ::getppid(),
-                    ownerText(::geteuid()), fmt::gmtime(std::chrono::system_clock::to_time_t(_started)),
-                    _root == "/" ? "" : ", below " + _root),
-        ""};
+    return {Health::ok, "daemon",
+            fmt::format(
+                "Release " ADMINHOST_RELEASE ", process {}, as {}{}, since {:%Y-%m-%d %H:%M:%S} UTC{}.", ::getppid(),
+                ownerText(_account), ::geteuid() == _account ? "" : ", its front as " + ownerText(::geteuid()),
+                fmt::gmtime(std::chrono::system_clock::to_time_t(_started)), _root == "/" ? "" : ", below " + _root),
+            ""};
 }
 
 Diagnosis FrontChecks::socketCheck() const {
@@ -191,6 +191,13 @@ Diagnosis FrontChecks::configurationCheck() const {
     const DiskPath file(_configuration.path);
     if (const auto problem = _configurationIsNamed ? openToEverybody(file) : distrust(file)) {
         return failureOf("configuration file", *problem);
+    }
+    if (::access(file.c_str(), R_OK) != 0 && errno == EACCES) {
+        return {Health::warning, "configuration file",
+                fmt::format("{} is in effect, but cannot be read by the front's account (uid {}): a change would take "
+                            "effect after a restart only.",
+                            file.text(), ::geteuid()),
+                fmt::format("chmod a+r {} and its directory; passwords are in files of their own", file.text())};
     }
     try {
         Options read;

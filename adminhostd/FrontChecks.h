@@ -19,6 +19,7 @@
 #include <sys/statvfs.h>
 #include <sys/timex.h>
 #include <sys/types.h>
+#include <unistd.h>
 
 namespace adminhost {
 
@@ -53,6 +54,7 @@ class FrontChecks {
     [[nodiscard]] Diagnosis configurationCheck() const;
 
     std::string _root;
+    uid_t _account = ::geteuid();  ///< of the daemon, before the front changes to another one
     Seen _socket;
     Seen _configuration;
     bool _configurationIsNamed;  ///< on the command line: other rules apply to who may write to it

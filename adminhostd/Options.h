@@ -21,6 +21,7 @@ struct Options {
     HostPath runDirectory{"/run/adminhostd"};
     std::optional<DiskPath> socket;  ///< instead of the one in the run directory
     std::string socketGroup;         ///< empty: the daemon's own
+    std::string account;             ///< of the front, if started as the superuser; empty: see frontAccount()
     std::optional<Array> languages;  ///< instead of those of the environment
     std::string accountUuids;        ///< host path of the accounts' UUIDs; empty: name-based ones
     std::string serviceManager;      ///< "systemd" or "pidfile"; empty: the platform's default

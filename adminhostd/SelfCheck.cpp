@@ -1,6 +1,7 @@
 #include "adminhostd/SelfCheck.h"
 
 #include "adminhostd/Frame.h"
+#include "adminhostd/FrontRights.h"
 #include "adminhostd/ListeningSocket.h"
 #include "adminhostd/PluginSelection.h"
 #include "adminhostd/RunDirectory.h"
@@ -89,6 +90,7 @@ int check(const Options& options) {
     }
     try {
         static_cast<void>(groupOf(options.socketGroup));
+        static_cast<void>(frontAccount(options));
     } catch (const std::exception& error) {
         problems.emplace_back(error.what());
     }

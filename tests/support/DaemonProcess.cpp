@@ -138,10 +138,16 @@ pid_t DaemonProcess::frontPid() const {
 }
 
 pid_t DaemonProcess::workerPid() const {
-    const std::string text = connect().get("/v1/").body;
     const std::string key = "\"workerPid\":";
-    const std::size_t at = text.find(key);
-    return at == std::string::npos ? -1 : std::stoi(text.substr(at + key.size()));
+    const auto end = std::chrono::steady_clock::now() + patience;
+    do {
+        const std::string text = connect().get("/v1/").body;
+        if (const std::size_t at = text.find(key); at != std::string::npos) {
+            return std::stoi(text.substr(at + key.size()));
+        }
+        std::this_thread::sleep_for(step);  // the monitor is starting it
+    } while (std::chrono::steady_clock::now() < end);
+    return -1;
 }
 
 std::string DaemonProcess::log() const {

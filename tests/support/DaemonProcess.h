@@ -42,7 +42,8 @@ class DaemonProcess {
     [[nodiscard]] const std::string& socket() const noexcept { return _socket; }
     [[nodiscard]] UnixHttp connect() const { return UnixHttp(socket()); }
 
-    /// The process id of the worker, as the daemon reports it.
+    /// The process id of the worker, as the daemon reports it. Waits for a worker that is being started, and returns -1
+    /// if there is none after ten seconds.
     [[nodiscard]] pid_t workerPid() const;
     /// Its output on standard error: the log.
     [[nodiscard]] std::string log() const;

@@ -2,6 +2,7 @@
 
 #include "adminhostd/PluginFile.h"
 #include "tests/support/Program.h"
+#include "tests/support/TemporaryRoot.h"
 #include "tests/system/host/Host.h"
 
 #include <csignal>
@@ -239,7 +240,7 @@ TEST_F(Start, PluginDirectoryMustBeTrustworthyAsAWhole) {
     std::ofstream(plugins / "notes.txt") << "no plug-in";
     ASSERT_EQ(::chmod((plugins / "good.so").c_str(), 0644), 0);
     ASSERT_EQ(::chmod(plugins.c_str(), 0755), 0);
-    const std::string file = configuration("plugin_directory = \"" + plugins.string() + "\"\n");
+    const std::string file = configuration("account = \"nobody\"\nplugin_directory = \"" + plugins.string() + "\"\n");
     const std::vector<std::string> command = {"--check", "--config", file, "--socket", directory / "socket"};
     const ProgramResult good = run(command);
     EXPECT_EQ(good.status, 0) << good.output;
@@ -274,8 +275,10 @@ TEST_F(Start, PluginThatEverybodyMayWriteIsRefused) {
 }
 
 TEST_F(Start, CheckReportsThatNothingIsWrongAndLeavesNothingBehind) {
-    const ProgramResult result =
-        run({"--check", "--plugin", pluginFile("fixture_good"), "--socket", directory / "socket"});
+    const TemporaryRoot other;
+    other.write("/adminhostd.toml", "account = \"nobody\"\n");
+    const ProgramResult result = run({"--check", "--config", other.path("/adminhostd.toml"), "--plugin",
+                                      pluginFile("fixture_good"), "--socket", directory / "socket"});
     EXPECT_EQ(result.status, 0) << result.output;
     EXPECT_EQ(result.output,
               "Nothing is wrong. Plug-ins: fixture 1.2.3. Socket: " + (directory / "socket").string() + "\n");
