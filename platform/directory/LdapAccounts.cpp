@@ -1,5 +1,6 @@
 #include "platform/directory/LdapAccounts.h"
 
+#include "platform/crypto/Crypt.h"
 #include "platform/directory/DirectoryRequest.h"
 #include "platform/directory/LdapFilter.h"
 #include "platform/directory/LdapQuery.h"
@@ -64,7 +65,9 @@ Result<bool> LdapAccounts::signIn(std::string_view name, std::string_view passwo
     if (!dn) {
         return failure(dn.error());
     }
-    auto opened = _lookUps->signIn({*std::move(dn), std::string(password)});
+    LdapSignIn signIn{*std::move(dn), std::string(password)};
+    const ScopedCleanse wipePassword(signIn.password);
+    auto opened = _lookUps->signIn(signIn);
     if (!opened) {
         return failure(opened.error());
     }

@@ -12,6 +12,7 @@
 #include "platform/value/Result.h"
 
 #include <chrono>
+#include <cstddef>
 #include <functional>
 #include <map>
 #include <memory>
@@ -52,12 +53,13 @@ class LdapConnection {
     using Clock = std::chrono::steady_clock;
 
     /// Tries the servers in order, until the end, and binds: as the user if there is one, else as the settings state.
-    /// A server that refuses to bind is the last one tried. With a sign-in, a server to which the password would go in
-    /// clear text is refused (code 13) before anything is sent to it.
+    /// A server that refuses to bind is the last one tried; one that refuses TLS is not. With a sign-in, a server to
+    /// which the password would go in clear text is refused (code 13) before anything is sent to it.
     [[nodiscard]] static Result<std::unique_ptr<LdapConnection>> open(const LdapNodeSettings& settings,
                                                                       KerberosCredential& credential,
                                                                       const LdapSignIn* signIn, Clock::time_point end);
 
+    /// More than the bounds (LdapSearchBounds.h), and pages without an end, are failures.
     [[nodiscard]] Result<void> search(const LdapSearch& search, const LdapEntrySink& sink);
     /// Two searches that are not paged, sent at once. The sinks receive all entries.
     [[nodiscard]] Result<void> searchBoth(const LdapSearch& first, const LdapEntrySink& firstSink,
@@ -70,6 +72,12 @@ class LdapConnection {
     [[nodiscard]] Result<void> setPassword(const std::string& dn, std::string_view password);
 
   private:
+    /// What a search has brought so far.
+    struct Collected {
+        std::size_t entries = 0;
+        std::size_t bytes = 0;
+    };
+
     LdapConnection(const LdapNodeSettings& settings, std::string uri) : _settings(settings), _uri(std::move(uri)) {}
 
     [[nodiscard]] Result<void> connect();
@@ -93,7 +101,8 @@ class LdapConnection {
     [[nodiscard]] Result<int> send(const LdapSearch& search, const std::string& cookie);
     /// Receives the entries of one search or page; the cookie of the next page, empty after the last. Nullopt if the
     /// sink ended it.
-    [[nodiscard]] Result<std::optional<std::string>> collect(int id, const LdapEntrySink& sink);
+    [[nodiscard]] Result<std::optional<std::string>> collect(int id, const LdapEntrySink& sink, Collected& collected);
+    [[nodiscard]] tl::unexpected<Error> tooMuch() const;
     [[nodiscard]] LdapEntry entryOf(LDAPMessage* message);
 
     LdapNodeSettings _settings;

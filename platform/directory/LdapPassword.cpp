@@ -1,9 +1,11 @@
 #include "platform/directory/LdapPassword.h"
 
+#include "platform/crypto/Crypt.h"
 #include "platform/files/FileDescriptor.h"
 
 #include <cerrno>
 #include <cstring>
+#include <string_view>
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -45,23 +47,23 @@ Result<std::string> ldapBindPassword(const LdapNodeSettings& settings) {
     if (isFile && (status.st_mode & 077U) != 0) {
         return failure(unusable(shown, "group or others have access; set its mode to 0600"));
     }
-    std::string password(maximumSize + 1, '\0');
-    const ssize_t size = ::read(file.get(), password.data(), password.size());
+    std::string read(maximumSize + 1, '\0');
+    const ScopedCleanse wipeRead(read);
+    const ssize_t size = ::read(file.get(), read.data(), read.size());
     if (size < 0) {
         return failure(unusable(shown, std::strerror(errno)));
     }
-    password.resize(static_cast<std::size_t>(size));
-    if (password.ends_with('\n')) {
-        password.pop_back();
-    }
-    if (password.ends_with('\r')) {
-        password.pop_back();
+    std::string_view password = std::string_view(read).substr(0, static_cast<std::size_t>(size));
+    for (const char end : {'\n', '\r'}) {
+        if (password.ends_with(end)) {
+            password.remove_suffix(1);
+        }
     }
     if (password.empty() || password.size() > maximumSize - 2) {
         return failure(
             unusable(shown, password.empty() ? "the file is empty" : "the file is too large for a password"));
     }
-    return password;
+    return std::string(password);
 }
 
 }  // namespace adminhost

@@ -9,7 +9,8 @@
 
 namespace adminhost {
 
-/// Fails if the file cannot be read, is accessible to group or others, or holds no password.
+/// The caller wipes it after use. Fails if the file cannot be read, is accessible to group or others, or holds no
+/// password.
 [[nodiscard]] Result<std::string> ldapBindPassword(const LdapNodeSettings& settings);
 
 }  // namespace adminhost

@@ -1,15 +1,23 @@
 // Checks that freed memory holds no key and no plain text. The program has its own new and delete for that, which read
 // whole blocks, written or not. So it is not part of the unit programs, which also run below valgrind.
 
+#include "platform/directory/Directory.h"
+#include "platform/directory/LdapNode.h"
 #include "tests/unit/resources/PropertyFixture.h"
 
 #include <algorithm>
+#include <array>
 #include <atomic>
 #include <cstdlib>
+#include <filesystem>
 #include <new>
 #include <string_view>
+#include <thread>
 
 #include <malloc.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
 
 namespace {
 
@@ -113,6 +121,57 @@ TEST_F(CleansedMemory, PlainTextThatCannotBeStoredIsNotLeftBehind) {
     const std::string quoted = std::string(plainText) + '"';
     ASSERT_EQ(insert({{"name", "n"}, {"value", quoted}, {"protect", true}}), std::nullopt);
     EXPECT_EQ(seenWhile([&] { EXPECT_TRUE(change({{"_id_", "1"}, {"protect", false}})); }), 0);
+}
+
+TEST_F(CleansedMemory, SigningInToADirectoryServerLeavesNoPasswordBehind) {
+    constexpr std::string_view administrator = "cn=admin,dc=nimbo,dc=test";
+    adminhost::LdapNodeSettings settings;
+    settings.name = "/LDAP";
+    settings.base = "dc=nimbo,dc=test";
+    settings.uris = {"ldap://127.0.0.1:1"};
+    // In clear text, so that it is refused.
+    EXPECT_EQ(seenWhile([&] {
+                  EXPECT_FALSE(adminhost::ldapNode(settings).open().value()->authenticate(administrator, plainText));
+              }),
+              0);
+}
+
+TEST_F(CleansedMemory, PasswordFileOfADirectoryServerIsNotLeftBehind) {
+    // A server that accepts the connection and ends it when the password arrives.
+    const int listening = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_in address{};
+    address.sin_family = AF_INET;
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t length = sizeof address;
+    ASSERT_EQ(::bind(listening, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    ASSERT_EQ(::listen(listening, 1), 0);
+    ASSERT_EQ(::getsockname(listening, reinterpret_cast<sockaddr*>(&address), &length), 0);
+    bool isSent = false;
+    std::thread server([&] {
+        const int client = ::accept(listening, nullptr, nullptr);
+        std::array<char, 4096> received{};
+        const ssize_t size = ::read(client, received.data(), received.size());
+        isSent =
+            std::string_view(received.data(), static_cast<std::size_t>(std::max<ssize_t>(size, 0))).find(plainText) !=
+            std::string_view::npos;
+        ::close(client);
+    });
+    root.write("/password", plainText);
+    std::filesystem::permissions(root.path("/password"), std::filesystem::perms(0600));
+    adminhost::LdapNodeSettings settings;
+    settings.name = "/LDAP";
+    settings.base = "dc=nimbo,dc=test";
+    settings.uris = {"ldap://127.0.0.1:" + std::to_string(ntohs(address.sin_port))};
+    settings.bindDn = "cn=reader,dc=nimbo,dc=test";
+    settings.bindPasswordFile = adminhost::HostPath("/password");
+    adminhost::DirectoryQuery query;
+    query.recordTypes = {std::string(adminhost::directory::users)};
+    query.attribute = adminhost::directory::recordName;
+    query.values = {"anna"};
+    EXPECT_EQ(seenWhile([&] { EXPECT_FALSE(adminhost::ldapNode(settings).open().value()->records(query)); }), 0);
+    server.join();
+    ::close(listening);
+    EXPECT_TRUE(isSent);
 }
 
 }  // namespace

@@ -348,6 +348,32 @@ TEST_F(LdapConnections, ServersAreTriedInOrder) {
     EXPECT_THAT(found(settings), ElementsAre("anna"));
 }
 
+TEST_F(LdapConnections, ServerThatRefusesTlsIsPassedOver) {
+    const TestAuthority authority;
+    support::Slapd::Options options;
+    options.certificates = authority.issue("IP:127.0.0.1", std::chrono::hours(24));
+    support::Slapd secure(options);
+    secure.add(people());
+    const support::Slapd withoutTls;
+    LdapNodeSettings settings = settingsFor(secure);
+    settings.caFile = HostPath(authority.file().string());
+    settings.startTls = true;
+    settings.uris = {withoutTls.uri(), secure.uri()};
+    EXPECT_THAT(found(settings), ElementsAre("anna"));
+}
+
+TEST_F(LdapConnections, ServerThatRefusesToBindIsTheLastOneTried) {
+    support::Slapd first;
+    first.add(people());
+    support::Slapd second;
+    second.add(people());
+    LdapNodeSettings settings = settingsFor(first);
+    settings.uris = {first.uri(), second.uri()};
+    settings.bindDn = "uid=writer,ou=people,dc=nimbo,dc=test";
+    settings.bindPasswordFile = file("wrong");
+    EXPECT_THAT(errorOf(ask(ldapNode(settings), anna())).description.value_or(""), StartsWith(first.uri()));
+}
+
 TEST_F(LdapConnections, ServerThatIsDownIsAnErrorAtOnce) {
     LdapNodeSettings settings;
     settings.name = "/LDAP";

@@ -1,5 +1,6 @@
 // Servers that behave as OpenLDAP's does not: long lists in parts, limits that are ignored, refusals.
 
+#include "platform/directory/LdapSearchBounds.h"
 #include "tests/integration/ldap/ScriptedServer.h"
 #include "tests/integration/ldap/TestDirectory.h"
 
@@ -110,6 +111,67 @@ TEST(OddLdapServers, MoreEntriesThanRequestedAreCutOff) {
     EXPECT_THAT(namesOf(ask(source, query)), ElementsAre("user1000", "user1001", "user1002"));
     query.maximum = 1;
     EXPECT_THAT(namesOf(ask(source, query)), ElementsAre("user1000")) << "the rest of the last one does not come back";
+}
+
+DirectoryQuery usersBeginningWith(std::string_view text) {
+    DirectoryQuery query = oneType(directory::users, text);
+    query.match = DirectoryQuery::Match::beginsWith;
+    return query;
+}
+
+TEST(OddLdapServers, PagesThatAllHaveOneCookieAreReadToTheLast) {
+    int pages = 0;
+    const ScriptedServer server([&](const ScriptedServer::Search&) {
+        const std::string name = "user" + std::to_string(++pages);
+        return Reply{{{"CN=" + name, {{"sAMAccountName", {name}}}}}, LDAP_SUCCESS, pages < 3 ? "the cookie" : ""};
+    });
+    EXPECT_THAT(namesOf(ask(ldapNode(settingsFor(server.uri())), usersBeginningWith("user"))),
+                ElementsAre("user1", "user2", "user3"));
+}
+
+TEST(OddLdapServers, EmptyPageThatComesAgainIsAnError) {
+    int pages = 0;
+    const ScriptedServer server([&](const ScriptedServer::Search&) {
+        // Ends after all, so that the test does.
+        return Reply{{}, LDAP_SUCCESS, ++pages < 100 ? "the cookie" : ""};
+    });
+    const Error error = errorOf(ask(ldapNode(settingsFor(server.uri())), usersBeginningWith("user")));
+    EXPECT_THAT(error.description.value_or(""), HasSubstr("the server sends the same empty page again"));
+    EXPECT_EQ(pages, 2);
+}
+
+/// The bounds of this program's searches while a test runs.
+struct ScopedSearchBounds {
+    explicit ScopedSearchBounds(const LdapSearchBounds& bounds) { setLdapSearchBounds(bounds); }
+    ScopedSearchBounds(const ScopedSearchBounds&) = delete;
+    ScopedSearchBounds& operator=(const ScopedSearchBounds&) = delete;
+    ~ScopedSearchBounds() { setLdapSearchBounds({}); }
+};
+
+TEST(OddLdapServers, MoreEntriesThanTheBoundInAllPagesTogetherAreAnError) {
+    int pages = 0;
+    const ScriptedServer server([&](const ScriptedServer::Search&) {
+        const std::string name = "user" + std::to_string(++pages);
+        return Reply{{{"CN=" + name, {{"sAMAccountName", {name}}}}}, LDAP_SUCCESS, pages < 5 ? name : ""};
+    });
+    const DirectoryNodeSource source = ldapNode(settingsFor(server.uri()));
+    {
+        const ScopedSearchBounds bounds({.entries = 4});
+        EXPECT_THAT(errorOf(ask(source, usersBeginningWith("user"))).description.value_or(""),
+                    HasSubstr("the server sends more than 4 entries or"));
+    }
+    pages = 0;
+    const ScopedSearchBounds bounds({.entries = 5});
+    EXPECT_EQ(namesOf(ask(source, usersBeginningWith("user"))).size(), 5U);
+}
+
+TEST(OddLdapServers, MoreBytesThanTheBoundAreAnError) {
+    const ScriptedServer server([&](const ScriptedServer::Search&) {
+        return Reply{{{"CN=anna", {{"sAMAccountName", {"anna"}}, {"displayName", {std::string(1000, 'a')}}}}}};
+    });
+    const ScopedSearchBounds bounds({.entries = 10, .bytes = 1000});
+    EXPECT_THAT(errorOf(ask(ldapNode(settingsFor(server.uri())), usersBeginningWith("anna"))).description.value_or(""),
+                HasSubstr("or 1000 bytes"));
 }
 
 TEST(OddLdapServers, UuidsAreLookedUpTwoHundredAtATimeEachOnce) {

@@ -6,6 +6,7 @@
 #include <atomic>
 #include <functional>
 #include <map>
+#include <optional>
 #include <string>
 #include <thread>
 #include <vector>
@@ -32,6 +33,7 @@ class ScriptedServer {
     struct Reply {
         std::vector<Entry> entries;
         int code = LDAP_SUCCESS;
+        std::optional<std::string> cookie = std::nullopt;  ///< of the next page
     };
 
     explicit ScriptedServer(std::function<Reply(const Search&)> reply) : _reply(std::move(reply)) {
@@ -97,13 +99,30 @@ class ScriptedServer {
                 sendEntry(buffer, id, entry);
             }
             send(buffer, [&](BerElement* ber) {
-                ::ber_printf(ber, "{it{ess}}", id, LDAP_RES_SEARCH_RESULT, reply.code, "", "");
+                ::ber_printf(ber, "{it{essN}", id, LDAP_RES_SEARCH_RESULT, reply.code, "", "");
+                if (reply.cookie) {
+                    const std::string page = pageOf(*reply.cookie);
+                    ::ber_printf(ber, "t{{so}N}", LDAP_TAG_CONTROLS, LDAP_CONTROL_PAGEDRESULTS, page.data(),
+                                 page.size());
+                }
+                ::ber_printf(ber, "N}");
             });
         } else if (operation != LDAP_REQ_ABANDON) {
             goesOn = false;
         }
         ::ber_free(request, 1);
         return goesOn;
+    }
+
+    /// The value of the control for pages, without an estimate of the number of entries.
+    static std::string pageOf(const std::string& cookie) {
+        BerElement* ber = ::ber_alloc_t(LBER_USE_DER);
+        berval value{};
+        ::ber_printf(ber, "{io}", 0, cookie.data(), cookie.size());
+        ::ber_flatten2(ber, &value, 0);
+        std::string text(value.bv_val, value.bv_len);
+        ::ber_free(ber, 1);
+        return text;
     }
 
     static Search searchIn(BerElement* request) {
