@@ -1,11 +1,13 @@
 // Preloaded into test programs that run below valgrind: calls for starting a child that valgrind 3.19 does not support.
 // - pidfd_open(2): returns a descriptor that becomes readable when the child has exited, and does not reap the child.
+//   waitid(2) accepts it.
 // - execve(2) that fails with E2BIG. Valgrind checks the program's file itself, and ends the child when the call fails
 //   for another reason.
 // - execve(2) of /proc/self/exe, which is valgrind's own program. Valgrind shows the program under test as the link's
 //   target.
 
 #include <array>
+#include <atomic>
 #include <cerrno>
 #include <cstdarg>
 #include <cstring>
@@ -19,6 +21,9 @@
 #include <unistd.h>
 
 namespace {
+
+/// The children of the descriptors that were returned in place of the kernel's; 0 for other descriptors.
+std::array<std::atomic<pid_t>, 1024> children;
 
 int readableAfterExitOf(pid_t child) noexcept {
     std::array<int, 2> pipe{};
@@ -37,6 +42,9 @@ int readableAfterExitOf(pid_t child) noexcept {
         ::close(pipe[1]);
         errno = failure.code().value();
         return -1;
+    }
+    if (static_cast<std::size_t>(pipe[0]) < children.size()) {
+        children[static_cast<std::size_t>(pipe[0])] = child;
     }
     return pipe[0];
 }
@@ -72,6 +80,15 @@ bool hasTooLongArgument(char* const* argv) noexcept {
 }
 
 }  // namespace
+
+extern "C" int waitid(idtype_t kind, id_t id, siginfo_t* info, int options) {
+    if (kind == P_PIDFD && id < children.size() && children[id] != 0) {
+        kind = P_PID;
+        id = static_cast<id_t>(children[id]);
+    }
+    static const auto real = reinterpret_cast<decltype(&waitid)>(::dlsym(RTLD_NEXT, "waitid"));
+    return real(kind, id, info, options);
+}
 
 extern "C" long syscall(long number, ...) noexcept {
     std::array<long, 6> arguments{};
