@@ -4,9 +4,11 @@
 usage: include_edges.py [ROOT]   (the project's root: by default the directory above this script's)
 """
 
-import pathlib
 import re
 import sys
+
+sys.dont_write_bytecode = True
+import tree_check  # noqa: E402
 
 SOURCES = {".cpp", ".h"}
 INCLUDE = re.compile(r'^\s*#\s*include\s*"([^"]+)"')
@@ -65,12 +67,4 @@ def check(root):
                     yield f"{name}:{number}: {match[1]}: {why}"
 
 
-def main():
-    root = pathlib.Path(sys.argv[1]) if len(sys.argv) > 1 else pathlib.Path(__file__).resolve().parent.parent
-    findings = list(check(root))
-    for finding in findings:
-        print(finding)
-    sys.exit(1 if findings else 0)
-
-
-main()
+tree_check.run(check)

@@ -13,10 +13,12 @@ Some words of the plug-in are not its own and are permitted: plain words that th
 and uses in its source.
 """
 
-import pathlib
 import re
 import sys
 import tomllib
+
+sys.dont_write_bytecode = True
+import tree_check  # noqa: E402
 
 HOST = ["adminhostd", "platform", "adminhostctl"]
 # The verbs of this one service, and the program that joins them.
@@ -107,12 +109,4 @@ def findings(root):
                     yield f"{name}:{number}: names \"{word}\", which only the plug-in knows"
 
 
-def main():
-    root = pathlib.Path(sys.argv[1]) if len(sys.argv) > 1 else pathlib.Path(__file__).resolve().parent.parent
-    found = list(findings(root))
-    for finding in found:
-        print(finding)
-    sys.exit(1 if found else 0)
-
-
-main()
+tree_check.run(findings)

@@ -8,9 +8,11 @@ count: they are named after the outer one (Probe::State).
 """
 
 import collections
-import pathlib
 import re
 import sys
+
+sys.dont_write_bytecode = True
+import tree_check  # noqa: E402
 
 PLUGIN = ["plugin", "handler", "resources", "settings", "codec", "krb5", "commands"]
 # The worker loads the plug-in, so both are one program.
@@ -38,12 +40,8 @@ def twins(root, rooms):
                 yield f"{', '.join(sorted(places))}: {what} of the same name {name}"
 
 
-def main():
-    root = pathlib.Path(sys.argv[1]) if len(sys.argv) > 1 else pathlib.Path(__file__).resolve().parent.parent
-    findings = sorted({finding for rooms in PROGRAMS.values() for finding in twins(root, rooms)})
-    for finding in findings:
-        print(finding)
-    sys.exit(1 if findings else 0)
+def findings(root):
+    return sorted({finding for rooms in PROGRAMS.values() for finding in twins(root, rooms)})
 
 
-main()
+tree_check.run(findings)

@@ -1,5 +1,7 @@
 #include "tests/support/AvahiNamespace.h"
 
+#include "tests/support/RunAgain.h"
+
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
@@ -53,19 +55,9 @@ void endChild(pid_t child) {
 }  // namespace
 
 void enterAvahiNamespace(int argc, char** argv) {
-    if (std::getenv(daemonVariable) != nullptr) {
-        return;
+    if (std::getenv(daemonVariable) == nullptr) {
+        runAgainBelow("with-avahi", argc, argv);
     }
-    std::string script = SOURCE_DIR "/tests/support/with-avahi";
-    char self[4096] = "";
-    if (::readlink("/proc/self/exe", self, sizeof self - 1) < 0) {
-        std::abort();
-    }
-    std::vector<char*> command = {script.data(), self};
-    command.insert(command.end(), argv + 1, argv + argc);
-    command.push_back(nullptr);
-    ::execv(script.c_str(), command.data());
-    std::abort();
 }
 
 PublishedService::PublishedService(const std::string& name, const std::string& type) {

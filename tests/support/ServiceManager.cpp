@@ -1,6 +1,7 @@
 #include "tests/support/ServiceManager.h"
 
 #include "tests/support/Program.h"
+#include "tests/support/RunAgain.h"
 
 #include <cstdlib>
 #include <fstream>
@@ -46,19 +47,9 @@ void systemctl(std::vector<std::string> words) {
 }  // namespace
 
 void enterServiceManager(int argc, char** argv) {
-    if (std::getenv(kindVariable) != nullptr) {
-        return;
+    if (std::getenv(kindVariable) == nullptr) {
+        runAgainBelow("with-systemd", argc, argv);
     }
-    std::string script = SOURCE_DIR "/tests/support/with-systemd";
-    char self[4096] = "";
-    if (::readlink("/proc/self/exe", self, sizeof self - 1) < 0) {
-        std::abort();
-    }
-    std::vector<char*> command = {script.data(), self};
-    command.insert(command.end(), argv + 1, argv + argc);
-    command.push_back(nullptr);
-    ::execv(script.c_str(), command.data());
-    std::abort();
 }
 
 bool isRealServiceManager() {

@@ -31,9 +31,9 @@ void collect(const Value& value, const std::string& path, Seen& seen) {
 }
 
 /// Returns true if a value of this type fits the type in an answer's description.
-bool fits(Value::Type type, const std::string& described) {
+bool fits(Value::Type type, std::string_view described) {
     using T = Value::Type;
-    static const std::map<std::string, std::set<T>> types{
+    static const std::map<std::string_view, std::set<T>> types{
         {"any", {T::null, T::boolean, T::integer, T::real, T::string, T::date, T::data, T::array, T::dictionary}},
         {"scalar", {T::boolean, T::integer, T::real, T::string, T::date}},
         {"text", {T::string}},
@@ -63,11 +63,6 @@ class DescribedAnswers : public testing::Test {
         EXPECT_TRUE(value) << reply.body;
         return value ? *value : Value();
     }
-    [[nodiscard]] static std::string textAt(const Value& value, std::string_view key) {
-        const Dictionary* dictionary = value.dictionary();
-        const std::string* text = dictionary == nullptr ? nullptr : dictionary->get(key).string();
-        return text == nullptr ? std::string() : *text;
-    }
     [[nodiscard]] Value answerOf(const std::string& command, const std::string& request) const {
         return valueOf(daemon.connect().post("/v1/lumio/" + command, request));
     }
@@ -86,8 +81,8 @@ TEST_F(DescribedAnswers, EveryReadingCommandAnswersWithTheKeysAndTypesOfItsDescr
     ASSERT_EQ(daemon.connect().post("/v1/lumio/startService").status, 204);
     int compared = 0;
     for (const Value& command : *commands) {
-        const std::string name = textAt(command, "name");
-        if (textAt(command, "access") != "read") {
+        const std::string name(command.dictionary()->text("name"));
+        if (command.dictionary()->text("access") != "read") {
             continue;
         }
         SCOPED_TRACE(name);
@@ -96,14 +91,14 @@ TEST_F(DescribedAnswers, EveryReadingCommandAnswersWithTheKeysAndTypesOfItsDescr
         collect(answerOf(name, "{}"), "", seen);
         collect(answerOf(name, jsonOf(command.dictionary()->at("example.request"))), "", seen);
         for (const Value& key : *command.dictionary()->get("answer").array()) {
-            const std::string path = textAt(key, "path");
+            const std::string path(key.dictionary()->text("path"));
             const auto found = seen.find(path);
             if (found == seen.end()) {
                 ADD_FAILURE() << "the sample's answer does not have " << path;
                 continue;
             }
             for (const Value::Type type : found->second) {
-                EXPECT_TRUE(fits(type, textAt(key, "type"))) << path << " is a " << nameOf(type);
+                EXPECT_TRUE(fits(type, key.dictionary()->text("type"))) << path << " is a " << nameOf(type);
             }
             seen.erase(found);
         }

@@ -20,8 +20,8 @@ TEST_F(Answers, OverviewNamesPluginsCommandsAndTheQueue) {
     EXPECT_EQ(reply.headers.at("content-type"), "application/json");
     const Dictionary body = dictionaryOf(reply);
     const Dictionary& plugin = *body.get("plugins").array()->front().dictionary();
-    EXPECT_EQ(textAt(plugin, "name"), "fixture");
-    EXPECT_EQ(textAt(plugin, "version"), "1.2.3");
+    EXPECT_EQ(plugin.text("name"), "fixture");
+    EXPECT_EQ(plugin.text("version"), "1.2.3");
     EXPECT_EQ(plugin.get("commands").array()->front(), Value("echo"));
     EXPECT_EQ(body.get("waiting"), Value(0));
     EXPECT_FALSE(body.contains("running"));
@@ -316,9 +316,9 @@ TEST_F(Answers, RequestIsRememberedWithDurationResultAndLogLines) {
     const HttpReply reply = client.post("/v1/fixture/log", R"({"lines": ["one", "two %s\twith tab", ""]})");
     ASSERT_EQ(reply.status, 204);
     const Dictionary record = dictionaryOf(client.get("/v1/requests/" + reply.headers.at("request-id")));
-    EXPECT_EQ(textAt(record, "command"), "log");
-    EXPECT_EQ(textAt(record, "plugin"), "fixture");
-    EXPECT_EQ(textAt(record, "state"), "done");
+    EXPECT_EQ(record.text("command"), "log");
+    EXPECT_EQ(record.text("plugin"), "fixture");
+    EXPECT_EQ(record.text("state"), "done");
     EXPECT_EQ(record.get("status"), Value(204));
     EXPECT_EQ(record.get("uid"), Value(::getuid()));
     EXPECT_GT(record.get("milliseconds").real().value_or(0), 0);
@@ -327,7 +327,7 @@ TEST_F(Answers, RequestIsRememberedWithDurationResultAndLogLines) {
 
     const HttpReply refused = client.post("/v1/fixture/fly", "{}");
     const Dictionary other = dictionaryOf(client.get("/v1/requests/" + refused.headers.at("request-id")));
-    EXPECT_EQ(textAt(other, "error"), "UNKNOWN_COMMAND");
+    EXPECT_EQ(other.text("error"), "UNKNOWN_COMMAND");
     EXPECT_EQ(other.get("status"), Value(404));
 }
 
@@ -381,8 +381,7 @@ TEST_F(Answers, StandardOutputOfAnOperationDisturbsNothing) {
 }
 
 TEST_F(Answers, ToolsFindAPrivateDirectoryWithTheFilesThatThePluginGives) {
-    const std::string text =
-        textAt(dictionaryOf(client.post("/v1/fixture/environment", R"({"files": true})")), "output");
+    const std::string text(dictionaryOf(client.post("/v1/fixture/environment", R"({"files": true})")).text("output"));
     const std::size_t at = text.find("XDG_CONFIG_HOME=");
     ASSERT_NE(at, std::string::npos) << text;
     const std::filesystem::path directory = text.substr(at + 16, text.find('\n', at) - at - 16);
@@ -404,7 +403,7 @@ TEST(ToolEnvironment, HasNeitherThePrivateDirectoryNorTheDaemonsCredentials) {
                            "LDAPURI=ldap://a",
                            "XDG_CONFIG_HOME=/the-account"};
     const DaemonProcess daemon(options);
-    const std::string text = textAt(dictionaryOf(daemon.connect().post("/v1/fixture/environment")), "output");
+    const std::string text(dictionaryOf(daemon.connect().post("/v1/fixture/environment")).text("output"));
     EXPECT_NE(text.find("XDG_CONFIG_HOME=/the-account\n"), std::string::npos) << text;
     for (const char* name : {"CREDENTIALS_DIRECTORY", "LISTEN_", "KRB5CCNAME", "KRB5_CLIENT_KTNAME", "LDAP"}) {
         EXPECT_EQ(text.find(name), std::string::npos) << text;

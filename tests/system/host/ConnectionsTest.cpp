@@ -69,7 +69,7 @@ TEST(Connections, OneAccountCannotHoldAllOfThem) {
         UnixHttp last(daemon.socket());
         const HttpReply reply = last.reply();
         EXPECT_EQ(reply.status, 503);
-        EXPECT_EQ(textAt(dictionaryOf(reply), "error"), "TOO_MANY_CONNECTIONS");
+        EXPECT_EQ(dictionaryOf(reply).text("error"), "TOO_MANY_CONNECTIONS");
         return;
     }
     ASSERT_EQ(::chmod(daemon.directory().c_str(), 0755), 0);

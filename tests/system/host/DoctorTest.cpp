@@ -44,34 +44,34 @@ TEST_F(Doctor, EveryCheckHasItsFourKeysAndAStateOfThree) {
     EXPECT_GT(all.size(), 8U);
     for (const Value& one : all) {
         const Dictionary& check = *one.dictionary();
-        EXPECT_EQ(check.size(), 4U) << textAt(check, "name");
-        EXPECT_THAT(textAt(check, "state"), ::testing::AnyOf("ok", "warning", "failure"));
-        EXPECT_NE(textAt(check, "found"), "");
+        EXPECT_EQ(check.size(), 4U) << check.text("name");
+        EXPECT_THAT(check.text("state"), ::testing::AnyOf("ok", "warning", "failure"));
+        EXPECT_NE(check.text("found"), "");
         EXPECT_NE(check.get("fix").string(), nullptr);
     }
 }
 
 TEST_F(Doctor, PlugInsOwnChecksHaveItsNameBeforeTheirs) {
     const Dictionary found = check("fixture/sample");
-    EXPECT_EQ(textAt(found, "state"), "warning");
-    EXPECT_EQ(textAt(found, "found"), "The sample is old.");
-    EXPECT_EQ(textAt(found, "fix"), "renew it");
+    EXPECT_EQ(found.text("state"), "warning");
+    EXPECT_EQ(found.text("found"), "The sample is old.");
+    EXPECT_EQ(found.text("fix"), "renew it");
 }
 
 TEST_F(Doctor, PlugInThatThrowsIsAFailureAndTheOtherChecksAreThere) {
     makePlugin("throw");
     const Dictionary found = check("fixture");
-    EXPECT_EQ(textAt(found, "state"), "failure");
-    EXPECT_THAT(textAt(found, "found"), HasSubstr("cannot diagnose"));
-    EXPECT_EQ(textAt(check("worker"), "state"), "ok");
+    EXPECT_EQ(found.text("state"), "failure");
+    EXPECT_THAT(found.text("found"), HasSubstr("cannot diagnose"));
+    EXPECT_EQ(check("worker").text("state"), "ok");
 }
 
 TEST_F(Doctor, WorkerThatDiesLeavesTheFrontsChecks) {
     makePlugin("crash");
     const Dictionary found = check("checks of the worker");
-    EXPECT_EQ(textAt(found, "state"), "failure");
-    EXPECT_THAT(textAt(found, "found"), HasSubstr("was killed by signal 11"));
-    EXPECT_EQ(textAt(check("socket"), "state"), "ok");
+    EXPECT_EQ(found.text("state"), "failure");
+    EXPECT_THAT(found.text("found"), HasSubstr("was killed by signal 11"));
+    EXPECT_EQ(check("socket").text("state"), "ok");
 }
 
 TEST_F(Doctor, SocketThatWasReplacedIsAFailure) {
@@ -83,9 +83,9 @@ TEST_F(Doctor, SocketThatWasReplacedIsAFailure) {
 }
 
 TEST_F(Doctor, DaemonAndWorkerAreNamedWithTheirProcesses) {
-    EXPECT_THAT(textAt(check("daemon"), "found"), HasSubstr("process " + std::to_string(daemon.pid())));
-    EXPECT_THAT(textAt(check("daemon"), "found"), HasSubstr("Release " ADMINHOST_RELEASE));
-    EXPECT_THAT(textAt(check("worker"), "found"), HasSubstr(std::to_string(daemon.workerPid())));
+    EXPECT_THAT(check("daemon").text("found"), HasSubstr("process " + std::to_string(daemon.pid())));
+    EXPECT_THAT(check("daemon").text("found"), HasSubstr("Release " ADMINHOST_RELEASE));
+    EXPECT_THAT(check("worker").text("found"), HasSubstr(std::to_string(daemon.workerPid())));
 }
 
 TEST_F(Doctor, FrontAnswersWhileAnotherOperationHangs) {
@@ -93,7 +93,7 @@ TEST_F(Doctor, FrontAnswersWhileAnotherOperationHangs) {
     const auto before = std::chrono::steady_clock::now();
     const Dictionary found = check("checks of the worker");
     EXPECT_LT(std::chrono::steady_clock::now() - before, std::chrono::seconds(38));
-    EXPECT_THAT(textAt(found, "found"), HasSubstr("The worker is busy with another request."));
+    EXPECT_THAT(found.text("found"), HasSubstr("The worker is busy with another request."));
     ::kill(daemon.workerPid(), SIGKILL);
 }
 

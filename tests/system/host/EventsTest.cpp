@@ -95,7 +95,7 @@ TEST_F(Events, StopAnswersThoseThatWaitAtOnce) {
 
 TEST_F(Events, NumbersOfAnotherStartAreMissedEvents) {
     EXPECT_EQ(client.post("/v1/fixture/echo", "{}").status, 200);
-    const std::string epoch = textAt(dictionaryOf(client.get("/v1/events")), "epoch");
+    const std::string epoch(dictionaryOf(client.get("/v1/events")).text("epoch"));
     for (const std::string& address : {after(7), after(1) + "&epoch=other", after(0) + "&epoch=other"}) {
         const HttpReply reply = client.get(address);
         EXPECT_EQ(dictionaryOf(reply).get("missed"), Value(true)) << address;

@@ -4,10 +4,10 @@
 
 #include "platform/json/Json.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Eventually.h"
 
 #include <chrono>
 #include <filesystem>
-#include <functional>
 #include <string>
 #include <thread>
 #include <vector>
@@ -30,30 +30,14 @@ inline Dictionary dictionaryOf(const HttpReply& reply) {
     return value && value->dictionary() != nullptr ? *value->dictionary() : Dictionary();
 }
 
-inline std::string textAt(const Dictionary& dictionary, std::string_view key) {
-    const std::string* text = dictionary.get(key).string();
-    return text == nullptr ? "(no text)" : *text;
-}
-
 /// An error answer: its code and a message, in the two keys.
 inline void expectError(const HttpReply& reply, int status, std::string_view code) {
     EXPECT_EQ(reply.status, status) << reply.body;
     const Dictionary body = dictionaryOf(reply);
-    EXPECT_EQ(textAt(body, "error"), code);
-    EXPECT_FALSE(textAt(body, "message").empty());
+    EXPECT_EQ(body.text("error"), code);
+    EXPECT_FALSE(body.text("message").empty());
     EXPECT_EQ(body.size(), body.contains("findings") || body.contains("state") ? 3U : 2U);
     EXPECT_TRUE(reply.headers.contains("request-id"));
-}
-
-/// Returns true if the condition becomes true within ten seconds.
-inline bool eventually(const std::function<bool()>& condition) {
-    for (int i = 0; i < 2000; ++i) {
-        if (condition()) {
-            return true;
-        }
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    return false;
 }
 
 /// A client whose write has begun. It ends when the file "go" exists in the directory, and writes the text to "data".

@@ -46,12 +46,12 @@ TEST_F(Logs, ListHasNamesAndSizes) {
     ASSERT_NE(list, nullptr);
     ASSERT_EQ(list->size(), 2U);
     const Dictionary& first = *(*list)[0].dictionary();
-    EXPECT_EQ(textAt(first, "name"), "log");
-    EXPECT_EQ(textAt(first, "plugin"), "fixture");
-    EXPECT_EQ(textAt(first, "path"), "/var/log/fixture/fixture.log");
+    EXPECT_EQ(first.text("name"), "log");
+    EXPECT_EQ(first.text("plugin"), "fixture");
+    EXPECT_EQ(first.text("path"), "/var/log/fixture/fixture.log");
     EXPECT_EQ(first.get("size"), Value(8));
     const Dictionary& second = *(*list)[1].dictionary();
-    EXPECT_EQ(textAt(second, "name"), "other");
+    EXPECT_EQ(second.text("name"), "other");
     EXPECT_FALSE(second.contains("size")) << "it does not exist";
     EXPECT_FALSE(second.contains("problem"));
 }

@@ -51,7 +51,7 @@ TEST_F(Processes, FrontThatIsKilledIsReplacedAndItsWorkerFinishesItsWriteFirst) 
     // The socket stays: a client that connects meanwhile waits for the next front.
     const Dictionary waiting = overview();
     EXPECT_NE(_daemon.frontPid(), front);
-    EXPECT_THAT(textAt(waiting, "workerProblem"),
+    EXPECT_THAT(waiting.text("workerProblem"),
                 HasSubstr("(process " + std::to_string(worker) + ") is finishing its request"));
     EXPECT_FALSE(waiting.contains("workerPid"));
     const HttpReply refused = _daemon.connect().post("/v1/fixture/nothing");
@@ -116,7 +116,7 @@ TEST_F(Processes, StopOfTheMonitorWaitsForTheWriteAlsoIfTheFrontHasDied) {
     const UnixHttp lost = startHeldWrite(_daemon, _daemon.directory(), "written");
     const pid_t worker = _daemon.workerPid();
     ::kill(_daemon.frontPid(), SIGKILL);
-    ASSERT_THAT(textAt(overview(), "workerProblem"), HasSubstr("is finishing"));
+    ASSERT_THAT(overview().text("workerProblem"), HasSubstr("is finishing"));
     _daemon.signal(SIGTERM);
     EXPECT_EQ(_daemon.wait(std::chrono::milliseconds(100)), std::nullopt);
     go();

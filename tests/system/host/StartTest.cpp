@@ -446,8 +446,8 @@ TEST_F(Start, WhatTheParentLeftOpenReachesNoTool) {
     const Dictionary answer =
         dictionaryOf(daemon.connect().post("/v1/fixture/run", "{\"script\": \"" + listing + "\"}"));
     const std::string pipe = fs::read_symlink("/proc/self/fd/" + std::to_string(ends[0]));
-    EXPECT_EQ(textAt(answer, "output").find(pipe + "\n"), std::string::npos) << textAt(answer, "output");
-    EXPECT_NE(textAt(answer, "output").find("/dev/null\n"), std::string::npos) << textAt(answer, "output");
+    EXPECT_EQ(answer.text("output").find(pipe + "\n"), std::string::npos) << answer.text("output");
+    EXPECT_NE(answer.text("output").find("/dev/null\n"), std::string::npos) << answer.text("output");
     ::close(ends[0]);
 }
 

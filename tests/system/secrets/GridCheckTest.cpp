@@ -2,6 +2,7 @@
 // password must not be. The stand-in for the grid tool asks the KDC for a ticket with the cache that it is given.
 
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Eventually.h"
 #include "tests/support/Kdc.h"
 #include "tests/support/SampleRoot.h"
 #include "tests/system/secrets/Searches.h"
@@ -10,11 +11,9 @@
 #include <chrono>
 #include <csignal>
 #include <filesystem>
-#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
-#include <thread>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -42,17 +41,6 @@ support::Kdc& realm() {
         return started;
     }();
     return *kdc;
-}
-
-bool eventually(const std::function<bool()>& condition) {
-    const auto end = std::chrono::steady_clock::now() + patience;
-    while (std::chrono::steady_clock::now() < end) {
-        if (condition()) {
-            return true;
-        }
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    return false;
 }
 
 class GridCheck : public testing::Test {
@@ -148,7 +136,7 @@ TEST_F(GridCheck, TicketsOfAKilledWorkerAreRemovedWhenTheNextOneStarts) {
     const pid_t worker = daemon->workerPid();
     ASSERT_EQ(::kill(worker, SIGKILL), 0);
     EXPECT_EQ(client.reply().status, 500);
-    EXPECT_TRUE(eventually([&] { return !fs::exists(root.disk(cacheFile)); }));
+    EXPECT_TRUE(eventually([&] { return !fs::exists(root.disk(cacheFile)); }, patience));
     root.clearSwitches();
     root.write("/etc/demo/nimbo.service", "nimbo/grid1.example.org");
     EXPECT_THAT(post("getState", details).body, HasSubstr("kNimboAvailable"));

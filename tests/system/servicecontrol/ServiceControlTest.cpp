@@ -3,12 +3,12 @@
 
 #include "platform/json/Json.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Eventually.h"
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 #include "tests/support/ServiceManager.h"
 
 #include <filesystem>
-#include <functional>
 #include <optional>
 #include <string>
 
@@ -25,16 +25,6 @@ using testing::HasSubstr;
 constexpr const char* unit = "com.brenn.lumioserverd.service";
 constexpr const char* serviceUnit = "lumioserverd.service";
 constexpr const char* daemonUnit = "adminhostd.service";
-
-bool eventually(const std::function<bool()>& condition) {
-    for (int i = 0; i < 1000; ++i) {
-        if (condition()) {
-            return true;
-        }
-        ::usleep(10'000);
-    }
-    return false;
-}
 
 class ServiceControl : public testing::Test {
   protected:

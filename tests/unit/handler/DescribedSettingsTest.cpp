@@ -18,23 +18,18 @@ using Keys = std::set<std::string>;
 
 constexpr std::string_view prefix = "configuration.";
 
-std::string textAt(const Value& value, std::string_view key) {
-    const std::string* text = value.dictionary()->get(key).string();
-    return text == nullptr ? std::string() : *text;
-}
-
 /// The described keys directly below the configuration, each with the file that its description names.
 std::map<std::string, std::string> described(std::string_view command, std::string_view part) {
     std::map<std::string, std::string> keys;
     const Value all = describeCommands();
     for (const Value& one : *all.array()) {
-        if (textAt(one, "name") != command) {
+        if (one.dictionary()->text("name") != command) {
             continue;
         }
         for (const Value& key : *one.dictionary()->get(part).array()) {
-            const std::string path = textAt(key, "path");
+            const std::string path(key.dictionary()->text("path"));
             if (path.starts_with(prefix) && path.find_first_of(".[", prefix.size()) == std::string::npos) {
-                keys[path.substr(prefix.size())] = textAt(key, "file");
+                keys[path.substr(prefix.size())] = key.dictionary()->text("file");
             }
         }
     }

@@ -4,7 +4,6 @@
 #include "tests/support/TemporaryRoot.h"
 
 #include <algorithm>
-#include <regex>
 #include <set>
 #include <string>
 
@@ -19,6 +18,7 @@ using adminhost::Error;
 using adminhost::Value;
 using testing::ElementsAre;
 using testing::IsEmpty;
+using testing::MatchesRegex;
 using testing::Not;
 
 namespace directory = adminhost::directory;
@@ -146,7 +146,7 @@ TEST_F(GridAccount, SignInThatFailsWithoutAnErrorHasItsOwnMessage) {
 TEST_F(GridAccount, ServerWithoutUuidGetsANewNameEachTimeAndThatIsLoggedAfterTheSignIn) {
     root.writePropertyList(libraryFile, "<key>library_version</key><string>2</string>");
     const std::string first{create().text("username")};
-    ASSERT_TRUE(std::regex_match(first, std::regex("sorvanenimbo_[0-9A-F]{8}(-[0-9A-F]{4}){3}-[0-9A-F]{12}"))) << first;
+    ASSERT_THAT(first, MatchesRegex("sorvanenimbo_[0-9A-F]{8}(-[0-9A-F]{4}){3}-[0-9A-F]{12}"));
     EXPECT_THAT(log.lines, ElementsAre("adminhost_lumio: Sorvane Producer using uuid '" + first.substr(13) +
                                        "' because the server_uuid could not be determined."));
     EXPECT_NE(create().text("username"), first);
