@@ -187,7 +187,7 @@ TEST_F(AccountRights, FrontHasAnAccountOfItsOwnAndNoRightAndTheOthersHaveTheDaem
     const Status worker = statusOf(daemon.workerPid());
     const Dictionary answer =
         dictionaryOf(daemon.connect().post("/v1/fixture/run", R"({"script": "cat /proc/self/status"})"));
-    const Status tool = statusIn(std::istringstream(textAt(answer, "output")));
+    const Status tool = statusIn(std::istringstream(std::string(answer.text("output"))));
     print("monitor", monitor);
     print("front", front);
     print("worker", worker);
