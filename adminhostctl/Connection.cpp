@@ -2,12 +2,15 @@
 
 #include "adminhostctl/Interrupt.h"
 
+#include <algorithm>
 #include <cerrno>
+#include <cstdlib>
 #include <cstring>
 #include <memory>
 #include <utility>
 
 #include <curl/curl.h>
+#include <fmt/format.h>
 
 namespace adminhost::ctl {
 namespace {
@@ -61,25 +64,40 @@ Connection::~Connection() = default;
 Connection::Connection(Connection&&) noexcept = default;
 Connection& Connection::operator=(Connection&&) noexcept = default;
 
-DaemonReply Connection::get(const std::string& path) {
-    return send(path, nullptr, {});
+struct Connection::Exchange {
+    const std::string& path;
+    std::chrono::milliseconds timeout;
+    const char* method = nullptr;  ///< null: GET, or POST with a body
+    const std::string* body = nullptr;
+    PostHeaders headers{};
+};
+
+DaemonReply Connection::get(const std::string& path, std::chrono::milliseconds timeout) {
+    return send({path, timeout});
 }
-DaemonReply Connection::post(const std::string& path, const std::string& body, const PostHeaders& headers) {
-    return send(path, &body, headers);
+DaemonReply Connection::remove(const std::string& path, std::chrono::milliseconds timeout) {
+    return send({path, timeout, "DELETE"});
+}
+DaemonReply Connection::post(const std::string& path, const std::string& body, std::chrono::milliseconds timeout,
+                             const PostHeaders& headers) {
+    return send({path, timeout, nullptr, &body, headers});
 }
 
-DaemonReply Connection::send(const std::string& path, const std::string* body, const PostHeaders& extra) {
+DaemonReply Connection::send(const Exchange& exchange) {
+    const std::string* const body = exchange.body;
+    const PostHeaders& extra = exchange.headers;
     DaemonReply answer;
-    const std::string address = "http://localhost" + path;
+    const std::string address = "http://localhost" + exchange.path;
     // Without an empty Expect header, larger bodies would wait for a permission that the daemon need not give.
     HeaderList headers(curl_slist_append(nullptr, "Content-Type: application/json"));
     curl_slist_append(headers.get(), "Expect:");
     curl_slist_append(headers.get(), "Accept: application/json");
-    if (!extra.revision.empty()) {
-        curl_slist_append(headers.get(), ("If-Match: " + extra.revision).c_str());
-    }
-    if (!extra.requestId.empty()) {
-        curl_slist_append(headers.get(), ("Request-Id: " + extra.requestId).c_str());
+    for (const auto& [name, value] : {std::pair{"If-Match: ", &extra.revision},
+                                      {"Request-Id: ", &extra.requestId},
+                                      {"Request-Deadline: ", &extra.deadline}}) {
+        if (!value->empty()) {
+            curl_slist_append(headers.get(), (name + *value).c_str());
+        }
     }
 
     curl_easy_reset(_transfer->get());
@@ -89,6 +107,10 @@ DaemonReply Connection::send(const std::string& path, const std::string* body, c
     _transfer->set(CURLOPT_NOPROXY, "*");
     _transfer->set(CURLOPT_NOSIGNAL, 1L);
     _transfer->set(CURLOPT_CONNECTTIMEOUT, 10L);
+    _transfer->set(CURLOPT_TIMEOUT_MS, std::max(1L, static_cast<long>(exchange.timeout.count())));
+    if (exchange.method != nullptr) {
+        _transfer->set(CURLOPT_CUSTOMREQUEST, exchange.method);
+    }
     _transfer->set(CURLOPT_HTTPHEADER, headers.get());
     _transfer->set(CURLOPT_WRITEFUNCTION, &append);
     _transfer->set(CURLOPT_WRITEDATA, &answer.body);
@@ -111,16 +133,24 @@ DaemonReply Connection::send(const std::string& path, const std::string* body, c
             throw Failure(ExitStatus::notPermitted, "permission denied by the daemon's socket " + _socketPath +
                                                         "; its group and root may use it");
         }
+        const bool isLate = result == CURLE_OPERATION_TIMEDOUT;
         const std::string why = result == CURLE_COULDNT_CONNECT && number != 0 ? std::strerror(static_cast<int>(number))
                                                                                : curl_easy_strerror(result);
+        const std::string late = fmt::format(
+            "the daemon has not answered within {:g} s",
+            std::chrono::duration<double>(std::max(exchange.timeout, std::chrono::milliseconds(1))).count());
         long sent = 0;
         curl_easy_getinfo(_transfer->get(), CURLINFO_REQUEST_SIZE, &sent);
         if (body != nullptr && sent > 0) {
-            throw LostConnection(ExitStatus::undetermined,
-                                 isInterrupted() ? "interrupted" : "the connection to the daemon was lost: " + why);
+            throw LostConnection(ExitStatus::undetermined, isInterrupted() ? "interrupted"
+                                                           : isLate        ? late
+                                                                    : "the connection to the daemon was lost: " + why);
         }
         if (isInterrupted()) {
             throw Failure(ExitStatus::failed, "interrupted; nothing was sent");
+        }
+        if (isLate) {
+            throw Unavailable(ExitStatus::notReachable, late);
         }
         throw Unavailable(ExitStatus::notReachable, "the daemon cannot be reached at " + _socketPath + ": " + why);
     }
@@ -133,6 +163,9 @@ DaemonReply Connection::send(const std::string& path, const std::string* body, c
         curl_easy_header(_transfer->get(), "Adminhost-Not-Done", 0, CURLH_HEADER, -1, &header) == CURLHE_OK;
     if (curl_easy_header(_transfer->get(), "ETag", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
         answer.revision = header->value;
+    }
+    if (curl_easy_header(_transfer->get(), "Retry-After", 0, CURLH_HEADER, -1, &header) == CURLHE_OK) {
+        answer.retryAfter = std::max(0L, std::strtol(header->value, nullptr, 10));
     }
     return answer;
 }

@@ -4,6 +4,7 @@
 
 #include "adminhostctl/Failure.h"
 
+#include <chrono>
 #include <memory>
 #include <string>
 
@@ -15,6 +16,7 @@ struct DaemonReply {
     std::string requestId;  ///< the daemon's name for the request; empty if it gave none
     std::string revision;   ///< of the state that was read, from the ETag header; empty without that header
     bool notDone = false;   ///< parts of the request were not carried out, or were ignored
+    long retryAfter = 0;    ///< seconds after which the daemon may accept the request; 0 without that header
 };
 
 /// The daemon was reached, and the connection ended before the answer: the request may have been carried out.
@@ -25,14 +27,15 @@ class LostConnection : public Failure {
 
 /// Headers of a request that may change something.
 struct PostHeaders {
-    std::string requestId;  ///< a UUID of the client's choice; empty: the daemon chooses
-    std::string revision;  ///< the daemon refuses the request (412) unless this is the current one; empty: no condition
+    std::string requestId{};  ///< a UUID of the client's choice; empty: the daemon chooses
+    std::string
+        revision{};  ///< the daemon refuses the request (412) unless this is the current one; empty: no condition
+    std::string deadline{};  ///< seconds that its operation may take; empty: as long as the daemon allows
 };
 
-/// One connection, kept open between requests. Throws Unavailable when the daemon cannot be reached (notReachable), and
-/// Failure when the
-/// socket may not be opened (notPermitted). post() throws LostConnection when the connection ends without an answer or
-/// isInterrupted() becomes true before the answer. There is no time limit here, because the daemon limits requests.
+/// One connection, kept open between requests. Throws Unavailable when the daemon cannot be reached or does not answer
+/// in time (notReachable), and Failure when the socket may not be opened (notPermitted). post() throws LostConnection
+/// when the connection ends without an answer, the time is over or isInterrupted() becomes true before the answer.
 class Connection {
   public:
     explicit Connection(std::string socketPath);
@@ -40,10 +43,14 @@ class Connection {
     Connection(Connection&&) noexcept;
     Connection& operator=(Connection&&) noexcept;
 
-    /// The path is the address below "http://host", each of its segments already escaped.
-    [[nodiscard]] DaemonReply get(const std::string& path);
+    /// The path is the address below "http://host", each of its segments already escaped. The timeout is that of the
+    /// whole exchange.
+    [[nodiscard]] DaemonReply get(const std::string& path, std::chrono::milliseconds timeout);
+    /// The same with the method DELETE.
+    [[nodiscard]] DaemonReply remove(const std::string& path, std::chrono::milliseconds timeout);
     /// The body is JSON.
-    [[nodiscard]] DaemonReply post(const std::string& path, const std::string& body, const PostHeaders& headers = {});
+    [[nodiscard]] DaemonReply post(const std::string& path, const std::string& body, std::chrono::milliseconds timeout,
+                                   const PostHeaders& headers = {});
 
     [[nodiscard]] const std::string& socketPath() const noexcept { return _socketPath; }
     /// Escapes one segment of a path, or a value in its query.
@@ -51,7 +58,8 @@ class Connection {
 
   private:
     class Transfer;
-    [[nodiscard]] DaemonReply send(const std::string& path, const std::string* body, const PostHeaders& headers);
+    struct Exchange;
+    [[nodiscard]] DaemonReply send(const Exchange& exchange);
 
     std::string _socketPath;
     std::unique_ptr<Transfer> _transfer;

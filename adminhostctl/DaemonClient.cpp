@@ -17,9 +17,28 @@ namespace {
 constexpr long statusOk = 200;
 constexpr long statusNoContent = 204;
 constexpr long statusForbidden = 403;
+constexpr long statusRevisionChanged = 412;
 constexpr long statusInternal = 500;
 constexpr long statusUnavailable = 503;
 constexpr long statusTimeout = 504;
+
+using std::chrono::seconds;
+
+/// Of requests that the daemon answers from memory.
+constexpr auto quickTimeout = seconds(30);
+/// What the daemon needs to stop an operation and to answer.
+constexpr auto margin = seconds(10);
+constexpr auto usualDeadline = seconds(300);
+constexpr int repeats = 3;
+
+constexpr const char* overviewPath = "/v1/";
+constexpr const char* requestsPath = "/v1/requests/";
+
+/// The deadline to send so that the operation has ended before the timeout.
+std::string deadlineBefore(std::chrono::milliseconds timeout) {
+    const auto whole = std::chrono::ceil<seconds>(timeout);
+    return std::to_string(std::max<std::int64_t>(1, whole > 2 * margin ? (whole - margin).count() : whole.count() / 2));
+}
 
 std::string shownText(const Dictionary& dictionary, std::string_view key) {
     return shown(dictionary.text(key));
@@ -96,6 +115,10 @@ std::string messageOf(const DaemonReply& reply) {
     return message.empty() ? code : message + (code.empty() ? "" : " (" + code + ")");
 }
 
+std::string commandPath(const CommandRef& command) {
+    return "/v1/" + Connection::escaped(command.plugin) + '/' + Connection::escaped(command.description.name());
+}
+
 Failure noPlugin() {
     return {ExitStatus::failed, "the daemon has loaded no plug-in; adminhostd --check shows why"};
 }
@@ -110,8 +133,40 @@ bool isSet(const Value& value) {
 
 }  // namespace
 
+DaemonClient::Milliseconds DaemonClient::timeoutOf(std::optional<seconds> deadline) {
+    if (_timeout) {
+        return *_timeout;
+    }
+    if (!deadline) {
+        if (!_deadline) {
+            static_cast<void>(overview());
+        }
+        deadline = _deadline;
+    }
+    return deadline.value_or(usualDeadline) + margin;
+}
+
+template <typename Send>
+DaemonReply DaemonClient::patiently(Milliseconds timeout, const Send& send) {
+    const auto end = std::chrono::steady_clock::now() + timeout;
+    const auto left = [&] { return std::chrono::ceil<Milliseconds>(end - std::chrono::steady_clock::now()); };
+    for (int repeat = 0;; ++repeat) {
+        DaemonReply reply = send(left());
+        const auto pause = seconds(reply.retryAfter);
+        if (reply.status != statusUnavailable || pause == seconds(0) || repeat == repeats || pause >= left()) {
+            return reply;
+        }
+        std::this_thread::sleep_for(pause);
+        if (isInterrupted()) {
+            throw Failure(ExitStatus::failed, "interrupted; nothing was sent");
+        }
+    }
+}
+
 Value DaemonClient::get(const std::string& path) {
-    const DaemonReply answer = _connection.get(path);
+    const bool isQuick = path == overviewPath || path.starts_with(requestsPath);
+    const Milliseconds timeout = _timeout ? *_timeout : isQuick ? Milliseconds(quickTimeout) : timeoutOf(std::nullopt);
+    const DaemonReply answer = patiently(timeout, [&](Milliseconds left) { return _connection.get(path, left); });
     if (answer.status != statusOk) {
         fail(answer);
     }
@@ -134,7 +189,19 @@ void DaemonClient::fail(const DaemonReply& reply) {
 }
 
 Value DaemonClient::overview() {
-    return get("/v1/");
+    Value overview = get(overviewPath);
+    const auto deadline =
+        overview.dictionary() != nullptr ? overview.dictionary()->get("deadlineSeconds").integer() : std::nullopt;
+    _deadline = deadline ? seconds(*deadline) : usualDeadline;
+    return overview;
+}
+
+void DaemonClient::cancel(const std::string& requestId) {
+    const std::string path = requestsPath + Connection::escaped(requestId);
+    const DaemonReply reply = _connection.remove(path, _timeout.value_or(quickTimeout));
+    if (reply.status < statusOk || reply.status >= 300) {
+        fail(reply);
+    }
 }
 
 const std::vector<PluginInfo>& DaemonClient::plugins() {
@@ -213,19 +280,29 @@ CommandAnswer DaemonClient::ask(const CommandRef& command, Dictionary request, c
     if (_languages) {
         addLanguages(request, command.description, *_languages);
     }
-    const std::string path =
-        "/v1/" + Connection::escaped(command.plugin) + '/' + Connection::escaped(command.description.name());
-    const PostHeaders headers{textOf(randomUuid()), revision};
+    const std::string path = commandPath(command);
+    const std::string body = jsonOf(request);
+    PostHeaders headers{"", revision, ""};
+    const auto send = [&](Milliseconds left) {
+        // The daemon accepts each id once.
+        headers.requestId = textOf(randomUuid());
+        headers.deadline = deadlineBefore(left);
+        return _connection.post(path, body, left, headers);
+    };
+    const Milliseconds timeout = timeoutOf(command.description.deadline());
     DaemonReply reply;
-    if (command.description.changes()) {
-        const InterruptGuard guard;
-        try {
-            reply = _connection.post(path, jsonOf(request), headers);
-        } catch (const LostConnection& lost) {
-            throw LostAnswer(lost.status(), lost.what(), headers.requestId);
+    try {
+        if (command.description.changes()) {
+            const InterruptGuard guard;
+            reply = patiently(timeout, send);
+        } else {
+            reply = patiently(timeout, send);
         }
-    } else {
-        reply = _connection.post(path, jsonOf(request), headers);
+    } catch (const LostConnection& lost) {
+        if (!command.description.changes()) {
+            throw Unavailable(ExitStatus::notReachable, lost.what());
+        }
+        throw LostAnswer(lost.status(), lost.what(), headers.requestId);
     }
     const std::string id = reply.requestId.empty() ? headers.requestId : reply.requestId;
     if (reply.status == statusNoContent) {
@@ -234,6 +311,9 @@ CommandAnswer DaemonClient::ask(const CommandRef& command, Dictionary request, c
     if (reply.status != statusOk) {
         if (command.description.changes() && (reply.status == statusInternal || reply.status == statusTimeout)) {
             throw LostAnswer(ExitStatus::failed, messageOf(reply), id);
+        }
+        if (reply.status == statusRevisionChanged) {
+            throw Conflict(messageOf(reply));
         }
         fail(reply);
     }
@@ -244,11 +324,23 @@ CommandAnswer DaemonClient::ask(const CommandRef& command, Dictionary request, c
     return {*std::move(value), id, reply.revision, reply.notDone};
 }
 
+void DaemonClient::check(const CommandRef& command, const Dictionary& request) {
+    const std::string path = commandPath(command) + "?check=1";
+    const std::string body = jsonOf(request);
+    const DaemonReply reply = patiently(timeoutOf(command.description.deadline()), [&](Milliseconds left) {
+        return _connection.post(path, body, left, {"", "", deadlineBefore(left)});
+    });
+    if (reply.status != statusOk) {
+        fail(reply);
+    }
+}
+
 RequestReport DaemonClient::report(const std::string& requestId) {
     RequestReport report;
     DaemonReply reply;
     try {
-        reply = _connection.get("/v1/requests/" + Connection::escaped(requestId));
+        reply = _connection.get(requestsPath + Connection::escaped(requestId),
+                                std::min(_timeout.value_or(margin), Milliseconds(margin)));
     } catch (const Failure&) {
         report.state = RequestReport::State::notReachable;
         return report;

@@ -7,6 +7,7 @@
 #include "adminhostctl/Failure.h"
 #include "platform/value/Value.h"
 
+#include <chrono>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -83,11 +84,21 @@ struct CommandAnswer {
     bool notDone = false;  ///< parts of the request were not carried out: see report()
 };
 
+/// The state has changed since it was read, so that the daemon refused a write that depends on its revision.
+class Conflict : public Failure {
+  public:
+    explicit Conflict(const std::string& message) : Failure(ExitStatus::conflict, message) {}
+};
+
+/// Every call ends in time: after the given timeout, or else ten seconds after the deadline of its operation. If the
+/// daemon asks to try again later (503 with Retry-After), the call is repeated after that time, three times at most.
 class DaemonClient {
   public:
     /// With languages, they are sent with every request of a command that describes where (DescribedKey::filledWith).
-    explicit DaemonClient(std::string socketPath, std::optional<std::vector<std::string>> languages = std::nullopt)
-        : _connection(std::move(socketPath)), _languages(std::move(languages)) {}
+    /// A timeout also shortens the operations' deadlines, so that they end before it.
+    explicit DaemonClient(std::string socketPath, std::optional<std::vector<std::string>> languages = std::nullopt,
+                          std::optional<std::chrono::milliseconds> timeout = std::nullopt)
+        : _connection(std::move(socketPath)), _languages(std::move(languages)), _timeout(timeout) {}
 
     /// The daemon's overview: the running request, how many wait, and the plug-ins.
     [[nodiscard]] Value overview();
@@ -101,8 +112,11 @@ class DaemonClient {
     [[nodiscard]] CommandRef stateCommand(std::string_view state);
     /// Sends the request once and returns the answer. A request with a revision fails unless the revision is still
     /// current. Throws Failure with the daemon's message, its findings and, after a failure inside the service, the log
-    /// lines of the request. Throws LostAnswer if the command may change something and its answer is missing.
+    /// lines of the request. Throws LostAnswer if the command may change something and its answer is missing, and
+    /// Conflict if the revision is no longer current.
     [[nodiscard]] CommandAnswer ask(const CommandRef& command, Dictionary request, const std::string& revision = {});
+    /// Lets the daemon check a request, which is not carried out. Throws Failure as ask() does if it would be refused.
+    void check(const CommandRef& command, const Dictionary& request);
     /// Returns the daemon's current record of a request. A daemon that cannot be reached is a state of the report, not
     /// a Failure.
     [[nodiscard]] RequestReport report(const std::string& requestId);
@@ -114,14 +128,24 @@ class DaemonClient {
 
     /// The JSON value at an address of the daemon. Throws Failure as ask() does, Unavailable if it may be there soon.
     [[nodiscard]] Value get(const std::string& path);
+    /// Cancels a request that waits or is running. Throws Failure as ask() does.
+    void cancel(const std::string& requestId);
     [[nodiscard]] const std::string& socketPath() const noexcept { return _connection.socketPath(); }
 
   private:
+    using Milliseconds = std::chrono::milliseconds;
+
     [[noreturn]] void fail(const DaemonReply& answer);
+    /// The time that an operation with this limit (the daemon's without one) may take here.
+    [[nodiscard]] Milliseconds timeoutOf(std::optional<std::chrono::seconds> deadline);
+    template <typename Send>
+    [[nodiscard]] DaemonReply patiently(Milliseconds timeout, const Send& send);
 
     Connection _connection;
     std::optional<std::vector<std::string>> _languages;
     std::optional<std::vector<PluginInfo>> _plugins;
+    std::optional<Milliseconds> _timeout;
+    std::optional<std::chrono::seconds> _deadline;  ///< the daemon's, once it is known
 };
 
 /// Adds the languages to the request, under the key that the description fills with languages, unless the request has

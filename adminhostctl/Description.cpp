@@ -32,6 +32,8 @@ void Description::Keys::add(const Value& described) {
     description.secret = key->get("secret").boolean().value_or(false);
     description.required = key->get("required").boolean().value_or(false);
     description.allowed = textsAt(*key, "allowed");
+    description.minimum = key->get("minimum").integer();
+    description.maximum = key->get("maximum").integer();
     description.title = textsAt(*key, "title");
     description.kind = key->text("kind");
     description.section = key->text("section");
@@ -70,6 +72,9 @@ Description::Description(const Dictionary& command)
       _text(command.text("description")),
       _changes(command.get("access") != Value("read")),
       _state(command.text("state")) {
+    if (const auto limit = command.get("deadlineSeconds").integer()) {
+        _deadline = std::chrono::seconds(*limit);
+    }
     if (const Array* trials = command.get("trials").array()) {
         for (const Value& element : *trials) {
             if (const Dictionary* trial = element.dictionary()) {

@@ -4,6 +4,9 @@
 
 #include "platform/value/Value.h"
 
+#include <chrono>
+#include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -22,6 +25,8 @@ struct DescribedKey {
     std::string column;  ///< heading in tables; empty: not shown in one
     std::string help;
     std::vector<std::string> allowed;
+    std::optional<std::int64_t> minimum;  ///< of the sensible range of a number
+    std::optional<std::int64_t> maximum;
     bool secret = false;
     bool required = false;
     // Of a list's element that is a person or a group.
@@ -67,6 +72,8 @@ class Description {
     [[nodiscard]] const std::string& text() const noexcept { return _text; }
     /// Whether the command may change something: it has another right than reading.
     [[nodiscard]] bool changes() const noexcept { return _changes; }
+    /// The command's own time limit; nullopt if the daemon's applies.
+    [[nodiscard]] std::optional<std::chrono::seconds> deadline() const noexcept { return _deadline; }
     /// "read" if the command reads the state, "write" if it writes it, "try" if it tries values before they are
     /// written; empty for other commands.
     [[nodiscard]] const std::string& state() const noexcept { return _state; }
@@ -95,6 +102,7 @@ class Description {
     std::string _summary;
     std::string _text;
     bool _changes = false;
+    std::optional<std::chrono::seconds> _deadline;
     std::string _state;
     std::vector<Trial> _trials;
     Dictionary _parts;

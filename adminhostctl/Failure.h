@@ -11,8 +11,9 @@ enum class ExitStatus : int {
     done = 0,
     failed = 1,  ///< the service returned an error, or something was not applied
     usage = 2,
-    notReachable = 3,  ///< no daemon at the socket
+    notReachable = 3,  ///< no daemon at the socket, or it does not answer
     notPermitted = 4,
+    conflict = 7,      ///< another client has changed the state since it was read; nothing was written
     undetermined = 6,  ///< the answer to a write is missing, and whether everything was written cannot be determined
 
     // Of "doctor", which has numbers of its own.

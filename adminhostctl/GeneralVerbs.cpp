@@ -39,6 +39,12 @@ ExitStatus commands(const Context& context, Words) {
     return ExitStatus::done;
 }
 
+ExitStatus cancel(const Context& context, Words arguments) {
+    context.service.cancel(arguments.front());
+    context.out << (context.options.format == Format::text ? "The request has been cancelled.\n" : "");
+    return ExitStatus::done;
+}
+
 // The directory
 
 /// The entry as people read it: each value once, and the names of its groups in place of their entries.
@@ -88,6 +94,13 @@ constexpr std::array table = {
          0,
          &daemon,
          {{"daemon", "--format json daemon"}}},
+    Verb{"cancel",
+         "ID",
+         "Cancel a request that waits, or is running and only reads",
+         1,
+         1,
+         &cancel,
+         {{"cancel 0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1EFF", "--timeout 5 cancel 0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1EFF"}}},
     Verb{"commands", "[--names]", "List the commands", 0, 0, &commands, {{"commands", "--format json commands"}}},
     Verb{"help",
          "[VERB | COMMAND] [--names]",
@@ -114,6 +127,9 @@ constexpr std::array table = {
 };
 
 constexpr std::array options = {
+    VerbOption{dryRunOption, "", "Show what would be changed, and change nothing", {}, {}, true},
+    VerbOption{yesOption, "", "Do not ask"},
+    VerbOption{forceOption, "", "Also send a value that is outside its range or not one of its words", {}, {}, true},
     VerbOption{followOption, "", "With logs: print also what is written from now on", {}, "-f"},
     VerbOption{linesOption, "LINES", "With logs: print only the last LINES lines (10 if not given)", {}, "-n"},
 };

@@ -17,6 +17,8 @@
 #include "platform/files/StandardDescriptors.h"
 
 #include <algorithm>
+#include <charconv>
+#include <chrono>
 #include <cstdlib>
 #include <iostream>
 #include <sstream>
@@ -110,6 +112,21 @@ void addOption(CLI::App& app, const adminhost::ctl::VerbOption& option, adminhos
     }
 }
 
+/// The timeout that was given. Throws Failure(usage) if it is not a number of seconds.
+std::optional<std::chrono::milliseconds> timeoutOf(const std::optional<std::string>& given) {
+    if (!given) {
+        return std::nullopt;
+    }
+    constexpr double most = 1'000'000;
+    const std::string& text = *given;
+    double seconds = 0;
+    const auto [rest, error] = std::from_chars(text.data(), text.data() + text.size(), seconds);
+    if (error != std::errc() || rest != text.data() + text.size() || !(seconds >= 0.001 && seconds <= most)) {
+        throw adminhost::ctl::usageError("--timeout: \"" + text + "\" is not a number of seconds above 0");
+    }
+    return std::chrono::milliseconds(static_cast<long>(seconds * 1000));
+}
+
 int runMain(int count, char** words) {
     adminhost::ctl::VerbOptions options;
     std::string socket = defaultSocket;
@@ -128,6 +145,11 @@ int runMain(int count, char** words) {
                    "Languages of names and descriptions, the preferred one first: de,fr (by default those of LANGUAGE, "
                    "LC_ALL, LC_MESSAGES and LANG)")
         ->type_name("LIST");
+    std::optional<std::string> timeout;
+    app.add_option("--timeout", timeout,
+                   "Seconds to wait for an answer (by default until 10 s after the daemon's deadline); the service "
+                   "stops before that")
+        ->type_name("SECONDS");
     const std::vector<adminhost::ctl::VerbOption> verbOptions = allOptions();
     for (const adminhost::ctl::VerbOption& option : verbOptions) {
         addOption(app, option, options);
@@ -162,10 +184,15 @@ int runMain(int count, char** words) {
     options.names = options.has("--names");
     try {
         adminhost::ctl::DaemonClient service(
-            socket, languages ? adminhost::ctl::languagesOfText(*languages) : adminhost::ctl::callerLanguages());
-        const adminhost::ctl::Sources sources{&adminhost::ctl::readSource,       &adminhost::ctl::askSecret,
-                                              adminhost::ctl::inputIsTerminal(), options.has("--clear"),
-                                              &adminhost::ctl::askKnownSecret,   &adminhost::ctl::confirm};
+            socket, languages ? adminhost::ctl::languagesOfText(*languages) : adminhost::ctl::callerLanguages(),
+            timeoutOf(timeout));
+        const adminhost::ctl::Sources sources{&adminhost::ctl::readSource,
+                                              &adminhost::ctl::askSecret,
+                                              adminhost::ctl::inputIsTerminal(),
+                                              options.has("--clear"),
+                                              &adminhost::ctl::askKnownSecret,
+                                              &adminhost::ctl::confirm,
+                                              options.has(adminhost::ctl::forceOption)};
         const std::vector<adminhost::ctl::Verb> verbs = allVerbs();
         const adminhost::ctl::Context context{service, options, sources, std::cout, std::cerr, verbs, verbOptions};
         const ExitStatus status = isHelp ? helpOf(context, rest) : adminhost::ctl::run(context, rest);

@@ -35,22 +35,24 @@ std::optional<double> numberOf(const Value& value) {
     return result.ec == std::errc() && result.ptr == end ? std::optional(number) : std::nullopt;
 }
 
-std::string withUnit(const Value& value, const std::string& unit) {
+}  // namespace
+
+std::string textWithUnit(const Value& value, const std::string& unit) {
+    // A number with a unit of settings is shown as it is stored: that is the number to be written.
+    const std::string_view word = wordOfUnit(unit);
+    if (!word.empty()) {
+        return numberOf(value) ? shown(textOf(value)) + ' ' + std::string(word) : "";
+    }
     const auto number = numberOf(value);
-    if (!number || !(*number >= 0)) {
-        return {};
-    }
-    // The unit of a setting is kept: the number shown is the one to be written.
-    if (unit == "seconds" || unit == "minutes" || unit == "megabytes") {
-        return shown(textOf(value)) + (unit == "seconds" ? " s" : unit == "minutes" ? " min" : " MB");
-    }
-    if (unit == "bytes" && *number < 18e18) {
+    if (unit == "bytes" && number && *number >= 0 && *number < 18e18) {
         return sizeText(static_cast<std::uint64_t>(*number));
     }
     return {};
 }
 
-}  // namespace
+std::string_view wordOfUnit(std::string_view unit) {
+    return unit == "seconds" ? "s" : unit == "minutes" ? "min" : unit == "megabytes" ? "MB" : "";
+}
 
 std::string sizeText(std::uint64_t bytes) {
     constexpr std::array<const char*, 7> units = {"bytes", "kB", "MB", "GB", "TB", "PB", "EB"};
@@ -111,7 +113,7 @@ bool Reading::isSection(const Value& value, const std::string& path) const {
 
 std::string Reading::cell(const Value& value, const std::string& path) const {
     if (const DescribedKey* key = _description.answerKey(path); key != nullptr && !key->unit.empty()) {
-        std::string text = withUnit(value, key->unit);
+        std::string text = textWithUnit(value, key->unit);
         if (!text.empty()) {
             return text;
         }

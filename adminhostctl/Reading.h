@@ -7,6 +7,7 @@
 
 #include <cstddef>
 #include <string>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -38,6 +39,11 @@ class Reading {
     std::vector<std::string> _columns;
 };
 
+/// "4096 MB", "30 s": the number with the unit that the description gives it; empty without a number or a known unit. A
+/// setting's number is shown as it is stored.
+[[nodiscard]] std::string textWithUnit(const Value& value, const std::string& unit);
+/// The word that people read and type for the unit of a setting ("MB" for "megabytes"); empty for other units.
+[[nodiscard]] std::string_view wordOfUnit(std::string_view unit);
 /// "1.2 TB": decimal units.
 [[nodiscard]] std::string sizeText(std::uint64_t bytes);
 /// "31 Jan 2026, 09:00", local time.

@@ -1,6 +1,7 @@
 #include "adminhostctl/RequestArguments.h"
 
 #include "adminhostctl/Failure.h"
+#include "adminhostctl/Reading.h"
 #include "adminhostctl/Similar.h"
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
@@ -8,10 +9,12 @@
 #include "platform/text/Utf8.h"
 
 #include <algorithm>
+#include <array>
 #include <cctype>
 #include <charconv>
 #include <cstdio>
 #include <ctime>
+#include <limits>
 #include <optional>
 #include <set>
 #include <span>
@@ -169,15 +172,19 @@ std::optional<Value> numberOf(const std::string& text) {
     return !text.empty() && result.ec == std::errc() && result.ptr == end ? std::optional<Value>(number) : std::nullopt;
 }
 
-std::optional<Value> booleanOfText(const std::string& text) {
-    const std::string word = lowered(text);
-    if (word == "yes" || word == "true" || word == "on" || word == "y" || word == "t" || word == "1") {
-        return true;
+/// The text without the unit at its end. Throws Failure(usage) if it ends in another unit.
+std::string withoutUnit(const DescribedKey& key, const std::string& text) {
+    const std::size_t end = text.find_first_not_of("+-.0123456789");
+    const std::size_t word = text.find_first_not_of(" \t", std::min(end, text.size()));
+    const std::string_view unit = wordOfUnit(key.unit);
+    if (end == 0 || word == std::string::npos || unit.empty()) {
+        return text;
     }
-    if (word == "no" || word == "false" || word == "off" || word == "n" || word == "f" || word == "0") {
-        return false;
+    const std::string given = lowered(text.substr(word));
+    if (given == lowered(std::string(unit)) || given == key.unit || given + 's' == key.unit) {
+        return text.substr(0, end);
     }
-    return std::nullopt;
+    throw usageError(key.path + ": \"" + text + "\" is not a number of " + key.unit + " (" + std::string(unit) + ")");
 }
 
 /// "2026-01-31T08:00:00Z", or local time: "2026-01-31 08:00:00", "2026-01-31 08:00", "2026-01-31".
@@ -216,13 +223,22 @@ std::string withoutLineEnd(std::string text) {
     return text;
 }
 
+/// As valueOfText(), and throws Failure(usage) for a value outside its range.
+Value sensibleValueOf(const DescribedKey& key, const std::string& text, const Sources& sources) {
+    Value value = valueOfText(key, text);
+    if (const std::string problem = rangeProblem(key, value); !sources.force && !problem.empty()) {
+        throw usageError(key.path + ": " + text + ' ' + problem + "; --force writes it nevertheless");
+    }
+    return value;
+}
+
 /// The value of a text that was read. An empty secret is rejected, because it would remove the stored one by mistake
 /// (when standard input is /dev/null).
 Value notEmpty(const DescribedKey& key, const std::string& text, const Sources& sources) {
     if (key.secret && text.empty() && !sources.clear) {
         throw usageError(key.path + ": the value is empty; use --clear to remove the stored one");
     }
-    return valueOfText(key, text);
+    return sensibleValueOf(key, text, sources);
 }
 
 Value valueOfFile(const DescribedKey& key, const std::string& path, const Sources& sources) {
@@ -256,8 +272,39 @@ std::string suggestion(const Description& command, const std::string& key) {
 
 }  // namespace
 
-Value valueOfText(const DescribedKey& key, const std::string& text) {
+std::optional<bool> booleanOfText(const std::string& text) {
+    constexpr std::array yes = {"yes", "true", "on", "y", "t", "1", "enable", "enabled"};
+    constexpr std::array no = {"no", "false", "off", "n", "f", "0", "disable", "disabled"};
+    const std::string word = lowered(text);
+    return std::find(yes.begin(), yes.end(), word) != yes.end() ? std::optional(true)
+           : std::find(no.begin(), no.end(), word) != no.end()  ? std::optional(false)
+                                                                : std::nullopt;
+}
+
+std::string rangeProblem(const DescribedKey& key, const Value& value) {
+    const std::string unit(wordOfUnit(key.unit));
+    const auto bound = [&](std::int64_t number) { return std::to_string(number) + (unit.empty() ? "" : " " + unit); };
+    if (const auto number = value.isInteger() ? value.integer().value_or(std::numeric_limits<std::int64_t>::max())
+                                              : std::optional<std::int64_t>()) {
+        return key.minimum && *number < *key.minimum   ? "is below " + bound(*key.minimum)
+               : key.maximum && *number > *key.maximum ? "is above " + bound(*key.maximum)
+                                                       : "";
+    }
+    const std::string* text = value.string();
+    if (text == nullptr || key.allowed.empty() ||
+        std::find(key.allowed.begin(), key.allowed.end(), *text) != key.allowed.end()) {
+        return {};
+    }
+    std::string words;
+    for (const std::string& word : key.allowed) {
+        words += (words.empty() ? "" : ", ") + word;
+    }
+    return "is not one of " + words;
+}
+
+Value valueOfText(const DescribedKey& key, const std::string& given) {
     const std::string& type = key.enteredAs.empty() ? key.type : key.enteredAs;
+    const std::string text = type == "integer" || type == "real" ? withoutUnit(key, given) : given;
     if (isStructure(key) || type == "data") {
         throw usageError(key.path + ": the value is " + (type == "data" ? "data" : "a " + type) + "; use " + key.path +
                          (type == "data" ? "@FILE" : ":=JSON or " + key.path + "@FILE"));
@@ -274,7 +321,9 @@ Value valueOfText(const DescribedKey& key, const std::string& text) {
         value = numberOf<double>(text);
         wanted = "a number";
     } else if (type == "boolean") {
-        value = booleanOfText(text);
+        if (const auto boolean = booleanOfText(text)) {
+            value = *boolean;
+        }
         wanted = "yes or no";
     } else if (type == "date") {
         value = dateOfText(text);
@@ -304,7 +353,7 @@ Value valueOfWord(const DescribedKey& key, const std::optional<std::string>& wor
         throw usageError(key.path + ": the value is missing; use " +
                          (key.secret ? "@FILE or @-" : "TEXT, @FILE or @-"));
     }
-    return word ? valueOfText(key, *word) : notEmpty(key, sources.ask(key.path), sources);
+    return word ? sensibleValueOf(key, *word, sources) : notEmpty(key, sources.ask(key.path), sources);
 }
 
 std::string textOfWord(const DescribedKey& key, const std::optional<std::string>& word, const Sources& sources) {
@@ -354,7 +403,7 @@ Dictionary buildRequest(const Description& command, Dictionary base, const std::
                     argument.key + (secret == path ? "@FILE, or " + argument.key + "@- to be asked" : "@FILE"));
             }
             if (argument.form == Form::text) {
-                value = valueOfText(*key, argument.value);
+                value = sensibleValueOf(*key, argument.value, sources);
             }
         }
         if (value.isNull()) {

@@ -25,13 +25,15 @@ struct Sources {
     std::function<std::string(const std::string& key)> askKnown = {};
     /// Asks a question; true for yes. Only called when standard input is a terminal.
     std::function<bool(const std::string& question)> confirm = {};
+    bool force = false;  ///< values outside their range are accepted
 };
 
 /// Builds the request. Each argument is KEY=TEXT (converted to the key's type), KEY:=JSON, KEY@FILE or KEY@- (standard
 /// input; a secret is asked for at a terminal). KEY is a path with dots; a number names a list's element, an existing
 /// one or the next one. A file of text loses one line end at its end; for a list or a dictionary it holds JSON or an
 /// XML property list. Arguments replace what the base request holds. Throws Failure(usage) for an argument of another
-/// form, a key that is not described (except with KEY:=JSON), a text that does not fit its key, a secret on the command
+/// form, a key that is not described (except with KEY:=JSON), a text that does not fit its key or its range (without
+/// Sources::force), a secret on the command
 /// line, an empty secret, or a key that is given twice.
 [[nodiscard]] Dictionary buildRequest(const Description& command, Dictionary base,
                                       const std::vector<std::string>& arguments, const Sources& sources);
@@ -49,7 +51,13 @@ struct Sources {
 [[nodiscard]] std::string textOfWord(const DescribedKey& key, const std::optional<std::string>& word,
                                      const Sources& sources);
 
-/// The value of a text for a key; throws Failure(usage) when it does not fit.
+/// The value of a text for a key; throws Failure(usage) when it does not fit. A number may be followed by its unit.
 [[nodiscard]] Value valueOfText(const DescribedKey& key, const std::string& text);
+
+/// Why the value is not a sensible one for the key ("is above 65534"); empty if it is, or if the key has no range.
+[[nodiscard]] std::string rangeProblem(const DescribedKey& key, const Value& value);
+
+/// "yes", "no" and the other usual words; nullopt for another text.
+[[nodiscard]] std::optional<bool> booleanOfText(const std::string& text);
 
 }  // namespace adminhost::ctl

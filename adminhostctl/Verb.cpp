@@ -39,6 +39,9 @@ ExitStatus perform(const Context& context, Words words) {
     }
     const Dictionary request =
         buildRequest(command.description, std::move(base), {words.begin() + 1, words.end()}, context.sources);
+    if (context.options.has(dryRunOption)) {
+        return checkOnly(context, command, request);
+    }
     ExitStatus status = ExitStatus::done;
     const auto answer = askOnce(context, command, request, status);
     if (!answer) {
@@ -134,6 +137,15 @@ std::optional<CommandAnswer> askOnce(const Context& context, const CommandRef& c
     }
 }
 
+ExitStatus checkOnly(const Context& context, const CommandRef& command, const Dictionary& request) {
+    context.service.check(command, request);
+    if (context.options.format == Format::text) {
+        context.out << "dry run: " << shown(command.description.name())
+                    << " would be carried out; nothing was changed\n";
+    }
+    return ExitStatus::done;
+}
+
 RequestReport reportLost(const Context& context, const LostAnswer& lost) {
     context.err << "adminhostctl: " << shown(lost.what()) << '\n';
     const RequestReport report = context.service.settledReport(lost.requestId());
@@ -161,6 +173,15 @@ RequestReport reportLost(const Context& context, const LostAnswer& lost) {
         }
     }
     return report;
+}
+
+bool isConfirmed(const Context& context, const std::string& question) {
+    if (!context.sources.terminal || context.options.has(yesOption) || context.options.has(dryRunOption) ||
+        context.sources.confirm(question)) {
+        return true;
+    }
+    context.err << "Nothing was done.\n";
+    return false;
 }
 
 std::optional<std::string> wordAt(Words arguments, std::size_t index) {

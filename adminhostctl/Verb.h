@@ -22,6 +22,11 @@ namespace adminhost::ctl {
 
 enum class Format { text, json, plist };
 
+// Options of verbs of several rooms.
+inline constexpr std::string_view dryRunOption = "--dry-run";
+inline constexpr std::string_view yesOption = "--yes";
+inline constexpr std::string_view forceOption = "--force";
+
 /// An option that some verbs of a room have.
 struct VerbOption {
     std::string_view name;      ///< "--group"
@@ -103,9 +108,17 @@ void printNotDone(const Context& context, const RequestReport& report);
 [[nodiscard]] std::optional<CommandAnswer> askOnce(const Context& context, const CommandRef& command,
                                                    const Dictionary& request, ExitStatus& status);
 
+/// For --dry-run: lets the daemon check the request, which is not carried out, and prints that it would be accepted.
+/// Throws Failure if it would be refused.
+[[nodiscard]] ExitStatus checkOnly(const Context& context, const CommandRef& command, const Dictionary& request);
+
 /// Prints on standard error why the answer to a request is missing, and its outcome: what the daemon reports as changed
 /// and as not done, and the log lines. Does not send the request again. Returns the printed report.
 RequestReport reportLost(const Context& context, const LostAnswer& lost);
+
+/// Asks before something that cannot be undone. Returns true without asking if there is no terminal, with --yes, and
+/// with --dry-run; prints that nothing was done if the reply is no.
+[[nodiscard]] bool isConfirmed(const Context& context, const std::string& question);
 
 /// The argument at the index; nullopt if fewer were given.
 [[nodiscard]] std::optional<std::string> wordAt(std::span<const std::string> arguments, std::size_t index);

@@ -1,6 +1,7 @@
 #include "adminhostctl/desired/DesiredFile.h"
 
 #include "adminhostctl/Failure.h"
+#include "adminhostctl/RequestArguments.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/Toml.h"
 
@@ -202,7 +203,8 @@ std::string joined(const std::vector<std::string>& words) {
     return text;
 }
 
-void parseSetting(Wanted& wanted, const std::string& key, const Node& node, const StateForm& form, const State& state) {
+void parseSetting(Wanted& wanted, const std::string& key, const Node& node, const StateForm& form, const State& state,
+                  bool force) {
     if (form.secret(key) != nullptr) {
         node.fail("is a secret, which a file must not hold; use --password-file FILE");
     }
@@ -219,6 +221,9 @@ void parseSetting(Wanted& wanted, const std::string& key, const Node& node, cons
                                            : type == "boolean" ? "true or false"
                                            : type == "real"    ? "a number"
                                                                : "a text in quotes"));
+    }
+    if (const std::string problem = rangeProblem(*described, value); !problem.empty() && !force && value != stored) {
+        node.fail(problem + "; --force writes it nevertheless");
     }
     wanted.settings.set(key, std::move(value));
 }
@@ -306,7 +311,8 @@ std::string exportOf(const StateForm& form, const State& state) {
     return text;
 }
 
-Wanted parseDesired(std::string_view text, const std::string& from, const StateForm& form, const State& state) {
+Wanted parseDesired(std::string_view text, const std::string& from, const StateForm& form, const State& state,
+                    bool force) {
     const toml::table table = parsed(text, from);
     std::vector<std::string> known{form.settingsSection()};
     for (const ListForm& list : form.lists()) {
@@ -326,7 +332,7 @@ Wanted parseDesired(std::string_view text, const std::string& from, const StateF
             if (section == switchesTable) {
                 parseSwitch(wanted, key, node, form);
             } else {
-                parseSetting(wanted, key, node, form, state);
+                parseSetting(wanted, key, node, form, state, force);
             }
         }
     }

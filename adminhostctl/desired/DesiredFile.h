@@ -29,8 +29,9 @@ namespace adminhost::ctl {
 [[nodiscard]] std::string exportOf(const StateForm& form, const State& state);
 
 /// Reads a file. Throws Failure(usage) with the mistake, its line and column, and what to do: broken TOML, an unknown
-/// table, key or setting, or a value whose type is neither that of its key nor that of the stored value.
+/// table, key or setting, a value whose type is neither that of its key nor that of the stored value, or, unless
+/// `force`, a value outside its range that is not stored yet.
 [[nodiscard]] Wanted parseDesired(std::string_view text, const std::string& from, const StateForm& form,
-                                  const State& state);
+                                  const State& state, bool force = false);
 
 }  // namespace adminhost::ctl

@@ -20,7 +20,7 @@ constexpr std::string_view validateOption = "--validate";
 /// The desired state from the file and the password file.
 Wanted wantedOf(const Context& context, const std::string& file, const CurrentState& current) {
     requireWhole(current);
-    Wanted wanted = parseDesired(context.sources.read(file), file, current.form, current.state);
+    Wanted wanted = parseDesired(context.sources.read(file), file, current.form, current.state, context.sources.force);
     if (const std::string passwordFile = context.options.argumentOf(passwordFileOption); !passwordFile.empty()) {
         if (current.form.secrets().size() != 1) {
             throw usageError("--password-file: the service has " + std::to_string(current.form.secrets().size()) +
@@ -95,7 +95,7 @@ ExitStatus settingsSet(const Context& context, Words arguments) {
     if (context.options.has(validateOption) && !passTrials(context, wanted, current)) {
         throw Failure(ExitStatus::failed, "nothing was written, because the setting failed a trial");
     }
-    return carryOut(context, wanted, current);
+    return carryOut(context, wanted, current, Retry::ifUnchanged);
 }
 
 ExitStatus exportState(const Context& context, Words arguments) {
@@ -120,8 +120,7 @@ ExitStatus planFile(const Context& context, Words arguments) {
                                  ": unknown and not compared; --password-file gives it");
         }
     }
-    showPlan(context, plan);
-    return ExitStatus::done;
+    return showOnly(context, current, plan);
 }
 
 ExitStatus applyFile(const Context& context, Words arguments) {
@@ -138,7 +137,7 @@ constexpr std::array table = {
          &settingsGet,
          {{"settings get", "settings get server_port"}}},
     Verb{"settings set",
-         "KEY [VALUE|@FILE|@-] [--clear] [--validate [--password-file FILE]]",
+         "KEY [VALUE|@FILE|@-] [--clear] [--force] [--dry-run] [--validate [--password-file FILE]]",
          "Change a setting",
          1,
          2,
@@ -152,14 +151,14 @@ constexpr std::array table = {
          &exportState,
          {{"export", "export host.toml"}}},
     Verb{"plan",
-         "FILE [--password-file FILE]",
+         "FILE [--password-file FILE] [--force]",
          "Show what applying the file would change",
          1,
          1,
          &planFile,
          {{"plan host.toml", "plan host.toml --password-file grid.txt"}}},
     Verb{"apply",
-         "FILE [--password-file FILE]",
+         "FILE [--password-file FILE] [--force] [--dry-run]",
          "Change what differs from the file",
          1,
          1,
@@ -173,12 +172,12 @@ constexpr std::array table = {
          &history,
          {{"history", "--format json history"}}},
     Verb{"rollback",
-         "NUMBER",
+         "NUMBER [--dry-run]",
          "Restore the settings as they were before a change",
          1,
          1,
          &rollback,
-         {{"rollback 7", "--format json rollback 7"}}},
+         {{"rollback 7", "rollback 7 --dry-run"}}},
 };
 
 constexpr std::array options = {

@@ -24,9 +24,9 @@ std::vector<std::string> writableKeys(const StateForm& form) {
 }
 
 /// As plans show it; long texts, certificates for instance, only by their beginning.
-std::string valueText(const Value& value, const char* null) {
+std::string valueText(const Value& value, const char* null, const std::string& unit = {}) {
     constexpr std::size_t widest = 60;
-    std::string text = value.isNull() ? null : tomlValue(value).value_or("(" + std::string(nameOf(value.type())) + ")");
+    std::string text = value.isNull() ? null : valueForPeople(value, unit);
     return widthOf(text) <= widest ? text : wrapped(text, widest).front() + "...";
 }
 
@@ -36,12 +36,15 @@ std::string textAt(const Dictionary& dictionary, std::string_view key) {
 }
 
 /// What became of a setting: "port: 80 -> 81".
-std::string settingChangeText(const Dictionary& change) {
+std::string settingChangeText(const StateForm& form, const Dictionary& change) {
     const std::string key = shown(textAt(change, "key"));
+    const DescribedKey* described = form.setting(textAt(change, "key"));
+    const std::string unit = described != nullptr ? described->unit : "";
     if (change.get("secret") == Value(true)) {
         return key + ": " + (change.get("to").isNull() ? "(secret) removed" : "(secret) changed");
     }
-    return key + ": " + valueText(change.get("from"), "(not set)") + " -> " + valueText(change.get("to"), "(not set)");
+    return key + ": " + valueText(change.get("from"), "(not set)", unit) + " -> " +
+           valueText(change.get("to"), "(not set)", unit);
 }
 
 /// What became of an element of a list, named as plans name it: "SECTION.NAME.LIST.anna: (not allowed) -> (allowed)".
@@ -82,7 +85,7 @@ std::vector<std::string> changeTexts(const StateForm& form, const Dictionary& en
     for (const Value& value : *changes) {
         if (const Dictionary* change = value.dictionary()) {
             texts.push_back(change->contains("section") ? elementChangeText(form, *change)
-                                                        : settingChangeText(*change));
+                                                        : settingChangeText(form, *change));
         }
     }
     return texts;

@@ -1,6 +1,7 @@
 #include "adminhostctl/desired/Plan.h"
 
 #include "adminhostctl/Failure.h"
+#include "adminhostctl/Reading.h"
 #include "adminhostctl/desired/Toml.h"
 #include "platform/value/ValueText.h"
 
@@ -14,12 +15,10 @@ namespace {
 constexpr std::string_view secretText = "(secret)";
 constexpr const char* allowedText = "(allowed)";
 constexpr const char* notAllowedText = "(not allowed)";
+constexpr const char* removedText = "(removed)";
 
-std::string valueText(const Value& value) {
-    return value.isNull() ? "(not set)" : tomlValue(value).value_or("(" + std::string(nameOf(value.type())) + ")");
-}
 std::string textOrSecret(bool hidden, const Value& value) {
-    return hidden ? std::string(secretText) : valueText(value);
+    return hidden ? std::string(secretText) : valueForPeople(value);
 }
 
 template <typename Range, typename Element>
@@ -44,16 +43,26 @@ void planSetting(Plan& plan, const StateForm& form, const Wanted& wanted, const 
     const DescribedKey* key = form.setting(entry.key);
     const Value& stored = state.settings.get(entry.key);
     const std::string name = form.settingsSection() + '.' + entry.key;
+    const std::string unit = key != nullptr ? key->unit : "";
     const bool differs = entry.value != stored;
     if (differs && !moved && key != nullptr && !wanted.lookUp && isLookedUp(*key, entry.value)) {
-        plan.notes.push_back(name + ": " + valueText(entry.value) + " is looked up by the write, so it is left at " +
-                             valueText(stored) + "; \"settings set " + entry.key +
-                             "\" writes it, then put the stored name here");
+        plan.notes.push_back(name + ": " + valueForPeople(entry.value) +
+                             " is looked up by the write, so it is left at " + valueForPeople(stored) +
+                             "; \"settings set " + entry.key + "\" writes it, then put the stored name here");
         return;
     }
     if (differs) {
-        plan.changes.push_back(
-            {name, valueText(stored), valueText(entry.value), form.root() + '.' + entry.key, false, {}, entry.key});
+        plan.changes.push_back({name,
+                                valueForPeople(stored, unit),
+                                valueForPeople(entry.value, unit),
+                                form.root() + '.' + entry.key,
+                                false,
+                                {},
+                                entry.key,
+                                form.settingsSection(),
+                                {},
+                                stored,
+                                entry.value});
         for (const std::string& command : key != nullptr ? key->restart : std::vector<std::string>()) {
             if (!contains(plan.restart, command)) {
                 plan.restart.push_back(command);
@@ -82,7 +91,12 @@ void planSettings(Plan& plan, const StateForm& form, const Wanted& wanted, const
                                     form.root() + '.' + name,
                                     true,
                                     {},
-                                    name});
+                                    name,
+                                    form.settingsSection(),
+                                    {},
+                                    valueForPrograms(isSet ? Value(true) : Value(), true),
+                                    valueForPrograms(value.empty() ? Value() : Value(true), true),
+                                    true});
             plan.root.set(name, value);
         }
     }
@@ -92,11 +106,12 @@ void planSettings(Plan& plan, const StateForm& form, const Wanted& wanted, const
         const std::string name = form.nameOf(key);
         if (moved.count(key.file) > 0 && !wanted.settings.contains(name) && !state.settings.get(name).isNull()) {
             unlisted += (unlisted.empty() ? "" : ", ") + name;
+            plan.movedAlong.push_back(name);
         }
     }
     if (!unlisted.empty()) {
-        plan.notes.push_back(form.settingsSection() + ": read from other files then, which may not have them: " +
-                             unlisted + "; \"adminhostctl export\" writes all settings down");
+        plan.consequences.push_back(form.settingsSection() + ": read from other files then, which may not have them: " +
+                                    unlisted + "; \"adminhostctl export\" writes all settings down");
     }
     for (const DescribedKey& key : form.secrets()) {
         const std::string name = form.nameOf(key);
@@ -116,7 +131,8 @@ class Section {
         : _plan(plan), _list(list), _state(state), _path(form.root() + '.' + list.key + '.') {}
 
     void change(const WantedElement& wanted, const std::set<std::string>& removeUnlisted) {
-        _entry = _list.section + '.' + tomlKey(wanted.shownAs.empty() ? wanted.name : wanted.shownAs);
+        _name = wanted.shownAs.empty() ? wanted.name : wanted.shownAs;
+        _entry = _list.section + '.' + tomlKey(_name);
         _element = findElement(_state, _list, wanted.name);
         if (wanted.remove) {
             remove();
@@ -157,11 +173,13 @@ class Section {
     }
 
   private:
-    void push(const std::string& entry, std::string from, std::string to, const std::string& below, bool hidden,
-              const std::string& key) {
-        _plan.changes.push_back({entry, std::move(from), std::move(to),
-                                 recordPath() + (below.empty() ? "" : '.' + below), hidden,
-                                 _element != nullptr ? _element->identity : "", key});
+    /// Adds a change of the element, whose entry, words, values and key are set.
+    void push(PlannedChange change, const std::string& below) {
+        change.keyPath = recordPath() + (below.empty() ? "" : '.' + below);
+        change.identity = _element != nullptr ? _element->identity : "";
+        change.section = _list.section;
+        change.name = _name;
+        _plan.changes.push_back(std::move(change));
     }
     [[nodiscard]] std::string recordPath() const { return _path + std::to_string(_records.size()); }
 
@@ -169,14 +187,17 @@ class Section {
         if (_element == nullptr) {
             return;
         }
-        std::string from = "(present)";
+        PlannedChange change{.entry = _entry, .from = "(present)", .to = removedText, .before = true};
         for (const FieldForm& field : _list.fields) {
             if (!field.boolean) {
-                from = textOrSecret(isSecret(field, *_element), _element->fields.get(field.key));
+                const Value& value = _element->fields.get(field.key);
+                change.secret = isSecret(field, *_element);
+                change.from = textOrSecret(change.secret, value);
+                change.before = change.secret ? Value(secretText) : value;
                 break;
             }
         }
-        push(_entry, std::move(from), "(removed)", "", false, "");
+        push(std::move(change), "");
         _records.emplace_back(Dictionary{{_list.identity, _element->identity}, {_list.removedBy, true}});
     }
 
@@ -188,20 +209,22 @@ class Section {
             throw usageError(_entry + ": the name is empty");
         }
         Dictionary record{{_list.addedBy, true}, {_list.label, wanted.name}};
-        std::string to = "(added)";
+        PlannedChange change{.entry = _entry, .from = "(not present)", .to = "(added)", .after = true};
         for (const FieldForm& field : _list.fields) {
             const Value& value = wanted.fields.get(field.key);
             if (!field.boolean && value.isNull()) {
                 throw usageError(_entry + ": not found, and adding it needs a " + field.inFile);
             }
             if (!field.boolean) {
-                to = textOrSecret(wanted.fields.get(field.secretIf).boolean().value_or(false), value);
+                change.secret = wanted.fields.get(field.secretIf).boolean().value_or(false);
+                change.to = textOrSecret(change.secret, value);
+                change.after = valueForPrograms(value, change.secret);
             }
             if (!field.boolean || value.boolean().value_or(false)) {
                 record.set(field.key, value);
             }
         }
-        push(_entry, "(not present)", std::move(to), "", false, "");
+        push(std::move(change), "");
         _records.emplace_back(std::move(record));
     }
 
@@ -222,8 +245,15 @@ class Section {
             const bool switchesSecrecy =
                 std::any_of(_list.fields.begin(), _list.fields.end(),
                             [&](const FieldForm& other) { return other.secretIf == field.key; });
-            push(_entry + '.' + field.inFile, textOrSecret(isHidden, stored), textOrSecret(becomesHidden, value),
-                 field.key, becomesHidden || switchesSecrecy, field.key);
+            push({.entry = _entry + '.' + field.inFile,
+                  .from = textOrSecret(isHidden, stored),
+                  .to = textOrSecret(becomesHidden, value),
+                  .hidden = becomesHidden || switchesSecrecy,
+                  .key = field.key,
+                  .before = isHidden ? Value(secretText) : stored,
+                  .after = valueForPrograms(value, becomesHidden),
+                  .secret = isHidden || becomesHidden},
+                 field.key);
             record.set(field.key, value);
         }
     }
@@ -281,12 +311,16 @@ class Section {
     bool pushPerson(const Array& entries, const PeopleForm& form, const std::string& list, const std::string& name,
                     bool allowed) {
         const std::string entry = _entry + '.' + list + '.' + tomlKey(name);
-        const PlannedChange change{
-            entry, allowed ? notAllowedText : allowedText, allowed ? allowedText : notAllowedText, {}, false, {}, {}};
+        PlannedChange change{.entry = entry,
+                             .from = allowed ? notAllowedText : allowedText,
+                             .to = allowed ? allowedText : notAllowedText,
+                             .key = list,
+                             .before = allowed ? Value() : Value(name),
+                             .after = allowed ? Value(name) : Value()};
         if (contains(_plan.changes, change)) {
             return false;
         }
-        push(entry, change.from, change.to, form.key + '.' + std::to_string(entries.size()), false, list);
+        push(std::move(change), form.key + '.' + std::to_string(entries.size()));
         return true;
     }
 
@@ -295,6 +329,7 @@ class Section {
     const State& _state;
     std::string _path;
     Array _records;
+    std::string _name;
     std::string _entry;
     const Element* _element = nullptr;
 };
@@ -375,6 +410,24 @@ Wanted comparable(const StateForm& form, const Wanted& wanted, const Plan& plan,
 }
 
 }  // namespace
+
+std::string valueForPeople(const Value& value, const std::string& unit) {
+    if (value.isNull()) {
+        return "(not set)";
+    }
+    if (const auto boolean = value.boolean()) {
+        return *boolean ? "yes" : "no";
+    }
+    // A number that is stored as text differs from the number.
+    if (std::string text = textWithUnit(value, unit); !text.empty() && value.string() == nullptr) {
+        return text;
+    }
+    return tomlValue(value).value_or("(" + std::string(nameOf(value.type())) + ")");
+}
+
+Value valueForPrograms(const Value& value, bool secret) {
+    return secret && !value.isNull() ? Value(secretText) : value;
+}
 
 bool isLookedUp(const DescribedKey& setting, const Value& value) {
     constexpr std::string_view local = ".local";

@@ -38,13 +38,19 @@ struct Wanted {
 };
 
 struct PlannedChange {
-    std::string entry;     ///< "SECTION.KEY", "SECTION.\"Main hall\".LIST.anna"
-    std::string from;      ///< as TOML writes it, or words in parentheses; "(secret)" for every secret
-    std::string to;        ///< the same
-    std::string keyPath;   ///< its key path in the request: "ROOT.LIST.0"
-    bool hidden = false;   ///< reading does not show whether it was applied
-    std::string identity;  ///< of the element
-    std::string key;       ///< of the setting, or of the element
+    std::string entry{};     ///< "SECTION.KEY", "SECTION.\"Main hall\".LIST.anna"
+    std::string from{};      ///< for people, with its unit, or words in parentheses; "(secret)" for every secret
+    std::string to{};        ///< the same
+    std::string keyPath{};   ///< its key path in the request: "ROOT.LIST.0"
+    bool hidden = false;     ///< reading does not show whether it was applied
+    std::string identity{};  ///< of the element
+    std::string key{};       ///< of the setting, or of the element; of a person the name of the list in a file
+    // For programs.
+    std::string section{};  ///< "settings", "cameras", ...
+    std::string name{};     ///< of the element, as people know it
+    Value before{};         ///< null: not set, not present, not in the list; "(secret)" for every secret
+    Value after{};          ///< the same; true for an element without a text of its own
+    bool secret = false;
 
     /// Compares the change itself, without its place in the request.
     friend bool operator==(const PlannedChange& a, const PlannedChange& b) {
@@ -54,14 +60,22 @@ struct PlannedChange {
 
 struct Plan {
     std::vector<PlannedChange> changes;
-    std::vector<std::string> notes;    ///< desired values that are left as they are, and consequences of changes
-    Dictionary root;                   ///< what to write; empty if nothing changes
-    std::vector<std::string> restart;  ///< commands that have to be run for a change to take effect
-    bool moves = false;                ///< other settings files, perhaps another database, are used from then on
+    std::vector<std::string> notes;         ///< desired values that are left as they are, and what remains to be done
+    std::vector<std::string> consequences;  ///< of changes that are not made yet
+    Dictionary root;                        ///< what to write; empty if nothing changes
+    std::vector<std::string> restart;       ///< commands that have to be run for a change to take effect
+    bool moves = false;                     ///< other settings files, perhaps another database, are used from then on
+    std::vector<std::string> movedAlong;    ///< stored settings of those files that the plan does not write
 };
 
 /// Returns true if the service looks the written value up and stores the result instead.
 [[nodiscard]] bool isLookedUp(const DescribedKey& setting, const Value& value);
+
+/// The value as people read it: yes or no, a number with the unit of its setting, a text in quotes.
+[[nodiscard]] std::string valueForPeople(const Value& value, const std::string& unit = {});
+
+/// The value of a change for programs: a secret is "(secret)".
+[[nodiscard]] Value valueForPrograms(const Value& value, bool secret);
 
 /// Returns the changes from `state` to what is wanted. Throws Failure(usage), which names the place, if something
 /// wanted does not fit the state.

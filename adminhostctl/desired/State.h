@@ -17,6 +17,8 @@ struct Person {
     std::string kind;  ///< "user", "group"
     std::string label;
     std::string identity;
+
+    friend bool operator==(const Person& a, const Person& b) = default;
 };
 
 /// An element of a section.
@@ -26,6 +28,8 @@ struct Element {
     Dictionary fields;                                  ///< texts and booleans by their key; a secret text is absent
     std::map<std::string, std::vector<Person>> people;  ///< by the key of the list
     std::vector<std::string> otherNames{};              ///< in the order of their keys; empty for a missing one
+
+    friend bool operator==(const Element& a, const Element& b) = default;
 };
 
 struct State {

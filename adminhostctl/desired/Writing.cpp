@@ -1,8 +1,11 @@
 #include "adminhostctl/desired/Writing.h"
 
 #include "adminhostctl/Width.h"
+#include "adminhostctl/desired/ChangeOutput.h"
 #include "adminhostctl/desired/Toml.h"
 #include "platform/value/ValueText.h"
+
+#include <algorithm>
 
 namespace adminhost::ctl {
 namespace {
@@ -13,32 +16,6 @@ const Dictionary& dictionaryOf(const std::optional<Value>& answer) {
         throw Failure(ExitStatus::failed, "the service did not return a dictionary");
     }
     return *answer->dictionary();
-}
-
-void showLine(std::ostream& out, const PlannedChange& change) {
-    out << shown(change.entry) << ": " << change.from << " -> " << change.to;
-}
-
-void showLines(std::ostream& err, const char* heading, const std::vector<PlannedChange>& changes) {
-    if (!changes.empty()) {
-        err << "adminhostctl: " << heading << '\n';
-    }
-    for (const PlannedChange& change : changes) {
-        err << "  ";
-        showLine(err, change);
-        err << '\n';
-    }
-}
-
-void showFailed(std::ostream& err, const std::vector<FailedChange>& failed) {
-    if (!failed.empty()) {
-        err << "adminhostctl: these changes were not applied:\n";
-    }
-    for (const FailedChange& one : failed) {
-        err << "  ";
-        showLine(err, one.change);
-        err << (one.reason.empty() ? "" : ": " + shownIndented(one.reason, 4)) << '\n';
-    }
 }
 
 std::string linesOf(const std::vector<ReportedGap>& gaps) {
@@ -82,54 +59,47 @@ void showLookedUp(const Context& context, const StateForm& form, const Plan& pla
     }
 }
 
-/// The plan for programs.
-void writePlan(const Context& context, const Plan& plan) {
-    Array changes;
-    for (const PlannedChange& change : plan.changes) {
-        changes.emplace_back(Dictionary{{"entry", change.entry}, {"from", change.from}, {"to", change.to}});
+/// The commands that have to be run for the applied changes to take effect.
+std::vector<std::string> restartOf(const StateForm& form, const std::vector<PlannedChange>& applied) {
+    std::vector<std::string> commands;
+    for (const PlannedChange& change : applied) {
+        const DescribedKey* key = change.section == form.settingsSection() ? form.setting(change.key) : nullptr;
+        for (const std::string& command : key != nullptr ? key->restart : std::vector<std::string>()) {
+            if (std::find(commands.begin(), commands.end(), command) == commands.end()) {
+                commands.push_back(command);
+            }
+        }
     }
-    Array notes;
-    for (const std::string& note : plan.notes) {
-        notes.emplace_back(note);
-    }
-    writeValue(
-        context,
-        Dictionary{{"changes", std::move(changes)}, {"notes", std::move(notes)}, {"restart", !plan.restart.empty()}},
-        Description());
+    return commands;
 }
 
-/// The plans of one verb's writes. Text is printed at once; for programs, finish() prints them as one document.
-class PlanOutput {
-  public:
-    explicit PlanOutput(const Context& context) noexcept : _context(context) {}
-
-    void show(const Plan& plan) {
-        if (_context.options.format == Format::text) {
-            showPlan(_context, plan);
-            return;
-        }
-        _shown = true;
-        _all.changes.insert(_all.changes.end(), plan.changes.begin(), plan.changes.end());
-        _all.notes.insert(_all.notes.end(), plan.notes.begin(), plan.notes.end());
-        _all.restart.insert(_all.restart.end(), plan.restart.begin(), plan.restart.end());
-    }
-    void finish() const {
-        if (_shown) {
-            writePlan(_context, _all);
+/// Prints what the other settings of files that have moved are now.
+void showMoved(const Context& context, const StateForm& form, const Plan& plan, const State& after) {
+    std::string unset;
+    std::size_t count = 0;
+    for (const std::string& name : plan.movedAlong) {
+        if (after.settings.get(name).isNull()) {
+            unset += (unset.empty() ? "" : ", ") + name;
+            ++count;
         }
     }
-
-  private:
-    const Context& _context;
-    Plan _all;
-    bool _shown = false;
-};
+    if (plan.movedAlong.empty()) {
+        return;
+    }
+    const std::size_t all = plan.movedAlong.size();
+    context.err << form.settingsSection() << ": " << all
+                << (all == 1 ? " setting is read from there now: " : " settings are read from there now: ")
+                << (count == all ? "not set"
+                    : count == 0 ? "set"
+                                 : std::to_string(count) + " of them not set (" + shown(unset) + ")")
+                << '\n';
+}
 
 /// One write and its outcome.
 class PlannedWrite {
   public:
     PlannedWrite(const Context& context, const CurrentState& current, const Wanted& wanted, Plan plan,
-                 PlanOutput& output)
+                 ChangeOutput& output)
         : _context(context),
           _output(output),
           _current(current),
@@ -158,13 +128,13 @@ class PlannedWrite {
         }
         const PlanOutcome outcome =
             outcomeOf(_current.form, _wanted, _plan, _current.state, after, error.empty(), report);
-        _output.show(_plan);
+        _output.show(_plan, outcome, restartOf(_current.form, outcome.applied));
+        _context.out.flush();
         if (after) {
             showLookedUp(_context, _current.form, _plan, *after);
+            showMoved(_context, _current.form, _plan, *after);
         }
         const ExitStatus status = reportAnswered(_context, error);
-        showFailed(_context.err, outcome.failed);
-        showLines(_context.err, "it could not be determined whether these changes were applied:", outcome.undetermined);
         if (status == ExitStatus::done && outcome.failed.empty() && outcome.undetermined.empty()) {
             return ExitStatus::done;
         }
@@ -209,16 +179,7 @@ class PlannedWrite {
             }
         }
         PlanOutcome outcome = outcomeOf(_current.form, _wanted, _plan, _current.state, after, false, report);
-        Plan applied;
-        applied.changes = outcome.applied;
-        applied.restart = outcome.applied.empty() ? std::vector<std::string>() : _plan.restart;
-        if (!applied.changes.empty()) {
-            _context.err << "these changes were applied:\n";
-            _context.err.flush();
-            _output.show(applied);
-        }
-        showFailed(_context.err, outcome.failed);
-        showLines(_context.err, "it could not be determined whether these changes were applied:", outcome.undetermined);
+        _output.show(_plan, outcome, restartOf(_current.form, outcome.applied));
         return !outcome.undetermined.empty()               ? ExitStatus::undetermined
                : !outcome.failed.empty()                   ? ExitStatus::failed
                : lost.status() == ExitStatus::undetermined ? ExitStatus::done
@@ -226,15 +187,19 @@ class PlannedWrite {
     }
 
     const Context& _context;
-    PlanOutput& _output;
+    ChangeOutput& _output;
     const CurrentState& _current;
     const Wanted& _wanted;
     Plan _plan;
     CommandRef _command;
 };
 
-ExitStatus carryOutWith(const Context& context, const Wanted& wanted, const CurrentState& current, PlanOutput& output) {
+ExitStatus carryOutWith(const Context& context, const Wanted& wanted, const CurrentState& current,
+                        ChangeOutput& output) {
     Plan plan = planOf(current.form, wanted, current.state);
+    if (context.options.has(dryRunOption)) {
+        return showOnly(context, current, plan);
+    }
     if (plan.changes.empty()) {
         output.show(plan);
         return ExitStatus::done;
@@ -261,6 +226,40 @@ ExitStatus carryOutWith(const Context& context, const Wanted& wanted, const Curr
         return ExitStatus::done;
     }
     return PlannedWrite(context, moved, elements, std::move(second), output).perform();
+}
+
+/// Whether an element that is removed as a whole is as it was.
+bool isSameElement(const PlannedChange& removal, const CurrentState& before, const CurrentState& now) {
+    const auto find = [&](const CurrentState& current) {
+        const std::vector<Element>& all = elementsOf(current.state, current.form.list(removal.section));
+        return std::find_if(all.begin(), all.end(),
+                            [&](const Element& element) { return element.identity == removal.identity; });
+    };
+    if (removal.identity.empty()) {
+        return true;  // it is added
+    }
+    return *find(before) == *find(now);
+}
+
+/// Returns false if nothing is left to be changed. Throws Conflict if something that is to be changed is no longer as
+/// it was, or if that cannot be determined.
+bool requireUnchanged(const Wanted& wanted, const CurrentState& before, const CurrentState& now) {
+    const Plan old = planOf(before.form, wanted, before.state);
+    const Plan plan = planOf(now.form, wanted, now.state);
+    for (const PlannedChange& change : plan.changes) {
+        const auto same = std::find(old.changes.begin(), old.changes.end(), change);
+        const bool isSame = same != old.changes.end() && same->identity == change.identity;
+        if (!isSame || !(change.key.empty() ? isSameElement(change, before, now) : true)) {
+            throw Conflict(change.entry + ": another client has changed it, it is " + change.from +
+                           " now; nothing was written");
+        }
+        if (change.secret && !change.before.isNull()) {
+            throw Conflict(change.entry +
+                           ": another client has changed something since the state was read, and a stored secret "
+                           "cannot be compared; nothing was written");
+        }
+    }
+    return !plan.changes.empty();
 }
 
 }  // namespace
@@ -292,35 +291,37 @@ void requireWhole(const CurrentState& current) {
     }
 }
 
-void showPlan(const Context& context, const Plan& plan) {
-    if (context.options.format != Format::text) {
-        writePlan(context, plan);
-        return;
+ExitStatus showOnly(const Context& context, const CurrentState& current, const Plan& plan) {
+    if (!plan.root.empty()) {
+        context.service.check(context.service.stateCommand("write"), {{current.form.root(), plan.root}});
     }
-    for (const PlannedChange& change : plan.changes) {
-        showLine(context.out, change);
-        context.out << '\n';
-    }
-    if (plan.changes.empty()) {
-        context.out << "no change\n";
-    } else if (!plan.restart.empty()) {
-        context.out << "the service has to be restarted for this to take effect: adminhostctl ";
-        for (std::size_t i = 0; i < plan.restart.size(); ++i) {
-            context.out << (i == 0 ? "" : ", then ") << shown(plan.restart[i]);
-        }
-        context.out << '\n';
-    }
-    for (const std::string& note : plan.notes) {
-        context.err << shown(note) << '\n';
-    }
+    ChangeOutput output(context);
+    output.show(plan);
+    output.finish();
+    return ExitStatus::done;
 }
 
-ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentState& current) {
-    PlanOutput output(context);
+ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentState& current, Retry retry) {
+    constexpr int attempts = 3;
+    ChangeOutput output(context);
+    std::optional<CurrentState> again;
     try {
-        const ExitStatus status = carryOutWith(context, wanted, current, output);
-        output.finish();
-        return status;
+        for (int attempt = 0;; ++attempt) {
+            try {
+                const ExitStatus status = carryOutWith(context, wanted, again ? *again : current, output);
+                output.finish();
+                return status;
+            } catch (const Conflict&) {
+                if (retry == Retry::never || attempt == attempts) {
+                    throw;
+                }
+                again = readState(context, current.section);
+                requireWhole(*again);
+                if (!requireUnchanged(wanted, current, *again)) {
+                    context.err << "already so: another client has changed it\n";
+                }
+            }
+        }
     } catch (const Failure&) {
         output.finish();
         throw;

@@ -28,14 +28,24 @@ struct CurrentState {
 /// Throws Failure(failed) with the reasons if parts of the state could not be read.
 void requireWhole(const CurrentState& current);
 
-/// Prints the plan in the requested format.
-void showPlan(const Context& context, const Plan& plan);
+/// Prints the plan. Throws Failure if the daemon would refuse it.
+[[nodiscard]] ExitStatus showOnly(const Context& context, const CurrentState& current, const Plan& plan);
 
-/// Changes what differs from the desired state, and prints the changes. Sends nothing if nothing differs. The daemon
-/// refuses the write if another client has changed something since the state was read. A change that moves settings
-/// files is written before the elements, which are then planned again for the new state. Names each change that was not
-/// applied and returns failed. Returns undetermined if the answer is missing and neither the state nor the daemon's
-/// report shows what was written. Nothing is ever written twice.
-[[nodiscard]] ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentState& current);
+/// What to do if another client has changed the state since it was read.
+enum class Retry {
+    never,
+    /// Read again and try again, three times at most, while the parts of the state that change are as they were. A
+    /// stored secret cannot be compared, so it is not tried again.
+    ifUnchanged,
+};
+
+/// Changes what differs from the desired state, and prints the changes. Sends nothing if nothing differs. With
+/// --dry-run, only prints them. The daemon refuses the write if another client has changed something since the state
+/// was read; then throws Conflict, unless `retry` allows another attempt. A change that moves settings files is written
+/// before the elements, which are then planned again for the new state. Names each change that was not applied and
+/// returns failed. Returns undetermined if the answer is missing and neither the state nor the daemon's report shows
+/// what was written. Nothing is ever written twice.
+[[nodiscard]] ExitStatus carryOut(const Context& context, const Wanted& wanted, const CurrentState& current,
+                                  Retry retry = Retry::never);
 
 }  // namespace adminhost::ctl

@@ -225,6 +225,14 @@ ExitStatus revoke(const Context& context, const Overview& overview, const Dictio
         }
         request.set("resources", std::move(resources));
     }
+    if (context.options.has(dryRunOption)) {
+        if (context.options.format == Format::text) {
+            for (const Removal& removal : removals) {
+                context.out << shown(removal.line) << '\n';
+            }
+        }
+        return checkOnly(context, command, request);
+    }
     try {
         const CommandAnswer answer = context.service.ask(command, request, revision);
         return showOutcome(context, removals, entry, context.service.report(answer.requestId));

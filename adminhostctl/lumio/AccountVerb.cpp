@@ -148,6 +148,11 @@ ExitStatus accountCreate(const Context& context, std::span<const std::string> ar
     if (password.empty()) {
         throw usageError("the directory administrator's password is empty; nothing was sent");
     }
+    const Dictionary request{
+        {"directoryNode", arguments[0]}, {"directoryUsername", arguments[1]}, {"directoryPassword", password}};
+    if (context.options.has(dryRunOption)) {
+        return checkOnly(context, command, request);
+    }
     if (!isAgreed(context)) {
         context.err << "Nothing was done.\n";
         return ExitStatus::failed;
@@ -158,10 +163,7 @@ ExitStatus accountCreate(const Context& context, std::span<const std::string> ar
         current = readSettings(context);
     }
     ExitStatus status = ExitStatus::done;
-    const auto answer =
-        askOnce(context, command,
-                {{"directoryNode", arguments[0]}, {"directoryUsername", arguments[1]}, {"directoryPassword", password}},
-                status);
+    const auto answer = askOnce(context, command, request, status);
     if (!answer) {
         return status;
     }

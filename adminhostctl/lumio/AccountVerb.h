@@ -11,7 +11,6 @@
 namespace adminhost::ctl {
 
 inline constexpr std::string_view saveOption = "--save";
-inline constexpr std::string_view yesOption = "--yes";
 
 /// Creates the account in the directory node (the first argument) as its administrator (the second), then checks which
 /// steps are left until the grid accepts it, and names the first one. With the option --save, writes its name and

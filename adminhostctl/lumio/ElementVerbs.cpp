@@ -3,6 +3,7 @@
 #include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/State.h"
+#include "adminhostctl/desired/Toml.h"
 #include "adminhostctl/desired/Writing.h"
 #include "adminhostctl/lumio/AccessVerb.h"
 #include "adminhostctl/lumio/Listing.h"
@@ -94,6 +95,11 @@ ExitStatus change(const Context& context, const ElementKind& kind, std::span<con
         if (element == nullptr) {
             throw notFound(kind, name, current.state, list);
         }
+        const bool removes = std::any_of(ways.begin(), ways.end(), [](const WantedElement& way) { return way.remove; });
+        if (removes && !isConfirmed(context, "The " + std::string(kind.word) + ' ' + tomlText(name) +
+                                                 " is removed, which cannot be undone. Continue?")) {
+            return ExitStatus::failed;
+        }
         for (WantedElement wanted : ways) {
             addNotes(notes, kind, name, *element, wanted);
             wanted.name = element->identity;
@@ -101,7 +107,7 @@ ExitStatus change(const Context& context, const ElementKind& kind, std::span<con
             all.elements[kind.section].push_back(std::move(wanted));
         }
     }
-    const ExitStatus status = carryOut(context, all, current);
+    const ExitStatus status = carryOut(context, all, current, Retry::ifUnchanged);
     for (const std::string& note : notes) {
         context.err << shown(note) << '\n';
     }
@@ -199,11 +205,12 @@ ExitStatus denyPeople(const Context& context, const ElementKind& kind, std::span
 
 ExitStatus switchAccess(const Context& context, const ElementKind& kind, const std::string& name,
                         const std::string& onOrOff) {
-    if (onOrOff != "on" && onOrOff != "off") {
+    const auto restricted = booleanOfText(onOrOff);
+    if (!restricted) {
         throw usageError(std::string(kind.word) + " access: \"" + onOrOff + "\" is neither on nor off");
     }
     WantedElement wanted;
-    wanted.fields.set("access_control_enabled", onOrOff == "on");
+    wanted.fields.set("access_control_enabled", *restricted);
     return change(context, kind, std::span(&name, 1), {wanted});
 }
 

@@ -30,7 +30,7 @@ WantedElement wantedOf(const std::string& name) {
 ExitStatus changeProperty(const Context& context, WantedElement element, const CurrentState& current) {
     Wanted wanted;
     wanted.elements[property.section].push_back(std::move(element));
-    return carryOut(context, wanted, current);
+    return carryOut(context, wanted, current, Retry::ifUnchanged);
 }
 
 ExitStatus propertySet(const Context& context, Words arguments) {
@@ -62,6 +62,9 @@ ExitStatus propertyRemove(const Context& context, Words arguments) {
     const ListForm& list = current.form.list(property.section);
     if (findElement(current.state, list, arguments.front()) == nullptr) {
         throw notFound(property, arguments.front(), current.state, list);
+    }
+    if (!isConfirmed(context, "The property " + tomlText(arguments.front()) + " is removed. Continue?")) {
+        return ExitStatus::failed;
     }
     WantedElement removed = wantedOf(arguments.front());
     removed.remove = true;
@@ -136,33 +139,33 @@ constexpr std::array table = {
          &showVerb<camera>,
          {{"camera show 'Lecture hall 1'", "--format json camera show Roof"}}},
     Verb{"camera allow",
-         "CAMERA NAME... [--group] | --group GROUP CAMERA...",
+         "CAMERA NAME... [--group] | --group GROUP CAMERA... [--dry-run]",
          "Allow users, or groups, to use a camera",
          1,
          1000,
          &allowVerb<camera>,
          {{"camera allow 'Lecture hall 1' anna ben", "camera allow --group studio 'Main hall' Roof"}}},
     Verb{"camera deny",
-         "CAMERA NAME... [--group] | --group GROUP CAMERA...",
+         "CAMERA NAME... [--group] | --group GROUP CAMERA... [--dry-run]",
          "Remove users and groups from a camera's list",
          1,
          1000,
          &denyVerb<camera>,
          {{"camera deny 'Lecture hall 1' anna", "camera deny --group studio 'Main hall' Roof"}}},
     Verb{"camera access",
-         "CAMERA on|off",
+         "CAMERA on|off [--dry-run]",
          "Restrict a camera to its list, or open it to everyone",
          2,
          2,
          &accessVerb<camera>,
-         {{"camera access Roof on", "camera access Roof off"}}},
+         {{"camera access Roof on", "camera access Roof off --dry-run"}}},
     Verb{"camera remove",
-         "CAMERA",
+         "CAMERA [--yes] [--dry-run]",
          "Remove a camera from the service",
          1,
          1,
          &cameraRemove,
-         {{"camera remove Roof", "camera remove 0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1E01"}}},
+         {{"camera remove Roof", "camera remove 0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1E01 --yes"}}},
     Verb{"workflow list",
          "[--match GLOB] [--allowed NAME] [--restricted] [--sort COLUMN] [--columns LIST] [--wide] [--names]",
          "List the workflows and who may use them",
@@ -178,28 +181,28 @@ constexpr std::array table = {
          &showVerb<workflow>,
          {{"workflow show 'Publish to Catalog'", "workflow show Workflows/Archive.workflow"}}},
     Verb{"workflow allow",
-         "WORKFLOW NAME... [--group] | --group GROUP WORKFLOW...",
+         "WORKFLOW NAME... [--group] | --group GROUP WORKFLOW... [--dry-run]",
          "Allow users, or groups, to use a workflow",
          1,
          1000,
          &allowVerb<workflow>,
          {{"workflow allow 'Publish to Catalog' anna ben", "workflow allow --group studio 'Audio Episode' Archive"}}},
     Verb{"workflow deny",
-         "WORKFLOW NAME... [--group] | --group GROUP WORKFLOW...",
+         "WORKFLOW NAME... [--group] | --group GROUP WORKFLOW... [--dry-run]",
          "Remove users and groups from a workflow's list",
          1,
          1000,
          &denyVerb<workflow>,
          {{"workflow deny 'Publish to Catalog' anna", "workflow deny --group studio 'Audio Episode' Archive"}}},
     Verb{"workflow access",
-         "WORKFLOW on|off",
+         "WORKFLOW on|off [--dry-run]",
          "Restrict a workflow to its list, or open it to everyone",
          2,
          2,
          &accessVerb<workflow>,
          {{"workflow access Archive on", "workflow access Archive off"}}},
     Verb{"access",
-         "NAME|UUID [--group] [--revoke]",
+         "NAME|UUID [--group] [--revoke [--dry-run]]",
          "Show what a person or a group may use, or remove it from all lists",
          0,
          1,
@@ -213,14 +216,14 @@ constexpr std::array table = {
          &listVerb<property>,
          {{"property list", "property list --match 'mail_*' --sort name"}}},
     Verb{"property set",
-         "NAME [VALUE|@FILE|@-] [--protect|--no-protect]",
+         "NAME [VALUE|@FILE|@-] [--protect|--no-protect] [--dry-run]",
          "Add or change a property",
          1,
          2,
          &propertySet,
          {{"property set watermark left", "property set mail_password @password.txt --protect"}}},
     Verb{"property remove",
-         "NAME",
+         "NAME [--yes] [--dry-run]",
          "Remove a property",
          1,
          1,

@@ -14,6 +14,9 @@ using Words = std::span<const std::string>;
 /// Sends a command without arguments and reports that it has been carried out.
 ExitStatus control(const Context& context, const std::string& name, const char* done) {
     const CommandRef command = context.service.command(name);
+    if (context.options.has(dryRunOption)) {
+        return checkOnly(context, command, {});
+    }
     ExitStatus status = ExitStatus::done;
     const auto answer = askOnce(context, command, {}, status);
     if (!answer) {
@@ -51,17 +54,17 @@ constexpr std::array table = {
          0,
          &serviceStatus,
          {{"status", "--format json status"}}},
-    Verb{"start", "", "Start the service", 0, 0, &start, {{"start", "start --format json"}}},
-    Verb{"stop", "", "Stop the service", 0, 0, &stop, {{"stop", "stop --format json"}}},
+    Verb{"start", "[--dry-run]", "Start the service", 0, 0, &start, {{"start", "start --dry-run"}}},
+    Verb{"stop", "[--dry-run]", "Stop the service", 0, 0, &stop, {{"stop", "stop --dry-run"}}},
     Verb{"recycleService",
-         "",
+         "[--dry-run]",
          "Do nothing: stop and start restart the service",
          0,
          1,
          &recycle,
          {{"recycleService", "recycleService --format json"}}},
     Verb{"account create",
-         "NODE ADMINISTRATOR [--password-file FILE] [--save [--yes]]",
+         "NODE ADMINISTRATOR [--password-file FILE] [--save [--yes]] [--dry-run]",
          "Create the grid account in a directory node",
          2,
          2,
@@ -72,7 +75,6 @@ constexpr std::array table = {
 
 constexpr std::array options = {
     VerbOption{saveOption, "", "With account create: write the account's name and password into the settings"},
-    VerbOption{yesOption, "", "With account create --save: do not ask"},
 };
 
 }  // namespace

@@ -87,8 +87,8 @@ TEST_F(Deadline, ApplyReportsWhatWasWrittenBeforeItAndWhatWasNot) {
     const ProgramResult apply = ctl({"apply", desired});
     EXPECT_EQ(apply.status, 1);
     EXPECT_THAT(apply.output, AllOf(HasSubstr("DEADLINE_EXCEEDED"), HasSubstr("has ended; it was not repeated"),
-                                    testing::ContainsRegex("these changes were applied:\nsettings.member_uuid: "),
-                                    testing::ContainsRegex("not applied:\n  settings.server_port: [^\n]* -> 8180")));
+                                    testing::ContainsRegex("settings.member_uuid: [^\n]*: applied\n"),
+                                    testing::ContainsRegex("settings.server_port: [^\n]* -> 8180: FAILED: ")));
     EXPECT_EQ(writes(), 1U);
 }
 
@@ -108,7 +108,7 @@ TEST_F(LostAnswers, KilledWorkerIsReportedAndNothingIsWrittenTwice) {
     const ProgramResult result = set.wait();
     EXPECT_EQ(result.status, 1);
     EXPECT_THAT(result.output, AllOf(HasSubstr("WORKER_FAILED"), HasSubstr("has ended; it was not repeated"),
-                                     HasSubstr("not applied:\n  settings.server_port: 8170 -> 8180")));
+                                     HasSubstr("settings.server_port: 8170 -> 8180: FAILED: ")));
     EXPECT_LE(writes(), 1U);
 }
 
@@ -123,9 +123,7 @@ TEST_F(LostAnswers, StateThatCannotBeReadBackCompletelyLeavesItUndetermined) {
     EXPECT_EQ(result.status, 6);
     EXPECT_THAT(result.output,
                 AllOf(HasSubstr("parts of the state could not be read:\n  not read: the access list ("),
-                      HasSubstr("could not be determined whether these changes were applied:\n  settings.server_port: "
-                                "8170 -> 8180"),
-                      Not(HasSubstr("not applied:"))));
+                      HasSubstr("settings.server_port: 8170 -> 8180: not determined\n"), Not(HasSubstr(": FAILED:"))));
 }
 
 TEST_F(LostAnswers, DaemonThatIsGoneLeavesItUndetermined) {
@@ -139,8 +137,7 @@ TEST_F(LostAnswers, DaemonThatIsGoneLeavesItUndetermined) {
     EXPECT_EQ(result.status, 6);
     EXPECT_THAT(result.output,
                 AllOf(HasSubstr("the connection to the daemon was lost"), HasSubstr("the daemon cannot be reached"),
-                      HasSubstr("could not be determined whether these changes were applied:\n  settings.server_port: "
-                                "8170 -> 8180")));
+                      HasSubstr("settings.server_port: 8170 -> 8180: not determined\n")));
 }
 
 TEST_F(LostAnswers, InterruptedWriteIsReportedAndTheProgramEndsByTheSignal) {
@@ -151,7 +148,7 @@ TEST_F(LostAnswers, InterruptedWriteIsReportedAndTheProgramEndsByTheSignal) {
     const ProgramResult result = set.wait();
     EXPECT_EQ(result.status, 128 + SIGINT) << result.output;
     EXPECT_THAT(result.output, AllOf(HasSubstr("interrupted"), HasSubstr("has ended; it was not repeated"),
-                                     HasSubstr("these changes were applied:\nsettings.server_port: 8170 -> 8180\n")));
+                                     HasSubstr("settings.server_port: 8170 -> 8180: applied\n")));
     EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8180\n");
 }
 

@@ -78,7 +78,7 @@ TEST_F(Moving, BothStepsAreOneDocumentForPrograms) {
     EXPECT_EQ(apply.status, 0);
     const auto document = parseJson(apply.output);
     ASSERT_TRUE(document) << apply.output;
-    EXPECT_THAT(apply.output, AllOf(HasSubstr("settings.shared_filesystem"), HasSubstr("properties.default_language")));
+    EXPECT_THAT(apply.output, AllOf(HasSubstr("\"shared_filesystem\""), HasSubstr("\"default_language\"")));
 }
 
 TEST_F(Moving, ListsAreNotChangedWhenTheStateIsNotReadCompletelyAfterTheMove) {

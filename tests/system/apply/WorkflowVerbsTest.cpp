@@ -74,10 +74,10 @@ TEST_F(WorkflowVerbs, NameOfSeveralIsRefusedWithTheirUuids) {
 
 TEST_F(WorkflowVerbs, UsersAndGroupsComeOnAndOffTheList) {
     EXPECT_EQ(in("fr_FR.UTF-8", {"workflow", "allow", "Publier au catalogue", "ben"}).output,
-              "workflows.\"Publier au catalogue\".users.ben: (not allowed) -> (allowed)\n");
+              "workflows.\"Publier au catalogue\".users.ben: (not allowed) -> (allowed): applied\n");
     EXPECT_EQ(in("C", {"workflow", "allow", "Workflows/Publish.workflow", "studio", "--group"}).status, 0);
     EXPECT_EQ(in("C", {"workflow", "deny", uuid("Publish"), "editors"}).output,
-              "workflows." + uuid("Publish") + ".groups.editors: (allowed) -> (not allowed)\n");
+              "workflows." + uuid("Publish") + ".groups.editors: (allowed) -> (not allowed): applied\n");
     EXPECT_EQ(access("Publish"), SampleRoot::uuidOf("group", "lecturers") + "\n" + SampleRoot::uuidOf("user", "ben") +
                                      "\n" + SampleRoot::uuidOf("group", "studio") + "\n");
     EXPECT_EQ(in("C", {"workflow", "allow", "Publish to Catalog", "ben"}).output, "no change\n");
@@ -127,7 +127,7 @@ TEST_F(WorkflowVerbs, FileIsAppliedOnceAndThenNothingChanges) {
     EXPECT_EQ(plan.status, 0);
     const std::string entry = "workflows." + uuid("Publish");
     for (const std::string& line :
-         {entry + ".access_control: true -> false\n", entry + ".users.anna: (not allowed) -> (allowed)\n",
+         {entry + ".access_control: yes -> no\n", entry + ".users.anna: (not allowed) -> (allowed)\n",
           entry + ".users.ben: (not allowed) -> (allowed)\n", entry + ".groups.lecturers: (allowed) -> (not allowed)\n",
           "workflows." + uuid("Removed") + ".users.carla: (not allowed) -> (allowed)\n"}) {
         EXPECT_THAT(plan.output, HasSubstr(line));
@@ -159,7 +159,8 @@ TEST_F(WorkflowVerbs, ConfigurationToolThatFailsIsNamed) {
     root.setSwitch("lumioconfig.exit", "3");
     const ProgramResult allow = in("C", {"workflow", "allow", "Publish to Catalog", "ben"});
     EXPECT_EQ(allow.status, 1);
-    EXPECT_THAT(allow.output, HasSubstr("not applied:\n  workflows.\"Publish to Catalog\".users.ben"));
+    EXPECT_THAT(allow.output,
+                HasSubstr("workflows.\"Publish to Catalog\".users.ben: (not allowed) -> (allowed): FAILED: "));
 }
 
 TEST_F(WorkflowVerbs, ListThatCannotBeReadIsNotExported) {

@@ -22,8 +22,8 @@ TEST(Journey, ShowsTheMainTasksOnTheSampleService) {
     EXPECT_THAT(demo.output, AllOf(ContainsRegex("\n *Im Katalog "), ContainsRegex("\n *Hörfolge "),
                                    ContainsRegex("\n *カタログに公開 "), ContainsRegex("\n *Picture in Picture ")));
     EXPECT_THAT(demo.output,
-                AllOf(HasSubstr("workflows.\"Publish to Catalog\".users.ben: (not allowed) -> (allowed)\n"),
-                      HasSubstr(".groups.editors: (allowed) -> (not allowed)\n"),
+                AllOf(HasSubstr("workflows.\"Publish to Catalog\".users.ben: (not allowed) -> (allowed): applied\n"),
+                      HasSubstr(".groups.editors: (allowed) -> (not allowed): applied\n"),
                       ContainsRegex("workflows +Publish to Catalog +in its list, through the group lecturers\n")));
     EXPECT_THAT(demo.output, HasSubstr("The daemon has stopped."));
 }
@@ -34,8 +34,8 @@ TEST(Journey, ShowsTheSameWithThePeopleInAnLdapServer) {
     EXPECT_THAT(demo.output, ContainsRegex("node +/LDAP\n"));
     EXPECT_THAT(demo.output,
                 AllOf(HasSubstr("Anna Lindqvist (user)"),
-                      HasSubstr("workflows.\"Publish to Catalog\".users.ben: (not allowed) -> (allowed)\n"),
-                      HasSubstr(".groups.editors: (allowed) -> (not allowed)\n"),
+                      HasSubstr("workflows.\"Publish to Catalog\".users.ben: (not allowed) -> (allowed): applied\n"),
+                      HasSubstr(".groups.editors: (allowed) -> (not allowed): applied\n"),
                       ContainsRegex("workflows +Publish to Catalog +in its list, through the group lecturers\n")));
 }
 

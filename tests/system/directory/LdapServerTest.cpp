@@ -64,11 +64,11 @@ TEST_F(LdapServer, AccessOfACameraIsShownAndChangedByTheNamesOfTheServer) {
     EXPECT_THAT(shown, HasSubstr("Anna of the Server"));
     EXPECT_THAT(shown, HasSubstr("lecturers"));
     EXPECT_EQ(ctl({"camera", "allow", "Main hall", "ben"}).output,
-              "cameras.\"Main hall\".users.ben: (not allowed) -> (allowed)\n");
+              "cameras.\"Main hall\".users.ben: (not allowed) -> (allowed): applied\n");
     EXPECT_EQ(ctl({"camera", "allow", "Main hall", "studio", "--group"}).output,
-              "cameras.\"Main hall\".groups.studio: (not allowed) -> (allowed)\n");
+              "cameras.\"Main hall\".groups.studio: (not allowed) -> (allowed): applied\n");
     EXPECT_EQ(ctl({"camera", "deny", "Main hall", "anna"}).output,
-              "cameras.\"Main hall\".users.anna: (allowed) -> (not allowed)\n");
+              "cameras.\"Main hall\".users.anna: (allowed) -> (not allowed): applied\n");
     EXPECT_EQ(ctl({"camera", "access", "Main hall", "off"}).status, 0);
     EXPECT_THAT(accessRows(), HasSubstr(SampleRoot::uuidOf("user", "ben")));
     EXPECT_THAT(accessRows(), HasSubstr(SampleRoot::uuidOf("group", "studio")));

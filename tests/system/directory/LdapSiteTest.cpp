@@ -62,7 +62,7 @@ TEST_F(LdapSite, WorkflowIsListedInFrenchAndItsAccessChangedForPeopleOfTheServer
     EXPECT_THAT(ctl({"--languages", "fr", "workflow", "list", "--names"}).output,
                 AllOf(HasSubstr("Publier au catalogue\n"), HasSubstr("Picture in Picture\n")));
     EXPECT_EQ(ctl({"--languages", "de", "workflow", "allow", "Bild im Bild", "greta"}).output,
-              "workflows.\"Bild im Bild\".users.greta: (not allowed) -> (allowed)\n");
+              "workflows.\"Bild im Bild\".users.greta: (not allowed) -> (allowed): applied\n");
     EXPECT_EQ(ctl({"workflow", "allow", uuid, "filmers", "--group"}).status, 0);
     const std::string juergen = SampleRoot::uuidOf("user", "juergen");
     EXPECT_EQ(listOf("Workflow", uuid), juergen + "\n" + greta + "\n" + filmers + "\n");
@@ -115,7 +115,7 @@ TEST_F(LdapSite, PeopleAreNotShownAsRemovedWhenTheServerFailsWithinTheWrite) {
     slapd.stop();
     const ProgramResult result = apply.get();
     EXPECT_EQ(result.status, 1);
-    EXPECT_THAT(result.output, ContainsRegex("not applied:\n  workflows[^\n]*users.greta: [^\n]*not removed"));
+    EXPECT_THAT(result.output, ContainsRegex("workflows[^\n]*users.greta: [^\n]*FAILED: [^\n]*not removed"));
     EXPECT_THAT(listOf("Workflow", uuid), HasSubstr(greta));
 }
 

@@ -205,7 +205,7 @@ TEST_F(ServiceVerbs, SettingWithoutATrialIsWrittenAndSaidToBeUntried) {
     const ProgramResult result = ctl({"settings", "set", "server_port", "8180", "--validate"});
     EXPECT_EQ(result.status, 0);
     EXPECT_THAT(result.output, AllOf(HasSubstr("shared file system: not tried: it does not depend on this setting\n"),
-                                     HasSubstr("settings.server_port: 8170 -> 8180\n")));
+                                     HasSubstr("settings.server_port: 8170 -> 8180: applied\n")));
 }
 
 TEST_F(ServiceVerbs, AccountInAnUnknownNodeIsAnErrorAndItsPasswordIsShownNowhere) {

@@ -240,7 +240,7 @@ TEST_F(Settings, RollbackNamesSettingsThatWereNotSetThenAndNotesThatThePasswordS
               200);
     const ProgramResult rollback = ctl({"rollback", "1"});
     EXPECT_EQ(rollback.status, 1) << "not all of it could be restored";
-    EXPECT_THAT(rollback.output, HasSubstr("settings.server_port: 9001 -> 8170\n"));
+    EXPECT_THAT(rollback.output, HasSubstr("settings.server_port: 9001 -> 8170: applied\n"));
     EXPECT_THAT(
         rollback.output,
         HasSubstr("settings.tunnel_agent_host: not set at that time; it cannot be removed and stays \"agent\"\n"));
@@ -263,7 +263,7 @@ TEST_F(Settings, RollbackOfSettingsThatAnotherClientChangesMeanwhileIsRefused) {
     }
     EXPECT_EQ(post("writeSettings", R"({"configuration":{"server_host":"other"}})").status, 200);
     restoring.join();
-    EXPECT_EQ(rollback.status, 1);
+    EXPECT_EQ(rollback.status, 7);
     EXPECT_THAT(rollback.output, HasSubstr("REVISION_CHANGED"));
     root.clearSwitches();
     EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "9001\n");
@@ -408,7 +408,7 @@ TEST_F(Settings, HistoryShowsEachWriteAndEachEditOutsideAsARowOfItsOwn) {
 
     const ProgramResult rollback = ctl({"rollback", "2"});
     EXPECT_EQ(rollback.status, 0) << rollback.output;
-    EXPECT_THAT(rollback.output, HasSubstr("settings.server_port: 9002 -> 9001\n"));
+    EXPECT_THAT(rollback.output, HasSubstr("settings.server_port: 9002 -> 9001: applied\n"));
     EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "9001\n");
 }
 

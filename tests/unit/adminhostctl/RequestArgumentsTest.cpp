@@ -28,6 +28,7 @@ struct Given {
     std::string typed;
     bool terminal = false;
     bool clear = false;
+    bool force = false;
 
     [[nodiscard]] Sources sources() const {
         return {[this](const std::string& path) {
@@ -37,7 +38,12 @@ struct Given {
                     }
                     return found->second;
                 },
-                [this](const std::string&) { return typed; }, terminal, clear};
+                [this](const std::string&) { return typed; },
+                terminal,
+                clear,
+                {},
+                {},
+                force};
     }
 };
 
@@ -156,7 +162,7 @@ TEST(BuildRequest, AKeyBelowAValueThatIsNotADictionaryIsAUsageError) {
 }
 
 TEST(BuildRequest, AKeyGivenTwiceIsAUsageError) {
-    EXPECT_THAT(usageOf("getState", {"variant=a", "variant=b"}), HasSubstr("given twice"));
+    EXPECT_THAT(usageOf("getState", {"variant=withDetails", "variant=b"}), HasSubstr("given twice"));
 }
 
 TEST(BuildRequest, WordsOfAnotherFormAreUsageErrors) {
@@ -166,8 +172,41 @@ TEST(BuildRequest, WordsOfAnotherFormAreUsageErrors) {
 }
 
 TEST(BuildRequest, AValueMayHoldTheSignsThatSeparate) {
-    EXPECT_EQ(build("getState", {"variant=a=b@c:=d"}), (Dictionary{{"variant", "a=b@c:=d"}}));
-    EXPECT_EQ(build("getState", {"variant="}), (Dictionary{{"variant", ""}}));
+    EXPECT_EQ(build("validateSettings", {"nimbo_controller=a=b@c:=d"}), (Dictionary{{"nimbo_controller", "a=b@c:=d"}}));
+    EXPECT_EQ(build("validateSettings", {"nimbo_controller="}), (Dictionary{{"nimbo_controller", ""}}));
+}
+
+TEST(BuildRequest, WordThatHasNoMeaningNeedsForce) {
+    EXPECT_THAT(usageOf("getState", {"variant=other"}),
+                HasSubstr("variant: other is not one of withDetails; --force writes it nevertheless"));
+    Given given;
+    given.force = true;
+    EXPECT_EQ(build("getState", {"variant=other"}, given), (Dictionary{{"variant", "other"}}));
+}
+
+TEST(ValueOfText, NumberMayHaveTheUnitOfItsKeyAndNoOther) {
+    DescribedKey key = keyOf("integer");
+    key.unit = "megabytes";
+    for (const char* const text : {"4096", "4096 MB", "4096mb", "4096 megabytes", "4096 megabyte"}) {
+        EXPECT_EQ(adminhost::ctl::valueOfText(key, text), Value(4096)) << text;
+    }
+    for (const char* const text : {"4 GB", "4096 M B", "MB", "4096 MB 1"}) {
+        EXPECT_THROW((void)adminhost::ctl::valueOfText(key, text), Failure) << text;
+    }
+    EXPECT_THAT(refused("integer", "4096 MB"), HasSubstr("is not a whole number")) << "a key without a unit";
+}
+
+TEST(ValueOfText, RangeIncludesItsBounds) {
+    DescribedKey key = keyOf("integer");
+    key.unit = "seconds";
+    key.minimum = 1;
+    key.maximum = 10;
+    EXPECT_EQ(adminhost::ctl::rangeProblem(key, Value(1)), "");
+    EXPECT_EQ(adminhost::ctl::rangeProblem(key, Value(10)), "");
+    EXPECT_EQ(adminhost::ctl::rangeProblem(key, Value(0)), "is below 1 s");
+    EXPECT_EQ(adminhost::ctl::rangeProblem(key, Value(11)), "is above 10 s");
+    EXPECT_EQ(adminhost::ctl::rangeProblem(key, Value(std::uint64_t{1} << 63U)), "is above 10 s");
+    EXPECT_EQ(adminhost::ctl::rangeProblem(keyOf("integer"), Value(-1)), "") << "without a range";
 }
 
 TEST(BuildRequest, ASecretIsRefusedOnTheCommandLine) {

@@ -119,8 +119,9 @@ TEST(Plan, NewSharedFileSystemSendsEveryWantedSettingOfTheFilesThatMoveWithIt) {
     EXPECT_EQ(
         plan.root,
         (Dictionary{{"shared_filesystem", "/new"}, {"server_port", 8170}, {"nimbo_controller", "grid.example.org"}}));
-    EXPECT_THAT(plan.notes, ElementsAre(HasSubstr("may not have them: server_host;"),
-                                        HasSubstr("nimbo_client_password: a secret, read from another file then")));
+    EXPECT_THAT(plan.consequences, ElementsAre(HasSubstr("may not have them: server_host;")));
+    EXPECT_THAT(plan.movedAlong, ElementsAre("server_host"));
+    EXPECT_THAT(plan.notes, ElementsAre(HasSubstr("nimbo_client_password: a secret, read from another file then")));
 }
 
 TEST(Plan, NewMemberSendsTheSettingsOfTheMembersFileOnly) {
