@@ -29,6 +29,7 @@ void Description::Keys::add(const Value& described) {
     description.unit = key->text("unit");
     description.column = key->text("column");
     description.help = key->text("help");
+    description.defaultKey = key->text("defaultKey");
     description.secret = key->get("secret").boolean().value_or(false);
     description.required = key->get("required").boolean().value_or(false);
     description.allowed = textsAt(*key, "allowed");

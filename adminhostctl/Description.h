@@ -24,6 +24,7 @@ struct DescribedKey {
     std::string unit;
     std::string column;  ///< heading in tables; empty: not shown in one
     std::string help;
+    std::string defaultKey;  ///< of a setting in an answer: the key there that holds its default; empty: not known
     std::vector<std::string> allowed;
     std::optional<std::int64_t> minimum;  ///< of the sensible range of a number
     std::optional<std::int64_t> maximum;

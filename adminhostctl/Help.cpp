@@ -13,15 +13,6 @@ namespace {
 
 using Words = std::span<const std::string>;
 
-std::string typeText(const DescribedKey& key) {
-    const std::string type = key.enteredAs.empty() ? key.type : key.enteredAs;
-    return type == "integer"                   ? "whole number"
-           : type == "real"                    ? "number"
-           : type == "boolean"                 ? "yes or no"
-           : type == "scalar" || type == "any" ? "text"
-                                               : type;
-}
-
 /// Key paths are long and cannot be broken: each has a line of its own, with its meaning below.
 std::string keyList(const std::vector<DescribedKey>& keys, std::size_t width) {
     constexpr std::size_t indent = 6;
@@ -120,6 +111,15 @@ void helpOfAll(const Context& context) {
 }
 
 }  // namespace
+
+std::string typeText(const DescribedKey& key) {
+    const std::string type = key.enteredAs.empty() ? key.type : key.enteredAs;
+    return type == "integer"                   ? "whole number"
+           : type == "real"                    ? "number"
+           : type == "boolean"                 ? "yes or no"
+           : type == "scalar" || type == "any" ? "text"
+                                               : type;
+}
 
 ExitStatus help(const Context& context, Words arguments) {
     if (arguments.empty()) {

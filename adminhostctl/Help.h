@@ -13,4 +13,7 @@ namespace adminhost::ctl {
 /// a command, its keys with types and units, its answer and an example. Only commands need the daemon.
 [[nodiscard]] ExitStatus help(const Context& context, std::span<const std::string> arguments);
 
+/// The key's type for people: "whole number".
+[[nodiscard]] std::string typeText(const DescribedKey& key);
+
 }  // namespace adminhost::ctl

@@ -55,7 +55,7 @@ STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_fi
 # Unit and sensible range of a setting's number; described where the setting is read.
 RANGE_WORDS = {"unit", "minimum", "maximum"}
 KEY_WORDS = {"type", "entered_as", "filled_with", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"} | STATE_WORDS | RANGE_WORDS
-ANSWER_WORDS = {"type", "secret", "column", "help", "title", "kind"} | RANGE_WORDS
+ANSWER_WORDS = {"type", "secret", "column", "help", "title", "kind", "default_key"} | RANGE_WORDS
 ENTRY_WORDS = {"added_by", "removed_by", "first", "leading_zeros", "otherwise", "added_kinds", "columns", "together"}
 
 
@@ -241,9 +241,9 @@ def key_description(path, key):
     for word in ("allowed", "rules"):
         if key.get(word):
             described[word] = key[word]
-    for word in ("unit", "minimum", "maximum", "column", "title"):
+    for word in ("unit", "minimum", "maximum", "column", "title", "default_key"):
         if word in key:
-            described[word] = key[word]
+            described[camel(word)] = key[word]
     for word in sorted(STATE_WORDS):
         if key.get(word):
             described[camel(word)] = key[word]

@@ -4,6 +4,7 @@
 #include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/DesiredFile.h"
+#include "adminhostctl/desired/Explain.h"
 #include "adminhostctl/desired/LookingBack.h"
 #include "adminhostctl/desired/Trial.h"
 #include "adminhostctl/desired/Writing.h"
@@ -136,6 +137,13 @@ constexpr std::array table = {
          1,
          &settingsGet,
          {{"settings get", "settings get server_port"}}},
+    Verb{"explain",
+         "KEY",
+         "Explain a setting: unit, range, default, restart, last change",
+         1,
+         1,
+         &explain,
+         {{"explain server_port", "--format json explain shared_filesystem"}}},
     Verb{"settings set",
          "KEY [VALUE|@FILE|@-] [--clear] [--force] [--dry-run] [--validate [--password-file FILE]]",
          "Change a setting",
