@@ -28,11 +28,6 @@ bool beginsWithHyphen(const adminhost::HostPath& database) noexcept {
     return database.text().starts_with('-');
 }
 
-adminhost::TaskPlan planFor(const adminhost::HostPath& database, const std::string& statement) {
-    const std::string file = adminhost::diskPath(database).text();
-    return databaseToolPlan(database, {"-line", (file.starts_with('-') ? "./" : "") + file, statement});
-}
-
 }  // namespace
 
 std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
@@ -66,8 +61,13 @@ std::vector<Dictionary> recordsOfLineOutput(std::string_view output) {
     return records;
 }
 
+adminhost::TaskPlan planOf(const adminhost::HostPath& database, const std::string& statement) {
+    const std::string file = adminhost::diskPath(database).text();
+    return databaseToolPlan(database, {"-line", (file.starts_with('-') ? "./" : "") + file, statement});
+}
+
 adminhost::TaskPlan planOf(const std::string& statement) {
-    return planFor(SettingsStore::dbPath(), statement);
+    return planOf(SettingsStore::dbPath(), statement);
 }
 
 static adminhost::Result<std::string> outputOf(adminhost::TaskResult result) {
@@ -89,7 +89,7 @@ adminhost::Result<std::string> statementOutput(const std::string& statement,
             Error{"sqliteQuery", 1, failed + ("Error: the database path begins with a hyphen: " + database.text())});
     }
     adminhost::TaskGroup tool;
-    adminhost::TaskPlan plan = planFor(database, statement);
+    adminhost::TaskPlan plan = planOf(database, statement);
     plan.outputGrows = std::move(outputGrows);
     return outputOf(tool.collect(tool.start(std::move(plan))));
 }

@@ -27,8 +27,10 @@ namespace lumio {
 /// the empty text); empty if the statement prints nothing. Rows printed before a failure are dropped.
 [[nodiscard]] adminhost::Result<std::vector<adminhost::Dictionary>> runStatement(const std::string& statement);
 
-/// The plan of the tool's run for the statement.
+/// The plan of the tool's run for the statement, on the database at SettingsStore::dbPath().
 [[nodiscard]] adminhost::TaskPlan planOf(const std::string& statement);
+/// The same on a given database, for many statements: looking for the path reads settings files.
+[[nodiscard]] adminhost::TaskPlan planOf(const adminhost::HostPath& database, const std::string& statement);
 /// What runStatement() returns for the result of that run.
 [[nodiscard]] adminhost::Result<std::vector<adminhost::Dictionary>> rowsOf(adminhost::TaskResult result);
 /// The failure of a listing whose database does not exist. Listings check first, because the tool would create an empty

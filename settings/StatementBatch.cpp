@@ -1,5 +1,7 @@
 #include "settings/StatementBatch.h"
 
+#include "settings/SettingsStore.h"
+
 #include <algorithm>
 #include <chrono>
 #include <thread>
@@ -23,7 +25,8 @@ constexpr std::int32_t locked = 5;
 }  // namespace
 
 StatementBatch::StatementBatch(std::vector<std::string> statements, std::size_t atOnce)
-    : _statements(std::move(statements)),
+    : _database(SettingsStore::dbPath()),
+      _statements(std::move(statements)),
       _atOnce(atOnce != 0 ? atOnce : std::clamp<std::size_t>(std::thread::hardware_concurrency(), 1, mostAtOnce)) {
     _atOnce = std::min(_atOnce, std::max<std::size_t>(_statements.size(), 1));
     _tasks.reserve(_statements.size());
@@ -37,7 +40,7 @@ std::size_t StatementBatch::running() const {
 
 void StatementBatch::startMore() {
     while (_tasks.size() < _statements.size() && _tasks.size() < _next + mostUntaken && running() < _atOnce) {
-        _tasks.push_back(_group.start(planOf(_statements[_tasks.size()])));
+        _tasks.push_back(_group.start(planOf(_database, _statements[_tasks.size()])));
     }
 }
 
@@ -59,7 +62,7 @@ TaskResult StatementBatch::runAlone() {
             serve();
         }
     }
-    return _group.collect(_group.start(planOf(_statements[_next])));
+    return _group.collect(_group.start(planOf(_database, _statements[_next])));
 }
 
 adminhost::Result<std::vector<Dictionary>> StatementBatch::next() {

@@ -4,8 +4,10 @@
 //
 // The results are those of runStatement() for each statement in turn, and are returned in that order. As many tools run
 // at once as there are processors, at most 8. At most 64 results are kept until their turn. All share the request's
-// deadline and one bound on captured bytes. With one statement or one processor the tools run one after the other.
+// deadline, one bound on captured bytes, and the database whose path is known when the batch is made. With one
+// statement or one processor the tools run one after the other.
 
+#include "platform/files/Path.h"
 #include "platform/task/TaskGroup.h"
 #include "settings/QueryRunner.h"
 
@@ -29,6 +31,7 @@ class StatementBatch {
     [[nodiscard]] std::size_t running() const;
     [[nodiscard]] adminhost::TaskResult runAlone();
 
+    adminhost::HostPath _database;
     std::vector<std::string> _statements;
     std::size_t _atOnce;
     std::vector<adminhost::TaskGroup::Id> _tasks;  ///< of the statements that were started, in their order

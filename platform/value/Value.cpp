@@ -10,8 +10,10 @@ namespace {
 /// Up to this many keys a look-up compares keys one by one. An index would be as fast, but needs more memory than the
 /// entries of a database row.
 constexpr std::size_t linearLimit = 32;
-/// Entries by which a dictionary grows up to that limit. Doubling would leave half of the memory of many rows unused.
-constexpr std::size_t growth = 8;
+/// Entries for which a dictionary has room at first, and by which it grows afterwards up to that limit. Doubling would
+/// leave much of the memory of many rows unused.
+constexpr std::size_t firstRoom = 8;
+constexpr std::size_t growth = 4;
 constexpr std::size_t notFound = static_cast<std::size_t>(-1);
 const Value nullValue;
 
@@ -115,7 +117,7 @@ void Dictionary::set(std::string_view key, Value value) {
 
 void Dictionary::append(std::string_view key, Value value) {
     if (_entries.size() == _entries.capacity() && _entries.size() < linearLimit) {
-        _entries.reserve(_entries.size() + growth);
+        _entries.reserve(_entries.empty() ? firstRoom : _entries.size() + growth);
     }
     std::string copiedKey(key);
     DictionaryEntry& entry = _entries.emplace_back();

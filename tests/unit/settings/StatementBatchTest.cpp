@@ -39,6 +39,7 @@ killed) kill -KILL $$ ;;
 failing) echo "Error: no such table" >&2; exit 1 ;;
 locked) [ -e "$directory/unlocked" ] || { touch "$directory/unlocked"; echo "Error: database is locked (5)" >&2; exit 5; } ;;
 always) echo "Error: database is locked (5)" >&2; exit 5 ;;
+waiting) until [ "$(grep -c '^waiting' "$directory/calls")" -ge 3 ]; do sleep 0.01; done ;;
 hanging) echo $$ >"$directory/process"; exec sleep 60 ;;
 esac
 printf '   id = %s\nvalue = %s\n' "$2" "$1"
@@ -101,7 +102,13 @@ TEST_F(StatementBatchTest, ResultsAndStatementsAreThoseOfRunningInTurn) {
 }
 
 TEST_F(StatementBatchTest, RunsAsManyAtATimeAsAllowed) {
-    static_cast<void>(inBatch(statements(20), 3));
+    // The first three end only when all three are running.
+    std::vector<std::string> list;
+    for (int i = 0; i < 20; ++i) {
+        list.push_back("waiting " + std::to_string(i));
+    }
+    adminhost::setTaskDeadline(std::chrono::steady_clock::now() + 120s);
+    static_cast<void>(inBatch(list, 3));
     std::size_t running = 0;
     std::size_t most = 0;
     for (const std::string& line : calls()) {
