@@ -1,5 +1,6 @@
 #include "adminhostd/FrontRights.h"
 
+#include "platform/files/Path.h"
 #include "platform/task/Confinement.h"
 
 #include <cerrno>
@@ -7,7 +8,9 @@
 #include <filesystem>
 #include <memory>
 #include <stdexcept>
+#include <string>
 #include <system_error>
+#include <vector>
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -65,6 +68,7 @@ void confineFiles(const Options& options) {
     std::vector<std::string> readable = {"/etc",        "/usr",           "/lib",      "/lib64",
                                          "/proc",       "/sys/fs/cgroup", "/run/nscd", "/run/systemd/userdb",
                                          "/var/lib/sss"};
+    readable.push_back(diskPath(HostPath("/etc")).text());  // accounts below another root
     if (!options.configuration.empty()) {
         // The directory: an editor replaces the file.
         readable.push_back(std::filesystem::path(options.configuration).parent_path());

@@ -5,6 +5,8 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <cstddef>
+#include <cstdlib>
 #include <cstring>
 #include <stdexcept>
 #include <thread>
@@ -165,6 +167,50 @@ ListeningSocket::ListeningSocket(std::string path, gid_t group) : _path(std::mov
     }
     _device = status.st_dev;
     _inode = status.st_ino;
+}
+
+ListeningSocket::ListeningSocket(FileDescriptor inherited, const std::string& path) : _socket(std::move(inherited)) {
+    const auto number = [&](int option) {
+        int value = -1;
+        socklen_t size = sizeof value;
+        return ::getsockopt(_socket.get(), SOL_SOCKET, option, &value, &size) == 0 ? value : -1;
+    };
+    if (number(SO_DOMAIN) != AF_UNIX || number(SO_TYPE) != SOCK_STREAM || number(SO_ACCEPTCONN) != 1) {
+        fail(
+            "the service manager passes something else than a listening Unix stream socket; use ListenStream= with a "
+            "path in adminhostd.socket");
+    }
+    sockaddr_un address{};
+    socklen_t size = sizeof address;
+    if (::getsockname(_socket.get(), reinterpret_cast<sockaddr*>(&address), &size) != 0) {
+        failWithErrno("the name of the service manager's socket");
+    }
+    const std::string place(address.sun_path, ::strnlen(address.sun_path, size - offsetof(sockaddr_un, sun_path)));
+    if (place != path) {
+        fail(
+            fmt::format("the service manager's socket is \"{}\", and the daemon's is {}; ListenStream= in "
+                        "adminhostd.socket and the daemon's configuration must name the same path",
+                        place, path));
+    }
+    ::fcntl(_socket.get(), F_SETFL, O_NONBLOCK);
+    ::fcntl(_socket.get(), F_SETFD, FD_CLOEXEC);
+}
+
+FileDescriptor inheritedSocket() {
+    constexpr int first = 3;
+    const auto numberIn = [](const char* name) {
+        const char* const text = std::getenv(name);
+        return text == nullptr ? 0 : std::atoi(text);
+    };
+    const bool ours = numberIn("LISTEN_PID") == ::getpid();
+    const int count = ours ? numberIn("LISTEN_FDS") : 0;
+    for (const char* name : {"LISTEN_PID", "LISTEN_FDS", "LISTEN_FDNAMES"}) {
+        ::unsetenv(name);
+    }
+    if (count > 1) {
+        fail(fmt::format("the service manager passes {} sockets; name one in adminhostd.socket", count));
+    }
+    return FileDescriptor(count == 1 ? first : -1);
 }
 
 void ListeningSocket::remove() noexcept {

@@ -24,6 +24,9 @@ class ListeningSocket {
 
     /// Throws std::runtime_error with a description and a suggested fix.
     ListeningSocket(std::string path, gid_t group);
+    /// Serves a socket that the service manager has created. It must listen at the path, which stays there at the end.
+    /// Throws as above.
+    ListeningSocket(FileDescriptor inherited, const std::string& path);
     ListeningSocket(const ListeningSocket&) = delete;
     ListeningSocket& operator=(const ListeningSocket&) = delete;
     ~ListeningSocket() { remove(); }
@@ -40,6 +43,10 @@ class ListeningSocket {
     dev_t _device = 0;
     ino_t _inode = 0;
 };
+
+/// The socket that the service manager passes to this process (LISTEN_FDS); empty if it passes none. Removes the
+/// variables, so that no child believes that the socket is its own. Throws std::runtime_error if it passes several.
+[[nodiscard]] FileDescriptor inheritedSocket();
 
 /// The group's number; ListeningSocket::sameGroup for an empty name. Throws std::runtime_error for an unknown group.
 [[nodiscard]] gid_t groupOf(const std::string& name);

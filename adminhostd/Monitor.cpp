@@ -324,11 +324,25 @@ void Monitor::sendToFront(const MonitorMessage& message, std::span<const int> de
     }
 }
 
+ListeningSocket listeningSocket(const Options& options) {
+    FileDescriptor inherited = inheritedSocket();
+    if (!inherited.isOpen()) {
+        return {socketPath(options), groupOf(options.socketGroup)};
+    }
+    if (!options.socketGroup.empty()) {
+        throw std::runtime_error(
+            "socket_group is set, but the service manager creates the socket; set SocketGroup= in adminhostd.socket "
+            "and "
+            "remove socket_group from the configuration");
+    }
+    return {std::move(inherited), socketPath(options)};
+}
+
 }  // namespace
 
 int runMonitor(const Options& options, std::vector<std::string> arguments) {
     setLogSink(options.logToStandardError ? standardErrorSink() : syslogSink());
-    ListeningSocket socket(socketPath(options), groupOf(options.socketGroup));
+    ListeningSocket socket = listeningSocket(options);
     removeAbandonedDirectories(privateParent(options));
     const ToolConfiguration tools(privateParent(options));
     const int status = Monitor(options, std::move(arguments), socket, tools.directory()).run();
