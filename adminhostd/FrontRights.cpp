@@ -56,11 +56,13 @@ void dropCapabilities() {
     require(::syscall(SYS_capset, &header, none) == 0, "capabilities");
 }
 
-void confineFiles(const Options& options) {
+/// The files that the front may read; nullopt where the kernel has no Landlock. Created with the rights that the front
+/// has at its start, because it may not enter every directory afterwards.
+std::optional<Confinement> readableFiles(const Options& options) {
     if (!Confinement::isAvailable()) {
-        return;
+        return std::nullopt;
     }
-    const auto confinement = Confinement::create();
+    auto confinement = Confinement::create();
     if (!confinement) {
         fail("Landlock", static_cast<int>(confinement.error().code));
     }
@@ -68,17 +70,18 @@ void confineFiles(const Options& options) {
     std::vector<std::string> readable = {"/etc",        "/usr",           "/lib",      "/lib64",
                                          "/proc",       "/sys/fs/cgroup", "/run/nscd", "/run/systemd/userdb",
                                          "/var/lib/sss"};
-    readable.push_back(diskPath(HostPath("/etc")).text());  // accounts below another root
     if (!options.configuration.empty()) {
         // The directory: an editor replaces the file.
         readable.push_back(std::filesystem::path(options.configuration).parent_path());
     }
+    readable.push_back(diskPath(HostPath("/etc")).text());  // accounts below another root
     for (const std::string& path : readable) {
-        if (const int number = confinement->allowIfPresent(path, Confinement::Access::read); number != 0) {
+        const int number = confinement->allowIfPresent(path, Confinement::Access::read);
+        if (number != 0 && number != EACCES) {  // what cannot be reached now cannot be read later either
             fail(path.c_str(), number);
         }
     }
-    require(::syscall(SYS_landlock_restrict_self, confinement->descriptor(), 0) == 0, "Landlock");
+    return *std::move(confinement);
 }
 
 /// Calls that are allowed whatever their arguments.
@@ -259,6 +262,7 @@ std::optional<FrontAccount> frontAccount(const Options& options) {
 }
 
 void dropFrontRights(const std::optional<FrontAccount>& account, const Options& options) {
+    const auto readable = readableFiles(options);
     dropBoundingSet(account.has_value());
     if (account) {
         require(::setgroups(0, nullptr) == 0, "groups");
@@ -270,7 +274,9 @@ void dropFrontRights(const std::optional<FrontAccount>& account, const Options& 
     }
     dropCapabilities();
     require(::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0, "no new privileges");
-    confineFiles(options);
+    if (readable) {
+        require(::syscall(SYS_landlock_restrict_self, readable->descriptor(), 0) == 0, "Landlock");
+    }
     filterSystemCalls();
 }
 
