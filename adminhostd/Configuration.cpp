@@ -28,9 +28,38 @@ constexpr std::string_view knownKeys[] = {"plugins",
                                           "request_deadline_seconds",
                                           "client_timeout_seconds",
                                           "queue_limit",
+                                          "body_limit_bytes",
+                                          "values_limit",
+                                          "depth_limit",
+                                          "head_limit_bytes",
+                                          "connection_limit",
                                           "log",
                                           "directory",
                                           "permission"};
+
+/// Applies a key that bounds requests. Returns false for any other key.
+bool applyBound(const ConfigurationEntry& entry, RequestBounds& bounds) {
+    constexpr std::int64_t kibibyte = 1024;
+    const auto number = [&](std::int64_t least, std::int64_t most) {
+        return static_cast<std::size_t>(entry.wholeNumber(least, most));
+    };
+    if (entry.key() == "body_limit_bytes") {
+        bounds.bodyBytes = number(kibibyte, 64 * kibibyte * kibibyte);
+    } else if (entry.key() == "values_limit") {
+        bounds.body.values = number(100, 10'000'000);
+    } else if (entry.key() == "depth_limit") {
+        bounds.body.depth = number(1, 512);
+    } else if (entry.key() == "head_limit_bytes") {
+        bounds.headBytes = number(kibibyte, kibibyte * kibibyte);
+    } else if (entry.key() == "connection_limit") {
+        bounds.connections = number(2, 4096);
+    } else if (entry.key() == "client_timeout_seconds") {
+        bounds.clientTimeout = std::chrono::seconds(std::llround(std::ceil(entry.seconds())));
+    } else {
+        return false;
+    }
+    return true;
+}
 
 void apply(const ConfigurationEntry& entry, Options& options) {
     constexpr std::int64_t longestQueue = 10'000;
@@ -56,8 +85,6 @@ void apply(const ConfigurationEntry& entry, Options& options) {
         options.serviceManager = entry.choice<std::string>({{"systemd", "systemd"}, {"pidfile", "pidfile"}});
     } else if (entry.key() == "request_deadline_seconds") {
         options.deadline = std::chrono::milliseconds(std::llround(std::ceil(entry.seconds() * 1000)));
-    } else if (entry.key() == "client_timeout_seconds") {
-        options.clientTimeout = std::chrono::seconds(std::llround(std::ceil(entry.seconds())));
     } else if (entry.key() == "queue_limit") {
         options.queueLimit = static_cast<std::size_t>(entry.wholeNumber(0, longestQueue));
     } else if (entry.key() == "log") {
@@ -66,7 +93,7 @@ void apply(const ConfigurationEntry& entry, Options& options) {
         readDirectory(entry, options.directory);
     } else if (entry.key() == "permission") {
         readPermissions(entry, options.permissions);
-    } else {
+    } else if (!applyBound(entry, options.bounds)) {
         entry.rejectAsUnknown(knownKeys);
     }
 }

@@ -4,7 +4,7 @@
 
 namespace adminhost {
 
-ConnectionLimits::ConnectionLimits(std::size_t descriptors) noexcept
+ConnectionLimits::ConnectionLimits(std::size_t descriptors, std::size_t maximum) noexcept
     : _total(descriptors > ownDescriptors ? std::min(descriptors - ownDescriptors, maximum) : 1),
       _others(std::max<std::size_t>(_total - std::min(rootReserve, _total / 2), 1)),
       _perAccount(std::max<std::size_t>(_others / 2, 1)) {}

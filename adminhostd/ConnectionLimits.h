@@ -13,13 +13,12 @@ namespace adminhost {
 /// root, and one of them alone may have half of the rest, so that no account can lock out the others.
 class ConnectionLimits {
   public:
-    static constexpr std::size_t maximum = 256;        ///< in total
     static constexpr std::size_t rootReserve = 16;     ///< of them, for root only
     static constexpr std::size_t ownDescriptors = 16;  ///< that the daemon needs besides its connections
 
-    /// `descriptors` is how many the process may have open. If there are few, the numbers above shrink, to 1 in total
-    /// at the least.
-    explicit ConnectionLimits(std::size_t descriptors) noexcept;
+    /// `descriptors` is how many the process may have open, `maximum` how many connections in total. If there are few
+    /// descriptors, all numbers shrink, to 1 in total at the least.
+    ConnectionLimits(std::size_t descriptors, std::size_t maximum) noexcept;
 
     [[nodiscard]] std::size_t total() const noexcept { return _total; }
     /// For all accounts but root together.

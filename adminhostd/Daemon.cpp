@@ -14,7 +14,10 @@
 #include <algorithm>
 #include <csignal>
 #include <optional>
+#include <stdexcept>
+#include <string>
 #include <thread>
+#include <vector>
 
 #include <fmt/format.h>
 #include <sys/signalfd.h>
@@ -43,11 +46,31 @@ FileDescriptor stopSignals() {
     return FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
 }
 
+/// Gives the settings that only a start can change their old values. Returns the keys of those that differed.
+std::vector<std::string> keepFixedSettings(Options& read, const Options& old) {
+    std::vector<std::string> keys;
+    const auto keep = [&](const char* key, auto& now, const auto& before) {
+        if (now != before) {
+            keys.emplace_back(key);
+            now = before;
+        }
+    };
+    keep("socket", read.socket, old.socket);
+    keep("socket_group", read.socketGroup, old.socketGroup);
+    keep("log", read.logToStandardError, old.logToStandardError);
+    keep("client_timeout_seconds", read.bounds.clientTimeout, old.bounds.clientTimeout);
+    keep("head_limit_bytes", read.bounds.headBytes, old.bounds.headBytes);
+    keep("connection_limit", read.bounds.connections, old.bounds.connections);
+    return keys;
+}
+
 class Daemon {
   public:
     Daemon(const Options& options, const PluginSelection& plugins, const std::string& toolDirectory, FrontChecks checks,
            Permissions permissions, FileDescriptor link, FileDescriptor listener)
         : _options(options),
+          _plugins(plugins),
+          _toolDirectory(toolDirectory),
           _monitor(std::move(link)),
           _listener(std::move(listener)),
           _signals(stopSignals()),
@@ -58,7 +81,8 @@ class Daemon {
         for (;;) {
             // Clients that connect before the first worker is ready wait in the socket's backlog.
             if (!_server && _front.queue().settled() && !_stopping) {
-                _server.emplace(std::move(_listener), _options.clientTimeout,
+                _front.setBodyBounds(_options.bounds.body);
+                _server.emplace(std::move(_listener), _options.bounds,
                                 [this](Exchange& exchange) { return _front.head(exchange); });
                 notify("READY=1");
             }
@@ -70,6 +94,9 @@ class Daemon {
             _front.events().run();
             if (_signalled || _monitor.closed()) {
                 stop();
+            }
+            if (_reload && !_stopping) {
+                reload();
             }
             if (_server) {
                 _server->run();
@@ -104,10 +131,46 @@ class Daemon {
     }
 
     void readSignals() {
-        signalfd_siginfo ignored{};
-        while (::read(_signals.get(), &ignored, sizeof ignored) > 0) {
+        signalfd_siginfo signal{};
+        while (::read(_signals.get(), &signal, sizeof signal) > 0) {
+            if (signal.ssi_signo == SIGHUP) {
+                _reload = true;
+            } else {
+                _signalled = true;
+            }
         }
-        _signalled = true;
+    }
+
+    /// Reads the configuration again. Requests that wait or run are not touched.
+    void reload() {
+        _reload = false;
+        Options read;
+        try {
+            read = readOptionsAgain(_options.arguments);
+        } catch (const std::runtime_error& error) {
+            logEvent(fmt::format("adminhostd: the configuration was not read again, the old one stays in effect: {}",
+                                 error.what()));
+            return;
+        }
+        for (const std::string& key : keepFixedSettings(read, _options)) {
+            logEvent(fmt::format("adminhostd: {} cannot be changed while the daemon is running; restart it", key));
+        }
+        if (read.plugins != _options.plugins || read.pluginDirectory != _options.pluginDirectory) {
+            _plugins = selectPlugins(read);
+        }
+        std::optional<Permissions> permissions;
+        if (read.permissions != _options.permissions) {
+            permissions.emplace(read.permissions, _front.permissions().own(), configurationFile(read));
+        }
+        _options = std::move(read);
+        _front.reconfigure(FrontChecks(_options), std::move(permissions), _plugins.refused);
+        _front.setBodyBounds(_options.bounds.body);
+        if (_server) {
+            _server->setBodyMaximum(_options.bounds.bodyBytes);
+        }
+        logEvent("adminhostd: the configuration has been read again");
+        _front.queue().reconfigure(workerConfiguration(_options, _plugins, _toolDirectory), _options.queueLimit,
+                                   _options.deadline);
     }
 
     void stop() {
@@ -140,13 +203,16 @@ class Daemon {
         return !_server || _server->open() == 0 || Clock::now() >= *_stopBy;
     }
 
-    const Options& _options;
+    Options _options;
+    PluginSelection _plugins;
+    std::string _toolDirectory;
     MonitorLink _monitor;
     FileDescriptor _listener;  ///< until there is a server
     FileDescriptor _signals;
     Front _front;
     std::optional<HttpServer> _server;
     bool _signalled = false;
+    bool _reload = false;
     bool _stopping = false;
     std::optional<Clock::time_point> _stopBy;  ///< the end of the wait for clients, once no operation runs
     std::vector<pollfd> _entries;

@@ -85,6 +85,18 @@ Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlu
     }
 }
 
+void Front::reconfigure(FrontChecks checks, std::optional<Permissions> permissions,
+                        std::vector<protocol::RefusedPlugin> refused) {
+    _checks = std::move(checks);
+    _refused = std::move(refused);
+    if (permissions) {
+        _permissions = *std::move(permissions);
+        for (const std::string& problem : _permissions.problems()) {
+            logEvent("adminhostd: " + problem);
+        }
+    }
+}
+
 std::vector<protocol::RefusedPlugin> Front::refusedPlugins() const {
     std::vector<protocol::RefusedPlugin> refused = _refused;
     if (_hello) {

@@ -37,6 +37,14 @@ class Front {
     /// The clients that wait for events.
     [[nodiscard]] EventClients& events() noexcept { return _events; }
 
+    /// Changes what a body may hold.
+    void setBodyBounds(const BodyBounds& bounds) noexcept { _bodyBounds = bounds; }
+    /// Applies a configuration that has been read again, from the next request on. Without permissions, those that are
+    /// in effect stay.
+    void reconfigure(FrontChecks checks, std::optional<Permissions> permissions,
+                     std::vector<protocol::RefusedPlugin> refused);
+    [[nodiscard]] const Permissions& permissions() const noexcept { return _permissions; }
+
     /// Handles a request whose head has arrived. Returns the answer if it needs no body (not permitted, not found,
     /// malformed), else the function that serves it once its body is there: at once, or, for an operation, after it has
     /// run. Permission, address and id are checked here only.
@@ -77,6 +85,7 @@ class Front {
     void end(const Operation& operation, HttpAnswer answer, std::string_view code);
 
     FrontChecks _checks;
+    BodyBounds _bodyBounds;
     Permissions _permissions;
     AccountNames _names;
     RequestLog _log;

@@ -54,11 +54,14 @@ void Front::operation(Exchange& exchange, const Target& target) {
     }
     const Command& command = *commandOf(target);
     BodyProblem problem;
-    auto request = requestOf(exchange.body(), *bodyFormOf(exchange.header("Content-Type").value_or("")), problem);
+    auto request =
+        requestOf(exchange.body(), *bodyFormOf(exchange.header("Content-Type").value_or("")), problem, _bodyBounds);
     exchange.dropBody();
     if (!request) {
-        return refuse(problem.tooManyValues ? errorAnswer(413, "BODY_TOO_LARGE", problem.text)
-                                            : errorAnswer(400, "MALFORMED_BODY", problem.text));
+        using Kind = BodyProblem::Kind;
+        return refuse(problem.kind == Kind::tooManyValues ? errorAnswer(413, "BODY_TOO_LARGE", problem.text)
+                      : problem.kind == Kind::tooDeep     ? errorAnswer(413, "BODY_TOO_DEEP", problem.text)
+                                                          : errorAnswer(400, "MALFORMED_BODY", problem.text));
     }
     const auto ifMatch = exchange.header("If-Match");
     auto revisions = revisionsOf(ifMatch.value_or("*"));

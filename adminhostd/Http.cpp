@@ -27,13 +27,15 @@ using namespace std::chrono_literals;
 constexpr int acceptedAtOnce = 64;  ///< connections in one turn, so that a flood of them does not hold up the others
 constexpr auto shortagePause = 1s;  ///< until the next try when no descriptor is free
 constexpr auto logPause = 60s;      ///< between two events about the same kind of refusal
+constexpr std::size_t answerPiece = std::size_t{1} << 20U;  ///< bytes that a client has the time-out to read
 /// Freed buffers of at least this size are worth returning to the system.
 constexpr std::size_t largeBuffer = std::size_t{1} << 20U;
-constexpr std::size_t headMaximum = std::size_t{32}
-                                    << 10U;  ///< bytes of a request's head and what the library keeps with it
-/// A body of unknown length that exceeds the bound is read and dropped up to this size, so that the client gets its
-/// answer.
-constexpr std::size_t discardMaximum = 4 * bodyMaximum;
+/// What the library keeps of a request beside its head. A head that exceeds the bound by no more than this is answered
+/// like any other error, a longer one by the library itself.
+constexpr std::size_t headReserve = std::size_t{32} << 10U;
+/// A body of unknown length that exceeds the bound is read and dropped up to so many times this size, so that the
+/// client gets its answer.
+constexpr std::size_t discardFactor = 4;
 
 // The library takes a connection over at once, and reports it, only if it knows that no other thread calls it. Before
 // this version it needs no flag for that.
@@ -58,10 +60,10 @@ bool worthLogging(std::optional<std::chrono::steady_clock::time_point>& last) {
     return true;
 }
 
-HttpAnswer bodyTooLarge() {
+HttpAnswer bodyTooLarge(std::size_t maximum) {
     return {413,
             Dictionary{{"error", "BODY_TOO_LARGE"},
-                       {"message", fmt::format("The request's body may have {} bytes at most.", bodyMaximum)}},
+                       {"message", fmt::format("The request's body may have {} bytes at most.", maximum)}},
             {}};
 }
 
@@ -131,6 +133,7 @@ struct HttpServer::Callbacks {
         if (Client* client = clientOf(connection)) {
             client->receiving = true;
             client->since = Clock::now();
+            client->readBy.reset();
         }
     }
 
@@ -145,24 +148,24 @@ struct HttpServer::Callbacks {
     }
 };
 
-HttpServer::HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeout, Head head)
+HttpServer::HttpServer(FileDescriptor listener, const RequestBounds& bounds, Head head)
     : _listener(std::move(listener)),
-      _clientTimeout(clientTimeout),
+      _bounds(bounds),
       _head(std::move(head)),
-      _limits(descriptorMaximum()),
+      _limits(descriptorMaximum(), bounds.connections),
       // Different after each start, so that an id from a log names one request only.
       _idPrefix(makeUUIDString().substr(0, 8)) {
     // The library does not accept by itself: it would stop for good after it has run out of connections or descriptors,
     // and it does not know which account a connection comes from.
     _daemon = ::MHD_start_daemon(MHD_USE_EPOLL | MHD_USE_NO_LISTEN_SOCKET | MHD_ALLOW_SUSPEND_RESUME | oneThread, 0,
-                                 nullptr, nullptr, &Callbacks::access, this,                                    //
-                                 MHD_OPTION_CONNECTION_LIMIT, static_cast<unsigned>(_limits.total()),           //
-                                 MHD_OPTION_CONNECTION_MEMORY_LIMIT, headMaximum,                               //
-                                 MHD_OPTION_CONNECTION_TIMEOUT, static_cast<unsigned>(_clientTimeout.count()),  //
-                                 MHD_OPTION_NOTIFY_COMPLETED, &Callbacks::completed, this,                      //
-                                 MHD_OPTION_NOTIFY_CONNECTION, &Callbacks::connection, this,                    //
-                                 MHD_OPTION_UNESCAPE_CALLBACK, &decodeEscapes, nullptr,                         //
-                                 MHD_OPTION_SIGPIPE_HANDLED_BY_APP, 1,                                          //
+                                 nullptr, nullptr, &Callbacks::access, this,                                          //
+                                 MHD_OPTION_CONNECTION_LIMIT, static_cast<unsigned>(_limits.total()),                 //
+                                 MHD_OPTION_CONNECTION_MEMORY_LIMIT, bounds.headBytes + headReserve,                  //
+                                 MHD_OPTION_CONNECTION_TIMEOUT, static_cast<unsigned>(bounds.clientTimeout.count()),  //
+                                 MHD_OPTION_NOTIFY_COMPLETED, &Callbacks::completed, this,                            //
+                                 MHD_OPTION_NOTIFY_CONNECTION, &Callbacks::connection, this,                          //
+                                 MHD_OPTION_UNESCAPE_CALLBACK, &decodeEscapes, nullptr,                               //
+                                 MHD_OPTION_SIGPIPE_HANDLED_BY_APP, 1,                                                //
                                  MHD_OPTION_END);
     if (_daemon == nullptr) {
         throw std::runtime_error(
@@ -293,9 +296,11 @@ void HttpServer::dropSlowClients() {
     // The library only bounds silence; a client that sends one byte every few seconds would hold a connection for ever.
     const auto now = Clock::now();
     for (Client& client : _clients) {
-        if (client.receiving && now - client.since > _clientTimeout) {
+        if ((client.receiving && now - client.since > _bounds.clientTimeout) ||
+            (client.readBy && now > *client.readBy)) {
             ::shutdown(client.socket, SHUT_RDWR);
             client.receiving = false;
+            client.readBy.reset();
         }
     }
 }
@@ -314,7 +319,8 @@ int HttpServer::begin(MHD_Connection* connection, const char* url, const char* m
     *place = exchange.release();
     ++_open;
     Exchange& begun = **place;
-    begun._headProblem = headRefusal(connection, version);
+    begun._bodyMaximum = _bounds.bodyBytes;
+    begun._headProblem = headRefusal(connection, version, _bounds.headBytes);
     auto decided = _head(begun);
     if (auto* refusal = std::get_if<HttpAnswer>(&decided)) {
         begun._refusal = std::move(*refusal);
@@ -325,9 +331,9 @@ int HttpServer::begin(MHD_Connection* connection, const char* url, const char* m
         begun._answer = std::move(begun._refusal ? begun._refusal : begun._headProblem);
         return send(begun);
     }
-    const bool tooLarge = announcedLength(connection) > bodyMaximum;
+    const bool tooLarge = announcedLength(connection) > begun._bodyMaximum;
     if (!begun._refusal && tooLarge) {
-        begun._refusal = bodyTooLarge();
+        begun._refusal = bodyTooLarge(begun._bodyMaximum);
     }
     const bool waits = headerOf(connection, MHD_HTTP_HEADER_EXPECT).has_value();
     if (begun._refusal && (tooLarge || waits || begun._refusal->status == 403)) {
@@ -345,9 +351,9 @@ int HttpServer::access(MHD_Connection* connection, const char* url, const char* 
     Exchange& exchange = **place;
     if (*size > 0) {
         exchange._received += *size;
-        if (exchange._received > bodyMaximum) {
+        if (exchange._received > exchange._bodyMaximum) {
             exchange.dropBody();
-            exchange._refusal = bodyTooLarge();
+            exchange._refusal = bodyTooLarge(exchange._bodyMaximum);
         } else if (!exchange._refusal) {
             exchange._body.append(data, *size);
         }
@@ -355,7 +361,7 @@ int HttpServer::access(MHD_Connection* connection, const char* url, const char* 
         // the library only promises that it does not look at these bytes again.
         ::explicit_bzero(const_cast<char*>(data), *size);
         *size = 0;
-        return exchange._received > discardMaximum ? MHD_NO : MHD_YES;
+        return exchange._received / discardFactor > exchange._bodyMaximum ? MHD_NO : MHD_YES;
     }
     if (!exchange._answer) {
         if (Client* client = clientOf(connection)) {
@@ -429,6 +435,12 @@ int HttpServer::send(Exchange& exchange) {
         _unread += exchange._unread;
         _returnMemory |= exchange._unread >= largeBuffer;
         dropOldAnswers(exchange);
+    }
+    if (Client* client = clientOf(exchange._connection)) {
+        // A client that reads a byte a second would hold the answer's memory for ever.
+        const auto pieces = static_cast<int>(1 + bytes.size() / answerPiece);
+        client->readBy = Clock::now() + pieces * _bounds.clientTimeout;
+        client->receiving = false;
     }
     // The library does not write to a persistent buffer.
     MHD_Response* response =

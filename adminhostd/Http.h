@@ -5,6 +5,7 @@
 
 #include "adminhostd/ConnectionLimits.h"
 #include "adminhostd/Peer.h"
+#include "adminhostd/RequestBounds.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/value/Value.h"
 
@@ -28,7 +29,6 @@ struct MHD_Daemon;
 
 namespace adminhost {
 
-constexpr std::size_t bodyMaximum = std::size_t{8} << 20U;  ///< bytes of a request's body
 /// Bytes of all answers that clients have not read yet. Above it, the oldest of them is dropped with its connection.
 /// The newest never is, so that an answer of any size arrives.
 constexpr std::size_t unreadMaximum = std::size_t{64} << 20U;
@@ -90,6 +90,7 @@ class Exchange {
     std::string _path;
     std::string _body;
     std::size_t _received = 0;
+    std::size_t _bodyMaximum = 0;           ///< when its head arrived
     std::function<void(Exchange&)> _serve;  ///< the function that head() returned
     std::optional<HttpAnswer> _headProblem;
     std::optional<HttpAnswer> _refusal;  ///< decided from the head, sent once the body has been read and dropped
@@ -110,7 +111,7 @@ class HttpServer {
 
     /// Takes ownership of the listening socket. A client that exceeds the time for a request, or for reading on, is
     /// dropped. Throws std::runtime_error if the library fails to start.
-    HttpServer(FileDescriptor listener, std::chrono::seconds clientTimeout, Head head);
+    HttpServer(FileDescriptor listener, const RequestBounds& bounds, Head head);
     HttpServer(const HttpServer&) = delete;
     HttpServer& operator=(const HttpServer&) = delete;
     /// Every exchange must have its answer before.
@@ -123,6 +124,8 @@ class HttpServer {
     [[nodiscard]] std::optional<int> timeout() const;
     /// Accepts, reads, serves and sends everything that needs no waiting.
     void run();
+    /// Changes the bound on bodies, for requests whose heads arrive from now on. The others are fixed at the start.
+    void setBodyMaximum(std::size_t bytes) noexcept { _bounds.bodyBytes = bytes; }
     /// Closes the listening socket: accepts no further connection.
     void quiesce() noexcept { _listener.close(); }
     /// The number of requests that have begun and whose answers are not fully sent.
@@ -135,6 +138,7 @@ class HttpServer {
         Peer peer;
         bool receiving;
         Clock::time_point since;
+        std::optional<Clock::time_point> readBy = {};  ///< while an answer is sent: when it must have been read
     };
     struct Callbacks;
 
@@ -153,7 +157,7 @@ class HttpServer {
     void closed(const Client& client) noexcept;
 
     FileDescriptor _listener;
-    std::chrono::seconds _clientTimeout;
+    RequestBounds _bounds;
     Head _head;
     MHD_Daemon* _daemon = nullptr;
     int _descriptor = -1;  ///< the library's: readable when it has something to do

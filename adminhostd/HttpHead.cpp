@@ -6,6 +6,7 @@
 #include <cstring>
 #include <vector>
 
+#include <fmt/format.h>
 #include <microhttpd.h>
 #include <strings.h>
 
@@ -63,7 +64,14 @@ std::string pathOf(std::string_view target) {
     return target.empty() ? "/" : std::string(target);
 }
 
-std::optional<HttpAnswer> headRefusal(MHD_Connection* connection, std::string_view version) {
+std::optional<HttpAnswer> headRefusal(MHD_Connection* connection, std::string_view version, std::size_t bytesMaximum) {
+    if (::MHD_get_connection_info(connection, MHD_CONNECTION_INFO_REQUEST_HEADER_SIZE)->header_size > bytesMaximum) {
+        return HttpAnswer{
+            431,
+            Dictionary{{"error", "HEAD_TOO_LARGE"},
+                       {"message", fmt::format("The head of a request may have {} bytes at most.", bytesMaximum)}},
+            {{"Connection", "close"}}};
+    }
     if (version == MHD_HTTP_VERSION_1_1 && !headerOf(connection, MHD_HTTP_HEADER_HOST)) {
         return malformed("The Host header is missing; send one, with any value.");
     }

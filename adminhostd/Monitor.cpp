@@ -200,7 +200,11 @@ void Monitor::stop() {
 void Monitor::signalled() {
     signalfd_siginfo signal{};
     while (::read(_signals.get(), &signal, sizeof signal) > 0) {
-        if (signal.ssi_signo != SIGCHLD && !_stopping) {
+        if (signal.ssi_signo == SIGHUP) {
+            if (_front != 0) {  // the next one reads the configuration anyway
+                ::kill(_front, SIGHUP);
+            }
+        } else if (signal.ssi_signo != SIGCHLD && !_stopping) {
             stop();
         }
     }

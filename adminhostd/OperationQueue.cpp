@@ -70,6 +70,7 @@ std::optional<OperationQueue::Clock::time_point> OperationQueue::due() const {
 
 void OperationQueue::start() {
     ++_starts;
+    _replaceWorker = false;
     _worker = WorkerProcess::start(_settings.monitor);
     if (!_worker || !_worker->send(protocol::frameOf(_settings.configuration))) {
         startFailed(fmt::format("cannot be started: {}", std::strerror(errno)));
@@ -293,7 +294,22 @@ void OperationQueue::timeUp() {
     }
 }
 
+void OperationQueue::reconfigure(protocol::Configure configuration, std::size_t limit,
+                                 std::chrono::milliseconds deadline) {
+    _settings.limit = limit;
+    _settings.deadline = deadline;
+    if (configuration != _settings.configuration) {
+        _settings.configuration = std::move(configuration);
+        _replaceWorker = true;
+        next();
+    }
+}
+
 void OperationQueue::next() {
+    if (_replaceWorker && _state == State::idle && !_stopping) {
+        endWorker("is replaced, because the configuration has changed");
+        return;
+    }
     while (_state == State::idle && !_stopping && !_waiting.empty()) {
         const bool locked = _changesFrom && Clock::now() < *_changesFrom;
         auto operation = _waiting.takeNext(locked);

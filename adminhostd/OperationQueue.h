@@ -89,6 +89,10 @@ class OperationQueue {
     void stop(std::chrono::milliseconds bound);
     [[nodiscard]] bool stopped() const noexcept { return _stopping && !_running; }
 
+    /// Changes the settings. If the worker's differ, the next worker gets them: it takes the place of this one once no
+    /// operation is running. Requests wait meanwhile.
+    void reconfigure(protocol::Configure configuration, std::size_t limit, std::chrono::milliseconds deadline);
+
     void addTo(std::vector<pollfd>& entries) const;
     [[nodiscard]] std::optional<std::chrono::steady_clock::time_point> due() const;
     /// Does everything that needs no waiting. Called after a poll of these entries, to which addTo() has added the
@@ -136,8 +140,9 @@ class OperationQueue {
     std::optional<Clock::time_point> _due;          ///< when timeUp() has to act
     std::chrono::milliseconds _pause{0};
     std::string _startProblem;
-    unsigned long _starts = 0;   ///< distinguishes one worker from the next
-    bool _waitsForLeft = false;  ///< the worker's start waits for the end of an earlier front's worker
+    unsigned long _starts = 0;    ///< distinguishes one worker from the next
+    bool _waitsForLeft = false;   ///< the worker's start waits for the end of an earlier front's worker
+    bool _replaceWorker = false;  ///< its configuration is an old one
     bool _settled = false;
     bool _stopping = false;
 };

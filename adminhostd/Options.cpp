@@ -18,10 +18,10 @@ std::string absolute(const std::string& path) {
     return path.empty() ? path : std::filesystem::absolute(path).string();
 }
 
-}  // namespace
-
-std::optional<Options> readOptions(int count, const char* const* arguments, int& status) {
+/// Throws std::runtime_error for a mistake in the configuration.
+std::optional<Options> read(int count, const char* const* arguments, int& status) {
     Options options;
+    options.arguments.assign(arguments, arguments + count);
     std::vector<std::string> plugins;
     std::string socket;
     std::string configuration;
@@ -45,36 +45,30 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
         status = app.exit(error, std::cout, std::cerr) == 0 ? 0 : 2;
         return std::nullopt;
     }
-    try {
-        // The worker leaves the directory in which the daemon was started, and tools are named by absolute paths.
-        options.root = absolute(options.root);
-        setSystemRoot(options.root);
-        options.root = systemRoot();
-        // Missing directories below it are created, but a typo is not a new root.
-        if (!std::filesystem::is_directory(options.root)) {
-            throw std::runtime_error(options.root + " is not a directory; create it or correct --root");
-        }
-        const DiskPath standard = diskPath(HostPath(defaultConfiguration));
-        // It names the files that are loaded into the daemon, so the same rules apply to it as to plug-ins.
-        const auto problem = !configuration.empty() ? openToEverybody(DiskPath(configuration))
-                             : exists(standard)     ? distrust(standard)
-                                                    : std::nullopt;
-        if (problem) {
-            throw std::runtime_error(*problem);
-        }
-        options.configurationIsNamed = !configuration.empty();
-        options.configuration = options.configurationIsNamed ? absolute(configuration)
-                                : exists(standard)           ? standard.text()
-                                                             : std::string();
-        if (options.configurationIsNamed) {
-            readConfiguration(configuration, options);
-        } else if (!options.configuration.empty()) {
-            readConfiguration(options.configuration, options);
-        }
-    } catch (const std::runtime_error& error) {
-        std::cerr << "adminhostd: " << error.what() << '\n';
-        status = 1;
-        return std::nullopt;
+    // The worker leaves the directory in which the daemon was started, and tools are named by absolute paths.
+    options.root = absolute(options.root);
+    setSystemRoot(options.root);
+    options.root = systemRoot();
+    // Missing directories below it are created, but a typo is not a new root.
+    if (!std::filesystem::is_directory(options.root)) {
+        throw std::runtime_error(options.root + " is not a directory; create it or correct --root");
+    }
+    const DiskPath standard = diskPath(HostPath(defaultConfiguration));
+    // It names the files that are loaded into the daemon, so the same rules apply to it as to plug-ins.
+    const auto problem = !configuration.empty() ? openToEverybody(DiskPath(configuration))
+                         : exists(standard)     ? distrust(standard)
+                                                : std::nullopt;
+    if (problem) {
+        throw std::runtime_error(*problem);
+    }
+    options.configurationIsNamed = !configuration.empty();
+    options.configuration = options.configurationIsNamed ? absolute(configuration)
+                            : exists(standard)           ? standard.text()
+                                                         : std::string();
+    if (options.configurationIsNamed) {
+        readConfiguration(configuration, options);
+    } else if (!options.configuration.empty()) {
+        readConfiguration(options.configuration, options);
     }
     if (!plugins.empty()) {
         options.plugins.clear();
@@ -92,6 +86,32 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
         options.logToStandardError = log == "stderr";
     }
     return options;
+}
+
+}  // namespace
+
+std::optional<Options> readOptions(int count, const char* const* arguments, int& status) {
+    try {
+        return read(count, arguments, status);
+    } catch (const std::runtime_error& error) {
+        std::cerr << "adminhostd: " << error.what() << '\n';
+        status = 1;
+        return std::nullopt;
+    }
+}
+
+Options readOptionsAgain(const std::vector<std::string>& arguments) {
+    std::vector<const char*> texts;
+    texts.reserve(arguments.size());
+    for (const std::string& argument : arguments) {
+        texts.push_back(argument.c_str());
+    }
+    int status = 0;
+    auto options = read(static_cast<int>(texts.size()), texts.data(), status);
+    if (!options) {
+        throw std::runtime_error("the command line cannot be understood");
+    }
+    return *std::move(options);
 }
 
 std::string configurationFile(const Options& options) {

@@ -4,6 +4,7 @@
 
 #include "adminhostd/DirectoryOptions.h"
 #include "adminhostd/Permissions.h"
+#include "adminhostd/RequestBounds.h"
 #include "platform/files/Path.h"
 #include "platform/value/Value.h"
 
@@ -27,19 +28,23 @@ struct Options {
     std::string serviceManager;      ///< "systemd" or "pidfile"; empty: the platform's default
     DirectoryOptions directory;
     std::chrono::milliseconds deadline{300'000};  ///< of one operation
-    std::chrono::seconds clientTimeout{30};
+    RequestBounds bounds;
     std::size_t queueLimit = 64;
     std::vector<PermissionOptions> permissions;
     std::string configuration;          ///< path on disk of the file that was read; empty: none
     bool configurationIsNamed = false;  ///< on the command line
     bool logToStandardError = false;
     bool check = false;
+    std::vector<std::string> arguments;  ///< the command line, with the program's name
 };
 
 /// Reads both; the command line wins. Sets the system root. A relative root or plug-in is below the current directory.
 /// Returns nullopt if the daemon must exit at once, because help or an error was printed; then status is the exit
 /// status.
 [[nodiscard]] std::optional<Options> readOptions(int count, const char* const* arguments, int& status);
+
+/// The same for a process that is running already. Throws std::runtime_error with the description of a mistake.
+[[nodiscard]] Options readOptionsAgain(const std::vector<std::string>& arguments);
 
 /// Applies a configuration file to the options. Throws std::runtime_error with the file, the line, the column and a
 /// description.

@@ -57,6 +57,7 @@ struct ConfiguredAccount {
     std::string name = {};        ///< empty if the number was given
     std::optional<id_t> id = {};  ///< the number, if it was given
     std::string place = {};       ///< in the file, for messages: "FILE, line 3, column 7"
+    bool operator==(const ConfiguredAccount&) const = default;
 };
 
 /// One table [[permission]].
@@ -64,6 +65,7 @@ struct PermissionOptions {
     std::vector<ConfiguredAccount> users;
     std::vector<ConfiguredAccount> groups;
     Rights rights;
+    bool operator==(const PermissionOptions&) const = default;
 };
 
 class Permissions {
@@ -74,6 +76,8 @@ class Permissions {
     Permissions(const std::vector<PermissionOptions>& options, uid_t own, std::string file);
 
     [[nodiscard]] Rights of(const Peer& peer) const;
+    /// The account that the daemon runs as.
+    [[nodiscard]] uid_t own() const noexcept { return _own; }
     /// Returns true for root and the daemon's own account.
     [[nodiscard]] bool isOwn(const Peer& peer) const noexcept { return peer.uid == 0 || peer.uid == _own; }
 

@@ -25,6 +25,20 @@ bool same(std::string_view a, std::string_view b) {
     return a.size() == b.size() && ::strncasecmp(a.data(), b.data(), a.size()) == 0;
 }
 
+/// Returns true if lists and dictionaries are nested deeper than that. The readers bound the recursion.
+bool isDeeper(const Value& value, std::size_t depth) {
+    if (const Array* array = value.array()) {
+        return depth == 0 ||
+               std::any_of(array->begin(), array->end(), [&](const Value& one) { return isDeeper(one, depth - 1); });
+    }
+    if (const Dictionary* dictionary = value.dictionary()) {
+        return depth == 0 || std::any_of(dictionary->begin(), dictionary->end(), [&](const DictionaryEntry& entry) {
+                   return isDeeper(entry.value, depth - 1);
+               });
+    }
+    return false;
+}
+
 }  // namespace
 
 std::optional<BodyForm> bodyFormOf(std::string_view contentType) {
@@ -52,21 +66,28 @@ std::optional<BodyForm> bodyFormOf(std::string_view contentType) {
     return same(type, "application/x-plist") ? std::optional(BodyForm::propertyList) : std::nullopt;
 }
 
-std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem) {
+std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem,
+                                    const BodyBounds& bounds) {
     if (body.empty()) {
         return Dictionary();
     }
-    auto value =
-        form == BodyForm::json ? parseJson(body, bodyValuesMaximum) : parsePropertyList(body, bodyValuesMaximum);
+    auto value = form == BodyForm::json ? parseJson(body, bounds.values) : parsePropertyList(body, bounds.values);
     if (!value) {
         const Error& error = value.error();
-        problem.tooManyValues = error.code == (form == BodyForm::json ? jsonTooManyValues : plistTooManyValues);
+        if (error.code == (form == BodyForm::json ? jsonTooManyValues : plistTooManyValues)) {
+            problem.kind = BodyProblem::Kind::tooManyValues;
+        }
         problem.text = error.description.value_or("The body cannot be read.");
         return std::nullopt;
     }
     if (value->dictionary() == nullptr) {
         problem.text =
             fmt::format("line 1, column 1: a request is a dictionary, not a value of type {}", nameOf(value->type()));
+        return std::nullopt;
+    }
+    if (isDeeper(*value, bounds.depth)) {
+        problem.kind = BodyProblem::Kind::tooDeep;
+        problem.text = fmt::format("Lists and dictionaries of a request may be nested {} deep at most.", bounds.depth);
         return std::nullopt;
     }
     return std::move(*value->dictionary());

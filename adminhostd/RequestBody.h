@@ -14,9 +14,12 @@
 
 namespace adminhost {
 
-/// The maximum of values in one body. A small dictionary is ten bytes in it and a kilobyte in memory, so a bound on
-/// bytes alone would not bound the memory.
-constexpr std::size_t bodyValuesMaximum = 100'000;
+struct BodyBounds {
+    /// A small dictionary is ten bytes in a body and a kilobyte in memory, so a bound on bytes alone would not bound
+    /// the memory.
+    std::size_t values = 100'000;
+    std::size_t depth = 512;  ///< nested lists and dictionaries; the readers allow no more than this
+};
 
 enum class BodyForm { json, propertyList };
 
@@ -24,13 +27,15 @@ enum class BodyForm { json, propertyList };
 [[nodiscard]] std::optional<BodyForm> bodyFormOf(std::string_view contentType);
 
 struct BodyProblem {
-    bool tooManyValues = false;  ///< else malformed, or not a dictionary
-    std::string text;            ///< with line and column
+    enum class Kind { malformed, tooManyValues, tooDeep };
+    Kind kind = Kind::malformed;  ///< malformed also: not a dictionary
+    std::string text;             ///< with line and column where they are known
 };
 
 /// The request dictionary of a body; an empty one for an empty body. Returns nullopt, with the problem, if the body is
 /// not a dictionary.
-[[nodiscard]] std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem);
+[[nodiscard]] std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem,
+                                                  const BodyBounds& bounds = {});
 
 /// Returns true when an Accept header prefers a property list to JSON, by a higher weight or by naming it first.
 [[nodiscard]] bool prefersPropertyList(std::string_view accept);

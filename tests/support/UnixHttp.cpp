@@ -144,4 +144,10 @@ bool UnixHttp::closedWithin(std::chrono::milliseconds time) {
     }
 }
 
+std::size_t UnixHttp::readSome(std::size_t bytes) {
+    std::string buffer(bytes, '\0');
+    const ssize_t count = ::recv(_socket, buffer.data(), buffer.size(), 0);
+    return count < 0 ? 0 : static_cast<std::size_t>(count);
+}
+
 }  // namespace adminhost::test

@@ -4,6 +4,7 @@
 // requests. Everything waits ten seconds at most (or the given time) and then throws std::runtime_error.
 
 #include <chrono>
+#include <cstddef>
 #include <map>
 #include <optional>
 #include <string>
@@ -45,6 +46,9 @@ class UnixHttp {
     HttpReply reply(bool headOnly = false);
     /// Returns true if the server closes the connection within this time.
     bool closedWithin(std::chrono::milliseconds time);
+    /// Reads at most so many bytes that have arrived or arrive within ten seconds, and drops them. Returns their
+    /// number; 0 if the server has closed the connection.
+    std::size_t readSome(std::size_t bytes);
     void close();
 
   private:

@@ -343,10 +343,10 @@ TEST(End, RunningWriteIsEndedAtItsDeadline) {
     EXPECT_EQ(daemon.wait(), 0);
 }
 
-TEST(End, HangupLeavesNothingBehind) {
+TEST(End, InterruptLeavesNothingBehind) {
     DaemonProcess daemon(withFixture());
     const pid_t worker = daemon.workerPid();
-    daemon.signal(SIGHUP);
+    daemon.signal(SIGINT);
     EXPECT_EQ(daemon.wait(), 0);
     EXPECT_TRUE(eventually([&] { return ::kill(worker, 0) != 0; }));
     EXPECT_FALSE(std::filesystem::exists(daemon.socket()));

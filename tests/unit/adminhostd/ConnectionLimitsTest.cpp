@@ -14,7 +14,7 @@ std::size_t addAll(ConnectionLimits& limits, uid_t uid) {
 }
 
 TEST(ConnectionLimits, OneAccountHasHalfOfWhatRootLeaves) {
-    ConnectionLimits limits(1024);
+    ConnectionLimits limits(1024, 256);
     EXPECT_EQ(addAll(limits, 1000), 120U);
     EXPECT_EQ(addAll(limits, 1001), 120U);
     EXPECT_EQ(addAll(limits, 1002), 0U);
@@ -24,14 +24,14 @@ TEST(ConnectionLimits, OneAccountHasHalfOfWhatRootLeaves) {
 }
 
 TEST(ConnectionLimits, RootMayHaveAllOfThem) {
-    ConnectionLimits limits(1024);
-    EXPECT_EQ(addAll(limits, 0), ConnectionLimits::maximum);
+    ConnectionLimits limits(1024, 256);
+    EXPECT_EQ(addAll(limits, 0), 256U);
     EXPECT_TRUE(limits.full());
     EXPECT_FALSE(limits.add(1000));
 }
 
 TEST(ConnectionLimits, ClosedConnectionCanBeOpenedAgain) {
-    ConnectionLimits limits(1024);
+    ConnectionLimits limits(1024, 256);
     ASSERT_EQ(addAll(limits, 1000), limits.perAccount());
     limits.remove(1000);
     EXPECT_TRUE(limits.add(1000));
@@ -43,11 +43,11 @@ TEST(ConnectionLimits, ClosedConnectionCanBeOpenedAgain) {
 }
 
 TEST(ConnectionLimits, FewDescriptorsLeaveTheDaemonItsOwn) {
-    EXPECT_EQ(ConnectionLimits(64).total(), 48U);
-    EXPECT_EQ(ConnectionLimits(64).others(), 32U);
-    EXPECT_EQ(ConnectionLimits(64).perAccount(), 16U);
+    EXPECT_EQ(ConnectionLimits(64, 256).total(), 48U);
+    EXPECT_EQ(ConnectionLimits(64, 256).others(), 32U);
+    EXPECT_EQ(ConnectionLimits(64, 256).perAccount(), 16U);
     for (std::size_t descriptors = 0; descriptors < 300; ++descriptors) {
-        const ConnectionLimits limits(descriptors);
+        const ConnectionLimits limits(descriptors, 256);
         EXPECT_GE(limits.perAccount(), 1U) << descriptors;
         EXPECT_GE(limits.others(), limits.perAccount()) << descriptors;
         EXPECT_GE(limits.total(), limits.others()) << descriptors;

@@ -29,7 +29,7 @@ TEST(RequestOf, TakesDictionariesOnly) {
     EXPECT_EQ(problem.text, "line 1, column 1: a request is a dictionary, not a value of type text");
     EXPECT_FALSE(requestOf("{", BodyForm::propertyList, problem));
     EXPECT_NE(problem.text.find("line"), std::string::npos) << problem.text;
-    EXPECT_FALSE(problem.tooManyValues);
+    EXPECT_FALSE((problem.kind == BodyProblem::Kind::tooManyValues));
 }
 
 TEST(RequestOf, BoundsTheNumberOfValuesInBothForms) {
@@ -49,14 +49,14 @@ TEST(RequestOf, BoundsTheNumberOfValuesInBothForms) {
         return text + "</array></dict></plist>";
     };
     BodyProblem problem;
-    EXPECT_TRUE(requestOf(json(bodyValuesMaximum), BodyForm::json, problem)) << problem.text;
-    EXPECT_TRUE(requestOf(list(bodyValuesMaximum), BodyForm::propertyList, problem)) << problem.text;
-    EXPECT_FALSE(requestOf(json(bodyValuesMaximum + 1), BodyForm::json, problem));
-    EXPECT_TRUE(problem.tooManyValues);
+    EXPECT_TRUE(requestOf(json(BodyBounds().values), BodyForm::json, problem)) << problem.text;
+    EXPECT_TRUE(requestOf(list(BodyBounds().values), BodyForm::propertyList, problem)) << problem.text;
+    EXPECT_FALSE(requestOf(json(BodyBounds().values + 1), BodyForm::json, problem));
+    EXPECT_TRUE((problem.kind == BodyProblem::Kind::tooManyValues));
     EXPECT_EQ(problem.text, "line 1, column 200005: there are more than 100000 values");
     problem = {};
-    EXPECT_FALSE(requestOf(list(bodyValuesMaximum + 1), BodyForm::propertyList, problem));
-    EXPECT_TRUE(problem.tooManyValues);
+    EXPECT_FALSE(requestOf(list(BodyBounds().values + 1), BodyForm::propertyList, problem));
+    EXPECT_TRUE((problem.kind == BodyProblem::Kind::tooManyValues));
     EXPECT_TRUE(problem.text.starts_with("line 1, column ")) << problem.text;
 }
 
@@ -85,6 +85,17 @@ TEST(RevisionsOf, ReadsAListOfQuotedTexts) {
     for (const char* text : {"a", "\"a", "\"a\" \"b\"", "W/\"a\"", "\"", "*, \"a\""}) {
         EXPECT_EQ(revisionsOf(text), std::nullopt) << text;
     }
+}
+
+TEST(RequestBody, DepthIsBoundedInBothForms) {
+    BodyProblem problem;
+    const BodyBounds bounds{.values = 100, .depth = 3};
+    EXPECT_TRUE(requestOf(R"({"a":[{"b":1}]})", BodyForm::json, problem, bounds));
+    EXPECT_FALSE(requestOf(R"({"a":[{"b":[]}]})", BodyForm::json, problem, bounds));
+    EXPECT_EQ(problem.kind, BodyProblem::Kind::tooDeep);
+    EXPECT_FALSE(requestOf("<plist><dict><key>a</key><array><array><array/></array></array></dict></plist>",
+                           BodyForm::propertyList, problem, bounds));
+    EXPECT_EQ(problem.kind, BodyProblem::Kind::tooDeep);
 }
 
 TEST(RequestDeadline, IsAWholeNumberOfSecondsFromOne) {
