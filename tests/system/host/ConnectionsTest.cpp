@@ -149,7 +149,8 @@ TEST(Connections, TwelveClientsThatDoNotReadCostOneFormOfTheirAnswersAndItIsRetu
         std::vector<UnixHttp> clients;
         for (int i = 0; i < 12; ++i) {
             clients.push_back(daemon.connect());
-            clients.back().begin("POST", "/v1/fixture/echo", body);
+            // Not identical: those would have one answer.
+            clients.back().begin("POST", "/v1/fixture/echo", "{\"client\":" + std::to_string(i) + "," + body.substr(1));
         }
         ASSERT_TRUE(eventually([&] {
             const Dictionary overview = dictionaryOf(daemon.connect().get("/v1/"));
@@ -170,7 +171,8 @@ TEST(Connections, AnswersThatNobodyReadsAreBoundedInTotalAndTheOldestIsDropped) 
     std::vector<UnixHttp> clients;
     for (int i = 0; i < 4; ++i) {
         clients.push_back(daemon.connect());
-        clients.back().begin("POST", "/v1/fixture/large", R"({"bytes": 25000000})");
+        // Not identical: those would have one answer.
+        clients.back().begin("POST", "/v1/fixture/large", R"({"bytes": 2500000)" + std::to_string(i) + "}");
     }
     ASSERT_TRUE(eventually([&] {
         const Dictionary overview = dictionaryOf(daemon.connect().get("/v1/"));

@@ -123,6 +123,7 @@ TEST_F(MemoryAfterAnAnswer, HoldsNoTextOfARequestThatIsRefused) {
 
 TEST_F(MemoryAfterAnAnswer, HoldsNoTextOfARequestWhoseWorkerDied) {
     EXPECT_EQ(client.post("/v1/fixture/crash", request()).status, 500);
+    ASSERT_TRUE(eventually([&] { return dictionaryOf(daemon.connect().get("/v1/")).contains("workerPid"); }));
     expectNothingLeft();
 }
 
