@@ -57,6 +57,7 @@ std::vector<std::string> keepFixedSettings(Options& read, const Options& old) {
     };
     keep("socket", read.socket, old.socket);
     keep("socket_group", read.socketGroup, old.socketGroup);
+    keep("account", read.account, old.account);
     keep("log", read.logToStandardError, old.logToStandardError);
     keep("client_timeout_seconds", read.bounds.clientTimeout, old.bounds.clientTimeout);
     keep("head_limit_bytes", read.bounds.headBytes, old.bounds.headBytes);
