@@ -6,7 +6,9 @@
 #include "platform/value/ValueText.h"
 
 #include <algorithm>
+#include <chrono>
 #include <filesystem>
+#include <map>
 #include <system_error>
 #include <utility>
 
@@ -56,6 +58,34 @@ bool isLinkOfOthers(const PathStep& step, uid_t account) {
            ((step.directory.st_mode & writableByOthers) != 0 ||
             (!adminhost::isOfRootOrOutside(step.directory) && step.directory.st_uid != account));
 }
+
+using Clock = std::chrono::steady_clock;
+using Identity = std::pair<dev_t, ino_t>;
+
+constexpr auto keptTime = std::chrono::seconds(1);
+
+Identity identityOf(const std::string& path) noexcept {
+    struct stat status {};
+    return !path.empty() && ::stat(path.c_str(), &status) == 0 ? Identity{status.st_dev, status.st_ino} : Identity();
+}
+
+/// What a confinement allows beside fixed places. While the confinement exists, no other file can get these numbers.
+struct ConfinedFiles {
+    DiskPath tool;
+    Identity program;
+    Identity loader;
+    Identity directory;
+    std::map<std::string, std::string> configuration;
+
+    bool operator==(const ConfinedFiles&) const = default;
+};
+
+struct KeptConfinement {
+    ConfinedFiles files;
+    std::string loader;
+    std::shared_ptr<const Confinement> confinement;
+    Clock::time_point until;  ///< fixed places such as the time zone may be replaced
+};
 
 }  // namespace
 
@@ -113,10 +143,30 @@ std::string DatabaseAccess::directory() const {
 }
 
 adminhost::Result<std::shared_ptr<const Confinement>> DatabaseAccess::confine(const DiskPath& tool) const {
+    // A listing runs many statements: they share a confinement of the same files.
+    thread_local KeptConfinement kept;
+    ConfinedFiles files{tool, identityOf(tool.text()), {}, {}, adminhost::toolFileVariables()};
+    if (_route.directory.isOpen() && !_route.missesDirectory) {
+        files.directory = {_route.directoryStatus.st_dev, _route.directoryStatus.st_ino};
+    }
+    files.loader = identityOf(kept.loader);
+    if (Clock::now() < kept.until && files == kept.files) {
+        return kept.confinement;
+    }
     const auto loader = adminhost::loaderOf(tool);
     if (!loader || !Confinement::isAvailable()) {
         return nullptr;
     }
+    auto made = confineNow(tool, *loader);
+    if (made) {
+        files.loader = identityOf(*loader);
+        kept = {std::move(files), *loader, *made, Clock::now() + keptTime};
+    }
+    return made;
+}
+
+adminhost::Result<std::shared_ptr<const Confinement>> DatabaseAccess::confineNow(const DiskPath& tool,
+                                                                                 const std::string& loader) const {
     auto confinement = Confinement::create();
     if (!confinement) {
         return adminhost::failure(confinement.error());
@@ -126,8 +176,8 @@ adminhost::Result<std::shared_ptr<const Confinement>> DatabaseAccess::confine(co
         failure = failure != 0 ? failure : confinement->allowIfPresent(path, access);
     };
     allow(tool.text(), Access::execute);
-    if (!loader->empty()) {
-        allow(*loader, Access::execute);
+    if (!loader.empty()) {
+        allow(loader, Access::execute);
     }
     for (const char* libraries :
          {"/usr/lib", "/usr/lib64", "/lib", "/lib64", "/usr/local/lib", "/etc/ld.so.cache", "/etc/ld.so.preload"}) {

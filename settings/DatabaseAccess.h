@@ -41,11 +41,14 @@ class DatabaseAccess {
     [[nodiscard]] std::string directory() const;
 
     /// What confines the tool; null if the kernel has no Landlock, or the tool is a script: nobody knows which files
-    /// its interpreter needs. Fails if the confinement cannot be made.
+    /// its interpreter needs. Fails if the confinement cannot be made. For the same files, one is used for a second.
     [[nodiscard]] adminhost::Result<std::shared_ptr<const adminhost::Confinement>> confine(
         const adminhost::DiskPath& tool) const;
 
   private:
+    [[nodiscard]] adminhost::Result<std::shared_ptr<const adminhost::Confinement>> confineNow(
+        const adminhost::DiskPath& tool, const std::string& loader) const;
+
     adminhost::FileRoute _route;
     std::optional<adminhost::ChildRights> _account;
 };

@@ -1,5 +1,6 @@
 // With which rights the database tool runs on a database, by owners and modes of the file and its path.
 
+#include "platform/task/Task.h"
 #include "settings/DatabaseAccess.h"
 #include "settings/DatabaseTool.h"
 #include "settings/QueryRunner.h"
@@ -184,6 +185,28 @@ TEST_F(DatabaseAccessOfRoot, ForAMissingFileTheOwnerOfWhatExistsCounts) {
     ASSERT_FALSE(rows);
     EXPECT_EQ(rows.error().code, 1) << "the tool's own failure";
     EXPECT_THAT(rows.error().description.value_or(""), HasSubstr("unable to open database"));
+}
+
+TEST_F(DatabaseAccessOfRoot, DirectoryToolAndConfigurationThatAreReplacedAreUsedAtOnce) {
+    own(file, accounts::user, accounts::group, 0644);
+    own(directory, accounts::user, accounts::group, 0755);
+    ASSERT_TRUE(runStatement("insert into t values('two')"));
+    fs::rename(root.path(directory), root.path("/Library/former"));
+    root.sql(file, "create table t(a); insert into t values('of the new directory')");
+    own(file, accounts::user, accounts::group, 0644);
+    own(directory, accounts::user, accounts::group, 0755);
+    ASSERT_TRUE(runStatement("insert into t values('four')"));
+    EXPECT_EQ(root.sql(file, "select count(*) from t"), "2\n");
+    fs::remove(root.path("/usr/bin/sqlite3"));
+    fs::copy_file("/usr/bin/sqlite3", root.path("/usr/bin/sqlite3"));
+    fs::permissions(root.path("/usr/bin/sqlite3"), fs::perms(0755));
+    ASSERT_TRUE(runStatement("insert into t values('by a new tool')"));
+    const auto plan = [] { return databaseToolPlan(SettingsStore::dbPath(), {}); };
+    const auto before = plan().confinement;
+    EXPECT_EQ(plan().confinement, before) << "statements of one listing share it";
+    adminhost::setToolFileVariables({{"XDG_CONFIG_HOME", root.path("/").string()}});
+    EXPECT_NE(plan().confinement, before);
+    adminhost::setToolFileVariables({});
 }
 
 TEST_F(DatabaseAccessOfRoot, PathThatCannotBeFollowedIsRefused) {
