@@ -1,5 +1,6 @@
 #include "adminhostctl/GeneralVerbs.h"
 
+#include "adminhostctl/Complete.h"
 #include "adminhostctl/DoctorVerb.h"
 #include "adminhostctl/Help.h"
 #include "adminhostctl/LogsVerb.h"
@@ -86,6 +87,12 @@ ExitStatus whois(const Context& context, Words arguments) {
     return ExitStatus::done;
 }
 
+// Completion
+
+std::vector<std::string> logNames(const Context& context, Words) {
+    return textsOf(context.service.get("/v1/logs"), "logs", "name");
+}
+
 constexpr std::array table = {
     Verb{"daemon",
          "",
@@ -116,14 +123,16 @@ constexpr std::array table = {
          0,
          1,
          &logs,
-         {{"logs", "logs -f -n 50 application_log"}}},
+         {{"logs", "logs -f -n 50 application_log"}},
+         &logNames},
     Verb{"whois",
          "NAME|UUID",
          "Show the people and groups with this name or UUID",
          1,
          1,
          &whois,
-         {{"whois anna", "--format json whois studio"}}},
+         {{"whois anna", "--format json whois studio"}},
+         &peopleNames},
 };
 
 constexpr std::array options = {

@@ -2,6 +2,7 @@
 // client, the desired state and the verbs of this one service.
 
 #include "adminhostctl/CallerLanguages.h"
+#include "adminhostctl/Complete.h"
 #include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/GeneralVerbs.h"
@@ -36,6 +37,7 @@ using adminhost::ctl::Format;
 
 constexpr const char* defaultSocket = "/run/adminhostd/adminhostd.sock";
 constexpr std::size_t widthWithoutTerminal = 120;
+constexpr std::chrono::milliseconds completionLimit(100);  ///< a person who presses the tab key does not wait longer
 
 /// Columns of the terminal; COLUMNS, or a fixed number, where the output is not a terminal.
 std::size_t outputWidth() {
@@ -182,6 +184,14 @@ int runMain(int count, char** words) {
     options.width = outputWidth();
     options.file = options.argumentOf("--file");
     options.names = options.has("--names");
+    const bool completes = rest.front() == "complete";
+    if (completes) {
+        rest.erase(rest.begin());
+        const adminhost::ctl::CompletionTarget target = adminhost::ctl::completionTarget(rest);
+        socket = target.socket.value_or(socket);
+        languages = target.languages ? target.languages : languages;
+        timeout = target.timeout ? target.timeout : timeout;
+    }
     try {
         adminhost::ctl::DaemonClient service(
             socket, languages ? adminhost::ctl::languagesOfText(*languages) : adminhost::ctl::callerLanguages(),
@@ -195,7 +205,10 @@ int runMain(int count, char** words) {
                                               options.has(adminhost::ctl::forceOption)};
         const std::vector<adminhost::ctl::Verb> verbs = allVerbs();
         const adminhost::ctl::Context context{service, options, sources, std::cout, std::cerr, verbs, verbOptions};
-        const ExitStatus status = isHelp ? helpOf(context, rest) : adminhost::ctl::run(context, rest);
+        const ExitStatus status =
+            completes ? adminhost::ctl::complete(context, rest, timeoutOf(timeout).value_or(completionLimit))
+            : isHelp  ? helpOf(context, rest)
+                      : adminhost::ctl::run(context, rest);
         std::cout.flush();
         adminhost::ctl::endIfInterrupted();
         if (!std::cout) {

@@ -74,6 +74,8 @@ struct Verb {
     std::size_t most;
     ExitStatus (*run)(const Context& context, std::span<const std::string> arguments);
     std::array<std::string_view, 2> examples;  ///< without the program's name, for a shell
+    /// What the argument that follows these can be, for completion; null if it is not known, or a file.
+    std::vector<std::string> (*complete)(const Context& context, std::span<const std::string> before) = nullptr;
 };
 
 /// The first words of all verbs.

@@ -1,5 +1,7 @@
 #include "adminhostctl/desired/DesiredVerbs.h"
 
+#include "adminhostctl/Complete.h"
+#include "adminhostctl/Connection.h"
 #include "adminhostctl/OutputFile.h"
 #include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
@@ -129,6 +131,39 @@ ExitStatus applyFile(const Context& context, Words arguments) {
     return carryOut(context, wantedOf(context, arguments.front(), current), current);
 }
 
+// Completion
+
+/// All settings.
+std::vector<std::string> settingsAnd(const Context& context, Words before) {
+    if (!before.empty()) {
+        return {};
+    }
+    const StateForm form(context.service.stateCommand("write").description);
+    std::vector<std::string> names;
+    const CommandRef read = context.service.stateCommand("read");
+    for (const DescribedKey& key : read.description.answerKeys()) {
+        if (key.path.starts_with(form.root() + '.') && key.path.find('[') == std::string::npos && key.type != "list") {
+            names.push_back(key.path.substr(form.root().size() + 1));
+        }
+    }
+    return names;
+}
+
+/// The settings that can be written, then the values that one may have.
+std::vector<std::string> writableSettings(const Context& context, Words before) {
+    const StateForm form(context.service.stateCommand("write").description);
+    if (before.empty()) {
+        return settingNames(form, {});
+    }
+    const DescribedKey* key = form.setting(before.front());
+    return key == nullptr ? std::vector<std::string>() : valuesOf(*key);
+}
+
+std::vector<std::string> historyNumbers(const Context& context, Words) {
+    const std::string plugin = context.service.stateCommand("write").plugin;
+    return textsOf(context.service.get("/v1/" + Connection::escaped(plugin) + "/history"), "history", "number");
+}
+
 constexpr std::array table = {
     Verb{"settings get",
          "[KEY]",
@@ -136,21 +171,24 @@ constexpr std::array table = {
          0,
          1,
          &settingsGet,
-         {{"settings get", "settings get server_port"}}},
+         {{"settings get", "settings get server_port"}},
+         &settingsAnd},
     Verb{"explain",
          "KEY",
          "Explain a setting: unit, range, default, restart, last change",
          1,
          1,
          &explain,
-         {{"explain server_port", "--format json explain shared_filesystem"}}},
+         {{"explain server_port", "--format json explain shared_filesystem"}},
+         &settingsAnd},
     Verb{"settings set",
          "KEY [VALUE|@FILE|@-] [--clear] [--force] [--dry-run] [--validate [--password-file FILE]]",
          "Change a setting",
          1,
          2,
          &settingsSet,
-         {{"settings set server_port 8170", "settings set nimbo_client_password @password.txt --validate"}}},
+         {{"settings set server_port 8170", "settings set nimbo_client_password @password.txt --validate"}},
+         &writableSettings},
     Verb{"export",
          "[FILE]",
          "Write settings and lists to a TOML file",
@@ -185,7 +223,8 @@ constexpr std::array table = {
          1,
          1,
          &rollback,
-         {{"rollback 7", "rollback 7 --dry-run"}}},
+         {{"rollback 7", "rollback 7 --dry-run"}},
+         &historyNumbers},
 };
 
 constexpr std::array options = {

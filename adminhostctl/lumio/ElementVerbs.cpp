@@ -1,5 +1,6 @@
 #include "adminhostctl/lumio/ElementVerbs.h"
 
+#include "adminhostctl/Complete.h"
 #include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/State.h"
@@ -140,6 +141,20 @@ ExitStatus listElements(const Context& context, const ElementKind& kind) {
         context.out << (name.empty() ? "" : shown(name) + '\n');
     }
     return reportUnread(context, listing);
+}
+
+std::vector<std::string> elementNames(const Context& context, const ElementKind& kind) {
+    const bool hasAccess = std::string_view(kind.section) != "properties";
+    const CommandAnswer answer =
+        context.service.ask(context.service.command(hasAccess ? "getAccess" : kind.listing), {});
+    std::vector<std::string> names;
+    for (const Dictionary& one :
+         dictionariesAt(answer.value.value_or(Value()), hasAccess ? "resources" : kind.section)) {
+        if ((!hasAccess || one.text("section") == kind.section) && one.get("disabled") != Value(true)) {
+            names.emplace_back(one.text(one.text("name").empty() ? "bundle_path" : "name"));
+        }
+    }
+    return names;
 }
 
 ExitStatus showElement(const Context& context, const ElementKind& kind, const std::string& name) {

@@ -28,6 +28,9 @@ struct ElementKind {
 [[nodiscard]] ExitStatus listElements(const Context& context, const ElementKind& kind);
 [[nodiscard]] ExitStatus showElement(const Context& context, const ElementKind& kind, const std::string& name);
 
+/// The names of all elements, for completion: of cameras and workflows from the quickest listing.
+[[nodiscard]] std::vector<std::string> elementNames(const Context& context, const ElementKind& kind);
+
 // These change elements that the service lists. The names of people and groups are looked up before anything is sent:
 // Failure(usage) if the directory does not have one, or if it is a group's and --group was not given.
 

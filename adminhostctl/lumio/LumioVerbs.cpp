@@ -1,5 +1,6 @@
 #include "adminhostctl/lumio/LumioVerbs.h"
 
+#include "adminhostctl/Complete.h"
 #include "adminhostctl/desired/State.h"
 #include "adminhostctl/desired/Toml.h"
 #include "adminhostctl/desired/Writing.h"
@@ -122,6 +123,34 @@ ExitStatus cameraRemove(const Context& context, Words words) {
     return removeElement(context, camera, words.front());
 }
 
+// Completion
+
+std::vector<std::string> propertyNames(const Context& context, Words before) {
+    return before.empty() ? elementNames(context, property) : std::vector<std::string>();
+}
+
+/// What follows the name of an element.
+enum class Then { nothing, people, onOrOff };
+
+template <const ElementKind& kind, Then then>
+std::vector<std::string> elementsThen(const Context& context, Words before) {
+    if (before.empty()) {
+        return elementNames(context, kind);
+    }
+    if constexpr (then == Then::people) {
+        std::vector<std::string> names = peopleNames(context, before);
+        // After "--group GROUP" all words are elements, and a name is seldom both.
+        for (std::string& name : elementNames(context, kind)) {
+            names.push_back(std::move(name));
+        }
+        return names;
+    } else if constexpr (then == Then::onOrOff) {
+        return {"on", "off"};
+    } else {
+        return {};
+    }
+}
+
 constexpr std::array table = {
     Verb{"camera list",
          "[--match GLOB] [--status STATUS] [--allowed NAME] [--restricted] [--sort COLUMN] [--columns LIST] [--wide] "
@@ -137,35 +166,40 @@ constexpr std::array table = {
          1,
          1,
          &showVerb<camera>,
-         {{"camera show 'Lecture hall 1'", "--format json camera show Roof"}}},
+         {{"camera show 'Lecture hall 1'", "--format json camera show Roof"}},
+         &elementsThen<camera, Then::nothing>},
     Verb{"camera allow",
          "CAMERA NAME... [--group] | --group GROUP CAMERA... [--dry-run]",
          "Allow users, or groups, to use a camera",
          1,
          1000,
          &allowVerb<camera>,
-         {{"camera allow 'Lecture hall 1' anna ben", "camera allow --group studio 'Main hall' Roof"}}},
+         {{"camera allow 'Lecture hall 1' anna ben", "camera allow --group studio 'Main hall' Roof"}},
+         &elementsThen<camera, Then::people>},
     Verb{"camera deny",
          "CAMERA NAME... [--group] | --group GROUP CAMERA... [--dry-run]",
          "Remove users and groups from a camera's list",
          1,
          1000,
          &denyVerb<camera>,
-         {{"camera deny 'Lecture hall 1' anna", "camera deny --group studio 'Main hall' Roof"}}},
+         {{"camera deny 'Lecture hall 1' anna", "camera deny --group studio 'Main hall' Roof"}},
+         &elementsThen<camera, Then::people>},
     Verb{"camera access",
          "CAMERA on|off [--dry-run]",
          "Restrict a camera to its list, or open it to everyone",
          2,
          2,
          &accessVerb<camera>,
-         {{"camera access Roof on", "camera access Roof off --dry-run"}}},
+         {{"camera access Roof on", "camera access Roof off --dry-run"}},
+         &elementsThen<camera, Then::onOrOff>},
     Verb{"camera remove",
          "CAMERA [--yes] [--dry-run]",
          "Remove a camera from the service",
          1,
          1,
          &cameraRemove,
-         {{"camera remove Roof", "camera remove 0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1E01 --yes"}}},
+         {{"camera remove Roof", "camera remove 0E6F2C1A-6B0B-4F2E-9C35-3A1F0C7A1E01 --yes"}},
+         &elementsThen<camera, Then::nothing>},
     Verb{"workflow list",
          "[--match GLOB] [--allowed NAME] [--restricted] [--sort COLUMN] [--columns LIST] [--wide] [--names]",
          "List the workflows and who may use them",
@@ -179,35 +213,40 @@ constexpr std::array table = {
          1,
          1,
          &showVerb<workflow>,
-         {{"workflow show 'Publish to Catalog'", "workflow show Workflows/Archive.workflow"}}},
+         {{"workflow show 'Publish to Catalog'", "workflow show Workflows/Archive.workflow"}},
+         &elementsThen<workflow, Then::nothing>},
     Verb{"workflow allow",
          "WORKFLOW NAME... [--group] | --group GROUP WORKFLOW... [--dry-run]",
          "Allow users, or groups, to use a workflow",
          1,
          1000,
          &allowVerb<workflow>,
-         {{"workflow allow 'Publish to Catalog' anna ben", "workflow allow --group studio 'Audio Episode' Archive"}}},
+         {{"workflow allow 'Publish to Catalog' anna ben", "workflow allow --group studio 'Audio Episode' Archive"}},
+         &elementsThen<workflow, Then::people>},
     Verb{"workflow deny",
          "WORKFLOW NAME... [--group] | --group GROUP WORKFLOW... [--dry-run]",
          "Remove users and groups from a workflow's list",
          1,
          1000,
          &denyVerb<workflow>,
-         {{"workflow deny 'Publish to Catalog' anna", "workflow deny --group studio 'Audio Episode' Archive"}}},
+         {{"workflow deny 'Publish to Catalog' anna", "workflow deny --group studio 'Audio Episode' Archive"}},
+         &elementsThen<workflow, Then::people>},
     Verb{"workflow access",
          "WORKFLOW on|off [--dry-run]",
          "Restrict a workflow to its list, or open it to everyone",
          2,
          2,
          &accessVerb<workflow>,
-         {{"workflow access Archive on", "workflow access Archive off"}}},
+         {{"workflow access Archive on", "workflow access Archive off"}},
+         &elementsThen<workflow, Then::onOrOff>},
     Verb{"access",
          "NAME|UUID [--group] [--revoke [--dry-run]]",
          "Show what a person or a group may use, or remove it from all lists",
          0,
          1,
          &accessOf,
-         {{"access anna", "access --group studio --revoke"}}},
+         {{"access anna", "access --group studio --revoke"}},
+         &peopleNames},
     Verb{"property list",
          "[--match GLOB] [--sort COLUMN] [--columns LIST] [--wide] [--names]",
          "List the workflow properties",
@@ -221,14 +260,16 @@ constexpr std::array table = {
          1,
          2,
          &propertySet,
-         {{"property set watermark left", "property set mail_password @password.txt --protect"}}},
+         {{"property set watermark left", "property set mail_password @password.txt --protect"}},
+         &propertyNames},
     Verb{"property remove",
          "NAME [--yes] [--dry-run]",
          "Remove a property",
          1,
          1,
          &propertyRemove,
-         {{"property remove watermark", "property remove mail_password"}}},
+         {{"property remove watermark", "property remove mail_password"}},
+         &propertyNames},
 };
 
 constexpr std::array options = {
