@@ -4,6 +4,7 @@
 
 #include "platform/json/Json.h"
 #include "platform/value/Value.h"
+#include "tests/support/AdministratorTree.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Kdc.h"
 #include "tests/support/SampleRoot.h"
@@ -32,24 +33,10 @@ constexpr auto patience = std::chrono::seconds(60);
 /// The account that the server lets change people.
 constexpr const char* administrator = "writer";
 
-constexpr const char* tree = R"(dn: dc=nimbo,dc=test
-objectClass: domain
-dc: nimbo
-
-dn: ou=people,dc=nimbo,dc=test
-objectClass: organizationalUnit
-ou: people
-
-dn: uid=writer,ou=people,dc=nimbo,dc=test
-objectClass: account
-objectClass: simpleSecurityObject
-uid: writer
-userPassword: )";
-
 class AccountCreation : public testing::Test {
   protected:
     void SetUp() override {
-        server.add(std::string(tree) + planted + "\n\n");
+        server.add(administratorTree(planted));
         kdc.admin("addprinc -randkey nimbo/grid1.example.org");
         root.write("/etc/demo/nimbo.service", "nimbo/grid1.example.org");
         root.recordToolCalls();

@@ -1,5 +1,6 @@
 // The grid's account through the command line, in a real LDAP server and with a real Kerberos server.
 
+#include "tests/support/AdministratorTree.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Kdc.h"
 #include "tests/support/Program.h"
@@ -30,26 +31,10 @@ using testing::Not;
 
 constexpr const char* administratorsPassword = "planted-password";
 
-constexpr const char* tree = R"(dn: dc=nimbo,dc=test
-objectClass: domain
-dc: nimbo
-
-dn: ou=people,dc=nimbo,dc=test
-objectClass: organizationalUnit
-ou: people
-
-dn: uid=writer,ou=people,dc=nimbo,dc=test
-objectClass: account
-objectClass: simpleSecurityObject
-uid: writer
-userPassword: planted-password
-
-)";
-
 class AccountVerb : public testing::Test {
   protected:
     void SetUp() override {
-        server.add(tree);
+        server.add(administratorTree(administratorsPassword));
         kdc.admin("addprinc -randkey nimbo/grid1.example.org");
         root.write("/etc/demo/nimbo.service", "nimbo/grid1.example.org");
         startDaemon("kerberos_realm = \"NIMBO.TEST\"\n");
