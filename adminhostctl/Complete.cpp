@@ -140,10 +140,10 @@ void offerKeys(const Context& context, const std::string& name, const std::strin
     const CommandRef command = context.service.command(name);
     for (const DescribedKey& one : command.description.keys()) {
         if (at == std::string::npos) {
-            candidates.offer(one.path + (one.secret ? '@' : '='));
+            candidates.offer(std::string(one.path).append(one.secret ? "@" : "="));
         } else if (one.path == key) {
             for (const std::string& value : valuesOf(one)) {
-                candidates.offer(key + '=' + value);
+                candidates.offer(std::string(key).append("=").append(value));
             }
         }
     }

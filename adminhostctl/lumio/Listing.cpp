@@ -40,7 +40,7 @@ std::string keyOfColumn(const ElementKind& kind, const Description& listing, con
         if (!key.path.starts_with(prefix) || key.path.find_first_of(".[", prefix.size()) != std::string::npos) {
             continue;
         }
-        const std::string own = key.path.substr(prefix.size());
+        std::string own = key.path.substr(prefix.size());
         if (isSameWord(name, own) || (!key.column.empty() && isSameWord(name, key.column))) {
             return own;
         }
