@@ -385,7 +385,8 @@ TEST_F(Answers, ToolsFindAPrivateDirectoryWithTheFilesThatThePluginGives) {
     const std::size_t at = text.find("XDG_CONFIG_HOME=");
     ASSERT_NE(at, std::string::npos) << text;
     const std::filesystem::path directory = text.substr(at + 16, text.find('\n', at) - at - 16);
-    EXPECT_EQ(std::filesystem::status(directory).permissions(), std::filesystem::perms::owner_all);
+    EXPECT_EQ(std::filesystem::status(directory).permissions(), std::filesystem::perms(0711))
+        << "a tool that runs as another account opens its file by name, and nobody else lists the directory";
     std::ifstream file(directory / "tool" / "rc");
     EXPECT_EQ(std::string(std::istreambuf_iterator<char>(file), {}), "of the plug-in\n");
     daemon.signal(SIGTERM);
