@@ -8,6 +8,7 @@
 #include "platform/value/ValueText.h"
 
 #include <algorithm>
+#include <array>
 
 namespace adminhost::ctl {
 namespace {
@@ -52,7 +53,8 @@ ExitStatus perform(const Context& context, Words words) {
     } else {
         writeValue(context, *answer->value, command.description);
         const Dictionary* dictionary = answer->value->dictionary();
-        status = reportAnswered(context, dictionary != nullptr ? errorOf(command.description, *dictionary) : "");
+        status =
+            reportAnswered(context, dictionary != nullptr ? errorOf(command.description, *dictionary) : "", *answer);
     }
     if (answer->notDone) {
         status = ExitStatus::failed;
@@ -100,12 +102,37 @@ void writeValue(const Context& context, const Value& value, const Description& d
     }
 }
 
-ExitStatus reportAnswered(const Context& context, const std::string& error) {
+std::string toolWordsOf(const RequestReport& report) {
+    constexpr std::array<std::string_view, 2> prefixes = {"Error: ", "in prepare, "};
+    for (const ReportedGap& gap : report.notDone) {
+        if (gap.keyPath.empty() && !gap.toolMessage.empty()) {
+            std::string_view words = gap.toolMessage;
+            for (const std::string_view prefix : prefixes) {
+                words.remove_prefix(words.starts_with(prefix) ? prefix.size() : 0);
+            }
+            return std::string(words);
+        }
+    }
+    return {};
+}
+
+ExitStatus reportAnswered(const Context& context, const std::string& error, const CommandAnswer& answer) {
     if (error.empty()) {
         return ExitStatus::done;
     }
-    context.err << "adminhostctl: the service returned an error: " << error << '\n';
+    const RequestReport report = context.service.report(answer.requestId);
+    const std::string words = toolWordsOf(report);
+    context.err << "adminhostctl: the service returned an error: " << error
+                << (words.empty() ? "" : ": " + shownIndented(words, 4)) << '\n';
+    printLog(context, report);
     return ExitStatus::failed;
+}
+
+void printLog(const Context& context, const RequestReport& report) {
+    context.err << (report.log.empty() ? "" : "log lines of the request:\n");
+    for (const std::string& line : report.log) {
+        context.err << "  " << shownIndented(line, 4) << '\n';
+    }
 }
 
 std::string gapText(const ReportedGap& gap) {
@@ -166,12 +193,7 @@ RequestReport reportLost(const Context& context, const LostAnswer& lost) {
         }
     }
     printNotDone(context, report);
-    if (!report.log.empty()) {
-        context.err << "log lines of the request:\n";
-        for (const std::string& line : report.log) {
-            context.err << "  " << shownIndented(line, 4) << '\n';
-        }
-    }
+    printLog(context, report);
     return report;
 }
 

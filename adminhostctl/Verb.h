@@ -96,8 +96,16 @@ struct Verb {
 void writeValue(const Context& context, const Value& value, const Description& description,
                 const std::string& path = {});
 
-/// Prints the error of an answer (errorOf()) on standard error and returns failed; returns done if there is none.
-[[nodiscard]] ExitStatus reportAnswered(const Context& context, const std::string& error);
+/// Prints the error of an answer (errorOf()) on standard error, with the reasons and the log lines of its request, and
+/// returns failed; returns done if there is none.
+[[nodiscard]] ExitStatus reportAnswered(const Context& context, const std::string& error, const CommandAnswer& answer);
+
+/// Why the answer has an error: the words of the tool that failed, as far as the daemon reports them ("file is not a
+/// database"); empty if it does not.
+[[nodiscard]] std::string toolWordsOf(const RequestReport& report);
+
+/// Prints the log lines of the request, if there are any.
+void printLog(const Context& context, const RequestReport& report);
 
 /// "list.0: reason (words of the tool)".
 [[nodiscard]] std::string gapText(const ReportedGap& gap);

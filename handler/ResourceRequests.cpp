@@ -19,8 +19,11 @@ using adminhost::Value;
 
 namespace {
 
-/// The response of a listing that failed: the status alone, neither command nor list.
-Response failedListing(const std::optional<Error>& error) {
+/// The response of a listing that failed: the status alone, neither command nor list. The reason is reported.
+Response failedListing(std::string_view what, const std::optional<Error>& error) {
+    if (error) {
+        adminhost::reportNotDone({"", "not read: the " + std::string(what), toolWords(*error)});
+    }
     return Dictionary{{"readStatus", error ? error->code : -1}};
 }
 
@@ -82,7 +85,7 @@ Response LumioRequestHandler::getCamerasWithRequest(const Dictionary&) {
     std::optional<Error> error;
     const auto cameras = Camera::allCamerasWithError(error);
     if (!cameras) {
-        return failedListing(error);
+        return failedListing("cameras", error);
     }
     Resource::expandAll(*cameras);
     Array list;
@@ -97,7 +100,7 @@ Response LumioRequestHandler::getAccessWithRequest(const Dictionary& request) {
     auto resources = accessOverview(languagesOf(request));
     if (!resources) {
         logEvent("adminhost_lumio: could not read who may use what: " + textOf(resources.error()));
-        return failedListing(resources.error());
+        return failedListing("cameras and workflows", resources.error());
     }
     return Dictionary{{"resources", *std::move(resources)}, {"readStatus", 0}};
 }
@@ -141,7 +144,7 @@ Response LumioRequestHandler::getWorkflowsWithRequest(const Dictionary& request)
     std::optional<Error> error;
     const auto workflows = Workflow::allWorkflowsWithError(error);
     if (!workflows) {
-        return failedListing(error);
+        return failedListing("workflows", error);
     }
     const std::vector<std::string> languages = languagesOf(request);
     Array list;
@@ -157,7 +160,7 @@ Response LumioRequestHandler::getPropertiesWithRequest(const Dictionary& request
     std::optional<Error> error;
     auto records = Property::recordsUsingLocalizations(languagesOf(request), error);
     if (!records) {
-        return failedListing(error);
+        return failedListing("properties", error);
     }
     return listing("getProperties", "properties", *std::move(records));
 }

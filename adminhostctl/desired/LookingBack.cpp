@@ -2,6 +2,7 @@
 
 #include "adminhostctl/Connection.h"
 #include "adminhostctl/Reading.h"
+#include "adminhostctl/RequestArguments.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/Toml.h"
@@ -9,7 +10,11 @@
 #include "platform/value/ValueText.h"
 
 #include <algorithm>
+#include <ctime>
 #include <iterator>
+#include <optional>
+
+#include <fmt/format.h>
 
 namespace adminhost::ctl {
 namespace {
@@ -118,15 +123,16 @@ bool addTo(Array& entries, const Dictionary& resources) {
     return false;
 }
 
-/// The plug-in's history, oldest first, one entry for each write. Entries of settings have a number.
+/// The plug-in's history, oldest first, one entry for each write. The numbers of entries without settings begin with
+/// "r".
 Array entriesOf(const Context& context, const CommandRef& write) {
     const Value answer = context.service.get("/v1/" + Connection::escaped(write.plugin) + "/history");
     Array entries = listAt(answer, "history");
     Array others;
     for (Value& resources : listAt(answer, "resources")) {
         if (!addTo(entries, *resources.dictionary())) {
-            // They have numbers of their own, which rollback does not know.
-            resources.dictionary()->remove("number");
+            // They have numbers of their own.
+            resources.dictionary()->set("number", "r" + textOf(resources.dictionary()->get("number")));
             others.push_back(std::move(resources));
         }
     }
@@ -143,17 +149,206 @@ const Dictionary& dictionaryAt(const Dictionary& dictionary, std::string_view ke
     return found == nullptr ? none : *found;
 }
 
+/// "31 Jan 2026, 09:00:05 CET".
+std::string momentText(Date date) {
+    const std::time_t seconds = date.time_since_epoch().count();
+    std::tm parts{};
+    return ::localtime_r(&seconds, &parts) == nullptr
+               ? dateText(date)
+               : fmt::format("{}:{:02} {}", dateText(date), parts.tm_sec, parts.tm_zone);
+}
+
+/// The moment of the option --since: a date, "today" or "yesterday".
+std::optional<Date> sinceOf(const Context& context) {
+    if (!context.options.has(sinceOption)) {
+        return std::nullopt;
+    }
+    std::string text = context.options.argumentOf(sinceOption);
+    if (text == "today" || text == "yesterday") {
+        std::time_t now = std::time(nullptr);
+        std::tm parts{};
+        ::localtime_r(&now, &parts);
+        parts.tm_mday -= text == "today" ? 0 : 1;
+        parts.tm_hour = parts.tm_min = parts.tm_sec = 0;
+        parts.tm_isdst = -1;
+        return Date(std::chrono::seconds(std::mktime(&parts)));
+    }
+    DescribedKey key;
+    key.path = std::string(sinceOption);
+    key.type = "date";
+    return valueOfText(key, text).date();
+}
+
+/// Whether the account is one of an entry's: its name, or its number.
+bool isBy(const Dictionary& entry, const std::string& account) {
+    const std::string who = textAt(entry, "who");
+    return who.starts_with(account + " (") || who.find(", as " + account + " (") != std::string::npos ||
+           textOf(entry.get("uid")) == account;
+}
+
+/// Leaves the entries and changes that the options ask for.
+void filter(const Context& context, Array& entries) {
+    const std::optional<Date> since = sinceOf(context);
+    const std::string user = context.options.argumentOf(userOption);
+    const std::string wanted = context.options.argumentOf(keyOption);
+    std::erase_if(entries, [&](Value& value) {
+        Dictionary& entry = *value.dictionary();
+        const auto when = entry.get("when").date();
+        if ((since && (!when || *when < *since)) || (context.options.has(userOption) && !isBy(entry, user))) {
+            return true;
+        }
+        if (!context.options.has(keyOption)) {
+            return false;
+        }
+        Value* changes = entry.find("changes");
+        if (changes == nullptr || changes->array() == nullptr) {
+            return true;
+        }
+        std::erase_if(*changes->array(), [&](const Value& change) {
+            const Dictionary* one = change.dictionary();
+            return one == nullptr || (textAt(*one, "key") != wanted && textAt(*one, "name") != wanted &&
+                                      textAt(*one, "section") != wanted);
+        });
+        return changes->array()->empty();
+    });
+}
+
+/// What a rollback changes, and what it cannot restore.
+struct Restoration {
+    Wanted wanted;
+    std::vector<std::string> lost;   ///< parts of the earlier state that cannot be restored
+    std::vector<std::string> notes;  ///< secrets, which stay as they are
+};
+
+void restoreSettings(Restoration& restoration, const Dictionary& settings, const CurrentState& current) {
+    const StateForm& form = current.form;
+    for (const std::string& key : writableKeys(form)) {
+        if (settings.contains(key)) {
+            restoration.wanted.settings.set(key, settings.get(key));
+        } else if (current.state.settings.contains(key)) {
+            restoration.lost.push_back(form.settingsSection() + '.' + key +
+                                       ": not set at that time; it cannot be removed and stays " +
+                                       valueText(current.state.settings.get(key), "(not set)"));
+        }
+    }
+    for (const DescribedKey& key : form.secrets()) {
+        if (settings.contains(form.nameOf(key))) {
+            restoration.notes.push_back(form.settingsSection() + '.' + form.nameOf(key) +
+                                        ": not restored, a stored secret cannot be written back");
+        }
+    }
+}
+
+/// The value before the change; null if it is not known. A change of an element that was not read has it only in the
+/// request that undoes it.
+Value valueBefore(const ListForm& list, const Dictionary& change) {
+    if (const Value& from = change.get("from"); !from.isNull()) {
+        return from;
+    }
+    const Array* undone = dictionaryAt(change, "undo").get(list.key).array();
+    const Dictionary* element = undone == nullptr || undone->empty() ? nullptr : undone->front().dictionary();
+    return element == nullptr ? Value() : element->get(textAt(change, "key"));
+}
+
+/// The kind of the people in a list with this name.
+std::string kindOf(const ListForm& list, const std::string& inFile) {
+    for (const PeopleForm& people : list.people) {
+        for (const auto& [kind, name] : people.kinds) {
+            if (name == inFile) {
+                return kind;
+            }
+        }
+    }
+    return {};
+}
+
+void restoreChange(Restoration& restoration, const ListForm& list, const Dictionary& change,
+                   const CurrentState& current) {
+    const std::string key = textAt(change, "key");
+    const std::string line = elementChangeText(current.form, change);
+    const auto lose = [&](const char* why) { restoration.lost.push_back(line + ": not restored, " + why); };
+    const std::vector<Element>& all = elementsOf(current.state, list);
+    const auto present = std::find_if(
+        all.begin(), all.end(), [&](const Element& element) { return element.identity == textAt(change, "identity"); });
+    const bool isPresent = present != all.end();
+    const std::string name = !isPresent ? textAt(change, "name") : present->label;
+    WantedElement wanted{list.byIdentity && isPresent ? present->identity : name, {}, {}, {}, false, false};
+    wanted.shownAs = name;
+    if (change.get("secret") == Value(true)) {
+        lose("a stored secret cannot be written back");
+        return;
+    }
+    if (key.empty() && change.get("from").isNull()) {
+        wanted.remove = true;
+        if (!isPresent) {
+            return;  // it has been removed since
+        }
+    } else if (key.empty()) {
+        const FieldForm* const text = list.addedBy.empty() || list.fields.empty() ? nullptr : &list.fields.front();
+        const Value& value = text == nullptr ? Value() : change.get("from");
+        if (isPresent) {
+            return;
+        }
+        if (text == nullptr || value.string() == nullptr || name.empty()) {
+            lose("what was removed cannot be added again");
+            return;
+        }
+        wanted.fields.set(text->key, value);
+    } else if (!isPresent) {
+        lose("it no longer exists");
+        return;
+    } else if (list.isPeople(key)) {
+        const Value& from = change.get("from");
+        if (from.isNull()) {
+            wanted.denied.push_back({kindOf(list, key), textOf(change.get("to")), ""});
+        } else {
+            wanted.lists[key] = {textOf(from)};
+        }
+    } else if (const Value before = valueBefore(list, change); !before.isNull()) {
+        wanted.fields.set(key, before);
+    } else {
+        lose("the earlier value is not known");
+        return;
+    }
+    restoration.wanted.elements[list.section].push_back(std::move(wanted));
+}
+
+/// Everything that the entry changed, as it was before. Settings are restored as a whole.
+Restoration restorationOf(const Dictionary& entry, const CurrentState& current) {
+    Restoration restoration;
+    restoration.wanted.lookUp = true;
+    if (entry.contains("settings")) {
+        restoreSettings(restoration, dictionaryAt(entry, "settings"), current);
+    }
+    const Array* changes = entry.get("changes").array();
+    // The last change of a thing is undone first.
+    for (std::size_t i = changes == nullptr ? 0 : changes->size(); i > 0; --i) {
+        const Dictionary* change = (*changes)[i - 1].dictionary();
+        for (const ListForm& list : current.form.lists()) {
+            if (change != nullptr && change->get("section") == Value(list.key)) {
+                restoreChange(restoration, list, *change, current);
+            }
+        }
+    }
+    return restoration;
+}
+
 }  // namespace
 
 ExitStatus history(const Context& context, std::span<const std::string>) {
     const CommandRef write = context.service.stateCommand("write");
-    const Array entries = entriesOf(context, write);
+    Array entries = entriesOf(context, write);
+    filter(context, entries);
     if (context.options.format != Format::text) {
+        for (Value& entry : entries) {
+            entry.dictionary()->remove("settings");
+        }
         writeValue(context, entries, Description());
         return ExitStatus::done;
     }
     if (entries.empty()) {
-        context.out << "No change has been recorded yet.\n";
+        context.out << (context.options.own.empty() ? "No change has been recorded yet.\n"
+                                                    : "No such change has been recorded.\n");
         return ExitStatus::done;
     }
     const StateForm form(write.description);
@@ -165,7 +360,7 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
         const auto when = entry.get("when").date();
         // The daemon notices an edit outside when the next write comes.
         const char* const before = entry.get("outside") == Value(true) ? "before " : "";
-        std::vector<std::string> row{number.isNull() ? "" : textOf(number), when ? before + dateText(*when) : "",
+        std::vector<std::string> row{number.isNull() ? "" : textOf(number), when ? before + momentText(*when) : "",
                                      shown(textAt(entry, "who")), ""};
         for (std::string& change : changeTexts(form, entry)) {
             row.back() = std::move(change);
@@ -174,7 +369,7 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
         }
     }
     context.out << table.text(context.options.width, 0)
-                << "\nadminhostctl rollback NUMBER restores the settings as they were before that change.\n";
+                << "\nadminhostctl rollback NUMBER restores what that change has changed; --dry-run shows it.\n";
     return ExitStatus::done;
 }
 
@@ -188,34 +383,21 @@ ExitStatus rollback(const Context& context, std::span<const std::string> argumen
     if (found == entries.end()) {
         throw usageError("history entry not found: " + arguments.front() + "; \"adminhostctl history\" lists them");
     }
-    const Dictionary& settings = dictionaryAt(*found->dictionary(), "settings");
     const CurrentState current = readState(context);
     requireWhole(current);
-    const StateForm& form = current.form;
-    Wanted wanted;
-    std::vector<std::string> staying;
-    for (const std::string& key : writableKeys(form)) {
-        if (settings.contains(key)) {
-            wanted.settings.set(key, settings.get(key));
-        } else if (current.state.settings.contains(key)) {
-            staying.push_back(key);
+    const Restoration restoration = restorationOf(*found->dictionary(), current);
+    // Before anything is written.
+    for (const std::string& lost : restoration.lost) {
+        context.err << "adminhostctl: " << shown(lost) << '\n';
+    }
+    if (!planOf(current.form, restoration.wanted, current.state).changes.empty()) {
+        for (const std::string& note : restoration.notes) {
+            context.err << shown(note) << '\n';
         }
     }
-    wanted.lookUp = true;
-    const bool changes = !planOf(form, wanted, current.state).changes.empty();
-    const ExitStatus status = carryOut(context, wanted, current);
-    for (const DescribedKey& key : form.secrets()) {
-        if (changes && settings.contains(form.nameOf(key))) {
-            context.err << form.settingsSection() << '.' << form.nameOf(key)
-                        << ": not restored, a stored secret cannot be written back\n";
-        }
-    }
-    for (const std::string& key : staying) {
-        context.err << "adminhostctl: " << form.settingsSection() << '.' << key
-                    << ": not set at that time; it cannot be removed and stays "
-                    << valueText(current.state.settings.get(key), "(not set)") << '\n';
-    }
-    return status == ExitStatus::done && !staying.empty() ? ExitStatus::failed : status;
+    context.err.flush();
+    const ExitStatus status = carryOut(context, restoration.wanted, current);
+    return status == ExitStatus::done && !restoration.lost.empty() ? ExitStatus::failed : status;
 }
 
 }  // namespace adminhost::ctl

@@ -134,7 +134,10 @@ class PlannedWrite {
             showLookedUp(_context, _current.form, _plan, *after);
             showMoved(_context, _current.form, _plan, *after);
         }
-        const ExitStatus status = reportAnswered(_context, error);
+        if (!error.empty()) {
+            _context.err << "adminhostctl: the service returned an error: " << error << '\n';
+        }
+        const ExitStatus status = error.empty() ? ExitStatus::done : ExitStatus::failed;
         if (status == ExitStatus::done && outcome.failed.empty() && outcome.undetermined.empty()) {
             return ExitStatus::done;
         }

@@ -172,7 +172,7 @@ ExitStatus accountCreate(const Context& context, std::span<const std::string> ar
         throw Failure(ExitStatus::failed, "the service did not return a dictionary");
     }
     if (const std::string error = errorOf(command.description, *said); !error.empty()) {
-        return reportAnswered(context, error);
+        return reportAnswered(context, error, *answer);
     }
     const NewAccount account{std::string(said->text("username")), std::string(said->text("password"))};
     if (account.name.empty() || account.password.empty()) {

@@ -10,6 +10,7 @@
 #include "adminhostctl/lumio/Listing.h"
 #include "adminhostctl/lumio/People.h"
 #include "platform/text/Uuid.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
 #include <cctype>
@@ -32,9 +33,16 @@ Listing listingOf(const Context& context, const CommandRef& command, const Eleme
     const std::string error = errorOf(command.description, *said);
     const Array* list = said->get(kind.section).array();
     if (!error.empty() || list == nullptr) {
-        throw Failure(ExitStatus::failed, std::string("the service does not list its ") + kind.section +
-                                              ": its database is missing or cannot be read" +
-                                              (error.empty() ? "" : " (" + error + ")"));
+        const RequestReport report = context.service.report(answer.requestId);
+        const std::string words = toolWordsOf(report);
+        const std::string status = textOf(said->get("readStatus"));
+        printLog(context, report);
+        throw Failure(ExitStatus::failed,
+                      std::string("the service does not list its ") + kind.section +
+                          (words.empty() ? ": its database is missing or cannot be read" +
+                                               (error.empty() ? std::string() : " (" + error + ")")
+                                         : ": the database cannot be read: " + words +
+                                               (words.ends_with(')') ? std::string() : " (" + status + ")")));
     }
     return {*list, context.service.gapsOf(answer)};
 }

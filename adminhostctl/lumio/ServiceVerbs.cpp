@@ -28,7 +28,7 @@ ExitStatus control(const Context& context, const std::string& name, const char* 
         writeValue(context, *answer->value, command.description);
     }
     const Dictionary* dictionary = answer->value ? answer->value->dictionary() : nullptr;
-    return reportAnswered(context, dictionary == nullptr ? "" : errorOf(command.description, *dictionary));
+    return reportAnswered(context, dictionary == nullptr ? "" : errorOf(command.description, *dictionary), *answer);
 }
 
 ExitStatus start(const Context& context, Words) {

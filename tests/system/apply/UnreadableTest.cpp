@@ -30,17 +30,17 @@ TEST_F(Unreadable, MissingDatabaseIsNotExported) {
 
 TEST_F(Unreadable, BrokenDatabaseIsNotExported) {
     std::ofstream(root.databasePath()) << std::string(4096, 'x');
-    exportFails("the service does not list its properties: its database is missing or cannot be read");
+    exportFails("parts of the state could not be read:\n  not read: the cameras (Error: ");
 }
 
 TEST_F(Unreadable, MissingTableOfWorkflowsIsNotExported) {
     root.sql("alter table workflows rename to gone");
-    exportFails("the service does not list its workflows");
+    exportFails("not read: the workflows (");
 }
 
 TEST_F(Unreadable, MissingTableOfCamerasIsNotExported) {
     root.sql("alter table cameras rename to gone");
-    exportFails("the service does not list its cameras");
+    exportFails("not read: the cameras (");
 }
 
 TEST_F(Unreadable, AccessListsThatCannotBeReadAreNotExportedAsEmpty) {
@@ -64,12 +64,22 @@ TEST_F(Unreadable, AccessListsThatCannotBeReadAreNotListedAsEmpty) {
     }
 }
 
+TEST_F(Unreadable, FailureOfTheDatabaseInsideAnAnswerIsExplained) {
+    std::ofstream(root.databasePath()) << std::string(4096, 'x');
+    const ProgramResult command = ctl({"getCameras"});
+    EXPECT_EQ(command.status, 1);
+    EXPECT_THAT(command.output, HasSubstr("the service returned an error: readStatus is 26: file is not a database"));
+    root.setSwitch("setup_preferences.exit", "3");
+    const ProgramResult read = ctl({"readSettings"});
+    EXPECT_EQ(read.status, 1);
+    EXPECT_THAT(read.output, testing::AllOf(HasSubstr("readStatus is 3"), HasSubstr("log lines of the request:\n  ")));
+}
 TEST_F(Unreadable, ListsOfABrokenDatabaseFailInTheSameWords) {
     std::ofstream(root.databasePath()) << std::string(4096, 'x');
     for (const std::string what : {"camera", "workflow", "property"}) {
         const ProgramResult list = ctl({what, "list"});
         EXPECT_EQ(list.status, 1) << what;
-        EXPECT_THAT(list.output, HasSubstr(": its database is missing or cannot be read (readStatus is 26)\n"));
+        EXPECT_THAT(list.output, HasSubstr(": the database cannot be read: file is not a database"));
     }
 }
 
