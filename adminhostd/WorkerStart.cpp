@@ -41,7 +41,7 @@ Result<StartedWorker> startWorker(bool outputToStandardError) {
     plan.environment = processEnvironment();
     plan.descriptors = {-1, outputToStandardError ? STDERR_FILENO : STDOUT_FILENO, STDERR_FILENO, other.get(),
                         tools->descriptor()};
-    plan.directory = "/";
+    plan.directory = std::string("/");
     plan.fileModeMask = S_IWGRP | S_IWOTH;
     auto started = startChild(plan);
     if (!started) {
