@@ -1,5 +1,6 @@
 #include "adminhostctl/GeneralVerbs.h"
 
+#include "adminhostctl/AuditVerb.h"
 #include "adminhostctl/Complete.h"
 #include "adminhostctl/DoctorVerb.h"
 #include "adminhostctl/Help.h"
@@ -125,6 +126,13 @@ constexpr std::array table = {
          &logs,
          {{"logs", "logs -f -n 50 application_log"}},
          &logNames},
+    Verb{"audit",
+         "[-f] [--since TIME] [--user NAME] [--key KEY]",
+         "Show who has asked the daemon for what, and what it has changed",
+         0,
+         0,
+         &audit,
+         {{"audit --since 2h", "audit -f --user anna"}}},
     Verb{"whois",
          "NAME|UUID",
          "Show the people and groups with this name or UUID",
@@ -139,8 +147,12 @@ constexpr std::array options = {
     VerbOption{dryRunOption, "", "Show what would be changed, and change nothing", {}, {}, true},
     VerbOption{yesOption, "", "Do not ask"},
     VerbOption{forceOption, "", "Also send a value that is outside its range or not one of its words", {}, {}, true},
-    VerbOption{followOption, "", "With logs: print also what is written from now on", {}, "-f"},
+    VerbOption{followOption, "", "With logs and audit: print also what is written from now on", {}, "-f"},
     VerbOption{linesOption, "LINES", "With logs: print only the last LINES lines (10 if not given)", {}, "-n"},
+    VerbOption{sinceOption, "TIME", "With audit: from this time on: a date, or 90min, 2h or 3d ago (24h if not given)"},
+    VerbOption{userOption, "NAME", "With audit: only of this user, by name or number"},
+    VerbOption{keyOption, "KEY",
+               "With audit: only what has changed this setting, property or list (port, cameras.users)"},
 };
 
 }  // namespace

@@ -1,5 +1,6 @@
 #include "adminhostctl/LogsVerb.h"
 
+#include "adminhostctl/Follow.h"
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
@@ -7,9 +8,7 @@
 
 #include <algorithm>
 #include <charconv>
-#include <chrono>
 #include <system_error>
-#include <thread>
 #include <utility>
 #include <vector>
 
@@ -20,9 +19,6 @@ constexpr std::size_t usualLines = 10;
 constexpr std::uint64_t firstWindow = std::uint64_t{64} << 10U;    ///< bytes at the end that are looked through first
 constexpr std::uint64_t largestWindow = std::uint64_t{64} << 20U;  ///< more is not held in memory
 constexpr std::size_t longestLine = std::size_t{1} << 20U;         ///< a longer one is printed in parts
-constexpr auto pollPause = std::chrono::milliseconds(500);
-constexpr auto retryPause = std::chrono::seconds(1);
-constexpr int retries = 30;
 
 struct ServiceLog {
     std::string name;
@@ -203,31 +199,14 @@ bool readOn(const Context& context, LinePrinter& printer, Followed& followed) {
     return piece.more;
 }
 
-/// Follows the logs until the output is closed or a signal ends the program. A daemon that is being restarted is waited
-/// for.
 void follow(const Context& context, LinePrinter& printer, std::vector<Followed>& all) {
-    int failures = 0;
-    while (context.out) {
+    followUntilClosed(context, [&] {
         bool more = false;
-        try {
-            for (Followed& followed : all) {
-                more = readOn(context, printer, followed) || more;
-            }
-            failures = 0;
-        } catch (const Unavailable& failure) {
-            if (++failures == retries) {
-                throw;
-            }
-            if (failures == 1) {
-                context.err << "adminhostctl: " << shown(failure.what()) << "; trying again\n";
-            }
-            std::this_thread::sleep_for(retryPause);
+        for (Followed& followed : all) {
+            more = readOn(context, printer, followed) || more;
         }
-        context.out.flush();
-        if (!more) {
-            std::this_thread::sleep_for(pollPause);
-        }
-    }
+        return more;
+    });
 }
 
 void list(const Context& context, const std::vector<ServiceLog>& logs) {

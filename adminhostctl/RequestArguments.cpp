@@ -5,6 +5,7 @@
 #include "adminhostctl/Similar.h"
 #include "platform/json/Json.h"
 #include "platform/plist/PropertyList.h"
+#include "platform/text/IsoDate.h"
 #include "platform/text/LocalDate.h"
 #include "platform/text/Utf8.h"
 
@@ -187,19 +188,6 @@ std::string withoutUnit(const DescribedKey& key, const std::string& text) {
     throw usageError(key.path + ": \"" + text + "\" is not a number of " + key.unit + " (" + std::string(unit) + ")");
 }
 
-/// "2026-01-31T08:00:00Z", or local time: "2026-01-31 08:00:00", "2026-01-31 08:00", "2026-01-31".
-std::optional<Value> dateOfText(const std::string& text) {
-    if (auto value = parseJson("{\"$date\": " + jsonOf(text) + "}"); value && value->date()) {
-        return *std::move(value);
-    }
-    for (const char* const rest : {"", ":00", " 00:00:00"}) {
-        if (const auto date = localDateOf(text + rest)) {
-            return Value(*date);
-        }
-    }
-    return std::nullopt;
-}
-
 Value parseStructure(std::string_view bytes, const std::string& from) {
     const std::size_t begin = bytes.find_first_not_of(" \t\r\n");
     auto value = begin != std::string_view::npos && bytes[begin] == '<' ? parsePropertyList(bytes) : parseJson(bytes);
@@ -326,7 +314,8 @@ Value valueOfText(const DescribedKey& key, const std::string& given) {
         }
         wanted = "yes or no";
     } else if (type == "date") {
-        value = dateOfText(text);
+        const auto date = dateOfText(text);
+        value = date ? std::optional<Value>(*date) : std::nullopt;
         wanted = "a date such as \"2026-01-31 08:00\"";
     } else {
         value = text;
@@ -412,6 +401,18 @@ Dictionary buildRequest(const Description& command, Dictionary base, const std::
         store(request, steps, std::move(value), argument.key);
     }
     return std::move(*request.dictionary());
+}
+
+std::optional<Date> dateOfText(const std::string& text) {
+    if (const auto date = isoDateOf(text)) {
+        return date;
+    }
+    for (const char* const rest : {"", ":00", " 00:00:00"}) {
+        if (const auto date = localDateOf(text + rest)) {
+            return date;
+        }
+    }
+    return std::nullopt;
 }
 
 }  // namespace adminhost::ctl

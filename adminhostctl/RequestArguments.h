@@ -60,4 +60,8 @@ struct Sources {
 /// "yes", "no" and the other usual words; nullopt for another text.
 [[nodiscard]] std::optional<bool> booleanOfText(const std::string& text);
 
+/// "2026-01-31T08:00:00Z", or local time: "2026-01-31 08:00:00", "2026-01-31 08:00", "2026-01-31". Returns nullopt for
+/// any other text.
+[[nodiscard]] std::optional<Date> dateOfText(const std::string& text);
+
 }  // namespace adminhost::ctl

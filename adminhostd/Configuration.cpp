@@ -28,6 +28,7 @@ constexpr std::string_view knownKeys[] = {"plugins",
                                           "request_deadline_seconds",
                                           "client_timeout_seconds",
                                           "queue_limit",
+                                          "queue_limit_per_account",
                                           "body_limit_bytes",
                                           "values_limit",
                                           "depth_limit",
@@ -87,6 +88,8 @@ void apply(const ConfigurationEntry& entry, Options& options) {
         options.deadline = std::chrono::milliseconds(std::llround(std::ceil(entry.seconds() * 1000)));
     } else if (entry.key() == "queue_limit") {
         options.queueLimit = static_cast<std::size_t>(entry.wholeNumber(0, longestQueue));
+    } else if (entry.key() == "queue_limit_per_account") {
+        options.queueLimitPerAccount = static_cast<std::size_t>(entry.wholeNumber(1, longestQueue));
     } else if (entry.key() == "log") {
         options.logToStandardError = entry.choice<bool>({{"syslog", false}, {"stderr", true}});
     } else if (entry.key() == "directory") {

@@ -75,7 +75,8 @@ class Daemon {
           _monitor(std::move(link)),
           _listener(std::move(listener)),
           _signals(stopSignals()),
-          _front({workerConfiguration(options, plugins, toolDirectory), _monitor, options.queueLimit, options.deadline},
+          _front({workerConfiguration(options, plugins, toolDirectory), _monitor, options.queueLimit, options.deadline,
+                  options.queueLimitPerAccount},
                  plugins.refused, std::move(checks), std::move(permissions)) {}
 
     void run() {

@@ -50,6 +50,9 @@ void ForwardingSink::changed(Change change) {
     if (change.secret || _changes.size() < changesMaximum) {
         _changes.push_back(change);
     }
+    if (_note != nullptr) {
+        _note->add(change);
+    }
     send(_descriptor, std::move(change));
 }
 
@@ -61,6 +64,9 @@ void ForwardingSink::becomesSecret(const SecretPart& part) {
 }
 
 void ForwardingSink::notDone(NotDone part) {
+    if (_note != nullptr) {
+        _note->add(part);
+    }
     send(_descriptor, std::move(part));
 }
 

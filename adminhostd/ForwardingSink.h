@@ -5,6 +5,7 @@
 // Events and reports are passed on to the front when they happen. The front writes the system log and keeps both with
 // the request's record. They are lost only together with the front itself.
 
+#include "adminhostd/BegunRequest.h"
 #include "adminhostd/FormerValues.h"
 #include "platform/framework/Report.h"
 #include "platform/log/Log.h"
@@ -27,6 +28,8 @@ class ForwardingSink final : public LogSink, public ReportSink {
     ForwardingSink& operator=(const ForwardingSink&) = delete;
     ~ForwardingSink() override;
 
+    /// Reports are added to this note too from now on; null: to none. It must outlive its use.
+    void setNote(BegunRequest* note) noexcept { _note = note; }
     /// The reports from now on are of an operation of this plug-in.
     void beginOperation(std::string_view plugin);
     /// The changes of the operation: at most changesMaximum, and all secret ones above it. They are then forgotten.
@@ -41,6 +44,7 @@ class ForwardingSink final : public LogSink, public ReportSink {
 
   private:
     int _descriptor;
+    BegunRequest* _note = nullptr;
     std::vector<Change> _changes;
     std::optional<FormerValues> _former;
 };

@@ -29,7 +29,12 @@ enum class FrameType : std::uint32_t {
     diagnose,
     readLog,
     secretPart,
-    last = secretPart,
+    proceed,
+    recorded,
+    begun,
+    unfinished,
+    readAudit,
+    last = readAudit,
 };
 
 constexpr std::size_t frameMaximum = std::size_t{128} << 20U;  ///< bytes of payload and bytes together

@@ -15,7 +15,7 @@
 namespace adminhost {
 namespace {
 
-constexpr std::size_t keptName = 100;  ///< bytes of an unknown name that are remembered and logged
+constexpr const char* unknownName = "(unknown)";
 
 /// The class that a target needs; nullopt if any class will do. A command that does not exist needs none: a client with
 /// any right may know which ones there are.
@@ -30,6 +30,8 @@ std::optional<Right> neededFor(const Target& target, const Command* command) {
         case Kind::logs:
         case Kind::metrics:
             return Right::read;
+        case Kind::audit:
+            return Right::audit;
         case Kind::events:
         case Kind::unknown:
         case Kind::overview:
@@ -77,6 +79,11 @@ Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlu
       _queue(std::move(settings),
              {[this](protocol::Hello hello) { welcome(std::move(hello)); },
               [](const std::string& event) { logEvent(event); }, [this](const SecretPart& part) { _log.hide(part); },
+              [this](const Operation& operation, const protocol::Begun& about) {
+                  operation.record->begun = true;
+                  _audit.begun(*operation.record, about);
+              },
+              [this](const protocol::Unfinished& request) { unfinished(request); },
               [this](const Operation& operation, OperationQueue::Ending ending) {
                   finished(operation, std::move(ending));
               }}) {
@@ -112,6 +119,59 @@ void Front::welcome(protocol::Hello hello) {
     }
     logEvent(
         fmt::format("adminhostd: release " ADMINHOST_RELEASE " serves with the plug-ins {}", namesIn(_hello->plugins)));
+}
+
+void Front::unfinished(const protocol::Unfinished& request) {
+    const RequestRecord* record = _log.find(request.request);
+    if (record == nullptr || record->state != RequestRecord::State::done) {
+        _audit.unfinished(request);
+    }  // else its worker died, and this front has logged its end
+}
+
+void Front::name(RequestRecord& record, const Target& target) const {
+    using Kind = Target::Kind;
+    const Command* command = commandOf(target);
+    record.plugin = target.plugin.empty() || pluginNamed(target.plugin) != nullptr ? target.plugin : unknownName;
+    switch (target.kind) {
+        case Kind::command:
+            record.command = command != nullptr ? target.command : unknownName;
+            break;
+        case Kind::overview:
+            record.command = "overview";
+            break;
+        case Kind::plugin:
+            record.command = "commands";
+            break;
+        case Kind::request:
+            record.command = "requests";
+            break;
+        case Kind::logs:
+            record.command = "logs";
+            break;
+        case Kind::unknown:
+            record.command = unknownName;
+            break;
+        case Kind::directory:
+        case Kind::history:
+        case Kind::doctor:
+        case Kind::audit:
+        case Kind::events:
+        case Kind::metrics:
+            record.command = target.command;
+            break;
+    }
+    if (const auto needed = neededFor(target, command)) {
+        record.access = nameOf(*needed);
+    }
+}
+
+void Front::close(RequestRecord& record, unsigned status, std::string_view code) {
+    record.close(status, code);
+    // Only names that exist: a client must not be able to fill the memory with others.
+    const bool known = record.plugin != unknownName && record.command != unknownName;
+    _metrics.requestEnded(known ? record.plugin : "", known ? record.command : "", status, code,
+                          record.milliseconds / 1000);
+    _audit.ended(record);
 }
 
 const protocol::OfferedPlugin* Front::pluginNamed(std::string_view name) const {
@@ -174,7 +234,7 @@ std::optional<HttpAnswer> Front::forbidden(const Exchange& exchange, const Targe
     if (!needed || rights.has(*needed)) {
         return std::nullopt;
     }
-    return errorAnswer(403, "NOT_PERMITTED", _permissions.refusal(peer, _names.of(peer.uid), *needed));
+    return errorAnswer(403, "NOT_PERMITTED", _permissions.refusal(peer, _audit.names().of(peer.uid), *needed));
 }
 
 const RequestRecord* Front::requestFor(const Peer& peer, std::string_view id) const {
@@ -186,9 +246,10 @@ const RequestRecord* Front::requestFor(const Peer& peer, std::string_view id) co
 std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target& target) const {
     using Kind = Target::Kind;
     if (target.kind == Kind::unknown) {
-        return errorAnswer(404, "UNKNOWN_ADDRESS",
-                           "Known addresses: /v1/, /v1/PLUGIN, /v1/PLUGIN/COMMAND, /v1/PLUGIN/history, /v1/directory, "
-                           "/v1/doctor, /v1/events, /v1/logs, /v1/logs/NAME, /v1/metrics, /v1/requests/ID.");
+        return errorAnswer(
+            404, "UNKNOWN_ADDRESS",
+            "Known addresses: /v1/, /v1/PLUGIN, /v1/PLUGIN/COMMAND, /v1/PLUGIN/history, /v1/audit, "
+            "/v1/directory, /v1/doctor, /v1/events, /v1/logs, /v1/logs/NAME, /v1/metrics, /v1/requests/ID.");
     }
     if (target.kind == Kind::plugin || target.kind == Kind::command || target.kind == Kind::history) {
         if (auto answer = missing(target)) {
@@ -239,13 +300,8 @@ std::variant<HttpAnswer, HttpServer::Serve> Front::head(Exchange& exchange) {
     if (stranger || exchange.method() == "POST") {
         // Log unauthorised requests, but keep them out of the log of requests.
         const std::shared_ptr<RequestRecord> record = stranger ? RequestLog::begin(exchange) : _log.add(exchange);
-        record->plugin = target.plugin.substr(0, keptName);
-        record->command = target.command.substr(0, keptName);
-        record->close(answer->status, codeOf(*answer));
-        // Only names that exist: a client must not be able to fill the memory with others.
-        const bool known = !stranger && commandOf(target) != nullptr;
-        _metrics.requestEnded(known ? target.plugin : "", known ? target.command : "", answer->status, codeOf(*answer),
-                              record->milliseconds / 1000);
+        name(*record, target);
+        close(*record, answer->status, codeOf(*answer));
     }
     return std::move(*answer);
 }
@@ -259,6 +315,7 @@ void Front::serve(Exchange& exchange, const Target& target) {
         case Target::Kind::history:
         case Target::Kind::doctor:
         case Target::Kind::logs:
+        case Target::Kind::audit:
             query(exchange, target);
             return;
         case Target::Kind::plugin: {

@@ -2,7 +2,7 @@
 
 // The front: what each address serves, which clients are permitted, and the audit.
 
-#include "adminhostd/AccountNames.h"
+#include "adminhostd/Audit.h"
 #include "adminhostd/EventClients.h"
 #include "adminhostd/FrontChecks.h"
 #include "adminhostd/Http.h"
@@ -81,13 +81,20 @@ class Front {
     void finished(const Operation& operation, OperationQueue::Ending ending);
     /// The front's own checks, and those of the worker or the reason why it made none.
     [[nodiscard]] HttpAnswer doctorAnswer(const OperationQueue::Ending& ending) const;
+    /// A request of an earlier daemon, or of a worker that died, had begun.
+    void unfinished(const protocol::Unfinished& request);
+    /// Enters into a request's record what it asks for. Names from the address that do not exist are not entered: they
+    /// may be anything, also a password.
+    void name(RequestRecord& record, const Target& target) const;
+    /// Completes a request's record and logs its end.
+    void close(RequestRecord& record, unsigned status, std::string_view code);
     /// Sends an operation's answer and logs its end.
     void end(const Operation& operation, HttpAnswer answer, std::string_view code);
 
     FrontChecks _checks;
     BodyBounds _bodyBounds;
     Permissions _permissions;
-    AccountNames _names;
+    Audit _audit;
     RequestLog _log;
     EventClients _events;
     Metrics _metrics;

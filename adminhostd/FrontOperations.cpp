@@ -3,12 +3,14 @@
 #include "adminhostd/Front.h"
 #include "adminhostd/FrontAnswers.h"
 #include "adminhostd/RequestBody.h"
+#include "platform/text/IsoDate.h"
 #include "platform/text/Utf8.h"
 
 #include <string>
 #include <utility>
 
 #include <fmt/format.h>
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
@@ -39,8 +41,7 @@ std::optional<std::chrono::steady_clock::time_point> endByOf(const Exchange& exc
 void Front::operation(Exchange& exchange, const Target& target) {
     Operation operation{&exchange, _log.add(exchange)};
     RequestRecord& record = *operation.record;
-    record.plugin = target.plugin;
-    record.command = target.command;
+    name(record, target);
     const auto refuse = [&](HttpAnswer answer) {
         const std::string code(codeOf(answer));
         end(operation, std::move(answer), code);
@@ -63,6 +64,7 @@ void Front::operation(Exchange& exchange, const Target& target) {
                       : problem.kind == Kind::tooDeep     ? errorAnswer(413, "BODY_TOO_DEEP", problem.text)
                                                           : errorAnswer(400, "MALFORMED_BODY", problem.text));
     }
+    record.redaction = Redaction(command, *request);
     const auto ifMatch = exchange.header("If-Match");
     auto revisions = revisionsOf(ifMatch.value_or("*"));
     if (ifMatch && (!revisions || !command.takesRevision)) {
@@ -73,13 +75,14 @@ void Front::operation(Exchange& exchange, const Target& target) {
     operation.deadline = command.deadline;
     operation.endBy = endByOf(exchange, record);
     const bool checkOnly = exchange.argument("check") == "1";
+    record.checkOnly = checkOnly;
     operation.changes = command.access != Access::read && !checkOnly;
     operation.urgent = command.access == Access::control && !checkOnly;
     operation.order = protocol::Perform{
         .request = record.id,
         .plugin = record.plugin,
         .command = record.command,
-        .caller = {record.peer.uid, record.peer.pid, record.peer.login},
+        .caller = {record.peer.uid, record.peer.pid, record.peer.login, record.peer.unit},
         .received = record.received,
         .arguments = std::move(*request),
         .revisions = std::move(*revisions),
@@ -99,7 +102,7 @@ std::optional<protocol::ToWorker> Front::orderFor(const Exchange& exchange, cons
         malformed = errorAnswer(400, "MALFORMED_ADDRESS", what);
         return std::nullopt;
     };
-    for (const char* argument : {"match", "is", "plugin"}) {
+    for (const char* argument : {"match", "is", "plugin", "user", "key", "after"}) {
         if (!isUtf8(exchange.argument(argument))) {
             return refuse("The address has an argument that is not UTF-8.");
         }
@@ -122,6 +125,20 @@ std::optional<protocol::ToWorker> Front::orderFor(const Exchange& exchange, cons
                                      .milliseconds = 0,
                                      .form = wantedForm(exchange)};
         }
+        case Target::Kind::audit: {
+            const std::string_view since = exchange.argument("since");
+            const auto date = since.empty() ? Date() : isoDateOf(since);
+            if (!date || date->time_since_epoch().count() < 0) {
+                return refuse("\"since\" must be a date like 2026-01-31T08:00:00Z, from 1970 on.");
+            }
+            return protocol::ReadAudit{.since = static_cast<std::uint64_t>(date->time_since_epoch().count()),
+                                       .user = std::string(exchange.argument("user")),
+                                       .key = std::string(exchange.argument("key")),
+                                       .after = std::string(exchange.argument("after")),
+                                       .account = ::geteuid(),
+                                       .milliseconds = 0,
+                                       .form = wantedForm(exchange)};
+        }
         default:
             return protocol::FindAccounts{std::string(exchange.argument("match")), std::string(exchange.argument("is")),
                                           wantedForm(exchange)};
@@ -129,12 +146,13 @@ std::optional<protocol::ToWorker> Front::orderFor(const Exchange& exchange, cons
 }
 
 void Front::query(Exchange& exchange, const Target& target) {
-    // A client that follows a log asks every second: that must not push other requests out of the log of requests.
-    const bool follows = target.kind == Target::Kind::logs && !exchange.argument("inode").empty();
+    // A client that follows a log or the audit asks every second: that must not push other requests out of the log of
+    // requests.
+    const bool follows = (target.kind == Target::Kind::logs && !exchange.argument("inode").empty()) ||
+                         (target.kind == Target::Kind::audit && !exchange.argument("after").empty());
     Operation operation{&exchange, follows ? RequestLog::begin(exchange) : _log.add(exchange)};
     operation.record->repeated = follows;
-    operation.record->plugin = target.plugin;
-    operation.record->command = target.kind == Target::Kind::logs ? "logs" : target.command;
+    name(*operation.record, target);
     HttpAnswer malformed;
     auto order = orderFor(exchange, target, malformed);
     if (!order) {
@@ -147,15 +165,25 @@ void Front::query(Exchange& exchange, const Target& target) {
     if (target.kind == Target::Kind::doctor) {
         operation.deadline = doctorBound;
         operation.beginBy = std::chrono::steady_clock::now() + doctorWait;
-    } else if (target.kind == Target::Kind::logs) {
+    } else if (target.kind == Target::Kind::logs || target.kind == Target::Kind::audit) {
         operation.deadline = logBound;
     }
     enqueue(std::move(operation));
 }
 
 void Front::enqueue(Operation operation) {
-    if (_queue.full()) {
+    const Peer& peer = operation.record->peer;
+    const auto hasTooMany = [&] { return !_permissions.isOwn(peer) && _queue.fullFor(peer.uid); };
+    if (_queue.full() || hasTooMany()) {
         _queue.dropAbandoned();
+    }
+    if (hasTooMany()) {
+        end(operation,
+            retryLater("TOO_MANY_WAITING_OF_ACCOUNT",
+                       fmt::format("{} requests of this account wait already; wait for their answers.",
+                                   _queue.limitPerAccount())),
+            "TOO_MANY_WAITING_OF_ACCOUNT");
+        return;
     }
     if (_queue.full()) {
         if (isDoctor(*operation.record)) {
@@ -218,8 +246,7 @@ HttpAnswer Front::cancel(const Peer& peer, const RequestRecord& record) {
 
 void Front::end(const Operation& operation, HttpAnswer answer, std::string_view code) {
     RequestRecord& record = *operation.record;
-    record.close(answer.status, code);
-    _metrics.requestEnded(record.plugin, record.command, answer.status, code, record.milliseconds / 1000);
+    close(record, answer.status, code);
     if (!record.repeated || answer.status >= 300) {
         _events.add(record);
     }

@@ -121,6 +121,8 @@ HttpAnswer Front::doctorAnswer(const OperationQueue::Ending& ending) const {
         }
     }
     std::vector<Diagnosis> checks = _checks.run(workers);
+    checks.push_back(_permissions.check());
+    checks.push_back(_audit.check());
     const auto* answer = std::get_if<protocol::Answer>(&ending);
     if (answer != nullptr && answer->outcome == protocol::Outcome::checked) {
         checks.insert(checks.end(), answer->checks.begin(), answer->checks.end());

@@ -16,13 +16,8 @@ namespace adminhost {
 namespace {
 
 std::string accountText(uid_t uid) {
-    std::array<char, 4096> room{};
-    passwd account{};
-    passwd* found = nullptr;
-    if (::getpwuid_r(uid, &account, room.data(), room.size(), &found) != 0 || found == nullptr) {
-        return fmt::format("uid {}", uid);
-    }
-    return fmt::format("{} (uid {})", found->pw_name, uid);
+    const std::string name = accountNameOf(uid);
+    return name.empty() ? fmt::format("uid {}", uid) : fmt::format("{} (uid {})", name, uid);
 }
 
 }  // namespace
@@ -40,6 +35,14 @@ uid_t loginOf(pid_t pid, uid_t uid) noexcept {
     uid_t login = noLogin;
     const bool parsed = size > 0 && std::from_chars(text.data(), text.data() + size, login).ec == std::errc();
     return parsed ? login : noLogin;
+}
+
+std::string accountNameOf(uid_t uid) {
+    std::array<char, 4096> room{};
+    passwd account{};
+    passwd* found = nullptr;
+    const bool known = ::getpwuid_r(uid, &account, room.data(), room.size(), &found) == 0 && found != nullptr;
+    return known ? found->pw_name : std::string();
 }
 
 std::string loginText(uid_t uid, uid_t login) {

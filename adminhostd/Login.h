@@ -17,6 +17,9 @@ constexpr uid_t noLogin = static_cast<uid_t>(-1);
 /// which also owns the files in /proc of processes that cannot be inspected.
 [[nodiscard]] uid_t loginOf(pid_t pid, uid_t uid) noexcept;
 
+/// The account's name, by all the machine's account sources: this may ask a directory service. Empty if it has none.
+[[nodiscard]] std::string accountNameOf(uid_t uid);
+
 /// "anna (uid 1000)": the account of the login session, if there is one, else that of the uid. If the two differ:
 /// "anna (uid 1000), as root (uid 0)".
 [[nodiscard]] std::string loginText(uid_t uid, uid_t login);

@@ -26,7 +26,8 @@ constexpr std::nullptr_t members = nullptr;
 
 template <>
 constexpr auto members<Caller> = std::tuple(member("caller.uid", &Caller::uid), member("caller.pid", &Caller::pid),
-                                            member("caller.login", &Caller::login));
+                                            member("caller.login", &Caller::login),
+                                            member("caller.unit", &Caller::unit));
 template <>
 constexpr auto members<Configure> = std::tuple(
     member("configure.build", &Configure::build), member("configure.root", &Configure::root),
@@ -101,6 +102,29 @@ template <>
 constexpr auto members<Hello> = std::tuple(member("hello.plugins", &Hello::plugins),
                                            member("hello.refused", &Hello::refused),
                                            member("hello.problems", &Hello::problems));
+template <>
+constexpr auto members<ReadAudit> = std::tuple(member("readAudit.since", &ReadAudit::since),
+                                               member("readAudit.user", &ReadAudit::user),
+                                               member("readAudit.key", &ReadAudit::key),
+                                               member("readAudit.after", &ReadAudit::after),
+                                               member("readAudit.account", &ReadAudit::account),
+                                               member("readAudit.milliseconds", &ReadAudit::milliseconds),
+                                               member("readAudit.form", &ReadAudit::form));
+template <>
+constexpr auto members<Proceed> = std::tuple(member("proceed.request", &Proceed::request));
+template <>
+constexpr auto members<Recorded> = std::tuple(member("recorded.request", &Recorded::request));
+template <>
+constexpr auto members<Begun> = std::tuple(member("begun.request", &Begun::request), member("begun.user", &Begun::user),
+                                           member("begun.loginUser", &Begun::loginUser),
+                                           member("begun.problem", &Begun::problem));
+template <>
+constexpr auto members<Unfinished> = std::tuple(
+    member("unfinished.request", &Unfinished::request), member("unfinished.plugin", &Unfinished::plugin),
+    member("unfinished.command", &Unfinished::command), member("unfinished.access", &Unfinished::access),
+    member("unfinished.caller", &Unfinished::caller), member("unfinished.user", &Unfinished::user),
+    member("unfinished.loginUser", &Unfinished::loginUser), member("unfinished.changes", &Unfinished::changes),
+    member("unfinished.notDone", &Unfinished::notDone), member("unfinished.end", &Unfinished::end));
 template <>
 constexpr auto members<Log> = std::tuple(member("log.event", &Log::event));
 template <>

@@ -217,6 +217,19 @@ bool OperationQueue::take(const SecretPart& part) {
     return _running.has_value();
 }
 
+bool OperationQueue::take(const protocol::Begun& begun) {
+    if (!_running || !_running->changes || _running->record->id != begun.request) {
+        return false;
+    }
+    _events.begun(*_running, begun);
+    return _worker->send(protocol::frameOf(protocol::Proceed{begun.request}));
+}
+
+bool OperationQueue::take(const protocol::Unfinished& request) {
+    _events.unfinished(request);
+    return _worker->send(protocol::frameOf(protocol::Recorded{request.request}));
+}
+
 bool OperationQueue::take(protocol::Hello hello) {
     if (_state != State::starting) {
         return false;
@@ -242,7 +255,11 @@ bool OperationQueue::take(protocol::Answer answer) {
         Clock::now() < *_running->until) {
         waitForLock(std::move(answer));
     } else {
+        const std::shared_ptr<RequestRecord> record = _running->record;
         finish(std::move(answer));
+        if (record->begun && !_worker->send(protocol::frameOf(protocol::Recorded{record->id}))) {
+            return false;
+        }
     }
     next();
     return true;

@@ -47,13 +47,16 @@ class OperationQueue {
         MonitorLink& monitor;               ///< starts the workers
         std::size_t limit = 64;
         std::chrono::milliseconds deadline{300'000};
+        std::size_t limitPerAccount = 16;
     };
     using Ending = std::variant<protocol::Answer, Unserved>;
     struct Events {
         std::function<void(protocol::Hello)> hello;
         std::function<void(const std::string&)> log;  ///< an event of the plug-ins or of the queue, for the system log
-        std::function<void(const SecretPart&)> becomesSecret;    ///< reported by the running operation
-        std::function<void(const Operation&, Ending)> finished;  ///< also its sharers are finished
+        std::function<void(const SecretPart&)> becomesSecret;                 ///< reported by the running operation
+        std::function<void(const Operation&, const protocol::Begun&)> begun;  ///< may change something from now on
+        std::function<void(const protocol::Unfinished&)> unfinished;          ///< of an earlier worker
+        std::function<void(const Operation&, Ending)> finished;               ///< also its sharers are finished
     };
 
     OperationQueue(Settings settings, Events events);
@@ -63,6 +66,9 @@ class OperationQueue {
         const bool runsAtOnce = _state == State::idle && _waiting.empty();
         return !runsAtOnce && _waiting.size() >= _settings.limit;
     }
+    /// Returns true if no further operation of this account may wait.
+    [[nodiscard]] bool fullFor(uid_t uid) const noexcept { return _waiting.countOf(uid) >= _settings.limitPerAccount; }
+    [[nodiscard]] std::size_t limitPerAccount() const noexcept { return _settings.limitPerAccount; }
     void add(Operation operation);
     /// Ends the waiting operations whose clients have closed their connections.
     void dropAbandoned();
@@ -114,6 +120,8 @@ class OperationQueue {
     bool take(const Change& change);
     bool take(const NotDone& part);
     bool take(const SecretPart& part);
+    bool take(const protocol::Begun& begun);
+    bool take(const protocol::Unfinished& request);
     bool take(protocol::Answer answer);
     void endWorker(const std::string& why);
     void workerEnded(const std::string& how);

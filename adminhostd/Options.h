@@ -30,6 +30,7 @@ struct Options {
     std::chrono::milliseconds deadline{300'000};  ///< of one operation
     RequestBounds bounds;
     std::size_t queueLimit = 64;
+    std::size_t queueLimitPerAccount = 16;  ///< for accounts other than root and the daemon's own
     std::vector<PermissionOptions> permissions;
     std::string configuration;          ///< path on disk of the file that was read; empty: none
     bool configurationIsNamed = false;  ///< on the command line

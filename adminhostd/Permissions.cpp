@@ -4,6 +4,7 @@
 #include <cerrno>
 
 #include <fmt/format.h>
+#include <fmt/ranges.h>
 #include <grp.h>
 #include <pwd.h>
 
@@ -99,6 +100,22 @@ std::string Permissions::refusal(const Peer& peer, const std::string& name, Righ
         "{} lacks the class \"{}\", which this needs. To grant it, root adds to {} the lines \"[[permission]]\", "
         "'users = [{}]' and 'classes = [\"{}\"]', and runs \"systemctl reload adminhostd\".",
         account, nameOf(right), _file, entry, nameOf(right));
+}
+
+Diagnosis Permissions::check() const {
+    if (_grants.empty()) {
+        return {Diagnosis::Health::ok, "permissions",
+                "Only root and the daemon's account may use the daemon: the configuration grants nothing to others.",
+                ""};
+    }
+    if (_problems.empty()) {
+        return {Diagnosis::Health::ok, "permissions",
+                fmt::format("All users and groups of the {} tables [[permission]] exist.", _grants.size()), ""};
+    }
+    return {Diagnosis::Health::warning, "permissions",
+            fmt::format("Names in [[permission]] were not found when the daemon read them, and grant nothing: {}.",
+                        fmt::join(_problems, "; ")),
+            "create the accounts or correct the names, and reload the daemon"};
 }
 
 }  // namespace adminhost

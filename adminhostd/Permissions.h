@@ -88,6 +88,8 @@ class Permissions {
     /// The names that were not found, as sentences with a suggested fix. They grant nothing, and the others count: a
     /// directory service that is down at the start must not lock out everybody.
     [[nodiscard]] const std::vector<std::string>& problems() const noexcept { return _problems; }
+    /// The same as a check of the installation.
+    [[nodiscard]] Diagnosis check() const;
 
   private:
     struct Grant {

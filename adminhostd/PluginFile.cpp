@@ -213,7 +213,8 @@ Result<LoadedPlugin> loadPlugin(const DiskPath& file) {
     if (loaded->plugin == nullptr) {
         return refused(fmt::format("{} has an entry point that returns no plug-in", file.text()));
     }
-    constexpr std::string_view ownAddresses[] = {"requests", "directory", "doctor", "logs", "events", "metrics"};
+    constexpr std::string_view ownAddresses[] = {"requests", "directory", "doctor", "logs",
+                                                 "events",   "metrics",   "audit"};
     if (!isAddressWord(loaded->name) ||
         std::find(std::begin(ownAddresses), std::end(ownAddresses), loaded->name) != std::end(ownAddresses)) {
         return refused(

@@ -325,6 +325,16 @@ constexpr FrameType typeOf<Diagnose> = FrameType::diagnose;
 template <>
 constexpr FrameType typeOf<ReadLog> = FrameType::readLog;
 template <>
+constexpr FrameType typeOf<ReadAudit> = FrameType::readAudit;
+template <>
+constexpr FrameType typeOf<Proceed> = FrameType::proceed;
+template <>
+constexpr FrameType typeOf<Recorded> = FrameType::recorded;
+template <>
+constexpr FrameType typeOf<Begun> = FrameType::begun;
+template <>
+constexpr FrameType typeOf<Unfinished> = FrameType::unfinished;
+template <>
 constexpr FrameType typeOf<Hello> = FrameType::hello;
 template <>
 constexpr FrameType typeOf<Log> = FrameType::log;

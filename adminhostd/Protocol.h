@@ -48,7 +48,8 @@ enum class Outcome {
 struct Caller {
     uid_t uid = 0;
     pid_t pid = 0;
-    uid_t login = 0;  ///< of its login session; noLogin: none
+    uid_t login = 0;   ///< of its login session; noLogin: none
+    std::string unit;  ///< of the service manager; empty: not known
     bool operator==(const Caller&) const = default;
 };
 
@@ -119,7 +120,32 @@ struct ReadLog {
     bool operator==(const ReadLog&) const = default;
 };
 
-using ToWorker = std::variant<Configure, Perform, FindAccounts, ReadHistory, Diagnose, ReadLog>;
+/// A page of the audit.
+struct ReadAudit {
+    std::uint64_t since = 0;         ///< seconds since 1970
+    std::string user;                ///< name or number of the account or of the login session's; empty: any
+    std::string key;                 ///< of a change ("port", "cameras.users"); empty: any
+    std::string after;               ///< `next` of an earlier page, which then counts instead of `since`; empty: none
+    std::uint64_t account = 0;       ///< that the front runs as
+    std::uint64_t milliseconds = 0;  ///< until its deadline
+    BodyForm form = BodyForm::json;
+    bool operator==(const ReadAudit&) const = default;
+};
+
+/// The reply to Begun: the beginning has been logged, and the operation may run.
+struct Proceed {
+    std::string request;
+    bool operator==(const Proceed&) const = default;
+};
+
+/// The end of a request that had begun has been logged: the worker's note about it is not needed any more.
+struct Recorded {
+    std::string request;
+    bool operator==(const Recorded&) const = default;
+};
+
+using ToWorker =
+    std::variant<Configure, Perform, FindAccounts, ReadHistory, Diagnose, ReadLog, ReadAudit, Proceed, Recorded>;
 
 // From the worker to the front.
 
@@ -151,7 +177,32 @@ struct Log {
     bool operator==(const Log&) const = default;
 };
 
-/// The reply to every message but Configure.
+/// An operation that may change something is about to run, and waits for Proceed.
+struct Begun {
+    std::string request;
+    std::string user;       ///< the name of the caller's account; empty: not known
+    std::string loginUser;  ///< and of its login session's
+    std::string problem;    ///< why no note for the next daemon could be stored; empty if there is one
+    bool operator==(const Begun&) const = default;
+};
+
+/// A request of an earlier worker whose end may not have been logged. Sent when no other process holds the lock for
+/// changes; the reply is Recorded.
+struct Unfinished {
+    std::string request;
+    std::string plugin;
+    std::string command;
+    std::string access;  ///< "write"
+    Caller caller;
+    std::string user;
+    std::string loginUser;
+    std::vector<Dictionary> changes;  ///< as requests report them, without secrets
+    std::vector<Dictionary> notDone;
+    std::string end;  ///< what is known of its end, as a part of a sentence
+    bool operator==(const Unfinished&) const = default;
+};
+
+/// The reply to every message that asks for something.
 struct Answer {
     Outcome outcome = Outcome::broken;
     std::string error;               ///< a code
@@ -168,7 +219,7 @@ struct Answer {
     bool operator==(const Answer&) const = default;
 };
 
-using ToFront = std::variant<Hello, Log, Change, NotDone, SecretPart, Answer>;
+using ToFront = std::variant<Hello, Log, Change, NotDone, SecretPart, Begun, Unfinished, Answer>;
 
 [[nodiscard]] Frame frameOf(ToWorker message);
 [[nodiscard]] Frame frameOf(ToFront message);

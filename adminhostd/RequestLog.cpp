@@ -1,13 +1,10 @@
 #include "adminhostd/RequestLog.h"
 
-#include "platform/log/Log.h"
 #include "platform/value/ValueCodec.h"
 
 #include <algorithm>
 #include <set>
 #include <utility>
-
-#include <fmt/format.h>
 
 namespace adminhost {
 namespace {
@@ -84,22 +81,6 @@ void RequestRecord::close(unsigned answered, std::string_view code) {
     state = State::done;
     status = answered;
     error = code;
-    if (repeated && status < 300) {
-        return;
-    }
-    // Names from an address come from the client: only printable ones may reach the log.
-    std::string name = plugin + "/" + command;
-    for (char& c : name) {
-        c = c < 0x21 || c > 0x7e ? '?' : c;
-    }
-    std::string reports;
-    for (const auto& [what, count] : {std::pair("changes", changes()), std::pair("not done", notDone())}) {
-        if (count > 0) {
-            reports += fmt::format(", {}: {}", what, count);
-        }
-    }
-    logEvent(fmt::format("adminhostd: request {} {} by uid {} pid {}: {}{}{} in {:.1f} ms{}", id, name, peer.uid,
-                         peer.pid, status, error.empty() ? "" : " ", error, milliseconds, reports));
 }
 
 std::map<std::string, std::vector<std::string>> RequestRecord::changedKeys(std::size_t maximum) const {

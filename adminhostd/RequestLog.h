@@ -3,6 +3,7 @@
 // The log of requests: the latest requests for operations, with their events and reports.
 
 #include "adminhostd/Http.h"
+#include "adminhostd/Redaction.h"
 #include "platform/framework/Report.h"
 #include "platform/value/Value.h"
 
@@ -40,6 +41,12 @@ struct RequestRecord {
     unsigned status = 0;
     std::string error;      ///< the code of an answer that is an error
     bool repeated = false;  ///< one of many like it, which a client sends by itself: its success is not logged
+    std::string access;     ///< the class that it needs; empty if what it names does not exist
+    bool checkOnly = false;
+    bool begun = false;  ///< the beginning of its operation has been logged
+    std::string user;    ///< the names of its accounts, if the worker has looked them up
+    std::string loginUser;
+    Redaction redaction;  ///< until it has ended
 
     // Above these bounds, events and reports are only counted.
     void add(std::string_view event);
@@ -48,7 +55,7 @@ struct RequestRecord {
     /// Withholds the values of kept changes of this part.
     void hide(const SecretPart& part);
 
-    /// Completes the record with the status of the answer and the code of its error, and logs the end of the request.
+    /// Completes the record with the status of the answer and the code of its error.
     void close(unsigned answered, std::string_view code);
 
     /// The names of the keys that the kept changes name, by section, at most so many of each.
@@ -57,6 +64,9 @@ struct RequestRecord {
     /// The number of reports, including those that were not kept.
     [[nodiscard]] std::size_t changes() const noexcept { return _changes.reported; }
     [[nodiscard]] std::size_t notDone() const noexcept { return _notDone.reported; }
+    // As clients get them.
+    [[nodiscard]] const Array& keptChanges() const noexcept { return _changes.kept; }
+    [[nodiscard]] const Array& keptNotDone() const noexcept { return _notDone.kept; }
     [[nodiscard]] std::size_t reportBytes() const noexcept { return _reportBytes; }
 
     /// The form that clients get. The reports are for the account that sent the request, and for accounts that may read

@@ -33,6 +33,9 @@ Target targetOf(std::string_view path) {
     if (path == "metrics") {
         return {Kind::metrics, {}, first};
     }
+    if (path == "audit") {
+        return {Kind::audit, {}, first};
+    }
     if (first == "logs") {
         return {Kind::logs, {}, second};
     }

@@ -53,6 +53,11 @@ std::optional<Time> WaitingOperations::due() const {
     return first;
 }
 
+std::size_t WaitingOperations::countOf(uid_t uid) const noexcept {
+    return static_cast<std::size_t>(std::count_if(_operations.begin(), _operations.end(),
+                                                  [&](const Operation& one) { return one.record->peer.uid == uid; }));
+}
+
 void WaitingOperations::add(Operation operation) {
     auto place = _operations.end();
     if (operation.urgent) {

@@ -20,6 +20,8 @@ class WaitingOperations {
 
     [[nodiscard]] bool empty() const noexcept { return _operations.empty(); }
     [[nodiscard]] std::size_t size() const noexcept { return _operations.size(); }
+    /// How many of them are this account's.
+    [[nodiscard]] std::size_t countOf(uid_t uid) const noexcept;
     /// When takeLate() has something to take; nullopt if there is no bound.
     [[nodiscard]] std::optional<Clock::time_point> due() const;
 

@@ -1,17 +1,21 @@
 #include "adminhostd/Worker.h"
 
+#include "adminhostd/AuditJournal.h"
+#include "adminhostd/ChangeNotes.h"
 #include "adminhostd/ForwardingSink.h"
 #include "adminhostd/Frame.h"
 #include "adminhostd/KeptWrite.h"
 #include "adminhostd/LoadedPlugins.h"
 #include "adminhostd/Login.h"
 #include "adminhostd/OwnMemory.h"
+#include "adminhostd/Peer.h"
 #include "adminhostd/PluginCall.h"
 #include "adminhostd/PluginLogs.h"
 #include "adminhostd/PluginTrial.h"
 #include "adminhostd/PrivateDirectory.h"
 #include "adminhostd/Protocol.h"
 #include "adminhostd/ToolConfiguration.h"
+#include "adminhostd/UnitProcesses.h"
 #include "adminhostd/WorkerAnswer.h"
 #include "adminhostd/WorkerChecks.h"
 #include "adminhostd/WorkerDirectory.h"
@@ -37,6 +41,7 @@
 #include <fmt/format.h>
 #include <malloc.h>
 #include <poll.h>
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
@@ -56,6 +61,18 @@ void setDeadline(std::optional<Clock::time_point> deadline) {
         shared->setDeadline(deadline);
     }
 }
+
+constexpr const char* frontHasEnded = "The daemon that sent the request has ended.";
+
+/// Of the messages to a worker: returns false for those without an answer of their own.
+template <class Message>
+constexpr bool asksForSomething = true;
+template <>
+constexpr bool asksForSomething<protocol::Configure> = false;
+template <>
+constexpr bool asksForSomething<protocol::Proceed> = false;
+template <>
+constexpr bool asksForSomething<protocol::Recorded> = false;
 
 bool send(int descriptor, protocol::ToFront message) {
     return writeFrame(descriptor, protocol::frameOf(std::move(message)));
@@ -83,11 +100,13 @@ class Worker {
     protocol::Answer answer(const protocol::ReadHistory& order);
     [[nodiscard]] protocol::Answer answer(const protocol::Diagnose& order) const;
     [[nodiscard]] protocol::Answer answer(const protocol::ReadLog& order) const;
+    [[nodiscard]] static protocol::Answer answer(const protocol::ReadAudit& order);
     protocol::Answer perform(const LoadedPlugin& loaded, const protocol::Perform& order);
 
     int _descriptor;
     ForwardingSink _sink;
     FrameReader _reader;
+    ChangeNotes _notes{_descriptor, _reader, _sink};
     std::chrono::milliseconds _directoryTime{};  ///< for all directory work of a request
     OwnMemory _memory;
     LoadedPlugins _plugins;
@@ -225,10 +244,11 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
         held.emplace(*std::move(lock));
         // A worker that was stopped may have missed the end of its front, and later writes of another worker.
         if (isClosed(_descriptor)) {
-            return broken("The daemon that sent the request has ended.");
+            return broken(frontHasEnded);
         }
         removeLeftovers();
         removeSettingsLeftovers();
+        _notes.reportUnfinished();
     }
     _plugins.enter(loaded);
     setTaskDeadline(deadline);
@@ -241,6 +261,9 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
             answer.outcome = Outcome::conflict;
             return answer;
         }
+    }
+    if (held && !_notes.begin(loaded, order)) {
+        return broken(frontHasEnded);
     }
     // Only a command that may change something has a history: the name of a reader is not looked up.
     std::optional<KeptWrite> write;
@@ -302,7 +325,9 @@ protocol::Answer Worker::answer(const protocol::Perform& order) {
         return notLoaded(order.plugin);
     }
     const DirectoryRequestScope directory(directoryBudget(commandNamed(*found, order.command), _directoryTime));
-    return perform(*found, order);
+    protocol::Answer answered = perform(*found, order);
+    _notes.end(answered.outcome);
+    return answered;
 }
 
 protocol::Answer Worker::answer(const protocol::ReadHistory& order) {
@@ -349,6 +374,10 @@ protocol::Answer Worker::answer(const protocol::ReadLog& order) const {
     return logAnswer(_plugins.all(), order);
 }
 
+protocol::Answer Worker::answer(const protocol::ReadAudit& order) {
+    return auditAnswer(order, unitOf(controlGroupOf(::getpid())));  // the front is in the same unit
+}
+
 std::optional<int> Worker::serve(protocol::ToWorker message) {
     if (const auto* configuration = std::get_if<protocol::Configure>(&message)) {
         if (configuration->build != ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY) {
@@ -368,8 +397,13 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
             // holds the lock, the first write removes both.
             if (const auto lock = WriteLock::tryToHold()) {
                 removeLeftovers();
+                _notes.reportUnfinished();
             }
         }
+        return std::nullopt;
+    }
+    if (const auto* recorded = std::get_if<protocol::Recorded>(&message)) {
+        ChangeNotes::recorded(*recorded);
         return std::nullopt;
     }
     protocol::Answer answered;
@@ -383,7 +417,7 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
                     bound = std::chrono::milliseconds(order.milliseconds);
                 }
                 setDeadline(Clock::now() + bound);
-                if constexpr (std::is_same_v<Order, protocol::Configure>) {
+                if constexpr (!asksForSomething<Order>) {
                     return broken({});
                 } else {
                     return answer(order);

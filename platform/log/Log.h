@@ -8,8 +8,11 @@
 
 #include "platform/framework/Export.h"
 
+#include <cstddef>
 #include <string>
 #include <string_view>
+#include <utility>
+#include <vector>
 
 namespace adminhost {
 
@@ -37,8 +40,18 @@ class ADMINHOST_EXPORT LogSink {
 ADMINHOST_EXPORT void setLogSink(LogSink& sink) noexcept;
 /// Logs one event.
 ADMINHOST_EXPORT void logEvent(std::string_view event) noexcept;
-/// Tries to write what the process's sink has queued; returns true when nothing is left. To be called from time to time
-/// while it returns false: without it, queued events wait for the next one.
+/// Fields of an entry of the journal: names in capitals, with any values.
+using LogFields = std::vector<std::pair<std::string, std::string>>;
+/// Logs one event with fields. Where the journal runs, it is an entry with these fields; the sink gets the event too,
+/// unless its output ends in the same journal. Elsewhere the sink alone gets the event.
+ADMINHOST_EXPORT void logEntry(std::string_view event, const LogFields& fields) noexcept;
+/// Returns true if the journal runs, so that logEntry() writes fields.
+[[nodiscard]] ADMINHOST_EXPORT bool journalIsThere() noexcept;
+/// The number of events that could not be logged since the start of the process, apart from those of other sinks than
+/// the two above.
+[[nodiscard]] ADMINHOST_EXPORT std::size_t lostEvents() noexcept;
+/// Tries to write what the process's sink and the journal have queued; returns true when nothing is left. To be called
+/// from time to time while it returns false: without it, queued events wait for the next one.
 ADMINHOST_EXPORT bool flushLog() noexcept;
 
 }  // namespace adminhost

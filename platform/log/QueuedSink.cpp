@@ -11,7 +11,7 @@ void QueuedSink::write(std::string_view event) noexcept {
         add(event);
         drain();
     } catch (...) {
-        ++_lost;  // no memory left
+        lose(1);  // no memory left
     }
 }
 
@@ -24,11 +24,21 @@ bool QueuedSink::flush() noexcept {
     }
 }
 
+void QueuedSink::lose(std::size_t events) noexcept {
+    _lost += events;
+    _lostInTotal += events;
+}
+
+std::size_t QueuedSink::lostInTotal() const noexcept {
+    const std::lock_guard lock(_mutex);
+    return _lostInTotal;
+}
+
 void QueuedSink::add(std::string_view event) {
     std::string text = logTextOf(event) + '\n';
     // A single event of any size is queued, because the output may accept it in parts.
     if (!_queue.empty() && _bytes + text.size() > maximum) {
-        ++_lost;
+        lose(1);
         return;
     }
     addNumberOfLost();
@@ -38,7 +48,8 @@ void QueuedSink::add(std::string_view event) {
 
 void QueuedSink::addNumberOfLost() {
     if (_lost > 0) {
-        _queue.push_back({fmt::format("adminhost: {} events were lost: the log could not be written\n", _lost), _lost});
+        _queue.push_back(
+            {fmt::format("adminhost: {} events were lost: the log could not be written\n", _lost), _lost, true});
         _bytes += _queue.back().text.size();
         _lost = 0;
     }
@@ -54,7 +65,11 @@ bool QueuedSink::drain() {
             return false;
         }
         const bool failed = written.outcome == Outcome::failed;
-        _lost += failed ? first.events : 0;
+        if (failed) {
+            // The number of lost events was counted when they were lost.
+            _lost += first.events;
+            _lostInTotal += first.isNumberOfLost ? 0 : first.events;
+        }
         _bytes -= first.text.size();
         _queue.pop_front();
         if (_queue.empty() && !failed) {

@@ -36,22 +36,27 @@ class ADMINHOST_EXPORT QueuedSink final : public LogSink {
 
     void write(std::string_view event) noexcept override;
     bool flush() noexcept override;
+    /// Events that were lost since the start of the process.
+    [[nodiscard]] std::size_t lostInTotal() const noexcept;
 
   private:
     struct Queued {
         std::string text;        ///< the part that is not written yet
         std::size_t events = 1;  ///< that are lost with it
+        bool isNumberOfLost = false;
     };
 
     void add(std::string_view event);
+    void lose(std::size_t events) noexcept;
     void addNumberOfLost();
     bool drain();
 
     Write _write;
-    std::mutex _mutex;
+    mutable std::mutex _mutex;
     std::deque<Queued> _queue;
     std::size_t _bytes = 0;  ///< in the queue
-    std::size_t _lost = 0;   ///< events that are not in the queue and whose number is not in it either
+    std::size_t _lostInTotal = 0;
+    std::size_t _lost = 0;  ///< events that are not in the queue and whose number is not in it either
 };
 
 }  // namespace adminhost

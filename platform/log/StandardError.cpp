@@ -6,8 +6,10 @@
 #include <cerrno>
 #include <climits>
 #include <cstddef>
+#include <cstdlib>
 
 #include <fcntl.h>
+#include <fmt/format.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -73,6 +75,13 @@ QueuedSink::Written writeToStandardError(std::string_view text) {
         }
     }
     return {QueuedSink::Outcome::written};
+}
+
+bool standardErrorIsTheJournal() {
+    struct stat status {};
+    const char* const stream = std::getenv("JOURNAL_STREAM");  // "DEVICE:INODE"
+    return stream != nullptr && ::fstat(STDERR_FILENO, &status) == 0 &&
+           fmt::format("{}:{}", status.st_dev, status.st_ino) == stream;
 }
 
 }  // namespace adminhost

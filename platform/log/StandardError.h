@@ -11,4 +11,7 @@ namespace adminhost {
 /// socket. Its flags are left alone, because other processes share them.
 [[nodiscard]] ADMINHOST_EXPORT QueuedSink::Written writeToStandardError(std::string_view text);
 
+/// Returns true if a service manager has connected the present standard error to the journal ($JOURNAL_STREAM).
+[[nodiscard]] ADMINHOST_EXPORT bool standardErrorIsTheJournal();
+
 }  // namespace adminhost

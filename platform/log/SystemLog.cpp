@@ -1,5 +1,7 @@
 #include "platform/log/SystemLog.h"
 
+#include "platform/log/DatagramSocket.h"
+
 #include <array>
 #include <cerrno>
 #include <cstring>
@@ -7,7 +9,6 @@
 
 #include <fmt/format.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <syslog.h>
 
 namespace adminhost {
@@ -39,16 +40,8 @@ std::string messageOf(std::string_view text) {
 }  // namespace
 
 bool SystemLog::connect() {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    _path.copy(address.sun_path, sizeof address.sun_path - 1);
-    _socket = FileDescriptor(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
-    if (!_socket.isOpen() ||
-        ::connect(_socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-        _socket.close();
-        return false;
-    }
-    return true;
+    _socket = datagramSocketTo(_path);
+    return _socket.isOpen();
 }
 
 QueuedSink::Written SystemLog::write(std::string_view text) {

@@ -100,6 +100,7 @@ TEST_F(Permission, EachClassAllowsItsOwnCommandsAndAddressesOnly) {
     for (const char* address : {"/v1/lumio/history", "/v1/directory?is=anna", "/v1/doctor", "/v1/logs"}) {
         rows.push_back({"GET", address, "read"});
     }
+    rows.push_back({"GET", "/v1/audit", "audit"});
     for (const char* address : {"/v1/", "/v1/lumio"}) {
         rows.push_back({"GET", address, ""});
     }

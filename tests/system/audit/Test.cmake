@@ -1,2 +1,2 @@
 set(TEST_LIBS host)
-set(TEST_DEPENDS adminhostd adminhostd-worker adminhostctl adminhost_lumio host_fixtures)
+set(TEST_DEPENDS adminhostd adminhostd-worker adminhostctl adminhost_lumio fixture_good)

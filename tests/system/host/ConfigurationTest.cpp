@@ -54,6 +54,7 @@ TEST_F(Start, MistakesInTheConfigurationAreNamedWithTheirLine) {
     } const cases[] = {
         {"queue_limit = 1\nqueu_limit = 2\n", "line 2, column 1: unknown key \"queu_limit\"; known keys: plugins"},
         {"\nqueue_limit = \"2\"\n", "line 2, column 15: \"queue_limit\" must be a whole number"},
+        {"queue_limit_per_account = 0\n", "line 1, column 27: \"queue_limit_per_account\" must be a whole number"},
         {"queue_limit = -1\n", "line 1, column 15: \"queue_limit\" must be"},
         {"request_deadline_seconds = 0\n",
          "line 1, column 28: \"request_deadline_seconds\" must be a number of seconds"},

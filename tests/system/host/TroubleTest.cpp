@@ -273,7 +273,7 @@ TEST(Clients, AccountThatIsNeitherRootNorTheDaemonsIsNotPermitted) {
     ASSERT_EQ(::waitpid(child, &status, 0), child);
     EXPECT_EQ(status, 0);
     EXPECT_TRUE(daemon.waitForLog("fixture/echo by uid 65534"));
-    EXPECT_TRUE(daemon.waitForLog(" / by uid 65534")) << "whatever the method";
+    EXPECT_TRUE(daemon.waitForLog(" /overview by uid 65534")) << "whatever the method";
     const std::string log = daemon.log();
     const std::string before = "adminhostd: request ";
     const std::size_t at = log.rfind(before, log.find(" fixture/echo by uid 65534")) + before.size();

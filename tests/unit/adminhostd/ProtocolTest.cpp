@@ -13,7 +13,7 @@ Perform perform() {
     return {.request = "1-2",
             .plugin = "p",
             .command = "c",
-            .caller = {7, 8, 9},
+            .caller = {7, 8, 9, "u.scope"},
             .received = Date(90s),
             .arguments = Dictionary{{"a", Array{Value(1), Value(Dictionary{{"b", 2.5}})}}},
             .revisions = {"r1", ""},
@@ -75,7 +75,10 @@ std::vector<ToWorker> messagesToWorker() {
             FindAccounts{"ma", "is", BodyForm::propertyList},
             ReadHistory{"p", BodyForm::propertyList},
             Diagnose{7},
-            ReadLog{"p", "n", 1, 2, 3, BodyForm::propertyList}};
+            ReadLog{"p", "n", 1, 2, 3, BodyForm::propertyList},
+            ReadAudit{1, "u", "k", "a", 2, 3, BodyForm::propertyList},
+            Proceed{"r"},
+            Recorded{"r"}};
 }
 
 Answer answer(Outcome outcome) {
@@ -111,7 +114,18 @@ std::vector<ToFront> messagesToFront() {
         Change{"cameras", "U", "Studio", "users", Value(1), Value("b"), true, Dictionary{{"k", 1}}, true},
         Change{"settings", "", "", "k", {}, {}, false, {}},
         NotDone{"configuration.a", "why", "words"},
-        SecretPart{"properties", "3", "value"}};
+        SecretPart{"properties", "3", "value"},
+        Begun{"r", "anna", "eva", "disk full"},
+        Unfinished{"r",
+                   "p",
+                   "c",
+                   "write",
+                   {7, 8, 9, "u.scope"},
+                   "anna",
+                   "eva",
+                   {Dictionary{{"key", "port"}}},
+                   {Dictionary{{"reason", "why"}}},
+                   "its end"}};
     for (const Outcome outcome : outcomes()) {
         messages.emplace_back(answer(outcome));
     }
@@ -207,7 +221,7 @@ TEST(Protocol, NumberOutsideTheRangeOfItsMemberIsAnError) {
         Frame frame = frameOf(perform());
         for (const DictionaryEntry& entry : Dictionary(*frame.payload.dictionary())) {
             const Dictionary* caller = entry.value.dictionary();
-            if (caller != nullptr && caller->size() == 3) {
+            if (caller != nullptr && caller->size() == 4) {
                 Dictionary changed;
                 for (const DictionaryEntry& one : *caller) {
                     changed.set(one.key, number);

@@ -1,5 +1,7 @@
+#include "platform/log/JournalSocket.h"
 #include "platform/log/Log.h"
 #include "platform/log/QueuedSink.h"
+#include "platform/log/StandardError.h"
 #include "platform/log/SystemLog.h"
 
 #include <filesystem>
@@ -13,6 +15,7 @@
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -280,6 +283,7 @@ TEST_F(SystemLogSocket, ReaderThatIsStuckDoesNotBlockAndLostEventsAreCounted) {
     }
     EXPECT_EQ(kept + lost, events);
     EXPECT_GT(lost, 0U);
+    EXPECT_EQ(sink.lostInTotal(), lost);
 }
 
 TEST_F(SystemLogSocket, RestartedReaderGetsWhatWasLoggedMeanwhile) {
@@ -305,6 +309,82 @@ TEST_F(SystemLogSocket, TextThatIsTooLongIsCutBetweenCharacters) {
     const std::size_t end = text.rfind(" (");
     EXPECT_EQ(event.compare(0, end - begin, text, begin, end - begin), 0);
     EXPECT_EQ(std::stoul(text.substr(end + 2)), event.size() - (end - begin));
+}
+
+/// The journal's end of its socket is the same kind of socket.
+class JournalEnd : public SystemLogSocket {
+  protected:
+    JournalSocket journal{path()};
+};
+
+TEST_F(JournalEnd, EntryIsOneDatagramWithItsFields) {
+    using namespace std::string_literals;
+    ASSERT_TRUE(journal.write("a message", {{"ADMINHOST_A", "1"}, {"ADMINHOST_B", "two\nlines"}, {"ADMINHOST_A", ""}}));
+    EXPECT_EQ(message(),
+              "MESSAGE=a message\nPRIORITY=5\nSYSLOG_FACILITY=3\nSYSLOG_IDENTIFIER=unit_platform_log\nADMINHOST_A=1\n"
+              "ADMINHOST_B\n\x09\0\0\0\0\0\0\0two\nlines\nADMINHOST_A=\n"s);
+    EXPECT_TRUE(journal.isThere());
+    EXPECT_EQ(journal.lostInTotal(), 0U);
+}
+
+TEST_F(JournalEnd, JournalThatIsStuckDoesNotBlockAndLostEntriesAreCounted) {
+    constexpr std::size_t entries = 40'000;
+    for (std::size_t i = 0; i < entries; ++i) {
+        ASSERT_TRUE(journal.write("entry " + std::to_string(i), {}));
+    }
+    EXPECT_FALSE(journal.flush());
+    std::size_t kept = 0;
+    for (int idle = 0; idle < 2;) {
+        journal.flush();
+        const auto text = message();
+        idle = text ? 0 : idle + 1;
+        if (text) {
+            EXPECT_NE(text->find("MESSAGE=entry " + std::to_string(kept) + "\n"), std::string::npos) << *text;
+            ++kept;
+        }
+    }
+    EXPECT_TRUE(journal.flush());
+    EXPECT_GT(journal.lostInTotal(), 0U);
+    EXPECT_EQ(kept + journal.lostInTotal(), entries);
+}
+
+TEST_F(JournalEnd, RestartedJournalIsFoundAgainAndAMissingOneLeavesTheEntryToTheCaller) {
+    ASSERT_TRUE(journal.write("one", {}));
+    ASSERT_TRUE(message());
+    ::close(socket);
+    EXPECT_FALSE(journal.write("two", {}));
+    EXPECT_FALSE(journal.isThere());
+    listen();
+    EXPECT_TRUE(journal.write("three", {}));
+    EXPECT_THAT(message().value_or(""), testing::StartsWith("MESSAGE=three\n"));
+    EXPECT_EQ(journal.lostInTotal(), 0U);
+}
+
+TEST_F(JournalEnd, EntryThatIsTooLargeIsLostAndCounted) {
+    EXPECT_TRUE(journal.write(std::string(JournalSocket::entryMaximum, 'x'), {}));
+    EXPECT_EQ(journal.lostInTotal(), 1U);
+    EXPECT_FALSE(message());
+    EXPECT_TRUE(journal.write("small", {}));
+    EXPECT_TRUE(message());
+}
+
+TEST_F(Log, EntryWithoutAJournalIsAnEventOfTheSink) {
+    Recorder recorder;
+    setLogSink(recorder);
+    logEntry("an entry", {{"ADMINHOST_A", "1"}});
+    EXPECT_THAT(recorder.events(), testing::ElementsAre("an entry"));
+}
+
+TEST_F(Log, StandardErrorIsTheJournalOnlyIfTheServiceManagerHasConnectedIt) {
+    struct stat status {};
+    ASSERT_EQ(::fstat(STDERR_FILENO, &status), 0);
+    const std::string own = std::to_string(status.st_dev) + ':' + std::to_string(status.st_ino);
+    ::setenv("JOURNAL_STREAM", own.c_str(), 1);
+    EXPECT_TRUE(standardErrorIsTheJournal());
+    ::setenv("JOURNAL_STREAM", "1:1", 1);
+    EXPECT_FALSE(standardErrorIsTheJournal()) << "it has been redirected";
+    ::unsetenv("JOURNAL_STREAM");
+    EXPECT_FALSE(standardErrorIsTheJournal());
 }
 
 TEST_F(Log, SystemLogSinkIsNotStandardError) {

@@ -1,0 +1,131 @@
+#include "adminhostd/Audit.h"
+
+#include "platform/log/Log.h"
+
+#include <utility>
+
+#include <fmt/format.h>
+
+namespace adminhost {
+namespace {
+
+constexpr auto refusalPeriod = std::chrono::minutes(1);
+constexpr std::size_t refusedAccounts = 1000;  ///< that are counted at a time
+
+}  // namespace
+
+AuditEvent Audit::eventFor(const RequestRecord& record, AuditEvent::Kind kind) {
+    AuditEvent event;
+    event.kind = kind;
+    event.request = record.id;
+    event.plugin = record.plugin;
+    event.command = record.command;
+    event.access = record.access;
+    event.checkOnly = record.checkOnly;
+    const Peer& peer = record.peer;
+    event.client = {peer.uid, record.user, peer.login, record.loginUser, peer.pid, peer.unit};
+    if (event.client.user.empty()) {
+        event.client.user = _names.of(peer.uid);
+    }
+    if (event.client.loginUser.empty() && peer.login != noLogin) {
+        event.client.loginUser = _names.of(peer.login);
+    }
+    return event;
+}
+
+void Audit::write(const AuditEvent& event, const Redaction& redaction) {
+    const AuditEvent shown = redacted(event, redaction);
+    logEntry(lineOf(shown), fieldsOf(shown));
+}
+
+void Audit::begun(RequestRecord& record, const protocol::Begun& about) {
+    record.user = about.user;
+    record.loginUser = about.loginUser;
+    if (!about.problem.empty()) {
+        ++_unrecorded;
+        _unrecordedReason = about.problem;
+    }
+    write(eventFor(record, AuditEvent::Kind::begun), record.redaction);
+}
+
+bool Audit::countRefusal(uid_t uid, std::size_t& notLogged) {
+    const auto now = Clock::now();
+    if (_refusals.size() >= refusedAccounts && !_refusals.contains(uid)) {
+        std::erase_if(_refusals, [&](const auto& one) { return now - one.second.since >= refusalPeriod; });
+        if (_refusals.size() >= refusedAccounts) {
+            _refusals.erase(_refusals.begin());
+        }
+    }
+    Refusals& refusals = _refusals.try_emplace(uid, Refusals{now}).first->second;
+    if (now - refusals.since >= refusalPeriod) {
+        refusals.since = now;
+        refusals.logged = 0;
+    }
+    if (refusals.logged == refusalsLogged) {
+        ++refusals.notLogged;
+        return false;
+    }
+    ++refusals.logged;
+    notLogged = std::exchange(refusals.notLogged, 0);
+    return true;
+}
+
+void Audit::ended(RequestRecord& record) {
+    const Redaction redaction = std::exchange(record.redaction, {});
+    AuditEvent event = eventFor(record, AuditEvent::Kind::ended);
+    constexpr unsigned forbidden = 403;
+    // Any account that can connect can cause refusals: it must not be able to fill the log.
+    const bool worthLogging = record.status == forbidden ? countRefusal(record.peer.uid, event.refusalsNotLogged)
+                                                         : !(record.repeated && record.status < 300);
+    if (!worthLogging) {
+        return;
+    }
+    event.status = record.status;
+    event.result = record.error;
+    event.milliseconds = record.milliseconds;
+    event.changes = {record.keptChanges(), record.changes()};
+    event.notDone = {record.keptNotDone(), record.notDone()};
+    write(event, redaction);
+}
+
+void Audit::unfinished(const protocol::Unfinished& request) {
+    AuditEvent event;
+    event.kind = AuditEvent::Kind::unfinished;
+    event.request = request.request;
+    event.plugin = request.plugin;
+    event.command = request.command;
+    event.access = request.access;
+    const protocol::Caller& caller = request.caller;
+    event.client = {caller.uid, request.user, caller.login, request.loginUser, caller.pid, caller.unit};
+    event.result = request.end;
+    event.changes = {Array(request.changes.begin(), request.changes.end()), request.changes.size()};
+    event.notDone = {Array(request.notDone.begin(), request.notDone.end()), request.notDone.size()};
+    write(event, Redaction());
+}
+
+Diagnosis Audit::check() const {
+    using Health = Diagnosis::Health;
+    const std::size_t lost = lostEvents();
+    const bool journal = journalIsThere();
+    const std::string where =
+        journal ? "Who does what is recorded in the journal."
+                : "Who does what is recorded as lines of the system log, because systemd-journald does not run; "
+                  "\"adminhostctl audit\" cannot show them.";
+    if (lost == 0 && _unrecorded == 0) {
+        return {Health::ok, "audit", where, ""};
+    }
+    std::string found = where;
+    if (lost > 0) {
+        found += fmt::format(" {} events could not be written since the daemon was started.", lost);
+    }
+    if (_unrecorded > 0) {
+        found += fmt::format(
+            " {} commands began without a note, so that their end would be missing if the daemon was killed: {}.",
+            _unrecorded, _unrecordedReason);
+    }
+    return {Health::warning, "audit", found,
+            lost > 0 ? "check the log service and its disk space (systemctl status systemd-journald)"
+                     : "make the directory writable, and its file system large enough"};
+}
+
+}  // namespace adminhost

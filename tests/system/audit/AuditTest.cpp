@@ -1,0 +1,187 @@
+// The audit in a real journal: what is recorded, and what is shown of it.
+
+#include "tests/system/audit/AuditFixture.h"
+
+#include <algorithm>
+#include <chrono>
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <iostream>
+#include <iterator>
+#include <optional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <fmt/format.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace adminhost {
+namespace {
+
+namespace fs = std::filesystem;
+using testing::HasSubstr;
+using testing::Not;
+using testing::SizeIs;
+
+TEST_F(AuditTest, JourneyHasTwoEventsForAChangeAndOneForAReading) {
+    const std::string write = test::connectAs({test::bert}, daemon->socket())
+                                  .post("/v1/fixture/reportWrite", R"({"changes": 1, "parts": 1, "text": "443"})")
+                                  .headers.at("request-id");
+    const std::string read =
+        test::connectAs({test::bert}, daemon->socket()).post("/v1/fixture/echo").headers.at("request-id");
+    const std::string refused =
+        test::connectAs({test::anna}, daemon->socket()).post("/v1/fixture/reportWrite").headers.at("request-id");
+
+    const auto written = awaitEntries(write, 2);
+    EXPECT_EQ(written[0].text("event"), "begun");
+    EXPECT_FALSE(written[0].contains("changes"));
+    EXPECT_EQ(written[1].text("event"), "ended");
+    for (const Dictionary& entry : written) {
+        EXPECT_EQ(entry.text("plugin"), "fixture");
+        EXPECT_EQ(entry.text("command"), "reportWrite");
+        EXPECT_EQ(entry.text("access"), "write");
+        EXPECT_EQ(entry.get("uid"), Value(test::bert));
+        EXPECT_EQ(entry.text("user"), "bert");
+        EXPECT_TRUE(entry.get("pid").isInteger());
+        EXPECT_TRUE(entry.get("when").date());
+    }
+    EXPECT_EQ(written[1].get("status"), Value(204));
+    EXPECT_TRUE(written[1].get("milliseconds").real());
+    const Array& changes = *written[1].get("changes").array();
+    ASSERT_EQ(changes.size(), 2U);
+    EXPECT_EQ(changes[0].dictionary()->text("section"), "cameras");
+    EXPECT_EQ(*changes[1].dictionary(), (Dictionary{{"section", "settings"},
+                                                    {"identity", ""},
+                                                    {"name", ""},
+                                                    {"key", "port"},
+                                                    {"from", 80},
+                                                    {"to", "443"},
+                                                    {"secret", false}}));
+    ASSERT_EQ(written[1].get("notDone").array()->size(), 2U);
+    EXPECT_EQ(written[1].get("notDone").array()->front().dictionary()->text("reason"), "not changed: camera not found");
+
+    const auto reading = awaitEntries(read, 1);
+    EXPECT_EQ(reading[0].text("event"), "ended");
+    EXPECT_FALSE(reading[0].contains("changes"));
+    const auto refusal = awaitEntries(refused, 1);
+    EXPECT_EQ(refusal[0].text("user"), "anna");
+    EXPECT_EQ(refusal[0].text("result"), "NOT_PERMITTED");
+
+    std::cout << journalctl({"--output=verbose", "ADMINHOST_REQUEST=" + write})
+              << ctl({"audit", "--since", "1h"}).output;
+}
+
+TEST_F(AuditTest, RequestThatChangesNothingLogsNoChange) {
+    const std::string id = daemon->connect().post("/v1/fixture/reportWrite", "{}").headers.at("request-id");
+    EXPECT_FALSE(awaitEntries(id, 2)[1].contains("changes"));
+    const std::string bad = daemon->connect().post("/v1/fixture/reportWrite", R"({"bad": 1})").headers.at("request-id");
+    EXPECT_EQ(awaitEntries(bad, 1)[0].text("result"), "REQUEST_REFUSED") << "nothing had begun";
+    const std::string check = daemon->connect().post("/v1/fixture/reportWrite?check=1", "{}").headers.at("request-id");
+    EXPECT_EQ(awaitEntries(check, 1)[0].get("checkOnly"), Value(true));
+}
+
+TEST_F(AuditTest, SelectionByUserKeyAndTimeAndPages) {
+    test::connectAs({test::bert}, daemon->socket()).post("/v1/fixture/reportWrite", R"({"changes": 1})");
+    const std::string last =
+        daemon->connect().post("/v1/fixture/reportWrite", R"({"text": "443"})").headers.at("request-id");
+    awaitEntries(last, 2);
+    for (const char* user : {"bert", "20002"}) {
+        const Array entries = *page(std::string("user=") + user).get("entries").array();
+        ASSERT_GE(entries.size(), 2U);
+        for (const Value& entry : entries) {
+            EXPECT_EQ(entry.dictionary()->text("user"), "bert");
+        }
+    }
+    EXPECT_THAT(*page("user=nobody-of-this-name").get("entries").array(), SizeIs(0));
+    for (const char* key : {"port", "settings", "settings.port"}) {
+        const Array entries = *page(std::string("key=") + key).get("entries").array();
+        ASSERT_GE(entries.size(), 1U);
+        EXPECT_EQ(entries.back().dictionary()->text("request"), last);
+    }
+    EXPECT_THAT(*page("key=cameras.port").get("entries").array(), SizeIs(0));
+    EXPECT_THAT(*page("since=2100-01-01T00:00:00Z").get("entries").array(), SizeIs(0));
+    EXPECT_GE(page("since=2020-01-01T00:00:00Z").get("entries").array()->size(), 4U);
+    EXPECT_EQ(daemon->connect().get("/v1/audit?since=yesterday").status, 400);
+    EXPECT_EQ(daemon->connect().get("/v1/audit?after=nowhere").status, 404);
+
+    const Dictionary all = page("");
+    EXPECT_EQ(all.get("more"), Value(false));
+    const Array rest = *page("after=" + std::string(all.text("next"))).get("entries").array();
+    for (const Value& entry : *all.get("entries").array()) {
+        EXPECT_EQ(std::count(rest.begin(), rest.end(), entry), 0) << "each entry is on one page";
+    }
+    const std::string next = daemon->connect().post("/v1/fixture/echo").headers.at("request-id");
+    ASSERT_TRUE(eventually([&] {
+        const Array newer = *page("after=" + std::string(all.text("next"))).get("entries").array();
+        return !newer.empty() && newer.back().dictionary()->text("request") == next;
+    }));
+}
+
+TEST_F(AuditTest, PageIsBounded) {
+    auto client = daemon->connect();
+    for (int i = 0; i < 250; ++i) {
+        client.post("/v1/fixture/nothing");
+    }
+    ASSERT_TRUE(eventually([&] { return page("").get("more") == Value(true); }));
+    EXPECT_EQ(page("").get("entries").array()->size(), 200U);
+}
+
+TEST_F(AuditTest, FollowingReadsAreNotRecordedThemselves) {
+    const Dictionary first = page("");
+    const auto count = [&] {
+        std::size_t readings = 0;
+        const Array entries = *page("after=" + std::string(first.text("next"))).get("entries").array();
+        for (const Value& entry : entries) {
+            readings += entry.dictionary()->text("command") == "audit" ? 1U : 0U;
+        }
+        return readings;
+    };
+    ASSERT_TRUE(eventually([&] { return count() == 1; })) << "the first page is a reading like others";
+    for (int i = 0; i < 5; ++i) {
+        EXPECT_EQ(count(), 1U);
+    }
+}
+
+TEST_F(AuditTest, CommandLinePrintsATableJsonAndFollows) {
+    daemon->connect().post("/v1/fixture/reportWrite", R"({"text": "a\u001b[2Jb\nc"})");
+    const std::string id = daemon->connect().post("/v1/fixture/echo").headers.at("request-id");
+    awaitEntries(id, 1);
+    const std::string table = ctl({"audit", "--since", "1h"}).output;
+    EXPECT_THAT(table, HasSubstr("TIME"));
+    EXPECT_THAT(table, HasSubstr("fixture/reportWrite"));
+    EXPECT_THAT(table, HasSubstr("\\x1b[2J"));
+    EXPECT_THAT(table, Not(HasSubstr("\x1b")));
+    EXPECT_THAT(table, Not(HasSubstr("begins"))) << "its end is there";
+    const auto json = parseJson(ctl({"--format", "json", "audit", "--user", "root"}).output);
+    ASSERT_TRUE(json && json->dictionary() != nullptr);
+    EXPECT_GE(json->dictionary()->get("entries").array()->size(), 3U);
+    EXPECT_EQ(ctl({"audit", "--since", "yesterday"}).status, 2);
+    EXPECT_THAT(ctl({"audit", "--since", "yesterday"}).output, HasSubstr("neither a date"));
+    EXPECT_EQ(ctl({"audit", "--since", "2026-01-31", "--key", "port"}).status, 0);
+
+    const std::string output = daemon->directory() / "followed";
+    const std::string program =
+        fmt::format("echo $$ >{1}.pid; exec {0}/bin/adminhostctl --socket {2} audit -f >{1} 2>&1", BINARY_DIR, output,
+                    daemon->socket());
+    std::thread follower([&] { static_cast<void>(test::runProgram({"/bin/sh", "-c", program})); });
+    const auto followed = [&] {
+        std::ifstream file(output);
+        return std::string(std::istreambuf_iterator<char>(file), {});
+    };
+    EXPECT_TRUE(eventually([&] { return followed().find("fixture/echo") != std::string::npos; })) << followed();
+    daemon->connect().post("/v1/fixture/languages");
+    EXPECT_TRUE(eventually([&] { return followed().find("fixture/languages") != std::string::npos; })) << followed();
+    pid_t pid = 0;
+    std::ifstream(output + ".pid") >> pid;
+    ::kill(pid, SIGTERM);
+    follower.join();
+}
+
+}  // namespace
+}  // namespace adminhost

@@ -1,0 +1,120 @@
+#include "adminhostd/BegunRequest.h"
+#include "tests/support/TemporaryRoot.h"
+
+#include <filesystem>
+#include <string>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+namespace adminhost {
+namespace {
+
+namespace fs = std::filesystem;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+constexpr const char* notes = "/var/lib/adminhostd/begun";
+
+class BegunRequests : public testing::Test {
+  protected:
+    static protocol::Unfinished about(const std::string& request) {
+        protocol::Unfinished about;
+        about.request = request;
+        about.plugin = "p";
+        about.command = "c";
+        about.access = "write";
+        about.caller = {1000, 42, 1005, "session-3.scope"};
+        about.user = "anna";
+        about.loginUser = "eva";
+        return about;
+    }
+
+    const test::TemporaryRoot root;
+};
+
+TEST_F(BegunRequests, NoteHasTheRequestItsReportsAndItsEnd) {
+    protocol::Unfinished expected = about("1-1");
+    {
+        BegunRequest request(about("1-1"), Redaction());
+        EXPECT_EQ(request.problem(), "");
+        expected.end = "its operation was interrupted";
+        EXPECT_EQ(BegunRequest::all(), std::vector{expected}) << "nothing is known yet";
+        request.add(Change{"settings", "", "", "port", 80, 443, false, Dictionary{{"port", 80}}});
+        request.add(NotDone{"configuration.x", "not known", "words"});
+        expected.changes = {Dictionary{{"section", "settings"},
+                                       {"identity", ""},
+                                       {"name", ""},
+                                       {"key", "port"},
+                                       {"from", 80},
+                                       {"to", 443},
+                                       {"secret", false}}};
+        expected.notDone = {
+            Dictionary{{"keyPath", "configuration.x"}, {"reason", "not known"}, {"toolMessage", "words"}}};
+        EXPECT_EQ(BegunRequest::all(), std::vector{expected});
+        request.ended("its operation failed");
+    }
+    expected.end = "its operation failed";
+    EXPECT_EQ(BegunRequest::all(), std::vector{expected});
+    BegunRequest::remove("1-1");
+    EXPECT_THAT(BegunRequest::all(), IsEmpty());
+    BegunRequest::remove("1-1");
+}
+
+TEST_F(BegunRequests, NotesAreForTheDaemonAlone) {
+    const BegunRequest request(about("1-1"), Redaction());
+    struct stat status {};
+    ASSERT_EQ(::stat(root.path(notes).c_str(), &status), 0);
+    EXPECT_EQ(status.st_mode & 07777U, 0700U);
+    ASSERT_EQ(::stat((root.path(notes) / "1-1").c_str(), &status), 0);
+    EXPECT_EQ(status.st_mode & 07777U, 0600U);
+}
+
+TEST_F(BegunRequests, NoteHoldsNoSecret) {
+    Command command;
+    command.description.set("keys", Array{Dictionary{{"path", "password"}, {"secret", true}}});
+    BegunRequest request(about("1-1"), Redaction(command, {{"password", "hunter2"}}));
+    request.add(Change{"settings", "", "", "password", "old", "hunter2", false, {}});
+    request.add(NotDone{"x", "hunter2", "it was hunter2"});
+    EXPECT_EQ(root.read(std::string(notes) + "/1-1").find("hunter2"), std::string::npos);
+    EXPECT_EQ(root.read(std::string(notes) + "/1-1").find("old"), std::string::npos);
+}
+
+TEST_F(BegunRequests, LastLineMayBeIncompleteAndOtherFilesAreRemovedOrIgnored) {
+    BegunRequest(about("1-1"), Redaction()).add(NotDone{"x", "why", ""});
+    const std::string whole = root.read(std::string(notes) + "/1-1");
+    root.write(std::string(notes) + "/1-1", whole + "{\"change\": {\"sec");
+    root.write(std::string(notes) + "/1-2", "garbage\n");
+    root.write(std::string(notes) + "/1-3", whole);
+    root.write(std::string(notes) + "/not a request", "kept");
+    const auto all = BegunRequest::all();
+    ASSERT_EQ(all.size(), 1U);
+    EXPECT_EQ(all[0].request, "1-1");
+    EXPECT_EQ(all[0].notDone.size(), 1U);
+    EXPECT_FALSE(fs::exists(root.path(std::string(notes) + "/1-2")));
+    EXPECT_FALSE(fs::exists(root.path(std::string(notes) + "/1-3"))) << "it is about another request";
+    EXPECT_TRUE(fs::exists(root.path(std::string(notes) + "/not a request")));
+}
+
+TEST_F(BegunRequests, RequestThatCannotBeNotedSaysWhy) {
+    root.write(notes, "a file in the place of the directory");
+    BegunRequest request(about("1-1"), Redaction());
+    EXPECT_THAT(request.problem(), HasSubstr("begun"));
+    request.add(NotDone{"x", "why", ""});
+    request.ended("its operation failed");
+    EXPECT_THAT(BegunRequest::all(), IsEmpty());
+    EXPECT_NE(BegunRequest(about("../../etc/passwd"), Redaction()).problem(), "");
+}
+
+TEST_F(BegunRequests, NoteIsBounded) {
+    BegunRequest request(about("1-1"), Redaction());
+    for (int i = 0; i < 100; ++i) {
+        request.add(NotDone{"x", std::string(100'000, 'x'), ""});
+    }
+    EXPECT_LE(fs::file_size(root.path(std::string(notes) + "/1-1")), BegunRequest::noteMaximum);
+    EXPECT_EQ(BegunRequest::all().size(), 1U);
+}
+
+}  // namespace
+}  // namespace adminhost
