@@ -46,25 +46,6 @@ FileDescriptor stopSignals() {
     return FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
 }
 
-/// Gives the settings that only a start can change their old values. Returns the keys of those that differed.
-std::vector<std::string> keepFixedSettings(Options& read, const Options& old) {
-    std::vector<std::string> keys;
-    const auto keep = [&](const char* key, auto& now, const auto& before) {
-        if (now != before) {
-            keys.emplace_back(key);
-            now = before;
-        }
-    };
-    keep("socket", read.socket, old.socket);
-    keep("socket_group", read.socketGroup, old.socketGroup);
-    keep("account", read.account, old.account);
-    keep("log", read.logToStandardError, old.logToStandardError);
-    keep("client_timeout_seconds", read.bounds.clientTimeout, old.bounds.clientTimeout);
-    keep("head_limit_bytes", read.bounds.headBytes, old.bounds.headBytes);
-    keep("connection_limit", read.bounds.connections, old.bounds.connections);
-    return keys;
-}
-
 class Daemon {
   public:
     Daemon(const Options& options, const PluginSelection& plugins, const std::string& toolDirectory, FrontChecks checks,

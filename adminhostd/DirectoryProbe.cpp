@@ -11,17 +11,13 @@ constexpr auto bound = std::chrono::seconds(8);
 
 }  // namespace
 
-void DirectoryProbe::start(protocol::Configure configuration, MonitorLink& monitor) {
+void DirectoryProbe::start(const protocol::Configure& configuration, MonitorLink& monitor) {
     const bool remote = std::any_of(configuration.directory.begin(), configuration.directory.end(),
                                     [](const DirectoryNodeOptions& node) { return !node.local; });
     if (_process || !remote) {
         return;
     }
-    configuration.probeDirectory = true;
-    _process = WorkerProcess::start(monitor);
-    if (_process && !_process->send(protocol::frameOf(std::move(configuration)))) {
-        _process.reset();
-    }
+    _process = WorkerProcess::start(monitor, WorkerProcess::Purpose::tryDirectory);
     _until = std::chrono::steady_clock::now() + bound;
 }
 

@@ -21,7 +21,7 @@ namespace adminhost {
 class DirectoryProbe {
   public:
     /// Starts to try the nodes of the configuration. Does nothing if they are all local, or are being tried already.
-    void start(protocol::Configure configuration, MonitorLink& monitor);
+    void start(const protocol::Configure& configuration, MonitorLink& monitor);
 
     void addTo(std::vector<pollfd>& entries) const;
     /// When run() has to be called at the latest.

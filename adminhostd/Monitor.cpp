@@ -1,11 +1,15 @@
 #include "adminhostd/Monitor.h"
 
+#include "adminhostd/Frame.h"
 #include "adminhostd/FrontStart.h"
 #include "adminhostd/ListeningSocket.h"
 #include "adminhostd/MonitorMessage.h"
+#include "adminhostd/PluginSelection.h"
 #include "adminhostd/PrivateDirectory.h"
+#include "adminhostd/Protocol.h"
 #include "adminhostd/RunDirectory.h"
 #include "adminhostd/ToolConfiguration.h"
+#include "adminhostd/WorkerConfiguration.h"
 #include "adminhostd/WorkerStart.h"
 #include "platform/log/Log.h"
 #include "platform/task/StartChild.h"
@@ -24,6 +28,8 @@
 #include <fmt/format.h>
 #include <poll.h>
 #include <sys/signalfd.h>
+#include <sys/socket.h>
+#include <sys/time.h>
 #include <sys/wait.h>
 
 namespace adminhost {
@@ -74,8 +80,14 @@ class Monitor {
     void stop();
     void reap();
     void receive();
-    void start(std::uint32_t number);
-    void startNow(std::uint32_t number);
+    struct Wanted {
+        std::uint32_t number;
+        bool triesNodes;
+    };
+
+    void start(Wanted wanted);
+    void startNow(Wanted wanted);
+    void reload();
     void startWaiting();
     void kill(Worker& worker);
     bool collect(Worker& worker);
@@ -83,10 +95,11 @@ class Monitor {
     void sendToFront(const MonitorMessage& message, std::span<const int> descriptors = {});
     [[nodiscard]] int timeout() const;
 
-    const Options& _options;
+    Options _options;
     std::vector<std::string> _arguments;
     ListeningSocket& _socket;
     const std::string& _toolDirectory;
+    protocol::Configure _configuration = workerConfiguration(_options, selectPlugins(_options), _toolDirectory);
     FileDescriptor _signals = monitorSignals();
     pid_t _front = 0;  ///< 0 while none is running
     FileDescriptor _link;
@@ -95,7 +108,7 @@ class Monitor {
     std::optional<Clock::time_point> _frontDue;
     std::chrono::milliseconds _pause{0};
     std::list<Worker> _workers;
-    std::vector<std::uint32_t> _waiting;  ///< that the front has asked for, while the last front's worker is running
+    std::vector<Wanted> _waiting;  ///< that the front has asked for, while the last front's worker is running
     bool _stopping = false;
     int _status = 0;
 };
@@ -201,6 +214,7 @@ void Monitor::signalled() {
     signalfd_siginfo signal{};
     while (::read(_signals.get(), &signal, sizeof signal) > 0) {
         if (signal.ssi_signo == SIGHUP) {
+            reload();
             if (_front != 0) {  // the next one reads the configuration anyway
                 ::kill(_front, SIGHUP);
             }
@@ -209,6 +223,19 @@ void Monitor::signalled() {
         }
     }
     reap();
+}
+
+/// For the workers that are started from now on. The front reports what is wrong with the file, and what cannot be
+/// changed.
+void Monitor::reload() {
+    try {
+        Options read = readOptionsAgain(_options.arguments);
+        static_cast<void>(keepFixedSettings(read, _options));
+        _configuration = workerConfiguration(read, selectPlugins(read), _toolDirectory);
+        _options = std::move(read);
+    } catch (const std::exception&) {
+        // The old one stays in effect.
+    }
 }
 
 void Monitor::reap() {
@@ -251,9 +278,9 @@ void Monitor::receive() {
                                         [&](const Worker& worker) { return worker.number == number && !worker.left; });
         if (received.kind == Kind::message && received.message.kind == MonitorMessage::Kind::start && _front != 0 &&
             found == _workers.end()) {
-            start(number);
+            start({number, received.message.status == 1});
         } else if (received.kind == Kind::message && received.message.kind == MonitorMessage::Kind::kill) {
-            std::erase(_waiting, number);
+            std::erase_if(_waiting, [&](const Wanted& wanted) { return wanted.number == number; });
             if (found != _workers.end()) {
                 kill(*found);
                 if (collect(*found)) {
@@ -268,31 +295,45 @@ void Monitor::receive() {
     }
 }
 
-void Monitor::start(std::uint32_t number) {
+void Monitor::start(Wanted wanted) {
+    const std::uint32_t number = wanted.number;
     _served = true;
     const auto left = std::find_if(_workers.begin(), _workers.end(), [](const Worker& worker) { return worker.left; });
     if (_workers.size() + _waiting.size() >= workerMaximum) {
         sendToFront({MonitorMessage::Kind::start, number, 0, EAGAIN});
     } else if (left != _workers.end()) {
-        _waiting.push_back(number);
+        _waiting.push_back(wanted);
         sendToFront({MonitorMessage::Kind::start, number, left->process.pid, EBUSY});
     } else {
-        startNow(number);
+        startNow(wanted);
     }
 }
 
 void Monitor::startWaiting() {
     if (std::none_of(_workers.begin(), _workers.end(), [](const Worker& worker) { return worker.left; })) {
-        for (const std::uint32_t number : std::exchange(_waiting, {})) {
-            startNow(number);
+        for (const Wanted& wanted : std::exchange(_waiting, {})) {
+            startNow(wanted);
         }
     }
 }
 
-void Monitor::startNow(std::uint32_t number) {
+void Monitor::startNow(Wanted wanted) {
+    const std::uint32_t number = wanted.number;
     auto started = startWorker(_options.logToStandardError);
     if (!started) {
         sendToFront({MonitorMessage::Kind::start, number, 0, static_cast<std::int32_t>(started.error().code)});
+        return;
+    }
+    // The configuration is in the conversation before the front gets its end: a front that was taken over must not
+    // choose what the worker loads, or where it works.
+    protocol::Configure configuration = _configuration;
+    configuration.probeDirectory = wanted.triesNodes;
+    const timeval bound{5, 0};
+    ::setsockopt(started->conversation.get(), SOL_SOCKET, SO_SNDTIMEO, &bound, sizeof bound);
+    if (!writeFrame(started->conversation.get(), protocol::frameOf(std::move(configuration)))) {
+        ::kill(started->pid, SIGKILL);
+        ::waitpid(started->pid, nullptr, 0);
+        sendToFront({MonitorMessage::Kind::start, number, 0, EIO});
         return;
     }
     const int descriptors[] = {started->conversation.get(), started->process.get()};

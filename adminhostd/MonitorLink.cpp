@@ -5,13 +5,13 @@
 
 namespace adminhost {
 
-std::uint32_t MonitorLink::start(Receiver receiver) {
+std::uint32_t MonitorLink::start(bool triesNodes, Receiver receiver) {
     if (closed()) {
         errno = EPIPE;
         return 0;
     }
     const std::uint32_t number = ++_last;
-    if (!sendMonitorMessage(_socket.get(), {MonitorMessage::Kind::start, number, 0, 0})) {
+    if (!sendMonitorMessage(_socket.get(), {MonitorMessage::Kind::start, number, 0, triesNodes ? 1 : 0})) {
         return 0;
     }
     _receivers.emplace(number, std::move(receiver));

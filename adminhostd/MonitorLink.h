@@ -24,9 +24,9 @@ class MonitorLink {
     MonitorLink(const MonitorLink&) = delete;
     MonitorLink& operator=(const MonitorLink&) = delete;
 
-    /// Asks for a worker and returns its number; 0, with errno, if the monitor cannot be asked. The receiver is called
-    /// by run() until forget().
-    [[nodiscard]] std::uint32_t start(Receiver receiver);
+    /// Asks for a worker, or for one that only tries the directory's nodes, and returns its number; 0, with errno, if
+    /// the monitor cannot be asked. The receiver is called by run() until forget().
+    [[nodiscard]] std::uint32_t start(bool triesNodes, Receiver receiver);
     /// Has the worker and its tools killed. Without a monitor, nothing can be killed: the worker ends by itself.
     void kill(std::uint32_t worker) noexcept;
     void forget(std::uint32_t worker) noexcept { _receivers.erase(worker); }

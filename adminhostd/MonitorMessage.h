@@ -2,7 +2,8 @@
 
 // The messages between monitor and front: three of one fixed size over a socket pair that keeps their boundaries.
 //
-//     start   front -> monitor: start a worker under this number.
+//     start   front -> monitor: start a worker under this number; if `status` is 1, one that only tries the nodes of
+//             the directory. What it loads, and where, is the monitor's to say: it sends the worker its configuration.
 //             monitor -> front: it runs as `process`, and two descriptors come along: the conversation with the worker,
 //             and a pidfd of it. If `status` is not 0, it does not run: EBUSY while the monitor waits for the end of
 //             `process`, a worker of an earlier front, after which another "start" follows; any other number of the

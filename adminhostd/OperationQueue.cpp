@@ -72,7 +72,7 @@ void OperationQueue::start() {
     ++_starts;
     _replaceWorker = false;
     _worker = WorkerProcess::start(_settings.monitor);
-    if (!_worker || !_worker->send(protocol::frameOf(_settings.configuration))) {
+    if (!_worker) {
         startFailed(fmt::format("cannot be started: {}", std::strerror(errno)));
         return;
     }

@@ -43,7 +43,7 @@ struct Unserved {
 class OperationQueue {
   public:
     struct Settings {
-        protocol::Configure configuration;  ///< sent to every worker first
+        protocol::Configure configuration;  ///< of every worker, which gets it from the monitor
         MonitorLink& monitor;               ///< starts the workers
         std::size_t limit = 64;
         std::chrono::milliseconds deadline{300'000};

@@ -114,6 +114,24 @@ Options readOptionsAgain(const std::vector<std::string>& arguments) {
     return *std::move(options);
 }
 
+std::vector<std::string> keepFixedSettings(Options& read, const Options& old) {
+    std::vector<std::string> keys;
+    const auto keep = [&](const char* key, auto& now, const auto& before) {
+        if (now != before) {
+            keys.emplace_back(key);
+            now = before;
+        }
+    };
+    keep("socket", read.socket, old.socket);
+    keep("socket_group", read.socketGroup, old.socketGroup);
+    keep("account", read.account, old.account);
+    keep("log", read.logToStandardError, old.logToStandardError);
+    keep("client_timeout_seconds", read.bounds.clientTimeout, old.bounds.clientTimeout);
+    keep("head_limit_bytes", read.bounds.headBytes, old.bounds.headBytes);
+    keep("connection_limit", read.bounds.connections, old.bounds.connections);
+    return keys;
+}
+
 std::string configurationFile(const Options& options) {
     return options.configuration.empty() ? diskPath(HostPath(defaultConfiguration)).text() : options.configuration;
 }

@@ -47,6 +47,9 @@ struct Options {
 /// The same for a process that is running already. Throws std::runtime_error with the description of a mistake.
 [[nodiscard]] Options readOptionsAgain(const std::vector<std::string>& arguments);
 
+/// Gives the settings that only a start can change their old values. Returns the keys of those that differed.
+std::vector<std::string> keepFixedSettings(Options& read, const Options& old);
+
 /// Applies a configuration file to the options. Throws std::runtime_error with the file, the line, the column and a
 /// description.
 void readConfiguration(const std::string& file, Options& options);

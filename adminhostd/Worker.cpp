@@ -55,6 +55,12 @@ constexpr std::size_t largeMessage = std::size_t{1} << 20U;
 /// For an order that has no deadline: the front ends it earlier.
 constexpr std::chrono::milliseconds undatedBound = std::chrono::minutes(5);
 
+/// The time of an order. A front that was taken over may send any number.
+std::chrono::milliseconds timeOf(const auto& order) {
+    constexpr std::chrono::milliseconds longest = std::chrono::hours(48);
+    return std::chrono::milliseconds(std::min<std::uint64_t>(order.milliseconds, longest.count()));
+}
+
 /// Shows the monitor until when an operation runs, so that it can end one whose front has died.
 void setDeadline(std::optional<Clock::time_point> deadline) {
     if (ToolRegister* const shared = toolRegister()) {
@@ -111,6 +117,7 @@ class Worker {
     OwnMemory _memory;
     LoadedPlugins _plugins;
     FileDescriptor _toolConfiguration;  ///< open: the directory stays if the front is killed and another one starts
+    bool _configured = false;
     bool _leftoversRemoved = false;
     bool _settingsLeftoversRemoved = false;
     bool _returnMemory = false;  ///< a large message has been freed
@@ -229,8 +236,8 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
     if (order.checkOnly) {
         return written(Outcome::answered, Dictionary{{"findings", Array()}}, order.form);
     }
-    const auto deadline = Clock::now() + std::chrono::milliseconds(order.milliseconds);
-    if (const auto unmet = _plugins.unmetNeed(loaded, order.command, std::chrono::milliseconds(order.milliseconds))) {
+    const auto deadline = Clock::now() + timeOf(order);
+    if (const auto unmet = _plugins.unmetNeed(loaded, order.command, timeOf(order))) {
         return unmetAnswer(*unmet, order.form);
     }
     std::optional<WriteLock::Held> held;
@@ -355,7 +362,7 @@ protocol::Answer Worker::answer(const protocol::FindAccounts& order) {
 }
 
 protocol::Answer Worker::answer(const protocol::Diagnose& order) const {
-    const auto deadline = Clock::now() + std::chrono::milliseconds(order.milliseconds);
+    const auto deadline = Clock::now() + timeOf(order);
     setTaskDeadline(deadline);
     protocol::Answer answer;
     answer.outcome = Outcome::checked;
@@ -379,7 +386,13 @@ protocol::Answer Worker::answer(const protocol::ReadAudit& order) {
 }
 
 std::optional<int> Worker::serve(protocol::ToWorker message) {
-    if (const auto* configuration = std::get_if<protocol::Configure>(&message)) {
+    const auto* configuration = std::get_if<protocol::Configure>(&message);
+    // The monitor sends the configuration, before the front can send anything.
+    if (std::exchange(_configured, true) == (configuration != nullptr)) {
+        logEvent("adminhostd: the worker was sent what it may not be sent, and ends");
+        return 1;
+    }
+    if (configuration != nullptr) {
         if (configuration->build != ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY) {
             logEvent("adminhostd: the worker is of another release than the daemon; restart the daemon");
             return 1;
@@ -414,7 +427,7 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
             [&]<class Order>(const Order& order) {
                 auto bound = undatedBound;
                 if constexpr (requires { order.milliseconds; }) {
-                    bound = std::chrono::milliseconds(order.milliseconds);
+                    bound = timeOf(order);
                 }
                 setDeadline(Clock::now() + bound);
                 if constexpr (!asksForSomething<Order>) {

@@ -24,9 +24,10 @@ bool isReady(std::span<const pollfd> polled, int descriptor) noexcept {
 
 }  // namespace
 
-std::unique_ptr<WorkerProcess> WorkerProcess::start(MonitorLink& monitor) {
+std::unique_ptr<WorkerProcess> WorkerProcess::start(MonitorLink& monitor, Purpose purpose) {
     std::unique_ptr<WorkerProcess> worker(new WorkerProcess(monitor));
-    worker->_number = monitor.start([self = worker.get()](ReceivedMessage& received) { self->receive(received); });
+    worker->_number = monitor.start(purpose == Purpose::tryDirectory,
+                                    [self = worker.get()](ReceivedMessage& received) { self->receive(received); });
     return worker->_number == 0 ? nullptr : std::move(worker);
 }
 

@@ -21,9 +21,11 @@ namespace adminhost {
 
 class WorkerProcess {
   public:
-    /// Asks the monitor for a worker; what is sent to it meanwhile is kept. Returns null, with errno, if the monitor
-    /// cannot be asked. The link must outlive the object.
-    [[nodiscard]] static std::unique_ptr<WorkerProcess> start(MonitorLink& monitor);
+    enum class Purpose { serve, tryDirectory };
+
+    /// Asks the monitor for a worker, which gets its configuration from the monitor. What is sent to it meanwhile is
+    /// kept. Returns null, with errno, if the monitor cannot be asked. The link must outlive the object.
+    [[nodiscard]] static std::unique_ptr<WorkerProcess> start(MonitorLink& monitor, Purpose purpose = Purpose::serve);
 
     WorkerProcess(const WorkerProcess&) = delete;
     WorkerProcess& operator=(const WorkerProcess&) = delete;

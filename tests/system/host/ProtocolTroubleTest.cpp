@@ -1,7 +1,16 @@
 // Workers that break the protocol: each is killed, its request fails, and the next worker serves the others.
 
 #include "adminhostd/Protocol.h"
+#include "platform/files/FileDescriptor.h"
+#include "platform/framework/BuildNote.h"
+#include "platform/task/StartChild.h"
+#include "platform/task/ToolRegister.h"
+#include "tests/support/TemporaryRoot.h"
 #include "tests/system/host/Host.h"
+
+#include <sys/socket.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 namespace adminhost::test {
 namespace {
@@ -70,6 +79,79 @@ TEST_F(ProtocolTrouble, AnswerOrReportWhileIdleEndsTheWorker) {
     answer.outcome = protocol::Outcome::nothing;
     expectEndedWhileIdle(bytesOf(answer));
     expectEndedWhileIdle(bytesOf(NotDone{"a", "b", "c"}));
+}
+
+/// A worker without a front, to which a test says what it likes.
+class LoneWorker : public ::testing::Test {
+  protected:
+    LoneWorker() {
+        int ends[2];
+        EXPECT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
+        _conversation = FileDescriptor(ends[0]);
+        const FileDescriptor other(ends[1]);
+        auto tools = ToolRegister::create();
+        EXPECT_TRUE(tools);
+        ChildPlan plan;
+        plan.program = std::string(BINARY_DIR) + "/bin/adminhostd-worker";
+        plan.arguments = {"adminhostd-worker"};
+        plan.environment = processEnvironment();
+        plan.descriptors = {-1, STDERR_FILENO, STDERR_FILENO, other.get(), tools->descriptor()};
+        auto started = startChild(plan);
+        EXPECT_TRUE(started);
+        _pid = started->pid;
+    }
+
+    [[nodiscard]] protocol::Configure configuration(const char* plugin) const {
+        protocol::Configure configuration;
+        configuration.build = ADMINHOST_RELEASE ", " ADMINHOST_BUILD_IDENTITY;
+        configuration.root = _root.path("/");
+        configuration.plugins = {pluginFile(plugin)};
+        return configuration;
+    }
+    [[nodiscard]] bool send(protocol::ToWorker message) const {
+        return writeFrame(_conversation.get(), protocol::frameOf(std::move(message)));
+    }
+    /// Everything that the worker sends up to its end, as the names of the messages; its plug-ins are added to the
+    /// list.
+    [[nodiscard]] int end(std::vector<std::string>& loaded, std::string& log) {
+        FrameReader reader;
+        while (auto frame = readFrame(_conversation.get(), reader)) {
+            auto message = protocol::toFront(std::move(*frame));
+            if (const auto* hello = message ? std::get_if<protocol::Hello>(&*message) : nullptr) {
+                for (const protocol::OfferedPlugin& plugin : hello->plugins) {
+                    loaded.push_back(plugin.file);
+                }
+            } else if (const auto* event = message ? std::get_if<protocol::Log>(&*message) : nullptr) {
+                log += event->event;
+            }
+        }
+        int status = -1;
+        EXPECT_EQ(::waitpid(_pid, &status, 0), _pid);
+        return WEXITSTATUS(status);
+    }
+
+    const TemporaryRoot _root;
+    FileDescriptor _conversation;
+    pid_t _pid = -1;
+};
+
+TEST_F(LoneWorker, ConfigurationAfterThatOfTheMonitorIsRefusedAndNothingOfItIsUsed) {
+    ASSERT_TRUE(send(configuration("fixture_good")));
+    // What a front that was taken over would send: another plug-in at another place.
+    ASSERT_TRUE(send(configuration("fixture_throwing")));
+    std::vector<std::string> loaded;
+    std::string log;
+    EXPECT_EQ(end(loaded, log), 1);
+    EXPECT_EQ(loaded, std::vector<std::string>{pluginFile("fixture_good")});
+    EXPECT_NE(log.find("the worker was sent what it may not be sent, and ends"), std::string::npos) << log;
+}
+
+TEST_F(LoneWorker, OrderBeforeItsConfigurationEndsIt) {
+    ASSERT_TRUE(send(protocol::ReadHistory{"fixture", BodyForm::json}));
+    std::vector<std::string> loaded;
+    std::string log;
+    EXPECT_EQ(end(loaded, log), 1);
+    EXPECT_NE(log.find("may not be sent"), std::string::npos) << log;
 }
 
 }  // namespace
