@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <chrono>
 #include <cstddef>
 #include <cstdlib>
@@ -200,7 +201,11 @@ FileDescriptor inheritedSocket() {
     constexpr int first = 3;
     const auto numberIn = [](const char* name) {
         const char* const text = std::getenv(name);
-        return text == nullptr ? 0 : std::atoi(text);
+        int number = 0;
+        if (text != nullptr) {
+            std::from_chars(text, text + std::strlen(text), number);  // 0 for anything else
+        }
+        return number;
     };
     const bool ours = numberIn("LISTEN_PID") == ::getpid();
     const int count = ours ? numberIn("LISTEN_FDS") : 0;

@@ -114,6 +114,7 @@ class LoneWorker : public ::testing::Test {
     /// Everything that the worker sends up to its end, as the names of the messages; its plug-ins are added to the
     /// list.
     [[nodiscard]] int end(std::vector<std::string>& loaded, std::string& log) {
+        ::shutdown(_conversation.get(), SHUT_WR);  // one that accepts everything ends, too
         FrameReader reader;
         while (auto frame = readFrame(_conversation.get(), reader)) {
             auto message = protocol::toFront(std::move(*frame));
