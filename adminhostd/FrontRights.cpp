@@ -112,10 +112,6 @@ constexpr int allowedCalls[] = {
     SCMP_SYS(getdents64),
     SCMP_SYS(getcwd),
     SCMP_SYS(sendfile),
-    // The journal's large entries.
-    SCMP_SYS(memfd_create),
-    SCMP_SYS(ftruncate),
-    SCMP_SYS(fallocate),
     // Memory.
     SCMP_SYS(brk),
     SCMP_SYS(munmap),
@@ -142,7 +138,6 @@ constexpr int allowedCalls[] = {
     SCMP_SYS(rt_sigreturn),
     SCMP_SYS(sigaltstack),
     SCMP_SYS(signalfd4),
-    SCMP_SYS(tgkill),
     // Sockets that are open. connect: see socket below.
     SCMP_SYS(accept),
     SCMP_SYS(accept4),
@@ -168,7 +163,6 @@ constexpr int allowedCalls[] = {
     SCMP_SYS(times),
     SCMP_SYS(getrusage),
     SCMP_SYS(getrlimit),
-    SCMP_SYS(prlimit64),
     SCMP_SYS(getrandom),
     SCMP_SYS(uname),
     SCMP_SYS(sysinfo),
@@ -221,9 +215,14 @@ void filterSystemCalls() {
     allow(SCMP_SYS(openat), {SCMP_A2(SCMP_CMP_MASKED_EQ, writing, O_RDONLY)});
     allow(SCMP_SYS(socket), {SCMP_A0(SCMP_CMP_EQ, AF_UNIX)});
     allow(SCMP_SYS(socketpair), {SCMP_A0(SCMP_CMP_EQ, AF_UNIX)});
-    // Never memory that can be written and executed. Name services are libraries, which are mapped.
+    // Never memory that can be written and executed. Name services are libraries, whose files are mapped. A shared
+    // mapping would show what is written to the file later.
     allow(SCMP_SYS(mmap), {SCMP_A2(SCMP_CMP_MASKED_EQ, PROT_EXEC, 0)});
-    allow(SCMP_SYS(mmap), {SCMP_A2(SCMP_CMP_MASKED_EQ, PROT_WRITE | PROT_EXEC, PROT_EXEC)});
+    allow(SCMP_SYS(mmap), {SCMP_A2(SCMP_CMP_MASKED_EQ, PROT_WRITE | PROT_EXEC, PROT_EXEC),
+                           SCMP_A3(SCMP_CMP_MASKED_EQ, MAP_TYPE | MAP_ANONYMOUS, MAP_PRIVATE)});
+    // Only itself: its account may have other processes.
+    allow(SCMP_SYS(tgkill), {SCMP_A0(SCMP_CMP_EQ, static_cast<scmp_datum_t>(::getpid()))});
+    allow(SCMP_SYS(prlimit64), {SCMP_A0(SCMP_CMP_EQ, 0)});
 #ifndef ADMINHOST_SANITIZED
     allow(SCMP_SYS(mprotect), {SCMP_A2(SCMP_CMP_MASKED_EQ, PROT_EXEC, 0)});
 #endif

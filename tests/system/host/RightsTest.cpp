@@ -2,6 +2,7 @@
 // was taken over by a client could do.
 
 #include "adminhostd/FrontRights.h"
+#include "platform/files/FileDescriptor.h"
 #include "tests/support/Program.h"
 #include "tests/support/TemporaryRoot.h"
 #include "tests/system/host/Host.h"
@@ -24,6 +25,7 @@
 #include <sys/mman.h>
 #include <sys/mount.h>
 #include <sys/ptrace.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
@@ -326,6 +328,29 @@ TEST(FrontRights, CodeInTheFrontCannotStartAProgramOrAProcess) {
     }
 }
 
+TEST(FrontRights, CodeInTheFrontCanSignalAndLimitNoOtherProcessOfItsAccount) {
+    const pid_t other = ::getpid();  // of the attempts
+    EXPECT_EQ(attemptAsFront([&] { return ::syscall(SYS_tgkill, other, other, 0) == 0; }, false), EPERM);
+    constexpr int absent = 1 << 30;  // the kernel would return ESRCH
+    EXPECT_EQ(attemptAsFront([] { return ::syscall(SYS_tgkill, absent, absent, 0) == 0; }, false), EPERM);
+    EXPECT_EQ(attemptAsFront([] { return ::syscall(SYS_tgkill, ::getpid(), ::getpid(), 0) == 0; }, false), 0)
+        << "abort() needs it";
+    EXPECT_EQ(attemptAsFront(
+                  [&] {
+                      rlimit bound{};
+                      return ::prlimit(other, RLIMIT_NOFILE, nullptr, &bound) == 0;
+                  },
+                  false),
+              EPERM);
+    EXPECT_EQ(attemptAsFront(
+                  [] {
+                      rlimit bound{};
+                      return ::getrlimit(RLIMIT_NOFILE, &bound) == 0;
+                  },
+                  false),
+              0);
+}
+
 TEST(FrontRights, CodeInTheFrontCannotWriteFilesOrReadThoseOfOtherPlaces) {
     const TemporaryRoot root;
     root.write("/file", "content");
@@ -348,6 +373,21 @@ TEST(FrontRights, CodeInTheFrontCanOpenUnixSocketsOnlyAndNoExecutableMemory) {
     EXPECT_EQ(attemptAsFront([] {
                   return ::mmap(nullptr, 4096, PROT_READ | PROT_WRITE | PROT_EXEC, MAP_PRIVATE | MAP_ANONYMOUS, -1,
                                 0) != MAP_FAILED;
+              }),
+              EPERM);
+    EXPECT_EQ(attemptAsFront([] { return ::memfd_create("code", 0) >= 0; }), EPERM);
+    const FileDescriptor passed(::memfd_create("code", MFD_CLOEXEC));  // as another process could send it
+    ASSERT_EQ(::ftruncate(passed.get(), 4096), 0);
+    EXPECT_EQ(attemptAsFront([&] { return ::ftruncate(passed.get(), 8192) == 0; }), EPERM);
+    for (const int shared : {MAP_SHARED, MAP_SHARED_VALIDATE}) {
+        EXPECT_EQ(attemptAsFront([&] {
+                      return ::mmap(nullptr, 4096, PROT_READ | PROT_EXEC, shared, passed.get(), 0) != MAP_FAILED;
+                  }),
+                  EPERM)
+            << "the front's own bytes";
+    }
+    EXPECT_EQ(attemptAsFront([] {
+                  return ::mmap(nullptr, 4096, PROT_READ | PROT_EXEC, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0) != MAP_FAILED;
               }),
               EPERM);
     if (!sanitized) {
