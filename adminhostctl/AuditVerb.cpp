@@ -2,18 +2,17 @@
 
 #include "adminhostctl/Follow.h"
 #include "adminhostctl/LogsVerb.h"
+#include "adminhostctl/Since.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "platform/json/Json.h"
 #include "platform/text/IsoDate.h"
 #include "platform/text/LocalDate.h"
 
-#include <charconv>
 #include <chrono>
 #include <deque>
 #include <functional>
 #include <set>
-#include <system_error>
 #include <utility>
 #include <vector>
 
@@ -26,40 +25,9 @@ namespace {
 constexpr std::size_t entriesMaximum = 10'000;  ///< more are not held in memory
 constexpr auto usualPeriod = std::chrono::hours(24);
 
-Date now() {
-    return std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now());
-}
-
-/// "90min", "2h" or "3d" ago; nullopt for another text.
-std::optional<Date> dateAgo(const std::string& text) {
-    std::int64_t count = 0;
-    const auto [end, failure] = std::from_chars(text.data(), text.data() + text.size(), count);
-    const std::string_view unit(end, static_cast<std::size_t>(text.data() + text.size() - end));
-    constexpr std::int64_t longest = 36'500;  // so that no sum overflows
-    if (failure != std::errc() || count < 0 || count > longest) {
-        return std::nullopt;
-    }
-    if (unit == "min") {
-        return now() - std::chrono::minutes(count);
-    }
-    if (unit == "h") {
-        return now() - std::chrono::hours(count);
-    }
-    return unit == "d" ? std::optional<Date>(now() - std::chrono::days(count)) : std::nullopt;
-}
-
-Date sinceOf(const Context& context) {
-    if (!context.options.has(sinceOption)) {
-        return now() - usualPeriod;
-    }
-    const std::string text = context.options.argumentOf(sinceOption);
-    auto date = dateAgo(text);
-    date = date ? date : dateOfText(text);
-    if (!date || date->time_since_epoch().count() < 0) {
-        throw usageError("--since: \"" + text +
-                         "\" is neither a date (2026-01-31, 2026-01-31 08:00) nor a time ago (90min, 2h, 3d)");
-    }
-    return *date;
+Date firstMoment(const Context& context) {
+    const Date usual = std::chrono::floor<std::chrono::seconds>(std::chrono::system_clock::now()) - usualPeriod;
+    return sinceOf(context).value_or(usual);
 }
 
 /// Reads the pages of the audit one after the other.
@@ -69,7 +37,7 @@ class AuditReader {
         : _context(context),
           _selection("&user=" + Connection::escaped(context.options.argumentOf(userOption)) +
                      "&key=" + Connection::escaped(context.options.argumentOf(keyOption))),
-          _since("since=" + Connection::escaped(isoTextOf(sinceOf(context)))) {}
+          _since("since=" + Connection::escaped(isoTextOf(firstMoment(context)))) {}
 
     /// Calls the function for each entry that has come in since the last call. Returns true if there are more.
     bool readPage(const std::function<void(Dictionary)>& function) {

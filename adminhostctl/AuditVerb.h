@@ -6,13 +6,8 @@
 
 #include <span>
 #include <string>
-#include <string_view>
 
 namespace adminhost::ctl {
-
-inline constexpr std::string_view sinceOption = "--since";
-inline constexpr std::string_view userOption = "--user";
-inline constexpr std::string_view keyOption = "--key";
 
 /// Prints the events of the audit that the options select and, with the option, those that come in from then on.
 [[nodiscard]] ExitStatus audit(const Context& context, std::span<const std::string> arguments);

@@ -6,6 +6,7 @@
 #include "adminhostctl/Help.h"
 #include "adminhostctl/LogsVerb.h"
 #include "adminhostctl/Reading.h"
+#include "adminhostctl/Since.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "platform/json/Json.h"
@@ -149,10 +150,11 @@ constexpr std::array options = {
     VerbOption{forceOption, "", "Also send a value that is outside its range or not one of its words", {}, {}, true},
     VerbOption{followOption, "", "With logs and audit: print also what is written from now on", {}, "-f"},
     VerbOption{linesOption, "LINES", "With logs: print only the last LINES lines (10 if not given)", {}, "-n"},
-    VerbOption{sinceOption, "TIME", "With audit: from this time on: a date, or 90min, 2h or 3d ago (24h if not given)"},
-    VerbOption{userOption, "NAME", "With audit: only of this user, by name or number"},
-    VerbOption{keyOption, "KEY",
-               "With audit: only what has changed this setting, property or list (port, cameras.users)"},
+    VerbOption{
+        sinceOption, "TIME",
+        "Only from this time on: a date, today, yesterday, or 90min, 2h or 3d ago (with audit 24h if not given)"},
+    VerbOption{userOption, "NAME", "Only by this account, by name or number"},
+    VerbOption{keyOption, "KEY", "Only changes of this setting, property, list or section (port, cameras.users)"},
 };
 
 }  // namespace

@@ -211,7 +211,7 @@ constexpr std::array table = {
          &applyFile,
          {{"apply host.toml", "apply host.toml --password-file grid.txt"}}},
     Verb{"history",
-         "[--since DATE] [--user NAME] [--key KEY]",
+         "[--since TIME] [--user NAME] [--key KEY]",
          "List the latest changes: when, who and what was changed",
          0,
          0,
@@ -231,9 +231,6 @@ constexpr std::array options = {
     VerbOption{passwordFileOption, "FILE",
                "Read a password from a file; - asks, or reads standard input. With plan, apply and settings set "
                "--validate the grid account's, with account create the directory administrator's"},
-    VerbOption{sinceOption, "DATE", "Only changes from this moment on: \"2026-01-31 08:00\", today or yesterday"},
-    VerbOption{userOption, "NAME", "Only changes by this account, by name or number"},
-    VerbOption{keyOption, "KEY", "Only changes of this setting, element's key, element or section"},
     VerbOption{validateOption, "", "With settings set: try the setting before it is written"},
 };
 

@@ -3,6 +3,7 @@
 #include "adminhostctl/Connection.h"
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/RequestArguments.h"
+#include "adminhostctl/Since.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/Toml.h"
@@ -156,27 +157,6 @@ std::string momentText(Date date) {
     return ::localtime_r(&seconds, &parts) == nullptr
                ? dateText(date)
                : fmt::format("{}:{:02} {}", dateText(date), parts.tm_sec, parts.tm_zone);
-}
-
-/// The moment of the option --since: a date, "today" or "yesterday".
-std::optional<Date> sinceOf(const Context& context) {
-    if (!context.options.has(sinceOption)) {
-        return std::nullopt;
-    }
-    std::string text = context.options.argumentOf(sinceOption);
-    if (text == "today" || text == "yesterday") {
-        std::time_t now = std::time(nullptr);
-        std::tm parts{};
-        ::localtime_r(&now, &parts);
-        parts.tm_mday -= text == "today" ? 0 : 1;
-        parts.tm_hour = parts.tm_min = parts.tm_sec = 0;
-        parts.tm_isdst = -1;
-        return Date(std::chrono::seconds(std::mktime(&parts)));
-    }
-    DescribedKey key;
-    key.path = std::string(sinceOption);
-    key.type = "date";
-    return valueOfText(key, text).date();
 }
 
 /// Whether the account is one of an entry's: its name, or its number.

@@ -6,10 +6,6 @@
 
 namespace adminhost::ctl {
 
-inline constexpr std::string_view sinceOption = "--since";
-inline constexpr std::string_view userOption = "--user";
-inline constexpr std::string_view keyOption = "--key";
-
 /// Prints the entries of the daemon's history, one row for each write and each edit outside the daemon. The other
 /// formats hold them as a list, oldest first: as the daemon returns them, changes of settings first, then those of
 /// elements (with "section"); an entry without settings has no number.

@@ -161,9 +161,9 @@ TEST_F(AuditTest, CommandLinePrintsATableJsonAndFollows) {
     const auto json = parseJson(ctl({"--format", "json", "audit", "--user", "root"}).output);
     ASSERT_TRUE(json && json->dictionary() != nullptr);
     EXPECT_GE(json->dictionary()->get("entries").array()->size(), 3U);
-    EXPECT_EQ(ctl({"audit", "--since", "yesterday"}).status, 2);
-    EXPECT_THAT(ctl({"audit", "--since", "yesterday"}).output, HasSubstr("neither a date"));
-    EXPECT_EQ(ctl({"audit", "--since", "2026-01-31", "--key", "port"}).status, 0);
+    EXPECT_EQ(ctl({"audit", "--since", "soon"}).status, 2);
+    EXPECT_THAT(ctl({"audit", "--since", "soon"}).output, HasSubstr("neither a date"));
+    EXPECT_EQ(ctl({"audit", "--since", "yesterday", "--key", "port"}).status, 0);
 
     const std::string output = daemon->directory() / "followed";
     const std::string program =
