@@ -252,12 +252,14 @@ bool HttpServer::acceptOne() {
         _limits.remove(credentials.uid);
         throw;
     }
-    const Client& client = _clients.back();
+    const std::size_t held = _clients.size();
     sockaddr address{};
     address.sa_family = AF_UNIX;
     // From here on the socket is the library's, also when it fails.
     if (::MHD_add_connection(_daemon, socket.release(), &address, sizeof address.sa_family) != MHD_YES) {
-        closed(client);
+        if (_clients.size() == held) {  // else the library has reported the end of the connection already
+            closed(_clients.back());
+        }
         _acceptAfter = Clock::now() + shortagePause;
         return false;
     }
