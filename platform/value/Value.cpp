@@ -116,17 +116,17 @@ void Dictionary::set(std::string_view key, Value value) {
 }
 
 void Dictionary::append(std::string_view key, Value value) {
+    std::string copiedKey(key);  // before anything moves: it may be the text of a value in this dictionary
     if (_entries.size() == _entries.capacity() && _entries.size() < linearLimit) {
         _entries.reserve(_entries.empty() ? firstRoom : _entries.size() + growth);
     }
-    std::string copiedKey(key);
     DictionaryEntry& entry = _entries.emplace_back();
     entry.key = std::move(copiedKey);
     entry.value = std::move(value);
     if (_entries.size() == linearLimit + 1) {
         rebuildIndex();
     } else if (_entries.size() > linearLimit) {
-        _index->places.emplace(key, _entries.size() - 1);
+        _index->places.emplace(entry.key, _entries.size() - 1);
     }
 }
 

@@ -46,6 +46,17 @@ TEST(Dictionary, AppendedKeysAreFoundHoweverManyThereAre) {
     EXPECT_EQ(dictionary.get("key 39"), Value("new"));
 }
 
+TEST(Dictionary, NewKeyMayBeTheTextOfOneOfItsOwnValues) {
+    Dictionary d;
+    for (int i = 0; i < 80; ++i) {
+        // Short, so that the text is inside the entry, which moves when the dictionary grows.
+        const std::string key = "k" + std::to_string(i);
+        d.set("next key", key);
+        d.set(d.text("next key"), i);
+        ASSERT_EQ(d.get(key), Value(i)) << key;
+    }
+}
+
 TEST(Dictionary, KeepsInsertionOrderAndAnExistingKeysPlace) {
     Dictionary d;
     for (int i = 0; i < 100; ++i) {
