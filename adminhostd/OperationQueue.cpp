@@ -134,8 +134,10 @@ void OperationQueue::giveUpWaiting() {
         dropAbandoned();
         _abandonedFrom = _waiting.empty() ? std::nullopt : std::optional(now + abandonedPause);
     }
-    for (const Operation& operation : _waiting.takeLate(now)) {
-        if (operation.endBy && now >= *operation.endBy) {
+    for (Operation& operation : _waiting.takeLate(now)) {
+        if (operation.locked) {
+            finishLocked(std::move(operation));
+        } else if (operation.endBy && now >= *operation.endBy) {
             _events.finished(operation,
                              Unserved{Unserved::Reason::overrun,
                                       "The deadline passed while the request was waiting; nothing was done."});
@@ -338,8 +340,7 @@ void OperationQueue::next() {
             _events.finished(*operation,
                              Unserved{Unserved::Reason::abandoned, "The client went away before its turn."});
         } else if (operation->locked && Clock::now() >= *operation->until) {
-            auto answer = *std::move(operation->locked);
-            _events.finished(*operation, std::move(answer));
+            finishLocked(*std::move(operation));
         } else {
             begin(*std::move(operation));
         }
@@ -384,6 +385,11 @@ void OperationQueue::waitForLock(protocol::Answer answer) {
     operation.locked = std::move(answer);
     _changesFrom = std::min(Clock::now() + lockPause, *operation.until);
     _waiting.addAgain(std::move(operation));
+}
+
+void OperationQueue::finishLocked(Operation operation) {
+    auto answer = *std::move(operation.locked);
+    _events.finished(operation, std::move(answer));
 }
 
 void OperationQueue::finish(Ending ending) {

@@ -133,6 +133,8 @@ class OperationQueue {
     bool cancelRunning(const RequestRecord& request);
     void begin(Operation operation);
     void waitForLock(protocol::Answer answer);
+    /// Ends a change that did not get the lock until its deadline.
+    void finishLocked(Operation operation);
     void finish(Ending ending);
     void failWaiting(Unserved::Reason reason, const std::string& message);
 

@@ -12,10 +12,16 @@ namespace {
 
 using Time = WaitingOperations::Clock::time_point;
 
-bool isLate(const Operation& operation, Time now) {
-    // A change that did not get the lock until its deadline is answered with that reason, at its turn.
-    const bool ends = operation.endBy && !operation.locked;
-    return (operation.beginBy && now >= *operation.beginBy) || (ends && now >= *operation.endBy);
+/// When the operation is given up unless it runs; nullopt if it has no such bound.
+std::optional<Time> endOf(const Operation& operation) {
+    std::optional<Time> first;
+    // The time of a change that did not get the lock counts from its first start.
+    for (const auto& end : {operation.beginBy, operation.endBy, operation.locked ? operation.until : std::nullopt}) {
+        if (end && (!first || *end < *first)) {
+            first = end;
+        }
+    }
+    return first;
 }
 
 /// The answers of these orders depend on nothing but the order and the state of the service.
@@ -44,10 +50,9 @@ bool isIdentical(const Operation& a, const Operation& b) {
 std::optional<Time> WaitingOperations::due() const {
     std::optional<Time> first;
     for (const Operation& operation : _operations) {
-        for (const auto& end : {operation.beginBy, operation.locked ? std::nullopt : operation.endBy}) {
-            if (end && (!first || *end < *first)) {
-                first = end;
-            }
+        const auto end = endOf(operation);
+        if (end && (!first || *end < *first)) {
+            first = end;
         }
     }
     return first;
@@ -96,7 +101,10 @@ std::vector<Operation> WaitingOperations::takeSharers(const Operation& operation
 }
 
 std::vector<Operation> WaitingOperations::takeLate(Time now) {
-    return takeIf([&](const Operation& operation) { return isLate(operation, now); });
+    return takeIf([&](const Operation& operation) {
+        const auto end = endOf(operation);
+        return end && now >= *end;
+    });
 }
 
 std::vector<Operation> WaitingOperations::takeAbandoned() {

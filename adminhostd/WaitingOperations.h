@@ -38,7 +38,7 @@ class WaitingOperations {
     /// by no client.
     [[nodiscard]] std::vector<Operation> takeSharers(const Operation& operation, Clock::time_point now,
                                                      std::chrono::milliseconds longest);
-    /// Those that had to begin or to end before now.
+    /// Those that had to begin or to end before now, and changes that did not get the lock until their deadline.
     [[nodiscard]] std::vector<Operation> takeLate(Clock::time_point now);
     /// Those whose clients have closed their connections.
     [[nodiscard]] std::vector<Operation> takeAbandoned();

@@ -103,6 +103,25 @@ TEST_F(TwoDaemons, WhileAHolderIsStoppedReadsAreAnsweredAndAWriteNamesTheHolder)
     EXPECT_EQ(read("data"), "first\nthird\n");
 }
 
+TEST_F(TwoDaemons, WriteWithoutTheLockIsAnsweredAtItsDeadlineAlsoWhileAReadIsRunning) {
+    DaemonProcess holder(options());
+    UnixHttp held = startWrite(holder, "first");
+    DaemonProcess daemon(options());
+    const auto begin = std::chrono::steady_clock::now();
+    UnixHttp writer = daemon.connect();
+    writer.begin("POST", "/v1/fixture/runWrite", body("echo second > " + place("data")), {"Request-Deadline: 1"});
+    ASSERT_TRUE(eventually([&] { return dictionaryOf(daemon.connect().get("/v1/")).get("waiting") == Value(1); }));
+    UnixHttp reader = startSleeping(daemon, 4000);
+    expectError(writer.reply(), 503, "WRITE_LOCKED");
+    const auto duration = std::chrono::steady_clock::now() - begin;
+    EXPECT_GE(duration, std::chrono::milliseconds(900));
+    EXPECT_LT(duration, std::chrono::milliseconds(3000)) << "it waited for the end of the read";
+    EXPECT_EQ(reader.reply().status, 200);
+    go();
+    EXPECT_EQ(held.reply().status, 200);
+    EXPECT_EQ(read("data"), "first\n");
+}
+
 TEST_F(TwoDaemons, WritesKeepTheirOrderWhileTheyWaitForTheLock) {
     DaemonProcess holder(options());
     UnixHttp first = startWrite(holder, "0");

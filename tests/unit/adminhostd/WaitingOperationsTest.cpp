@@ -106,7 +106,7 @@ TEST_F(Waiting, ChangesNeverShareARun) {
 
 TEST_F(Waiting, ReadsThatDifferInAnythingThatShapesTheAnswerDoNotShare) {
     std::vector<Operation> others;
-    for (int i = 0; i < 7; ++i) {
+    for (int i = 0; i < 10; ++i) {
         others.push_back(read("b"));
     }
     others[0].record->peer.uid = 8;
@@ -116,6 +116,9 @@ TEST_F(Waiting, ReadsThatDifferInAnythingThatShapesTheAnswerDoNotShare) {
     std::get<protocol::Perform>(others[4].order).checkOnly = true;
     others[5].order = protocol::ReadHistory{"p"};
     others[6].endBy = now + 1s;  // would be answered after its deadline
+    std::get<protocol::Perform>(others[7].order).revisions = {"r1"};
+    std::get<protocol::Perform>(others[8].order).showsRevision = true;
+    std::get<protocol::Perform>(others[9].order).command = "other";
     for (Operation& other : others) {
         waiting.add(read("a"));
         waiting.add(std::move(other));
@@ -156,18 +159,29 @@ TEST_F(Waiting, ThoseWhoseTimeIsOverAreTakenWithoutTheOthers) {
     early.beginBy = now + 1s;
     Operation late = read("b");
     late.endBy = now + 2s;
-    Operation locked = change("c");
-    locked.endBy = now + 1s;
-    locked.locked.emplace();
     waiting.add(std::move(early));
     waiting.add(std::move(late));
-    waiting.add(std::move(locked));
+    waiting.add(read("c"));
     EXPECT_EQ(waiting.due(), now + 1s);
     EXPECT_TRUE(waiting.takeLate(now).empty());
     EXPECT_EQ(waiting.takeLate(now + 1s).size(), 1U);
     EXPECT_EQ(waiting.due(), now + 2s);
     EXPECT_EQ(waiting.takeLate(now + 3s).front().record->id, "b");
-    EXPECT_EQ(order(), "c") << "it is answered with the reason of the lock, at its turn";
+    EXPECT_EQ(order(), "c");
+}
+
+TEST_F(Waiting, ChangeWithoutItsLockIsLateAtItsDeadlineWhateverRunsThen) {
+    Operation locked = change("a");
+    locked.until = now + 1s;
+    locked.locked.emplace();
+    waiting.addAgain(std::move(locked));
+    waiting.add(change("b"));
+    EXPECT_EQ(waiting.due(), now + 1s);
+    EXPECT_TRUE(waiting.takeLate(now).empty());
+    const std::vector<Operation> late = waiting.takeLate(now + 1s);
+    ASSERT_EQ(late.size(), 1U);
+    EXPECT_EQ(late.front().record->id, "a");
+    EXPECT_FALSE(waiting.due());
 }
 
 TEST_F(Waiting, OneIsTakenByItsRequest) {
