@@ -174,7 +174,8 @@ void Front::query(Exchange& exchange, const Target& target) {
 void Front::enqueue(Operation operation) {
     const Peer& peer = operation.record->peer;
     const auto hasTooMany = [&] { return !_permissions.isOwn(peer) && _queue.fullFor(peer.uid); };
-    if (_queue.full() || hasTooMany()) {
+    const auto full = [&] { return _queue.full(operation.urgent); };
+    if (full() || hasTooMany()) {
         _queue.dropAbandoned();
     }
     if (hasTooMany()) {
@@ -185,7 +186,7 @@ void Front::enqueue(Operation operation) {
             "TOO_MANY_WAITING_OF_ACCOUNT");
         return;
     }
-    if (_queue.full()) {
+    if (full()) {
         if (isDoctor(*operation.record)) {
             finished(operation, Unserved{Unserved::Reason::notBegun, "Too many requests are waiting already."});
             return;

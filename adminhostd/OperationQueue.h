@@ -61,10 +61,14 @@ class OperationQueue {
 
     OperationQueue(Settings settings, Events events);
 
-    /// Returns true if no further operation may wait.
-    [[nodiscard]] bool full() const noexcept {
-        const bool runsAtOnce = _state == State::idle && _waiting.empty();
-        return !runsAtOnce && _waiting.size() >= _settings.limit;
+    /// How many urgent operations may wait beyond the limit: a stop must not be refused because of many reads.
+    static constexpr std::size_t urgentReserve = 4;
+
+    /// Returns true if no further operation may wait, or no further one that is urgent.
+    [[nodiscard]] bool full(bool urgent = false) const noexcept {
+        // While the worker of an idle daemon is replaced, one request is accepted as if the worker was there.
+        const bool runsNext = (_state == State::idle || _state == State::starting) && _waiting.empty();
+        return !runsNext && _waiting.size() >= _settings.limit + (urgent ? urgentReserve : 0);
     }
     /// Returns true if no further operation of this account may wait.
     [[nodiscard]] bool fullFor(uid_t uid) const noexcept { return _waiting.countOf(uid) >= _settings.limitPerAccount; }

@@ -1,7 +1,9 @@
 // The queue under pressure: requests that are cancelled, abandoned, identical or urgent.
 
+#include "adminhostd/OperationQueue.h"
 #include "tests/system/host/Host.h"
 
+#include <csignal>
 #include <fstream>
 #include <iterator>
 
@@ -56,14 +58,22 @@ TEST_F(Queue, WaitingRequestThatIsCancelledNeverRuns) {
 }
 
 TEST_F(Queue, RunningReadThatIsCancelledEndsAtOnceWithItsTools) {
-    UnixHttp reader = begin("run", mark("begun") + "; sleep 60", {"Request-Id: " + first});
+    const std::string tool = daemon.directory() / "tool";
+    UnixHttp reader =
+        begin("run", "echo $$ > " + tool + "; " + mark("begun") + "; exec sleep 60", {"Request-Id: " + first});
     UnixHttp other = begin("run", mark("other"));
     ASSERT_TRUE(eventually([&] { return ran() == "begun\n"; }));
+    pid_t pid = 0;
+    std::ifstream(tool) >> pid;
+    ASSERT_EQ(::kill(pid, 0), 0);
+    const auto start = std::chrono::steady_clock::now();
     const HttpReply reply = cancel(first);
     EXPECT_EQ(reply.status, 200) << reply.body;
     EXPECT_EQ(dictionaryOf(reply).get("state"), Value("running"));
     const HttpReply ended = reader.reply();
     expectError(ended, 503, "CANCELLED");
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 10s);
+    EXPECT_TRUE(eventually([&] { return ::kill(pid, 0) != 0; })) << "its tool goes on";
     EXPECT_FALSE(ended.headers.contains("retry-after"));
     EXPECT_EQ(other.reply().status, 200) << "the next worker serves those that wait";
     EXPECT_EQ(dictionaryOf(daemon.connect().get("/v1/requests/" + first)).get("error"), Value("CANCELLED"));
@@ -80,7 +90,7 @@ TEST_F(Queue, RunningChangeIsNotCancelled) {
     EXPECT_EQ(ran(), "begun\nended\n");
 }
 
-TEST_F(Queue, RunningDoctorIsCancelledLikeAnyRead) {
+TEST_F(Queue, WaitingDoctorIsCancelledLikeAnyRead) {
     UnixHttp sleeper = startSleeping(daemon, 1500);
     UnixHttp doctor = daemon.connect();
     doctor.begin("GET", "/v1/doctor", "", {"Request-Id: " + first});
@@ -117,6 +127,38 @@ TEST_F(Queue, FullQueueMakesRoomForOthersThanVanishedClients) {
     EXPECT_EQ(begin("run", mark("after")).reply().status, 200) << "the queue is full of requests that nobody wants";
     EXPECT_EQ(sleeper.reply().status, 200);
     EXPECT_EQ(ran(), "after\n");
+}
+
+TEST_F(Queue, StopIsAcceptedWhenItIsFullOfReads) {
+    UnixHttp sleeper = startSleeping(daemon, 1500);
+    std::vector<UnixHttp> readers;
+    for (const char* word : {"a", "b", "c", "d"}) {
+        readers.push_back(begin("run", mark(word)));
+    }
+    waitUntilSoManyWait(4);
+    std::vector<UnixHttp> stops;
+    for (std::uint64_t i = 0; i < OperationQueue::urgentReserve; ++i) {
+        stops.push_back(begin("runControl", mark("stop")));
+        waitUntilSoManyWait(5 + i);
+    }
+    expectError(begin("runControl", mark("surplus")).reply(), 503, "TOO_MANY_WAITING");
+    expectError(begin("runWrite", mark("surplus")).reply(), 503, "TOO_MANY_WAITING");
+    for (UnixHttp& stop : stops) {
+        EXPECT_EQ(stop.reply().status, 200);
+    }
+    for (UnixHttp& reader : readers) {
+        EXPECT_EQ(reader.reply().status, 200);
+    }
+    EXPECT_EQ(ran(), "stop\nstop\nstop\nstop\na\nb\nc\nd\n");
+}
+
+TEST_F(Queue, RequestIsAcceptedWithoutRoomToWaitWhileTheWorkerOfAnIdleDaemonIsReplaced) {
+    const DaemonProcess small(withFixture("queue_limit = 0\n"));
+    UnixHttp client = small.connect();
+    EXPECT_EQ(client.post("/v1/fixture/nothing").status, 204);
+    ::kill(small.workerPid(), SIGKILL);
+    ASSERT_TRUE(small.waitForLog("was killed by signal 9"));
+    EXPECT_EQ(client.post("/v1/fixture/nothing").status, 204);
 }
 
 TEST_F(Queue, IdenticalWaitingReadsRunOnceAndEachHasItsAnswer) {
