@@ -30,7 +30,6 @@ using namespace std::chrono_literals;
 using Clock = std::chrono::steady_clock;
 
 constexpr auto runningBound = 10s;  ///< at a stop, for a running operation that only reads
-constexpr auto extension = 5s;      ///< by which the service manager waits longer than a running write may run
 constexpr int logPause = 100;       ///< milliseconds until the next try while the log cannot be written
 constexpr auto logBound = 200ms;    ///< for the log's last events at the end
 constexpr auto sendingBound = 2s;   ///< at a stop, for clients to read their answers
@@ -161,19 +160,12 @@ class Daemon {
             return;
         }
         _stopping = true;
-        notify("STOPPING=1");
         _listener.close();
         if (_server) {
             _server->quiesce();
         }
         _front.events().stop();
         _front.queue().stop(runningBound);
-        if (const auto due = _front.queue().due()) {
-            // A write may run longer than the unit's time for a stop.
-            const auto left =
-                std::chrono::ceil<std::chrono::microseconds>(*due - Clock::now() + sendingBound + extension);
-            notify(fmt::format("EXTEND_TIMEOUT_USEC={}", left.count()));
-        }
     }
 
     bool finished() {

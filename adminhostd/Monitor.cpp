@@ -4,6 +4,7 @@
 #include "adminhostd/FrontStart.h"
 #include "adminhostd/ListeningSocket.h"
 #include "adminhostd/MonitorMessage.h"
+#include "adminhostd/Notify.h"
 #include "adminhostd/PluginSelection.h"
 #include "adminhostd/PrivateDirectory.h"
 #include "adminhostd/Protocol.h"
@@ -44,6 +45,8 @@ constexpr auto longestPause = 30s;
 constexpr auto stableTime = 10s;      ///< a front that has run for so long has not died at its start
 constexpr auto overrunGrace = 5s;     ///< in which worker or front end an operation that overruns its deadline
 constexpr auto overrunInterval = 5s;  ///< at which the monitor looks for such an operation
+constexpr auto stopExtension = 10s;   ///< by which the service manager waits longer than a running operation may run
+constexpr int messageMaximum = 32;    ///< that are read from the front in one go
 constexpr int endingWait = 20;        ///< milliseconds for a killed worker
 constexpr auto logPause = 100ms;      ///< until the next try while the log cannot be written
 constexpr auto logBound = 200ms;      ///< for the log's last events at the end
@@ -75,9 +78,12 @@ class Monitor {
     };
 
     void startFront();
+    void startFrontAgain();
+    std::chrono::milliseconds nextPause();
     void frontEnded(int status);
     void signalled();
     void stop();
+    void extendStop();
     void reap();
     void receive();
     struct Wanted {
@@ -110,6 +116,7 @@ class Monitor {
     std::list<Worker> _workers;
     std::vector<Wanted> _waiting;  ///< that the front has asked for, while the last front's worker is running
     bool _stopping = false;
+    Clock::time_point _stopBy;  ///< the latest deadline that the service manager has been asked to wait for
     int _status = 0;
 };
 
@@ -125,8 +132,9 @@ int Monitor::run() {
             signalled();
         }
         endOverruns();
+        extendStop();
         if (_frontDue && Clock::now() >= *_frontDue) {
-            startFront();
+            startFrontAgain();
         }
     }
     return _status;
@@ -171,6 +179,23 @@ void Monitor::startFront() {
     _frontSince = Clock::now();
 }
 
+/// A lack of memory or descriptors may pass. Workers are left to finish.
+void Monitor::startFrontAgain() {
+    try {
+        startFront();
+    } catch (const std::exception& error) {
+        const auto pause = nextPause();
+        _frontDue = Clock::now() + pause;
+        logEvent(fmt::format("adminhostd: the front cannot be started again: {}; the next try is in {} ms",
+                             error.what(), pause.count()));
+    }
+}
+
+std::chrono::milliseconds Monitor::nextPause() {
+    _pause = std::clamp<std::chrono::milliseconds>(_pause * 2, firstPause, longestPause);
+    return _pause;
+}
+
 void Monitor::frontEnded(int status) {
     _front = 0;
     _link.close();
@@ -194,19 +219,35 @@ void Monitor::frontEnded(int status) {
     if (Clock::now() - _frontSince >= stableTime) {
         _pause = 0ms;
     }
-    _pause = std::clamp<std::chrono::milliseconds>(_pause * 2, firstPause, longestPause);
-    _frontDue = Clock::now() + _pause;
+    const auto pause = nextPause();
+    _frontDue = Clock::now() + pause;
     logEvent(
-        fmt::format("adminhostd: the front {}; the next one is started in {} ms", endingText(status), _pause.count()));
+        fmt::format("adminhostd: the front {}; the next one is started in {} ms", endingText(status), pause.count()));
 }
 
 void Monitor::stop() {
     _stopping = true;
+    notify("STOPPING=1");
     _frontDue.reset();
     _socket.remove();
     _socket.close();
     if (_front != 0) {
         ::kill(_front, SIGTERM);
+    }
+}
+
+/// An operation that is running at a stop may take longer than the unit's time for a stop.
+void Monitor::extendStop() {
+    if (!_stopping) {
+        return;
+    }
+    for (const Worker& worker : _workers) {
+        const auto deadline = worker.process.tools.deadline();
+        if (deadline && *deadline > _stopBy) {
+            _stopBy = *deadline;
+            const auto left = std::chrono::ceil<std::chrono::microseconds>(*deadline + stopExtension - Clock::now());
+            notify(fmt::format("EXTEND_TIMEOUT_USEC={}", left.count()));
+        }
     }
 }
 
@@ -239,9 +280,14 @@ void Monitor::reload() {
 }
 
 void Monitor::reap() {
-    int status = 0;
-    if (_front != 0 && ::waitpid(_front, &status, WNOHANG) == _front) {
-        receive();  // what it asked for before its end does not matter any more, but a worker must be known
+    siginfo_t ended{};
+    if (_front != 0 && ::waitid(P_PID, static_cast<id_t>(_front), &ended, WEXITED | WNOHANG | WNOWAIT) == 0 &&
+        ended.si_pid == _front) {
+        // What it asked for before its end does not matter any more, but a worker must be known. It is reaped
+        // afterwards, so that its process id is not another's if it must be killed for what it has sent.
+        receive();
+        int status = 0;
+        ::waitpid(_front, &status, 0);
         frontEnded(status);
     }
     std::erase_if(_workers, [&](Worker& worker) { return collect(worker); });
@@ -264,7 +310,8 @@ bool Monitor::collect(Worker& worker) {
 
 void Monitor::receive() {
     using Kind = ReceivedMessage::Kind;
-    while (_link.isOpen()) {
+    // The others wait for the next turn: a front that sends without end does not keep the monitor from the rest.
+    for (int i = 0; i < messageMaximum && _link.isOpen(); ++i) {
         const ReceivedMessage received = receiveMonitorMessage(_link.get());
         if (received.kind == Kind::none) {
             return;
@@ -331,9 +378,11 @@ void Monitor::startNow(Wanted wanted) {
     const timeval bound{5, 0};
     ::setsockopt(started->conversation.get(), SOL_SOCKET, SO_SNDTIMEO, &bound, sizeof bound);
     if (!writeFrame(started->conversation.get(), protocol::frameOf(std::move(configuration)))) {
+        // Reaped when it has ended: one that waits for a dead mount must not hold up the monitor.
         ::kill(started->pid, SIGKILL);
-        ::waitpid(started->pid, nullptr, 0);
         sendToFront({MonitorMessage::Kind::start, number, 0, EIO});
+        started->conversation.close();
+        _workers.push_back({number, *std::move(started), false});
         return;
     }
     const int descriptors[] = {started->conversation.get(), started->process.get()};

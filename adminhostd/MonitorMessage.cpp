@@ -4,6 +4,7 @@
 #include <cstring>
 #include <system_error>
 
+#include <poll.h>
 #include <sys/socket.h>
 #include <sys/uio.h>
 
@@ -35,6 +36,12 @@ bool takeDescriptors(msghdr& header, std::array<FileDescriptor, descriptorMaximu
         }
     }
     return (header.msg_flags & MSG_CTRUNC) == 0;
+}
+
+/// A packet without a byte is read like the end.
+bool isClosed(int socket) {
+    pollfd entry{socket, POLLIN, 0};
+    return ::poll(&entry, 1, 0) > 0 && (entry.revents & POLLHUP) != 0;
 }
 
 }  // namespace
@@ -86,8 +93,12 @@ ReceivedMessage receiveMonitorMessage(int socket) {
     do {
         size = ::recvmsg(socket, &header, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
     } while (size < 0 && errno == EINTR);
-    if (size <= 0) {
-        received.kind = size < 0 && errno == EAGAIN ? Kind::none : Kind::closed;
+    if (size < 0) {
+        received.kind = errno == EAGAIN ? Kind::none : Kind::closed;
+        return received;
+    }
+    if (size == 0 && isClosed(socket)) {
+        received.kind = Kind::closed;
         return received;
     }
     const bool whole = takeDescriptors(header, received.descriptors);

@@ -45,7 +45,8 @@ struct ReceivedMessage {
     std::array<FileDescriptor, 2> descriptors = {};
 };
 
-/// Does not wait. A message of another size, of an unknown kind, or with more descriptors than fit is malformed.
+/// Does not wait. A message of another size, of an unknown kind, or with more descriptors than fit is
+/// malformed, and so is a conversation of which the other process has closed one direction only.
 [[nodiscard]] ReceivedMessage receiveMonitorMessage(int socket);
 
 }  // namespace adminhost

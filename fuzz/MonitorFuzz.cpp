@@ -12,7 +12,7 @@
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     using namespace adminhost;
     static const auto ends = monitorSocketPair();
-    if (size == 0 || ::send(ends[0].get(), data, size, MSG_DONTWAIT | MSG_NOSIGNAL) < 0) {
+    if (::send(ends[0].get(), data, size, MSG_DONTWAIT | MSG_NOSIGNAL) < 0) {
         return 0;
     }
     const ReceivedMessage received = receiveMonitorMessage(ends[1].get());

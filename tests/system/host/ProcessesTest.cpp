@@ -8,6 +8,7 @@
 
 #include <gmock/gmock.h>
 #include <sys/prctl.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -84,6 +85,21 @@ TEST_F(Processes, FrontsThatKeepDyingAreStartedAfterAGrowingPause) {
         EXPECT_TRUE(_daemon.waitForLog(std::string("the next one is started in ") + pause)) << _daemon.log();
     }
     EXPECT_TRUE(serves());
+}
+
+TEST_F(Processes, FrontThatCannotBeStartedAgainIsTriedUntilItCan) {
+    rlimit bound{};
+    ASSERT_EQ(::prlimit(_daemon.pid(), RLIMIT_NOFILE, nullptr, &bound), 0);
+    const rlimit none{3, bound.rlim_max};
+    ASSERT_EQ(::prlimit(_daemon.pid(), RLIMIT_NOFILE, &none, nullptr), 0);
+    const UnixHttp lost = startHeldWrite(_daemon, _daemon.directory(), "written");
+    ::kill(_daemon.frontPid(), SIGKILL);
+    EXPECT_TRUE(_daemon.waitForLog("Too many open files; the next try is in 200 ms"));
+    EXPECT_TRUE(_daemon.waitForLog("Too many open files; the next try is in 400 ms"));
+    ASSERT_EQ(::prlimit(_daemon.pid(), RLIMIT_NOFILE, &bound, nullptr), 0);
+    go();
+    EXPECT_TRUE(serves());
+    EXPECT_EQ(data(), "written\n");
 }
 
 TEST_F(Processes, MonitorThatIsKilledLetsTheFrontFinishTheWriteAndAnswerItsClient) {

@@ -373,27 +373,5 @@ TEST_F(Start, OtherProcessesOfTheAccountCannotInspectFrontAndWorkerOnlyTheirTool
     EXPECT_EQ(status, 0) << WEXITSTATUS(status);
 }
 
-TEST_F(Start, ServiceManagerIsToldOfReadinessAndOfTheEnd) {
-    const fs::path path = directory / "notify";
-    const int listener = ::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    path.string().copy(address.sun_path, sizeof address.sun_path - 1);
-    ASSERT_EQ(::bind(listener, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-    const timeval bound{10, 0};
-    ::setsockopt(listener, SOL_SOCKET, SO_RCVTIMEO, &bound, sizeof bound);
-    auto options = withFixture();
-    options.environment = {"NOTIFY_SOCKET=" + path.string()};
-    DaemonProcess daemon(options);
-    char buffer[64] = {};
-    ASSERT_GT(::recv(listener, buffer, sizeof buffer - 1, 0), 0);
-    EXPECT_STREQ(buffer, "READY=1");
-    daemon.signal(SIGTERM);
-    ASSERT_GT(::recv(listener, buffer, sizeof buffer - 1, 0), 0);
-    EXPECT_TRUE(std::string(buffer).starts_with("STOPPING=1"));
-    EXPECT_EQ(daemon.wait(), 0);
-    ::close(listener);
-}
-
 }  // namespace
 }  // namespace adminhost::test
