@@ -253,8 +253,8 @@ std::optional<FrontAccount> frontAccount(const Options& options) {
     }
     if (entry->pw_uid == 0 || entry->pw_gid == 0) {
         throw std::runtime_error(
-            fmt::format("the account \"{}\" is the superuser's or in its group; name another account in the "
-                        "configuration",
+            fmt::format("the account \"{}\" is the superuser's or in its group; name another account in "
+                        "the configuration",
                         name));
     }
     return FrontAccount{entry->pw_uid, entry->pw_gid};

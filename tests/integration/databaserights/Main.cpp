@@ -13,6 +13,7 @@
 #include <iostream>
 #include <stdexcept>
 #include <string>
+#include <string_view>
 
 #include <gtest/gtest.h>
 #include <sched.h>
@@ -55,6 +56,10 @@ int main(int argc, char** argv) {
     }
     check(::unshare(CLONE_NEWNS), "unshare");
     check(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "mount");
+    // The accounts of this program cannot enter a temporary directory that is closed to others.
+    const char* const place = std::string_view(BINARY_DIR).starts_with("/mnt/") ? "/media" : "/mnt";
+    check(::mount("tmpfs", place, "tmpfs", 0, "mode=1777"), "mount");
+    ::setenv("TMPDIR", place, 1);
     using namespace accounts;
     std::string directory = (std::filesystem::temp_directory_path() / "accounts-XXXXXX").string();
     if (::mkdtemp(directory.data()) == nullptr) {

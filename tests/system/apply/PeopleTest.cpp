@@ -40,11 +40,11 @@ class People : public ControlledService {
         root.write("/etc/passwd", left);
     }
     [[nodiscard]] std::size_t writes() const {
-        const std::string log = daemon.log();
+        std::istringstream lines(daemon.log());
         std::size_t count = 0;
-        for (std::size_t at = log.find("lumio/writeSettings"); at != std::string::npos;
-             at = log.find("lumio/writeSettings", at + 1)) {
-            ++count;
+        for (std::string line; std::getline(lines, line);) {
+            const bool isBeginning = line.ends_with(": begins");
+            count += isBeginning && line.find("lumio/writeSettings") != std::string::npos ? 1U : 0U;
         }
         return count;
     }

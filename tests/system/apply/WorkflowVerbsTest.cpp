@@ -140,7 +140,7 @@ TEST_F(WorkflowVerbs, FileIsAppliedOnceAndThenNothingChanges) {
     EXPECT_EQ(root.sql("select access_control_enabled from workflows where uuid='" + uuid("Publish") + "'"), "f\n");
     EXPECT_EQ(in("de_DE.UTF-8", {"apply", desired}).output, "no change\n");
     EXPECT_THAT(in("C", {"history"}).output,
-                HasSubstr("workflows." + uuid("Removed") + ".users.carla: (not allowed) ->"))  // then it may be wrapped
+                HasSubstr("workflows." + uuid("Removed") + ".users.carla: (not"))  // wrapped
         << "the name of the account decides where";
 }
 
@@ -167,7 +167,7 @@ TEST_F(WorkflowVerbs, ListThatCannotBeReadIsNotExported) {
     root.sql("alter table workflows rename to gone");
     const ProgramResult exported = in("C", {"export"});
     EXPECT_EQ(exported.status, 1);
-    EXPECT_THAT(exported.output, HasSubstr("the service does not list its workflows"));
+    EXPECT_THAT(exported.output, HasSubstr("not read: the workflows (Error: in prepare, no such table: workflows)"));
     EXPECT_EQ(in("C", {"workflow", "list"}).status, 1);
     EXPECT_EQ(in("C", {"camera", "access", "Main hall", "off"}).status, 0) << "cameras have nothing to do with them";
 }

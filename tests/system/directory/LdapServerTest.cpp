@@ -75,7 +75,7 @@ TEST_F(LdapServer, AccessOfACameraIsShownAndChangedByTheNamesOfTheServer) {
     EXPECT_THAT(accessRows(), HasSubstr(SampleRoot::uuidOf("group", "lecturers")));
     EXPECT_THAT(accessRows(), Not(HasSubstr(SampleRoot::uuidOf("user", "anna"))));
     EXPECT_EQ(root.sql("select access_control_enabled from cameras where name='Main hall'"), "f\n");
-    EXPECT_EQ(ctl({"camera", "allow", "Main hall", "ben"}).output, "no change\n");
+    EXPECT_THAT(ctl({"camera", "allow", "Main hall", "ben"}).output, testing::StartsWith("no change\n"));
 }
 
 TEST_F(LdapServer, WhileItIsDownListsAreReportedAsEmptyAndAfterwardsTheyAreWhole) {
