@@ -28,7 +28,8 @@ TEST_F(Reports, AreInTheRecordAndTheirNumbersInTheAnswersHeaders) {
     EXPECT_EQ(reply.status, 204);
     EXPECT_EQ(reply.headers.at("adminhost-changes"), "2");
     EXPECT_EQ(reply.headers.at("adminhost-not-done"), "1");
-    EXPECT_TRUE(daemon.waitForLog(" ms, changes: 2, not done: 1\n"));
+    EXPECT_TRUE(daemon.waitForLog(" ms, changes: 2 (cameras Studio users: (not set) -> anna; "));
+    EXPECT_TRUE(daemon.waitForLog(", not done: 1 (configuration.cameras.0: not changed: camera not found (no row))\n"));
     const Dictionary record = recordOf(reply);
     EXPECT_EQ(record.get("changes").array()->front(), Value(Dictionary{{"section", "cameras"},
                                                                        {"identity", "U0"},
