@@ -1,6 +1,7 @@
 #include "adminhostd/AuditJournal.h"
 
 #include "adminhostd/AuditEvent.h"
+#include "adminhostd/Permissions.h"
 #include "adminhostd/WorkerAnswer.h"
 #include "platform/json/Json.h"
 #include "platform/log/Log.h"
@@ -138,9 +139,24 @@ Dictionary entryOf(const Fields& fields, std::uint64_t microseconds) {
     return entry;
 }
 
-bool isOfUser(const Fields& fields, const std::string& user) {
-    return user.empty() || textIn(fields, "USER") == user || textIn(fields, "LOGIN_USER") == user ||
-           textIn(fields, "UID") == user || textIn(fields, "LOGIN_UID") == user;
+/// A name or number of an account. `number` is that of the name: an event has no name if the front did not know it.
+struct WantedUser {
+    std::string text;
+    std::string number;
+
+    [[nodiscard]] bool is(const Fields& fields, std::string_view name, std::string_view uid) const {
+        const std::string found = textIn(fields, uid);
+        return found == text || textIn(fields, name) == text || (!number.empty() && found == number);
+    }
+};
+
+WantedUser wantedUser(const std::string& text) {
+    const auto number = text.empty() ? std::nullopt : accountNumberOf(text);
+    return {text, number ? std::to_string(*number) : std::string()};
+}
+
+bool isOfUser(const Fields& fields, const WantedUser& user) {
+    return user.text.empty() || user.is(fields, "USER", "UID") || user.is(fields, "LOGIN_USER", "LOGIN_UID");
 }
 
 bool hasKey(const Fields& fields, const std::string& key) {
@@ -154,12 +170,12 @@ int addMatch(sd_journal* journal, std::string_view field, std::string_view value
 }
 
 /// Two matches of one field are alternatives; different fields must all match.
-int addMatches(sd_journal* journal, const protocol::ReadAudit& order, const std::string& unit) {
+int addMatches(sd_journal* journal, uid_t account, const std::string& unit) {
     int result = addMatch(journal, "MESSAGE_ID", begunMessage);
     for (const auto& [field, value] :
          std::vector<std::pair<const char*, std::string>>{{"MESSAGE_ID", std::string(endedMessage)},
                                                           {"_TRANSPORT", "journal"},
-                                                          {"_UID", std::to_string(order.account)},
+                                                          {"_UID", std::to_string(account)},
                                                           {"_SYSTEMD_UNIT", unit}}) {
         if (result >= 0 && !value.empty()) {
             result = addMatch(journal, field, value);
@@ -194,7 +210,7 @@ int seek(sd_journal* journal, const protocol::ReadAudit& order, bool& gap) {
 
 }  // namespace
 
-Answer auditAnswer(const protocol::ReadAudit& order, const std::string& unit) {
+Answer auditAnswer(const protocol::ReadAudit& order, uid_t account, const std::string& unit) {
     if (!journalIsThere()) {
         return notReadable(
             "systemd-journald does not run on this machine, so the audit cannot be searched. Its events are the lines "
@@ -208,7 +224,7 @@ Answer auditAnswer(const protocol::ReadAudit& order, const std::string& unit) {
         return failed("open", result, order.form);
     }
     const Journal journal(opened);
-    result = addMatches(journal.get(), order, unit);
+    result = addMatches(journal.get(), account, unit);
     if (result < 0) {
         return failed("match", result, order.form);
     }
@@ -224,6 +240,7 @@ Answer auditAnswer(const protocol::ReadAudit& order, const std::string& unit) {
     if (result < 0) {
         return failed("seek", result, order.form);
     }
+    const WantedUser user = wantedUser(order.user);
     Array entries;
     std::size_t bytes = 0;
     std::string next = order.after;
@@ -239,7 +256,7 @@ Answer auditAnswer(const protocol::ReadAudit& order, const std::string& unit) {
         std::size_t size = 0;
         const Fields fields = fieldsOf(journal.get(), size);
         next = cursorOf(journal.get());
-        if (isOfUser(fields, order.user) && hasKey(fields, order.key)) {
+        if (isOfUser(fields, user) && hasKey(fields, order.key)) {
             bytes += size;
             entries.emplace_back(entryOf(fields, microseconds));
         }

@@ -10,7 +10,6 @@
 #include <utility>
 
 #include <fmt/format.h>
-#include <unistd.h>
 
 namespace adminhost {
 namespace {
@@ -135,7 +134,6 @@ std::optional<protocol::ToWorker> Front::orderFor(const Exchange& exchange, cons
                                        .user = std::string(exchange.argument("user")),
                                        .key = std::string(exchange.argument("key")),
                                        .after = std::string(exchange.argument("after")),
-                                       .account = ::geteuid(),
                                        .milliseconds = 0,
                                        .form = wantedForm(exchange)};
         }

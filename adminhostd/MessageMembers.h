@@ -37,7 +37,8 @@ constexpr auto members<Configure> = std::tuple(
     member("configure.toolEnvironment", &Configure::toolEnvironment),
     member("configure.directory", &Configure::directory),
     member("configure.directoryMilliseconds", &Configure::directoryMilliseconds),
-    member("configure.tryOnly", &Configure::tryOnly), member("configure.probeDirectory", &Configure::probeDirectory));
+    member("configure.frontAccount", &Configure::frontAccount), member("configure.tryOnly", &Configure::tryOnly),
+    member("configure.probeDirectory", &Configure::probeDirectory));
 template <>
 constexpr auto members<DirectoryNodeOptions> = std::tuple(member("node.local", &DirectoryNodeOptions::local),
                                                           member("node.settings", &DirectoryNodeOptions::settings),
@@ -107,7 +108,6 @@ constexpr auto members<ReadAudit> = std::tuple(member("readAudit.since", &ReadAu
                                                member("readAudit.user", &ReadAudit::user),
                                                member("readAudit.key", &ReadAudit::key),
                                                member("readAudit.after", &ReadAudit::after),
-                                               member("readAudit.account", &ReadAudit::account),
                                                member("readAudit.milliseconds", &ReadAudit::milliseconds),
                                                member("readAudit.form", &ReadAudit::form));
 template <>

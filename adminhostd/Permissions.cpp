@@ -28,15 +28,15 @@ std::optional<id_t> numberOf(const std::string& name, LookUp lookUp, Number numb
     return failure == 0 && found != nullptr ? std::optional<id_t>(entry.*number) : std::nullopt;
 }
 
-std::optional<id_t> userNumber(const std::string& name) {
-    return numberOf<passwd>(name, &::getpwnam_r, &passwd::pw_uid);
-}
-
 std::optional<id_t> groupNumber(const std::string& name) {
     return numberOf<group>(name, &::getgrnam_r, &group::gr_gid);
 }
 
 }  // namespace
+
+std::optional<uid_t> accountNumberOf(const std::string& name) {
+    return numberOf<passwd>(name, &::getpwnam_r, &passwd::pw_uid);
+}
 
 std::string_view nameOf(Right right) noexcept {
     return rightWords[static_cast<std::size_t>(right)].first;
@@ -72,7 +72,7 @@ Permissions::Permissions(const std::vector<PermissionOptions>& options, uid_t ow
                 }
             }
         };
-        resolve(table.users, "user", &userNumber, grant.users);
+        resolve(table.users, "user", &accountNumberOf, grant.users);
         resolve(table.groups, "group", &groupNumber, grant.groups);
     }
 }

@@ -68,6 +68,9 @@ struct PermissionOptions {
     bool operator==(const PermissionOptions&) const = default;
 };
 
+/// The number of the account with this name, by all the machine's account sources: this may ask a directory service.
+[[nodiscard]] std::optional<uid_t> accountNumberOf(const std::string& name);
+
 class Permissions {
   public:
     /// Looks up the names with the machine's account sources, which may ask a directory service: to be created at the

@@ -66,6 +66,7 @@ struct Configure {
     std::map<std::string, std::string> toolEnvironment;
     std::vector<DirectoryNodeOptions> directory;  ///< empty: the accounts of this machine
     std::uint64_t directoryMilliseconds = 0;      ///< for all directory work of a request
+    std::uint64_t frontAccount = 0;               ///< whose entries of the journal are the audit
     bool tryOnly = false;                         ///< only to see what loads: nothing is cleaned up
     bool probeDirectory = false;                  ///< only to log the nodes that cannot be reached: no Hello
     bool operator==(const Configure&) const = default;
@@ -126,7 +127,6 @@ struct ReadAudit {
     std::string user;                ///< name or number of the account or of the login session's; empty: any
     std::string key;                 ///< of a change ("port", "cameras.users"); empty: any
     std::string after;               ///< `next` of an earlier page, which then counts instead of `since`; empty: none
-    std::uint64_t account = 0;       ///< that the front runs as
     std::uint64_t milliseconds = 0;  ///< until its deadline
     BodyForm form = BodyForm::json;
     bool operator==(const ReadAudit&) const = default;

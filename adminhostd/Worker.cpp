@@ -106,13 +106,14 @@ class Worker {
     protocol::Answer answer(const protocol::ReadHistory& order);
     [[nodiscard]] protocol::Answer answer(const protocol::Diagnose& order) const;
     [[nodiscard]] protocol::Answer answer(const protocol::ReadLog& order) const;
-    [[nodiscard]] static protocol::Answer answer(const protocol::ReadAudit& order);
+    [[nodiscard]] protocol::Answer answer(const protocol::ReadAudit& order) const;
     protocol::Answer perform(const LoadedPlugin& loaded, const protocol::Perform& order);
 
     int _descriptor;
     ForwardingSink _sink;
     FrameReader _reader;
     ChangeNotes _notes{_descriptor, _reader, _sink};
+    uid_t _frontAccount = 0;
     std::chrono::milliseconds _directoryTime{};  ///< for all directory work of a request
     OwnMemory _memory;
     LoadedPlugins _plugins;
@@ -157,6 +158,7 @@ protocol::Answer unmetAnswer(const UnmetNeed& need, BodyForm form) {
 
 protocol::Hello Worker::configure(const protocol::Configure& configuration) {
     setSystemRoot(configuration.root);
+    _frontAccount = static_cast<uid_t>(configuration.frontAccount);
     _directoryTime = std::chrono::milliseconds(configuration.directoryMilliseconds);
     const std::vector<std::string> nodeProblems = configureDirectory(configuration);
     for (const std::string& problem : nodeProblems) {
@@ -381,8 +383,8 @@ protocol::Answer Worker::answer(const protocol::ReadLog& order) const {
     return logAnswer(_plugins.all(), order);
 }
 
-protocol::Answer Worker::answer(const protocol::ReadAudit& order) {
-    return auditAnswer(order, unitOf(controlGroupOf(::getpid())));  // the front is in the same unit
+protocol::Answer Worker::answer(const protocol::ReadAudit& order) const {
+    return auditAnswer(order, _frontAccount, unitOf(controlGroupOf(::getpid())));  // the front is in the same unit
 }
 
 std::optional<int> Worker::serve(protocol::ToWorker message) {

@@ -1,11 +1,14 @@
 #include "adminhostd/WorkerConfiguration.h"
 
+#include "adminhostd/FrontRights.h"
 #include "adminhostd/ToolConfiguration.h"
 #include "platform/framework/BuildNote.h"
 #include "platform/text/EnvironmentLanguages.h"
 
 #include <cstdint>
 #include <vector>
+
+#include <unistd.h>
 
 namespace adminhost {
 namespace {
@@ -35,6 +38,9 @@ protocol::Configure workerConfiguration(const Options& options, const PluginSele
     configuration.serviceManager = options.serviceManager;
     configuration.directory = options.directory.nodes;
     configuration.directoryMilliseconds = static_cast<std::uint64_t>(options.directory.budget.count());
+    // The worker must not learn this from the front, which could have it show what another account has written.
+    const auto account = frontAccount(options);
+    configuration.frontAccount = account ? account->user : ::geteuid();
     configuration.toolEnvironment = {{toolConfigurationVariable, toolConfiguration}};
     return configuration;
 }

@@ -69,6 +69,7 @@ std::vector<ToWorker> messagesToWorker() {
                       .toolEnvironment = {{"A", "1"}, {"B", ""}},
                       .directory = {node(), {}},
                       .directoryMilliseconds = 9,
+                      .frontAccount = 8,
                       .tryOnly = true,
                       .probeDirectory = true},
             perform(),
@@ -76,7 +77,7 @@ std::vector<ToWorker> messagesToWorker() {
             ReadHistory{"p", BodyForm::propertyList},
             Diagnose{7},
             ReadLog{"p", "n", 1, 2, 3, BodyForm::propertyList},
-            ReadAudit{1, "u", "k", "a", 2, 3, BodyForm::propertyList},
+            ReadAudit{1, "u", "k", "a", 3, BodyForm::propertyList},
             Proceed{"r"},
             Recorded{"r"}};
 }
