@@ -2,6 +2,7 @@
 
 #include "platform/log/Log.h"
 
+#include <algorithm>
 #include <utility>
 
 #include <fmt/format.h>
@@ -10,7 +11,8 @@ namespace adminhost {
 namespace {
 
 constexpr auto refusalPeriod = std::chrono::minutes(1);
-constexpr std::size_t refusedAccounts = 1000;  ///< that are counted at a time
+constexpr auto readingPeriod = std::chrono::hours(1);
+constexpr std::size_t readingsMaximum = 1000;  ///< that are remembered
 
 }  // namespace
 
@@ -48,13 +50,20 @@ void Audit::begun(RequestRecord& record, const protocol::Begun& about) {
     write(eventFor(record, AuditEvent::Kind::begun), record.redaction);
 }
 
+void Audit::forgetOldestRefusals() {
+    const auto oldest = std::min_element(_refusals.begin(), _refusals.end(),
+                                         [](const auto& a, const auto& b) { return a.second.since < b.second.since; });
+    if (oldest->second.notLogged > 0) {
+        logEvent(fmt::format("adminhostd: {} refusals of {} were not logged", oldest->second.notLogged,
+                             uidText(oldest->first, _names.of(oldest->first))));
+    }
+    _refusals.erase(oldest);
+}
+
 bool Audit::countRefusal(uid_t uid, std::size_t& notLogged) {
     const auto now = Clock::now();
     if (_refusals.size() >= refusedAccounts && !_refusals.contains(uid)) {
-        std::erase_if(_refusals, [&](const auto& one) { return now - one.second.since >= refusalPeriod; });
-        if (_refusals.size() >= refusedAccounts) {
-            _refusals.erase(_refusals.begin());
-        }
+        forgetOldestRefusals();
     }
     Refusals& refusals = _refusals.try_emplace(uid, Refusals{now}).first->second;
     if (now - refusals.since >= refusalPeriod) {
@@ -70,14 +79,35 @@ bool Audit::countRefusal(uid_t uid, std::size_t& notLogged) {
     return true;
 }
 
+bool Audit::countReading(uid_t uid, const std::string& place) {
+    const auto now = Clock::now();
+    const auto [reading, isNew] = _readings.try_emplace({uid, place}, now);
+    const bool first = isNew || now - reading->second >= readingPeriod;
+    if (first) {
+        reading->second = now;
+    }
+    if (_readings.size() > readingsMaximum) {
+        _readings.erase(std::min_element(_readings.begin(), _readings.end(),
+                                         [](const auto& a, const auto& b) { return a.second < b.second; }));
+    }
+    return first;
+}
+
+bool Audit::isWorthLogging(const RequestRecord& record, std::size_t& notLogged) {
+    constexpr unsigned forbidden = 403;
+    if (record.status == forbidden) {
+        // Any account that can connect can cause refusals: it must not be able to fill the log.
+        return countRefusal(record.peer.uid, notLogged);
+    }
+    const bool read = record.status < 300 && !record.place.empty();
+    const bool first = read && countReading(record.peer.uid, record.place);
+    return first || !record.repeated || record.status >= 300;
+}
+
 void Audit::ended(RequestRecord& record) {
     const Redaction redaction = std::exchange(record.redaction, {});
     AuditEvent event = eventFor(record, AuditEvent::Kind::ended);
-    constexpr unsigned forbidden = 403;
-    // Any account that can connect can cause refusals: it must not be able to fill the log.
-    const bool worthLogging = record.status == forbidden ? countRefusal(record.peer.uid, event.refusalsNotLogged)
-                                                         : !(record.repeated && record.status < 300);
-    if (!worthLogging) {
+    if (!isWorthLogging(record, event.refusalsNotLogged)) {
         return;
     }
     event.status = record.status;

@@ -17,6 +17,7 @@
 #include <cstddef>
 #include <map>
 #include <string>
+#include <utility>
 
 #include <sys/types.h>
 
@@ -24,7 +25,8 @@ namespace adminhost {
 
 class Audit {
   public:
-    static constexpr std::size_t refusalsLogged = 20;  ///< of one account in one minute; further ones are counted
+    static constexpr std::size_t refusalsLogged = 20;     ///< of one account in one minute; further ones are counted
+    static constexpr std::size_t refusedAccounts = 1000;  ///< whose refusals are counted at a time
 
     /// Names of accounts for messages.
     [[nodiscard]] AccountNames& names() noexcept { return _names; }
@@ -51,9 +53,14 @@ class Audit {
     static void write(const AuditEvent& event, const Redaction& redaction);
     /// Counts a refusal. Returns false if it is not to be logged, because the account has caused too many.
     [[nodiscard]] bool countRefusal(uid_t uid, std::size_t& notLogged);
+    void forgetOldestRefusals();
+    /// Returns true for the account's first reading of this place in an hour.
+    [[nodiscard]] bool countReading(uid_t uid, const std::string& place);
+    [[nodiscard]] bool isWorthLogging(const RequestRecord& record, std::size_t& notLogged);
 
     AccountNames _names;
     std::map<uid_t, Refusals> _refusals;
+    std::map<std::pair<uid_t, std::string>, Clock::time_point> _readings;  ///< of logs and of the audit
     std::size_t _unrecorded = 0;  ///< changes that began without a note for the next daemon
     std::string _unrecordedReason;
 };

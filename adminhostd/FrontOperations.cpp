@@ -150,6 +150,9 @@ void Front::query(Exchange& exchange, const Target& target) {
                          (target.kind == Target::Kind::audit && !exchange.argument("after").empty());
     Operation operation{&exchange, follows ? RequestLog::begin(exchange) : _log.add(exchange)};
     operation.record->repeated = follows;
+    if (target.kind == Target::Kind::logs || target.kind == Target::Kind::audit) {
+        operation.record->place = fmt::format("{}?{}", exchange.path(), exchange.argument("plugin"));
+    }
     name(*operation.record, target);
     HttpAnswer malformed;
     auto order = orderFor(exchange, target, malformed);

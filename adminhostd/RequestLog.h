@@ -40,7 +40,8 @@ struct RequestRecord {
     double milliseconds = 0;  ///< from arrival to answer
     unsigned status = 0;
     std::string error;      ///< the code of an answer that is an error
-    bool repeated = false;  ///< one of many like it, which a client sends by itself: its success is not logged
+    bool repeated = false;  ///< one of many like it, which a client sends by itself: only the first is logged
+    std::string place;      ///< what it reads, if that can be followed: a log or the audit
     std::string access;     ///< the class that it needs; empty if what it names does not exist
     bool checkOnly = false;
     bool begun = false;  ///< the beginning of its operation has been logged

@@ -41,7 +41,8 @@ class AuditTest : public testing::Test {
         test::DaemonProcess::Options options;
         options.arguments = {"--root", root.path(), "--plugin", test::pluginFile("fixture_good")};
         options.configuration =
-            "queue_limit_per_account = 2\n[[permission]]\nusers = [\"bert\"]\nclasses = [\"write\", \"read\"]\n";
+            "queue_limit_per_account = 2\n[[permission]]\nusers = [\"bert\"]\nclasses = [\"write\", \"read\"]\n"
+            "[[permission]]\nusers = [\"emil\"]\nclasses = [\"audit\"]\n";
         daemon.emplace(options);
         ::chmod(daemon->directory().c_str(), 0755);
         ::chmod(daemon->socket().c_str(), 0666);
@@ -92,6 +93,11 @@ class AuditTest : public testing::Test {
         EXPECT_THAT(entries, testing::SizeIs(count));
         entries.resize(count);
         return entries;
+    }
+    /// The number of entries of a request, once the journal has everything that was recorded so far.
+    [[nodiscard]] std::size_t settledCount(const std::string& request) const {
+        awaitEntries(daemon->connect().post("/v1/fixture/echo").headers.at("request-id"), 1);
+        return entriesOf(request).size();
     }
     [[nodiscard]] test::ProgramResult ctl(std::vector<std::string> words) const {
         words.insert(words.begin(), {std::string(BINARY_DIR) + "/bin/adminhostctl", "--socket", daemon->socket()});

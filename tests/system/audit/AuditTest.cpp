@@ -133,19 +133,41 @@ TEST_F(AuditTest, PageIsBounded) {
 }
 
 TEST_F(AuditTest, FollowingReadsAreNotRecordedThemselves) {
-    const Dictionary first = page("");
-    const auto count = [&] {
-        std::size_t readings = 0;
-        const Array entries = *page("after=" + std::string(first.text("next"))).get("entries").array();
-        for (const Value& entry : entries) {
-            readings += entry.dictionary()->text("command") == "audit" ? 1U : 0U;
-        }
-        return readings;
-    };
-    ASSERT_TRUE(eventually([&] { return count() == 1; })) << "the first page is a reading like others";
-    for (int i = 0; i < 5; ++i) {
-        EXPECT_EQ(count(), 1U);
+    awaitEntries(daemon->connect().post("/v1/fixture/echo").headers.at("request-id"), 1);
+    const test::HttpReply first = daemon->connect().get("/v1/audit");
+    const std::string following = "/v1/audit?after=" + std::string(dictionaryOf(first).text("next"));
+    const std::string next = daemon->connect().get(following).headers.at("request-id");
+    EXPECT_EQ(settledCount(first.headers.at("request-id")), 1U) << "the first page is a reading like others";
+    EXPECT_EQ(entriesOf(next).size(), 0U);
+}
+
+TEST_F(AuditTest, ReadingThatOnlyLooksLikeFollowingIsRecorded) {
+    fs::create_directories(root.disk("/var/log/fixture"));
+    std::ofstream(root.disk("/var/log/fixture/fixture.log")) << "text\n";
+    awaitEntries(daemon->connect().post("/v1/fixture/echo").headers.at("request-id"), 1);
+    const std::string place(page("").text("next"));
+    const test::TestAccount emil{test::emil};
+    const test::TestAccount bert{test::bert};
+    for (const auto& [account, address] :
+         {std::pair(bert, std::string("/v1/logs?inode=0&offset=0")),
+          std::pair(bert, std::string("/v1/logs/log?inode=0&offset=0")), std::pair(emil, "/v1/audit?after=" + place)}) {
+        const test::HttpReply first = test::connectAs(account, daemon->socket()).get(address);
+        ASSERT_EQ(first.status, 200) << first.body;
+        const test::HttpReply second = test::connectAs(account, daemon->socket()).get(address);
+        EXPECT_EQ(settledCount(first.headers.at("request-id")), 1U) << address;
+        EXPECT_EQ(entriesOf(second.headers.at("request-id")).size(), 0U) << address;
     }
+}
+
+TEST_F(AuditTest, AccountIsFoundByANameThatOnlyALookUpKnows) {
+    // The daemon does not know the name when it records the request, as with accounts of a directory service.
+    constexpr uid_t zoe = 20006;
+    const std::string id = test::connectAs({zoe}, daemon->socket()).get("/v1/").headers.at("request-id");
+    EXPECT_FALSE(awaitEntries(id, 1)[0].contains("user"));
+    std::ofstream("/etc/passwd", std::ios::app) << "zoe:x:20006:20006::/nonexistent:/usr/sbin/nologin\n";
+    const Array entries = *page("user=zoe").get("entries").array();
+    ASSERT_THAT(entries, testing::Not(testing::IsEmpty()));
+    EXPECT_EQ(entries.back().dictionary()->text("request"), id);
 }
 
 TEST_F(AuditTest, CommandLinePrintsATableJsonAndFollows) {
