@@ -34,7 +34,9 @@ bool ChangeNotes::awaitProceed(const std::string& request) {
             const auto* proceed = message ? std::get_if<protocol::Proceed>(&*message) : nullptr;
             return proceed != nullptr && proceed->request == request;
         }
-        recorded(*earlier);
+        if (earlier->request != request) {
+            recorded(*earlier);
+        }  // else it is about an earlier request with this id, whose note this one has replaced
     }
     return false;
 }

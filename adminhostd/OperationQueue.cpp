@@ -1,5 +1,7 @@
 #include "adminhostd/OperationQueue.h"
 
+#include "platform/log/Log.h"
+
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
@@ -121,6 +123,9 @@ void OperationQueue::run(std::span<const pollfd> polled) {
     if (_worker) {
         converse(polled);
     }
+    if (_state == State::idle && !sendRecorded()) {
+        endWorker("could not be sent which ends have been logged");
+    }
     _directoryProbe.run(polled, _events.log);
     if (_due && Clock::now() >= *_due) {
         timeUp();
@@ -223,13 +228,26 @@ bool OperationQueue::take(const protocol::Begun& begun) {
     if (!_running || !_running->changes || _running->record->id != begun.request) {
         return false;
     }
+    // This note replaces that of an earlier request with the same id.
+    std::erase(_recorded, begun.request);
     _events.begun(*_running, begun);
     return _worker->send(protocol::frameOf(protocol::Proceed{begun.request}));
 }
 
 bool OperationQueue::take(const protocol::Unfinished& request) {
     _events.unfinished(request);
-    return _worker->send(protocol::frameOf(protocol::Recorded{request.request}));
+    _recorded.push_back(request.request);
+    return sendRecorded();
+}
+
+bool OperationQueue::sendRecorded() {
+    if (_recorded.empty() || !flushLog()) {
+        return true;
+    }
+    const std::vector<std::string> requests = std::exchange(_recorded, {});
+    return std::all_of(requests.begin(), requests.end(), [&](const std::string& request) {
+        return _worker->send(protocol::frameOf(protocol::Recorded{request}));
+    });
 }
 
 bool OperationQueue::take(protocol::Hello hello) {
@@ -259,7 +277,10 @@ bool OperationQueue::take(protocol::Answer answer) {
     } else {
         const std::shared_ptr<RequestRecord> record = _running->record;
         finish(std::move(answer));
-        if (record->begun && !_worker->send(protocol::frameOf(protocol::Recorded{record->id}))) {
+        if (record->begun) {
+            _recorded.push_back(record->id);
+        }
+        if (!sendRecorded()) {
             return false;
         }
     }

@@ -127,6 +127,9 @@ class OperationQueue {
     bool take(const protocol::Begun& begun);
     bool take(const protocol::Unfinished& request);
     bool take(protocol::Answer answer);
+    /// Sends the worker the requests whose ends have been logged, once the log has nothing queued. Returns false
+    /// if the worker cannot be sent them.
+    [[nodiscard]] bool sendRecorded();
     void endWorker(const std::string& why);
     void workerEnded(const std::string& how);
     void timeUp();
@@ -150,6 +153,7 @@ class OperationQueue {
     WaitingOperations _waiting;
     std::optional<Clock::time_point> _abandonedFrom;  ///< when clients that have gone are looked for
     std::optional<Operation> _running;
+    std::vector<std::string> _recorded;  ///< ended requests of which the worker keeps notes until their ends are logged
     std::optional<Clock::time_point> _changesFrom;  ///< when the lock for changes is to be tried again
     std::optional<Clock::time_point> _due;          ///< when timeUp() has to act
     std::chrono::milliseconds _pause{0};

@@ -1,10 +1,15 @@
 // The audit when processes are killed, entries are forged, the journal is stuck or the disk is full.
 
+#include "adminhostd/AuditJournal.h"
+#include "adminhostd/Peer.h"
+#include "adminhostd/UnitProcesses.h"
 #include "tests/system/audit/AuditFixture.h"
 
 #include <chrono>
 #include <csignal>
+#include <cstdint>
 #include <cstdlib>
+#include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
@@ -151,9 +156,26 @@ TEST_F(AuditTest, WaitingRequestsOfOneAccountAreBoundedAndOthersGoOn) {
 }
 
 TEST_F(AuditTest, EntryOfAnotherUnitIsNotShown) {
+    const auto start = static_cast<std::uint64_t>(std::time(nullptr));
+    const std::string genuine = daemon->connect().post("/v1/fixture/echo").headers.at("request-id");
+    awaitEntries(genuine, 1);
+    const auto shownOf = [&](const std::string& unit) {
+        protocol::ReadAudit order;
+        order.since = start;
+        order.milliseconds = 10'000;
+        const protocol::Answer answer = auditAnswer(order, ::geteuid(), unit);
+        EXPECT_EQ(answer.outcome, protocol::Outcome::answered) << answer.message;
+        return answer.bytes;
+    };
+    EXPECT_THAT(shownOf(unitOf(controlGroupOf(daemon->pid()))), HasSubstr(genuine));
+    EXPECT_THAT(shownOf("another.service"), Not(HasSubstr(genuine)));
+}
+
+TEST_F(AuditTest, WorkerShowsEntriesOfItsOwnUnitOnly) {
     const std::string groups = std::getenv("JOURNAL_GROUPS");
     if (groups.empty()) {
-        // This account cannot create control groups, so there are no units: then the account alone decides.
+        // Only root can create a unit. In whatever unit this account runs, its own entries are shown.
+        ASSERT_NE(std::string(std::getenv("JOURNAL_KIND")), "root") << "mount cgroup2 must be permitted";
         const std::string id = daemon->connect().post("/v1/fixture/echo").headers.at("request-id");
         EXPECT_THAT(awaitEntries(id, 1), SizeIs(1));
         return;
@@ -199,6 +221,44 @@ class StuckJournal {
   private:
     pid_t _pid = 0;
 };
+
+TEST_F(AuditTest, EndOfAChangeThatTheJournalHasNotReadIsReportedByTheNextStart) {
+    const std::string id = fmt::format("01234567-89ab-cdef-0124-{:012x}", ++ids + ::getpid() * 1000LL);
+    const std::string note = root.disk("/var/lib/adminhostd/begun/" + id);
+    auto client = daemon->connect();
+    {
+        const StuckJournal stuck;
+        for (int i = 0; i < 1000; ++i) {  // more than its socket holds
+            ASSERT_EQ(client.post("/v1/fixture/nothing").status, 204);
+        }
+        EXPECT_EQ(client.post("/v1/fixture/reportWrite", R"({"changes": 1})", {"Request-Id: " + id}).status, 204);
+        ASSERT_EQ(client.post("/v1/fixture/echo").status, 200) << "the worker has read all that it was sent before";
+        EXPECT_TRUE(fs::exists(note)) << "its end is only in the daemon's memory";
+        killAll();
+    }
+    start();
+    const auto entries = awaitEntries(id, 1);
+    EXPECT_EQ(entries[0].text("event"), "unfinished");
+    EXPECT_EQ(entries[0].text("result"), "its operation was completed");
+    EXPECT_TRUE(eventually([&] { return !fs::exists(note); }));
+}
+
+TEST_F(AuditTest, NoteIsRemovedOnceAStuckJournalReadsAgain) {
+    const std::string id = fmt::format("01234567-89ab-cdef-0125-{:012x}", ++ids + ::getpid() * 1000LL);
+    const std::string note = root.disk("/var/lib/adminhostd/begun/" + id);
+    auto client = daemon->connect();
+    {
+        const StuckJournal stuck;
+        for (int i = 0; i < 1000; ++i) {
+            ASSERT_EQ(client.post("/v1/fixture/nothing").status, 204);
+        }
+        EXPECT_EQ(client.post("/v1/fixture/reportWrite", R"({"changes": 1})", {"Request-Id: " + id}).status, 204);
+        ASSERT_EQ(client.post("/v1/fixture/echo").status, 200);
+        EXPECT_TRUE(fs::exists(note));
+    }
+    EXPECT_TRUE(eventually([&] { return !fs::exists(note); })) << "without another request";
+    EXPECT_THAT(awaitEntries(id, 2), SizeIs(2));
+}
 
 std::string findingOf(const test::DaemonProcess& daemon, std::string_view name) {
     const Dictionary answer = dictionaryOf(daemon.connect().get("/v1/doctor"));

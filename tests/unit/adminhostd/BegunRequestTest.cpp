@@ -1,4 +1,7 @@
 #include "adminhostd/BegunRequest.h"
+#include "adminhostd/ChangeNotes.h"
+#include "adminhostd/ForwardingSink.h"
+#include "adminhostd/Frame.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <filesystem>
@@ -6,6 +9,7 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 
 namespace adminhost {
@@ -114,6 +118,33 @@ TEST_F(BegunRequests, NoteIsBounded) {
     }
     EXPECT_LE(fs::file_size(root.path(std::string(notes) + "/1-1")), BegunRequest::noteMaximum);
     EXPECT_EQ(BegunRequest::all().size(), 1U);
+}
+
+TEST_F(BegunRequests, NoteOfARequestThatIsRepeatedIsNotTakenForItsFormerOne) {
+    BegunRequest(about("1-1"), Redaction()).ended("its operation failed");
+    BegunRequest(about("1-2"), Redaction()).ended("its operation failed");
+    int pair[2] = {-1, -1};
+    ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, pair), 0);
+    const FileDescriptor ours(pair[0]);
+    const FileDescriptor fronts(pair[1]);
+    {
+        ForwardingSink sink(ours.get());
+        FrameReader reader;
+        ChangeNotes changes(ours.get(), reader, sink);
+        changes.reportUnfinished();
+        for (const char* request : {"1-1", "1-2"}) {
+            ASSERT_TRUE(writeFrame(fronts.get(), protocol::frameOf(protocol::Recorded{request})));
+        }
+        ASSERT_TRUE(writeFrame(fronts.get(), protocol::frameOf(protocol::Proceed{"1-1"})));
+        protocol::Perform order;
+        order.request = "1-1";
+        order.command = "again";
+        EXPECT_TRUE(changes.begin(LoadedPlugin(), order));
+        ASSERT_EQ(BegunRequest::all().size(), 1U);
+        EXPECT_EQ(BegunRequest::all().front().request, "1-1");
+        EXPECT_EQ(BegunRequest::all().front().command, "again");
+        changes.end(protocol::Outcome::answered);
+    }
 }
 
 }  // namespace
