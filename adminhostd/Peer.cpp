@@ -36,17 +36,29 @@ std::vector<gid_t> groupsOf(int socket) {
     }
 }
 
-/// A descriptor for the process at the other end; closed if the kernel has none to give (before 6.5).
-FileDescriptor processOf(int socket) {
-    int descriptor = -1;
-    socklen_t size = sizeof descriptor;
-    return FileDescriptor(::getsockopt(socket, SOL_SOCKET, SO_PEERPIDFD, &descriptor, &size) == 0 ? descriptor : -1);
-}
+/// The process at the other end, by which its end can be seen however often its id is used again.
+class PeerProcess {
+  public:
+    explicit PeerProcess(int socket) {
+        int descriptor = -1;
+        socklen_t size = sizeof descriptor;
+        if (::getsockopt(socket, SOL_SOCKET, SO_PEERPIDFD, &descriptor, &size) == 0) {
+            _descriptor = FileDescriptor(descriptor);
+        } else {
+            // A process that has been reaped has no descriptor. A kernel before 6.5 has none for any process.
+            _isLost = errno != ENOPROTOOPT;
+        }
+    }
 
-bool hasEnded(const FileDescriptor& process) {
-    pollfd entry{process.get(), POLLIN, 0};
-    return process.isOpen() && ::poll(&entry, 1, 0) != 0;
-}
+    [[nodiscard]] bool hasEnded() const {
+        pollfd entry{_descriptor.get(), POLLIN, 0};
+        return _isLost || (_descriptor.isOpen() && ::poll(&entry, 1, 0) != 0);
+    }
+
+  private:
+    FileDescriptor _descriptor;
+    bool _isLost = false;
+};
 
 }  // namespace
 
@@ -57,10 +69,10 @@ bool Peer::isInGroup(gid_t group) const noexcept {
 Peer peerOf(int socket, const ucred& credentials) {
     Peer peer{credentials.uid, credentials.gid, credentials.pid};
     peer.groups = groupsOf(socket);
-    const FileDescriptor process = processOf(socket);
+    const PeerProcess process(socket);
     const uid_t login = loginOf(peer.pid, peer.uid);
     std::string unit = unitOf(controlGroupOf(peer.pid));
-    if (!hasEnded(process)) {
+    if (!process.hasEnded()) {
         peer.login = login;
         peer.unit = std::move(unit);
     }

@@ -1,11 +1,15 @@
 #include "adminhostd/Login.h"
+#include "adminhostd/Peer.h"
+#include "platform/files/FileDescriptor.h"
 
+#include <cerrno>
 #include <csignal>
 #include <fstream>
 #include <string>
 
 #include <gtest/gtest.h>
 #include <sys/prctl.h>
+#include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -13,6 +17,7 @@ namespace adminhost {
 namespace {
 
 constexpr uid_t other = 65534;
+constexpr int peerProcess = 77;  ///< SO_PEERPIDFD, which the C library's headers may not have
 
 uid_t shownFor(pid_t pid) {
     uid_t login = noLogin;
@@ -78,6 +83,19 @@ TEST(Login, OfAProcessThatHasEndedIsNotKnown) {
 TEST(Login, OfAnotherAccountsProcessWithTheSameIdIsNotUsed) {
     const Session session;
     EXPECT_EQ(loginOf(session.pid(), other + 1), noLogin);
+}
+
+TEST(Login, OfAClientWhoseProcessTheKernelCannotShowIsNotUsed) {
+    const Session session;  // has the id now
+    const uid_t uid = ::geteuid() == 0 ? other : ::geteuid();
+    const FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));  // without another end
+    int process = -1;
+    socklen_t size = sizeof process;
+    ASSERT_NE(::getsockopt(socket.get(), SOL_SOCKET, peerProcess, &process, &size), 0);
+    const bool kernelKnows = errno != ENOPROTOOPT;  // from 6.5 on
+    const Peer peer = peerOf(socket.get(), {session.pid(), uid, uid});
+    EXPECT_EQ(peer.login, kernelKnows ? noLogin : loginOf(session.pid(), uid));
+    EXPECT_EQ(peer.uid, uid);
 }
 
 TEST(Login, TextNamesTheAccountAndItsNumber) {
