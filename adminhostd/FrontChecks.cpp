@@ -28,6 +28,9 @@ constexpr std::uint64_t scarceBytes = 100 * megabyte;
 constexpr std::uint64_t fullBytes = 10 * megabyte;
 constexpr std::uint64_t scarceFiles = 1000;
 
+/// Created by systemd-timesyncd when it has set the clock; may be looked for without any right.
+constexpr const char* synchronised = "/run/systemd/timesync/synchronized";
+
 /// The number alone: the front must not wait for a directory service to name an account.
 std::string ownerText(uid_t uid) {
     return uid == 0 ? "root" : fmt::format("uid {}", uid);
@@ -228,14 +231,19 @@ std::vector<Diagnosis> FrontChecks::run(const Workers& workers) const {
     checks.push_back(unitCheck());
     timex clock{};
     const int state = ::adjtimex(&clock);
-    checks.push_back(clockCheck(state, clock));
+    checks.push_back(clockCheck(state, clock, ::access(synchronised, F_OK) == 0));
     return checks;
 }
 
-Diagnosis clockCheck(int state, const timex& clock) {
+Diagnosis clockCheck(int state, const timex& clock, bool reported) {
+    if (state < 0 && reported) {
+        return {Health::ok, "clock", "The time service has synchronised the clock.", ""};
+    }
     if (state < 0) {
-        return {Health::warning, "clock", "The kernel does not show whether the clock is synchronised.",
-                "make sure that a time service is running on the host of this container"};
+        return {Health::warning, "clock",
+                "It is not known whether the clock is synchronised: the daemon may not ask the kernel, and "
+                "systemd-timesyncd has not reported it.",
+                "see whether timedatectl shows \"System clock synchronized: yes\"; in a container, do so on its host"};
     }
     if (state == TIME_ERROR || (static_cast<unsigned>(clock.status) & STA_UNSYNC) != 0) {
         return {

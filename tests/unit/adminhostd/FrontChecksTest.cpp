@@ -145,12 +145,20 @@ TEST_F(FrontChecksTest, PlugInThatWasRefusedIsAFailureWithItsReason) {
 
 TEST(ClockCheck, ClockThatTheKernelDoesNotCallSynchronisedIsAWarning) {
     timex clock{};
-    EXPECT_EQ(clockCheck(TIME_OK, clock).health, Health::ok);
-    EXPECT_EQ(clockCheck(TIME_ERROR, clock).health, Health::warning);
+    EXPECT_EQ(clockCheck(TIME_OK, clock, false).health, Health::ok);
+    EXPECT_EQ(clockCheck(TIME_ERROR, clock, true).health, Health::warning);
     clock.status = STA_UNSYNC;
-    EXPECT_EQ(clockCheck(TIME_OK, clock).health, Health::warning);
-    EXPECT_THAT(clockCheck(TIME_OK, clock).found, HasSubstr("not synchronised"));
-    EXPECT_EQ(clockCheck(-1, clock).health, Health::warning);
+    EXPECT_EQ(clockCheck(TIME_OK, clock, true).health, Health::warning);
+    EXPECT_THAT(clockCheck(TIME_OK, clock, true).found, HasSubstr("not synchronised"));
+}
+
+TEST(ClockCheck, ClockThatTheDaemonMayNotReadIsWhatTheTimeServiceReports) {
+    const timex clock{};
+    EXPECT_EQ(clockCheck(-1, clock, true).health, Health::ok);
+    const Diagnosis unknown = clockCheck(-1, clock, false);
+    EXPECT_EQ(unknown.health, Health::warning);
+    EXPECT_THAT(unknown.found, HasSubstr("It is not known whether the clock is synchronised"));
+    EXPECT_THAT(unknown.fix, HasSubstr("timedatectl"));
 }
 
 TEST(SpaceCheck, LittleSpaceIsAWarningAndNoneAFailure) {
