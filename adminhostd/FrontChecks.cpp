@@ -192,7 +192,7 @@ Diagnosis FrontChecks::configurationCheck() const {
         return {Health::ok, "configuration file", "The daemon was started without a configuration file.", ""};
     }
     const DiskPath file(_configuration.path);
-    if (const auto problem = _configurationIsNamed ? openToEverybody(file) : distrust(file)) {
+    if (const auto problem = _configurationIsNamed ? distrustNamed(file) : distrust(file)) {
         return failureOf("configuration file", *problem);
     }
     if (::access(file.c_str(), R_OK) != 0 && errno == EACCES) {

@@ -55,7 +55,7 @@ std::optional<Options> read(int count, const char* const* arguments, int& status
     }
     const DiskPath standard = diskPath(HostPath(defaultConfiguration));
     // It names the files that are loaded into the daemon, so the same rules apply to it as to plug-ins.
-    const auto problem = !configuration.empty() ? openToEverybody(DiskPath(configuration))
+    const auto problem = !configuration.empty() ? distrustNamed(DiskPath(configuration))
                          : exists(standard)     ? distrust(standard)
                                                 : std::nullopt;
     if (problem) {

@@ -15,9 +15,11 @@ namespace adminhost {
 /// own account) and must not be writable by group or others. nullopt if it is trusted.
 [[nodiscard]] std::optional<std::string> distrust(const DiskPath& path);
 
-/// Returns a warning, with a suggested fix, if everybody may write to the file; nullopt if not, or if the file does not
-/// exist.
-[[nodiscard]] std::optional<std::string> openToEverybody(const DiskPath& path);
+/// The same for a plug-in or configuration that the configuration or the command line names: the machine's daemon,
+/// which was started by root without another system root, trusts it by the same rule. Elsewhere it may belong to
+/// another account and be writable by a group, but not by everybody. nullopt if the file does not exist, which its
+/// reader reports.
+[[nodiscard]] std::optional<std::string> distrustNamed(const DiskPath& path);
 
 /// The plug-ins (*.so) of a directory in the order of their names; nullopt, with errno, if it cannot be read.
 [[nodiscard]] std::optional<std::vector<DiskPath>> pluginsIn(const DiskPath& directory);

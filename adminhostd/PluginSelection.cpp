@@ -19,7 +19,7 @@ PluginSelection selectPlugins(const Options& options) {
     PluginSelection selection;
     if (!options.plugins.empty()) {
         for (const DiskPath& file : options.plugins) {
-            if (const auto reason = openToEverybody(file)) {
+            if (const auto reason = distrustNamed(file)) {
                 selection.refused.push_back(refusedFile(file, *reason));
             } else {
                 selection.files.push_back(file);

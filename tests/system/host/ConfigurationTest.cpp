@@ -114,9 +114,10 @@ TEST_F(Start, ConfigurationThatOthersMayWriteIsRefused) {
 
     const std::string named = configuration("queue_limit = 3\n");
     ASSERT_EQ(::chmod(named.c_str(), 0646), 0);
-    const ProgramResult open = run({"--config", named, "--check"});
+    const ProgramResult open = run({"--root", directory / "etc", "--config", named, "--check"});
     EXPECT_EQ(open.status, 1);
     EXPECT_NE(open.output.find("may be written by everybody; chmod o-w it"), std::string::npos) << open.output;
+    expectRefusedForRoot(named, {"--config", named});
 }
 
 TEST_F(Start, CheckReportsASocketPathThatIsTooLong) {

@@ -12,6 +12,7 @@
 #include <vector>
 
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 namespace adminhost::test {
 
@@ -36,6 +37,17 @@ class Start : public ::testing::Test {
         const fs::path file = directory / "adminhostd.toml";
         std::ofstream(file) << text;
         return file;
+    }
+
+    /// The machine's daemon, which runs as root, gives what is in the file to root: a group that can write it is
+    /// refused.
+    void expectRefusedForRoot(const fs::path& file, std::vector<std::string> arguments) const {
+        fs::permissions(file, fs::perms(0664));
+        arguments.emplace_back("--check");
+        const std::string output = run(arguments).output;
+        EXPECT_EQ(output.find(file.string() + " may be written by group or others; chmod go-w it") != std::string::npos,
+                  ::geteuid() == 0)
+            << output;
     }
 
     fs::path directory;

@@ -242,9 +242,11 @@ TEST_F(Start, PluginThatEverybodyMayWriteIsRefused) {
     const fs::path file = directory / "open.so";
     fs::copy_file(pluginFile("fixture_good"), file);
     ASSERT_EQ(::chmod(file.c_str(), 0646), 0);
-    const ProgramResult result = run({"--check", "--plugin", file, "--socket", directory / "socket"});
+    const ProgramResult result =
+        run({"--root", directory, "--check", "--plugin", file, "--socket", directory / "socket"});
     EXPECT_EQ(result.status, 1);
     EXPECT_NE(result.output.find("may be written by everybody"), std::string::npos) << result.output;
+    expectRefusedForRoot(file, {"--plugin", file, "--socket", directory / "socket"});
 }
 
 TEST_F(Start, LockOfAStrangerOnTheSocketsDirectoryDoesNotMatter) {
