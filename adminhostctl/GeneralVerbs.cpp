@@ -117,7 +117,7 @@ constexpr std::array table = {
          0,
          2,
          &help,
-         {{"help settings set", "settings --help"}}},
+         {{"help settings set", "help plan"}}},
     Verb{"doctor", "", "Check the installation", 0, 0, &doctor, {{"doctor", "--format json doctor"}}},
     Verb{"logs",
          "[-f] [-n LINES] [--names] [NAME]",
