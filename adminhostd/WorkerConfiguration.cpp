@@ -1,11 +1,13 @@
 #include "adminhostd/WorkerConfiguration.h"
 
 #include "adminhostd/FrontRights.h"
+#include "adminhostd/Login.h"
 #include "adminhostd/ToolConfiguration.h"
 #include "platform/framework/BuildNote.h"
 #include "platform/text/EnvironmentLanguages.h"
 
 #include <cstdint>
+#include <stdexcept>
 #include <vector>
 
 #include <unistd.h>
@@ -21,6 +23,15 @@ std::vector<std::string> textsOf(const Array& list) {
         }
     }
     return texts;
+}
+
+uid_t accountOfFront(const Options& options) {
+    try {
+        const auto account = frontAccount(options);
+        return account ? account->user : ::geteuid();
+    } catch (const std::runtime_error&) {
+        return noLogin;  // nobody's: the front reports that the account does not exist, and does not start
+    }
 }
 
 }  // namespace
@@ -39,8 +50,7 @@ protocol::Configure workerConfiguration(const Options& options, const PluginSele
     configuration.directory = options.directory.nodes;
     configuration.directoryMilliseconds = static_cast<std::uint64_t>(options.directory.budget.count());
     // The worker must not learn this from the front, which could have it show what another account has written.
-    const auto account = frontAccount(options);
-    configuration.frontAccount = account ? account->user : ::geteuid();
+    configuration.frontAccount = accountOfFront(options);
     configuration.toolEnvironment = {{toolConfigurationVariable, toolConfiguration}};
     return configuration;
 }
