@@ -103,22 +103,31 @@ void apply(const ConfigurationEntry& entry, Options& options) {
 
 }  // namespace
 
-void readConfiguration(const std::string& file, Options& options) {
+std::string configurationTextIn(const std::string& file) {
     // The parser would read a directory, or a file whose reading fails, as an empty file.
-    const auto text = readFile(DiskPath(file), configurationMaximum);
+    auto text = readFile(DiskPath(file), configurationMaximum);
     if (!text) {
         throw std::runtime_error(fmt::format("{}: {}; the configuration must be a readable file", file,
                                              std::generic_category().message(static_cast<int>(text.error().code))));
     }
+    return *std::move(text);
+}
+
+void applyConfiguration(const std::string& file, const std::string& text, Options& options) {
     toml::table table;
     try {
-        table = toml::parse(*text, file);
+        table = toml::parse(text, file);
     } catch (const toml::parse_error& error) {
         throw std::runtime_error(fmt::format("{}: {}", placeText(file, error.source().begin), error.description()));
     }
     for (const auto& [key, node] : table) {
         apply({file, {}, key, node}, options);
     }
+    options.configurationText = text;
+}
+
+void readConfiguration(const std::string& file, Options& options) {
+    applyConfiguration(file, configurationTextIn(file), options);
 }
 
 }  // namespace adminhost

@@ -1,14 +1,12 @@
 #include "adminhostd/Daemon.h"
 
 #include "adminhostd/ClearedStack.h"
+#include "adminhostd/ConfigurationCopy.h"
 #include "adminhostd/Front.h"
 #include "adminhostd/FrontChecks.h"
 #include "adminhostd/FrontRights.h"
-#include "adminhostd/FrontStart.h"
 #include "adminhostd/MonitorLink.h"
 #include "adminhostd/Notify.h"
-#include "adminhostd/PluginSelection.h"
-#include "adminhostd/WorkerConfiguration.h"
 #include "platform/log/Log.h"
 
 #include <algorithm>
@@ -34,30 +32,21 @@ constexpr int logPause = 100;       ///< milliseconds until the next try while t
 constexpr auto logBound = 200ms;    ///< for the log's last events at the end
 constexpr auto sendingBound = 2s;   ///< at a stop, for clients to read their answers
 
-FileDescriptor stopSignals() {
-    sigset_t signals;
-    ::sigemptyset(&signals);
-    ::sigaddset(&signals, SIGTERM);
-    ::sigaddset(&signals, SIGINT);
-    ::sigaddset(&signals, SIGHUP);
-    ::sigprocmask(SIG_BLOCK, &signals, nullptr);
-    static_cast<void>(std::signal(SIGPIPE, SIG_IGN));
-    return FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
+OperationQueue::Settings settingsOf(const Options& options) {
+    const std::vector<DirectoryNodeOptions>& nodes = options.directory.nodes;
+    return {options.queueLimit, options.deadline, options.queueLimitPerAccount,
+            std::any_of(nodes.begin(), nodes.end(), [](const DirectoryNodeOptions& node) { return !node.local; })};
 }
 
 class Daemon {
   public:
-    Daemon(const Options& options, const PluginSelection& plugins, const std::string& toolDirectory, FrontChecks checks,
-           Permissions permissions, FileDescriptor link, FileDescriptor listener)
+    Daemon(const Options& options, FrontChecks checks, Permissions permissions, FileDescriptor signals,
+           FileDescriptor link, FileDescriptor listener)
         : _options(options),
-          _plugins(plugins),
-          _toolDirectory(toolDirectory),
           _monitor(std::move(link)),
           _listener(std::move(listener)),
-          _signals(stopSignals()),
-          _front({workerConfiguration(options, plugins, toolDirectory), _monitor, options.queueLimit, options.deadline,
-                  options.queueLimitPerAccount},
-                 plugins.refused, std::move(checks), std::move(permissions)) {}
+          _signals(std::move(signals)),
+          _front(settingsOf(options), _monitor, std::move(checks), std::move(permissions)) {}
 
     void run() {
         for (;;) {
@@ -77,8 +66,8 @@ class Daemon {
             if (_signalled || _monitor.closed()) {
                 stop();
             }
-            if (_reload && !_stopping) {
-                reload();
+            if (const auto configuration = _monitor.takeConfiguration(); configuration && !_stopping) {
+                reload(*configuration);
             }
             if (_server) {
                 _server->run();
@@ -115,44 +104,30 @@ class Daemon {
     void readSignals() {
         signalfd_siginfo signal{};
         while (::read(_signals.get(), &signal, sizeof signal) > 0) {
-            if (signal.ssi_signo == SIGHUP) {
-                _reload = true;
-            } else {
-                _signalled = true;
-            }
+            _signalled = _signalled || signal.ssi_signo != SIGHUP;
         }
     }
 
-    /// Reads the configuration again. Requests that wait or run are not touched.
-    void reload() {
-        _reload = false;
+    /// Applies a configuration that the monitor has read again. Requests that wait or run are not touched.
+    void reload(const MonitorLink::Configuration& configuration) {
         Options read;
         try {
-            read = readOptionsAgain(_options.arguments);
+            read = readOptionsWith(_options.arguments, configurationIn(configuration.copy.get()));
         } catch (const std::runtime_error& error) {
-            logEvent(fmt::format("adminhostd: the configuration was not read again, the old one stays in effect: {}",
-                                 error.what()));
+            logEvent(fmt::format("adminhostd: the front does not use the new configuration: {}", error.what()));
             return;
         }
-        for (const std::string& key : keepFixedSettings(read, _options)) {
-            logEvent(fmt::format("adminhostd: {} cannot be changed while the daemon is running; restart it", key));
-        }
-        if (read.plugins != _options.plugins || read.pluginDirectory != _options.pluginDirectory) {
-            _plugins = selectPlugins(read);
-        }
-        std::optional<Permissions> permissions;
-        if (read.permissions != _options.permissions) {
-            permissions.emplace(read.permissions, _front.permissions().own(), configurationFile(read));
-        }
+        static_cast<void>(keepFixedSettings(read, _options));  // the monitor has logged them
         _options = std::move(read);
-        _front.reconfigure(FrontChecks(_options), std::move(permissions), _plugins.refused);
+        // Names of accounts are looked up again even if the tables are the same.
+        _front.reconfigure(_options,
+                           Permissions(_options.permissions, _front.permissions().own(), configurationFile(_options)));
         _front.setBodyBounds(_options.bounds.body);
         if (_server) {
             _server->setBodyMaximum(_options.bounds.bodyBytes);
         }
         logEvent("adminhostd: the configuration has been read again");
-        _front.queue().reconfigure(workerConfiguration(_options, _plugins, _toolDirectory), _options.queueLimit,
-                                   _options.deadline);
+        _front.queue().reconfigure(settingsOf(_options), configuration.isNewForWorkers);
     }
 
     void stop() {
@@ -179,15 +154,12 @@ class Daemon {
     }
 
     Options _options;
-    PluginSelection _plugins;
-    std::string _toolDirectory;
     MonitorLink _monitor;
     FileDescriptor _listener;  ///< until there is a server
     FileDescriptor _signals;
     Front _front;
     std::optional<HttpServer> _server;
     bool _signalled = false;
-    bool _reload = false;
     bool _stopping = false;
     std::optional<Clock::time_point> _stopBy;  ///< the end of the wait for clients, once no operation runs
     std::vector<pollfd> _entries;
@@ -195,15 +167,24 @@ class Daemon {
 
 }  // namespace
 
-int runDaemon(const Options& options, FileDescriptor link, FileDescriptor listener, const std::string& toolDirectory) {
+FileDescriptor stopSignals() {
+    sigset_t signals;
+    ::sigemptyset(&signals);
+    ::sigaddset(&signals, SIGTERM);
+    ::sigaddset(&signals, SIGINT);
+    ::sigaddset(&signals, SIGHUP);
+    ::sigprocmask(SIG_BLOCK, &signals, nullptr);
+    static_cast<void>(std::signal(SIGPIPE, SIG_IGN));
+    return FileDescriptor(::signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
+}
+
+int runDaemon(const Options& options, FileDescriptor signals, FileDescriptor link, FileDescriptor listener) {
     setLogSink(options.logToStandardError ? standardErrorSink() : syslogSink());
     const auto account = frontAccount(options);
-    const PluginSelection plugins = selectPlugins(options);
     FrontChecks checks(options);
     Permissions permissions(options.permissions, ::geteuid(), configurationFile(options));
     dropFrontRights(account, options);
-    Daemon(options, plugins, toolDirectory, std::move(checks), std::move(permissions), std::move(link),
-           std::move(listener))
+    Daemon(options, std::move(checks), std::move(permissions), std::move(signals), std::move(link), std::move(listener))
         .run();
     for (const auto end = Clock::now() + logBound; !flushLog() && Clock::now() < end;) {
         std::this_thread::sleep_for(10ms);

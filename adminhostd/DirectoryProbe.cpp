@@ -1,6 +1,7 @@
 #include "adminhostd/DirectoryProbe.h"
 
-#include <algorithm>
+#include "adminhostd/Protocol.h"
+
 #include <utility>
 
 namespace adminhost {
@@ -11,10 +12,8 @@ constexpr auto bound = std::chrono::seconds(8);
 
 }  // namespace
 
-void DirectoryProbe::start(const protocol::Configure& configuration, MonitorLink& monitor) {
-    const bool remote = std::any_of(configuration.directory.begin(), configuration.directory.end(),
-                                    [](const DirectoryNodeOptions& node) { return !node.local; });
-    if (_process || !remote) {
+void DirectoryProbe::start(MonitorLink& monitor) {
+    if (_process) {
         return;
     }
     _process = WorkerProcess::start(monitor, WorkerProcess::Purpose::tryDirectory);

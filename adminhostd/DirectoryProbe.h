@@ -5,7 +5,6 @@
 // The nodes are tried by a process of its own, a worker that serves nothing: a server that does not respond delays
 // neither the start nor a request, and whatever a library does while it connects, this process can be killed.
 
-#include "adminhostd/Protocol.h"
 #include "adminhostd/WorkerProcess.h"
 
 #include <chrono>
@@ -20,8 +19,8 @@ namespace adminhost {
 
 class DirectoryProbe {
   public:
-    /// Starts to try the nodes of the configuration. Does nothing if they are all local, or are being tried already.
-    void start(const protocol::Configure& configuration, MonitorLink& monitor);
+    /// Starts to try the nodes of the configuration. Does nothing if they are being tried already.
+    void start(MonitorLink& monitor);
 
     void addTo(std::vector<pollfd>& entries) const;
     /// When run() has to be called at the latest.

@@ -71,12 +71,11 @@ const auto* elementNamed(const auto& named, std::string_view name) {
 
 }  // namespace
 
-Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks,
+Front::Front(const OperationQueue::Settings& settings, MonitorLink& monitor, FrontChecks checks,
              Permissions permissions)
     : _checks(std::move(checks)),
       _permissions(std::move(permissions)),
-      _refused(std::move(refused)),
-      _queue(std::move(settings),
+      _queue(settings, monitor,
              {[this](protocol::Hello hello) { welcome(std::move(hello)); },
               [](const std::string& event) { logEvent(event); }, [this](const SecretPart& part) { _log.hide(part); },
               [this](const Operation& operation, const protocol::Begun& about) {
@@ -87,29 +86,23 @@ Front::Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlu
               [this](const Operation& operation, OperationQueue::Ending ending) {
                   finished(operation, std::move(ending));
               }}) {
+    logProblems();
+}
+
+void Front::reconfigure(const Options& options, Permissions permissions) {
+    _checks.reconfigure(options);
+    _permissions = std::move(permissions);
+    logProblems();
+}
+
+void Front::logProblems() const {
     for (const std::string& problem : _permissions.problems()) {
         logEvent("adminhostd: " + problem);
     }
 }
 
-void Front::reconfigure(FrontChecks checks, std::optional<Permissions> permissions,
-                        std::vector<protocol::RefusedPlugin> refused) {
-    _checks = std::move(checks);
-    _refused = std::move(refused);
-    if (permissions) {
-        _permissions = *std::move(permissions);
-        for (const std::string& problem : _permissions.problems()) {
-            logEvent("adminhostd: " + problem);
-        }
-    }
-}
-
 std::vector<protocol::RefusedPlugin> Front::refusedPlugins() const {
-    std::vector<protocol::RefusedPlugin> refused = _refused;
-    if (_hello) {
-        refused.insert(refused.end(), _hello->refused.begin(), _hello->refused.end());
-    }
-    return refused;
+    return _hello ? _hello->refused : std::vector<protocol::RefusedPlugin>();
 }
 
 void Front::welcome(protocol::Hello hello) {

@@ -26,10 +26,8 @@ namespace adminhost {
 
 class Front {
   public:
-    /// `settings` configures the workers; `refused` are the plug-ins that are not even offered to them. Creates the
-    /// queue, which starts a worker for the operations.
-    Front(OperationQueue::Settings settings, std::vector<protocol::RefusedPlugin> refused, FrontChecks checks,
-          Permissions permissions);
+    /// Creates the queue, which asks the monitor for a worker for the operations.
+    Front(const OperationQueue::Settings& settings, MonitorLink& monitor, FrontChecks checks, Permissions permissions);
     Front(const Front&) = delete;
     Front& operator=(const Front&) = delete;
 
@@ -39,10 +37,8 @@ class Front {
 
     /// Changes what a body may hold.
     void setBodyBounds(const BodyBounds& bounds) noexcept { _bodyBounds = bounds; }
-    /// Applies a configuration that has been read again, from the next request on. Without permissions, those that are
-    /// in effect stay.
-    void reconfigure(FrontChecks checks, std::optional<Permissions> permissions,
-                     std::vector<protocol::RefusedPlugin> refused);
+    /// Applies a configuration that has been read again, from the next request on.
+    void reconfigure(const Options& options, Permissions permissions);
     [[nodiscard]] const Permissions& permissions() const noexcept { return _permissions; }
 
     /// Handles a request whose head has arrived. Returns the answer if it needs no body (not permitted, not found,
@@ -52,6 +48,7 @@ class Front {
 
   private:
     void welcome(protocol::Hello hello);
+    void logProblems() const;
     [[nodiscard]] const protocol::OfferedPlugin* pluginNamed(std::string_view name) const;
     /// The command that the target names; null if the worker offers none of that name.
     [[nodiscard]] const Command* commandOf(const Target& target) const;
@@ -99,8 +96,7 @@ class Front {
     EventClients _events;
     Metrics _metrics;
     OwnMemory _memory;
-    std::vector<protocol::RefusedPlugin> _refused;  ///< before they were offered to a worker
-    std::optional<protocol::Hello> _hello;          ///< of the latest worker
+    std::optional<protocol::Hello> _hello;  ///< of the latest worker
     OperationQueue _queue;
 };
 

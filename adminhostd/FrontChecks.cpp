@@ -138,23 +138,21 @@ FrontChecks::Seen FrontChecks::Seen::now(const std::string& path) {
     Seen seen;
     struct stat status {};
     if (!path.empty() && ::lstat(path.c_str(), &status) == 0) {
-        seen = {path, status.st_dev, status.st_ino, status.st_mtim};
+        seen = {path, status.st_dev, status.st_ino};
     }
     return seen;
 }
 
-bool FrontChecks::Seen::operator==(const Seen& other) const noexcept {
-    return path == other.path && device == other.device && inode == other.inode &&
-           modified.tv_sec == other.modified.tv_sec && modified.tv_nsec == other.modified.tv_nsec;
+FrontChecks::FrontChecks(const Options& options) : _root(options.root), _socket(Seen::now(socketPath(options))) {
+    reconfigure(options);
 }
 
-FrontChecks::FrontChecks(const Options& options)
-    : _root(options.root),
-      _socket(Seen::now(socketPath(options))),
-      _configuration(Seen::now(options.configuration)),
-      _configurationIsNamed(options.configurationIsNamed),
-      _directories{{"run directory", privateParent(options)},
-                   {"history directory", diskPath(HostPath("/var/lib/adminhostd")).text()}} {
+void FrontChecks::reconfigure(const Options& options) {
+    _configuration = options.configuration;
+    _configurationText = options.configurationText;
+    _configurationIsNamed = options.configurationIsNamed;
+    _directories = {{"run directory", privateParent(options)},
+                    {"history directory", diskPath(HostPath("/var/lib/adminhostd")).text()}};
     if (options.plugins.empty()) {
         _directories.emplace_back("plug-in directory", diskPath(options.pluginDirectory).text());
     }
@@ -188,33 +186,33 @@ Diagnosis FrontChecks::socketCheck() const {
 }
 
 Diagnosis FrontChecks::configurationCheck() const {
-    if (_configuration.path.empty()) {
-        return {Health::ok, "configuration file", "The daemon was started without a configuration file.", ""};
+    if (_configuration.empty()) {
+        return {Health::ok, "configuration file", "The daemon has no configuration file.", ""};
     }
-    const DiskPath file(_configuration.path);
+    const DiskPath file(_configuration);
     if (const auto problem = _configurationIsNamed ? distrustNamed(file) : distrust(file)) {
         return failureOf("configuration file", *problem);
     }
     if (::access(file.c_str(), R_OK) != 0 && errno == EACCES) {
-        return {Health::warning, "configuration file",
-                fmt::format("{} is in effect, but cannot be read by the front's account (uid {}): a change would take "
-                            "effect after a restart only.",
-                            file.text(), ::geteuid()),
-                fmt::format("chmod a+r {} and its directory; passwords are in files of their own", file.text())};
+        return {Health::ok, "configuration file",
+                fmt::format("{} is in effect as it was when the daemon read it. The front's account (uid {}) cannot "
+                            "read it, so that this check does not notice changes.",
+                            _configuration, ::geteuid()),
+                ""};
     }
     try {
         Options read;
-        readConfiguration(_configuration.path, read);
+        readConfiguration(_configuration, read);
+        if (read.configurationText != _configurationText) {
+            return {Health::warning, "configuration file",
+                    _configuration + " has changed since the daemon read it, and is not in effect.",
+                    "reload the daemon (systemctl reload adminhostd)"};
+        }
     } catch (const std::exception& error) {
         return {Health::failure, "configuration file",
                 fmt::format("{}. The daemon would not start again with it.", error.what()), "correct the file"};
     }
-    if (!(Seen::now(_configuration.path) == _configuration)) {
-        return {Health::warning, "configuration file",
-                _configuration.path + " has changed since the daemon was started, and is not in effect.",
-                "restart the daemon"};
-    }
-    return {Health::ok, "configuration file", _configuration.path + " is in effect.", ""};
+    return {Health::ok, "configuration file", _configuration + " is in effect.", ""};
 }
 
 std::vector<Diagnosis> FrontChecks::run(const Workers& workers) const {

@@ -33,8 +33,10 @@ class FrontChecks {
         std::vector<protocol::RefusedPlugin> refused;
     };
 
-    /// Remembers socket and configuration as they are now. Created after the socket.
+    /// Remembers the socket as it is now. Created after the socket, and before the front changes its account.
     explicit FrontChecks(const Options& options);
+    /// Applies options that have been read again.
+    void reconfigure(const Options& options);
 
     [[nodiscard]] std::vector<Diagnosis> run(const Workers& workers) const;
 
@@ -43,10 +45,8 @@ class FrontChecks {
         std::string path;  ///< empty: there is none
         dev_t device = 0;
         ino_t inode = 0;
-        timespec modified = {};
 
         [[nodiscard]] static Seen now(const std::string& path);
-        [[nodiscard]] bool operator==(const Seen& other) const noexcept;
     };
 
     [[nodiscard]] Diagnosis daemonCheck() const;
@@ -54,10 +54,11 @@ class FrontChecks {
     [[nodiscard]] Diagnosis configurationCheck() const;
 
     std::string _root;
-    uid_t _account = ::geteuid();  ///< of the daemon, before the front changes to another one
+    uid_t _account = ::geteuid();  ///< of the daemon
     Seen _socket;
-    Seen _configuration;
-    bool _configurationIsNamed;  ///< on the command line: other rules apply to who may write to it
+    std::string _configuration;          ///< path; empty: none
+    std::string _configurationText;      ///< that is in effect
+    bool _configurationIsNamed = false;  ///< on the command line: other rules apply to who may write to it
     std::vector<std::pair<std::string, std::string>> _directories;  ///< what for, and the path on disk
     std::chrono::system_clock::time_point _started = std::chrono::system_clock::now();
 };

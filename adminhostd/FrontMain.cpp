@@ -1,6 +1,6 @@
-// adminhostd-front: started by the monitor, with the conversation with it as descriptor 3 and the listening socket
-// as 4.
+// adminhostd-front: started by the monitor, with the descriptors of FrontStart.h.
 
+#include "adminhostd/ConfigurationCopy.h"
 #include "adminhostd/Daemon.h"
 #include "adminhostd/FrontStart.h"
 #include "adminhostd/Options.h"
@@ -8,10 +8,11 @@
 #include "platform/files/FileDescriptor.h"
 
 #include <cerrno>
-#include <cstdlib>
 #include <exception>
 #include <iostream>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include <sys/stat.h>
 
@@ -25,25 +26,27 @@ bool isSocket(int descriptor) {
 }  // namespace
 
 int main(int count, char** arguments) {
-    const char* const tools = std::getenv(adminhost::toolDirectoryVariable);
-    if (tools == nullptr || !isSocket(adminhost::frontLink) || !isSocket(adminhost::frontListener)) {
+    if (!isSocket(adminhost::frontLink) || !isSocket(adminhost::frontListener)) {
         std::cerr << "adminhostd-front is started by adminhostd\n";
         return 2;
     }
     try {
         adminhost::startProcess();
+        // First of all: a signal for the whole process group must not end a front that is starting.
+        adminhost::FileDescriptor signals = adminhost::stopSignals();
         // Log lines have the daemon's name.
         static char name[] = "adminhostd";
         ::program_invocation_short_name = name;
-        const std::string toolDirectory = tools;
-        ::unsetenv(adminhost::toolDirectoryVariable);
-        int status = 0;
-        const auto options = adminhost::readOptions(count, arguments, status);
-        if (!options) {
-            return status;
-        }
-        return adminhost::runDaemon(*options, adminhost::FileDescriptor(adminhost::frontLink),
-                                    adminhost::FileDescriptor(adminhost::frontListener), toolDirectory);
+        const std::vector<std::string> given(arguments, arguments + count);
+        const auto optionsIn = [&](int descriptor) {
+            const adminhost::FileDescriptor copy(descriptor);
+            return adminhost::readOptionsWith(given, adminhost::configurationIn(copy.get()));
+        };
+        const adminhost::Options first = optionsIn(adminhost::frontFirstConfiguration);
+        adminhost::Options options = optionsIn(adminhost::frontConfiguration);
+        static_cast<void>(adminhost::keepFixedSettings(options, first));  // the monitor has logged them
+        return adminhost::runDaemon(options, std::move(signals), adminhost::FileDescriptor(adminhost::frontLink),
+                                    adminhost::FileDescriptor(adminhost::frontListener));
     } catch (const std::exception& error) {
         std::cerr << "adminhostd: " << error.what() << '\n';
         return 1;

@@ -1,13 +1,14 @@
 #pragma once
 
-// How the monitor hands the front what it needs, besides the command line.
+// How the monitor hands the front what it needs, besides the command line. All are descriptors.
 
 namespace adminhost {
 
-constexpr int frontLink = 3;      ///< the front's descriptor of its conversation with the monitor
-constexpr int frontListener = 4;  ///< its descriptor of the listening socket
+constexpr int frontLink = 3;      ///< the front's conversation with the monitor
+constexpr int frontListener = 4;  ///< the listening socket
 
-/// The variable that names the private directory of the tools' configuration files. Workers do not get it.
-constexpr const char* toolDirectoryVariable = "ADMINHOST_TOOL_DIRECTORY";
+// Copies of the configuration (ConfigurationCopy.h).
+constexpr int frontFirstConfiguration = 5;  ///< with which the daemon was started
+constexpr int frontConfiguration = 6;       ///< that was read last
 
 }  // namespace adminhost

@@ -33,7 +33,7 @@ constexpr auto members<Configure> = std::tuple(
     member("configure.build", &Configure::build), member("configure.root", &Configure::root),
     member("configure.accountUuids", &Configure::accountUuids),
     member("configure.serviceManager", &Configure::serviceManager), member("configure.plugins", &Configure::plugins),
-    member("configure.languages", &Configure::languages),
+    member("configure.refused", &Configure::refused), member("configure.languages", &Configure::languages),
     member("configure.toolEnvironment", &Configure::toolEnvironment),
     member("configure.directory", &Configure::directory),
     member("configure.directoryMilliseconds", &Configure::directoryMilliseconds),

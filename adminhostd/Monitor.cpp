@@ -1,5 +1,6 @@
 #include "adminhostd/Monitor.h"
 
+#include "adminhostd/ConfigurationCopy.h"
 #include "adminhostd/Frame.h"
 #include "adminhostd/FrontStart.h"
 #include "adminhostd/ListeningSocket.h"
@@ -106,6 +107,8 @@ class Monitor {
     ListeningSocket& _socket;
     const std::string& _toolDirectory;
     protocol::Configure _configuration = workerConfiguration(_options, selectPlugins(_options), _toolDirectory);
+    const FileDescriptor _firstCopy = sealedCopyOf({_options.configuration, _options.configurationText});
+    FileDescriptor _copy = sealedCopyOf({_options.configuration, _options.configurationText});  ///< read last
     FileDescriptor _signals = monitorSignals();
     pid_t _front = 0;  ///< 0 while none is running
     FileDescriptor _link;
@@ -167,8 +170,8 @@ void Monitor::startFront() {
     plan.arguments = _arguments;
     plan.arguments.front() = "adminhostd-front";
     plan.environment = processEnvironment();
-    plan.environment.push_back(std::string(toolDirectoryVariable) + "=" + _toolDirectory);
-    plan.descriptors = {-1, STDOUT_FILENO, STDERR_FILENO, fronts.get(), _socket.descriptor()};
+    plan.descriptors = {-1,         STDOUT_FILENO, STDERR_FILENO, fronts.get(), _socket.descriptor(), _firstCopy.get(),
+                        _copy.get()};
     auto started = startChild(plan);
     if (!started) {
         throw std::runtime_error(fmt::format("{} cannot be started: {}; install the daemon again", plan.program,
@@ -256,9 +259,6 @@ void Monitor::signalled() {
     while (::read(_signals.get(), &signal, sizeof signal) > 0) {
         if (signal.ssi_signo == SIGHUP) {
             reload();
-            if (_front != 0) {  // the next one reads the configuration anyway
-                ::kill(_front, SIGHUP);
-            }
         } else if (signal.ssi_signo != SIGCHLD && !_stopping) {
             stop();
         }
@@ -266,17 +266,28 @@ void Monitor::signalled() {
     reap();
 }
 
-/// For the workers that are started from now on. The front reports what is wrong with the file, and what cannot be
-/// changed.
+/// Reads the configuration again, for the workers that are started from now on, for this front and the next ones.
 void Monitor::reload() {
+    Options read;
+    FileDescriptor copy;
     try {
-        Options read = readOptionsAgain(_options.arguments);
-        static_cast<void>(keepFixedSettings(read, _options));
-        _configuration = workerConfiguration(read, selectPlugins(read), _toolDirectory);
-        _options = std::move(read);
-    } catch (const std::exception&) {
-        // The old one stays in effect.
+        read = readOptionsAgain(_options.arguments);
+        copy = sealedCopyOf({read.configuration, read.configurationText});
+    } catch (const std::exception& error) {
+        logEvent(fmt::format("adminhostd: the configuration was not read again, the old one stays in effect: {}",
+                             error.what()));
+        return;
     }
+    for (const std::string& key : keepFixedSettings(read, _options)) {
+        logEvent(fmt::format("adminhostd: {} cannot be changed while the daemon is running; restart it", key));
+    }
+    protocol::Configure configuration = workerConfiguration(read, selectPlugins(read), _toolDirectory);
+    const bool isNewForWorkers = configuration != _configuration;
+    _configuration = std::move(configuration);
+    _options = std::move(read);
+    _copy = std::move(copy);
+    const int descriptor = _copy.get();
+    sendToFront({MonitorMessage::Kind::configuration, 0, 0, isNewForWorkers ? 1 : 0}, {&descriptor, 1});
 }
 
 void Monitor::reap() {

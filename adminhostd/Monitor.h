@@ -14,9 +14,9 @@
 
 namespace adminhost {
 
-/// Serves until SIGTERM or SIGINT; SIGHUP makes the front read its configuration again. The front gets the arguments,
-/// the first of which is the program's name. Returns the exit status: 0, or that of a front that could not start.
-/// Throws std::exception if the daemon cannot be started.
+/// Serves until SIGTERM or SIGINT; SIGHUP makes it read the configuration again and hand it to the front. The front
+/// gets the arguments, the first of which is the program's name. Returns the exit status: 0, or that of a front that
+/// could not start. Throws std::exception if the daemon cannot be started.
 [[nodiscard]] int runMonitor(const Options& options, std::vector<std::string> arguments);
 
 }  // namespace adminhost

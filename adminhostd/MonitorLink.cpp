@@ -33,6 +33,12 @@ void MonitorLink::run() {
             _socket.close();
             return;
         }
+        if (received.message.kind == MonitorMessage::Kind::configuration) {
+            const bool isNewForWorkers =
+                received.message.status == 1 || (_configuration && _configuration->isNewForWorkers);
+            _configuration = Configuration{std::move(received.descriptors.front()), isNewForWorkers};
+            continue;
+        }
         const auto found = _receivers.find(received.message.worker);
         if (found != _receivers.end()) {
             found->second(received);

@@ -8,7 +8,9 @@
 #include <cstdint>
 #include <functional>
 #include <map>
+#include <optional>
 #include <span>
+#include <utility>
 #include <vector>
 
 #include <poll.h>
@@ -31,6 +33,15 @@ class MonitorLink {
     void kill(std::uint32_t worker) noexcept;
     void forget(std::uint32_t worker) noexcept { _receivers.erase(worker); }
 
+    struct Configuration {
+        FileDescriptor copy;   ///< of what the monitor has read (ConfigurationCopy.h)
+        bool isNewForWorkers;  ///< those that have been started before have an old one
+    };
+    /// The latest configuration that has arrived since the last call; nullopt if there is none.
+    [[nodiscard]] std::optional<Configuration> takeConfiguration() {
+        return std::exchange(_configuration, std::nullopt);
+    }
+
     /// Returns true if the monitor has ended. No worker can be started any more.
     [[nodiscard]] bool closed() const noexcept { return !_socket.isOpen(); }
 
@@ -42,6 +53,7 @@ class MonitorLink {
     FileDescriptor _socket;
     std::map<std::uint32_t, Receiver> _receivers;
     std::uint32_t _last = 0;
+    std::optional<Configuration> _configuration;
 };
 
 }  // namespace adminhost

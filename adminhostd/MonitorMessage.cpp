@@ -104,8 +104,7 @@ ReceivedMessage receiveMonitorMessage(int socket) {
     const bool whole = takeDescriptors(header, received.descriptors);
     std::memcpy(&received.message, bytes, sizeof received.message);
     const auto kind = received.message.kind;
-    const bool known = kind == MonitorMessage::Kind::start || kind == MonitorMessage::Kind::kill ||
-                       kind == MonitorMessage::Kind::ended;
+    const bool known = kind >= MonitorMessage::Kind::start && kind <= MonitorMessage::Kind::configuration;
     received.kind = whole && known && size == static_cast<ssize_t>(sizeof(MonitorMessage)) ? Kind::message  //
                                                                                            : Kind::malformed;
     return received;

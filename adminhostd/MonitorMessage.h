@@ -1,6 +1,6 @@
 #pragma once
 
-// The messages between monitor and front: three of one fixed size over a socket pair that keeps their boundaries.
+// The messages between monitor and front: four of one fixed size over a socket pair that keeps their boundaries.
 //
 //     start   front -> monitor: start a worker under this number; if `status` is 1, one that only tries the nodes of
 //             the directory. What it loads, and where, is the monitor's to say: it sends the worker its configuration.
@@ -9,6 +9,8 @@
 //             `process`, a worker of an earlier front, after which another "start" follows; any other number of the
 //             system is why it cannot be started.
 //     kill    front -> monitor: kill the worker and the tools that it runs.
+//     configuration  monitor -> front: the configuration has been read again, and a descriptor of its copy comes along
+//             (ConfigurationCopy.h). If `status` is 1, workers that have been started before have an old one.
 //     ended   monitor -> front: the worker has ended with this status of wait(), and its tools have been killed.
 //
 // The monitor runs as the superuser and reads nothing else from the front, whose memory holds the bytes of strangers.
@@ -23,7 +25,7 @@
 namespace adminhost {
 
 struct MonitorMessage {
-    enum class Kind : std::uint32_t { start = 1, kill, ended };
+    enum class Kind : std::uint32_t { start = 1, kill, ended, configuration };
 
     Kind kind = Kind::start;
     std::uint32_t worker = 0;  ///< the number by which the front calls it

@@ -24,8 +24,8 @@ constexpr auto longestPause = 30s;
 
 }  // namespace
 
-OperationQueue::OperationQueue(Settings settings, Events events)
-    : _settings(std::move(settings)), _events(std::move(events)) {
+OperationQueue::OperationQueue(const Settings& settings, MonitorLink& monitor, Events events)
+    : _settings(settings), _monitor(monitor), _events(std::move(events)) {
     start();
 }
 
@@ -52,7 +52,7 @@ void OperationQueue::add(Operation operation) {
 }
 
 void OperationQueue::addTo(std::vector<pollfd>& entries) const {
-    _settings.monitor.addTo(entries);
+    _monitor.addTo(entries);
     if (_worker) {
         _worker->addTo(entries);
     }
@@ -73,7 +73,7 @@ std::optional<OperationQueue::Clock::time_point> OperationQueue::due() const {
 void OperationQueue::start() {
     ++_starts;
     _replaceWorker = false;
-    _worker = WorkerProcess::start(_settings.monitor);
+    _worker = WorkerProcess::start(_monitor);
     if (!_worker) {
         startFailed(fmt::format("cannot be started: {}", std::strerror(errno)));
         return;
@@ -118,7 +118,7 @@ void OperationQueue::failWaiting(Unserved::Reason reason, const std::string& mes
 }
 
 void OperationQueue::run(std::span<const pollfd> polled) {
-    _settings.monitor.run();
+    _monitor.run();
     noteStart();
     if (_worker) {
         converse(polled);
@@ -259,7 +259,9 @@ bool OperationQueue::take(protocol::Hello hello) {
     _settled = true;
     _due.reset();
     _pause = 0ms;
-    _directoryProbe.start(_settings.configuration, _settings.monitor);
+    if (_settings.triesServers) {
+        _directoryProbe.start(_monitor);
+    }
     next();
     return true;
 }
@@ -334,14 +336,16 @@ void OperationQueue::timeUp() {
     }
 }
 
-void OperationQueue::reconfigure(protocol::Configure configuration, std::size_t limit,
-                                 std::chrono::milliseconds deadline) {
-    _settings.limit = limit;
-    _settings.deadline = deadline;
-    if (configuration != _settings.configuration) {
-        _settings.configuration = std::move(configuration);
+void OperationQueue::reconfigure(const Settings& settings, bool replaceWorker) {
+    _settings = settings;
+    if (replaceWorker) {
+        _directoryProbe = {};  // it tries servers of the old configuration
         _replaceWorker = true;
         next();
+    }
+    if (_state == State::paused && !_stopping) {
+        _pause = 0ms;
+        start();
     }
 }
 

@@ -43,11 +43,10 @@ struct Unserved {
 class OperationQueue {
   public:
     struct Settings {
-        protocol::Configure configuration;  ///< of every worker, which gets it from the monitor
-        MonitorLink& monitor;               ///< starts the workers
         std::size_t limit = 64;
         std::chrono::milliseconds deadline{300'000};
         std::size_t limitPerAccount = 16;
+        bool triesServers = false;  ///< of the directory, after each start of a worker
     };
     using Ending = std::variant<protocol::Answer, Unserved>;
     struct Events {
@@ -59,7 +58,8 @@ class OperationQueue {
         std::function<void(const Operation&, Ending)> finished;               ///< also its sharers are finished
     };
 
-    OperationQueue(Settings settings, Events events);
+    /// `monitor` starts the workers and configures them. It must outlive the queue.
+    OperationQueue(const Settings& settings, MonitorLink& monitor, Events events);
 
     /// How many urgent operations may wait beyond the limit: a stop must not be refused because of many reads.
     static constexpr std::size_t urgentReserve = 4;
@@ -99,9 +99,9 @@ class OperationQueue {
     void stop(std::chrono::milliseconds bound);
     [[nodiscard]] bool stopped() const noexcept { return _stopping && !_running; }
 
-    /// Changes the settings. If the worker's differ, the next worker gets them: it takes the place of this one once no
-    /// operation is running. Requests wait meanwhile.
-    void reconfigure(protocol::Configure configuration, std::size_t limit, std::chrono::milliseconds deadline);
+    /// Changes the settings. If the worker's configuration is an old one, another worker takes its place once no
+    /// operation is running. Requests wait meanwhile. A worker whose start is paused is started at once.
+    void reconfigure(const Settings& settings, bool replaceWorker);
 
     void addTo(std::vector<pollfd>& entries) const;
     [[nodiscard]] std::optional<std::chrono::steady_clock::time_point> due() const;
@@ -146,6 +146,7 @@ class OperationQueue {
     void failWaiting(Unserved::Reason reason, const std::string& message);
 
     Settings _settings;
+    MonitorLink& _monitor;
     Events _events;
     State _state = State::paused;
     std::unique_ptr<WorkerProcess> _worker;

@@ -18,8 +18,22 @@ std::string absolute(const std::string& path) {
     return path.empty() ? path : std::filesystem::absolute(path).string();
 }
 
-/// Throws std::runtime_error for a mistake in the configuration.
-std::optional<Options> read(int count, const char* const* arguments, int& status) {
+/// The configuration file that the command line names or, if it names none, the one that is always read if it exists.
+ConfigurationText configurationOnDisk(const std::string& named) {
+    const DiskPath standard = diskPath(HostPath(defaultConfiguration));
+    if (named.empty() && !exists(standard)) {
+        return {};
+    }
+    // It names the files that are loaded into the daemon, so the same rules apply to it as to plug-ins.
+    if (const auto problem = named.empty() ? distrust(standard) : distrustNamed(DiskPath(named))) {
+        throw std::runtime_error(*problem);
+    }
+    const std::string file = named.empty() ? standard.text() : named;
+    return {absolute(file), configurationTextIn(file)};
+}
+
+/// Without a configuration that is given, reads its file. Throws std::runtime_error for a mistake in it.
+std::optional<Options> read(int count, const char* const* arguments, int& status, const ConfigurationText* given) {
     Options options;
     options.arguments.assign(arguments, arguments + count);
     std::vector<std::string> plugins;
@@ -49,26 +63,16 @@ std::optional<Options> read(int count, const char* const* arguments, int& status
     options.root = absolute(options.root);
     setSystemRoot(options.root);
     options.root = systemRoot();
-    // Missing directories below it are created, but a typo is not a new root.
-    if (!std::filesystem::is_directory(options.root)) {
+    // Missing directories below it are created, but a typo is not a new root. A front gets a configuration, cannot
+    // always enter the root, and leaves this check to the monitor.
+    if (given == nullptr && !std::filesystem::is_directory(options.root)) {
         throw std::runtime_error(options.root + " is not a directory; create it or correct --root");
     }
-    const DiskPath standard = diskPath(HostPath(defaultConfiguration));
-    // It names the files that are loaded into the daemon, so the same rules apply to it as to plug-ins.
-    const auto problem = !configuration.empty() ? distrustNamed(DiskPath(configuration))
-                         : exists(standard)     ? distrust(standard)
-                                                : std::nullopt;
-    if (problem) {
-        throw std::runtime_error(*problem);
-    }
     options.configurationIsNamed = !configuration.empty();
-    options.configuration = options.configurationIsNamed ? absolute(configuration)
-                            : exists(standard)           ? standard.text()
-                                                         : std::string();
-    if (options.configurationIsNamed) {
-        readConfiguration(configuration, options);
-    } else if (!options.configuration.empty()) {
-        readConfiguration(options.configuration, options);
+    const ConfigurationText source = given != nullptr ? *given : configurationOnDisk(configuration);
+    options.configuration = source.path;
+    if (!source.path.empty()) {
+        applyConfiguration(options.configurationIsNamed ? configuration : source.path, source.text, options);
     }
     if (!plugins.empty()) {
         options.plugins.clear();
@@ -88,11 +92,25 @@ std::optional<Options> read(int count, const char* const* arguments, int& status
     return options;
 }
 
+Options readAll(const std::vector<std::string>& arguments, const ConfigurationText* given) {
+    std::vector<const char*> texts;
+    texts.reserve(arguments.size());
+    for (const std::string& argument : arguments) {
+        texts.push_back(argument.c_str());
+    }
+    int status = 0;
+    auto options = read(static_cast<int>(texts.size()), texts.data(), status, given);
+    if (!options) {
+        throw std::runtime_error("the command line cannot be understood");
+    }
+    return *std::move(options);
+}
+
 }  // namespace
 
 std::optional<Options> readOptions(int count, const char* const* arguments, int& status) {
     try {
-        return read(count, arguments, status);
+        return read(count, arguments, status, nullptr);
     } catch (const std::runtime_error& error) {
         std::cerr << "adminhostd: " << error.what() << '\n';
         status = 1;
@@ -101,17 +119,11 @@ std::optional<Options> readOptions(int count, const char* const* arguments, int&
 }
 
 Options readOptionsAgain(const std::vector<std::string>& arguments) {
-    std::vector<const char*> texts;
-    texts.reserve(arguments.size());
-    for (const std::string& argument : arguments) {
-        texts.push_back(argument.c_str());
-    }
-    int status = 0;
-    auto options = read(static_cast<int>(texts.size()), texts.data(), status);
-    if (!options) {
-        throw std::runtime_error("the command line cannot be understood");
-    }
-    return *std::move(options);
+    return readAll(arguments, nullptr);
+}
+
+Options readOptionsWith(const std::vector<std::string>& arguments, const ConfigurationText& configuration) {
+    return readAll(arguments, &configuration);
 }
 
 std::vector<std::string> keepFixedSettings(Options& read, const Options& old) {

@@ -2,6 +2,7 @@
 
 // The daemon's options: its command line and its configuration file.
 
+#include "adminhostd/ConfigurationCopy.h"
 #include "adminhostd/DirectoryOptions.h"
 #include "adminhostd/Permissions.h"
 #include "adminhostd/RequestBounds.h"
@@ -33,6 +34,7 @@ struct Options {
     std::size_t queueLimitPerAccount = 16;  ///< for accounts other than root and the daemon's own
     std::vector<PermissionOptions> permissions;
     std::string configuration;          ///< path on disk of the file that was read; empty: none
+    std::string configurationText;      ///< what the file contained
     bool configurationIsNamed = false;  ///< on the command line
     bool logToStandardError = false;
     bool check = false;
@@ -47,11 +49,21 @@ struct Options {
 /// The same for a process that is running already. Throws std::runtime_error with the description of a mistake.
 [[nodiscard]] Options readOptionsAgain(const std::vector<std::string>& arguments);
 
+/// The same with a configuration that was read elsewhere.
+[[nodiscard]] Options readOptionsWith(const std::vector<std::string>& arguments,
+                                      const ConfigurationText& configuration);
+
 /// Gives the settings that only a start can change their old values. Returns the keys of those that differed.
 std::vector<std::string> keepFixedSettings(Options& read, const Options& old);
 
-/// Applies a configuration file to the options. Throws std::runtime_error with the file, the line, the column and a
+/// Returns the text of a configuration file. Throws std::runtime_error with the file and a description.
+[[nodiscard]] std::string configurationTextIn(const std::string& file);
+
+/// Applies a configuration's text to the options. Throws std::runtime_error with the file, the line, the column and a
 /// description.
+void applyConfiguration(const std::string& file, const std::string& text, Options& options);
+
+/// Both for a file.
 void readConfiguration(const std::string& file, Options& options);
 
 /// The path on disk of the configuration file that was read or, without one, where it would be.

@@ -55,6 +55,19 @@ struct Caller {
 
 // From the front to the worker.
 
+struct OfferedPlugin {
+    std::string name;
+    std::string version;
+    std::string file;
+    std::vector<Command> commands;
+    bool operator==(const OfferedPlugin&) const = default;
+};
+struct RefusedPlugin {
+    std::string file;
+    std::string reason;
+    bool operator==(const RefusedPlugin&) const = default;
+};
+
 /// First, and once. The nodes have no credentialsDirectory: the worker knows it.
 struct Configure {
     std::string build;  ///< the front's; must be the worker's
@@ -62,6 +75,7 @@ struct Configure {
     std::string accountUuids;    ///< host path of a file; empty: none
     std::string serviceManager;  ///< "systemd" or "pidfile"; empty: the default
     std::vector<std::string> plugins;
+    std::vector<RefusedPlugin> refused;  ///< plug-ins that the monitor does not offer, for Hello
     std::vector<std::string> languages;
     std::map<std::string, std::string> toolEnvironment;
     std::vector<DirectoryNodeOptions> directory;  ///< empty: the accounts of this machine
@@ -148,19 +162,6 @@ using ToWorker =
     std::variant<Configure, Perform, FindAccounts, ReadHistory, Diagnose, ReadLog, ReadAudit, Proceed, Recorded>;
 
 // From the worker to the front.
-
-struct OfferedPlugin {
-    std::string name;
-    std::string version;
-    std::string file;
-    std::vector<Command> commands;
-    bool operator==(const OfferedPlugin&) const = default;
-};
-struct RefusedPlugin {
-    std::string file;
-    std::string reason;
-    bool operator==(const RefusedPlugin&) const = default;
-};
 
 /// The reply to Configure, unless that has probeDirectory.
 struct Hello {

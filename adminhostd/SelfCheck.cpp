@@ -30,15 +30,16 @@ namespace {
 
 /// The worker's first message. If there is none, `problem` describes why.
 protocol::Hello helloOf(const protocol::Configure& configuration, std::string& problem) {
+    protocol::Hello hello;
+    hello.refused = configuration.refused;
     auto worker = startWorker(true);
     if (!worker) {
         problem = fmt::format("The worker cannot be started: {}", worker.error().description.value_or(""));
-        return {};
+        return hello;
     }
     const int socket = worker->conversation.get();
     const timeval bound{30, 0};
     ::setsockopt(socket, SOL_SOCKET, SO_RCVTIMEO, &bound, sizeof bound);
-    protocol::Hello hello;
     bool ready = writeFrame(socket, protocol::frameOf(configuration));
     FrameReader reader;
     for (bool said = false; ready && !said;) {
@@ -107,10 +108,8 @@ int check(const Options& options) {
         if (!problem.empty()) {
             problems.push_back(problem);
         }
-        for (const auto& refused : {plugins.refused, hello.refused}) {
-            for (const protocol::RefusedPlugin& plugin : refused) {
-                problems.push_back(plugin.reason);
-            }
+        for (const protocol::RefusedPlugin& plugin : hello.refused) {
+            problems.push_back(plugin.reason);
         }
         problems.insert(problems.end(), hello.problems.begin(), hello.problems.end());
         for (const protocol::OfferedPlugin& plugin : hello.plugins) {

@@ -175,6 +175,7 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
     }
 
     protocol::Hello hello;
+    hello.refused = configuration.refused;
     const std::vector<DiskPath> files(configuration.plugins.begin(), configuration.plugins.end());
     const auto reasons = tryPlugins(files);
     for (std::size_t i = 0; i < files.size(); ++i) {

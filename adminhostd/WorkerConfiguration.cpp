@@ -44,6 +44,7 @@ protocol::Configure workerConfiguration(const Options& options, const PluginSele
     for (const DiskPath& file : plugins.files) {
         configuration.plugins.push_back(file.text());
     }
+    configuration.refused = plugins.refused;
     configuration.languages = options.languages ? textsOf(*options.languages) : languagesOfEnvironment();
     configuration.accountUuids = options.accountUuids;
     configuration.serviceManager = options.serviceManager;

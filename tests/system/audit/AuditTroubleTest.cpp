@@ -148,6 +148,13 @@ TEST_F(AuditTest, WaitingRequestsOfOneAccountAreBoundedAndOthersGoOn) {
     EXPECT_EQ(dictionaryOf(refused).text("message"),
               "2 requests of this account wait already; wait for their answers.");
     EXPECT_TRUE(refused.headers.contains("retry-after"));
+    std::ofstream(daemon->directory() / "config")
+        << "queue_limit_per_account = 3\n[[permission]]\nusers = [\"bert\"]\nclasses = [\"read\"]\n";
+    daemon->signal(SIGHUP);
+    ASSERT_TRUE(daemon->waitForLog("the configuration has been read again"));
+    waiting.push_back(test::connectAs({test::bert}, daemon->socket()));
+    waiting.back().begin("POST", "/v1/fixture/echo", "{\"n\": 2}");
+    EXPECT_TRUE(eventually([&] { return dictionaryOf(daemon->connect().get("/v1/")).get("waiting") == Value(3); }));
     EXPECT_EQ(daemon->connect().post("/v1/fixture/echo", "{}").status, 200) << "root has no such bound";
     for (auto& client : waiting) {
         EXPECT_EQ(client.reply().status, 200);

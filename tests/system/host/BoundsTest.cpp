@@ -108,48 +108,5 @@ TEST(Bounds, ClientThatVanishesInTheMiddleOfItsAnswerHarmsNobody) {
     }
 }
 
-class Reload : public ::testing::Test {
-  protected:
-    void configure(const std::string& text) {
-        std::ofstream(daemon.directory() / "config") << text;
-        daemon.signal(SIGHUP);
-    }
-    DaemonProcess daemon{withFixture("request_deadline_seconds = 20\nlanguages = [\"de\"]\n")};
-    UnixHttp client = daemon.connect();
-};
-
-TEST_F(Reload, HangupReadsTheConfigurationAgain) {
-    configure("request_deadline_seconds = 30\nlanguages = [\"fr\"]\nbody_limit_bytes = 2000\n");
-    ASSERT_TRUE(daemon.waitForLog("the configuration has been read again")) << daemon.log();
-    EXPECT_EQ(dictionaryOf(client.get("/v1/")).get("deadlineSeconds").real(), 30.0);
-    EXPECT_EQ(client.post("/v1/fixture/languages", "{}").body, "{\"languages\":[\"fr\"]}\n");
-    expectError(client.post("/v1/fixture/echo", R"({"a":")" + std::string(2000, 'x') + "\"}"), 413, "BODY_TOO_LARGE");
-}
-
-TEST_F(Reload, NoRequestIsLostWhileTheWorkerIsReplaced) {
-    UnixHttp sleeper = startSleeping(daemon, 1000);
-    UnixHttp waits = daemon.connect();
-    waits.begin("POST", "/v1/fixture/languages", "{}");
-    configure("languages = [\"fr\"]\n");
-    ASSERT_TRUE(daemon.waitForLog("the configuration has been read again")) << daemon.log();
-    EXPECT_EQ(sleeper.reply().status, 200) << "a running request ends with its worker";
-    EXPECT_EQ(waits.reply().body, "{\"languages\":[\"fr\"]}\n");
-    EXPECT_EQ(client.get("/v1/").status, 200) << "connections stay";
-}
-
-TEST_F(Reload, MistakeIsReportedAndTheOldConfigurationStays) {
-    configure("request_deadline_seconds = 30\nqueue_limit = -1\n");
-    ASSERT_TRUE(daemon.waitForLog("the configuration was not read again, the old one stays in effect")) << daemon.log();
-    EXPECT_NE(daemon.log().find("line 2, column"), std::string::npos) << daemon.log();
-    EXPECT_EQ(dictionaryOf(client.get("/v1/")).get("deadlineSeconds").real(), 20.0);
-    EXPECT_EQ(client.post("/v1/fixture/languages", "{}").body, "{\"languages\":[\"de\"]}\n");
-}
-
-TEST_F(Reload, SettingThatOnlyAStartCanChangeIsReported) {
-    configure("connection_limit = 10\nlanguages = [\"fr\"]\n");
-    ASSERT_TRUE(daemon.waitForLog("connection_limit cannot be changed while the daemon is running; restart it"));
-    EXPECT_EQ(client.post("/v1/fixture/languages", "{}").body, "{\"languages\":[\"fr\"]}\n") << "the others count";
-}
-
 }  // namespace
 }  // namespace adminhost::test

@@ -73,6 +73,8 @@ TEST_F(Start, MistakesInTheConfigurationAreNamedWithTheirLine) {
         {"plugin_directory = 1\n", "line 1, column 20: \"plugin_directory\" must be a text"},
         {"socket = []\n", "line 1, column 10: \"socket\" must be a text"},
         {"socket_group = 0\n", "line 1, column 16: \"socket_group\" must be a text"},
+        {"account = 65534\n", "line 1, column 11: \"account\" must be a text"},
+        {"account = \"\"\n", "line 1, column 11: \"account\" must"},
         {"account_uuids = true\n", "line 1, column 17: \"account_uuids\" must be a text"},
         {"service_manager = \"launchd\"\n",
          "line 1, column 19: \"service_manager\" must be \"systemd\" or \"pidfile\""},

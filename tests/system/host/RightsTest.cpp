@@ -234,9 +234,29 @@ TEST_F(AccountRights, DaemonWithAnAccountForItsFrontServesWhatItServesWithout) {
     EXPECT_EQ(doctor.status, 200);
     const uid_t uid = ::getpwnam(otherAccount)->pw_uid;
     EXPECT_THAT(doctor.body, HasSubstr("as root, its front as uid " + std::to_string(uid)));
-    EXPECT_THAT(doctor.body, HasSubstr("cannot be read by the front's account"));
+    EXPECT_THAT(doctor.body, HasSubstr("The front's account (uid " + std::to_string(uid) + ") cannot read it"));
     daemon.signal(SIGTERM);
     EXPECT_EQ(daemon.wait(), 0);
+}
+
+TEST_F(AccountRights, FrontThatCannotReadTheFileGetsTheConfigurationAtAReload) {
+    if (!isSuperuser()) {
+        return;
+    }
+    const DaemonProcess daemon(withFixture(ofOtherAccount));
+    const fs::path file = daemon.directory() / "config";
+    std::ofstream(file) << ofOtherAccount << "request_deadline_seconds = 30\nlanguages = [\"fr\"]\n";
+    fs::permissions(file, fs::perms(0600));
+    daemon.signal(SIGHUP);
+    ASSERT_TRUE(daemon.waitForLog("the configuration has been read again")) << daemon.log();
+    EXPECT_EQ(dictionaryOf(daemon.connect().get("/v1/")).get("deadlineSeconds").real(), 30.0);
+    EXPECT_EQ(daemon.connect().post("/v1/fixture/languages", "{}").body, "{\"languages\":[\"fr\"]}\n");
+    EXPECT_THAT(daemon.connect().get("/v1/doctor").body, HasSubstr("as root, its front as uid"));
+    const pid_t front = daemon.frontPid();
+    ::kill(front, SIGKILL);
+    EXPECT_TRUE(eventually([&] { return daemon.frontPid() > 0 && daemon.frontPid() != front; }));
+    EXPECT_EQ(dictionaryOf(daemon.connect().get("/v1/")).get("deadlineSeconds").real(), 30.0) << daemon.log();
+    EXPECT_EQ(statusOf(daemon.frontPid())["Uid"], four(::getpwnam(otherAccount)->pw_uid));
 }
 
 TEST_F(AccountRights, AccountThatIsMissingOrTheSuperusersIsAnErrorAtTheStart) {

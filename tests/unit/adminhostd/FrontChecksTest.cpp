@@ -27,6 +27,7 @@ class FrontChecksTest : public ::testing::Test {
         root.write("/etc/adminhostd.toml", "queue_limit = 5\n");
         options.root = systemRoot();
         options.configuration = root.path("/etc/adminhostd.toml");
+        options.configurationText = "queue_limit = 5\n";
     }
 
     /// The check of that name, of a daemon that has just been started; `breakIt` is called after the start.
@@ -98,13 +99,27 @@ TEST_F(FrontChecksTest, ConfigurationThatOthersMayWriteIsAFailure) {
 }
 
 TEST_F(FrontChecksTest, ConfigurationThatHasChangedSinceTheStartIsAWarning) {
-    const Diagnosis found = check("configuration file", [&] {
-        root.write("/etc/adminhostd.toml", "queue_limit = 6\n");
-        fs::last_write_time(root.path("/etc/adminhostd.toml"),
-                            fs::file_time_type::clock::now() + std::chrono::hours(1));
-    });
+    const auto edit = [&] { root.write("/etc/adminhostd.toml", "queue_limit = 6\n"); };
+    const Diagnosis found = check("configuration file", edit);
     EXPECT_EQ(found.health, Health::warning);
-    EXPECT_THAT(found.found, HasSubstr("has changed since the daemon was started"));
+    EXPECT_THAT(found.found, HasSubstr("has changed since the daemon read it"));
+    EXPECT_THAT(found.fix, HasSubstr("reload the daemon"));
+}
+
+TEST_F(FrontChecksTest, OptionsThatAreReadAgainChangeNeitherTheStartNorTheSocket) {
+    const ListeningSocket socket(socketFile(), ListeningSocket::sameGroup);
+    FrontChecks checks(options);
+    const std::string before = named("daemon", checks.run(workers)).found;
+    root.write("/etc/adminhostd.toml", "queue_limit = 6\n");
+    fs::rename(socketFile(), socketFile() + ".old");
+    root.write("/run/adminhostd/adminhostd.sock", "");
+    options.configurationText = "queue_limit = 6\n";
+    options.pluginDirectory = HostPath("/elsewhere");
+    checks.reconfigure(options);
+    EXPECT_EQ(named("daemon", checks.run(workers)).found, before);
+    EXPECT_EQ(named("socket", checks.run(workers)).health, Health::failure);
+    EXPECT_EQ(named("configuration file", checks.run(workers)).health, Health::ok);
+    EXPECT_THAT(named("plug-in directory", checks.run(workers)).found, HasSubstr("/elsewhere does not exist yet"));
 }
 
 TEST_F(FrontChecksTest, DirectoryThatOthersMayWriteIsAFailure) {

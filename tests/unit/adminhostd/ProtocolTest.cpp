@@ -65,6 +65,7 @@ std::vector<ToWorker> messagesToWorker() {
                       .accountUuids = "/u",
                       .serviceManager = "pidfile",
                       .plugins = {"/a.so", "/b.so"},
+                      .refused = {{"/c.so", "reason"}},
                       .languages = {"de"},
                       .toolEnvironment = {{"A", "1"}, {"B", ""}},
                       .directory = {node(), {}},
