@@ -91,6 +91,9 @@ std::string resultText(const Dictionary& entry) {
         return "unfinished: " + std::string(entry.text("result"));
     }
     const auto status = entry.get("status").unsignedInteger().value_or(0);
+    if (event == "cancelled" && status < 300) {
+        return "cancelled; " + std::string(entry.text("result"));
+    }
     const std::string result = status < 300 ? "done" : fmt::format("{} {}", status, entry.text("result"));
     const auto refusals = entry.get("refusalsNotLogged").unsignedInteger();
     return checkOnly + result + (refusals ? fmt::format(" ({} more before it)", *refusals) : "");

@@ -13,8 +13,14 @@ namespace {
 constexpr auto refusalPeriod = std::chrono::minutes(1);
 constexpr auto readingPeriod = std::chrono::hours(1);
 constexpr std::size_t readingsMaximum = 1000;  ///< that are remembered
+constexpr unsigned forbidden = 403;
 
 }  // namespace
+
+AuditedClient Audit::clientOf(const Peer& peer) {
+    return {peer.uid, _names.of(peer.uid), peer.login, peer.login == noLogin ? "" : _names.of(peer.login), peer.pid,
+            peer.unit};
+}
 
 AuditEvent Audit::eventFor(const RequestRecord& record, AuditEvent::Kind kind) {
     AuditEvent event;
@@ -24,13 +30,12 @@ AuditEvent Audit::eventFor(const RequestRecord& record, AuditEvent::Kind kind) {
     event.command = record.command;
     event.access = record.access;
     event.checkOnly = record.checkOnly;
-    const Peer& peer = record.peer;
-    event.client = {peer.uid, record.user, peer.login, record.loginUser, peer.pid, peer.unit};
-    if (event.client.user.empty()) {
-        event.client.user = _names.of(peer.uid);
+    event.client = clientOf(record.peer);
+    if (!record.user.empty()) {
+        event.client.user = record.user;
     }
-    if (event.client.loginUser.empty() && peer.login != noLogin) {
-        event.client.loginUser = _names.of(peer.login);
+    if (!record.loginUser.empty()) {
+        event.client.loginUser = record.loginUser;
     }
     return event;
 }
@@ -58,6 +63,24 @@ void Audit::forgetOldestRefusals() {
                              uidText(oldest->first, _names.of(oldest->first))));
     }
     _refusals.erase(oldest);
+}
+
+AuditEvent Audit::cancellation(const Peer& peer, const RequestRecord& record) {
+    AuditEvent event = eventFor(record, AuditEvent::Kind::cancelled);
+    event.result = "it was sent by " + uidText(event.client.uid, event.client.user);
+    event.client = clientOf(peer);
+    return event;
+}
+
+void Audit::cancelled(AuditEvent event, unsigned status, const std::string& code) {
+    event.status = status;
+    if (!code.empty()) {
+        event.result = code;
+    }
+    if (status == forbidden && !countRefusal(event.client.uid, event.refusalsNotLogged)) {
+        return;
+    }
+    write(event, Redaction());
 }
 
 bool Audit::countRefusal(uid_t uid, std::size_t& notLogged) {
@@ -94,7 +117,6 @@ bool Audit::countReading(uid_t uid, const std::string& place) {
 }
 
 bool Audit::isWorthLogging(const RequestRecord& record, std::size_t& notLogged) {
-    constexpr unsigned forbidden = 403;
     if (record.status == forbidden) {
         // Any account that can connect can cause refusals: it must not be able to fill the log.
         return countRefusal(record.peer.uid, notLogged);

@@ -38,6 +38,11 @@ class Audit {
     /// A request of an earlier daemon that had begun, and whose end that daemon has not logged.
     void unfinished(const protocol::Unfinished& request);
 
+    /// The event for a client's try to cancel this request, without its result.
+    [[nodiscard]] AuditEvent cancellation(const Peer& peer, const RequestRecord& record);
+    /// The try has succeeded, or the client may not cancel that request.
+    void cancelled(AuditEvent event, unsigned status, const std::string& code);
+
     /// Whether everything could be recorded.
     [[nodiscard]] Diagnosis check() const;
 
@@ -49,6 +54,7 @@ class Audit {
         std::size_t notLogged = 0;
     };
 
+    [[nodiscard]] AuditedClient clientOf(const Peer& peer);
     [[nodiscard]] AuditEvent eventFor(const RequestRecord& record, AuditEvent::Kind kind);
     static void write(const AuditEvent& event, const Redaction& redaction);
     /// Counts a refusal. Returns false if it is not to be logged, because the account has caused too many.

@@ -131,6 +131,9 @@ std::string outcomeText(const AuditEvent& event) {
             return "begins";
         case AuditEvent::Kind::unfinished:
             return "had begun when the daemon ended; " + event.result;
+        case AuditEvent::Kind::cancelled:
+            return event.status < 300 ? "cancelled; " + event.result
+                                      : fmt::format("is not cancelled; {} {}", event.status, event.result);
         case AuditEvent::Kind::ended:
             break;
     }
@@ -139,7 +142,8 @@ std::string outcomeText(const AuditEvent& event) {
 }
 
 std::string nameOf(AuditEvent::Kind kind) {
-    return kind == AuditEvent::Kind::begun ? "begun" : kind == AuditEvent::Kind::ended ? "ended" : "unfinished";
+    constexpr const char* names[] = {"begun", "ended", "unfinished", "cancelled"};
+    return names[static_cast<int>(kind)];
 }
 
 }  // namespace

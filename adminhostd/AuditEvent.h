@@ -42,6 +42,7 @@ struct AuditEvent {
         begun,       ///< a command that may change something is about to run
         ended,       ///< any request has been answered
         unfinished,  ///< a command of an earlier daemon has begun, and its end was not logged
+        cancelled,   ///< a client, which is not always the request's own, has asked for its end
     };
     Kind kind = Kind::ended;
     std::string request;  ///< its id
@@ -50,9 +51,10 @@ struct AuditEvent {
     std::string access;  ///< the class that it needs; empty if it does not exist
     AuditedClient client;
     bool checkOnly = false;
-    unsigned status = 0;      ///< of HTTP; 0 if it is not known
-    std::string result;       ///< the error's code; for one that is unfinished, what is known of its end; else empty
-    double milliseconds = 0;  ///< from arrival to answer
+    unsigned status = 0;  ///< of HTTP; 0 if it is not known
+    /// The error's code; for one that is unfinished, what is known of its end; for one that was cancelled, who sent it.
+    std::string result;
+    double milliseconds = 0;            ///< from arrival to answer
     std::size_t refusalsNotLogged = 0;  ///< earlier ones of this account
     AuditedReports changes;
     AuditedReports notDone;

@@ -229,8 +229,11 @@ void Front::finished(const Operation& operation, OperationQueue::Ending ending) 
 }
 
 HttpAnswer Front::cancel(const Peer& peer, const RequestRecord& record) {
-    const std::string id = record.id;  // the record may be dropped when its request ends
+    // Copied, because the record may be dropped when its request ends.
+    const std::string id = record.id;
+    AuditEvent event = _audit.cancellation(peer, record);
     if (peer.uid != record.peer.uid && !_permissions.isOwn(peer)) {
+        _audit.cancelled(std::move(event), 403, "NOT_PERMITTED");
         return errorAnswer(403, "NOT_PERMITTED", "Only the account that sent the request, and root, may cancel it.");
     }
     if (record.state == RequestRecord::State::done) {
@@ -243,6 +246,7 @@ HttpAnswer Front::cancel(const Peer& peer, const RequestRecord& record) {
                                        "change is worse than none; it ends by itself, at its deadline at the latest.",
                                        id));
     }
+    _audit.cancelled(std::move(event), 200, "");
     return {200, Dictionary{{"request", id}, {"state", running ? "running" : "waiting"}, {"cancelled", true}}, {}};
 }
 

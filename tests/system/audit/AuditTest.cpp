@@ -77,6 +77,21 @@ TEST_F(AuditTest, JourneyHasTwoEventsForAChangeAndOneForAReading) {
               << ctl({"audit", "--since", "1h"}).output;
 }
 
+TEST_F(AuditTest, CancellationIsRecordedWithTheAccountsOfBothClients) {
+    const std::string id = "01234567-89ab-cdef-0123-0123456789ab";
+    test::UnixHttp reader = test::connectAs({test::bert}, daemon->socket());
+    reader.begin("POST", "/v1/fixture/run", R"({"script": "sleep 20"})", {"Request-Id: " + id});
+    ASSERT_TRUE(eventually([&] { return daemon->connect().get("/v1/requests/" + id).status == 200; }));
+    EXPECT_EQ(daemon->connect().request("DELETE", "/v1/requests/" + id).status, 200);
+    EXPECT_EQ(reader.reply().status, 503);
+    const auto entries = awaitEntries(id, 2);
+    EXPECT_EQ(entries[0].text("event"), "ended");
+    EXPECT_EQ(entries[0].text("user"), "bert");
+    EXPECT_EQ(entries[1].text("event"), "cancelled");
+    EXPECT_EQ(entries[1].get("uid"), Value(::geteuid()));
+    EXPECT_THAT(std::string(entries[1].text("result")), HasSubstr("(bert)"));
+}
+
 TEST_F(AuditTest, RequestThatChangesNothingLogsNoChange) {
     const std::string id = daemon->connect().post("/v1/fixture/reportWrite", "{}").headers.at("request-id");
     EXPECT_FALSE(awaitEntries(id, 2)[1].contains("changes"));

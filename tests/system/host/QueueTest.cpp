@@ -7,6 +7,8 @@
 #include <fstream>
 #include <iterator>
 
+#include <unistd.h>
+
 namespace adminhost::test {
 namespace {
 
@@ -49,6 +51,7 @@ TEST_F(Queue, WaitingRequestThatIsCancelledNeverRuns) {
     EXPECT_EQ(reply.status, 200) << reply.body;
     EXPECT_EQ(dictionaryOf(reply).get("state"), Value("waiting"));
     expectError(waits.reply(), 503, "CANCELLED");
+    EXPECT_TRUE(daemon.waitForLog(": cancelled; it was sent by uid " + std::to_string(::geteuid()))) << daemon.log();
     EXPECT_EQ(waiting(), Value(0));
     EXPECT_EQ(sleeper.reply().status, 200) << "the running one is not touched";
     EXPECT_EQ(begin("run", mark("after")).reply().status, 200);

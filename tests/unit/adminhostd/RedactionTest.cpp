@@ -176,6 +176,17 @@ TEST(AuditEvent, LineHasWhoWhatTheResultAndWhatChanged) {
     begun.changes = {};
     begun.notDone = {};
     EXPECT_EQ(lineOf(begun), "adminhostd: request 1-1 lumio/writeSettings by uid 20001 pid 42: begins");
+    begun.kind = AuditEvent::Kind::cancelled;
+    begun.status = 200;
+    begun.result = "it was sent by uid 7";
+    EXPECT_EQ(lineOf(begun),
+              "adminhostd: request 1-1 lumio/writeSettings by uid 20001 pid 42: cancelled; it was sent by uid 7");
+    EXPECT_EQ(fieldOf(begun, "ADMINHOST_EVENT"), "cancelled");
+    EXPECT_EQ(fieldOf(begun, "MESSAGE_ID"), endedMessage);
+    begun.status = 403;
+    begun.result = "NOT_PERMITTED";
+    EXPECT_EQ(lineOf(begun),
+              "adminhostd: request 1-1 lumio/writeSettings by uid 20001 pid 42: is not cancelled; 403 NOT_PERMITTED");
     begun.kind = AuditEvent::Kind::unfinished;
     begun.result = "its operation was interrupted";
     EXPECT_EQ(lineOf(begun),
