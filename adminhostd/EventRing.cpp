@@ -27,6 +27,7 @@ void EventRing::add(const RequestRecord& record) {
     event.command = record.command;
     event.uid = record.peer.uid;
     event.request = record.id;
+    event.checkOnly = record.checkOnly;
     event.milliseconds = record.milliseconds;
     for (auto& [section, keys] : record.changedKeys(keysMaximum)) {
         Event change = event;
@@ -69,6 +70,7 @@ Dictionary EventRing::since(std::optional<std::uint64_t> after, std::string_view
 
 Dictionary EventRing::Event::describe(bool details) const {
     Dictionary text{{"number", number}, {"kind", kind}, {"when", when}, {"plugin", plugin}, {"command", command}};
+    text.set("checkOnly", checkOnly ? Value(true) : Value());
     if (isEnd(status)) {
         text.set("status", status);
         text.set("error", error.empty() ? Value() : Value(error));

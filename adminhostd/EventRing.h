@@ -46,6 +46,7 @@ class EventRing {
         Date when;
         std::string plugin;
         std::string command;
+        bool checkOnly = false;
         std::string section;            ///< of a change
         std::vector<std::string> keys;  ///< of a change
         unsigned status = 0;            ///< of an end

@@ -163,7 +163,7 @@ void Front::close(RequestRecord& record, unsigned status, std::string_view code)
     // Only names that exist: a client must not be able to fill the memory with others.
     const bool known = record.plugin != unknownName && record.command != unknownName;
     _metrics.requestEnded(known ? record.plugin : "", known ? record.command : "", status, code,
-                          record.milliseconds / 1000);
+                          record.milliseconds / 1000, record.checkOnly);
     _audit.ended(record);
 }
 

@@ -201,6 +201,9 @@ void Front::enqueue(Operation operation) {
 
 void Front::finished(const Operation& operation, OperationQueue::Ending ending) {
     const auto* unserved = std::get_if<Unserved>(&ending);
+    if (const auto* answer = std::get_if<protocol::Answer>(&ending)) {
+        _metrics.workDone(answer->toolRuns, answer->directoryLookups, answer->residentBytes);
+    }
     const bool cancelled = unserved != nullptr && unserved->reason == Unserved::Reason::cancelled;
     if (isDoctor(*operation.record) && !cancelled) {
         return end(operation, doctorAnswer(ending), {});
@@ -212,7 +215,6 @@ void Front::finished(const Operation& operation, OperationQueue::Ending ending) 
         code = codeOf(http);
     } else {
         auto& answer = std::get<protocol::Answer>(ending);
-        _metrics.workDone(answer.toolRuns, answer.directoryLookups, answer.residentBytes);
         http = answerFor(answer);
         if (http.status < 300 && !answer.revision.empty()) {
             http.headers.emplace_back("ETag", fmt::format("\"{}\"", answer.revision));

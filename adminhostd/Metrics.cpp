@@ -32,20 +32,24 @@ void add(std::string& text, std::string_view name, std::string_view type, std::s
     text += fmt::format("{} {}\n", name, value);
 }
 
-std::string labelsOf(const std::string& plugin, const std::string& command) {
-    return fmt::format("plugin={},command={}", quoted(plugin), quoted(command));
+/// The labels of a plug-in's command.
+std::string labelsOf(const std::tuple<std::string, std::string, bool>& name) {
+    const auto& [plugin, command, checkOnly] = name;
+    // No label is the same as an empty one.
+    return fmt::format("plugin={},command={}{}", quoted(plugin), quoted(command), checkOnly ? ",check=\"1\"" : "");
 }
 
 }  // namespace
 
 void Metrics::requestEnded(std::string_view plugin, std::string_view command, unsigned status, std::string_view code,
-                           double seconds) {
-    Result result{plugin, command, status, code};
+                           double seconds, bool checkOnly) {
+    const Name name(plugin, command, checkOnly);
+    Result result{name, status, code};
     if (!_requests.contains(result) && _requests.size() >= seriesMaximum) {
-        result = {"", "other", status, ""};
+        result = {Name("", "other", false), status, ""};
     }
     ++_requests[std::move(result)];
-    Histogram& histogram = _durations[{std::string(plugin), std::string(command)}];
+    Histogram& histogram = _durations[name];
     const auto bucket = std::lower_bound(durations.begin(), durations.end(), seconds);
     if (bucket != durations.end()) {
         ++histogram.buckets[static_cast<std::size_t>(bucket - durations.begin())];
@@ -61,13 +65,13 @@ std::string Metrics::text(const Now& now) const {
     begin(text, "adminhost_requests_total", "counter",
           "Requests that ended, by command, HTTP status and the code of an error.");
     for (const auto& [result, count] : _requests) {
-        const auto& [plugin, command, status, code] = result;
-        text += fmt::format("adminhost_requests_total{{{},status=\"{}\",error={}}} {}\n", labelsOf(plugin, command),
-                            status, quoted(code), count);
+        const auto& [name, status, code] = result;
+        text += fmt::format("adminhost_requests_total{{{},status=\"{}\",error={}}} {}\n", labelsOf(name), status,
+                            quoted(code), count);
     }
     begin(text, "adminhost_request_duration_seconds", "histogram", "Time from the arrival of a request to its answer.");
     for (const auto& [name, histogram] : _durations) {
-        const std::string labels = labelsOf(name.first, name.second);
+        const std::string labels = labelsOf(name);
         std::uint64_t cumulated = 0;
         for (std::size_t i = 0; i < durations.size(); ++i) {
             cumulated += histogram.buckets[i];

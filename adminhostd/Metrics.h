@@ -35,7 +35,7 @@ class Metrics {
 
     /// Names that are not known to a plug-in must be empty. The code is that of an error, or empty.
     void requestEnded(std::string_view plugin, std::string_view command, unsigned status, std::string_view code,
-                      double seconds);
+                      double seconds, bool checkOnly = false);
     /// Adds what a worker did for one request. `residentBytes` is its memory after that; 0: not known.
     void workDone(std::uint64_t toolRuns, std::uint64_t directoryLookups, std::uint64_t residentBytes) noexcept {
         _toolRuns += toolRuns;
@@ -46,8 +46,8 @@ class Metrics {
     [[nodiscard]] std::string text(const Now& now) const;
 
   private:
-    using Name = std::pair<std::string, std::string>;                            ///< plug-in and command
-    using Result = std::tuple<std::string, std::string, unsigned, std::string>;  ///< also status and code
+    using Name = std::tuple<std::string, std::string, bool>;  ///< plug-in, command, and whether only the check ran
+    using Result = std::tuple<Name, unsigned, std::string>;   ///< also status and code
     struct Histogram {
         std::array<std::uint64_t, durations.size()> buckets{};  ///< not cumulated
         std::uint64_t count = 0;

@@ -104,6 +104,7 @@ Dictionary RequestRecord::describe(bool withReports) const {
                     {"plugin", plugin},    {"command", command},
                     {"uid", peer.uid},     {"pid", peer.pid},
                     {"received", received}};
+    text.set("checkOnly", checkOnly ? Value(true) : Value());
     if (state == State::running) {
         text.set("since", since);
     }

@@ -107,6 +107,27 @@ TEST_F(Events, NumbersOfAnotherStartAreMissedEvents) {
     }
 }
 
+TEST_F(Events, CheckWithoutARunIsToldFromTheCommandItself) {
+    const HttpReply reply = client.post("/v1/fixture/runWrite?check=1", "{}");
+    EXPECT_EQ(reply.status, 200);
+    EXPECT_EQ(client.post("/v1/fixture/runWrite", R"({"script": "exit 0"})").status, 200);
+    const Array events = eventsOf(client.get(after(0)));
+    ASSERT_EQ(events.size(), 2U);
+    EXPECT_EQ(events[0].dictionary()->get("checkOnly"), Value(true));
+    EXPECT_FALSE(events[1].dictionary()->contains("checkOnly"));
+    EXPECT_EQ(dictionaryOf(client.get("/v1/requests/" + reply.headers.at("request-id"))).get("checkOnly"), Value(true));
+    const PrometheusText text = parsePrometheusText(client.get("/v1/metrics").body);
+    EXPECT_EQ(text.sum("adminhost_requests_total", {{"command", "runWrite"}}), 2);
+    EXPECT_EQ(text.sum("adminhost_requests_total", {{"command", "runWrite"}, {"check", "1"}}), 1);
+    EXPECT_EQ(text.sum("adminhost_request_duration_seconds_count", {{"command", "runWrite"}, {"check", "1"}}), 1);
+}
+
+TEST_F(Events, MetricsCountTheWorkOfTheDoctor) {
+    EXPECT_EQ(client.get("/v1/doctor").status, 200);
+    const PrometheusText text = parsePrometheusText(client.get("/v1/metrics").body);
+    EXPECT_GT(text.at("adminhost_resident_memory_bytes", {{"process", "worker"}}), 1e6);
+}
+
 TEST_F(Events, MetricsCountWhatHappenedInAFormThatIsRead) {
     EXPECT_EQ(client.post("/v1/fixture/tool", R"({"seconds": 0})").status, 200);
     EXPECT_EQ(client.post("/v1/fixture/tool", R"({"seconds": 0})").status, 200);
