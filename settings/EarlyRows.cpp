@@ -14,8 +14,9 @@ constexpr std::string_view replacementCharacter = "\xEF\xBF\xBD";
 
 void EarlyRows::read(std::string_view output) {
     while (!_doubtful && _read < output.size()) {
-        const std::size_t end = output.find('\n', _read);
+        const std::size_t end = output.find('\n', std::max(_read, _searched));
         if (end == std::string_view::npos) {
+            _searched = output.size();
             return;
         }
         _doubtful = !readLine(output, output.substr(_read, end - _read));

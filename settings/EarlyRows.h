@@ -43,8 +43,9 @@ class EarlyRows {
     std::span<const std::string> _knownColumns;
     Row _row;
     bool _doubtful = false;
-    std::size_t _read = 0;   ///< bytes of whole lines that were read
-    std::size_t _width = 0;  ///< of a column's padded name
+    std::size_t _read = 0;      ///< bytes of whole lines that were read
+    std::size_t _searched = 0;  ///< bytes in which the end of the next line was not found: a line may have megabytes
+    std::size_t _width = 0;     ///< of a column's padded name
     bool _inFirstRow = true;
     std::vector<std::string> _columns;
     std::vector<std::string> _prefixes;  ///< the beginnings of the columns' lines
