@@ -95,7 +95,9 @@ void OperationQueue::noteStart() {
         failWaiting(Unserved::Reason::unavailable, _startProblem);
     } else if (_waitsForLeft && (!_worker || !_worker->waitsFor())) {
         _waitsForLeft = false;
-        _due = Clock::now() + startBound;
+        if (_worker) {  // else its start has failed, and the next one has a time already
+            _due = Clock::now() + startBound;
+        }
     }
 }
 
