@@ -37,6 +37,23 @@ std::vector<char*> pointersTo(std::vector<std::string>& texts) {
     return pointers;
 }
 
+std::vector<pid_t> childrenOf(pid_t process) {
+    const std::string self = std::to_string(process);
+    std::ifstream file("/proc/" + self + "/task/" + self + "/children");
+    std::vector<pid_t> children;
+    for (pid_t pid = 0; file >> pid;) {
+        children.push_back(pid);
+    }
+    return children;
+}
+
+/// Returns false for a process that has ended, also if nobody has collected its status.
+bool isRunning(pid_t process) {
+    const std::string text = readWhole("/proc/" + std::to_string(process) + "/stat");
+    const std::size_t name = text.rfind(") ");
+    return name != std::string::npos && text.substr(name + 2, 1) != "Z";
+}
+
 }  // namespace
 
 DaemonProcess::DaemonProcess(const Options& options) {
@@ -111,15 +128,20 @@ DaemonProcess::~DaemonProcess() {
 
 void DaemonProcess::end() {
     if (_pid > 0 && !_status) {
-        // Its worker ends by itself when the socket pair is closed.
+        const std::vector<pid_t> children = childrenOf(_pid);
         const pid_t front = frontPid();
         ::kill(_pid, SIGKILL);
         if (front > 0) {
             ::kill(front, SIGKILL);
         }
         wait();
+        // A worker ends by itself when the socket pair is closed. One that is just starting creates its directories
+        // first, below a root that would be removed already.
+        for (int tries = 0; tries < 200 && std::any_of(children.begin(), children.end(), &isRunning); ++tries) {
+            ::usleep(5'000);
+        }
     }
-    // A worker that is still ending may create and remove files meanwhile.
+    // One that is finishing a write may create and remove files meanwhile.
     std::error_code error;
     for (int tries = 0; std::filesystem::remove_all(_directory, error), error && tries < 500; ++tries) {
         ::usleep(10'000);
@@ -127,9 +149,7 @@ void DaemonProcess::end() {
 }
 
 pid_t DaemonProcess::frontPid() const {
-    const std::string self = std::to_string(_pid);
-    std::ifstream children("/proc/" + self + "/task/" + self + "/children");
-    for (pid_t pid = 0; children >> pid;) {
+    for (const pid_t pid : childrenOf(_pid)) {
         if (readWhole("/proc/" + std::to_string(pid) + "/comm").starts_with("adminhostd-fron")) {
             return pid;
         }

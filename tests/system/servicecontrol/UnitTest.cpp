@@ -5,6 +5,7 @@
 
 #include "platform/json/Json.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Eventually.h"
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 #include "tests/support/ServiceManager.h"
@@ -156,6 +157,20 @@ TEST_F(DaemonUnit, EveryCommandIsServedUnderItsRestrictions) {
         EXPECT_THAT(textOf(log()),
                     AllOf(Not(HasSubstr("Operation not permitted")), Not(HasSubstr("Read-only file system"))));
     }
+}
+
+TEST_F(DaemonUnit, ReloadReadsTheConfigurationAgain) {
+    ASSERT_EQ(client().get("/v1/").status, 200);
+    if (isRealServiceManager()) {
+        const ProgramResult reloaded = runProgram({"systemctl", "reload", service});
+        EXPECT_EQ(reloaded.status, 0) << reloaded.output;
+    } else {
+        process->signal(SIGHUP);
+    }
+    const std::string text = "the configuration has been read again";
+    EXPECT_TRUE(eventually([&] { return (process ? process->log() : textOf(log())).find(text) != std::string::npos; }))
+        << (process ? process->log() : textOf(log()));
+    EXPECT_EQ(client().get("/v1/").status, 200);
 }
 
 TEST_F(DaemonUnit, AccountIsCreatedAndTheSharedFileSystemChanged) {
