@@ -84,6 +84,11 @@ std::optional<Confinement> readableFiles(const Options& options) {
     return *std::move(confinement);
 }
 
+/// What an argument of a call must be. libseccomp's macros for it are expressions of C only.
+constexpr scmp_arg_cmp argument(unsigned number, scmp_compare comparison, scmp_datum_t a, scmp_datum_t b = 0) {
+    return {number, comparison, a, b};
+}
+
 /// Calls that are allowed whatever their arguments.
 constexpr int allowedCalls[] = {
     // Descriptors that are open, and names of files.
@@ -211,23 +216,23 @@ void filterSystemCalls() {
         allow(call);
     }
     constexpr scmp_datum_t writing = O_ACCMODE | O_CREAT | O_TRUNC | (O_TMPFILE & ~O_DIRECTORY);
-    allow(SCMP_SYS(open), {SCMP_A1(SCMP_CMP_MASKED_EQ, writing, O_RDONLY)});
-    allow(SCMP_SYS(openat), {SCMP_A2(SCMP_CMP_MASKED_EQ, writing, O_RDONLY)});
-    allow(SCMP_SYS(socket), {SCMP_A0(SCMP_CMP_EQ, AF_UNIX)});
-    allow(SCMP_SYS(socketpair), {SCMP_A0(SCMP_CMP_EQ, AF_UNIX)});
+    allow(SCMP_SYS(open), {argument(1, SCMP_CMP_MASKED_EQ, writing, O_RDONLY)});
+    allow(SCMP_SYS(openat), {argument(2, SCMP_CMP_MASKED_EQ, writing, O_RDONLY)});
+    allow(SCMP_SYS(socket), {argument(0, SCMP_CMP_EQ, AF_UNIX)});
+    allow(SCMP_SYS(socketpair), {argument(0, SCMP_CMP_EQ, AF_UNIX)});
     // Never memory that can be written and executed. Name services are libraries, whose files are mapped. A shared
     // mapping would show what is written to the file later.
-    allow(SCMP_SYS(mmap), {SCMP_A2(SCMP_CMP_MASKED_EQ, PROT_EXEC, 0)});
-    allow(SCMP_SYS(mmap), {SCMP_A2(SCMP_CMP_MASKED_EQ, PROT_WRITE | PROT_EXEC, PROT_EXEC),
-                           SCMP_A3(SCMP_CMP_MASKED_EQ, MAP_TYPE | MAP_ANONYMOUS, MAP_PRIVATE)});
+    allow(SCMP_SYS(mmap), {argument(2, SCMP_CMP_MASKED_EQ, PROT_EXEC, 0)});
+    allow(SCMP_SYS(mmap), {argument(2, SCMP_CMP_MASKED_EQ, PROT_WRITE | PROT_EXEC, PROT_EXEC),
+                           argument(3, SCMP_CMP_MASKED_EQ, MAP_TYPE | MAP_ANONYMOUS, MAP_PRIVATE)});
     // Only itself: its account may have other processes.
-    allow(SCMP_SYS(tgkill), {SCMP_A0(SCMP_CMP_EQ, static_cast<scmp_datum_t>(::getpid()))});
-    allow(SCMP_SYS(prlimit64), {SCMP_A0(SCMP_CMP_EQ, 0)});
+    allow(SCMP_SYS(tgkill), {argument(0, SCMP_CMP_EQ, static_cast<scmp_datum_t>(::getpid()))});
+    allow(SCMP_SYS(prlimit64), {argument(0, SCMP_CMP_EQ, 0)});
 #ifndef ADMINHOST_SANITIZED
-    allow(SCMP_SYS(mprotect), {SCMP_A2(SCMP_CMP_MASKED_EQ, PROT_EXEC, 0)});
+    allow(SCMP_SYS(mprotect), {argument(2, SCMP_CMP_MASKED_EQ, PROT_EXEC, 0)});
 #endif
     for (const scmp_datum_t request : {TCGETS, FIONREAD, FIONBIO}) {
-        allow(SCMP_SYS(ioctl), {SCMP_A1(SCMP_CMP_EQ, request)});
+        allow(SCMP_SYS(ioctl), {argument(1, SCMP_CMP_EQ, request)});
     }
     if (failure == 0) {
         failure = ::seccomp_load(filter.get());

@@ -30,7 +30,7 @@ void require(bool condition) {
 
 /// What the front does with a request, without its operations.
 void serve(Exchange& exchange) {
-    require(!exchange.headProblem() && exchange.body().size() <= bodyMaximum && !exchange.path().empty());
+    require(!exchange.headProblem() && exchange.body().size() <= RequestBounds().bodyBytes && !exchange.path().empty());
     static_cast<void>(revisionsOf(exchange.header("If-Match").value_or("*")));
     static_cast<void>(deadlineOf(exchange.header("Request-Deadline").value_or("1")));
     static_cast<void>(exchange.wantsPropertyList());
@@ -61,7 +61,7 @@ class Server {
         _size = sizeof _address;
         require(::getsockname(listener.get(), reinterpret_cast<sockaddr*>(&_address), &_size) == 0 &&
                 ::listen(listener.get(), 16) == 0);
-        _server = std::make_unique<HttpServer>(std::move(listener), std::chrono::seconds(30),
+        _server = std::make_unique<HttpServer>(std::move(listener), RequestBounds(),
                                                [](Exchange& exchange) -> std::variant<HttpAnswer, HttpServer::Serve> {
                                                    if (exchange.headProblem()) {
                                                        return *exchange.headProblem();

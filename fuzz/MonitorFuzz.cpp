@@ -20,9 +20,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     if (!accepted && received.kind != ReceivedMessage::Kind::malformed) {
         std::abort();
     }
-    if (accepted &&
-        (size != sizeof received.message || std::memcmp(&received.message, data, size) != 0 ||
-         received.message.kind < MonitorMessage::Kind::start || received.message.kind > MonitorMessage::Kind::ended)) {
+    if (accepted && (size != sizeof received.message || std::memcmp(&received.message, data, size) != 0 ||
+                     received.message.kind < MonitorMessage::Kind::start ||
+                     received.message.kind > MonitorMessage::Kind::configuration)) {
         std::abort();
     }
     return 0;
