@@ -18,6 +18,12 @@ if [ -f "$set_to.daemon" ]; then
     /usr/bin/setsid /bin/sleep "$(cat "$set_to.daemon")" &
     echo $! >"$root/var/run/$switches.daemon.pid"
 fi
+if [ -f "$set_to.hold" ]; then
+    : >"$set_to.held"
+    while [ -f "$set_to.hold" ]; do
+        /bin/sleep 0.05
+    done
+fi
 if [ -f "$set_to.sleep" ]; then
     /bin/sleep "$(cat "$set_to.sleep")"
 fi

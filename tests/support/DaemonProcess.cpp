@@ -1,5 +1,7 @@
 #include "tests/support/DaemonProcess.h"
 
+#include "tests/support/Eventually.h"
+
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
@@ -19,7 +21,7 @@
 namespace adminhost::test {
 namespace {
 
-constexpr auto patience = std::chrono::seconds(10);
+constexpr auto patience = std::chrono::seconds(30);
 constexpr auto step = std::chrono::milliseconds(5);
 
 std::string readWhole(const std::filesystem::path& path) {
@@ -45,13 +47,6 @@ std::vector<pid_t> childrenOf(pid_t process) {
         children.push_back(pid);
     }
     return children;
-}
-
-/// Returns false for a process that has ended, also if nobody has collected its status.
-bool isRunning(pid_t process) {
-    const std::string text = readWhole("/proc/" + std::to_string(process) + "/stat");
-    const std::size_t name = text.rfind(") ");
-    return name != std::string::npos && text.substr(name + 2, 1) != "Z";
 }
 
 }  // namespace
@@ -185,6 +180,11 @@ bool DaemonProcess::waitForLog(const std::string& text) const {
     return true;
 }
 
+bool DaemonProcess::waitForWaiting(unsigned count) const {
+    const std::string text = "\"waiting\":" + std::to_string(count) + ',';
+    return eventually([&] { return connect().get("/v1/").body.find(text) != std::string::npos; }, patience);
+}
+
 void DaemonProcess::signal(int number) const {
     ::kill(_pid, number);
 }
@@ -202,6 +202,12 @@ std::optional<int> DaemonProcess::wait(std::chrono::milliseconds bound) {
         }
     }
     return _status;
+}
+
+bool isRunning(pid_t process) {
+    const std::string text = readWhole("/proc/" + std::to_string(process) + "/stat");
+    const std::size_t name = text.rfind(") ");
+    return name != std::string::npos && text.substr(name + 2, 1) != "Z";
 }
 
 std::size_t descriptorsOf(pid_t pid) {

@@ -43,12 +43,14 @@ class DaemonProcess {
     [[nodiscard]] UnixHttp connect() const { return UnixHttp(socket()); }
 
     /// The process id of the worker, as the daemon reports it. Waits for a worker that is being started, and returns -1
-    /// if there is none after ten seconds.
+    /// if there is none after 30 seconds.
     [[nodiscard]] pid_t workerPid() const;
     /// Its output on standard error: the log.
     [[nodiscard]] std::string log() const;
-    /// Waits until the log contains the text. Returns false after ten seconds.
+    /// Waits until the log contains the text. Returns false after 30 seconds.
     [[nodiscard]] bool waitForLog(const std::string& text) const;
+    /// Waits until that many requests wait for the running one to end. Returns false after 30 seconds.
+    [[nodiscard]] bool waitForWaiting(unsigned count) const;
 
     void signal(int number) const;
     /// Waits for its end. Returns the exit status, 128 + number if a signal ended it, nullopt if it does not end in
@@ -64,6 +66,8 @@ class DaemonProcess {
     std::optional<int> _status;
 };
 
+/// Returns false for a process that has ended, also if nobody has collected its status.
+[[nodiscard]] bool isRunning(pid_t process);
 /// Open descriptors of a process. Always 0 for a daemon if the test does not run as root.
 [[nodiscard]] std::size_t descriptorsOf(pid_t pid);
 /// Resident memory of a process in kilobytes.

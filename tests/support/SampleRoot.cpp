@@ -1,5 +1,6 @@
 #include "tests/support/SampleRoot.h"
 
+#include "tests/support/Eventually.h"
 #include "tests/support/Program.h"
 
 #include <cerrno>
@@ -134,6 +135,19 @@ void SampleRoot::setSwitch(const std::string& name, const std::string& content) 
 void SampleRoot::clearSwitches() const {
     remove("/etc/demo");
     fs::create_directories(disk("/etc/demo"));
+}
+
+void SampleRoot::hold(const std::string& tool) const {
+    remove("/etc/demo/" + tool + ".held");
+    setSwitch(tool + ".hold", "");
+}
+
+void SampleRoot::release(const std::string& tool) const {
+    remove("/etc/demo/" + tool + ".hold");
+}
+
+bool SampleRoot::waitForHeld(const std::string& tool) const {
+    return eventually([&] { return fs::exists(disk("/etc/demo/" + tool + ".held")); }, std::chrono::seconds(30));
 }
 
 std::optional<int> SampleRoot::daemonLeftBy(const std::string& switchName) const {

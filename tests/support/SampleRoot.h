@@ -67,6 +67,12 @@ class SampleRoot {
     /// Sets a switch of a stand-in, for example ("lumioctl.exit", "3"). See demo/README.md.
     void setSwitch(const std::string& name, const std::string& content) const;
     void clearSwitches() const;
+    /// Lets the stand-in with this switch name ("setup_library") wait in its next run until it is released or the
+    /// switches are cleared, so that a test can act at a known point of an operation.
+    void hold(const std::string& tool) const;
+    void release(const std::string& tool) const;
+    /// Waits until the held stand-in is running. Returns false after 30 seconds.
+    [[nodiscard]] bool waitForHeld(const std::string& tool) const;
     /// The id of the process that a "NAME.daemon" switch left behind; nullopt if it is not running.
     [[nodiscard]] std::optional<int> daemonLeftBy(const std::string& switchName) const;
 

@@ -6,11 +6,9 @@
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 
-#include <chrono>
 #include <fstream>
 #include <sstream>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include <gmock/gmock.h>
@@ -45,19 +43,17 @@ class ControlledService : public testing::Test {
         content << std::ifstream(path).rdbuf();
         return content.str();
     }
-    /// Waits until a write is running in the daemon.
+    /// From now on a write waits in its operation, when it has compared the revision and changed nothing yet.
+    void holdWrite() const { root.hold(heldTool); }
+    /// Waits until a write is held. That the daemon reports it as running is not enough: the worker may not have
+    /// compared the revision.
     void waitForWrite() const {
-        for (int i = 0; i < 1000; ++i) {
-            if (daemon.connect().get("/v1/").body.find("writeSettings\",\"since") != std::string::npos ||
-                daemon.connect().get("/v1/").body.find("\"command\":\"writeSettings\"") != std::string::npos) {
-                return;
-            }
-            std::this_thread::sleep_for(std::chrono::milliseconds(10));
-        }
-        FAIL() << "no write runs: " << daemon.connect().get("/v1/").body;
+        ASSERT_TRUE(root.waitForHeld(heldTool)) << "no write runs: " << daemon.connect().get("/v1/").body;
     }
+    void releaseWrite() const { root.release(heldTool); }
 
   private:
+    static constexpr const char* heldTool = "setup_library";
     const std::string _configuration;  // used while the daemon is started
 
   protected:

@@ -1,7 +1,9 @@
 // Writes whose answer is lost: the outcome is determined and reported, and nothing is written a second time.
 
+#include "tests/support/Eventually.h"
 #include "tests/system/apply/ControlledService.h"
 
+#include <algorithm>
 #include <array>
 #include <csignal>
 
@@ -44,13 +46,18 @@ class RunningCtl {
     RunningCtl& operator=(const RunningCtl&) = delete;
 
     void signal(int number) const { ::kill(_pid, number); }
+    /// Reads its output until the text has come.
+    void waitFor(const std::string& text) {
+        while (_text.find(text) == std::string::npos) {
+            ASSERT_TRUE(readSome()) << "it has ended: " << _text;
+        }
+    }
     /// Its whole output and its status; 128 + number if a signal ended it.
     ProgramResult wait() {
-        ProgramResult result;
-        std::array<char, 4096> bytes{};
-        for (ssize_t count = 0; (count = ::read(_output, bytes.data(), bytes.size())) > 0;) {
-            result.output.append(bytes.data(), static_cast<std::size_t>(count));
+        while (readSome()) {
         }
+        ProgramResult result;
+        result.output = _text;
         int status = 0;
         EXPECT_EQ(::waitpid(_pid, &status, 0), _pid);
         result.status = WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status);
@@ -58,8 +65,17 @@ class RunningCtl {
     }
 
   private:
+    /// Returns false at the end of the output.
+    bool readSome() {
+        std::array<char, 4096> bytes{};
+        const ssize_t count = ::read(_output, bytes.data(), bytes.size());
+        _text.append(bytes.data(), static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
+        return count > 0;
+    }
+
     pid_t _pid = -1;
     int _output = -1;
+    std::string _text;
 };
 
 class LostAnswers : public ControlledService {
@@ -76,7 +92,7 @@ class LostAnswers : public ControlledService {
 
 class Deadline : public LostAnswers {
   protected:
-    Deadline() : LostAnswers("request_deadline_seconds = 2\n") {}
+    Deadline() : LostAnswers("request_deadline_seconds = 5\n") {}
 };
 
 TEST_F(Deadline, ApplyReportsWhatWasWrittenBeforeItAndWhatWasNot) {
@@ -101,7 +117,7 @@ TEST_F(Deadline, CommandReportsThatTheRequestHasEnded) {
 
 TEST_F(LostAnswers, KilledWorkerIsReportedAndNothingIsWrittenTwice) {
     root.recordToolCalls();
-    root.setSwitch("setup_library.sleep", "30");
+    holdWrite();
     RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
     waitForWrite();
     ::kill(daemon.workerPid(), SIGKILL);
@@ -113,7 +129,7 @@ TEST_F(LostAnswers, KilledWorkerIsReportedAndNothingIsWrittenTwice) {
 }
 
 TEST_F(LostAnswers, StateThatCannotBeReadBackCompletelyLeavesItUndetermined) {
-    root.setSwitch("setup_library.sleep", "30");
+    holdWrite();
     // A verb that concerns one setting would not read the access lists.
     RunningCtl set(daemon.socket(), {"apply", file("port.toml", "[settings]\nserver_port = 8180\n")});
     waitForWrite();
@@ -127,13 +143,17 @@ TEST_F(LostAnswers, StateThatCannotBeReadBackCompletelyLeavesItUndetermined) {
 }
 
 TEST_F(LostAnswers, DaemonThatIsGoneLeavesItUndetermined) {
-    root.setSwitch("setup_library.sleep", "30");
+    holdWrite();
     RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
     waitForWrite();
     const pid_t front = daemon.frontPid();
+    const pid_t worker = daemon.workerPid();
     daemon.signal(SIGKILL);
     ::kill(front, SIGKILL);
     const ProgramResult result = set.wait();
+    releaseWrite();
+    EXPECT_TRUE(eventually([&] { return !isRunning(worker); }, std::chrono::seconds(30)))
+        << "it finishes the write and ends";
     EXPECT_EQ(result.status, 6);
     EXPECT_THAT(result.output,
                 AllOf(HasSubstr("the connection to the daemon was lost"), HasSubstr("the daemon cannot be reached"),
@@ -141,10 +161,12 @@ TEST_F(LostAnswers, DaemonThatIsGoneLeavesItUndetermined) {
 }
 
 TEST_F(LostAnswers, InterruptedWriteIsReportedAndTheProgramEndsByTheSignal) {
-    root.setSwitch("setup_library.sleep", "2");
+    holdWrite();
     RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
     waitForWrite();
     set.signal(SIGINT);
+    set.waitFor("interrupted");
+    releaseWrite();
     const ProgramResult result = set.wait();
     EXPECT_EQ(result.status, 128 + SIGINT) << result.output;
     EXPECT_THAT(result.output, AllOf(HasSubstr("interrupted"), HasSubstr("has ended; it was not repeated"),

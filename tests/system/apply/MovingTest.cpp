@@ -87,10 +87,11 @@ TEST_F(Moving, ListsAreNotChangedWhenTheStateIsNotReadCompletelyAfterTheMove) {
     ASSERT_NE(at, std::string::npos);
     _text.replace(at, 12, "value = \"fr\"");
     const std::string desired = file("desired.toml", _text);
-    root.setSwitch("setup_library.sleep", "2");
+    holdWrite();
     std::future<ProgramResult> apply = std::async(std::launch::async, [&] { return ctl({"apply", desired}); });
     waitForWrite();
     root.sql("alter table access_control_entries rename to gone");
+    releaseWrite();
     const ProgramResult result = apply.get();
     EXPECT_EQ(result.status, 1);
     EXPECT_THAT(result.output, HasSubstr("parts of the state could not be read:\n  not read: the access list ("));

@@ -3,6 +3,8 @@
 #include "platform/json/Json.h"
 #include "tests/system/apply/ControlledService.h"
 
+#include <future>
+
 namespace adminhost::test {
 namespace {
 
@@ -23,18 +25,15 @@ class Outcomes : public ControlledService {
     /// Runs a verb whose state is changed by `other` after it has been read and before it is written. The other
     /// client's write waits in the queue behind the verb's first read.
     ProgramResult overtaken(const std::vector<std::string>& words, const std::string& other) const {
-        root.setSwitch("setup_preferences.sleep", "1");
-        ProgramResult result;
-        std::thread changing([&] { result = ctl(words); });
-        for (int i = 0; i < 2000 && daemon.connect().get("/v1/").body.find("readSettings\",\"uid") == std::string::npos;
-             ++i) {
-            std::this_thread::sleep_for(std::chrono::milliseconds(5));
-        }
-        EXPECT_EQ(UnixHttp(daemon.socket(), std::chrono::seconds(30)).post("/v1/lumio/writeSettings", other).status,
-                  200);
-        root.clearSwitches();
-        changing.join();
-        return result;
+        root.hold("setup_preferences");
+        std::future<ProgramResult> result = std::async(std::launch::async, [&] { return ctl(words); });
+        EXPECT_TRUE(root.waitForHeld("setup_preferences"));
+        UnixHttp client(daemon.socket(), std::chrono::seconds(60));
+        client.begin("POST", "/v1/lumio/writeSettings", other);
+        EXPECT_TRUE(daemon.waitForWaiting(1));
+        root.release("setup_preferences");
+        EXPECT_EQ(client.reply().status, 200);
+        return result.get();
     }
 };
 

@@ -1,9 +1,11 @@
 #include "platform/task/Task.h"
+#include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
 
 #include <chrono>
 #include <csignal>
 #include <filesystem>
+#include <future>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -14,6 +16,7 @@ namespace {
 using adminhost::DiskPath;
 using adminhost::launch_task;
 using adminhost::launch_task_with_input_and_environment;
+using adminhost::test::runProgram;
 using adminhost::test::SampleRoot;
 using adminhost::test::ToolCall;
 using testing::ElementsAre;
@@ -77,6 +80,17 @@ TEST_F(StandIns, SwitchesGiveOutputErrorAndStatusInsteadOfTheToolsWork) {
 TEST_F(StandIns, SwitchKillsTheToolByASignal) {
     root.setSwitch("setup_preferences.signal", "SEGV");
     EXPECT_EQ(run(setupPreferences, {}), 128 + SIGSEGV);
+}
+
+TEST_F(StandIns, HeldToolBeginsItsWorkWhenItIsReleased) {
+    root.remove("/var/lumio");
+    root.hold("setup_preferences");
+    auto running = std::async(std::launch::async, [&] { return runProgram({root.disk(setupPreferences)}); });
+    ASSERT_TRUE(root.waitForHeld("setup_preferences"));
+    EXPECT_FALSE(std::filesystem::exists(root.disk("/var/lumio")));
+    root.release("setup_preferences");
+    EXPECT_EQ(running.get().status, 0);
+    EXPECT_TRUE(std::filesystem::exists(root.disk("/var/lumio/server")));
 }
 
 TEST_F(StandIns, SwitchLeavesADaemonThatHoldsThePipes) {

@@ -109,10 +109,11 @@ TEST_F(LdapSite, PeopleAreNotShownAsRemovedWhenTheServerFailsWithinTheWrite) {
     const std::string desired =
         file("desired.toml", "[settings]\nserver_port = 8180\n[remove_unlisted]\naccess = true\n[workflows." + uuid +
                                  "]\nusers = []\n");
-    root.setSwitch("setup_library.sleep", "3");
+    holdWrite();
     std::future<ProgramResult> apply = std::async(std::launch::async, [&] { return ctl({"apply", desired}); });
     waitForWrite();
     slapd.stop();
+    releaseWrite();
     const ProgramResult result = apply.get();
     EXPECT_EQ(result.status, 1);
     EXPECT_THAT(result.output, ContainsRegex("workflows[^\n]*users.greta: [^\n]*FAILED: [^\n]*not removed"));

@@ -282,17 +282,17 @@ TEST_F(GridPassword, CommandLineReadsItFromFilesAndShowsItNowhere) {
 }
 
 TEST_F(GridPassword, NothingShowsItWhileTheRequestRuns) {
-    root.setSwitch("setup_library.sleep", "2");
+    root.hold("setup_library");
     UnixHttp client(daemon->socket(), std::chrono::seconds(60));
     client.begin("POST", writeSettings, bodyWith());
-    for (int i = 0; i < 1000 && !fs::exists(recordOf(1)); ++i) {
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
+    ASSERT_TRUE(root.waitForHeld("setup_library"));
+    EXPECT_TRUE(fs::exists(recordOf(1)));
     EXPECT_GE(processesFrom(daemon->pid()).size(), 3U) << "the front, the worker and the script";
     checkProcesses();
     const HttpReply overview = daemon->connect().get("/v1/");
     EXPECT_THAT(overview.body, HasSubstr("\"running\""));
     EXPECT_FALSE(holdsPlanted(overview.body));
+    root.release("setup_library");
     EXPECT_EQ(checked(client.reply()).status, 200);
 }
 

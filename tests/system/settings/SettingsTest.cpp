@@ -12,8 +12,8 @@
 #include <csignal>
 #include <filesystem>
 #include <fstream>
+#include <future>
 #include <iterator>
-#include <thread>
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -254,20 +254,19 @@ TEST_F(Settings, RollbackNamesSettingsThatWereNotSetThenAndNotesThatThePasswordS
 
 TEST_F(Settings, RollbackOfSettingsThatAnotherClientChangesMeanwhileIsRefused) {
     ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
-    root.setSwitch("setup_preferences.sleep", "1");
-    ProgramResult rollback;
-    std::thread restoring([&] { rollback = ctl({"rollback", "1"}); });
+    root.hold("setup_preferences");
+    std::future<ProgramResult> restoring = std::async(std::launch::async, [&] { return ctl({"rollback", "1"}); });
+    ASSERT_TRUE(root.waitForHeld("setup_preferences"));
     // The other client's write waits in the queue behind the rollback's first read, so it runs before the rollback's
     // write.
-    for (int i = 0; i < 2000 && daemon.connect().get("/v1/").body.find("readSettings\",\"uid") == std::string::npos;
-         ++i) {
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    EXPECT_EQ(post("writeSettings", R"({"configuration":{"server_host":"other"}})").status, 200);
-    restoring.join();
+    test::UnixHttp client(daemon.socket(), std::chrono::seconds(60));
+    client.begin("POST", "/v1/lumio/writeSettings", R"({"configuration":{"server_host":"other"}})");
+    EXPECT_TRUE(daemon.waitForWaiting(1));
+    root.release("setup_preferences");
+    EXPECT_EQ(client.reply().status, 200);
+    const ProgramResult rollback = restoring.get();
     EXPECT_EQ(rollback.status, 7);
     EXPECT_THAT(rollback.output, HasSubstr("REVISION_CHANGED"));
-    root.clearSwitches();
     EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "9001\n");
     EXPECT_EQ(ctl({"settings", "get", "server_host"}).output, "other\n");
 }
