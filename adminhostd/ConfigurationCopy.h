@@ -12,7 +12,7 @@
 namespace adminhost {
 
 struct ConfigurationText {
-    std::string path;  ///< on disk; empty: there is no file
+    std::string path;  ///< on disk; empty without a configuration file
     std::string text;
 };
 

@@ -25,7 +25,7 @@ class EventClients {
     /// Answers the request now, if there is something new or nothing can be waited for, or later. `all`: the client may
     /// see the details of every request.
     void serve(Exchange& exchange, bool all);
-    /// Adds the events of a request that has ended, and answers the clients that wait.
+    /// Adds the events of a request that has ended, and sends them to the waiting clients.
     void add(const RequestRecord& record);
 
     [[nodiscard]] std::size_t waiting() const noexcept { return _clients.size(); }

@@ -55,7 +55,7 @@ class AscendingIds {
     explicit AscendingIds(std::span<const std::string> columns)
         : _column(static_cast<std::size_t>(std::find(columns.begin(), columns.end(), "id") - columns.begin())) {}
 
-    /// Returns true if the row's id is a number that is greater than the one before, or there is no such column.
+    /// Returns true if the row's id is a number greater than the last one, or if the rows have no id.
     [[nodiscard]] bool accept(std::span<const std::string_view> values) {
         if (_column >= values.size()) {
             return true;

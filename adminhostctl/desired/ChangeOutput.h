@@ -3,7 +3,7 @@
 // Prints plans and the outcomes of writes: lines for people, one document for programs.
 
 #include "adminhostctl/Verb.h"
-#include "adminhostctl/desired/Plan.h"
+#include "adminhostctl/desired/PlanOutcome.h"
 
 #include <optional>
 #include <string>

@@ -23,6 +23,17 @@ class Queue : public ::testing::Test {
         client.begin("POST", "/v1/fixture/" + command, jsonOf(Dictionary{{"script", script}}), headers);
         return client;
     }
+    /// Begins so many identical reads, one client each, and waits until all of them wait.
+    [[nodiscard]] std::vector<UnixHttp> beginReads(std::uint64_t count, const std::string& command,
+                                                   const std::string& body) const {
+        std::vector<UnixHttp> clients;
+        while (clients.size() < count) {
+            clients.push_back(daemon.connect());
+            clients.back().begin("POST", "/v1/fixture/" + command, body);
+        }
+        waitUntilSoManyWait(count);
+        return clients;
+    }
     /// A script that adds a word to the list of those that ran.
     [[nodiscard]] std::string mark(const std::string& word) const { return "echo " + word + " >> " + list; }
     [[nodiscard]] std::string ran() const {
@@ -207,12 +218,7 @@ TEST_F(Queue, IdenticalReadsWithAWriteBetweenThemRunEachForItself) {
 
 TEST_F(Queue, ReportsOfASharedRunBelongToEachOfItsRequests) {
     UnixHttp sleeper = startSleeping(daemon, 1000);
-    std::vector<UnixHttp> readers;
-    for (int i = 0; i < 2; ++i) {
-        readers.push_back(daemon.connect());
-        readers.back().begin("POST", "/v1/fixture/report", R"({"parts": 2})");
-    }
-    waitUntilSoManyWait(2);
+    std::vector<UnixHttp> readers = beginReads(2, "report", R"({"parts": 2})");
     EXPECT_EQ(sleeper.reply().status, 200);
     for (UnixHttp& reader : readers) {
         const HttpReply reply = reader.reply();
@@ -242,12 +248,7 @@ TEST_F(Queue, CancellingOneOfASharedRunLeavesTheOthersTheirAnswer) {
 
 TEST_F(Queue, LargeAnswerOfASharedRunReachesEveryClient) {
     UnixHttp sleeper = startSleeping(daemon, 1000);
-    std::vector<UnixHttp> readers;
-    for (int i = 0; i < 4; ++i) {
-        readers.push_back(daemon.connect());
-        readers.back().begin("POST", "/v1/fixture/large", R"({"bytes": 30000000})");
-    }
-    waitUntilSoManyWait(4);
+    std::vector<UnixHttp> readers = beginReads(4, "large", R"({"bytes": 30000000})");
     EXPECT_EQ(sleeper.reply().status, 200);
     for (UnixHttp& reader : readers) {
         EXPECT_GT(reader.reply().body.size(), 30'000'000U) << "together they are above the bound on unread answers";

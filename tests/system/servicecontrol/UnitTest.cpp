@@ -4,6 +4,7 @@
 // units for it: there the same requests are made to a daemon without restrictions.
 
 #include "platform/json/Json.h"
+#include "tests/support/AdministratorTree.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Eventually.h"
 #include "tests/support/Program.h"
@@ -35,22 +36,6 @@ constexpr const char* service = "adminhostd.service";
 constexpr const char* socketUnit = "adminhostd.socket";
 constexpr const char* administratorsPassword = "a password";
 
-constexpr const char* tree = R"(dn: dc=nimbo,dc=test
-objectClass: domain
-dc: nimbo
-
-dn: ou=people,dc=nimbo,dc=test
-objectClass: organizationalUnit
-ou: people
-
-dn: uid=writer,ou=people,dc=nimbo,dc=test
-objectClass: account
-objectClass: simpleSecurityObject
-uid: writer
-userPassword: a password
-
-)";
-
 std::string textOf(const fs::path& path) {
     std::ifstream file(path);
     return {std::istreambuf_iterator<char>(file), {}};
@@ -74,7 +59,7 @@ std::string changed(const std::string& unit,
 class DaemonUnit : public testing::Test {
   protected:
     void SetUp() override {
-        server.add(tree);
+        server.add(administratorTree(administratorsPassword));
         fs::create_directory(root.directory() + "/daemon");
         const std::string configuration =
             "service_manager = \"pidfile\"\naccount = \"nobody\"\n[[directory.node]]\nname = "

@@ -1,5 +1,5 @@
 #include "adminhostctl/Failure.h"
-#include "adminhostctl/desired/Plan.h"
+#include "adminhostctl/desired/PlanOutcome.h"
 #include "adminhostctl/desired/Toml.h"
 #include "tests/unit/adminhostctl/Describe.h"
 
