@@ -40,6 +40,7 @@ void Description::Keys::add(const Value& described) {
     description.section = key->text("section");
     description.file = key->text("file");
     description.locates = textsAt(*key, "locates");
+    description.ofHost = key->get("ofHost").boolean().value_or(false);
     description.restart = textsAt(*key, "restart");
     description.lookedUp = key->text("lookedUp");
     description.shownBy = key->text("shownBy");

@@ -37,6 +37,7 @@ struct DescribedKey {
     std::string section;                  ///< table of a file: of plain values, of a list's elements
     std::string file;                     ///< of a setting: the settings file that holds it
     std::vector<std::string> locates;     ///< of a setting: files that move when it changes
+    bool ofHost = false;                  ///< of a setting: part of the identity of one host
     std::vector<std::string> restart;     ///< of a setting: commands to run for it to take effect
     std::string lookedUp;                 ///< of a setting: which values a write replaces
     std::string shownBy;                  ///< of a secret setting: the key that shows whether it is set

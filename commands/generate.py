@@ -51,7 +51,7 @@ COMMAND_WORDS = {"order", "summary", "description", "access", "needs", "deadline
                  "errors", "keys", "answer", "include", "example"}
 # Words for programs that compare and write a desired state (README.md).
 STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_file", "kind", "kinds", "secret_if", "file",
-               "localized", "other_names", "locates", "restart", "looked_up", "shown_by"}
+               "localized", "of_host", "other_names", "locates", "restart", "looked_up", "shown_by"}
 # Unit and sensible range of a setting's number; described where the setting is read.
 RANGE_WORDS = {"unit", "minimum", "maximum"}
 KEY_WORDS = {"type", "entered_as", "filled_with", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"} | STATE_WORDS | RANGE_WORDS

@@ -2,10 +2,13 @@
 
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/RequestArguments.h"
+#include "adminhostctl/SecretFile.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/Toml.h"
+#include "platform/value/ValueText.h"
 
 #include <algorithm>
+#include <filesystem>
 #include <optional>
 #include <set>
 
@@ -13,121 +16,30 @@
 #include <toml++/toml.h>
 
 namespace adminhost::ctl {
-namespace {
-
-constexpr std::string_view switchesTable = "remove_unlisted";
-
-/// Text of a comment: one line.
-std::string comment(const std::string& text) {
-    return "# " + text + '\n';
-}
-
-std::string introduction(const StateForm& form) {
-    std::string text =
-        "# The desired state: \"adminhostctl plan FILE\" shows what would change, \"adminhostctl apply FILE\" changes "
-        "it.\n"
-        "# What is not listed stays as it is, unless a switch here says otherwise.\n"
-        "\n";
-    text += "[" + std::string(switchesTable) + "]\n";
-    for (const std::string& name : form.switches()) {
-        text += tomlKey(name) + " = false\n";
-    }
-    return text;
-}
-
-std::vector<std::string> labelsOf(const std::vector<Person>& people, std::string_view kind) {
-    std::vector<std::string> labels;
-    for (const Person& person : people) {
-        if (person.kind == kind && !person.label.empty()) {
-            labels.push_back(person.label);
-        }
-    }
-    std::sort(labels.begin(), labels.end());
-    labels.erase(std::unique(labels.begin(), labels.end()), labels.end());
-    return labels;
-}
-
-std::string listText(const std::vector<std::string>& texts) {
-    std::string list;
-    for (const std::string& text : texts) {
-        list += (list.empty() ? "" : ", ") + tomlText(text);
-    }
-    return '[' + list + ']';
-}
-
-/// The name of the element in a file: its label, or its identity if the label is not unique or is localized; nullopt if
-/// neither can be used.
-std::optional<std::string> nameOf(const State& state, const ListForm& list, const Element& element) {
-    try {
-        if (!list.localized && !element.label.empty() && findElement(state, list, element.label) == &element) {
-            return element.label;
-        }
-    } catch (const Failure&) {
-        // several have the label
-    }
-    // Two rows may have one identity; a file can name only the first.
-    return list.byIdentity && findElement(state, list, element.identity) == &element ? std::optional(element.identity)
-                                                                                     : std::nullopt;
-}
-
-void appendElement(std::string& text, const ListForm& list, const std::string& name, const Element& element) {
-    text += "\n[" + tomlKey(list.section) + '.' + tomlKey(name) + "]\n";
-    if (!element.label.empty() && name != element.label) {
-        text += comment("name: " + tomlText(element.label));
-    }
-    for (std::size_t i = 0; element.label.empty() && i < element.otherNames.size(); ++i) {
-        text += comment(list.otherNames[i] + ": " + tomlText(element.otherNames[i]));
-    }
-    for (const FieldForm& field : list.fields) {
-        const Value& value = element.fields.get(field.key);
-        if (isSecret(field, element)) {
-            text += comment(tomlKey(field.inFile) + " = (secret)");
-        } else if (const auto written = tomlValue(value)) {
-            text += tomlKey(field.inFile) + " = " + *written + '\n';
-        }
-    }
-    for (const PeopleForm& people : list.people) {
-        for (const auto& [kind, inFile] : people.kinds) {
-            text += tomlKey(inFile) + " = " + listText(labelsOf(element.people.at(people.key), kind)) + '\n';
-        }
-    }
-}
-
-void appendSection(std::string& text, const State& state, const ListForm& list) {
-    std::vector<std::pair<std::string, const Element*>> sorted;
-    for (const Element& element : elementsOf(state, list)) {
-        sorted.emplace_back(nameOf(state, list, element).value_or(element.label), &element);
-    }
-    std::stable_sort(sorted.begin(), sorted.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
-    for (const auto& [name, element] : sorted) {
-        if (nameOf(state, list, *element)) {
-            appendElement(text, list, name, *element);
-        } else {
-            text += '\n' + comment(tomlKey(list.section) + '.' + tomlKey(name) + ", " + element->identity +
-                                   ": not managed here, other elements may have this name");
-        }
-    }
-}
 
 /// A node with its line and column for messages.
-class Node {
+class FileNode {
   public:
-    Node(const std::string& from, std::string path, const toml::node& node)
+    FileNode(const std::string& from, std::string path, const toml::node& node)
         : _from(from), _path(std::move(path)), _node(node) {}
 
-    [[noreturn]] void fail(const std::string& what) const {
-        const toml::source_position place = _node.source().begin;
-        throw usageError(fmt::format("{}, line {}, column {}: {} {}", _from, place.line, place.column, _path, what));
+    /// "host.toml, line 2, column 15".
+    [[nodiscard]] std::string place() const {
+        const toml::source_position begin = _node.source().begin;
+        return fmt::format("{}, line {}, column {}", _from, begin.line, begin.column);
     }
-    [[nodiscard]] std::vector<std::pair<std::string, Node>> entries() const {
+    [[noreturn]] void fail(const std::string& what) const {
+        throw usageError(fmt::format("{}: {} {}", place(), _path, what));
+    }
+    [[nodiscard]] std::vector<std::pair<std::string, FileNode>> entries() const {
         const toml::table* table = _node.as_table();
         if (table == nullptr) {
             fail("must be a table: [" + _path + "]");
         }
-        std::vector<std::pair<std::string, Node>> all;
+        std::vector<std::pair<std::string, FileNode>> all;
         for (const auto& [key, node] : *table) {
             all.emplace_back(std::string(key.str()),
-                             Node(_from, (_path.empty() ? "" : _path + '.') + tomlKey(key.str()), node));
+                             FileNode(_from, (_path.empty() ? "" : _path + '.') + tomlKey(key.str()), node));
         }
         return all;
     }
@@ -139,19 +51,28 @@ class Node {
         const auto value = _node.value_exact<std::string>();
         return value ? *value : (fail("must be a text in quotes"), std::string());
     }
-    [[nodiscard]] std::vector<std::string> texts() const {
+    /// The names of a list, each with its place.
+    [[nodiscard]] std::vector<std::pair<std::string, std::string>> names() const {
         const toml::array* array = _node.as_array();
         if (array == nullptr) {
             fail("must be a list of names: [\"anna\", \"ben\"]");
         }
-        std::vector<std::string> all;
+        std::vector<std::pair<std::string, std::string>> all;
         for (const toml::node& element : *array) {
-            all.push_back(Node(_from, "an entry of " + _path, element).text());
-            if (all.back().empty()) {
+            const FileNode entry(_from, "an entry of " + _path, element);
+            all.emplace_back(entry.text(), entry.place());
+            if (all.back().first.empty()) {
                 fail("is an empty name");
             }
         }
         return all;
+    }
+    /// The secret in the file that the text names, which is relative to the directory of this file.
+    [[nodiscard]] std::string secret() const {
+        const std::filesystem::path directory = std::filesystem::path(_from == "-" ? "" : _from).parent_path();
+        auto secret = secretOfFile((directory / text()).string());
+        return secret ? *std::move(secret)
+                      : (fail("cannot be used: " + textOf(secret.error().description)), std::string());
     }
     [[nodiscard]] Value value() const {
         if (const auto text = _node.value_exact<std::string>()) {
@@ -182,6 +103,10 @@ class Node {
     const toml::node& _node;
 };
 
+namespace {
+
+constexpr std::string_view fileSuffix = "_file";  ///< of the key that names the file with a text
+
 /// Returns true if a setting can hold the value: it has the described type, or the type of the stored value.
 bool fits(const DescribedKey& key, const Value& value, const Value& stored) {
     if (value.type() == stored.type()) {
@@ -203,8 +128,7 @@ std::string joined(const std::vector<std::string>& words) {
     return text;
 }
 
-void parseSetting(Wanted& wanted, const std::string& key, const Node& node, const StateForm& form, const State& state,
-                  bool force) {
+Value settingOf(const std::string& key, const FileNode& node, const StateForm& form, const State& state, bool force) {
     if (form.secret(key) != nullptr) {
         node.fail("is a secret, which a file must not hold; use --password-file FILE");
     }
@@ -225,55 +149,58 @@ void parseSetting(Wanted& wanted, const std::string& key, const Node& node, cons
     if (const std::string problem = rangeProblem(*described, value); !problem.empty() && !force && value != stored) {
         node.fail(problem + "; --force writes it nevertheless");
     }
-    wanted.settings.set(key, std::move(value));
+    return value;
 }
 
-WantedElement parseElement(const ListForm& list, const std::string& name, const Node& table) {
-    WantedElement element{name, {}, {}, {}, false, false};
+/// The text field that the key of a file with a secret stands for; null for another key.
+const FieldForm* fieldOfFile(const ListForm& list, std::string_view key) {
+    if (!key.ends_with(fileSuffix)) {
+        return nullptr;
+    }
+    const FieldForm* field = list.fieldInFile(key.substr(0, key.size() - fileSuffix.size()));
+    return field == nullptr || field->secretIf.empty() ? nullptr : field;
+}
+
+std::vector<std::string> keysOf(const ListForm& list) {
     std::vector<std::string> known;
     for (const FieldForm& field : list.fields) {
         known.push_back(field.inFile);
+        if (!field.secretIf.empty()) {
+            known.push_back(field.inFile + std::string(fileSuffix));
+        }
     }
     for (const PeopleForm& people : list.people) {
         for (const auto& [kind, inFile] : people.kinds) {
             known.push_back(inFile);
         }
     }
+    return known;
+}
+
+/// Adds the keys of the table to the element, in place of those that an earlier file has given.
+void readElement(WantedElement& element, const ListForm& list, const FileNode& table) {
+    element.place = table.place();
+    std::set<const FieldForm*> given;
     for (const auto& [key, node] : table.entries()) {
-        const FieldForm* field = list.fieldInFile(key);
-        if (field != nullptr) {
-            element.fields.set(field->key, field->boolean ? Value(node.flag()) : Value(node.text()));
-        } else if (std::find(known.begin(), known.end(), key) != known.end()) {
-            element.lists[key] = node.texts();
+        const FieldForm* const field = list.fieldInFile(key);
+        const FieldForm* const ofFile = field == nullptr ? fieldOfFile(list, key) : nullptr;
+        if (field != nullptr || ofFile != nullptr) {
+            const FieldForm& text = field != nullptr ? *field : *ofFile;
+            if (!given.insert(&text).second) {
+                node.fail("is the same as " + text.inFile + ", of which only one can be given");
+            }
+            element.fields.set(text.key, text.boolean        ? Value(node.flag())
+                                         : ofFile != nullptr ? Value(node.secret())
+                                                             : Value(node.text()));
+        } else if (list.isPeople(key)) {
+            element.lists[key].clear();
+            element.places[key].clear();
+            for (auto& [name, place] : node.names()) {
+                element.lists[key].push_back(std::move(name));
+                element.places[key].push_back(std::move(place));
+            }
         } else {
-            node.fail("is unknown; the keys here are " + joined(known));
-        }
-    }
-    return element;
-}
-
-void parseSwitch(Wanted& wanted, const std::string& key, const Node& node, const StateForm& form) {
-    const std::vector<std::string> switches = form.switches();
-    if (std::find(switches.begin(), switches.end(), key) == switches.end()) {
-        node.fail("is unknown; the switches are " + joined(switches));
-    }
-    if (node.flag()) {
-        wanted.removeUnlisted.insert(key);
-    }
-}
-
-void parseSection(Wanted& wanted, const ListForm& list, const Node& table, const State& state) {
-    std::set<const Element*> present;
-    for (const auto& [name, node] : table.entries()) {
-        wanted.elements[list.section].push_back(parseElement(list, name, node));
-        const Element* element = findElement(state, list, name);
-        if (element == nullptr && list.addedBy.empty()) {
-            node.fail(list.localized ? "not found in the service; a file names " + list.section +
-                                           " by their identities, which \"adminhostctl export\" lists"
-                                     : "not found in the service; \"adminhostctl export\" lists the names");
-        }
-        if (element != nullptr && !present.insert(element).second) {
-            node.fail("is in the file twice, by its name and by its identity");
+            node.fail("is unknown; the keys here are " + joined(keysOf(list)));
         }
     }
 }
@@ -290,53 +217,83 @@ toml::table parsed(std::string_view text, const std::string& from) {
 
 }  // namespace
 
-std::string exportOf(const StateForm& form, const State& state) {
-    std::string text = introduction(form);
-    text += "\n[" + tomlKey(form.settingsSection()) + "]\n";
-    for (const DescribedKey& key : form.settings()) {
-        const std::string name = form.nameOf(key);
-        const Value& value = state.settings.get(name);
-        if (value.isNull()) {
-            continue;
+DesiredFiles::DesiredFiles(const StateForm& form, const State& state, Options options)
+    : _form(form), _state(state), _options(std::move(options)) {
+    _wanted.only = _options.only;
+}
+
+bool DesiredFiles::isChosen(const std::string& section) const {
+    return _options.only.empty() || _options.only.contains(section);
+}
+
+void DesiredFiles::add(std::string_view text, const std::string& from) {
+    const toml::table table = parsed(text, from);
+    std::vector<std::string> known{_form.settingsSection()};
+    for (const ListForm& list : _form.lists()) {
+        known.push_back(list.section);
+    }
+    known.emplace_back(switchesTable);
+    for (const auto& [section, content] : FileNode(from, "", table).entries()) {
+        if (std::find(known.begin(), known.end(), section) == known.end()) {
+            content.fail("is unknown; the tables are " + joined(known));
         }
-        const auto written = tomlValue(value);
-        text +=
-            written
-                ? tomlKey(name) + " = " + *written + '\n'
-                : comment(tomlKey(name) + ": a " + std::string(adminhost::nameOf(value.type())) + ", not managed here");
+        if (section == switchesTable) {
+            for (const auto& [key, node] : content.entries()) {
+                addSwitch(key, node);
+            }
+        } else if (!isChosen(section)) {
+            continue;
+        } else if (section == _form.settingsSection()) {
+            for (const auto& [key, node] : content.entries()) {
+                _wanted.settings.set(key, settingOf(key, node, _form, _state, _options.force));
+            }
+        } else {
+            addElements(_form.list(section), content);
+        }
     }
-    for (const ListForm& list : form.lists()) {
-        appendSection(text, state, list);
+}
+
+void DesiredFiles::addSwitch(const std::string& key, const FileNode& node) {
+    const std::vector<std::string> switches = _form.switches();
+    if (std::find(switches.begin(), switches.end(), key) == switches.end()) {
+        node.fail("is unknown; the switches are " + joined(switches));
     }
-    return text;
+    if (node.flag()) {
+        _wanted.removeUnlisted.insert(key);
+    } else {
+        _wanted.removeUnlisted.erase(key);
+    }
+}
+
+void DesiredFiles::addElements(const ListForm& list, const FileNode& table) {
+    std::vector<WantedElement>& elements = _wanted.elements[list.section];
+    std::set<const Element*> present;
+    for (const auto& [name, node] : table.entries()) {
+        const Element* element = findElement(_state, list, name);
+        if (element == nullptr && list.addedBy.empty()) {
+            node.fail(list.localized ? "not found in the service; a file names " + list.section +
+                                           " by their identities, which \"adminhostctl export\" lists"
+                                     : "not found in the service; \"adminhostctl export\" lists the names");
+        }
+        if (element != nullptr && !present.insert(element).second) {
+            node.fail("is in the file twice, by its name and by its identity");
+        }
+        // An earlier file may name it in the other way.
+        auto found = std::find_if(elements.begin(), elements.end(), [&, &wanted = name](const WantedElement& one) {
+            return one.name == wanted || (element != nullptr && findElement(_state, list, one.name) == element);
+        });
+        if (found == elements.end()) {
+            found = elements.insert(found, WantedElement{name, {}, {}, {}, false, false});
+        }
+        readElement(*found, list, node);
+    }
 }
 
 Wanted parseDesired(std::string_view text, const std::string& from, const StateForm& form, const State& state,
                     bool force) {
-    const toml::table table = parsed(text, from);
-    std::vector<std::string> known{form.settingsSection()};
-    for (const ListForm& list : form.lists()) {
-        known.push_back(list.section);
-    }
-    known.emplace_back(switchesTable);
-    Wanted wanted;
-    for (const auto& [section, content] : Node(from, "", table).entries()) {
-        if (std::find(known.begin(), known.end(), section) == known.end()) {
-            content.fail("is unknown; the tables are " + joined(known));
-        }
-        if (section != form.settingsSection() && section != switchesTable) {
-            parseSection(wanted, form.list(section), content, state);
-            continue;
-        }
-        for (const auto& [key, node] : content.entries()) {
-            if (section == switchesTable) {
-                parseSwitch(wanted, key, node, form);
-            } else {
-                parseSetting(wanted, key, node, form, state, force);
-            }
-        }
-    }
-    return wanted;
+    DesiredFiles files(form, state, {.force = force});
+    files.add(text, from);
+    return files.wanted();
 }
 
 }  // namespace adminhost::ctl

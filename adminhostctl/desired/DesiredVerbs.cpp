@@ -7,11 +7,16 @@
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/DesiredFile.h"
 #include "adminhostctl/desired/Explain.h"
+#include "adminhostctl/desired/ExportedFile.h"
+#include "adminhostctl/desired/KnownPeople.h"
 #include "adminhostctl/desired/LookingBack.h"
 #include "adminhostctl/desired/Trial.h"
 #include "adminhostctl/desired/Writing.h"
 
+#include <algorithm>
 #include <array>
+#include <set>
+#include <sstream>
 
 namespace adminhost::ctl {
 namespace {
@@ -19,20 +24,84 @@ namespace {
 using Words = std::span<const std::string>;
 
 constexpr std::string_view validateOption = "--validate";
+constexpr std::string_view onlyOption = "--only";
+constexpr std::string_view exitCodeOption = "--exit-code";
+constexpr std::size_t mostFiles = 100;
 
-/// The desired state from the file and the password file.
-Wanted wantedOf(const Context& context, const std::string& file, const CurrentState& current) {
+/// The sections of --only; empty without it.
+std::set<std::string> chosenSections(const Context& context, const StateForm& form) {
+    std::vector<std::string> known{form.settingsSection()};
+    for (const ListForm& list : form.lists()) {
+        known.push_back(list.section);
+    }
+    std::set<std::string> chosen;
+    std::istringstream words(context.options.argumentOf(onlyOption));
+    for (std::string word; std::getline(words, word, ',');) {
+        if (std::find(known.begin(), known.end(), word) == known.end()) {
+            std::string list;
+            for (const std::string& section : known) {
+                list += (list.empty() ? "" : ", ") + section;
+            }
+            throw usageError("--only: not a section: " + word + didYouMean(word, known) + "; the sections are " + list);
+        }
+        chosen.insert(word);
+    }
+    if (chosen.empty() && context.options.has(onlyOption)) {
+        throw usageError("--only: the name of a section is missing");
+    }
+    return chosen;
+}
+
+/// The state that the files are compared with: a single section if they concern only that one.
+CurrentState readChosenState(const Context& context) {
+    const std::set<std::string> chosen =
+        chosenSections(context, StateForm(context.service.stateCommand("write").description));
+    CurrentState current = readState(context, chosen.size() == 1 ? *chosen.begin() : std::string());
     requireWhole(current);
-    Wanted wanted = parseDesired(context.sources.read(file), file, current.form, current.state, context.sources.force);
+    return current;
+}
+
+/// The desired state from the files and the password file. Nothing has been written when it throws Failure.
+Wanted wantedOf(const Context& context, Words paths, const CurrentState& current) {
+    const StateForm& form = current.form;
+    DesiredFiles files(form, current.state, {.force = context.sources.force, .only = chosenSections(context, form)});
+    for (const std::string& path : paths) {
+        files.add(context.sources.read(path), path);
+    }
+    Wanted wanted = files.wanted();
     if (const std::string passwordFile = context.options.argumentOf(passwordFileOption); !passwordFile.empty()) {
-        if (current.form.secrets().size() != 1) {
-            throw usageError("--password-file: the service has " + std::to_string(current.form.secrets().size()) +
+        if (form.secrets().size() != 1) {
+            throw usageError("--password-file: the service has " + std::to_string(form.secrets().size()) +
                              " secret settings; use \"settings set\"");
         }
-        const DescribedKey& key = current.form.secrets().front();
-        wanted.secrets[current.form.nameOf(key)] = textOfWord(key, '@' + passwordFile, context.sources);
+        if (!wanted.only.empty() && !wanted.only.contains(form.settingsSection())) {
+            throw usageError("--password-file: the password is a setting, and --only leaves out the " +
+                             form.settingsSection());
+        }
+        const DescribedKey& key = form.secrets().front();
+        wanted.secrets[form.nameOf(key)] = textOfWord(key, '@' + passwordFile, context.sources);
     }
+    requireKnownPeople(context, form, wanted, current.state);
     return wanted;
+}
+
+/// Adds a note on each secret that the files do not have although they have settings that are used together with it.
+void addSecretNotes(const Context& context, Plan& plan, const Wanted& wanted, const StateForm& form) {
+    for (const DescribedKey& key : form.secrets()) {
+        const std::string name = form.nameOf(key);
+        const std::set<std::string> together = settingsTriedWith(context, name);
+        const bool isConcerned = std::any_of(wanted.settings.begin(), wanted.settings.end(),
+                                             [&](const auto& setting) { return together.contains(setting.key); });
+        if (isConcerned && wanted.secrets.count(name) == 0) {
+            plan.notes.push_back(form.settingsSection() + '.' + name +
+                                 ": unknown and not compared; --password-file gives it");
+        }
+    }
+}
+
+/// The status for scripts: with --exit-code, success with changes differs from success without any.
+ExitStatus statusOf(const Context& context, ExitStatus status, bool differs) {
+    return status == ExitStatus::done && differs && context.options.has(exitCodeOption) ? ExitStatus::changes : status;
 }
 
 /// The settings that can be written, and those of the dictionary.
@@ -113,22 +182,19 @@ ExitStatus exportState(const Context& context, Words arguments) {
     return ExitStatus::done;
 }
 
-ExitStatus planFile(const Context& context, Words arguments) {
-    const CurrentState current = readState(context);
-    const Wanted wanted = wantedOf(context, arguments.front(), current);
+ExitStatus planFiles(const Context& context, Words arguments) {
+    const CurrentState current = readChosenState(context);
+    const Wanted wanted = wantedOf(context, arguments, current);
     Plan plan = planOf(current.form, wanted, current.state);
-    for (const DescribedKey& key : current.form.secrets()) {
-        if (wanted.secrets.count(current.form.nameOf(key)) == 0) {
-            plan.notes.push_back(current.form.settingsSection() + '.' + current.form.nameOf(key) +
-                                 ": unknown and not compared; --password-file gives it");
-        }
-    }
-    return showOnly(context, current, plan);
+    addSecretNotes(context, plan, wanted, current.form);
+    return statusOf(context, showOnly(context, current, plan), !plan.changes.empty());
 }
 
-ExitStatus applyFile(const Context& context, Words arguments) {
-    const CurrentState current = readState(context);
-    return carryOut(context, wantedOf(context, arguments.front(), current), current);
+ExitStatus applyFiles(const Context& context, Words arguments) {
+    const CurrentState current = readChosenState(context);
+    const Wanted wanted = wantedOf(context, arguments, current);
+    const bool differs = !planOf(current.form, wanted, current.state).changes.empty();
+    return statusOf(context, carryOut(context, wanted, current), differs);
 }
 
 // Completion
@@ -197,19 +263,19 @@ constexpr std::array table = {
          &exportState,
          {{"export", "export host.toml"}}},
     Verb{"plan",
-         "FILE [--password-file FILE] [--force]",
-         "Show what applying the file would change",
+         "FILE... [--only SECTIONS] [--password-file FILE] [--force] [--exit-code]",
+         "Show what applying the files, of which the later ones win, would change",
          1,
-         1,
-         &planFile,
-         {{"plan host.toml", "plan host.toml --password-file grid.txt"}}},
+         mostFiles,
+         &planFiles,
+         {{"plan host.toml", "plan base.toml host2.toml --only settings,cameras --exit-code"}}},
     Verb{"apply",
-         "FILE [--password-file FILE] [--force] [--dry-run]",
-         "Change what differs from the file",
+         "FILE... [--only SECTIONS] [--password-file FILE] [--force] [--dry-run] [--exit-code]",
+         "Change what differs from the files, of which the later ones win",
          1,
-         1,
-         &applyFile,
-         {{"apply host.toml", "apply host.toml --password-file grid.txt"}}},
+         mostFiles,
+         &applyFiles,
+         {{"apply base.toml host2.toml", "apply host.toml --password-file grid.txt"}}},
     Verb{"history",
          "[--since TIME] [--user NAME] [--key KEY]",
          "List the latest changes: when, who and what was changed",
@@ -231,6 +297,9 @@ constexpr std::array options = {
     VerbOption{passwordFileOption, "FILE",
                "Read a password from a file; - asks, or reads standard input. With plan, apply and settings set "
                "--validate the grid account's, with account create the directory administrator's"},
+    VerbOption{onlyOption, "SECTIONS", "With plan and apply: only these tables of the files, separated by commas"},
+    VerbOption{exitCodeOption, "",
+               "With plan and apply: exit status 5 if something differs, or was changed; 0 if nothing does"},
     VerbOption{validateOption, "", "With settings set: try the setting before it is written"},
 };
 

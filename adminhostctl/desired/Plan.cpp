@@ -213,7 +213,8 @@ class Section {
         for (const FieldForm& field : _list.fields) {
             const Value& value = wanted.fields.get(field.key);
             if (!field.boolean && value.isNull()) {
-                throw usageError(_entry + ": not found, and adding it needs a " + field.inFile);
+                throw usageError(wanted.place + (wanted.place.empty() ? "" : ": ") + _entry +
+                                 ": not found, and adding it needs a " + field.inFile);
             }
             if (!field.boolean) {
                 change.secret = wanted.fields.get(field.secretIf).boolean().value_or(false);
@@ -377,7 +378,8 @@ Plan planOf(const StateForm& form, const Wanted& wanted, const State& state) {
         for (const WantedElement& element : elements) {
             section.change(element, wanted.removeUnlisted);
         }
-        if (!list.unlisted.empty() && wanted.removeUnlisted.count(list.unlisted) > 0) {
+        const bool isChosen = wanted.only.empty() || wanted.only.contains(list.section);
+        if (isChosen && !list.unlisted.empty() && wanted.removeUnlisted.count(list.unlisted) > 0) {
             section.removeUnlisted(elements);
         }
         section.finish();

@@ -6,7 +6,6 @@
 #include "platform/value/Value.h"
 
 #include <map>
-#include <optional>
 #include <set>
 #include <string>
 #include <vector>
@@ -24,6 +23,9 @@ struct WantedElement {
     /// not set this.
     bool writeSecret = false;
     std::string shownAs{};  ///< what changes call it; empty: its name
+    // For messages: "host.toml, line 2, column 15".
+    std::string place{};                                       ///< of the element; empty if it is not from a file
+    std::map<std::string, std::vector<std::string>> places{};  ///< of the people in `lists`
 };
 
 struct Wanted {
@@ -31,6 +33,7 @@ struct Wanted {
     std::map<std::string, std::string> secrets;                  ///< secret settings; "" removes the stored one
     std::map<std::string, std::vector<WantedElement>> elements;  ///< by section
     std::set<std::string> removeUnlisted;                        ///< switches that are on
+    std::set<std::string> only;                                  ///< sections that may change; empty: all
     /// Also write a name that the write itself looks up, although its result is not known in advance.
     bool lookUp = false;
 };

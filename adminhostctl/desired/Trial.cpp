@@ -74,6 +74,20 @@ std::string failureOf(const Trial& trial, const Dictionary& answer) {
 
 }  // namespace
 
+std::set<std::string> settingsTriedWith(const Context& context, const std::string& name) {
+    std::set<std::string> together;
+    for (const PluginInfo& plugin : context.service.plugins()) {
+        for (const Description& command : plugin.commands) {
+            for (const Trial& trial : command.trials()) {
+                if (std::find(trial.needs.begin(), trial.needs.end(), name) != trial.needs.end()) {
+                    together.insert(trial.needs.begin(), trial.needs.end());
+                }
+            }
+        }
+    }
+    return together;
+}
+
 bool passTrials(const Context& context, const Wanted& wanted, const CurrentState& current) {
     const CommandRef command = context.service.stateCommand("try");
     Dictionary request = requestOf(context, command.description, wanted, current);

@@ -6,7 +6,13 @@
 #include "adminhostctl/desired/Plan.h"
 #include "adminhostctl/desired/Writing.h"
 
+#include <set>
+#include <string>
+
 namespace adminhost::ctl {
+
+/// The settings that a trial needs together with this one, including itself; empty if no trial needs it.
+[[nodiscard]] std::set<std::string> settingsTriedWith(const Context& context, const std::string& name);
 
 /// Makes the trials that depend on one of the wanted settings, with the stored values of the others. A stored secret
 /// cannot be read; the option --password-file gives it. Prints the outcome of each trial, or why it was not made.

@@ -1,58 +1,9 @@
 #include "adminhostctl/lumio/People.h"
 
-#include "adminhostctl/Connection.h"
-#include "adminhostctl/Similar.h"
-
 #include <algorithm>
 #include <cctype>
 
 namespace adminhost::ctl {
-namespace {
-
-/// Short names that begin as the name does: those that it may be a typo of.
-std::vector<std::string> similarNames(const Context& context, const std::string& name) {
-    std::vector<std::string> names;
-    const Value answer = context.service.get("/v1/directory?match=" + Connection::escaped(name.substr(0, 1)));
-    for (const Dictionary& entry :
-         dictionariesOf(answer.dictionary() == nullptr ? Value() : answer.dictionary()->get("entries"))) {
-        names.emplace_back(entry.text("shortName"));
-    }
-    return names;
-}
-
-}  // namespace
-
-std::vector<Dictionary> dictionariesOf(const Value& list) {
-    std::vector<Dictionary> all;
-    for (const Value& element : list.array() == nullptr ? Array() : *list.array()) {
-        if (element.dictionary() != nullptr) {
-            all.push_back(*element.dictionary());
-        }
-    }
-    return all;
-}
-
-std::vector<Dictionary> entriesNamed(const Context& context, const std::string& name) {
-    if (name.empty()) {
-        return {};  // the address without a text lists everybody
-    }
-    const Value answer = context.service.get("/v1/directory?is=" + Connection::escaped(name));
-    return dictionariesOf(answer.dictionary() == nullptr ? Value() : answer.dictionary()->get("entries"));
-}
-
-Failure unknownName(const Context& context, const char* what, const std::string& name) {
-    const bool isAscii = !name.empty() && static_cast<unsigned char>(name.front()) < 0x80;
-    return usageError(std::string(what) + " not found: " + name +
-                      (isAscii ? didYouMean(name, similarNames(context, name)) : std::string()));
-}
-
-Failure ambiguousName(const std::string& name, std::span<const Dictionary> entries) {
-    std::string identities;
-    for (const Dictionary& entry : entries) {
-        identities.append("\n  ").append(entry.text("_id_")).append("  ").append(entry.text("node"));
-    }
-    return usageError("several have the name " + name + "; use one of these instead:" + identities);
-}
 
 std::vector<std::string> shortNamesOf(const Context& context, std::span<const std::string> names, bool groups) {
     std::vector<std::string> shortNames;

@@ -2,8 +2,7 @@
 
 // People and groups of the directory, by the names that a person types.
 
-#include "adminhostctl/Verb.h"
-#include "platform/value/Value.h"
+#include "adminhostctl/DirectoryNames.h"
 
 #include <span>
 #include <string>
@@ -14,19 +13,6 @@ namespace adminhost::ctl {
 
 /// The option with which names are names of groups.
 inline constexpr std::string_view groupOption = "--group";
-
-/// The dictionaries of a list.
-[[nodiscard]] std::vector<Dictionary> dictionariesOf(const Value& list);
-
-/// The directory's entries with exactly this name or UUID. Throws Failure if the directory fails.
-[[nodiscard]] std::vector<Dictionary> entriesNamed(const Context& context, const std::string& name);
-
-/// The usage error for a name or UUID that the directory does not have ("person or group not found: ..."); suggests a
-/// similar short name.
-[[nodiscard]] Failure unknownName(const Context& context, const char* what, const std::string& name);
-
-/// The usage error for a name that several entries have.
-[[nodiscard]] Failure ambiguousName(const std::string& name, std::span<const Dictionary> entries);
 
 /// The short names of the people, or of the groups, with these names or UUIDs. Throws Failure(usage) for a name that
 /// the directory does not have, that several have, or that is of the other kind, so that nothing is sent for the

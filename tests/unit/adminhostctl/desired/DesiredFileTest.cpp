@@ -1,5 +1,6 @@
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/desired/DesiredFile.h"
+#include "adminhostctl/desired/ExportedFile.h"
 #include "tests/unit/adminhostctl/Describe.h"
 
 #include <gmock/gmock.h>
@@ -103,7 +104,7 @@ TEST(Export, HoldsWritableSettingsPropertiesAndAccessListsInAFixedForm) {
                                              "\n"
                                              "[settings]\n"
                                              "shared_filesystem = \"/shared\"\n"
-                                             "server_host = \"a \\\"quoted\\\"\\nhost\"\n"
+                                             "# server_host = \"a \\\"quoted\\\"\\nhost\"\n"
                                              "server_port = 8170\n"
                                              "sorvane_capture_web_enabled = true\n"
                                              "max_file_size_in_mb = 2.0\n"
@@ -161,7 +162,11 @@ TEST(Export, EveryWritableSettingIsManagedHereAndNothingElse) {
         }
     }
     const Wanted wanted = parse(exported(root), root);
-    EXPECT_EQ(wanted.settings.size(), 27U) << "the keys of the three files that are written";
+    for (const char* const ofHost : {"member_uuid", "server_host", "tunnel_agent_host"}) {
+        EXPECT_THAT(exported(root), HasSubstr(std::string("\n# ") + ofHost + " = \"x\"\n"));
+        EXPECT_FALSE(wanted.settings.contains(ofHost)) << "another host has its own";
+    }
+    EXPECT_EQ(wanted.settings.size(), 24U) << "the other keys of the three files that are written";
     for (const char* other : {"nimbo_client_password", "nimbo_controller_resolve_name", "cameras", "properties"}) {
         EXPECT_THAT(writable, testing::Contains(other));
         EXPECT_FALSE(wanted.settings.contains(other)) << other;
@@ -260,6 +265,39 @@ TEST(Desired, FileIsReadWithAllItsTables) {
     EXPECT_EQ(cameras[0].lists.count("groups"), 0U) << "what is not given stays as it is";
     EXPECT_THAT(cameras[1].lists.at("groups"), IsEmpty());
     EXPECT_TRUE(cameras[1].fields.empty());
+}
+
+TEST(Desired, LaterFileReplacesKeyByKeyHoweverItNamesTheElement) {
+    const State state = stateOf(form(), sample());
+    DesiredFiles files(form(), state, {});
+    files.add(
+        "[remove_unlisted]\naccess = true\n[settings]\nserver_port = 1\nserver_host = \"a\"\n"
+        "[cameras.Hall]\naccess_control = false\nusers = [\"anna\", \"ben\"]\ngroups = []\n"
+        "[properties.fresh]\nprotect = true\n",
+        "base.toml");
+    files.add(
+        "[remove_unlisted]\naccess = false\nproperties = true\n[settings]\nserver_port = 2\n"
+        "[cameras.aaaa-1]\nusers = [\"carla\"]\n[properties.fresh]\nvalue = \"x\"\n",
+        "host.toml");
+    const Wanted& wanted = files.wanted();
+    EXPECT_EQ(wanted.settings, (Dictionary{{"server_port", 2}, {"server_host", "a"}}));
+    EXPECT_THAT(wanted.removeUnlisted, ElementsAre("properties"));
+    ASSERT_EQ(wanted.elements.at("cameras").size(), 1U) << "one element, named in two ways";
+    const WantedElement& hall = wanted.elements.at("cameras").front();
+    EXPECT_EQ(hall.fields, (Dictionary{{"access_control_enabled", false}}));
+    EXPECT_THAT(hall.lists.at("users"), ElementsAre("carla"));
+    EXPECT_THAT(hall.places.at("users"), ElementsAre("host.toml, line 7, column 10"));
+    EXPECT_THAT(hall.lists.at("groups"), IsEmpty());
+    EXPECT_EQ(wanted.elements.at("properties").front().fields, (Dictionary{{"protect", true}, {"value", "x"}}));
+}
+
+TEST(Desired, SectionsThatAreNotChosenAreNeitherCheckedNorChanged) {
+    const State state = stateOf(form(), sample());
+    DesiredFiles files(form(), state, {.force = false, .only = {"settings"}});
+    files.add("[remove_unlisted]\nproperties = true\n[settings]\nserver_port = 1\n[cameras.Nowhere]\nuser = 1\n",
+              "base.toml");
+    EXPECT_TRUE(files.wanted().elements.empty());
+    EXPECT_EQ(planOf(form(), files.wanted(), state).changes.size(), 1U) << "no property is removed";
 }
 
 TEST(Desired, EmptyFileWantsNothing) {
