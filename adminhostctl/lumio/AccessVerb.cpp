@@ -197,18 +197,41 @@ ExitStatus showOutcome(const Context& context, const std::vector<Removal>& remov
     return status;
 }
 
-/// Removes the entry from its lists, or from the list of one element.
-ExitStatus revoke(const Context& context, const Overview& overview, const Dictionary& entry,
-                  const std::string& element) {
-    const std::vector<Removal> removals = removalsOf(overview, entry, element);
-    if (removals.empty()) {
-        if (context.options.format == Format::text) {
-            context.out << "no change\n";
-        } else {
-            writeValue(context, Array(), Description());
-        }
-        return ExitStatus::done;
+void showNoChange(const Context& context) {
+    if (context.options.format == Format::text) {
+        context.out << "no change\n";
+    } else {
+        writeValue(context, Array(), Description());
     }
+}
+
+/// Shows the entries at a terminal and asks whether they are to be removed.
+bool isRevocationConfirmed(const Context& context, const std::vector<Removal>& removals, const Dictionary& entry) {
+    const bool asks = context.sources.terminal && !context.options.has(yesOption) && !context.options.has(dryRunOption);
+    if (asks && context.options.format == Format::text) {
+        for (const Removal& removal : removals) {
+            context.out << shown(removal.line) << '\n';
+        }
+        context.out.flush();
+    }
+    return isConfirmed(context, "All entries of " + shown(nameOfEntry(entry)) + " are removed. Continue?");
+}
+
+/// Throws Conflict unless all entries of the account that are left are among those that were to be removed.
+void requireSameEntries(const std::vector<Removal>& before, const std::vector<Removal>& now) {
+    for (const Removal& removal : now) {
+        if (std::none_of(before.begin(), before.end(), [&](const Removal& one) {
+                return one.resource.get("_id_") == removal.resource.get("_id_");
+            })) {
+            throw Conflict(removal.line + ": another client has added this entry; nothing was written");
+        }
+    }
+}
+
+/// Removes these entries in one write, and prints the outcome. Throws Conflict if another client has changed something
+/// since they were read.
+ExitStatus removeEntries(const Context& context, const Overview& overview, const std::vector<Removal>& removals,
+                         const Dictionary& entry) {
     CommandRef command;
     Dictionary request;
     std::string revision;
@@ -242,6 +265,40 @@ ExitStatus revoke(const Context& context, const Overview& overview, const Dictio
             return ExitStatus::undetermined;
         }
         return showOutcome(context, removals, entry, report);
+    }
+}
+
+/// Removes the entry from its lists, or from the list of one element. If another client has changed something since
+/// they were read, reads again and tries again, three times at most, while the account has no other entries.
+ExitStatus revoke(const Context& context, const Overview& overview, const Dictionary& entry,
+                  const std::string& element) {
+    constexpr int attempts = 3;
+    const std::vector<Removal> all = removalsOf(overview, entry, element);
+    if (all.empty()) {
+        showNoChange(context);
+        return ExitStatus::done;
+    }
+    if (element.empty() && !isRevocationConfirmed(context, all, entry)) {
+        return ExitStatus::failed;
+    }
+    Overview current = overview;
+    std::vector<Removal> removals = all;
+    for (int attempt = 0;; ++attempt) {
+        try {
+            return removeEntries(context, current, removals, entry);
+        } catch (const Conflict&) {
+            if (attempt == attempts) {
+                throw;
+            }
+        }
+        current = readOverview(context);
+        removals = removalsOf(current, entry, element);
+        requireSameEntries(all, removals);
+        if (removals.empty()) {
+            showNoChange(context);
+            context.err << "already so: another client has changed it\n";
+            return ExitStatus::done;
+        }
     }
 }
 

@@ -240,7 +240,7 @@ constexpr std::array table = {
          {{"workflow access Archive on", "workflow access Archive off"}},
          &elementsThen<workflow, Then::onOrOff>},
     Verb{"access",
-         "NAME|UUID [--group] [--revoke [--dry-run]]",
+         "NAME|UUID [--group] [--revoke [--yes] [--dry-run]]",
          "Show what a person or a group may use, or remove it from all lists",
          0,
          1,

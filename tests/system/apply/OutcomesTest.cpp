@@ -1,9 +1,7 @@
 // What a change prints and does beside writing: documents for programs, dry runs, ranges, and other clients' changes.
 
 #include "platform/json/Json.h"
-#include "tests/system/apply/ControlledService.h"
-
-#include <future>
+#include "tests/system/apply/OvertakenService.h"
 
 namespace adminhost::test {
 namespace {
@@ -13,7 +11,7 @@ using testing::EndsWith;
 using testing::HasSubstr;
 using testing::Not;
 
-class Outcomes : public ControlledService {
+class Outcomes : public OvertakenService {
   protected:
     /// The changes in the document that a verb prints for programs.
     static Array changesOf(const std::string& output) {
@@ -21,19 +19,6 @@ class Outcomes : public ControlledService {
         EXPECT_TRUE(document) << output;
         const Array* changes = document ? document->dictionary()->get("changes").array() : nullptr;
         return changes != nullptr ? *changes : Array();
-    }
-    /// Runs a verb whose state is changed by `other` after it has been read and before it is written. The other
-    /// client's write waits in the queue behind the verb's first read.
-    ProgramResult overtaken(const std::vector<std::string>& words, const std::string& other) const {
-        root.hold("setup_preferences");
-        std::future<ProgramResult> result = std::async(std::launch::async, [&] { return ctl(words); });
-        EXPECT_TRUE(root.waitForHeld("setup_preferences"));
-        UnixHttp client(daemon.socket(), std::chrono::seconds(60));
-        client.begin("POST", "/v1/lumio/writeSettings", other);
-        EXPECT_TRUE(daemon.waitForWaiting(1));
-        root.release("setup_preferences");
-        EXPECT_EQ(client.reply().status, 200);
-        return result.get();
     }
 };
 

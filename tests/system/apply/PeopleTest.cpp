@@ -1,7 +1,7 @@
 // Access of people: several elements in one write, names that are looked up first, people who leave, and accounts that
 // the directory no longer knows.
 
-#include "tests/system/apply/ControlledService.h"
+#include "tests/system/apply/OvertakenService.h"
 
 namespace adminhost::test {
 namespace {
@@ -11,7 +11,7 @@ using testing::Contains;
 using testing::HasSubstr;
 using testing::Not;
 
-class People : public ControlledService {
+class People : public OvertakenService {
   protected:
     /// Names of the cameras and bundles of the workflows whose lists have the account, from the database.
     [[nodiscard]] std::vector<std::string> listsWith(const std::string& kind, const std::string& name) const {
@@ -115,6 +115,43 @@ TEST_F(People, RevokeRemovesAllDirectEntriesAlsoOfDisabledResources) {
     EXPECT_THAT(listsWith("user", "juergen"), testing::IsEmpty());
     EXPECT_THAT(listsWith("group", "studio"), Contains("Studio A")) << "only the person's own entries";
     EXPECT_EQ(ctl({"access", "juergen", "--revoke"}).output, "no change\n");
+}
+
+TEST_F(People, RevokeTriesAgainAfterAnotherClientsChange) {
+    makeDatabaseToolHoldable();
+    const ProgramResult result = overtaken({"access", "juergen", "--revoke", "--languages", "en"},
+                                           R"({"configuration":{"server_host":"other"}})", "sqlite3");
+    EXPECT_EQ(result.status, 0) << result.output;
+    EXPECT_THAT(result.output, HasSubstr("cameras.\"Studio A\".users.juergen: (allowed) -> (not allowed): applied\n"));
+    EXPECT_THAT(listsWith("user", "juergen"), testing::IsEmpty());
+    EXPECT_EQ(ctl({"settings", "get", "server_host"}).output, "other\n");
+}
+
+TEST_F(People, RevokeDoesNotRemoveAnEntryThatItHasNotShown) {
+    makeDatabaseToolHoldable();
+    const std::string roof = SampleRoot::uuidOf("camera", "Roof");
+    const ProgramResult result =
+        overtaken({"access", "juergen", "--revoke"},
+                  R"({"configuration":{"cameras":[{"_id_":")" + roof +
+                      R"(","allowedUsersAndGroups":[{"_newid_":true,"type":"user","shortName":"juergen"}]}]}})",
+                  "sqlite3");
+    EXPECT_EQ(result.status, 7) << result.output;
+    EXPECT_THAT(result.output, HasSubstr("cameras.Roof.users.juergen: (allowed) -> (not allowed): another client has "
+                                         "added this entry; nothing was written"));
+    EXPECT_THAT(listsWith("user", "juergen"), AllOf(Contains("Roof"), Contains("Studio A")));
+}
+
+TEST_F(People, RevokeOfEntriesThatAnotherClientHasRemovedIsSuccess) {
+    makeDatabaseToolHoldable();
+    const std::string removal = R"(","allowedUsersAndGroups":[{"_obsoleteid_":true,"_id_":")" +
+                                SampleRoot::uuidOf("user", "juergen") + R"("}]}])";
+    const ProgramResult result = overtaken(
+        {"access", "juergen", "--revoke"},
+        R"({"configuration":{"cameras":[{"_id_":")" + SampleRoot::uuidOf("camera", "Studio A") + removal +
+            R"(,"workflows":[{"_id_":")" + SampleRoot::uuidOf("workflow", "TwoCameras.workflow") + removal + "}}",
+        "sqlite3");
+    EXPECT_EQ(result.status, 0) << result.output;
+    EXPECT_EQ(result.output, "no change\nalready so: another client has changed it\n");
 }
 
 TEST_F(People, AccountThatIsGoneIsShownAndRemovedByItsUuid) {

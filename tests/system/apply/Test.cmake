@@ -1,2 +1,2 @@
-set(TEST_LIBS host)
+set(TEST_LIBS host util)
 set(TEST_DEPENDS adminhostd adminhostctl adminhost_lumio)

@@ -1,66 +1,22 @@
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/Prompt.h"
+#include "tests/support/OnTerminal.h"
 
 #include <csignal>
-#include <functional>
 #include <string>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <poll.h>
-#include <pty.h>
 #include <sys/wait.h>
 #include <termios.h>
 #include <unistd.h>
 
 namespace {
 
+using adminhost::test::OnTerminal;
 using testing::HasSubstr;
 using testing::Not;
-
-/// A child process on a terminal of its own.
-class OnTerminal {
-  public:
-    explicit OnTerminal(const std::function<int()>& program) {
-        _pid = ::forkpty(&_terminal, nullptr, nullptr, nullptr);
-        if (_pid == 0) {
-            ::_exit(program());
-        }
-    }
-    ~OnTerminal() { ::close(_terminal); }
-    OnTerminal(const OnTerminal&) = delete;
-    OnTerminal& operator=(const OnTerminal&) = delete;
-
-    void type(const std::string& text) const {
-        ASSERT_EQ(::write(_terminal, text.data(), text.size()), static_cast<ssize_t>(text.size()));
-    }
-    /// Reads what the terminal shows until the text has come, or the child has ended.
-    const std::string& showsUntil(const std::string& text) {
-        while (_shown.find(text) == std::string::npos) {
-            char bytes[256];
-            const ssize_t count = ::read(_terminal, bytes, sizeof bytes);
-            if (count <= 0) {
-                break;
-            }
-            _shown.append(bytes, static_cast<std::size_t>(count));
-        }
-        return _shown;
-    }
-    [[nodiscard]] bool echoes() const {
-        termios now{};
-        return ::tcgetattr(_terminal, &now) == 0 && (now.c_lflag & ECHO) != 0;
-    }
-    [[nodiscard]] int wait() const {
-        int status = 0;
-        EXPECT_EQ(::waitpid(_pid, &status, 0), _pid);
-        return status;
-    }
-
-  private:
-    int _terminal = -1;
-    pid_t _pid = -1;
-    std::string _shown;
-};
 
 int say(const std::string& text) {
     return ::write(STDOUT_FILENO, text.data(), text.size()) < 0 ? 1 : 0;
