@@ -332,7 +332,7 @@ TEST(HostName, SilentNameServerIsGivenUpSoonerThanTheSystemsDefault) {
     sockaddr_in address{};
     address.sin_family = AF_INET;
     address.sin_port = htons(53);
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    ASSERT_EQ(::inet_pton(AF_INET, "10.77.0.1", &address.sin_addr), 1);
     ASSERT_EQ(::bind(server, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
     const auto begin = Clock::now();
     const HostName result = hostNameOf(ipv4("10.77.0.99"));
