@@ -3,21 +3,16 @@
 #include "adminhostctl/Connection.h"
 #include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Interrupt.h"
+#include "tests/support/PlayedServer.h"
 
 #include <atomic>
 #include <csignal>
-#include <cstdlib>
-#include <filesystem>
-#include <functional>
 #include <string>
 #include <thread>
 #include <vector>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <poll.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 namespace {
@@ -33,72 +28,9 @@ using adminhost::ctl::Failure;
 using adminhost::ctl::LostConnection;
 using adminhost::ctl::ReportedGap;
 using adminhost::ctl::Unavailable;
+using adminhost::test::PlayedServer;
 using testing::HasSubstr;
 using testing::Not;
-
-/// Sends the answer that a function returns for each request, and closes the connection if it returns none.
-class PlayedServer {
-  public:
-    explicit PlayedServer(std::function<std::string(const std::string&)> answer) : _answer(std::move(answer)) {
-        std::string pattern = (std::filesystem::temp_directory_path() / "played.XXXXXX").string();
-        _directory = ::mkdtemp(pattern.data());
-        _listener = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_un address{};
-        address.sun_family = AF_UNIX;
-        path().copy(address.sun_path, sizeof address.sun_path - 1);
-        EXPECT_EQ(::bind(_listener, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
-        EXPECT_EQ(::listen(_listener, 8), 0);
-        _thread = std::thread([this] { serve(); });
-    }
-    ~PlayedServer() {
-        _ended = true;
-        _thread.join();
-        ::close(_listener);
-        std::filesystem::remove_all(_directory);
-    }
-    PlayedServer(const PlayedServer&) = delete;
-    PlayedServer& operator=(const PlayedServer&) = delete;
-
-    [[nodiscard]] std::string path() const { return _directory + "/socket"; }
-    /// The requests so far. To be called only after the client has its answer or its failure.
-    [[nodiscard]] std::vector<std::string> requests() const { return _requests; }
-
-  private:
-    void serve() {
-        int client = -1;
-        while (!_ended) {
-            pollfd entries[2] = {{_listener, POLLIN, 0}, {client, POLLIN, 0}};
-            if (::poll(entries, client < 0 ? 1 : 2, 20) <= 0) {
-                continue;
-            }
-            if ((entries[0].revents & POLLIN) != 0) {
-                ::close(client);
-                client = ::accept4(_listener, nullptr, nullptr, SOCK_CLOEXEC);
-                continue;
-            }
-            std::string request;
-            char bytes[4096];
-            const ssize_t count = ::read(client, bytes, sizeof bytes);
-            if (count > 0) {
-                request.assign(bytes, static_cast<std::size_t>(count));
-                _requests.push_back(request);
-            }
-            const std::string answer = count > 0 ? _answer(request) : "";
-            if (answer.empty() || ::send(client, answer.data(), answer.size(), MSG_NOSIGNAL) < 0) {
-                ::close(client);
-                client = -1;
-            }
-        }
-        ::close(client);
-    }
-
-    std::function<std::string(const std::string&)> _answer;
-    std::string _directory;
-    int _listener = -1;
-    std::atomic<bool> _ended = false;
-    std::vector<std::string> _requests;
-    std::thread _thread;
-};
 
 constexpr auto patience = std::chrono::seconds(20);
 
