@@ -107,8 +107,8 @@ class DaemonClient {
     /// The command of that name, or "PLUGIN/COMMAND" if two plug-ins have it. Throws Failure(usage), which lists the
     /// known commands and suggests one of them or of the other words that would have been known.
     [[nodiscard]] CommandRef command(const std::string& name, const std::vector<std::string>& others = {});
-    /// The command that reads, writes or tries the state that a file can describe: state is "read", "write" or "try".
-    /// Throws Failure(usage) when no plug-in has one, or several have.
+    /// The command that reads, writes or tries the state that a file can describe, or lists names of its elements:
+    /// state is "read", "write", "try" or "names". Throws Failure(usage) when no plug-in has one, or several have.
     [[nodiscard]] CommandRef stateCommand(std::string_view state);
     /// Sends the request once and returns the answer. A request with a revision fails unless the revision is still
     /// current. Throws Failure with the daemon's message, its findings and, after a failure inside the service, the log

@@ -77,7 +77,7 @@ class Description {
     /// The command's own time limit; nullopt if the daemon's applies.
     [[nodiscard]] std::optional<std::chrono::seconds> deadline() const noexcept { return _deadline; }
     /// "read" if the command reads the state, "write" if it writes it, "try" if it tries values before they are
-    /// written; empty for other commands.
+    /// written, "names" if it lists names of elements; empty for other commands.
     [[nodiscard]] const std::string& state() const noexcept { return _state; }
     [[nodiscard]] const std::vector<Trial>& trials() const noexcept { return _trials; }
     /// A request that reads only this section of the state; empty if the description has none.

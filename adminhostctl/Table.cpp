@@ -116,19 +116,27 @@ void Table::appendRow(std::string& text, const std::vector<std::string>& cells, 
 std::string Table::text(std::size_t width, std::size_t indent) const {
     const std::vector<Column> natural = columns();
     std::vector<Column> columns = natural;
+    std::vector<Column> left = natural;
     std::string leftOut;
     while (!narrow(columns, width, indent) && columns.size() > 1) {
-        const std::size_t last = columns.size() - 1;
-        leftOut.insert(0, _headings[natural[last].at] + (leftOut.empty() ? "" : ", "));
-        columns.assign(natural.begin(), natural.begin() + static_cast<std::ptrdiff_t>(last));
+        const auto last = left.end() - (left.back().at == _kept ? 2 : 1);
+        leftOut.insert(0, _headings[last->at] + (leftOut.empty() ? "" : ", "));
+        left.erase(last);
+        columns = left;
     }
     std::string text;
     appendRow(text, _headings, columns, indent);
     for (const auto& row : _rows) {
-        appendRow(text, row, columns, indent);
+        if (leftOut.empty() || std::any_of(columns.begin(), columns.end(),
+                                           [&](const Column& column) { return !row[column.at].empty(); })) {
+            appendRow(text, row, columns, indent);
+        }
     }
     if (!leftOut.empty()) {
-        text.append(indent, ' ').append("(omitted columns: " + leftOut + ")\n");
+        for (const std::string& line :
+             wrapped("(omitted columns: " + leftOut + ")", std::max(width, indent + 2) - indent)) {
+            text.append(indent, ' ').append(line).append("\n");
+        }
     }
     return text;
 }

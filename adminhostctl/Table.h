@@ -11,10 +11,13 @@ namespace adminhost::ctl {
 
 /// Headings in capitals, two blanks between columns, numbers aligned to the right. If the table is too wide, its widest
 /// columns are narrowed and their texts wrapped, between words if possible. If that is not enough, the last columns are
-/// omitted and named below the table.
+/// omitted and named below the table, with the rows that have texts in these columns only.
 class Table {
   public:
     explicit Table(std::vector<std::string> headings);
+
+    /// The column with this number is the last one to be omitted.
+    void keep(std::size_t column) { _kept = column; }
 
     /// One cell for each heading; texts as shown() returns them.
     void addRow(std::vector<std::string> cells);
@@ -34,6 +37,7 @@ class Table {
                    std::size_t indent) const;
 
     std::vector<std::string> _headings;
+    std::size_t _kept = 0;
     std::vector<std::vector<std::string>> _rows;
 };
 

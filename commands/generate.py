@@ -55,7 +55,7 @@ STATE_WORDS = {"section", "identity", "label", "by_identity", "unlisted", "in_fi
 # Unit and sensible range of a setting's number; described where the setting is read.
 RANGE_WORDS = {"unit", "minimum", "maximum"}
 KEY_WORDS = {"type", "entered_as", "filled_with", "secret", "required", "allowed", "rules", "for", "with", "help", "entry"} | STATE_WORDS | RANGE_WORDS
-ANSWER_WORDS = {"type", "secret", "column", "help", "title", "kind", "default_key"} | RANGE_WORDS
+ANSWER_WORDS = {"type", "secret", "column", "help", "title", "kind", "default_key", "identity", "label"} | RANGE_WORDS
 ENTRY_WORDS = {"added_by", "removed_by", "first", "leading_zeros", "otherwise", "added_kinds", "columns", "together"}
 
 
@@ -218,9 +218,9 @@ def load(directory):
                     command["example"][what] = value
         except Wrong as error:
             raise Wrong(f"{name}.toml: {error}") from error
-    for word in ("read", "write", "try"):
+    for word in ("read", "write", "try", "names"):
         need(sum(command.get("state") == word for command in commands.values()) <= 1, f"two commands have state = {word}")
-    need(all(command.get("state", "read") in ("read", "write", "try") for command in commands.values()), "state is read, write or try")
+    need(all(command.get("state", "read") in ("read", "write", "try", "names") for command in commands.values()), "state is read, write, try or names")
     by_order = {}
     for name, command in commands.items():
         other = by_order.setdefault(command["order"], name)

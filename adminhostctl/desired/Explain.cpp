@@ -109,7 +109,7 @@ ExitStatus explain(const Context& context, std::span<const std::string> argument
         all.set("written", "by the service only");
     } else {
         all.set("restart", restartText(*written));
-        all.set("file", written->file);
+        all.set("settings file", written->file);
         all.set("last change", lastChangeText(context, write, name));
     }
     writeValue(context, all, Description());

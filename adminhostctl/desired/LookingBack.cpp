@@ -13,6 +13,7 @@
 #include <algorithm>
 #include <ctime>
 #include <iterator>
+#include <map>
 #include <optional>
 
 #include <fmt/format.h>
@@ -144,6 +145,56 @@ Array entriesOf(const Context& context, const CommandRef& write) {
     return entries;
 }
 
+/// The changes of an entry; null if it has none.
+Array* changesOf(Value& entry) {
+    Value* const changes = entry.dictionary()->find("changes");
+    return changes == nullptr ? nullptr : changes->array();
+}
+
+/// Names of elements by their identities, as the service has them now; empty if they cannot be read.
+std::map<std::string, std::string> namesByIdentity(const Context& context) {
+    std::map<std::string, std::string> names;
+    try {
+        const CommandRef command = context.service.stateCommand("names");
+        const CommandAnswer answer = context.service.ask(command, {});
+        for (const DescribedKey& key : command.description.answerKeys()) {
+            if (key.identity.empty() || !key.path.ends_with("[]")) {
+                continue;
+            }
+            for (const Value& element :
+                 listAt(answer.value.value_or(Value()), key.path.substr(0, key.path.size() - 2))) {
+                names[textAt(*element.dictionary(), key.identity)] = textAt(*element.dictionary(), key.label);
+            }
+        }
+    } catch (const Failure&) {
+        // The history is shown with identities then: it may be needed most while the service cannot be read.
+    }
+    return names;
+}
+
+/// Names the elements that the daemon has recorded by their identity only, because the change did not read them.
+void addNames(const Context& context, Array& entries) {
+    std::optional<std::map<std::string, std::string>> names;
+    for (Value& entry : entries) {
+        Array* const changes = changesOf(entry);
+        if (changes == nullptr) {
+            continue;
+        }
+        for (Value& value : *changes) {
+            Dictionary* const change = value.dictionary();
+            if (change == nullptr || !change->contains("identity") || !textAt(*change, "name").empty()) {
+                continue;
+            }
+            if (!names) {
+                names = namesByIdentity(context);
+            }
+            if (const auto found = names->find(textAt(*change, "identity")); found != names->end()) {
+                change->set("name", found->second);
+            }
+        }
+    }
+}
+
 const Dictionary& dictionaryAt(const Dictionary& dictionary, std::string_view key) {
     static const Dictionary none;
     const Dictionary* found = dictionary.get(key).dictionary();
@@ -180,16 +231,16 @@ void filter(const Context& context, Array& entries) {
         if (!context.options.has(keyOption)) {
             return false;
         }
-        Value* changes = entry.find("changes");
-        if (changes == nullptr || changes->array() == nullptr) {
+        Array* const changes = changesOf(value);
+        if (changes == nullptr) {
             return true;
         }
-        std::erase_if(*changes->array(), [&](const Value& change) {
+        std::erase_if(*changes, [&](const Value& change) {
             const Dictionary* one = change.dictionary();
             return one == nullptr || (textAt(*one, "key") != wanted && textAt(*one, "name") != wanted &&
                                       textAt(*one, "section") != wanted);
         });
-        return changes->array()->empty();
+        return changes->empty();
     });
 }
 
@@ -200,7 +251,20 @@ struct Restoration {
     std::vector<std::string> notes;  ///< secrets, which stay as they are
 };
 
-void restoreSettings(Restoration& restoration, const Dictionary& settings, const CurrentState& current) {
+/// Whether the setting has been changed by the entry or since.
+bool isChangedSince(const Array& entries, Array::const_iterator entry, const std::string& setting) {
+    return std::any_of(entry, entries.end(), [&](const Value& later) {
+        const Array* const changes = later.dictionary()->get("changes").array();
+        return changes != nullptr && std::any_of(changes->begin(), changes->end(), [&](const Value& change) {
+                   return change.dictionary() != nullptr && !change.dictionary()->contains("section") &&
+                          textAt(*change.dictionary(), "key") == setting;
+               });
+    });
+}
+
+void restoreSettings(Restoration& restoration, const Array& entries, Array::const_iterator entry,
+                     const CurrentState& current) {
+    const Dictionary& settings = dictionaryAt(*entry->dictionary(), "settings");
     const StateForm& form = current.form;
     for (const std::string& key : writableKeys(form)) {
         if (settings.contains(key)) {
@@ -212,7 +276,7 @@ void restoreSettings(Restoration& restoration, const Dictionary& settings, const
         }
     }
     for (const DescribedKey& key : form.secrets()) {
-        if (settings.contains(form.nameOf(key))) {
+        if (settings.contains(form.nameOf(key)) && isChangedSince(entries, entry, form.nameOf(key))) {
             restoration.notes.push_back(form.settingsSection() + '.' + form.nameOf(key) +
                                         ": not restored, a stored secret cannot be written back");
         }
@@ -293,14 +357,32 @@ void restoreChange(Restoration& restoration, const ListForm& list, const Diction
     restoration.wanted.elements[list.section].push_back(std::move(wanted));
 }
 
-/// Everything that the entry changed, as it was before. Settings are restored as a whole.
-Restoration restorationOf(const Dictionary& entry, const CurrentState& current) {
+/// The only section that the entry concerns; empty if it concerns several.
+std::string sectionOf(const StateForm& form, const Dictionary& entry) {
+    std::string section = entry.contains("settings") ? form.settingsSection() : "";
+    const Array* changes = entry.get("changes").array();
+    for (const Value& change : changes == nullptr ? Array() : *changes) {
+        for (const ListForm& list : form.lists()) {
+            if (change.dictionary() == nullptr || change.dictionary()->get("section") != Value(list.key)) {
+                continue;
+            }
+            if (!section.empty() && section != list.section) {
+                return {};
+            }
+            section = list.section;
+        }
+    }
+    return section;
+}
+
+/// Everything that the entry, one of these, changed, as it was before. Settings are restored as a whole.
+Restoration restorationOf(const Array& entries, Array::const_iterator entry, const CurrentState& current) {
     Restoration restoration;
     restoration.wanted.lookUp = true;
-    if (entry.contains("settings")) {
-        restoreSettings(restoration, dictionaryAt(entry, "settings"), current);
+    if (entry->dictionary()->contains("settings")) {
+        restoreSettings(restoration, entries, entry, current);
     }
-    const Array* changes = entry.get("changes").array();
+    const Array* changes = entry->dictionary()->get("changes").array();
     // The last change of a thing is undone first.
     for (std::size_t i = changes == nullptr ? 0 : changes->size(); i > 0; --i) {
         const Dictionary* change = (*changes)[i - 1].dictionary();
@@ -315,9 +397,19 @@ Restoration restorationOf(const Dictionary& entry, const CurrentState& current) 
 
 }  // namespace
 
+std::vector<std::string> historyNumbersOf(const Context& context) {
+    std::vector<std::string> numbers;
+    for (const Value& entry : entriesOf(context, context.service.stateCommand("write"))) {
+        numbers.push_back(textOf(entry.dictionary()->get("number")));
+    }
+    std::reverse(numbers.begin(), numbers.end());
+    return numbers;
+}
+
 ExitStatus history(const Context& context, std::span<const std::string>) {
     const CommandRef write = context.service.stateCommand("write");
     Array entries = entriesOf(context, write);
+    addNames(context, entries);
     filter(context, entries);
     if (context.options.format != Format::text) {
         for (Value& entry : entries) {
@@ -333,6 +425,7 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
     }
     const StateForm form(write.description);
     Table table({"number", "when", "who", "changed"});
+    table.keep(3);
     // The newest first: that is the one that people look for.
     for (auto at = entries.rbegin(); at != entries.rend(); ++at) {
         const Dictionary& entry = *at->dictionary();
@@ -348,8 +441,12 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
             row.assign(row.size(), "");
         }
     }
-    context.out << table.text(context.options.width, 0)
-                << "\nadminhostctl rollback NUMBER restores what that change has changed; --dry-run shows it.\n";
+    context.out << table.text(context.options.width, 0) << '\n';
+    for (const std::string& line :
+         wrapped("adminhostctl rollback NUMBER restores what that change has changed; --dry-run shows it.",
+                 context.options.width)) {
+        context.out << line << '\n';
+    }
     return ExitStatus::done;
 }
 
@@ -363,9 +460,9 @@ ExitStatus rollback(const Context& context, std::span<const std::string> argumen
     if (found == entries.end()) {
         throw usageError("history entry not found: " + arguments.front() + "; \"adminhostctl history\" lists them");
     }
-    const CurrentState current = readState(context);
+    const CurrentState current = readState(context, sectionOf(StateForm(write.description), *found->dictionary()));
     requireWhole(current);
-    const Restoration restoration = restorationOf(*found->dictionary(), current);
+    const Restoration restoration = restorationOf(entries, found, current);
     // Before anything is written.
     for (const std::string& lost : restoration.lost) {
         context.err << "adminhostctl: " << shown(lost) << '\n';

@@ -52,6 +52,13 @@ TEST_F(NeededReads, SettingIsWrittenWithoutCamerasWorkflowsAndAccessLists) {
     EXPECT_THAT(read(root.memberPreferencesPath()), HasSubstr("<integer>8180</integer>"));
 }
 
+TEST_F(NeededReads, ChangeOfASettingIsUndoneWithoutCamerasWorkflowsAndAccessLists) {
+    ASSERT_EQ(ctl({"settings", "set", "server_port", "8180"}).status, 0);
+    const std::vector<std::string> statements = statementsOf({"rollback", "1"});
+    EXPECT_THAT(statements, AllOf(readsProperties, Not(readsCameras), Not(readsWorkflows), Not(readsAccessLists)));
+    EXPECT_THAT(read(root.memberPreferencesPath()), HasSubstr("<integer>8170</integer>"));
+}
+
 TEST_F(NeededReads, PropertyIsWrittenWithoutCamerasWorkflowsAndAccessLists) {
     const std::vector<std::string> statements = statementsOf({"property", "set", "watermark", "left"});
     EXPECT_THAT(statements, AllOf(readsProperties, Not(readsCameras), Not(readsWorkflows), Not(readsAccessLists)));

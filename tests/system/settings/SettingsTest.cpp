@@ -149,12 +149,14 @@ TEST_F(Settings, RollbackThatDoesNotTakeIsNamed) {
     EXPECT_EQ(ctl({"rollback", "77"}).status, 2);
 }
 
-TEST_F(Settings, RollbackNamesSettingsThatWereNotSetThenAndNotesThatThePasswordStays) {
+TEST_F(Settings, RollbackNamesSettingsThatWereNotSetThenAndNotesThatAChangedPasswordStays) {
     root.write("/Library/SorvaneProducer/Shared/Server/member_preferences_" +
                    test::SampleRoot::uuidOf("member", "media1") + ".plist",
                "<plist><dict><key>server_port</key><integer>8170</integer></dict></plist>");
     ASSERT_EQ(post("writeSettings", R"({"configuration":{"tunnel_agent_host":"agent","server_port":9001}})").status,
               200);
+    EXPECT_THAT(ctl({"rollback", "1", "--dry-run"}).output, Not(HasSubstr("password"))) << "it is as it was";
+    ASSERT_EQ(post("writeSettings", R"({"configuration":{"nimbo_client_password":"another"}})").status, 200);
     const ProgramResult rollback = ctl({"rollback", "1"});
     EXPECT_EQ(rollback.status, 1) << "not all of it could be restored";
     EXPECT_THAT(rollback.output, HasSubstr("settings.server_port: 9001 -> 8170: applied\n"));
