@@ -1,5 +1,7 @@
 #include "adminhostctl/Complete.h"
 
+#include "adminhostctl/DirectoryNames.h"
+#include "adminhostctl/Help.h"
 #include "adminhostctl/Width.h"
 #include "platform/value/ValueText.h"
 
@@ -14,15 +16,6 @@
 
 namespace adminhost::ctl {
 namespace {
-
-/// An option that every verb has.
-struct CommonOption {
-    std::string_view name;
-    std::string_view argument;
-};
-constexpr std::array commonOptions = {CommonOption{"--socket", "PATH"},    CommonOption{"--format", "FORMAT"},
-                                      CommonOption{"--languages", "LIST"}, CommonOption{"--timeout", "SECONDS"},
-                                      CommonOption{"--help", ""},          CommonOption{"--version", ""}};
 
 /// Prints candidates that begin with the word, each once. Names that a terminal would act on are left out: a shell
 /// prints what it offers.
@@ -81,7 +74,7 @@ void startLimit(std::chrono::milliseconds limit) {
 
 /// The name of the option's argument; empty if it has none, or if the word is not an option.
 std::string_view argumentOf(const Context& context, const std::string& word) {
-    for (const CommonOption& option : commonOptions) {
+    for (const VerbOption& option : commonOptions()) {
         if (option.name == word) {
             return option.argument;
         }
@@ -119,7 +112,7 @@ const Verb* verbAt(const Context& context, const std::vector<std::string>& plain
 }
 
 void offerOptions(const Context& context, const Verb* verb, bool isCommand, Candidates& candidates) {
-    for (const CommonOption& option : commonOptions) {
+    for (const VerbOption& option : commonOptions()) {
         candidates.offer(std::string(option.name));
     }
     for (const VerbOption& option : context.verbOptions) {
@@ -165,7 +158,7 @@ void offerArgument(const Context& context, const Verb& verb, std::span<const std
         candidates.offerFiles("@");
     }
     if (verb.complete != nullptr && before.size() < verb.most) {
-        candidates.offerAll(verb.complete(context, before));
+        candidates.offerAll(verb.complete(context, {before, word}));
     }
 }
 
@@ -214,8 +207,12 @@ std::vector<std::string> valuesOf(const DescribedKey& key) {
     return key.allowed.empty() && type == "boolean" ? std::vector<std::string>{"yes", "no"} : key.allowed;
 }
 
-std::vector<std::string> peopleNames(const Context& context, std::span<const std::string> /*before*/) {
-    return textsOf(context.service.get("/v1/directory?match="), "entries", "shortName");
+std::vector<std::string> peopleNames(const Context& context, const TypedArguments& typed) {
+    std::vector<std::string> names;
+    for (const Dictionary& entry : entriesBeginning(context, typed.word)) {
+        names.emplace_back(entry.text("shortName"));
+    }
+    return names;
 }
 
 ExitStatus complete(const Context& context, std::span<const std::string> words, std::chrono::milliseconds limit) {
@@ -233,8 +230,7 @@ ExitStatus complete(const Context& context, std::span<const std::string> words, 
             candidates.offerAll({"text", "json", "plist"});
         } else if (argument == "NAME" || argument == "[GROUP]") {
             const bool isGroup = argument == "[GROUP]";
-            const Value answer = context.service.get("/v1/directory?match=");
-            for (const Dictionary& entry : dictionariesAt(answer, "entries")) {
+            for (const Dictionary& entry : entriesBeginning(context, word)) {
                 if (!isGroup || entry.text("type") == "group") {
                     candidates.offer(std::string(entry.text("shortName")));
                 }

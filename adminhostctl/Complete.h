@@ -37,7 +37,8 @@ struct CompletionTarget {
 /// Texts of a key of the dictionaries in the list at the key of an answer.
 [[nodiscard]] std::vector<std::string> textsOf(const Value& answer, std::string_view list, std::string_view key);
 
-/// Short names of people and groups: a completion of a verb whose arguments are names (Verb::complete).
-[[nodiscard]] std::vector<std::string> peopleNames(const Context& context, std::span<const std::string> before);
+/// Short names of people and groups that begin with the typed word: a completion of a verb whose arguments are names
+/// (Verb::complete). The daemon returns 50 at most.
+[[nodiscard]] std::vector<std::string> peopleNames(const Context& context, const TypedArguments& typed);
 
 }  // namespace adminhost::ctl

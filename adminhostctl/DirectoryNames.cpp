@@ -3,16 +3,33 @@
 #include "adminhostctl/Connection.h"
 #include "adminhostctl/Similar.h"
 
+#include <algorithm>
+#include <set>
+
 namespace adminhost::ctl {
 namespace {
 
-/// Short names that begin as the name does: those that it may be a typo of.
+bool isContinuation(char byte) {
+    return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U;
+}
+
+/// Short names that the name, which is not empty, may be a typo of. The daemon does not return all of a large
+/// directory: those that begin with the same letter are asked for, and those that begin as all of the name but its last
+/// letter.
 std::vector<std::string> similarNames(const Context& context, const std::string& name) {
+    std::size_t first = 1;
+    while (first < name.size() && isContinuation(name[first])) {
+        ++first;
+    }
+    std::size_t last = name.size() - 1;
+    while (last > first && isContinuation(name[last])) {
+        --last;
+    }
     std::vector<std::string> names;
-    const Value answer = context.service.get("/v1/directory?match=" + Connection::escaped(name.substr(0, 1)));
-    for (const Dictionary& entry :
-         dictionariesOf(answer.dictionary() == nullptr ? Value() : answer.dictionary()->get("entries"))) {
-        names.emplace_back(entry.text("shortName"));
+    for (const std::size_t length : std::set{first, std::max(first, last)}) {
+        for (const Dictionary& entry : entriesBeginning(context, name.substr(0, length))) {
+            names.emplace_back(entry.text("shortName"));
+        }
     }
     return names;
 }
@@ -29,6 +46,11 @@ std::vector<Dictionary> dictionariesOf(const Value& list) {
     return all;
 }
 
+std::vector<Dictionary> entriesBeginning(const Context& context, const std::string& text) {
+    const Value answer = context.service.get("/v1/directory?match=" + Connection::escaped(text));
+    return dictionariesOf(answer.dictionary() == nullptr ? Value() : answer.dictionary()->get("entries"));
+}
+
 std::vector<Dictionary> entriesNamed(const Context& context, const std::string& name) {
     if (name.empty()) {
         return {};  // the address without a text lists everybody
@@ -42,9 +64,10 @@ std::string_view wordOfType(std::string_view type) noexcept {
 }
 
 Failure unknownName(const Context& context, std::string_view what, const std::string& name) {
-    const bool isAscii = !name.empty() && static_cast<unsigned char>(name.front()) < 0x80;
+    constexpr std::size_t longest = 256;  // accounts have shorter names
+    const bool mayBeTypo = !name.empty() && name.size() <= longest;
     return usageError(std::string(what) + " not found: " + name +
-                      (isAscii ? didYouMean(name, similarNames(context, name)) : std::string()));
+                      (mayBeTypo ? didYouMean(name, similarNames(context, name)) : std::string()));
 }
 
 Failure ambiguousName(const std::string& name, std::span<const Dictionary> entries) {

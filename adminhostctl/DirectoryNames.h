@@ -15,6 +15,9 @@ namespace adminhost::ctl {
 /// The dictionaries of a list.
 [[nodiscard]] std::vector<Dictionary> dictionariesOf(const Value& list);
 
+/// The entries whose short or full name begins with the text, in any case: the first 50 of the directory.
+[[nodiscard]] std::vector<Dictionary> entriesBeginning(const Context& context, const std::string& text);
+
 /// The directory's entries with exactly this name or UUID. Throws Failure if the directory fails.
 [[nodiscard]] std::vector<Dictionary> entriesNamed(const Context& context, const std::string& name);
 

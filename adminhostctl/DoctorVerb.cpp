@@ -62,24 +62,15 @@ Array ownChecks(const Context& context, const std::string& why) {
             check("command line", okState, fmt::format("The command line has the release {}.", ownRelease), "")};
 }
 
+/// A state that this release does not know is a failure: it must not look as if everything were in order.
 std::string_view stateOf(const Value& check) {
     const std::string* state = check.dictionary() == nullptr ? nullptr : check.dictionary()->get("state").string();
-    return state == nullptr ? failureState : std::string_view(*state);
+    return state != nullptr && (*state == okState || *state == warningState) ? std::string_view(*state) : failureState;
 }
 
 std::size_t countOf(const Array& checks, std::string_view state) {
     return static_cast<std::size_t>(
         std::count_if(checks.begin(), checks.end(), [&](const Value& one) { return stateOf(one) == state; }));
-}
-
-/// A text beside a column, in lines that fit.
-std::string besideColumn(const std::string& text, std::size_t column, std::size_t width) {
-    constexpr std::size_t narrowest = 20;
-    std::string all;
-    for (const std::string& line : wrapped(text, std::max(width, column + narrowest) - column)) {
-        all += (all.empty() ? std::string() : std::string(column, ' ')) + line + '\n';
-    }
-    return all;
 }
 
 void printPage(const Context& context, const Array& checks) {
@@ -90,18 +81,14 @@ void printPage(const Context& context, const Array& checks) {
         const std::size_t width = widthOf(shown(one.dictionary()->text("name")));
         nameWidth = width > widestName ? nameWidth : std::max(nameWidth, width);
     }
+    const TextPlace place{stateWidth + nameWidth + 2, stateWidth, context.options.width};
     for (const Value& one : checks) {
-        const std::string name = shown(one.dictionary()->text("name"));
         const std::string_view state = stateOf(one);
-        const std::string shownState = state == okState ? "ok" : state == warningState ? "WARNING" : "FAILURE";
-        const std::string fix = shown(one.dictionary()->text("fix"));
-        const std::size_t column = stateWidth + nameWidth + 2;
-        const std::size_t width = widthOf(name);
-        context.out << shownState << std::string(stateWidth - shownState.size(), ' ') << name
-                    << (width > nameWidth ? '\n' + std::string(column, ' ') : std::string(nameWidth + 2 - width, ' '))
-                    << besideColumn(shown(one.dictionary()->text("found")), column, context.options.width);
-        if (!fix.empty()) {
-            context.out << std::string(column, ' ') << besideColumn("fix: " + fix, column, context.options.width);
+        std::string name = state == okState ? "ok" : state == warningState ? "WARNING" : "FAILURE";
+        name.append(stateWidth - name.size(), ' ').append(shown(one.dictionary()->text("name")));
+        context.out << beside(name, shown(one.dictionary()->text("found")), place);
+        if (const std::string fix = shown(one.dictionary()->text("fix")); !fix.empty()) {
+            context.out << beside(std::string(stateWidth, ' '), "fix: " + fix, place);
         }
     }
     context.out << fmt::format("{} checks: {} ok, {} warnings, {} failures\n", checks.size(), countOf(checks, okState),

@@ -2,6 +2,7 @@
 
 #include "adminhostctl/AuditVerb.h"
 #include "adminhostctl/Complete.h"
+#include "adminhostctl/DirectoryNames.h"
 #include "adminhostctl/DoctorVerb.h"
 #include "adminhostctl/Help.h"
 #include "adminhostctl/LogsVerb.h"
@@ -71,27 +72,24 @@ Dictionary withGroupNames(Dictionary entry) {
 }
 
 ExitStatus whois(const Context& context, Words arguments) {
-    const Value answer = context.service.get("/v1/directory?is=" + Connection::escaped(arguments.front()));
-    const Array* entries = answer.dictionary() == nullptr ? nullptr : answer.dictionary()->get("entries").array();
-    if (entries == nullptr || entries->empty()) {
-        throw usageError("user or group not found: " + arguments.front());
+    const std::vector<Dictionary> entries = entriesNamed(context, arguments.front());
+    if (entries.empty()) {
+        throw unknownName(context, "person or group", arguments.front());
     }
     if (context.options.format != Format::text) {
-        writeValue(context, *entries, Description());
+        writeValue(context, Array(entries.begin(), entries.end()), Description());
         return ExitStatus::done;
     }
-    for (std::size_t i = 0; i < entries->size(); ++i) {
-        const Dictionary* entry = (*entries)[i].dictionary();
+    for (std::size_t i = 0; i < entries.size(); ++i) {
         context.out << (i == 0 ? "" : "\n")
-                    << Reading(Description(), context.options.width)
-                           .text(entry == nullptr ? (*entries)[i] : Value(withGroupNames(*entry)));
+                    << Reading(Description(), context.options.width).text(withGroupNames(entries[i]));
     }
     return ExitStatus::done;
 }
 
 // Completion
 
-std::vector<std::string> logNames(const Context& context, Words) {
+std::vector<std::string> logNames(const Context& context, const TypedArguments&) {
     return textsOf(context.service.get("/v1/logs"), "logs", "name");
 }
 

@@ -2,11 +2,13 @@
 
 #include "adminhostctl/Reading.h"
 #include "adminhostctl/Similar.h"
-#include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "platform/json/Json.h"
 
 #include <algorithm>
+#include <array>
+#include <utility>
+#include <vector>
 
 namespace adminhost::ctl {
 namespace {
@@ -62,31 +64,48 @@ void helpOfCommand(const Context& context, const std::string& name) {
                 << shownJson(jsonOf(description.example().get("request"), true)) << '\n';
 }
 
+/// The text in lines that fit, the further ones indented.
+std::string indentedBelow(const std::string& text, std::size_t width) {
+    constexpr std::size_t indent = 4;
+    std::string all;
+    for (const std::string& line : wrapped(text, width - indent)) {
+        all.append(all.empty() ? 0 : indent, ' ').append(line).append("\n");
+    }
+    return all;
+}
+
+std::string optionText(const Context& context, const VerbOption& option) {
+    constexpr std::size_t column = 26;
+    std::string name("  ");
+    name.append(option.brief).append(option.brief.empty() ? "" : ", ").append(option.name);
+    name.append(option.argument.empty() ? "" : " ").append(option.argument);
+    return beside(name, option.help, {column, 6, context.options.width});
+}
+
 /// The options that the arguments of a verb name, with what they mean.
 std::string optionList(const Context& context, const Verb& verb) {
-    constexpr std::size_t column = 26;
     std::string text;
     for (const VerbOption& option : context.verbOptions) {
-        if (!belongsTo(option, verb)) {
-            continue;
-        }
-        std::string name(option.brief);
-        name.append(name.empty() ? "" : ", ").append(option.name);
-        name.append(option.argument.empty() ? "" : " ").append(option.argument);
-        std::string line = "  " + name;
-        line.append(line.size() + 2 > column ? "\n" + std::string(column, ' ')
-                                             : std::string(column - line.size(), ' '));
-        for (const std::string& part :
-             wrapped(option.help, context.options.width - std::min(context.options.width / 2, column))) {
-            text += line + part + '\n';
-            line = std::string(column, ' ');
-        }
+        text += belongsTo(option, verb) ? optionText(context, option) : "";
     }
     return text;
 }
 
+constexpr std::array common = {
+    VerbOption{"--socket", "PATH", "The daemon's socket; without it that of ADMINHOST_SOCKET, or the usual one"},
+    VerbOption{"--format", "FORMAT", "text for reading, json or plist for programs"},
+    VerbOption{"--languages", "LIST",
+               "Languages of names and descriptions, the preferred one first: de,fr; without it those of LANGUAGE, "
+               "LC_ALL, LC_MESSAGES and LANG"},
+    VerbOption{"--timeout", "SECONDS",
+               "How long to wait for an answer; without it until 10 s after the daemon's deadline. The service stops "
+               "before that"},
+    VerbOption{"--help", "", "Describe the verb or the command", {}, "-h"},
+    VerbOption{"--version", "", "Print the release"},
+};
+
 void helpOfVerb(const Context& context, const Verb& verb) {
-    context.out << "adminhostctl " << verb.words << (verb.arguments.empty() ? "" : " ") << verb.arguments << '\n';
+    context.out << indentedBelow(usageOf(verb), context.options.width);
     for (const std::string& line : wrapped(verb.summary, context.options.width - 2)) {
         context.out << "  " << line << '\n';
     }
@@ -99,18 +118,67 @@ void helpOfVerb(const Context& context, const Verb& verb) {
     }
 }
 
-void helpOfAll(const Context& context) {
-    Table table({"verb", "", "meaning"});
-    for (const Verb& verb : context.verbs) {
-        table.addRow({std::string(verb.words), std::string(verb.arguments), std::string(verb.summary)});
+/// The arguments without options, and without a second way of giving them: "KEY [VALUE|@FILE|@-]".
+std::string argumentsWithoutOptions(std::string_view arguments) {
+    std::string plain;
+    for (std::size_t at = 0; at < arguments.size();) {
+        const bool isOption = arguments.substr(at).starts_with("[-");
+        const std::size_t begin = at;
+        int depth = 0;
+        do {
+            depth += arguments[at] == '[' ? 1 : arguments[at] == ']' ? -1 : 0;
+            ++at;
+        } while (at < arguments.size() && (depth > 0 || arguments[at] != ' '));
+        const std::string_view word = arguments.substr(begin, at - begin);
+        if (word == "|") {
+            break;
+        }
+        if (!isOption) {
+            plain.append(plain.empty() ? "" : " ").append(word);
+        }
+        at = std::min(arguments.find_first_not_of(' ', at), arguments.size());
     }
-    context.out << table.text(context.options.width, 0)
-                << "\n\"adminhostctl VERB --help\" shows a verb's options and examples.\n"
-                   "Every other word is a command of the service: adminhostctl commands lists them,\n"
-                   "adminhostctl help COMMAND describes one.\n";
+    return plain;
+}
+
+void helpOfAll(const Context& context) {
+    std::vector<std::pair<std::string, std::string>> lines;
+    std::size_t longest = 0;
+    for (const Verb& verb : context.verbs) {
+        const std::string arguments = argumentsWithoutOptions(verb.arguments);
+        std::string words(verb.words);
+        words.append(arguments.empty() ? "" : " ").append(arguments);
+        lines.emplace_back(std::move(words), verb.summary);
+        longest = std::max(longest, lines.back().first.size());
+    }
+    constexpr std::size_t widestColumn = 34;
+    for (const char* usage :
+         {"adminhostctl [OPTION]... VERB [ARGUMENT]...", "adminhostctl [OPTION]... COMMAND [KEY=TEXT]..."}) {
+        context.out << indentedBelow(usage, context.options.width);
+    }
+    context.out << "\nVerbs:\n";
+    for (const auto& [words, summary] : lines) {
+        context.out << beside("  " + words, summary, {std::min(longest, widestColumn) + 4, 6, context.options.width});
+    }
+    context.out << "\nOptions of all verbs and commands:\n";
+    for (const VerbOption& option : common) {
+        context.out << optionText(context, option);
+    }
+    context.out << '\n';
+    for (const char* text : {"\"adminhostctl VERB --help\" shows the options of a verb, and examples.",
+                             "Every other word is a command of the service: \"adminhostctl commands\" lists them, "
+                             "\"adminhostctl help COMMAND\" describes one."}) {
+        for (const std::string& line : wrapped(text, context.options.width)) {
+            context.out << line << '\n';
+        }
+    }
 }
 
 }  // namespace
+
+std::span<const VerbOption> commonOptions() noexcept {
+    return common;
+}
 
 std::string typeText(const DescribedKey& key) {
     const std::string type = key.enteredAs.empty() ? key.type : key.enteredAs;

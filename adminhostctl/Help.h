@@ -16,4 +16,7 @@ namespace adminhost::ctl {
 /// The key's type for people: "whole number".
 [[nodiscard]] std::string typeText(const DescribedKey& key);
 
+/// The options that every verb and every command has.
+[[nodiscard]] std::span<const VerbOption> commonOptions() noexcept;
+
 }  // namespace adminhost::ctl

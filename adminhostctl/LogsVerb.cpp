@@ -2,6 +2,7 @@
 
 #include "adminhostctl/Follow.h"
 #include "adminhostctl/Reading.h"
+#include "adminhostctl/Similar.h"
 #include "adminhostctl/Table.h"
 #include "adminhostctl/Width.h"
 #include "platform/value/Value.h"
@@ -61,15 +62,17 @@ std::vector<ServiceLog> logsOf(const Value& answer) {
 
 std::vector<ServiceLog> selected(std::vector<ServiceLog> logs, const std::string& name) {
     std::string names;
+    std::vector<std::string> known;
     std::vector<ServiceLog> found;
     for (ServiceLog& log : logs) {
+        known.push_back(log.name);
         names += (names.empty() ? "" : ", ") + log.name;
         if (log.name == name || log.plugin + '/' + log.name == name) {
             found.push_back(std::move(log));
         }
     }
     if (found.empty()) {
-        throw usageError("log not found: " + name + "; the logs are " + names);
+        throw usageError("log not found: " + name + didYouMean(name, known) + "; the logs are " + names);
     }
     if (found.size() > 1) {
         throw usageError("several plug-ins have a log " + name + "; use " + found.front().plugin + '/' + name);

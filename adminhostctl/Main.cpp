@@ -10,6 +10,7 @@
 #include "adminhostctl/Interrupt.h"
 #include "adminhostctl/Prompt.h"
 #include "adminhostctl/RequestArguments.h"
+#include "adminhostctl/Similar.h"
 #include "adminhostctl/Verb.h"
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/DesiredVerbs.h"
@@ -24,6 +25,7 @@
 #include <iostream>
 #include <sstream>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <CLI/CLI.hpp>
@@ -83,35 +85,74 @@ std::vector<adminhost::ctl::VerbOption> allOptions() {
     return all;
 }
 
-/// The help of the verb or the command that the words begin with; further words are its arguments.
+/// The help of the verb or the command that the words begin with, whose further words are its arguments; of everything
+/// without words.
 ExitStatus helpOf(const adminhost::ctl::Context& context, std::vector<std::string> words) {
     const bool isOfTwo =
         words.size() > 1 && std::any_of(context.verbs.begin(), context.verbs.end(), [&](const auto& verb) {
             return verb.words.find(' ') != std::string_view::npos &&
                    adminhost::ctl::beginsWith(verb, std::span(words).first(1));
         });
-    words.resize(isOfTwo ? 2 : 1);
+    words.resize(std::min<std::size_t>(words.size(), isOfTwo ? 2 : 1));
     return adminhost::ctl::help(context, words);
 }
 
 /// An excluded option must have been added before.
 void addOption(CLI::App& app, const adminhost::ctl::VerbOption& option, adminhost::ctl::VerbOptions& options) {
     const std::string name(option.name);
-    const std::string help(option.help);
     const std::string names = option.brief.empty() ? name : std::string(option.brief) + ',' + name;
     CLI::Option* const added =
-        option.argument.empty()
-            ? app.add_flag_callback(
-                  names, [&options, name] { options.own[name]; }, help)
-            : app.add_option_function<std::string>(
-                     names, [&options, name](const std::string& text) { options.own[name] = text; }, help)
-                  ->type_name(std::string(option.argument));
+        option.argument.empty() ? app.add_flag_callback(names, [&options, name] { options.own[name]; })
+                                : app.add_option_function<std::string>(
+                                         names, [&options, name](const std::string& text) { options.own[name] = text; })
+                                      ->type_name(std::string(option.argument));
     if (option.argument.starts_with('[')) {
         added->expected(0, 1);
     }
     if (!option.excludes.empty()) {
         added->excludes(app.get_option(std::string(option.excludes)));
     }
+}
+
+/// What is wrong with the options of the command line.
+std::string problemOf(const CLI::ParseError& error, const CLI::App& app) {
+    const std::string text = error.what();
+    if (dynamic_cast<const CLI::ExtrasError*>(&error) != nullptr) {
+        const std::vector<std::string> unknown = app.remaining();
+        std::vector<std::string> known;
+        for (const CLI::Option* option : app.get_options()) {
+            for (const std::string& name : option->get_lnames()) {
+                known.push_back("--" + name);
+            }
+        }
+        const std::string& first = unknown.empty() ? text : unknown.front();
+        const std::string similar = adminhost::ctl::didYouMean(first, known);
+        return "option not found: " + first +
+               (similar.empty() ? "; a word that begins with a hyphen and is no option follows \"--\"" : similar);
+    }
+    const std::string name = text.substr(0, text.find(':'));
+    const CLI::Option* const option = name.starts_with('-') ? app.get_option_no_throw(name) : nullptr;
+    if (dynamic_cast<const CLI::ArgumentMismatch*>(&error) != nullptr && option != nullptr) {
+        return option->count() > 1 ? name + " was given twice" : name + " needs " + option->get_type_name();
+    }
+    if (dynamic_cast<const CLI::ExcludesError*>(&error) != nullptr) {
+        const std::size_t between = text.find(" excludes ");
+        return between == std::string::npos
+                   ? text
+                   : text.substr(0, between) + " and " + text.substr(between + 10) + " do not go together";
+    }
+    return text;
+}
+
+/// Throws Failure(usage) if it is not the name of a format.
+Format formatOf(const std::string& text) {
+    for (const auto& [name, format] :
+         {std::pair{"text", Format::text}, {"json", Format::json}, {"plist", Format::plist}}) {
+        if (text == name) {
+            return format;
+        }
+    }
+    throw adminhost::ctl::usageError("--format: \"" + text + "\" is none of text, json, plist");
 }
 
 /// The timeout that was given. Throws Failure(usage) if it is not a number of seconds.
@@ -134,33 +175,21 @@ int runMain(int count, char** words) {
     std::string socket = defaultSocket;
     std::string format = "text";
     std::vector<std::string> rest;
-    CLI::App app(
-        "Administers the service through its daemon.\n\"adminhostctl help\" lists the verbs, \"adminhostctl "
-        "commands\" the service's commands.",
-        "adminhostctl");
-    app.add_option("--socket", socket, "The daemon's socket")->envname("ADMINHOST_SOCKET")->type_name("PATH");
-    app.add_option("--format", format, "Format of the answer: text (for reading), json or plist")
-        ->check(CLI::IsMember({"text", "json", "plist"}))
-        ->type_name("FORMAT");
+    CLI::App app;  // the help is our own (Help.h)
+    app.add_option("--socket", socket)->envname("ADMINHOST_SOCKET")->type_name("PATH");
+    app.add_option("--format", format)->type_name("FORMAT");
     std::optional<std::string> languages;
-    app.add_option("--languages", languages,
-                   "Languages of names and descriptions, the preferred one first: de,fr (by default those of LANGUAGE, "
-                   "LC_ALL, LC_MESSAGES and LANG)")
-        ->type_name("LIST");
+    app.add_option("--languages", languages)->type_name("LIST");
     std::optional<std::string> timeout;
-    app.add_option("--timeout", timeout,
-                   "Seconds to wait for an answer (by default until 10 s after the daemon's deadline); the service "
-                   "stops before that")
-        ->type_name("SECONDS");
+    app.add_option("--timeout", timeout)->type_name("SECONDS");
     const std::vector<adminhost::ctl::VerbOption> verbOptions = allOptions();
     for (const adminhost::ctl::VerbOption& option : verbOptions) {
         addOption(app, option, options);
     }
     bool isHelp = false;
     app.set_help_flag();
-    app.add_flag("-h,--help", isHelp, "Describe the verb or the command, or these options");
-    app.add_option("words", rest, "A verb or a command, and its arguments: KEY=TEXT, KEY:=JSON, KEY@FILE or KEY@-")
-        ->type_name("WORD");
+    app.add_flag("-h,--help", isHelp);
+    app.add_option("words", rest)->type_name("WORD");
     app.set_version_flag("--version", std::string("adminhostctl ") + ADMINHOST_RELEASE);
     try {
         app.parse(count, words);
@@ -169,22 +198,20 @@ int runMain(int count, char** words) {
         std::ostringstream err;
         const bool isVersion = app.exit(error, out, err) == 0;
         std::cout << out.str();
-        std::cerr << adminhost::ctl::shown(err.str());  // it repeats words of the command line
+        if (!isVersion) {
+            // It repeats words of the command line.
+            std::cerr << "adminhostctl: " << adminhost::ctl::shown(problemOf(error, app)) << '\n';
+        }
         return isVersion ? statusOf(ExitStatus::done) : statusOf(ExitStatus::usage);
     }
-    if (isHelp && rest.empty()) {
-        std::cout << app.help();
-        return statusOf(ExitStatus::done);
-    }
-    if (rest.empty()) {
+    if (rest.empty() && !isHelp) {
         std::cerr << "adminhostctl: a verb or a command is missing; adminhostctl help lists them\n";
         return statusOf(ExitStatus::usage);
     }
-    options.format = format == "json" ? Format::json : format == "plist" ? Format::plist : Format::text;
     options.width = outputWidth();
     options.file = options.argumentOf("--file");
     options.names = options.has("--names");
-    const bool completes = rest.front() == "complete";
+    const bool completes = !rest.empty() && rest.front() == "complete";
     if (completes) {
         rest.erase(rest.begin());
         const adminhost::ctl::CompletionTarget target = adminhost::ctl::completionTarget(rest);
@@ -193,6 +220,7 @@ int runMain(int count, char** words) {
         timeout = target.timeout ? target.timeout : timeout;
     }
     try {
+        options.format = formatOf(format);
         adminhost::ctl::DaemonClient service(
             socket, languages ? adminhost::ctl::languagesOfText(*languages) : adminhost::ctl::callerLanguages(),
             timeoutOf(timeout));

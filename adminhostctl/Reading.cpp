@@ -200,17 +200,8 @@ void Reading::appendDictionary(std::string& text, const Dictionary& dictionary, 
         if (isSection(entry.value, below(entry))) {
             continue;
         }
-        const std::string key = shown(entry.key);
-        std::string line = std::string(indent, ' ') + key + std::string(column - indent - widthOf(key), ' ');
-        bool first = true;
-        for (const std::string& part :
-             wrapped(cell(entry.value, below(entry)), std::max(_width, column + 20) - column)) {
-            line += (first ? "" : std::string(column, ' ')) + part;
-            line.erase(line.find_last_not_of(' ') + 1);
-            text += line + '\n';
-            line.clear();
-            first = false;
-        }
+        text += beside(std::string(indent, ' ') + shown(entry.key), cell(entry.value, below(entry)),
+                       {column, indent + 4, _width});
     }
     bool empty = text.empty();
     for (const DictionaryEntry& entry : dictionary) {

@@ -261,6 +261,21 @@ const Verb* verbOf(std::span<const Verb> verbs, const std::vector<std::string>& 
     throw usageError("not a verb: \"" + typed + '"' + didYouMean(typed, known) + "; the verbs are " + list);
 }
 
+Failure wrongUse(const Context& context, std::string_view words, const std::string& problem) {
+    std::string usage;
+    for (const Verb& verb : context.verbs) {
+        if (verb.words == words) {
+            usage = usageOf(verb);
+        }
+    }
+    return usageError(std::string(words) + ": " + problem + "; usage: " + usage);
+}
+
+std::string usageOf(const Verb& verb) {
+    return "adminhostctl " + std::string(verb.words) + (verb.arguments.empty() ? "" : " ") +
+           std::string(verb.arguments);
+}
+
 ExitStatus run(const Context& context, const std::vector<std::string>& words) {
     const Verb* verb = verbOf(context.verbs, words);
     requireOwnOptions(context, verb, words.front());
@@ -268,9 +283,11 @@ ExitStatus run(const Context& context, const std::vector<std::string>& words) {
         return perform(context, words);
     }
     const Words arguments = Words(words).subspan(splitWords(verb->words).size());
-    if (arguments.size() < verb->least || arguments.size() > verb->most) {
-        throw usageError("usage: adminhostctl " + std::string(verb->words) + (verb->arguments.empty() ? "" : " ") +
-                         std::string(verb->arguments));
+    if (arguments.size() < verb->least) {
+        throw wrongUse(context, verb->words, "an argument is missing");
+    }
+    if (arguments.size() > verb->most) {
+        throw wrongUse(context, verb->words, "too many arguments: " + arguments[verb->most]);
     }
     return verb->run(context, arguments);
 }

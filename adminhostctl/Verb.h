@@ -66,6 +66,12 @@ struct Context {
     std::span<const VerbOption> verbOptions;  ///< all of them
 };
 
+/// The arguments of a verb on a command line that is being completed.
+struct TypedArguments {
+    std::span<const std::string> before;  ///< the finished ones, without options
+    const std::string& word;              ///< the beginning of the next one; may be empty
+};
+
 struct Verb {
     std::string_view words;      ///< "camera list"
     std::string_view arguments;  ///< for people: "NAME|UUID [--group]"; the verb has the options that are named here
@@ -74,8 +80,9 @@ struct Verb {
     std::size_t most;
     ExitStatus (*run)(const Context& context, std::span<const std::string> arguments);
     std::array<std::string_view, 2> examples;  ///< without the program's name, for a shell
-    /// What the argument that follows these can be, for completion; null if it is not known, or a file.
-    std::vector<std::string> (*complete)(const Context& context, std::span<const std::string> before) = nullptr;
+    /// What the next argument can be, for completion; null if it is not known, or a file. Candidates that do not begin
+    /// with the typed word are dropped by the caller.
+    std::vector<std::string> (*complete)(const Context& context, const TypedArguments& typed) = nullptr;
 };
 
 /// The first words of all verbs.
@@ -132,6 +139,12 @@ RequestReport reportLost(const Context& context, const LostAnswer& lost);
 
 /// The argument at the index; nullopt if fewer were given.
 [[nodiscard]] std::optional<std::string> wordAt(std::span<const std::string> arguments, std::size_t index);
+
+/// "adminhostctl settings get [KEY]".
+[[nodiscard]] std::string usageOf(const Verb& verb);
+
+/// The usage error for arguments that do not fit the verb with these words: "VERB: PROBLEM; usage: ...".
+[[nodiscard]] Failure wrongUse(const Context& context, std::string_view words, const std::string& problem);
 
 /// Runs the verb or command at the beginning of the words. Throws Failure.
 [[nodiscard]] ExitStatus run(const Context& context, const std::vector<std::string>& words);

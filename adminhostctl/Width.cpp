@@ -144,4 +144,37 @@ std::vector<std::string> wrapped(std::string_view text, std::size_t width) {
     return lines;
 }
 
+std::string beside(std::string_view name, std::string_view text, const TextPlace& place) {
+    constexpr std::size_t least = 20;
+    constexpr std::size_t gap = 2;
+    const bool isNarrow = place.column + least > place.width;
+    std::string all;
+    const std::vector<std::string> names = wrapped(name, std::max(place.width, place.below + least) - place.below);
+    for (const std::string& line : names) {
+        all.append(all.empty() ? "" : "\n" + std::string(place.below, ' ')).append(line);
+    }
+    const std::size_t used = widthOf(names.back()) + (names.size() > 1 ? place.below : 0);
+    std::size_t begin = place.column;
+    if (name.find_first_not_of(' ') == std::string_view::npos) {
+        begin = isNarrow ? place.below : place.column;
+        all.assign(begin, ' ');
+    } else if (isNarrow && used + gap + widthOf(text) <= place.width && text.find('\n') == std::string_view::npos) {
+        begin = used + gap;
+        all.append(gap, ' ');
+    } else if (isNarrow || used + gap > place.column) {
+        begin = isNarrow ? place.below : place.column;
+        all.append(1, '\n').append(begin, ' ');
+    } else {
+        all.append(place.column - used, ' ');
+    }
+    bool isFirst = true;
+    for (const std::string& line : wrapped(text, std::max(place.width, begin + least) - begin)) {
+        all.append(isFirst ? 0 : begin, ' ').append(line);
+        all.erase(all.find_last_not_of(' ') + 1);
+        all += '\n';
+        isFirst = false;
+    }
+    return all;
+}
+
 }  // namespace adminhost::ctl

@@ -28,4 +28,14 @@ namespace adminhost::ctl {
 /// The text in lines of at most `width` columns (at least 2), broken at blanks if it has any.
 [[nodiscard]] std::vector<std::string> wrapped(std::string_view text, std::size_t width);
 
+/// Where a text beside a name goes.
+struct TextPlace {
+    std::size_t column;  ///< where it begins
+    std::size_t below;   ///< where it begins, below the name, if fewer than 20 columns are left beside it
+    std::size_t width;   ///< of the terminal
+};
+
+/// A name and its text in lines of at most `width` columns, each with a line feed.
+[[nodiscard]] std::string beside(std::string_view name, std::string_view text, const TextPlace& place);
+
 }  // namespace adminhost::ctl

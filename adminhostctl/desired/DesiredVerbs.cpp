@@ -1,7 +1,6 @@
 #include "adminhostctl/desired/DesiredVerbs.h"
 
 #include "adminhostctl/Complete.h"
-#include "adminhostctl/Connection.h"
 #include "adminhostctl/OutputFile.h"
 #include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
@@ -200,8 +199,8 @@ ExitStatus applyFiles(const Context& context, Words arguments) {
 // Completion
 
 /// All settings.
-std::vector<std::string> settingsAnd(const Context& context, Words before) {
-    if (!before.empty()) {
+std::vector<std::string> settingsAnd(const Context& context, const TypedArguments& typed) {
+    if (!typed.before.empty()) {
         return {};
     }
     const StateForm form(context.service.stateCommand("write").description);
@@ -216,18 +215,17 @@ std::vector<std::string> settingsAnd(const Context& context, Words before) {
 }
 
 /// The settings that can be written, then the values that one may have.
-std::vector<std::string> writableSettings(const Context& context, Words before) {
+std::vector<std::string> writableSettings(const Context& context, const TypedArguments& typed) {
     const StateForm form(context.service.stateCommand("write").description);
-    if (before.empty()) {
+    if (typed.before.empty()) {
         return settingNames(form, {});
     }
-    const DescribedKey* key = form.setting(before.front());
+    const DescribedKey* key = form.setting(typed.before.front());
     return key == nullptr ? std::vector<std::string>() : valuesOf(*key);
 }
 
-std::vector<std::string> historyNumbers(const Context& context, Words) {
-    const std::string plugin = context.service.stateCommand("write").plugin;
-    return textsOf(context.service.get("/v1/" + Connection::escaped(plugin) + "/history"), "history", "number");
+std::vector<std::string> historyNumbers(const Context& context, const TypedArguments&) {
+    return historyNumbersOf(context);
 }
 
 constexpr std::array table = {

@@ -4,6 +4,7 @@
 #include "adminhostctl/Width.h"
 #include "adminhostctl/desired/StateForm.h"
 #include "adminhostctl/desired/Toml.h"
+#include "adminhostctl/lumio/Listing.h"
 #include "adminhostctl/lumio/People.h"
 #include "platform/text/Uuid.h"
 
@@ -320,7 +321,7 @@ ExitStatus removeUnknown(const Context& context, const std::string& uuid, const 
 ExitStatus accessOf(const Context& context, std::span<const std::string> arguments) {
     const std::string group = context.options.argumentOf(groupOption);
     if (arguments.empty() == group.empty()) {
-        throw usageError("usage: adminhostctl access NAME|UUID [--group] [--revoke]");
+        throw wrongUse(context, "access", arguments.empty() ? "a name is missing" : "one name is enough");
     }
     const Overview overview = readOverview(context);
     const Dictionary entry = entryNamed(context, group.empty() ? arguments.front() : group, overview);
@@ -338,7 +339,8 @@ ExitStatus accessOf(const Context& context, std::span<const std::string> argumen
     for (const Dictionary& resource : overview.resources) {
         Dictionary access = accessTo(resource, entry, groups);
         // What is open to everyone is not open to an account that nobody can sign in with.
-        if (access.empty() || (!isKnown && access.get("directly") != Value(true))) {
+        if (access.empty() || (!isKnown && access.get("directly") != Value(true)) ||
+            (context.options.has(restrictedOption) && access.get("everyone") == Value(true))) {
             continue;
         }
         access.set("section", resource.get("section"));

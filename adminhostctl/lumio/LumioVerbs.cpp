@@ -86,7 +86,7 @@ struct ElementsAndPeople {
 };
 
 /// "ELEMENT NAME... [--group]", or "--group GROUP ELEMENT...".
-ElementsAndPeople elementsAndPeople(const Context& context, const ElementKind& kind, Words words) {
+ElementsAndPeople elementsAndPeople(const Context& context, const std::string& verb, Words words) {
     std::vector<std::string> all(words.begin(), words.end());
     if (std::string group = context.options.argumentOf(groupOption); !group.empty()) {
         const std::vector<Dictionary> entries = entriesNamed(context, group);
@@ -98,20 +98,19 @@ ElementsAndPeople elementsAndPeople(const Context& context, const ElementKind& k
         all.insert(all.begin(), std::move(group));  // "--group ELEMENT NAME"
     }
     if (all.size() < 2) {
-        throw usageError(std::string("a name is missing: adminhostctl ") + kind.word + " allow|deny " +
-                         std::string(kind.word) + " NAME..., or --group GROUP " + kind.word + "...");
+        throw wrongUse(context, verb, "a name is missing");
     }
     return {{all.front()}, {all.begin() + 1, all.end()}};
 }
 
 template <const ElementKind& kind>
 ExitStatus allowVerb(const Context& context, Words words) {
-    const auto [elements, people] = elementsAndPeople(context, kind, words);
+    const auto [elements, people] = elementsAndPeople(context, kind.word + std::string(" allow"), words);
     return allowPeople(context, kind, elements, people);
 }
 template <const ElementKind& kind>
 ExitStatus denyVerb(const Context& context, Words words) {
-    const auto [elements, people] = elementsAndPeople(context, kind, words);
+    const auto [elements, people] = elementsAndPeople(context, kind.word + std::string(" deny"), words);
     return denyPeople(context, kind, elements, people);
 }
 template <const ElementKind& kind>
@@ -125,20 +124,20 @@ ExitStatus cameraRemove(const Context& context, Words words) {
 
 // Completion
 
-std::vector<std::string> propertyNames(const Context& context, Words before) {
-    return before.empty() ? elementNames(context, property) : std::vector<std::string>();
+std::vector<std::string> propertyNames(const Context& context, const TypedArguments& typed) {
+    return typed.before.empty() ? elementNames(context, property) : std::vector<std::string>();
 }
 
 /// What follows the name of an element.
 enum class Then { nothing, people, onOrOff };
 
 template <const ElementKind& kind, Then then>
-std::vector<std::string> elementsThen(const Context& context, Words before) {
-    if (before.empty()) {
+std::vector<std::string> elementsThen(const Context& context, const TypedArguments& typed) {
+    if (typed.before.empty()) {
         return elementNames(context, kind);
     }
     if constexpr (then == Then::people) {
-        std::vector<std::string> names = peopleNames(context, before);
+        std::vector<std::string> names = peopleNames(context, typed);
         // After "--group GROUP" all words are elements, and a name is seldom both.
         for (std::string& name : elementNames(context, kind)) {
             names.push_back(std::move(name));
@@ -240,12 +239,12 @@ constexpr std::array table = {
          {{"workflow access Archive on", "workflow access Archive off"}},
          &elementsThen<workflow, Then::onOrOff>},
     Verb{"access",
-         "NAME|UUID [--group] [--revoke [--yes] [--dry-run]]",
+         "NAME|UUID [--group] [--restricted] [--revoke [--yes] [--dry-run]]",
          "Show what a person or a group may use, or remove it from all lists",
          0,
          1,
          &accessOf,
-         {{"access anna", "access --group studio --revoke"}},
+         {{"access anna --restricted", "access --group studio --revoke"}},
          &peopleNames},
     Verb{"property list",
          "[--match GLOB] [--sort COLUMN] [--columns LIST] [--wide] [--names]",
@@ -280,7 +279,7 @@ constexpr std::array options = {
     VerbOption{matchOption, "GLOB", "Only those whose name matches the pattern, in any case"},
     VerbOption{statusOption, "STATUS", "Only those with this status, which may be a pattern"},
     VerbOption{allowedOption, "NAME", "Only those that this person or group may use"},
-    VerbOption{restrictedOption, "", "Only those that are restricted to their list"},
+    VerbOption{restrictedOption, "", "Only those that are restricted to their list, and not open to everyone"},
     VerbOption{sortOption, "COLUMN", "In the order of this column"},
     VerbOption{columnsOption, "LIST", "Show these columns, separated by commas"},
     VerbOption{wideOption, "", "Show long lists in full, and do not fit the table to the terminal"},

@@ -168,7 +168,7 @@ void print(const Context& context, const Found& found) {
         width = std::max(width, name.size());
     }
     for (const auto& [name, text] : lines) {
-        context.out << name << std::string(width + 2 - name.size(), ' ') << text << '\n';
+        context.out << beside(name, text, {width + 2, 4, context.options.width});
     }
 }
 

@@ -3,6 +3,7 @@
 #include "tests/system/apply/ControlledService.h"
 
 #include <chrono>
+#include <filesystem>
 
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -58,7 +59,8 @@ TEST_F(Complete, NamesComeFromTheDaemon) {
                 AllOf(Contains("studio"), Not(Contains("stefan"))));
     EXPECT_THAT(candidates({"whois", "an"}), ElementsAre("anna"));
     ASSERT_EQ(ctl({"settings", "set", "server_port", "8180"}).status, 0);
-    EXPECT_THAT(candidates({"rollback", ""}), ElementsAre("1"));
+    ASSERT_EQ(ctl({"property", "set", "watermark", "left"}).status, 0);
+    EXPECT_THAT(candidates({"rollback", ""}), ElementsAre("r1", "1"));
 }
 
 TEST_F(Complete, KeysAndValuesAreOffered) {
@@ -89,6 +91,18 @@ TEST_F(Complete, FilesAreOfferedWhereAFileBelongs) {
 TEST_F(Complete, NameThatATerminalWouldActOnIsNotOffered) {
     root.sql("update cameras set name = 'Roof' || char(27) || '[31m' where name = 'Roof'");
     EXPECT_THAT(candidates({"camera", "show", "Roof"}), IsEmpty());
+}
+
+TEST_F(Complete, NamesThatTheServiceReadsTooSlowlyAreLeftOut) {
+    const std::vector<std::string> line{"complete", "--", "--socket", daemon.socket(), "camera", "show", "Ro"};
+    const std::string tool = root.disk("/usr/bin/sqlite3");
+    std::filesystem::remove(tool);
+    std::ofstream(tool) << "#!/bin/sh\n/bin/sleep 0.5\nexec /usr/bin/sqlite3 \"$@\"\n";
+    std::filesystem::permissions(tool, std::filesystem::perms(0755));
+    const ProgramResult slow = ctl(line);
+    EXPECT_EQ(slow.status, 0);
+    EXPECT_EQ(slow.output, "") << "0.5 s are more than the bound of 100 ms";
+    EXPECT_THAT(candidates({"camera", "show", "Ro"}), ElementsAre("Roof")) << "with a bound of 60 s";
 }
 
 TEST_F(Complete, DaemonThatDoesNotAnswerIsLeftOutAfterTheBound) {

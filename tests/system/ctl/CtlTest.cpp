@@ -261,10 +261,33 @@ TEST(CtlReach, VersionAndOptionsNeedNoDaemon) {
     EXPECT_EQ(runIn(program, {"--version"}, "/nowhere/socket").out, "adminhostctl " ADMINHOST_RELEASE "\n");
     const Result options = runIn(program, {"--help"}, "/nowhere/socket");
     EXPECT_EQ(options.status, 0);
+    EXPECT_EQ(runIn(program, {"help"}, "/nowhere/socket").out, options.out);
     for (const char* option :
-         {"--socket", "--format", "--file", "--names", "--group", "--languages", "--password-file", "--protect",
-          "--no-protect", "--clear", "--follow", "--lines", "--validate", "--save", "--yes", "--version"}) {
+         {"--socket PATH", "--format FORMAT", "--languages LIST", "--timeout SECONDS", "-h, --help", "--version",
+          "adminhostctl [OPTION]... VERB [ARGUMENT]...", "\n  camera show NAME|UUID  "}) {
         EXPECT_THAT(options.out, HasSubstr(option));
+    }
+    EXPECT_THAT(options.out, Not(HasSubstr("--revoke"))) << "options of a verb are in the help of the verb";
+}
+
+TEST(CtlReach, OptionThatIsWrongIsNamedAndASimilarOneSuggested) {
+    for (const auto& [words, message] : std::vector<std::pair<std::vector<std::string>, std::string>>{
+             {{"apply", "x", "--dry-rn"}, "adminhostctl: option not found: --dry-rn; did you mean \"--dry-run\"?\n"},
+             {{"settings", "set", "a", "-x"},
+              "adminhostctl: option not found: -x; a word that begins with a hyphen and is no option follows \"--\"\n"},
+             {{"status", "--format", "xml"}, "adminhostctl: --format: \"xml\" is none of text, json, plist\n"},
+             {{"history", "--since"}, "adminhostctl: --since needs TIME\n"},
+             {{"status", "--socket", "a", "--socket", "b"}, "adminhostctl: --socket was given twice\n"},
+             {{"property", "set", "a", "--protect", "--no-protect"},
+              "adminhostctl: --protect and --no-protect do not go together\n"},
+             {{"settings", "set", "a", "b", "c"},
+              "adminhostctl: settings set: too many arguments: c; usage: adminhostctl settings set KEY "},
+             {{"rollback"}, "adminhostctl: rollback: an argument is missing; usage: adminhostctl rollback NUMBER "},
+             {{"access"}, "adminhostctl: access: a name is missing; usage: adminhostctl access NAME|UUID "}}) {
+        const Result result = runIn(program, words, "/nowhere/socket");
+        EXPECT_EQ(result.status, 2) << testing::PrintToString(words);
+        EXPECT_EQ(result.err.substr(0, message.size()), message);
+        EXPECT_EQ(result.out, "");
     }
 }
 

@@ -71,6 +71,11 @@ TEST_F(Help, UnknownNamesAreUsageAndASimilarOneIsSuggested) {
     expectUsage({"camera", "show", "Studio_A"}, "camera not found: Studio_A; did you mean \"Studio A\"?");
     expectUsage({"camera", "access", "Rof", "on"}, "camera not found: Rof; did you mean \"Roof\"?");
     expectUsage({"property", "remove", "watermrk"}, "property not found: watermrk; did you mean \"watermark\"?");
+    expectUsage({"whois", "ana"}, "person or group not found: ana; did you mean \"anna\"?");
+    expectUsage({"access", "lecturrs"}, "person or group not found: lecturrs; did you mean \"lecturers\"?");
+    expectUsage({"logs", "server_lg"}, "log not found: server_lg; did you mean \"server_log\"?");
+    expectUsage({"camera", "allow", "Roof"},
+                "camera allow: a name is missing; usage: adminhostctl camera allow CAMERA");
     expectUsage({"readSettings", "optionalArguments.varaint=x"}, "did you mean \"optionalArguments.variant\"?");
 }
 
