@@ -94,9 +94,12 @@ std::optional<Error> copy(const std::vector<HostPath>& files, const HostPath& en
     return std::nullopt;
 }
 
-/// An entry's description, if the entry is complete.
+/// An entry's description, if the entry is complete. Nothing but the format is known of one of a newer release.
 std::optional<Dictionary> wholeEntry(const HostPath& entry) {
     auto about = readDictionary(below(entry, aboutName));
+    if (about && formatOf(*about) > SettingsHistory::format) {
+        return about;
+    }
     const Array* files = about ? about->get("files").array() : nullptr;
     for (std::size_t i = 0; files != nullptr && i < files->size(); ++i) {
         const Dictionary* file = (*files)[i].dictionary();

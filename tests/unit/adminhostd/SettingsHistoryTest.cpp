@@ -269,6 +269,25 @@ TEST_F(HistoryTest, EntriesOfTheFirstFormatAreReadAndThoseOfANewerOneAreSkippedW
     EXPECT_THAT(log.lines, ElementsAre(HasSubstr("2 entries of the history were written by a newer release")));
 }
 
+TEST_F(HistoryTest, EntriesOfANewerFormatWithOtherMembersAreLeftOutAndKept) {
+    const std::string place = directory;
+    const std::string newer =
+        "<key>format</key><integer>3</integer><key>files</key><array><string>0.plist</string></array>"
+        "<key>settings</key><array/><key>changes</key><string>none</string><key>after</key><true/>";
+    root.writePropertyList(place + "/00000001/about.plist", newer);
+    root.writePropertyList(place + "/resources/00000001.plist", newer);
+    EXPECT_EQ(history.settingsEntries(), Array{});
+    EXPECT_EQ(history.resourceEntries(), Array{});
+    EXPECT_THAT(log.lines, ElementsAre(HasSubstr("1 entries of the history were written by a newer release"),
+                                       HasSubstr("1 entries of the history were written by a newer release")));
+    EXPECT_EQ(write({{"a", 1}}, Dictionary{{"a", 2}}), 2U);
+    EXPECT_FALSE(history.keepResources({resourceChange("value", "x", nullptr, true)}, {}));
+    EXPECT_EQ(history.settingsEntries().size(), 1U);
+    EXPECT_EQ(history.resourceEntries().size(), 1U);
+    EXPECT_TRUE(fs::exists(root.path(place + "/00000001/about.plist")));
+    EXPECT_TRUE(fs::exists(root.path(place + "/resources/00000001.plist")));
+}
+
 TEST_F(HistoryTest, FileOfAnEntryOfTheFirstFormatContributesOnlyTheKeysOfItsOwnTable) {
     const std::string place = directory;
     root.writePropertyList(place + "/00000001/0.plist", "<key>a</key><integer>1</integer>");
