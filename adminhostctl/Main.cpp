@@ -17,6 +17,7 @@
 #include "adminhostctl/lumio/LumioVerbs.h"
 #include "adminhostctl/lumio/ServiceVerbs.h"
 #include "platform/files/StandardDescriptors.h"
+#include "platform/framework/Release.h"
 
 #include <algorithm>
 #include <charconv>

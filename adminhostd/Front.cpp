@@ -2,6 +2,7 @@
 
 #include "adminhostd/FrontAnswers.h"
 #include "adminhostd/RequestBody.h"
+#include "platform/framework/Release.h"
 #include "platform/log/Log.h"
 
 #include <algorithm>

@@ -3,6 +3,7 @@
 #include "adminhostd/PluginFile.h"
 #include "adminhostd/RunDirectory.h"
 #include "adminhostd/UnitProcesses.h"
+#include "platform/framework/Release.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -2,6 +2,7 @@
 
 #include "adminhostd/Front.h"
 #include "adminhostd/FrontAnswers.h"
+#include "platform/framework/Release.h"
 
 #include <string>
 #include <string_view>

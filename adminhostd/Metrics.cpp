@@ -1,5 +1,7 @@
 #include "adminhostd/Metrics.h"
 
+#include "platform/framework/Release.h"
+
 #include <algorithm>
 
 #include <fmt/format.h>

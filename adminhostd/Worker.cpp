@@ -22,6 +22,7 @@
 #include "adminhostd/WriteLock.h"
 #include "platform/directory/DirectoryRequest.h"
 #include "platform/files/Path.h"
+#include "platform/framework/Release.h"
 #include "platform/log/Log.h"
 #include "platform/service/ServiceState.h"
 #include "platform/task/Task.h"

@@ -5,6 +5,7 @@
 #include "commands/CommandTable.h"
 #include "handler/LumioRequestHandler.h"
 #include "platform/files/Path.h"
+#include "platform/framework/Release.h"
 #include "platform/framework/Report.h"
 #include "plugin/InstallationChecks.h"
 #include "settings/DatabaseTool.h"
