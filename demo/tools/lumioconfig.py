@@ -26,7 +26,7 @@ def database_path(root):
     tokens = open(root + "/var/lumio/server/database.yml", encoding="utf-8").read().split()
     after = tokens[tokens.index("production:"):]
     path = after[after.index("database:") + 1].strip('"')
-    return root + os.path.normpath("/" + path)
+    return root + os.path.normpath("/" + path.lstrip("/"))
 
 
 def is_account(root, record_type, name):

@@ -22,7 +22,7 @@ def main():
             shared = plistlib.load(file)["shared_filesystem"]
     except (OSError, ValueError, KeyError) as error:
         sys.exit(f"setup_lumioserverd_library: no shared file system: {error!r}")
-    library = root + os.path.normpath("/" + shared)  # a relative path or ".." leads nowhere but below the root
+    library = root + os.path.normpath("/" + shared.lstrip("/"))  # a relative path or ".." leads nowhere but below the root
     try:
         os.makedirs(library + "/Server/Secrets", exist_ok=True)
         make(library + "/lumioserverd.plist", {"library_version": "2.4", "server_uuid": names.uuid_of("server", shared)}, 0o644)
