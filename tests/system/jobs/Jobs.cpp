@@ -28,8 +28,10 @@ std::vector<std::string> linesOf(const std::string& text) {
     return lines;
 }
 
-std::string quotedWord(const std::string& text) {
-    return '\'' + text + '\'';  // no path or name here has a quote
+std::string contentOf(const std::string& path) {
+    std::ostringstream content;
+    content << std::ifstream(path).rdbuf();
+    return content.str();
 }
 
 std::string valueIn(const std::string& propertyList, const std::string& key) {
@@ -71,6 +73,11 @@ void Jobs::TearDownTestSuite() {
 Ran Jobs::ctl(std::vector<std::string> words) {
     words.insert(words.begin(), {ctlProgram, "--socket", daemon->socket()});
     return runBare(words);
+}
+
+Ran Jobs::history(const std::string& key, const std::string& since) {
+    return runBare(
+        {"COLUMNS=200", ctlProgram, "--socket", daemon->socket(), "history", "--since", since, "--key", key});
 }
 
 Ran Jobs::script(const std::string& text) {

@@ -30,8 +30,7 @@ struct Ran {
 [[nodiscard]] Ran runBare(const std::vector<std::string>& command);
 
 [[nodiscard]] std::vector<std::string> linesOf(const std::string& text);
-/// The text as a word of a shell.
-[[nodiscard]] std::string quotedWord(const std::string& text);
+[[nodiscard]] std::string contentOf(const std::string& path);
 /// A value of a property list, as Python prints it.
 [[nodiscard]] std::string valueIn(const std::string& propertyList, const std::string& key);
 /// The plain text of a protected value of the sample service.
@@ -45,6 +44,8 @@ class Jobs : public testing::Test {
 
     /// adminhostctl with these arguments.
     [[nodiscard]] static Ran ctl(std::vector<std::string> words);
+    /// The history of this key, so wide that nothing is wrapped: names of accounts have different lengths.
+    [[nodiscard]] static Ran history(const std::string& key, const std::string& since);
     /// A shell script in which $CTL is adminhostctl with the daemon's socket.
     [[nodiscard]] static Ran script(const std::string& text);
     /// Writes a file that only this account can read, and returns its path.
