@@ -8,6 +8,7 @@
 #include "platform/framework/Release.h"
 #include "platform/framework/Report.h"
 #include "plugin/InstallationChecks.h"
+#include "resources/FormerProperties.h"
 #include "settings/DatabaseTool.h"
 #include "settings/Revision.h"
 
@@ -39,7 +40,13 @@ constexpr std::size_t memberFile = 2;
 
 constexpr TableRow operations[] = {
     {"readSettings", [](LumioRequestHandler& h, const Dictionary& r) { return h.readSettingsWithRequest(r); }},
-    {"writeSettings", [](LumioRequestHandler& h, const Dictionary& r) { return h.writeSettingsWithRequest(r); }},
+    {"writeSettings",
+     [](LumioRequestHandler& h, const Dictionary& r) {
+         const Dictionary* configuration = r.get("configuration").dictionary();
+         const lumio::FormerProperties former(configuration == nullptr ? nullptr
+                                                                       : configuration->get("properties").array());
+         return h.writeSettingsWithRequest(r);
+     }},
     {"getState", [](LumioRequestHandler& h, const Dictionary& r) { return h.getStateWithRequest(r); }},
     {"getLogPaths", [](LumioRequestHandler& h, const Dictionary& r) { return h.getLogPathsWithRequest(r); }},
     {"startService",

@@ -8,6 +8,7 @@
 #include "platform/text/LocalDate.h"
 #include "platform/text/Utf8.h"
 #include "platform/value/ValueText.h"
+#include "resources/FormerProperties.h"
 #include "resources/PropertyRows.h"
 #include "resources/StatementText.h"
 #include "resources/ToolWords.h"
@@ -227,6 +228,14 @@ std::optional<Error> Property::deletePropertyWithID(const Value& id) {
     static_cast<void>(querySorvaneDatabase("delete from properties where id=\"" + textOf(id) + "\"", error));
     if (error) {
         logEvent("error deleting property with ID:\n" + textOf(id) + "\n  error:: " + textOf(error));
+    } else if (const FormerProperties::Row* const row = FormerProperties::find(textOf(id))) {
+        Change change;
+        change.section = "properties";
+        change.identity = textOf(id);
+        change.name = row->name;
+        change.from = row->isProtected ? Value(true) : Value(row->value);
+        change.secret = row->isProtected;
+        adminhost::reportChange(std::move(change));
     } else {
         reportRemoved(textOf(id), {}, false);
     }

@@ -58,6 +58,25 @@ TEST_F(LookingBack, ValuesOfPropertiesAreRestoredAndRemovedOnesAddedAgain) {
     EXPECT_EQ(ctl({"rollback", added}).output, "no change\n") << "it has been removed since";
 }
 
+TEST_F(LookingBack, RemovedPropertyIsAddedAgainWithItsValueUnlessItWasASecret) {
+    ASSERT_EQ(ctl({"property", "set", "colour", "blue"}).status, 0);
+    ASSERT_EQ(ctl({"property", "remove", "colour"}).status, 0);
+    const std::string removed = newest();
+    const ProgramResult dry = ctl({"rollback", removed, "--dry-run"});
+    EXPECT_EQ(dry.output, "properties.colour: (not present) -> \"blue\"\n");
+    EXPECT_EQ(row("colour"), "");
+    const ProgramResult rollback = ctl({"rollback", removed});
+    EXPECT_EQ(rollback.status, 0) << rollback.output;
+    EXPECT_EQ(rollback.output, "properties.colour: (not present) -> \"blue\": applied\n");
+    EXPECT_EQ(row("colour"), "blue|f\n");
+    EXPECT_EQ(ctl({"rollback", removed}).output, "no change\n");
+    ASSERT_EQ(ctl({"property", "remove", "upload_token"}).status, 0);
+    const ProgramResult secret = ctl({"rollback", newest()});
+    EXPECT_EQ(secret.status, 1);
+    EXPECT_THAT(secret.output, AllOf(HasSubstr("properties.upload_token: "),
+                                     HasSubstr("not restored, a stored secret cannot be written back\nno change\n")));
+}
+
 TEST_F(LookingBack, WhatCannotBeRestoredIsSaidBeforeAnythingIsWritten) {
     ASSERT_EQ(ctl({"camera", "remove", "Studio A"}).status, 0);
     const ProgramResult camera = ctl({"rollback", newest()});

@@ -2,6 +2,7 @@
 
 #include "tests/system/apply/ControlledService.h"
 
+#include <algorithm>
 #include <filesystem>
 
 namespace adminhost::test {
@@ -25,6 +26,9 @@ class NeededReads : public ControlledService {
         std::filesystem::remove(record);
         const ProgramResult result = ctl(words);
         EXPECT_EQ(result.status, 0) << result.output;
+        return recorded();
+    }
+    [[nodiscard]] std::vector<std::string> recorded() const {
         std::vector<std::string> statements;
         std::istringstream text(read(record));
         for (std::string statement; std::getline(text, statement, '\036');) {
@@ -63,6 +67,41 @@ TEST_F(NeededReads, PropertyIsWrittenWithoutCamerasWorkflowsAndAccessLists) {
     const std::vector<std::string> statements = statementsOf({"property", "set", "watermark", "left"});
     EXPECT_THAT(statements, AllOf(readsProperties, Not(readsCameras), Not(readsWorkflows), Not(readsAccessLists)));
     EXPECT_EQ(root.sql("select value from properties where name = 'watermark'"), "left\n");
+}
+
+TEST_F(NeededReads, RemovedPropertiesAreReadWithOneStatementBeforeTheWriteAndOtherWritesReadNothingMore) {
+    const auto idOf = [&](const std::string& name) {
+        return std::stoi(root.sql("select id from properties where name = '" + name + "'"));
+    };
+    const auto readsFormer = HasSubstr("select id, hex(name) as name, hex(value) as value, protect from properties");
+    const std::string begin = R"({"optionalArguments":{"variant":"getConfig"},"configuration":{"properties":[)";
+    const std::string others = R"({"_newid_":true,"name":"fresh","value":"x"},{"_id_":")" +
+                               std::to_string(idOf("default_language")) + R"(","value":"fr"})";
+    const std::string camera =
+        R"(],"cameras":[{"_id_":")" + SampleRoot::uuidOf("camera", "Roof") + R"(","access_control_enabled":true}]}})";
+    ASSERT_EQ(daemon.connect().post("/v1/lumio/writeSettings", begin + others + camera).status, 200);
+    EXPECT_THAT(recorded(), Not(Contains(readsFormer)));
+    const int sender = idOf("mail_sender");
+    const int language = idOf("default_language");
+    std::filesystem::remove(record);
+    ASSERT_EQ(daemon.connect()
+                  .post("/v1/lumio/writeSettings", begin + R"({"_id_":")" + std::to_string(sender) +
+                                                       R"(","_obsoleteid_":true},{"_id_":")" +
+                                                       std::to_string(language) + R"(","_obsoleteid_":true})" + camera)
+                  .status,
+              200);
+    const std::vector<std::string> statements = recorded();
+    EXPECT_THAT(statements, Contains(readsFormer).Times(1));
+    const auto former = std::find_if(statements.begin(), statements.end(), [](const std::string& statement) {
+        return statement.find(" where id in (") != std::string::npos;
+    });
+    const auto removal = std::find_if(statements.begin(), statements.end(), [](const std::string& statement) {
+        return statement.starts_with("delete from properties");
+    });
+    ASSERT_NE(removal, statements.end());
+    EXPECT_LT(former, removal);
+    EXPECT_EQ(*former, "select id, hex(name) as name, hex(value) as value, protect from properties where id in (" +
+                           std::to_string(sender) + ", " + std::to_string(language) + ")");
 }
 
 TEST_F(NeededReads, CameraIsChangedWithoutWorkflowsAndProperties) {
