@@ -58,14 +58,6 @@ std::string findingsText(const Value& findings) {
     return text;
 }
 
-std::string logText(const std::vector<std::string>& lines) {
-    std::string text = lines.empty() ? "" : "\nlog lines of the request:";
-    for (const std::string& line : lines) {
-        text += "\n  " + shownIndented(line, 4);
-    }
-    return text;
-}
-
 Failure unknownCommand(const std::string& name, const std::vector<PluginInfo>& plugins,
                        std::vector<std::string> known) {
     std::string list;
@@ -419,6 +411,14 @@ void addLanguages(Dictionary& request, const Description& command, const std::ve
             above->set(name, Array(languages.begin(), languages.end()));
         }
     }
+}
+
+std::string logText(const std::vector<std::string>& lines) {
+    std::string text = lines.empty() ? "" : "\nlog lines of the request:";
+    for (const std::string& line : lines) {
+        text += "\n  " + shownIndented(line, 4);
+    }
+    return text;
 }
 
 std::string errorOf(const Description& command, const Dictionary& answer) {

@@ -152,6 +152,9 @@ class DaemonClient {
 /// that key.
 void addLanguages(Dictionary& request, const Description& command, const std::vector<std::string>& languages);
 
+/// The log lines of a request as further lines of a message; empty if there are none.
+[[nodiscard]] std::string logText(const std::vector<std::string>& lines);
+
 /// Returns the failure in an answer as one sentence; empty if there is none. A failure is a key that the description
 /// lists under its errors, unless its value is null or the number 0.
 [[nodiscard]] std::string errorOf(const Description& command, const Dictionary& answer);

@@ -57,8 +57,12 @@ ExitStatus perform(const Context& context, Words words) {
             reportAnswered(context, dictionary != nullptr ? errorOf(command.description, *dictionary) : "", *answer);
     }
     if (answer->notDone) {
+        const RequestReport report = context.service.report(answer->requestId);
+        printNotDone(context, report);
+        if (status == ExitStatus::done) {  // else they have been printed with the error
+            printLog(context, report);
+        }
         status = ExitStatus::failed;
-        printNotDone(context, context.service.report(answer->requestId));
     }
     return status;
 }
@@ -102,9 +106,9 @@ void writeValue(const Context& context, const Value& value, const Description& d
     }
 }
 
-std::string toolWordsOf(const RequestReport& report) {
+std::string toolWordsOf(std::span<const ReportedGap> notDone) {
     constexpr std::array<std::string_view, 2> prefixes = {"Error: ", "in prepare, "};
-    for (const ReportedGap& gap : report.notDone) {
+    for (const ReportedGap& gap : notDone) {
         if (gap.keyPath.empty() && !gap.toolMessage.empty()) {
             std::string_view words = gap.toolMessage;
             for (const std::string_view prefix : prefixes) {
@@ -121,7 +125,7 @@ ExitStatus reportAnswered(const Context& context, const std::string& error, cons
         return ExitStatus::done;
     }
     const RequestReport report = context.service.report(answer.requestId);
-    const std::string words = toolWordsOf(report);
+    const std::string words = toolWordsOf(report.notDone);
     context.err << "adminhostctl: the service returned an error: " << error
                 << (words.empty() ? "" : ": " + shownIndented(words, 4)) << '\n';
     printLog(context, report);

@@ -109,7 +109,7 @@ void writeValue(const Context& context, const Value& value, const Description& d
 
 /// Why the answer has an error: the words of the tool that failed, as far as the daemon reports them ("file is not a
 /// database"); empty if it does not.
-[[nodiscard]] std::string toolWordsOf(const RequestReport& report);
+[[nodiscard]] std::string toolWordsOf(std::span<const ReportedGap> notDone);
 
 /// Prints the log lines of the request, if there are any.
 void printLog(const Context& context, const RequestReport& report);

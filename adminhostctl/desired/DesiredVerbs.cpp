@@ -56,7 +56,10 @@ CurrentState readChosenState(const Context& context) {
     const std::set<std::string> chosen =
         chosenSections(context, StateForm(context.service.stateCommand("write").description));
     CurrentState current = readState(context, chosen.size() == 1 ? *chosen.begin() : std::string());
-    requireWhole(current);
+    // Settings alone are read from their files, whatever the database has.
+    if (chosen != std::set<std::string>{current.form.settingsSection()}) {
+        requireWhole(current);
+    }
     return current;
 }
 

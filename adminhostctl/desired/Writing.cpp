@@ -277,7 +277,11 @@ CurrentState readState(const Context& context, const std::string& section) {
     }
     State state = stateOf(form, *root);
     std::vector<ReportedGap> unread = context.service.gapsOf(answer);
-    return {std::move(form), std::move(state), answer.revision, std::move(unread), section};
+    std::vector<std::string> log;
+    if (!unread.empty()) {
+        log = context.service.report(answer.requestId).log;
+    }
+    return {std::move(form), std::move(state), answer.revision, std::move(unread), section, std::move(log)};
 }
 
 CurrentState readSettings(const Context& context) {
@@ -285,13 +289,19 @@ CurrentState readSettings(const Context& context) {
 }
 
 void requireWhole(const CurrentState& current) {
-    std::string reasons;
-    for (const ReportedGap& gap : current.unread) {
-        reasons += "\n  " + gapText(gap);
+    if (current.unread.empty()) {
+        return;
     }
-    if (!reasons.empty()) {
-        throw Failure(ExitStatus::failed, "parts of the state could not be read:" + reasons);
-    }
+    // A section that is not even listed as empty: the service could not read its database at all.
+    const bool lacksSection =
+        std::any_of(current.form.lists().begin(), current.form.lists().end(), [&](const auto& list) {
+            return (current.section.empty() || current.section == list.section) &&
+                   !current.state.lists.contains(list.section);
+        });
+    const std::string words = lacksSection ? toolWordsOf(current.unread) : "";
+    throw Failure(ExitStatus::failed, (words.empty() ? "" : "the database cannot be read: " + words + '\n') +
+                                          "parts of the state could not be read:" + linesOf(current.unread) +
+                                          logText(current.log));
 }
 
 ExitStatus showOnly(const Context& context, const CurrentState& current, const Plan& plan) {

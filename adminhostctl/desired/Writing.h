@@ -16,6 +16,7 @@ struct CurrentState {
     std::string revision;
     std::vector<ReportedGap> unread;  ///< parts that the service could not read: they look empty
     std::string section;              ///< the only section that was read; empty: all of them
+    std::vector<std::string> log{};   ///< log lines of the request, if parts could not be read
 };
 
 /// Reads the state, or only one section of it. A write that depends on it may then change only this section, and reads
@@ -25,7 +26,7 @@ struct CurrentState {
 /// Reads the section of the settings only.
 [[nodiscard]] CurrentState readSettings(const Context& context);
 
-/// Throws Failure(failed) with the reasons if parts of the state could not be read.
+/// Throws Failure(failed) with the reasons and the log lines if parts of the state could not be read.
 void requireWhole(const CurrentState& current);
 
 /// Prints the plan. Throws Failure if the daemon would refuse it.

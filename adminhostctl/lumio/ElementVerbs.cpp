@@ -21,6 +21,7 @@ namespace {
 struct Listing {
     Array elements;
     std::vector<ReportedGap> unread;  ///< access lists that could not be read: they look empty
+    std::string requestId;
 };
 
 /// The listing's answer. Throws Failure when the command returns an error.
@@ -34,7 +35,7 @@ Listing listingOf(const Context& context, const CommandRef& command, const Eleme
     const Array* list = said->get(kind.section).array();
     if (!error.empty() || list == nullptr) {
         const RequestReport report = context.service.report(answer.requestId);
-        const std::string words = toolWordsOf(report);
+        const std::string words = toolWordsOf(report.notDone);
         const std::string status = textOf(said->get("readStatus"));
         printLog(context, report);
         throw Failure(ExitStatus::failed,
@@ -44,7 +45,7 @@ Listing listingOf(const Context& context, const CommandRef& command, const Eleme
                                          : ": the database cannot be read: " + words +
                                                (words.ends_with(')') ? std::string() : " (" + status + ")")));
     }
-    return {*list, context.service.gapsOf(answer)};
+    return {*list, context.service.gapsOf(answer), answer.requestId};
 }
 
 /// Prints what a listing could not read, after the rest of it; failed if there is something.
@@ -53,7 +54,11 @@ ExitStatus reportUnread(const Context& context, const Listing& listing) {
     for (const ReportedGap& gap : listing.unread) {
         context.err << "  " << shownIndented(gapText(gap), 4) << '\n';
     }
-    return listing.unread.empty() ? ExitStatus::done : ExitStatus::failed;
+    if (listing.unread.empty()) {
+        return ExitStatus::done;
+    }
+    printLog(context, context.service.report(listing.requestId));
+    return ExitStatus::failed;
 }
 
 /// The name as a word for a shell.

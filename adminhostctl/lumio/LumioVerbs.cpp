@@ -36,6 +36,7 @@ ExitStatus changeProperty(const Context& context, WantedElement element, const C
 
 ExitStatus propertySet(const Context& context, Words arguments) {
     const CurrentState current = readState(context, property.section);
+    requireWhole(current);
     const ListForm& list = current.form.list(property.section);
     const Element* stored = findElement(current.state, list, arguments.front());
     WantedElement wanted = wantedOf(arguments.front());
@@ -60,6 +61,7 @@ ExitStatus propertySet(const Context& context, Words arguments) {
 
 ExitStatus propertyRemove(const Context& context, Words arguments) {
     const CurrentState current = readState(context, property.section);
+    requireWhole(current);
     const ListForm& list = current.form.list(property.section);
     if (findElement(current.state, list, arguments.front()) == nullptr) {
         throw notFound(property, arguments.front(), current.state, list);

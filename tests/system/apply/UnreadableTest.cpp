@@ -74,6 +74,37 @@ TEST_F(Unreadable, FailureOfTheDatabaseInsideAnAnswerIsExplained) {
     EXPECT_EQ(read.status, 1);
     EXPECT_THAT(read.output, testing::AllOf(HasSubstr("readStatus is 3"), HasSubstr("log lines of the request:\n  ")));
 }
+
+TEST_F(Unreadable, GarbageInPlaceOfTheDatabaseIsExplainedAndTheLogLinesOfTheRequestFollow) {
+    std::ofstream(root.databasePath()) << std::string(4096, 'x');
+    const std::string port = file("port.toml", "[settings]\nserver_port = 8180\n");
+    const std::string explanation = "the database cannot be read: file is not a database (26)\n";
+    for (const std::vector<std::string>& words : {std::vector<std::string>{"plan", port},
+                                                  {"apply", port},
+                                                  {"plan", port, "--only", "settings,properties"},
+                                                  {"export"},
+                                                  {"property", "list"},
+                                                  {"property", "set", "colour", "blue"}}) {
+        const ProgramResult result = ctl(words);
+        EXPECT_EQ(result.status, 1) << words.front();
+        EXPECT_THAT(result.output, testing::AllOf(HasSubstr(explanation), HasSubstr("log lines of the request:\n  "),
+                                                  HasSubstr("Can't execute sqlite3 query: Error: in prepare, file is "
+                                                            "not a database (26)\n")));
+    }
+    const ProgramResult cameras = ctl({"camera", "list"});
+    EXPECT_EQ(cameras.status, 1);
+    EXPECT_EQ(cameras.output, "adminhostctl: the service does not list its cameras: " + explanation)
+        << "this request logs nothing";
+    const ProgramResult command = ctl({"--format", "json", "readSettings"});
+    EXPECT_EQ(command.status, 1);
+    EXPECT_THAT(command.output, testing::AllOf(HasSubstr("not read: the cameras (Error: in prepare, file is not a "
+                                                         "database (26))\n"),
+                                               HasSubstr("\nlog lines of the request:\n  ")));
+    // Settings are not in the database.
+    EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8170\n");
+    EXPECT_EQ(ctl({"apply", port, "--only", "settings"}).output, "settings.server_port: 8170 -> 8180: applied\n");
+}
+
 TEST_F(Unreadable, ListsOfABrokenDatabaseFailInTheSameWords) {
     std::ofstream(root.databasePath()) << std::string(4096, 'x');
     for (const std::string what : {"camera", "workflow", "property"}) {
