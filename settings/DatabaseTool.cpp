@@ -106,13 +106,15 @@ std::string DatabaseTool::homeOf(uid_t account) {
 }
 
 Probe DatabaseTool::probe() {
-    if (!SettingsStore::dbPathExists()) {
+    const adminhost::HostPath database = SettingsStore::dbPath();
+    if (!adminhost::exists(adminhost::diskPath(database))) {
         return {};
     }
-    if (const auto access = DatabaseAccess::of(SettingsStore::dbPath()); !access) {
+    const auto access = DatabaseAccess::of(database);
+    if (!access) {
         return {Probe::State::unusable, access.error().reason, access.error().fix};
     }
-    if (auto problem = startFileProblem()) {
+    if (auto problem = startFileProblem(*access)) {
         return *std::move(problem);
     }
     Probe probe = _usable ? Probe() : tryTool();
@@ -122,19 +124,20 @@ Probe DatabaseTool::probe() {
 
 std::optional<Probe> DatabaseTool::startFileProblem() const {
     const auto access = DatabaseAccess::of(SettingsStore::dbPath());
-    if (!access) {
-        return std::nullopt;  // the tool does not run at all
-    }
-    const std::string home = _home ? *_home : homeOf(access->account() ? access->account()->user : ::geteuid());
+    return access ? startFileProblem(*access) : std::nullopt;  // without access the tool does not run at all
+}
+
+std::optional<Probe> DatabaseTool::startFileProblem(const DatabaseAccess& access) const {
+    const std::string home = _home ? *_home : homeOf(access.account() ? access.account()->user : ::geteuid());
     const std::string startFile = home + "/.sqliterc";
     if (::access(startFile.c_str(), F_OK) != 0) {
         return std::nullopt;
     }
-    const auto confinement = access->confine(adminhost::diskPath(adminhost::HostPath(toolPath)));
+    const auto confinement = access.confine(adminhost::diskPath(adminhost::HostPath(toolPath)));
     if (confinement && *confinement) {
         std::error_code unknown;
         const std::string place = std::filesystem::canonical(startFile, unknown).string();
-        if (!unknown && !place.starts_with(access->directory() + '/')) {
+        if (!unknown && !place.starts_with(access.directory() + '/')) {
             return std::nullopt;
         }
     }

@@ -15,6 +15,8 @@
 
 namespace lumio {
 
+class DatabaseAccess;
+
 /// The plan of a run of the tool with the rights that it has on this database (DatabaseAccess.h). A run that is refused
 /// is a tool that is not started.
 [[nodiscard]] adminhost::TaskPlan databaseToolPlan(const adminhost::HostPath& database,
@@ -41,6 +43,8 @@ class DatabaseTool {
     [[nodiscard]] adminhost::Probe tryTool() const;
 
   private:
+    [[nodiscard]] std::optional<adminhost::Probe> startFileProblem(const DatabaseAccess& access) const;
+
     std::optional<std::string> _home;
     bool _usable = false;
 };

@@ -21,6 +21,7 @@ using adminhost::Value;
 namespace {
 
 constexpr std::size_t locationFileMaximum = std::size_t{1} << 20U;
+constexpr std::size_t rememberedMaximum = std::size_t{64} << 10U;
 
 std::optional<Dictionary> load(const HostPath& path) {
     auto value = adminhost::readPropertyList(adminhost::diskPath(path));
@@ -109,7 +110,25 @@ std::optional<std::string_view> productionDatabase(std::string_view text) {
 }  // namespace
 
 std::string SettingsStore::sharedFilesystemPath() {
-    return sharedFilesystemOf(identityPreferences());
+    // Each request asks several times, to find the database. The file is read each time, but parsed only if its content
+    // is another one than the last time.
+    struct LastRead {
+        std::string bytes;
+        std::string path;
+    };
+    thread_local std::optional<LastRead> last;
+    auto bytes = adminhost::readFile(adminhost::diskPath(identityPreferencesPath()), adminhost::plistMaximumSize);
+    if (!bytes) {
+        return sharedFilesystemOf(std::nullopt);
+    }
+    if (last && last->bytes == *bytes) {
+        return last->path;
+    }
+    const auto value = adminhost::parsePropertyList(*bytes);
+    const Dictionary* identity = value ? value->dictionary() : nullptr;
+    std::string path = sharedFilesystemOf(identity == nullptr ? std::nullopt : std::optional(*identity));
+    last = bytes->size() > rememberedMaximum ? std::nullopt : std::optional(LastRead{*std::move(bytes), path});
+    return path;
 }
 
 std::optional<std::string> SettingsStore::memberUUID() {

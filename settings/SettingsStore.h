@@ -2,8 +2,8 @@
 
 // Where the service keeps its settings and its database, and the loaders of its four settings files.
 //
-// Nothing is cached: every call reads the disk again. No operation reports an error: a file that cannot be read or
-// parsed, or whose top level is not a dictionary, counts as missing, and there is always a database path.
+// Every call reads the disk again. No operation reports an error: a file that cannot be read or parsed, or whose top
+// level is not a dictionary, counts as missing, and there is always a database path.
 
 #include "platform/files/Path.h"
 #include "platform/value/Result.h"

@@ -3,10 +3,7 @@
 #include "settings/SettingsStore.h"
 
 #include <algorithm>
-#include <chrono>
 #include <thread>
-
-#include <poll.h>
 
 namespace lumio {
 
@@ -44,22 +41,10 @@ void StatementBatch::startMore() {
     }
 }
 
-void StatementBatch::serve() {
-    std::vector<pollfd> entries;
-    _group.addTo(entries);
-    int milliseconds = -1;
-    if (const auto due = _group.due()) {
-        const auto left = std::chrono::ceil<std::chrono::milliseconds>(*due - TaskGroup::Clock::now()).count();
-        milliseconds = static_cast<int>(std::clamp<std::int64_t>(left, 0, 60'000));
-    }
-    static_cast<void>(::poll(entries.data(), entries.size(), milliseconds));
-    _group.serve();
-}
-
 TaskResult StatementBatch::runAlone() {
     for (std::size_t i = _next + 1; i < _tasks.size(); ++i) {
         while (!_group.ended(_tasks[i])) {
-            serve();
+            _group.wait();
         }
     }
     return _group.collect(_group.start(planOf(_database, _statements[_next])));
@@ -68,7 +53,7 @@ TaskResult StatementBatch::runAlone() {
 adminhost::Result<std::vector<Dictionary>> StatementBatch::next() {
     startMore();
     while (!_group.ended(_tasks[_next])) {
-        serve();
+        _group.wait();
         startMore();
     }
     TaskResult result = _group.collect(_tasks[_next]);

@@ -27,7 +27,6 @@ class StatementBatch {
 
   private:
     void startMore();
-    void serve();
     [[nodiscard]] std::size_t running() const;
     [[nodiscard]] adminhost::TaskResult runAlone();
 

@@ -20,31 +20,58 @@ class Writer {
     explicit Writer(bool pretty) : _pretty(pretty) {}
 
     void write(const Value& value, std::size_t level);
-    [[nodiscard]] std::string take() { return std::move(_text); }
+    [[nodiscard]] std::string take() {
+        _text.resize(_size);
+        return std::move(_text);
+    }
 
   private:
-    void writeNumber(auto number) {
+    /// Room for so many more bytes. A listing has thousands of short texts: one check for each of them is enough.
+    char* room(std::size_t more) {
+        if (_text.size() - _size < more) {
+            _text.resize(std::max(_text.size() * 2, _size + more));
+        }
+        return _text.data() + _size;
+    }
+    void put(char c) {
+        *room(1) = c;
+        ++_size;
+    }
+    void put(std::string_view bytes) {
+        std::copy(bytes.begin(), bytes.end(), room(bytes.size()));
+        _size += bytes.size();
+    }
+    /// A text that needs no escape.
+    void putQuoted(std::string_view bytes) {
+        char* to = room(bytes.size() + 2);
+        *to++ = '"';
+        to = std::copy(bytes.begin(), bytes.end(), to);
+        *to = '"';
+        _size += bytes.size() + 2;
+    }
+    void putNumber(auto number) {
         char buffer[64];
-        _text.append(buffer, std::to_chars(buffer, buffer + sizeof buffer, number).ptr);
+        put({buffer, std::to_chars(buffer, buffer + sizeof buffer, number).ptr});
     }
     void writeReal(double real);
     void writeString(std::string_view bytes);
     void writeWrapped(std::string_view form, std::string_view text) {
-        _text += "{\"";
-        _text += form;
-        _text += _pretty ? "\": \"" : "\":\"";
-        _text += text;
-        _text += "\"}";
+        put("{\"");
+        put(form);
+        put(_pretty ? "\": \"" : "\":\"");
+        put(text);
+        put("\"}");
     }
     void newLine(std::size_t level) {
         if (_pretty) {
-            _text += '\n';
-            _text.append(level * 2, ' ');
+            put('\n');
+            put(std::string(level * 2, ' '));
         }
     }
 
     bool _pretty;
-    std::string _text;
+    std::string _text;  ///< with room at its end
+    std::size_t _size = 0;
 };
 
 void Writer::writeReal(double real) {
@@ -53,10 +80,10 @@ void Writer::writeReal(double real) {
     } else if (std::isinf(real)) {
         writeWrapped("$real", real > 0 ? "infinity" : "-infinity");
     } else {
-        const std::size_t start = _text.size();
-        writeNumber(real);
-        if (_text.find_first_of(".e", start) == std::string::npos) {
-            _text += ".0";  // else it would be read back as an integer
+        const std::size_t start = _size;
+        putNumber(real);
+        if (std::string_view(_text).substr(start, _size - start).find_first_of(".e") == std::string_view::npos) {
+            put(".0");  // else it would be read back as an integer
         }
     }
 }
@@ -87,23 +114,21 @@ bool isPlain(std::string_view bytes) noexcept {
 
 void Writer::writeString(std::string_view bytes) {
     if (isPlain(bytes)) {
-        _text += '"';
-        _text += bytes;
-        _text += '"';
+        putQuoted(bytes);
         return;
     }
     if (!isUtf8(bytes)) {
         writeString(utf8Of(bytes));
         return;
     }
-    _text += '"';
+    put('"');
     const auto isPlain = [](char c) {
         return static_cast<unsigned char>(c) >= 0x20 && c != '"' && c != '\\' && c != 0x7f;
     };
     for (auto at = bytes.begin(); at != bytes.end(); ++at) {
         const auto plain = at;
         at = std::find_if_not(plain, bytes.end(), isPlain);
-        _text.append(plain, at);
+        put({plain, at});
         if (at == bytes.end()) {
             break;
         }
@@ -111,39 +136,40 @@ void Writer::writeString(std::string_view bytes) {
         switch (c) {
             case '"':
             case '\\':
-                _text += '\\';
-                _text += c;
+                put('\\');
+                put(c);
                 break;
             case '\n':
-                _text += "\\n";
+                put("\\n");
                 break;
             case '\r':
-                _text += "\\r";
+                put("\\r");
                 break;
             case '\t':
-                _text += "\\t";
+                put("\\t");
                 break;
             default:
-                _text += "\\u00";
-                appendHex(_text, static_cast<std::uint8_t>(c));
+                put("\\u00");
+                put(lowerHexDigits[static_cast<std::uint8_t>(c) >> 4U]);
+                put(lowerHexDigits[static_cast<std::uint8_t>(c) & 0xFU]);
         }
     }
-    _text += '"';
+    put('"');
 }
 
 void Writer::write(const Value& value, std::size_t level) {
     switch (value.type()) {
         case Value::Type::null:
-            _text += "null";
+            put("null");
             return;
         case Value::Type::boolean:
-            _text += *value.boolean() ? "true" : "false";
+            put(*value.boolean() ? "true" : "false");
             return;
         case Value::Type::integer:
             if (const auto number = value.integer()) {
-                writeNumber(*number);
+                putNumber(*number);
             } else {
-                writeNumber(*value.unsignedInteger());
+                putNumber(*value.unsignedInteger());
             }
             return;
         case Value::Type::real:
@@ -161,37 +187,37 @@ void Writer::write(const Value& value, std::size_t level) {
         case Value::Type::array: {
             const char* separator = "[";
             for (const Value& element : *value.array()) {
-                _text += std::exchange(separator, ",");
+                put(std::exchange(separator, ","));
                 newLine(level + 1);
                 write(element, level + 1);
             }
             if (value.array()->empty()) {
-                _text += "[]";
+                put("[]");
                 return;
             }
             newLine(level);
-            _text += ']';
+            put(']');
             return;
         }
         case Value::Type::dictionary: {
             const char* separator = "{";
             for (const DictionaryEntry& entry : *value.dictionary()) {
-                _text += std::exchange(separator, ",");
+                put(std::exchange(separator, ","));
                 newLine(level + 1);
                 if (entry.key.starts_with('$')) {
                     writeString('$' + entry.key);
                 } else {
                     writeString(entry.key);
                 }
-                _text += _pretty ? ": " : ":";
+                put(_pretty ? ": " : ":");
                 write(entry.value, level + 1);
             }
             if (value.dictionary()->empty()) {
-                _text += "{}";
+                put("{}");
                 return;
             }
             newLine(level);
-            _text += '}';
+            put('}');
             return;
         }
     }

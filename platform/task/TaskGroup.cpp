@@ -24,11 +24,20 @@
 namespace adminhost {
 namespace {
 
+using namespace std::chrono_literals;
+
 std::atomic<std::uint64_t> started = 0;
 
 using Clock = TaskGroup::Clock;
 
-constexpr auto waitForDaemonsOutput = std::chrono::milliseconds(200);
+constexpr auto waitForDaemonsOutput = 200ms;
+
+/// A tool writes to a pipe in pieces of 4 kB. If each woke us, both sides would spend more time on that than on the
+/// bytes. So after a piece of the output has been read, the next ones collect in the pipe for this long, unless they
+/// fill it. The end of the tool is noticed at once.
+constexpr auto collectingTime = 150us;
+/// A reading of as many bytes shows that the tool writes faster than that.
+constexpr std::size_t nearlyFull = std::size_t{32} << 10U;
 
 /// Keeps SIGPIPE from this thread while a tool that may not read its input is written to.
 class WithoutSigpipe {
@@ -69,8 +78,8 @@ class Capture {
     [[nodiscard]] int descriptor() const noexcept { return _stream.get(); }  ///< -1, which poll skips, after the end
     [[nodiscard]] std::size_t count() const noexcept { return _count; }
 
-    /// Reads once, unless that exceeds the bound; closes the stream at its end.
-    void readSome(std::size_t bound) {
+    /// Reads once, unless that exceeds the bound; closes the stream at its end. Returns the number of bytes.
+    std::size_t readSome(std::size_t bound) {
         std::array<char, 65536> buffer;  // not initialised: read() fills the used part
         const ssize_t count = ::read(_stream.get(), buffer.data(), buffer.size());
         if (count > 0) {
@@ -85,6 +94,7 @@ class Capture {
         } else if (count == 0 || (errno != EAGAIN && errno != EINTR)) {
             _stream.close();
         }
+        return count > 0 ? static_cast<std::size_t>(count) : 0;
     }
 
     /// Reads the bytes that are in the pipe at this moment, however long that takes, and not more.
@@ -196,10 +206,13 @@ class TaskGroup::RunningTask {
     }
 
     [[nodiscard]] bool ended() const noexcept { return _ended; }
-    [[nodiscard]] Clock::time_point until() const noexcept { return _until; }
+    /// The latest moment of the next call of serve().
+    [[nodiscard]] Clock::time_point due() const noexcept {
+        return _collectsUntil ? std::min(*_collectsUntil, _until) : _until;
+    }
 
     void addTo(std::vector<pollfd>& entries) const {
-        entries.push_back({_output.descriptor(), POLLIN, 0});
+        entries.push_back({_collectsUntil ? -1 : _output.descriptor(), POLLIN, 0});
         entries.push_back({_error.descriptor(), POLLIN, 0});
         entries.push_back({_exited ? -1 : _child.exit.get(), POLLIN, 0});
         entries.push_back({_child.input.get(), POLLOUT, 0});
@@ -207,8 +220,12 @@ class TaskGroup::RunningTask {
 
     /// Moves bytes both ways, until the child has exited and its streams are read.
     void serve(const pollfd* ready) {
-        if (ready[0].revents != 0) {
-            _output.readSome(_bound);
+        if (ready[0].revents != 0 || (_collectsUntil && Clock::now() >= *_collectsUntil)) {
+            _collectsUntil.reset();
+            const std::size_t count = _output.readSome(_bound);
+            if (count > 0 && count < nearlyFull && !_exited) {
+                _collectsUntil = Clock::now() + collectingTime;
+            }
         }
         if (ready[1].revents != 0 && _held <= _bound) {
             _error.readSome(_bound);
@@ -218,6 +235,7 @@ class TaskGroup::RunningTask {
         }
         if (ready[2].revents != 0) {
             _exited = true;
+            _collectsUntil.reset();
             _child.noteExit();
             _child.input.close();
             _output.readWhatIsThere(_bound);
@@ -295,6 +313,7 @@ class TaskGroup::RunningTask {
     std::string _input;
     std::string_view _rest;
     Clock::time_point _until;  ///< the deadline; after the exit, the end of the wait for a daemon's output
+    std::optional<Clock::time_point> _collectsUntil;  ///< the output is not polled until then
     bool _exited = false;
     bool _ended = false;
     TaskResult _result;
@@ -326,14 +345,19 @@ std::optional<Clock::time_point> TaskGroup::due() const {
     Clock::time_point earliest = Clock::time_point::max();
     for (const auto& task : _tasks) {
         if (task && !task->ended()) {
-            earliest = std::min(earliest, task->until());
+            earliest = std::min(earliest, task->due());
         }
     }
     return earliest == Clock::time_point::max() ? std::nullopt : std::optional(earliest);
 }
 
 void TaskGroup::serve() {
-    serveFor(0);
+    serveFor(Clock::duration::zero());
+}
+
+void TaskGroup::wait() {
+    const auto moment = due();
+    serveFor(moment ? std::optional(*moment - Clock::now()) : std::nullopt);
 }
 
 bool TaskGroup::ended(Id id) const {
@@ -342,27 +366,20 @@ bool TaskGroup::ended(Id id) const {
 
 TaskResult TaskGroup::collect(Id id) {
     while (!_tasks.at(id)->ended()) {
-        serveFor(milliseconds());
+        wait();
     }
     const std::unique_ptr<RunningTask> task = std::move(_tasks.at(id));
     return task->result();
 }
 
-/// Milliseconds for poll until the next moment, rounded up so that the moment has passed afterwards; -1 for never.
-int TaskGroup::milliseconds() const {
-    const auto moment = due();
-    if (!moment) {
-        return -1;
-    }
-    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*moment - Clock::now()).count();
-    return static_cast<int>(std::clamp<std::int64_t>(left, 0, 3'600'000));
-}
-
-void TaskGroup::serveFor(int milliseconds) {
+void TaskGroup::serveFor(std::optional<Clock::duration> time) {
     _entries.clear();
     addTo(_entries);
+    const auto left = std::clamp<Clock::duration>(time.value_or(0s), 0s, 1h);
+    const auto seconds = std::chrono::floor<std::chrono::seconds>(left);
+    const timespec bound{seconds.count(), std::chrono::nanoseconds(left - seconds).count()};
     // A failed or timed-out call leaves every revents 0.
-    (void)::poll(_entries.data(), _entries.size(), milliseconds);
+    (void)::ppoll(_entries.data(), _entries.size(), time ? &bound : nullptr, nullptr);
     const pollfd* ready = _entries.data();
     for (const auto& task : _tasks) {
         if (task && !task->ended()) {

@@ -70,6 +70,8 @@ class ADMINHOST_EXPORT TaskGroup {
     [[nodiscard]] std::optional<Clock::time_point> due() const;
     /// Does everything that can be done without waiting.
     void serve();
+    /// Waits until there is something to serve, and serves it. At least one tool must not have ended.
+    void wait();
 
     /// True once the tool has ended and its output has been read: collect() does not wait.
     [[nodiscard]] bool ended(Id id) const;
@@ -79,8 +81,8 @@ class ADMINHOST_EXPORT TaskGroup {
   private:
     class RunningTask;
 
-    void serveFor(int milliseconds);
-    [[nodiscard]] int milliseconds() const;
+    /// Waits for so long at most, nullopt for ever, and serves what is ready then.
+    void serveFor(std::optional<Clock::duration> time);
 
     std::size_t _bound;
     std::size_t _held = 0;                             ///< bytes read and not collected

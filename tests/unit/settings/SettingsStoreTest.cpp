@@ -125,6 +125,23 @@ TEST_F(SettingsStoreTest, TextThatIsNoPropertyListLoadsAsNull) {
     EXPECT_EQ(SettingsStore::sharedFilesystemPath(), "/Library/SorvaneProducer/Shared");
 }
 
+TEST_F(SettingsStoreTest, EveryCallFollowsAFileThatWasChangedInPlaceWhateverItsTime) {
+    const auto shared = [&](std::string_view text) {
+        root.writePropertyList(identity, text);
+        std::filesystem::last_write_time(root.path(identity), std::filesystem::file_time_type());
+        return SettingsStore::sharedFilesystemPath();
+    };
+    const std::string standard = "/Library/SorvaneProducer/Shared";
+    for (int round = 0; round < 2; ++round) {
+        EXPECT_EQ(shared("<key>shared_filesystem</key><string>/a</string>"), "/a");
+        EXPECT_EQ(shared("<key>shared_filesystem</key><string>/b</string>"), "/b");
+        EXPECT_EQ(shared("<key>shared_filesystem</key><string>/b</strinG>"), standard);
+        EXPECT_EQ(shared("<key>shared_filesystem</key><string>/b</string>"), "/b");
+        std::filesystem::remove(root.path(identity));
+        EXPECT_EQ(SettingsStore::sharedFilesystemPath(), standard);
+    }
+}
+
 TEST_F(SettingsStoreTest, TopLevelThatIsNoDictionaryLoadsAsNull) {
     root.write(identity, "<plist version=\"1.0\"><array/></plist>");
     EXPECT_EQ(SettingsStore::identityPreferences(), std::nullopt);

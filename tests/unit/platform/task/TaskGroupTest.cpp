@@ -1,6 +1,5 @@
-#include "platform/task/Task.h"
-#include "platform/task/TaskBounds.h"
 #include "platform/task/TaskGroup.h"
+#include "tests/unit/platform/task/TaskDirectory.h"
 
 #include <cerrno>
 #include <chrono>
@@ -25,39 +24,18 @@ using namespace std::chrono_literals;
 
 namespace fs = std::filesystem;
 
-class TaskGroupOf : public testing::Test {
+class TaskGroupOf : public TaskDirectory {
   protected:
-    void SetUp() override {
-        std::string place = fs::temp_directory_path() / "task-group-XXXXXX";
-        ASSERT_NE(::mkdtemp(place.data()), nullptr);
-        _dir = place;
-        prepareForTasks();
-    }
     void TearDown() override {
-        setTaskDeadline(std::nullopt);
-        setTaskOutputBound(taskDefaultOutputBound);
-        fs::remove_all(_dir);
+        TaskDirectory::TearDown();
         EXPECT_EQ(::waitpid(-1, nullptr, WNOHANG), -1) << "a child is left";
         EXPECT_EQ(errno, ECHILD);
     }
     [[nodiscard]] std::string place(const std::string& name) const { return _dir / name; }
-
-    fs::path _dir;
 };
 
 TaskPlan shell(const std::string& script) {
     return {DiskPath("/bin/sh"), {"-c", script}};
-}
-
-std::ptrdiff_t openDescriptors() {
-    return std::distance(fs::directory_iterator("/proc/self/fd"), fs::directory_iterator{});
-}
-
-bool isGoneSoon(pid_t pid) {
-    for (int i = 0; i < 1000 && ::kill(pid, 0) == 0; ++i) {
-        std::this_thread::sleep_for(10ms);
-    }
-    return ::kill(pid, 0) != 0;
 }
 
 /// Whether the process exists and has not been killed.
@@ -65,6 +43,25 @@ bool runs(const std::string& pid) {
     std::ifstream file("/proc/" + pid + "/status");
     const std::string text{std::istreambuf_iterator<char>(file), {}};
     return text.find("State:\t") != std::string::npos && text.find("State:\tZ") == std::string::npos;
+}
+
+TEST_F(TaskGroupOf, OutputCollectsForAMomentBetweenTwoReadings) {
+    TaskGroup group;
+    std::string seen;
+    TaskPlan plan = shell("echo one; until [ -e " + place("go") + " ]; do sleep 0.01; done; echo two");
+    plan.outputGrows = [&](std::string_view output) { seen = output; };
+    const TaskGroup::Id id = group.start(std::move(plan));
+    while (seen.empty()) {
+        group.wait();
+    }
+    EXPECT_EQ(seen, "one\n");
+    std::vector<pollfd> entries;
+    group.addTo(entries);
+    EXPECT_EQ(entries.at(0).fd, -1) << "further output wakes nobody";
+    EXPECT_TRUE(group.due()) << "the end of the moment";
+    std::ofstream(place("go")) << "";
+    EXPECT_EQ(group.collect(id).output, "one\ntwo\n");
+    EXPECT_EQ(seen, "one\ntwo\n");
 }
 
 TEST_F(TaskGroupOf, ToolsRunAtTheSameTime) {

@@ -1,6 +1,5 @@
-#include "platform/task/Task.h"
-#include "platform/task/TaskBounds.h"
 #include "tests/support/Environment.h"
+#include "tests/unit/platform/task/TaskDirectory.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -28,19 +27,11 @@ using testing::StartsWith;
 
 namespace fs = std::filesystem;
 
-class Task : public testing::Test {
+class Task : public TaskDirectory {
   protected:
-    void SetUp() override {
-        std::string place = fs::temp_directory_path() / "task-XXXXXX";
-        ASSERT_NE(::mkdtemp(place.data()), nullptr);
-        _dir = place;
-        prepareForTasks();
-    }
     void TearDown() override {
-        setTaskDeadline(std::nullopt);
-        setTaskOutputBound(taskDefaultOutputBound);
         setSystemRoot("/");
-        fs::remove_all(_dir);
+        TaskDirectory::TearDown();
     }
 
     std::int32_t run(const std::string& tool, const std::vector<std::string>& arguments) {
@@ -57,25 +48,9 @@ class Task : public testing::Test {
         return path;
     }
 
-    fs::path _dir;
     std::string _output = "old output";
     std::string _error = "old error";
 };
-
-int openDescriptors() {
-    return static_cast<int>(std::distance(fs::directory_iterator("/proc/self/fd"), fs::directory_iterator{}));
-}
-
-bool isAlive(pid_t pid) {
-    return ::kill(pid, 0) == 0;
-}
-
-bool isGoneSoon(pid_t pid) {
-    for (int i = 0; i < 1000 && isAlive(pid); ++i) {
-        std::this_thread::sleep_for(10ms);
-    }
-    return !isAlive(pid);
-}
 
 /// A process that the tool leaves behind on purpose. The destructor ends it.
 class Leftover {
