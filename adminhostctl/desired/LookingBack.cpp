@@ -37,15 +37,10 @@ std::string valueText(const Value& value, const char* null, const std::string& u
     return widthOf(text) <= widest ? text : wrapped(text, widest).front() + "...";
 }
 
-std::string textAt(const Dictionary& dictionary, std::string_view key) {
-    const std::string* text = dictionary.get(key).string();
-    return text == nullptr ? "" : *text;
-}
-
 /// What became of a setting: "port: 80 -> 81".
 std::string settingChangeText(const StateForm& form, const Dictionary& change) {
-    const std::string key = shown(textAt(change, "key"));
-    const DescribedKey* described = form.setting(textAt(change, "key"));
+    const std::string key = shown(change.text("key"));
+    const DescribedKey* described = form.setting(change.text("key"));
     const std::string unit = described != nullptr ? described->unit : "";
     if (change.get("secret") == Value(true)) {
         return key + ": " + (change.get("to").isNull() ? "(secret) removed" : "(secret) changed");
@@ -56,15 +51,15 @@ std::string settingChangeText(const StateForm& form, const Dictionary& change) {
 
 /// What became of an element of a list, named as plans name it: "SECTION.NAME.LIST.anna: (not allowed) -> (allowed)".
 std::string elementChangeText(const StateForm& form, const Dictionary& change) {
-    const std::string key = textAt(change, "key");
-    const std::string name = textAt(change, "name");
+    const std::string key(change.text("key"));
+    const std::string name(change.text("name"));
     const Value& from = change.get("from");
     const Value& to = change.get("to");
     const auto list = std::find_if(form.lists().begin(), form.lists().end(),
-                                   [&](const ListForm& one) { return one.key == textAt(change, "section"); });
+                                   [&](const ListForm& one) { return one.key == change.text("section"); });
     const bool isKnown = list != form.lists().end();
-    std::string entry = shown(isKnown ? list->section : textAt(change, "section")) + '.' +
-                        tomlKey(name.empty() ? textAt(change, "identity") : name);
+    std::string entry = shown(isKnown ? list->section : change.text("section")) + '.' +
+                        tomlKey(name.empty() ? change.text("identity") : name);
     const std::string doubt = change.get("unverified") == Value(true) ? " (if it existed)" : "";
     if (key.empty()) {
         return entry + (from.isNull() ? ": (not present) -> (present)" : ": (present) -> (not present)") + doubt;
@@ -112,11 +107,11 @@ Array listAt(const Value& answer, std::string_view key) {
 
 /// Adds changes of elements to the entry of the write that made them, if that has one.
 bool addTo(Array& entries, const Dictionary& resources) {
-    const std::string request = textAt(resources, "request");
+    const std::string_view request = resources.text("request");
     for (Value& value : entries) {
         Value* changes = value.dictionary()->find("changes");
         const Array* more = resources.get("changes").array();
-        if (!request.empty() && textAt(*value.dictionary(), "request") == request && changes != nullptr &&
+        if (!request.empty() && value.dictionary()->text("request") == request && changes != nullptr &&
             changes->array() != nullptr && more != nullptr) {
             changes->array()->insert(changes->array()->end(), more->begin(), more->end());
             return true;
@@ -212,7 +207,7 @@ std::string momentText(Date date) {
 
 /// Whether the account is one of an entry's: its name, or its number.
 bool isBy(const Dictionary& entry, const std::string& account) {
-    const std::string who = textAt(entry, "who");
+    const std::string_view who = entry.text("who");
     return who.starts_with(account + " (") || who.find(", as " + account + " (") != std::string::npos ||
            textOf(entry.get("uid")) == account;
 }
@@ -237,8 +232,8 @@ void filter(const Context& context, Array& entries) {
         }
         std::erase_if(*changes, [&](const Value& change) {
             const Dictionary* one = change.dictionary();
-            return one == nullptr || (textAt(*one, "key") != wanted && textAt(*one, "name") != wanted &&
-                                      textAt(*one, "section") != wanted);
+            return one == nullptr ||
+                   (one->text("key") != wanted && one->text("name") != wanted && one->text("section") != wanted);
         });
         return changes->empty();
     });
@@ -291,7 +286,7 @@ Value valueBefore(const ListForm& list, const Dictionary& change) {
     }
     const Array* undone = dictionaryAt(change, "undo").get(list.key).array();
     const Dictionary* element = undone == nullptr || undone->empty() ? nullptr : undone->front().dictionary();
-    return element == nullptr ? Value() : element->get(textAt(change, "key"));
+    return element == nullptr ? Value() : element->get(change.text("key"));
 }
 
 /// The kind of the people in a list with this name.
@@ -308,14 +303,14 @@ std::string kindOf(const ListForm& list, const std::string& inFile) {
 
 void restoreChange(Restoration& restoration, const ListForm& list, const Dictionary& change,
                    const CurrentState& current) {
-    const std::string key = textAt(change, "key");
+    const std::string key(change.text("key"));
     const std::string line = elementChangeText(current.form, change);
     const auto lose = [&](const char* why) { restoration.lost.push_back(line + ": not restored, " + why); };
     const std::vector<Element>& all = elementsOf(current.state, list);
     const auto present = std::find_if(
-        all.begin(), all.end(), [&](const Element& element) { return element.identity == textAt(change, "identity"); });
+        all.begin(), all.end(), [&](const Element& element) { return element.identity == change.text("identity"); });
     const bool isPresent = present != all.end();
-    const std::string name = !isPresent ? textAt(change, "name") : present->label;
+    const std::string name(!isPresent ? change.text("name") : present->label);
     WantedElement wanted{list.byIdentity && isPresent ? present->identity : name, {}, {}, {}, false, false};
     wanted.shownAs = name;
     if (change.get("secret") == Value(true)) {
@@ -434,7 +429,7 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
         // The daemon notices an edit outside when the next write comes.
         const char* const before = entry.get("outside") == Value(true) ? "before " : "";
         std::vector<std::string> row{number.isNull() ? "" : textOf(number), when ? before + momentText(*when) : "",
-                                     shown(textAt(entry, "who")), ""};
+                                     shown(entry.text("who")), ""};
         for (std::string& change : changeTexts(form, entry)) {
             row.back() = std::move(change);
             table.addRow(row);

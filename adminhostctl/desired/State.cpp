@@ -10,7 +10,8 @@
 namespace adminhost::ctl {
 namespace {
 
-std::string textAt(const Dictionary& dictionary, std::string_view key) {
+/// The value under the key as a text, whatever its type; empty if there is none.
+std::string convertedText(const Dictionary& dictionary, std::string_view key) {
     const Value& value = dictionary.get(key);
     return value.isNull() ? std::string() : textOf(value);
 }
@@ -25,14 +26,15 @@ std::vector<Person> peopleOf(const PeopleForm& form, const Dictionary& listed) {
     const Array* entries = listed.get(form.key).array();
     for (const Value& entry : entries != nullptr ? *entries : Array{}) {
         if (const Dictionary* person = entry.dictionary()) {
-            people.push_back({textAt(*person, form.kind), textAt(*person, form.label), textAt(*person, form.identity)});
+            people.push_back({convertedText(*person, form.kind), convertedText(*person, form.label),
+                              convertedText(*person, form.identity)});
         }
     }
     return people;
 }
 
 Element elementOf(const ListForm& list, const Dictionary& listed) {
-    Element element{textAt(listed, list.identity), textAt(listed, list.label), {}, {}};
+    Element element{convertedText(listed, list.identity), convertedText(listed, list.label), {}, {}};
     for (const FieldForm& field : list.fields) {
         if (field.boolean) {
             element.fields.set(field.key, booleanOf(listed.get(field.key)));
@@ -40,14 +42,14 @@ Element elementOf(const ListForm& list, const Dictionary& listed) {
     }
     for (const FieldForm& field : list.fields) {
         if (!field.boolean && listed.contains(field.key) && !isSecret(field, element)) {
-            element.fields.set(field.key, textAt(listed, field.key));
+            element.fields.set(field.key, convertedText(listed, field.key));
         }
     }
     for (const PeopleForm& people : list.people) {
         element.people[people.key] = peopleOf(people, listed);
     }
     for (const std::string& key : list.otherNames) {
-        element.otherNames.push_back(textAt(listed, key));
+        element.otherNames.push_back(convertedText(listed, key));
     }
     return element;
 }
@@ -95,7 +97,7 @@ State stateOf(const StateForm& form, const Dictionary& root) {
         }
         std::vector<Element>& all = state.lists[list.section];
         for (const Value& element : *elements) {
-            if (element.dictionary() != nullptr && !textAt(*element.dictionary(), list.identity).empty()) {
+            if (element.dictionary() != nullptr && !convertedText(*element.dictionary(), list.identity).empty()) {
                 all.push_back(elementOf(list, *element.dictionary()));
             }
         }

@@ -3,6 +3,7 @@
 
 #include "platform/directory/Directory.h"
 #include "platform/directory/LdapNode.h"
+#include "tests/support/SilentServer.h"
 #include "tests/unit/resources/PropertyFixture.h"
 
 #include <algorithm>
@@ -15,7 +16,6 @@
 #include <thread>
 
 #include <malloc.h>
-#include <netinet/in.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -138,17 +138,10 @@ TEST_F(CleansedMemory, SigningInToADirectoryServerLeavesNoPasswordBehind) {
 
 TEST_F(CleansedMemory, PasswordFileOfADirectoryServerIsNotLeftBehind) {
     // A server that accepts the connection and ends it when the password arrives.
-    const int listening = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    socklen_t length = sizeof address;
-    ASSERT_EQ(::bind(listening, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
-    ASSERT_EQ(::listen(listening, 1), 0);
-    ASSERT_EQ(::getsockname(listening, reinterpret_cast<sockaddr*>(&address), &length), 0);
+    const adminhost::test::SilentServer listening;
     bool isSent = false;
     std::thread server([&] {
-        const int client = ::accept(listening, nullptr, nullptr);
+        const int client = ::accept(listening.socket(), nullptr, nullptr);
         std::array<char, 4096> received{};
         const ssize_t size = ::read(client, received.data(), received.size());
         isSent =
@@ -161,7 +154,7 @@ TEST_F(CleansedMemory, PasswordFileOfADirectoryServerIsNotLeftBehind) {
     adminhost::LdapNodeSettings settings;
     settings.name = "/LDAP";
     settings.base = "dc=nimbo,dc=test";
-    settings.uris = {"ldap://127.0.0.1:" + std::to_string(ntohs(address.sin_port))};
+    settings.uris = {"ldap://127.0.0.1:" + std::to_string(listening.port())};
     settings.bindDn = "cn=reader,dc=nimbo,dc=test";
     settings.bindPasswordFile = adminhost::HostPath("/password");
     adminhost::DirectoryQuery query;
@@ -170,7 +163,6 @@ TEST_F(CleansedMemory, PasswordFileOfADirectoryServerIsNotLeftBehind) {
     query.values = {"anna"};
     EXPECT_EQ(seenWhile([&] { EXPECT_FALSE(adminhost::ldapNode(settings).open().value()->records(query)); }), 0);
     server.join();
-    ::close(listening);
     EXPECT_TRUE(isSent);
 }
 

@@ -1,5 +1,6 @@
 #include "krb5/KRB5CredentialCache.h"
 #include "tests/support/Kdc.h"
+#include "tests/support/SilentServer.h"
 
 #include <chrono>
 #include <cstdlib>
@@ -7,9 +8,6 @@
 #include <iostream>
 
 #include <gtest/gtest.h>
-#include <netinet/in.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
 namespace lumio {
 namespace {
@@ -20,16 +18,8 @@ TEST(SilentKdc, ThatAcceptsAndNeverAnswersIsGivenUpAsUnreachable) {
     ASSERT_NE(mkdtemp(pattern.data()), nullptr);
     const std::filesystem::path directory = pattern;
 
-    // Connections are completed by the kernel and wait to be accepted for ever.
-    const int listener = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    socklen_t length = sizeof address;
-    ASSERT_EQ(bind(listener, reinterpret_cast<const sockaddr*>(&address), length), 0);
-    ASSERT_EQ(getsockname(listener, reinterpret_cast<sockaddr*>(&address), &length), 0);
-    ASSERT_EQ(listen(listener, 16), 0);
-    std::ofstream(directory / "krb5.conf") << support::Kdc::clientConfiguration("NIMBO.TEST", ntohs(address.sin_port));
+    const adminhost::test::SilentServer listener;
+    std::ofstream(directory / "krb5.conf") << support::Kdc::clientConfiguration("NIMBO.TEST", listener.port());
     const support::ScopedEnvironment scoped({{"KRB5_CONFIG", directory / "krb5.conf"}});
 
     const auto context = KRB5Context::context();
@@ -45,7 +35,6 @@ TEST(SilentKdc, ThatAcceptsAndNeverAnswersIsGivenUpAsUnreachable) {
     EXPECT_TRUE(cache->credentials().empty());
     std::cout << "given up after " << seconds << " s\n";
     RecordProperty("seconds", static_cast<int>(seconds));
-    close(listener);
     std::filesystem::remove_all(directory);
 }
 

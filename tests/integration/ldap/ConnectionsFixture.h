@@ -16,6 +16,18 @@ namespace adminhost {
 class LdapConnections : public testing::Test {
   protected:
     static std::string people() { return tree + personEntry("anna", 1001) + personEntry("writer", 1002); }
+    /// A server with them. `global` is further lines of its configuration.
+    class ServerWithPeople : public support::Slapd {
+      public:
+        explicit ServerWithPeople(const std::string& global = {}) : Slapd(withLines(global)) { add(people()); }
+
+      private:
+        static Options withLines(const std::string& global) {
+            Options options;
+            options.global = global;
+            return options;
+        }
+    };
     static DirectoryQuery anna() { return queryFor(directory::recordName, {"anna"}); }
     /// The name of the only record that is found, or the error.
     static std::vector<std::string> found(const LdapNodeSettings& settings) {

@@ -24,10 +24,7 @@ using testing::StartsWith;
 // Signing in.
 
 TEST_F(LdapConnections, PasswordOfAFileIsReadAtEachConnectWithoutItsLineEnd) {
-    support::Slapd::Options options;
-    options.global = "disallow bind_anon\nrequire authc\n";
-    support::Slapd server(options);
-    server.add(people());
+    const ServerWithPeople server("disallow bind_anon\nrequire authc\n");
     LdapNodeSettings settings = settingsFor(server);
     settings.uris = {server.uri()};
     settings.bindDn = "uid=writer,ou=people,dc=nimbo,dc=test";
@@ -42,8 +39,7 @@ TEST_F(LdapConnections, PasswordOfAFileIsReadAtEachConnectWithoutItsLineEnd) {
 }
 
 TEST_F(LdapConnections, PasswordOfACredentialOfTheServiceManagerIsUsed) {
-    support::Slapd server;
-    server.add(people());
+    ServerWithPeople server;
     LdapNodeSettings settings = settingsFor(server);
     settings.bindDn = "uid=writer,ou=people,dc=nimbo,dc=test";
     settings.bindPasswordCredential = "ldap";
@@ -55,8 +51,7 @@ TEST_F(LdapConnections, PasswordOfACredentialOfTheServiceManagerIsUsed) {
 }
 
 TEST_F(LdapConnections, PasswordFileThatOthersMayReadIsRefusedBeforeTheServerIsAsked) {
-    support::Slapd server;
-    server.add(people());
+    ServerWithPeople server;
     LdapNodeSettings settings = settingsFor(server);
     settings.bindDn = "uid=writer,ou=people,dc=nimbo,dc=test";
     for (const mode_t mode : {0640U, 0604U, 0660U}) {
@@ -73,10 +68,7 @@ TEST_F(LdapConnections, PasswordFileThatOthersMayReadIsRefusedBeforeTheServerIsA
 }
 
 TEST_F(LdapConnections, ExternalBindOverTheLocalSocketIsTheProcessesOwnAccount) {
-    support::Slapd::Options options;
-    options.global = "require authc\n";
-    support::Slapd server(options);
-    server.add(people());
+    const ServerWithPeople server("require authc\n");
     LdapNodeSettings settings = settingsFor(server);
     EXPECT_EQ(errorOf(ask(ldapNode(settings), anna())).code, 53) << "the server wants to know who asks";
     settings.sasl = LdapNodeSettings::Sasl::external;
@@ -89,10 +81,7 @@ TEST_F(LdapConnections, KerberosBindUsesTheKeytabAndLeavesNoTraceInTheEnvironmen
               (kdc.directory() / "krb5.keytab").string() + " ldap/localhost\nktadd -k " +
               (kdc.directory() / "node.keytab").string() + " anna\n");
     const support::ScopedEnvironment environment(kdc.environment());
-    support::Slapd::Options options;
-    options.global = "require authc\n";
-    support::Slapd server(options);
-    server.add(people());
+    const ServerWithPeople server("require authc\n");
     LdapNodeSettings settings = settingsFor(server);
     settings.uris = {server.namedUri()};
     settings.sasl = LdapNodeSettings::Sasl::gssapi;

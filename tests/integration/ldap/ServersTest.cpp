@@ -4,13 +4,11 @@
 #include "platform/task/Task.h"
 #include "tests/integration/ldap/ConnectionsFixture.h"
 #include "tests/integration/ldap/TestAuthority.h"
+#include "tests/support/SilentServer.h"
 
 #include <chrono>
 #include <csignal>
 
-#include <fcntl.h>
-#include <netinet/in.h>
-#include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -25,55 +23,23 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::SizeIs;
 
-/// A port that accepts connections, and never sends anything.
-class BlackHole {
-  public:
-    BlackHole() : _socket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-        sockaddr_in address{};
-        address.sin_family = AF_INET;
-        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        socklen_t length = sizeof address;
-        EXPECT_EQ(::bind(_socket, reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
-        EXPECT_EQ(::listen(_socket, 100), 0);
-        EXPECT_EQ(::getsockname(_socket, reinterpret_cast<sockaddr*>(&address), &length), 0);
-        _port = ntohs(address.sin_port);
-    }
-    BlackHole(const BlackHole&) = delete;
-    BlackHole& operator=(const BlackHole&) = delete;
-    ~BlackHole() { ::close(_socket); }
-
-    [[nodiscard]] std::string uri() const { return "ldap://127.0.0.1:" + std::to_string(_port); }
-    /// The number of connections that clients have made.
-    [[nodiscard]] int connections() const {
-        int count = 0;
-        ::fcntl(_socket, F_SETFL, O_NONBLOCK);
-        for (int accepted = ::accept(_socket, nullptr, nullptr); accepted >= 0;
-             accepted = ::accept(_socket, nullptr, nullptr)) {
-            ::close(accepted);
-            ++count;
-        }
-        return count;
-    }
-
-  private:
-    int _socket;
-    int _port = 0;
-};
+std::string uriOf(const test::SilentServer& server) {
+    return "ldap://127.0.0.1:" + std::to_string(server.port());
+}
 
 TEST_F(LdapConnections, NodeConnectsAtItsFirstQueryAndNotWhenItIsOpened) {
     LdapNodeSettings settings;
     settings.name = "/LDAP";
     settings.base = "dc=nimbo,dc=test";
-    const BlackHole hole;
-    settings.uris = {hole.uri()};
+    const test::SilentServer hole;
+    settings.uris = {uriOf(hole)};
     const DirectoryNodeSource source = ldapNode(settings);
     ASSERT_TRUE(source.open());
     EXPECT_EQ(hole.connections(), 0);
 }
 
 TEST_F(LdapConnections, ServersAreTriedInOrder) {
-    support::Slapd server;
-    server.add(people());
+    ServerWithPeople server;
     LdapNodeSettings settings = settingsFor(server);
     settings.uris = {unusedUri(), server.uri(), unusedUri()};
     EXPECT_THAT(found(settings), ElementsAre("anna"));
@@ -106,11 +72,11 @@ TEST_F(LdapConnections, ServerThatIsDownIsAnErrorAtOnce) {
 }
 
 TEST_F(LdapConnections, ServerThatNeverRespondsEndsAtTheTimeOutAndIsNotTriedAgainInTheRequest) {
-    const BlackHole hole;
+    const test::SilentServer hole;
     LdapNodeSettings settings;
     settings.name = "/LDAP";
     settings.base = "dc=nimbo,dc=test";
-    settings.uris = {hole.uri()};
+    settings.uris = {uriOf(hole)};
     settings.timeout = seconds(1);
     const DirectoryNodeSource source = ldapNode(settings);
     const DirectoryRequestScope request(milliseconds(10'000));
@@ -131,31 +97,31 @@ TEST_F(LdapConnections, ServerThatNeverRespondsEndsAtTheTimeOutAndIsNotTriedAgai
 }
 
 TEST_F(LdapConnections, TlsHandshakeThatNeverEndsIsCutOffToo) {
-    const BlackHole hole;
+    const test::SilentServer hole;
     LdapNodeSettings settings;
     settings.name = "/LDAP";
     settings.base = "dc=nimbo,dc=test";
-    settings.uris = {"ldaps" + hole.uri().substr(4)};
+    settings.uris = {"ldaps" + uriOf(hole).substr(4)};
     settings.timeout = seconds(1);
     const auto begin = steady_clock::now();
     EXPECT_LT(errorOf(ask(ldapNode(settings), anna())).code, 0);
     EXPECT_LT(steady_clock::now() - begin, seconds(8));
-    settings.uris = {hole.uri()};
+    settings.uris = {uriOf(hole)};
     settings.startTls = true;
     EXPECT_LT(errorOf(ask(ldapNode(settings), anna())).code, 0);
     EXPECT_LT(steady_clock::now() - begin, seconds(16));
 }
 
 TEST_F(LdapConnections, BudgetOfTheRequestEndsAllDirectoryWork) {
-    const BlackHole one;
-    const BlackHole two;
+    const test::SilentServer one;
+    const test::SilentServer two;
     LdapNodeSettings settings;
     settings.base = "dc=nimbo,dc=test";
     settings.name = "/One";
-    settings.uris = {one.uri()};
+    settings.uris = {uriOf(one)};
     const DirectoryNodeSource first = ldapNode(settings);
     settings.name = "/Two";
-    settings.uris = {two.uri()};
+    settings.uris = {uriOf(two)};
     const DirectoryNodeSource second = ldapNode(settings);
     const DirectoryRequestScope request(milliseconds(700));
     const auto begin = steady_clock::now();
@@ -168,11 +134,11 @@ TEST_F(LdapConnections, BudgetOfTheRequestEndsAllDirectoryWork) {
 }
 
 TEST_F(LdapConnections, DeadlineOfTheRequestEndsDirectoryWorkToo) {
-    const BlackHole hole;
+    const test::SilentServer hole;
     LdapNodeSettings settings;
     settings.name = "/LDAP";
     settings.base = "dc=nimbo,dc=test";
-    settings.uris = {hole.uri()};
+    settings.uris = {uriOf(hole)};
     setTaskDeadline(steady_clock::now() + milliseconds(500));
     const auto begin = steady_clock::now();
     EXPECT_EQ(errorOf(ask(ldapNode(settings), anna())).code, -5);
@@ -181,11 +147,10 @@ TEST_F(LdapConnections, DeadlineOfTheRequestEndsDirectoryWorkToo) {
 }
 
 TEST_F(LdapConnections, WrongPasswordIsTriedOnceInARequestAndAtOneServer) {
-    support::Slapd server;
-    server.add(people());
-    const BlackHole hole;
+    ServerWithPeople server;
+    const test::SilentServer hole;
     LdapNodeSettings settings = settingsFor(server);
-    settings.uris = {server.uri(), hole.uri()};
+    settings.uris = {server.uri(), uriOf(hole)};
     settings.bindDn = "uid=writer,ou=people,dc=nimbo,dc=test";
     settings.bindPasswordFile = file("wrong");
     const DirectoryNodeSource source = ldapNode(settings);
@@ -199,8 +164,7 @@ TEST_F(LdapConnections, WrongPasswordIsTriedOnceInARequestAndAtOneServer) {
 }
 
 TEST_F(LdapConnections, ConnectionIsKeptBetweenRequestsAndOpenedAgainWhenTheServerWentAway) {
-    support::Slapd server;
-    server.add(people());
+    ServerWithPeople server;
     LdapNodeSettings settings = settingsFor(server);
     settings.uris = {server.uri()};
     const DirectoryNodeSource source = ldapNode(settings);
@@ -219,8 +183,7 @@ TEST_F(LdapConnections, ConnectionIsKeptBetweenRequestsAndOpenedAgainWhenTheServ
 }
 
 TEST_F(LdapConnections, KeptConnectionThatNoLongerRespondsFailsAtTheTimeOutAndIsReplaced) {
-    support::Slapd server;
-    server.add(people());
+    ServerWithPeople server;
     LdapNodeSettings settings = settingsFor(server);
     settings.uris = {server.uri()};
     settings.timeout = seconds(1);
@@ -236,12 +199,11 @@ TEST_F(LdapConnections, KeptConnectionThatNoLongerRespondsFailsAtTheTimeOutAndIs
 }
 
 TEST_F(LdapConnections, UnreachableNodesAreNamedWithinTheLimitForAllTogether) {
-    support::Slapd server;
-    server.add(people());
-    const BlackHole hole;
+    ServerWithPeople server;
+    const test::SilentServer hole;
     LdapNodeSettings silent = settingsFor(server);
     silent.name = "/Silent";
-    silent.uris = {hole.uri()};
+    silent.uris = {uriOf(hole)};
     LdapNodeSettings down = settingsFor(server);
     down.name = "/Down";
     down.uris = {unusedUri()};
@@ -257,8 +219,7 @@ TEST_F(LdapConnections, UnreachableNodesAreNamedWithinTheLimitForAllTogether) {
 }
 
 TEST_F(LdapConnections, NodeWithAKeptConnectionIsUnreachableWhenItsServerHasEnded) {
-    support::Slapd server;
-    server.add(people());
+    ServerWithPeople server;
     const DirectoryNodeSource source = ldapNode(settingsFor(server));
     const SessionWith session({source});
     EXPECT_THAT(namesOf(ask(source, anna())), ElementsAre("anna"));

@@ -30,6 +30,7 @@ namespace {
 
 namespace fs = std::filesystem;
 using testing::HasSubstr;
+using testing::IsEmpty;
 using testing::Not;
 
 constexpr const char* allow =
@@ -96,6 +97,19 @@ class Root : public testing::Test {
         const auto value = parseJson(reply.body);
         return value && value->dictionary() != nullptr ? *value->dictionary() : Dictionary();
     }
+    /// The descriptions of the commands whose access class fits.
+    [[nodiscard]] static std::vector<Dictionary> commandsThat(const test::DaemonProcess& daemon,
+                                                              bool (*fits)(std::string_view access)) {
+        std::vector<Dictionary> commands;
+        const auto described = parseJson(daemon.connect().get("/v1/lumio").body);
+        EXPECT_TRUE(described && described->array() != nullptr);
+        for (const Value& command : described && described->array() != nullptr ? *described->array() : Array()) {
+            if (fits(command.dictionary()->text("access"))) {
+                commands.push_back(*command.dictionary());
+            }
+        }
+        return commands;
+    }
     /// The sample's identity preferences with another shared file system.
     static void useSharedFilesystem(const test::SampleRoot& root, const std::string& path) {
         const std::string file = "/Library/Preferences/com.brenn.lumioserverd.plist";
@@ -122,15 +136,13 @@ TEST_F(Root, WriteIsServedWithoutTouchingWhatIsOutside) {
 TEST_F(Root, EveryReadingCommandIsServedWithoutTouchingWhatIsOutside) {
     const test::SampleRoot root;
     const test::DaemonProcess daemon(options(root));
-    const auto described = parseJson(daemon.connect().get("/v1/lumio").body);
-    ASSERT_TRUE(described && described->array() != nullptr);
-    for (const Value& command : *described->array()) {
-        const std::string name = textOf(command.dictionary()->get("name"));
-        if (command.dictionary()->get("access") != Value("read")) {
-            continue;
-        }
+    const std::vector<Dictionary> commands =
+        commandsThat(daemon, [](std::string_view access) { return access == "read"; });
+    ASSERT_THAT(commands, Not(IsEmpty()));
+    for (const Dictionary& command : commands) {
+        const std::string name = textOf(command.get("name"));
         SCOPED_TRACE(name);
-        const std::string example = jsonOf(command.dictionary()->at("example.request"));
+        const std::string example = jsonOf(command.at("example.request"));
         for (const std::string& body :
              {std::string("{}"), example, std::string(R"({"optionalArguments":{"languages":["de","en"]}})"),
               std::string(R"({"optionalArguments":{"variant":"getConfig","languages":["fr"]}})")}) {
@@ -207,16 +219,13 @@ TEST_F(Root, EveryKindOfChangeIsMadeBelowTheRoot) {
 TEST_F(Root, OtherCommandsTouchNothingOutsideWhetherTheySucceedOrFail) {
     const test::SampleRoot root;
     const test::DaemonProcess daemon(options(root));
-    const auto described = parseJson(daemon.connect().get("/v1/lumio").body);
-    ASSERT_TRUE(described && described->array() != nullptr);
-    for (const Value& command : *described->array()) {
-        const std::string name = textOf(command.dictionary()->get("name"));
-        if (command.dictionary()->get("access") == Value("read")) {
-            continue;
-        }
+    const std::vector<Dictionary> commands =
+        commandsThat(daemon, [](std::string_view access) { return access != "read"; });
+    ASSERT_THAT(commands, Not(IsEmpty()));
+    for (const Dictionary& command : commands) {
+        const std::string name = textOf(command.get("name"));
         SCOPED_TRACE(name);
-        const test::HttpReply reply =
-            daemon.connect().post("/v1/lumio/" + name, jsonOf(command.dictionary()->at("example.request")));
+        const test::HttpReply reply = daemon.connect().post("/v1/lumio/" + name, jsonOf(command.at("example.request")));
         EXPECT_LT(reply.status, 300) << reply.body;
         EXPECT_THAT(reply.body, Not(HasSubstr("Read-only file system")));
     }

@@ -1,8 +1,8 @@
 // A directory server that is down, or never answers: nothing is mistaken for "nobody has access", and nobody waits.
 
 #include "platform/json/Json.h"
+#include "tests/support/SilentServer.h"
 #include "tests/system/apply/ControlledService.h"
-#include "tests/system/directory/SilentServer.h"
 
 #include <chrono>
 #include <filesystem>

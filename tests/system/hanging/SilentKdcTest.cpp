@@ -3,6 +3,7 @@
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Kdc.h"
 #include "tests/support/SampleRoot.h"
+#include "tests/support/SilentServer.h"
 
 #include <chrono>
 #include <filesystem>
@@ -10,9 +11,6 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <netinet/in.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
 namespace adminhost::test {
 namespace {
@@ -23,18 +21,9 @@ using testing::HasSubstr;
 constexpr auto patience = std::chrono::seconds(150);
 
 TEST(SilentKdc, DelaysOnlyTheRequestThatNeedsItAndLeavesNoCache) {
-    // Connections are completed by the kernel and wait to be accepted for ever.
-    const int listener = ::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    socklen_t length = sizeof address;
-    ASSERT_EQ(::bind(listener, reinterpret_cast<const sockaddr*>(&address), length), 0);
-    ASSERT_EQ(::getsockname(listener, reinterpret_cast<sockaddr*>(&address), &length), 0);
-    ASSERT_EQ(::listen(listener, 16), 0);
-
+    const SilentServer listener;
     const SampleRoot root;
-    root.write("/etc/krb5.conf", support::Kdc::clientConfiguration("NIMBO.TEST", ntohs(address.sin_port)));
+    root.write("/etc/krb5.conf", support::Kdc::clientConfiguration("NIMBO.TEST", listener.port()));
     root.setSwitch("nimbo.exit", "10");  // as without a ticket
     const DaemonProcess daemon(
         {{"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"},
@@ -59,7 +48,6 @@ TEST(SilentKdc, DelaysOnlyTheRequestThatNeedsItAndLeavesNoCache) {
     }
     EXPECT_EQ(daemon.connect().post("/v1/lumio/getState").status, 200);
     EXPECT_FALSE(std::filesystem::exists(root.disk("/var/lumio/server/adminhostd_krb_cc")));
-    ::close(listener);
 }
 
 }  // namespace

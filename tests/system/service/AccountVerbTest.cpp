@@ -5,8 +5,8 @@
 #include "tests/support/Kdc.h"
 #include "tests/support/Program.h"
 #include "tests/support/SampleRoot.h"
+#include "tests/support/SilentServer.h"
 #include "tests/support/Slapd.h"
-#include "tests/system/directory/SilentServer.h"
 
 #include <chrono>
 #include <csignal>

@@ -2,7 +2,7 @@
 // Every client must know what became of each of its writes. ADMINHOST_SOAK_SECONDS sets the time; it is 20 seconds
 // without.
 
-#include "tests/system/directory/SilentServer.h"
+#include "tests/support/SilentServer.h"
 #include "tests/system/host/Host.h"
 
 #include <algorithm>

@@ -1,4 +1,5 @@
 #include "handler/LumioRequestHandler.h"
+#include "tests/support/ServiceTables.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <filesystem>
@@ -34,17 +35,10 @@ class ReadSettings : public testing::Test {
         root.writePropertyList("/shared/Server/member_preferences_M.plist", content);
     }
     void writeDatabase() const {
-        root.sql(
-            database,
-            "create table cameras(id integer primary key,name,uuid,create_user_uuid,created_at,update_user_uuid,"
-            "updated_at,last_recording_uuid,use_user_uuid,used_at,recording_status,access_control_enabled,disabled);"
-            "create table workflows(id integer primary key,uuid,bundle_path,disabled,access_control_enabled,"
-            "use_user_uuid,created_at,updated_at,used_at);"
-            "create table properties(id integer primary key,name,value,protect,created_at,updated_at);"
-            "create table access_control_entries(record_uuid,resource_type,resource_id);"
-            "insert into cameras(name,uuid,recording_status) values('Aula','C-1','offline');"
-            "insert into workflows(uuid,bundle_path,disabled) values('W-1','Lecture.bundle','f');"
-            "insert into properties(name,value,protect) values('n','left','f');");
+        root.sql(database, adminhost::test::serviceTables +
+                               "insert into cameras(name,uuid,recording_status) values('Aula','C-1','offline');"
+                               "insert into workflows(uuid,bundle_path,disabled) values('W-1','Lecture.bundle','f');"
+                               "insert into properties(name,value,protect) values('n','left','f');");
     }
     [[nodiscard]] static std::vector<std::string> keysOf(const Dictionary& dictionary) {
         std::vector<std::string> keys;

@@ -5,6 +5,7 @@
 #include "handler/LumioRequestHandler.h"
 #include "platform/plist/PropertyList.h"
 #include "tests/support/CapturedLog.h"
+#include "tests/support/ServiceTables.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <filesystem>
@@ -80,17 +81,10 @@ class WriteSettings : public testing::Test {
         return numbers;
     }
     void makeDatabase() const {
-        root.sql(
-            database,
-            "create table cameras(id integer primary key,name,uuid,create_user_uuid,created_at,update_user_uuid,"
-            "updated_at,last_recording_uuid,use_user_uuid,used_at,recording_status,access_control_enabled,disabled);"
-            "create table workflows(id integer primary key,uuid,bundle_path,disabled,access_control_enabled,"
-            "use_user_uuid,created_at,updated_at,used_at);"
-            "create table properties(id integer primary key,name,value,protect,created_at,updated_at);"
-            "create table access_control_entries(record_uuid,resource_type,resource_id);"
-            "insert into cameras(name,uuid,access_control_enabled) values('Aula','C-1','f');"
-            "insert into workflows(uuid,bundle_path,disabled) values('W-1','Lecture.bundle','f');"
-            "insert into properties(name,value,protect) values('p','old','f');");
+        root.sql(database, adminhost::test::serviceTables +
+                               "insert into cameras(name,uuid,access_control_enabled) values('Aula','C-1','f');"
+                               "insert into workflows(uuid,bundle_path,disabled) values('W-1','Lecture.bundle','f');"
+                               "insert into properties(name,value,protect) values('p','old','f');");
     }
 
     adminhost::test::TemporaryRoot root;

@@ -3,6 +3,7 @@
 #include "adminhostd/PluginFile.h"
 #include "platform/directory/LocalAccounts.h"
 #include "tests/support/CapturedReports.h"
+#include "tests/support/ServiceTables.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <filesystem>
@@ -110,9 +111,7 @@ TEST_F(PluginTable, RecycleServiceAnswersNothingAndChangesNothingWhateverTheVari
 
 TEST_F(PluginTable, ExceptionInsideAnOperationReachesTheHost) {
     root.sql("/Library/SorvaneProducer/Shared/Server/db.sqlite3",
-             "create table cameras(id integer primary key,name,uuid,create_user_uuid,created_at,update_user_uuid,"
-             "updated_at,last_recording_uuid,use_user_uuid,used_at,recording_status,access_control_enabled,disabled);"
-             "insert into cameras(use_user_uuid) values('A');");
+             test::camerasTable + "insert into cameras(use_user_uuid) values('A');");
     setDirectoryNodes({{"/Broken", []() -> OpenedDirectoryNode { throw std::runtime_error("no memory"); }}});
     EXPECT_THROW(static_cast<void>(plugin->perform("getCameras", {})), std::runtime_error);
 }

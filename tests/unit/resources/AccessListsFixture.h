@@ -7,6 +7,7 @@
 #include "platform/directory/NameBasedUuid.h"
 #include "resources/Camera.h"
 #include "tests/support/CapturedLog.h"
+#include "tests/support/ServiceTables.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <sstream>
@@ -36,14 +37,12 @@ class AccessLists : public testing::Test {
         root.write("/etc/passwd",
                    "anna:x:1001:1001:Anna Berg,,,:/home/anna:/bin/sh\nbo:x:1002:1002::/home/bo:/bin/sh\n");
         root.write("/etc/group", "editors:x:2001:anna\n");
-        root.sql(
-            database,
-            "create table cameras(id integer primary key,name,uuid,create_user_uuid,created_at,update_user_uuid,"
-            "updated_at,last_recording_uuid,use_user_uuid,used_at,recording_status,access_control_enabled,disabled);"
-            "create table access_control_entries(record_uuid text,resource_type text,resource_id integer);"
-            "insert into cameras(id,name,uuid,use_user_uuid,access_control_enabled) values"
-            "(7,'Aula','C-7','" +
-                uuidOf("user:anna") + "','t'),(8,'Hall','C-8','','f');");
+        root.sql(database,
+                 adminhost::test::camerasTable +
+                     "create table access_control_entries(record_uuid text,resource_type text,resource_id integer);"
+                     "insert into cameras(id,name,uuid,use_user_uuid,access_control_enabled) values"
+                     "(7,'Aula','C-7','" +
+                     uuidOf("user:anna") + "','t'),(8,'Hall','C-8','','f');");
         root.writeTool(tool, "#!/bin/sh\nfor a in \"$@\"; do printf '%s ' \"$a\"; done >> " +
                                  root.path("/calls").string() + "\necho >> " + root.path("/calls").string() + "\n");
         adminhost::setDirectoryNodes({adminhost::localAccounts()});

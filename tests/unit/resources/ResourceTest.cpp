@@ -1,5 +1,6 @@
 #include "resources/Camera.h"
 #include "resources/Resource.h"
+#include "tests/support/ServiceTables.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <cstdlib>
@@ -22,12 +23,11 @@ class ResourceTest : public testing::Test {
         ::tzset();
         root.sql(
             database,
-            "create table cameras(id integer primary key,name,uuid,create_user_uuid,created_at,update_user_uuid,"
-            "updated_at,last_recording_uuid,use_user_uuid,used_at,recording_status,access_control_enabled,disabled);"
-            "insert into cameras(name,uuid,created_at,recording_status,access_control_enabled,disabled) values"
-            "('A','U-A','2026-01-31 08:00:00','offline','f','f'),('B','U-B','garbage','capturing','t',NULL),"
-            "('C','U-C',NULL,'paused','t',NULL),('D','U-D',NULL,'idle','f','t'),('twin','U-T',NULL,NULL,NULL,'t'),"
-            "('twin','U-T',NULL,NULL,NULL,'t');");
+            adminhost::test::camerasTable +
+                "insert into cameras(name,uuid,created_at,recording_status,access_control_enabled,disabled) values"
+                "('A','U-A','2026-01-31 08:00:00','offline','f','f'),('B','U-B','garbage','capturing','t',NULL),"
+                "('C','U-C',NULL,'paused','t',NULL),('D','U-D',NULL,'idle','f','t'),('twin','U-T',NULL,NULL,NULL,'t'),"
+                "('twin','U-T',NULL,NULL,NULL,'t');");
     }
     void TearDown() override { ::unsetenv("TZ"); }
 
