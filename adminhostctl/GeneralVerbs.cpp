@@ -146,8 +146,8 @@ constexpr std::array options = {
     VerbOption{dryRunOption, "", "Show what would be changed, and change nothing", {}, {}, true},
     VerbOption{yesOption, "", "Do not ask"},
     VerbOption{forceOption, "", "Also send a value that is outside its range or not one of its words", {}, {}, true},
-    VerbOption{followOption, "", "With logs and audit: print also what is written from now on", {}, "-f"},
-    VerbOption{linesOption, "LINES", "With logs: print only the last LINES lines (10 if not given)", {}, "-n"},
+    VerbOption{followOption, "", "Print also what is written from now on", {}, "-f"},
+    VerbOption{linesOption, "LINES", "Print only the last LINES lines (10 if not given)", {}, "-n"},
     VerbOption{
         sinceOption, "TIME",
         "Only from this time on: a date, today, yesterday, or 90min, 2h or 3d ago (with audit 24h if not given)"},

@@ -117,7 +117,7 @@ void addOption(CLI::App& app, const adminhost::ctl::VerbOption& option, adminhos
 
 /// What is wrong with the options of the command line.
 std::string problemOf(const CLI::ParseError& error, const CLI::App& app) {
-    const std::string text = error.what();
+    std::string text = error.what();
     if (dynamic_cast<const CLI::ExtrasError*>(&error) != nullptr) {
         const std::vector<std::string> unknown = app.remaining();
         std::vector<std::string> known;

@@ -176,6 +176,13 @@ void Reading::appendTable(std::string& text, const Array& rows, const std::strin
         }
     }
     Table table(std::move(headings));
+    // A list of people answers the question that most tables with one are read for.
+    for (std::size_t i = 0; i < keys.size(); ++i) {
+        if (const DescribedKey* key = _description.answerKey(element + keys[i]);
+            key != nullptr && key->unit == "people") {
+            table.keep(i);
+        }
+    }
     for (const Value& row : rows) {
         std::vector<std::string> cells;
         for (const std::string& key : keys) {

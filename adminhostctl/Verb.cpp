@@ -179,7 +179,7 @@ ExitStatus checkOnly(const Context& context, const CommandRef& command, const Di
 
 RequestReport reportLost(const Context& context, const LostAnswer& lost) {
     context.err << "adminhostctl: " << shown(lost.what()) << '\n';
-    const RequestReport report = context.service.settledReport(lost.requestId());
+    RequestReport report = context.service.settledReport(lost.requestId());
     const char* const state = report.state == RequestReport::State::done      ? "has ended"
                               : report.state == RequestReport::State::running ? "is still running"
                               : report.state == RequestReport::State::waiting ? "is still waiting"

@@ -301,7 +301,7 @@ constexpr std::array options = {
     VerbOption{onlyOption, "SECTIONS", "With plan and apply: only these tables of the files, separated by commas"},
     VerbOption{exitCodeOption, "",
                "With plan and apply: exit status 5 if something differs, or was changed; 0 if nothing does"},
-    VerbOption{validateOption, "", "With settings set: try the setting before it is written"},
+    VerbOption{validateOption, "", "Try the setting before it is written"},
 };
 
 }  // namespace

@@ -104,6 +104,9 @@ ExitStatus explain(const Context& context, std::span<const std::string> argument
         const Value& value = state.settings.get(name);
         all.set("value", value.isNull() ? Value("(not set)") : value);
     }
+    if (secret != nullptr) {
+        all.remove("default");  // there is none
+    }
     if (written == nullptr) {
         all.remove("default");
         all.set("written", "by the service only");

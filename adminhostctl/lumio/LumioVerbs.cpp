@@ -285,8 +285,8 @@ constexpr std::array options = {
     VerbOption{sortOption, "COLUMN", "In the order of this column"},
     VerbOption{columnsOption, "LIST", "Show these columns, separated by commas"},
     VerbOption{wideOption, "", "Show long lists in full, and do not fit the table to the terminal"},
-    VerbOption{protectOption, "", "With property set: store the value encrypted"},
-    VerbOption{noProtectOption, "", "With property set: store the value unencrypted", protectOption},
+    VerbOption{protectOption, "", "Store the value encrypted"},
+    VerbOption{noProtectOption, "", "Store the value unencrypted", protectOption},
 };
 
 }  // namespace

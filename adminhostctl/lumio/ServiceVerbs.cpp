@@ -74,7 +74,7 @@ constexpr std::array table = {
 };
 
 constexpr std::array options = {
-    VerbOption{saveOption, "", "With account create: write the account's name and password into the settings"},
+    VerbOption{saveOption, "", "Write the account's name and password into the settings"},
 };
 
 }  // namespace

@@ -85,6 +85,12 @@ TEST_F(NarrowTerminal, HistoryKeepsWhatWasChanged) {
                             HasSubstr("camera_preview_cac"), ContainsRegex(" 4 s\n"), Not(HasSubstr("\n\n\n"))));
 }
 
+TEST_F(NarrowTerminal, ListKeepsWhoMayUseTheElements) {
+    EXPECT_THAT(
+        screen({"camera", "list", "--match", "Studio ?"}),
+        AllOf(ContainsRegex("NAME +STATUS +ALLOWED\n"), HasSubstr("(omitted columns: LAST USED, BY,\nRESTRICTED)")));
+}
+
 TEST_F(NarrowTerminal, WordsAreNotBrokenInHelp) {
     const std::string text = screen({"help"});
     EXPECT_THAT(text,
