@@ -158,7 +158,7 @@ std::map<std::string, std::string> namesByIdentity(const Context& context) {
             }
             for (const Value& element :
                  listAt(answer.value.value_or(Value()), key.path.substr(0, key.path.size() - 2))) {
-                names[textAt(*element.dictionary(), key.identity)] = textAt(*element.dictionary(), key.label);
+                names[std::string(element.dictionary()->text(key.identity))] = element.dictionary()->text(key.label);
             }
         }
     } catch (const Failure&) {
@@ -177,13 +177,13 @@ void addNames(const Context& context, Array& entries) {
         }
         for (Value& value : *changes) {
             Dictionary* const change = value.dictionary();
-            if (change == nullptr || !change->contains("identity") || !textAt(*change, "name").empty()) {
+            if (change == nullptr || !change->contains("identity") || !change->text("name").empty()) {
                 continue;
             }
             if (!names) {
                 names = namesByIdentity(context);
             }
-            if (const auto found = names->find(textAt(*change, "identity")); found != names->end()) {
+            if (const auto found = names->find(std::string(change->text("identity"))); found != names->end()) {
                 change->set("name", found->second);
             }
         }
@@ -252,7 +252,7 @@ bool isChangedSince(const Array& entries, Array::const_iterator entry, const std
         const Array* const changes = later.dictionary()->get("changes").array();
         return changes != nullptr && std::any_of(changes->begin(), changes->end(), [&](const Value& change) {
                    return change.dictionary() != nullptr && !change.dictionary()->contains("section") &&
-                          textAt(*change.dictionary(), "key") == setting;
+                          change.dictionary()->text("key") == setting;
                });
     });
 }
