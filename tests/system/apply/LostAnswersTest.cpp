@@ -174,5 +174,44 @@ TEST_F(LostAnswers, InterruptedWriteIsReportedAndTheProgramEndsByTheSignal) {
     EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8180\n");
 }
 
+TEST_F(LostAnswers, InterruptedCommandPrintsTheChangesThatTheDaemonReports) {
+    holdWrite();
+    RunningCtl write(daemon.socket(), {"writeSettings", "configuration.server_port=8180"});
+    waitForWrite();
+    write.signal(SIGINT);
+    write.waitFor("interrupted");
+    releaseWrite();
+    const ProgramResult result = write.wait();
+    EXPECT_EQ(result.status, 128 + SIGINT) << result.output;
+    EXPECT_THAT(result.output, AllOf(HasSubstr("has ended; it was not repeated"),
+                                     HasSubstr("the daemon reports these changes:\n  settings.server_port: "),
+                                     HasSubstr(" -> 8180\n")));
+}
+
+TEST_F(LostAnswers, SecondInterruptEndsTheProgramAtOnceAndTheWriteIsCompleted) {
+    holdWrite();
+    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    waitForWrite();
+    set.signal(SIGINT);
+    set.waitFor("interrupted");
+    set.signal(SIGINT);
+    EXPECT_EQ(set.wait().status, 128 + SIGINT) << "although the write is held";
+    releaseWrite();
+    EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8180\n") << "which waits for the write";
+}
+
+TEST_F(LostAnswers, InterruptBeforeTheWriteEndsTheProgramAndNothingIsWritten) {
+    root.hold("setup_preferences");
+    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    ASSERT_TRUE(root.waitForHeld("setup_preferences"));
+    set.signal(SIGINT);
+    const ProgramResult result = set.wait();
+    EXPECT_EQ(result.status, 128 + SIGINT) << "while it was reading";
+    EXPECT_EQ(result.output, "");
+    root.release("setup_preferences");
+    EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8170\n");
+    EXPECT_EQ(ctl({"history"}).output, "No change has been recorded yet.\n");
+}
+
 }  // namespace
 }  // namespace adminhost::test

@@ -1,2 +1,3 @@
 set(TEST_LIBS host util)
 set(TEST_DEPENDS adminhostd adminhostctl adminhost_lumio)
+set(TEST_TIMEOUT 600) # each test has a daemon
