@@ -17,6 +17,8 @@
 #include <set>
 #include <sstream>
 
+#include <fmt/format.h>
+
 namespace adminhost::ctl {
 namespace {
 
@@ -37,11 +39,8 @@ std::set<std::string> chosenSections(const Context& context, const StateForm& fo
     std::istringstream words(context.options.argumentOf(onlyOption));
     for (std::string word; std::getline(words, word, ',');) {
         if (std::find(known.begin(), known.end(), word) == known.end()) {
-            std::string list;
-            for (const std::string& section : known) {
-                list += (list.empty() ? "" : ", ") + section;
-            }
-            throw usageError("--only: not a section: " + word + didYouMean(word, known) + "; the sections are " + list);
+            throw usageError(fmt::format("--only: not a section: {}{}; the sections are {}", word,
+                                         didYouMean(word, known), fmt::join(known, ", ")));
         }
         chosen.insert(word);
     }
