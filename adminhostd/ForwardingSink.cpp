@@ -25,12 +25,14 @@ ForwardingSink::~ForwardingSink() {
     setLogSink(standardErrorSink());
 }
 
-void ForwardingSink::beginOperation(std::string_view plugin) {
+void ForwardingSink::beginOperation(std::string_view plugin, std::function<void()> onReading) {
     _changes.clear();
+    _onReading = std::move(onReading);
     _former.emplace(plugin);
 }
 
 std::vector<Change> ForwardingSink::takeChanges() {
+    _onReading = {};
     return std::exchange(_changes, {});
 }
 
@@ -68,6 +70,12 @@ void ForwardingSink::notDone(NotDone part) {
         _note->add(part);
     }
     send(_descriptor, std::move(part));
+}
+
+void ForwardingSink::readingBegins() {
+    if (const auto onReading = std::exchange(_onReading, {})) {
+        onReading();
+    }
 }
 
 }  // namespace adminhost

@@ -11,6 +11,7 @@
 #include "platform/log/Log.h"
 
 #include <cstddef>
+#include <functional>
 #include <optional>
 #include <string_view>
 #include <vector>
@@ -30,9 +31,11 @@ class ForwardingSink final : public LogSink, public ReportSink {
 
     /// Reports are added to this note too from now on; null: to none. It must outlive its use.
     void setNote(BegunRequest* note) noexcept { _note = note; }
-    /// The reports from now on are of an operation of this plug-in.
-    void beginOperation(std::string_view plugin);
-    /// The changes of the operation: at most changesMaximum, and all secret ones above it. They are then forgotten.
+    /// The reports from now on are of an operation of this plug-in. The function, if there is one, is called when the
+    /// operation first announces that it is about to read.
+    void beginOperation(std::string_view plugin, std::function<void()> onReading = {});
+    /// Called after the operation. Returns its changes: at most changesMaximum, and all secret ones above it. They are
+    /// then forgotten.
     [[nodiscard]] std::vector<Change> takeChanges();
 
     void write(std::string_view event) noexcept override;
@@ -41,12 +44,14 @@ class ForwardingSink final : public LogSink, public ReportSink {
     void changed(Change change) override;
     void becomesSecret(const SecretPart& part) override;
     void notDone(NotDone part) override;
+    void readingBegins() override;
 
   private:
     int _descriptor;
     BegunRequest* _note = nullptr;
     std::vector<Change> _changes;
     std::optional<FormerValues> _former;
+    std::function<void()> _onReading;
 };
 
 }  // namespace adminhost

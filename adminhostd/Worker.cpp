@@ -34,6 +34,7 @@
 #include <chrono>
 #include <csignal>
 #include <exception>
+#include <functional>
 #include <optional>
 #include <string>
 #include <utility>
@@ -155,6 +156,16 @@ protocol::Answer unmetAnswer(const UnmetNeed& need, BodyForm form) {
     later.error = "REQUIREMENT_UNKNOWN";
     later.message = need.message;
     return later;
+}
+
+/// Empty if there is none: past the deadline, when tools were killed, it may be that of half of the settings.
+std::string shownRevision(const LoadedPlugin& loaded, Result<std::string> revision, Clock::time_point deadline) {
+    if (revision && Clock::now() < deadline) {
+        return *std::move(revision);
+    }
+    logEvent(fmt::format("adminhostd: {} failed to give its revision: {}", loaded.name,
+                         revision ? "the deadline has passed" : textOf(revision.error().description)));
+    return {};
 }
 
 protocol::Hello Worker::configure(const protocol::Configure& configuration) {
@@ -288,7 +299,10 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
     if (write && order.keepsHistory) {
         write->begin();
     }
-    _sink.beginOperation(loaded.name);
+    const auto revisionNow = [&] { return callPlugin([&] { return plugin.revision(); }); };
+    std::optional<Result<std::string>> ofRead;
+    const bool readsWithRevision = order.showsRevision && !held;  // a write has the revision that it leaves
+    _sink.beginOperation(loaded.name, readsWithRevision ? [&] { ofRead = revisionNow(); } : std::function<void()>());
     auto response = callPlugin([&] { return plugin.perform(order.command, order.arguments); });
     const std::vector<Change> reported = _sink.takeChanges();
     if (write) {
@@ -301,17 +315,6 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
     if (Clock::now() >= deadline) {
         answer.outcome = Outcome::overrun;
         return answer;
-    }
-    std::string revision;
-    if (order.showsRevision && response->kind() != Response::Kind::error) {
-        auto now = callPlugin([&] { return plugin.revision(); });
-        // Past the deadline its tools were killed, and it may be the revision of half of the settings.
-        if (now && Clock::now() < deadline) {
-            revision = *std::move(now);
-        } else {
-            logEvent(fmt::format("adminhostd: {} failed to give its revision: {}", loaded.name,
-                                 now ? "the deadline has passed" : textOf(now.error().description)));
-        }
     }
     switch (response->kind()) {
         case Response::Kind::nothing:
@@ -326,7 +329,9 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
             answer = written(Outcome::error, _spent, order.form);
             break;
     }
-    answer.revision = std::move(revision);
+    if (order.showsRevision && response->kind() != Response::Kind::error) {
+        answer.revision = shownRevision(loaded, ofRead ? *std::move(ofRead) : revisionNow(), deadline);
+    }
     return answer;
 }
 

@@ -1,5 +1,6 @@
 #include "handler/LumioRequestHandler.h"
 #include "platform/crypto/Crypt.h"
+#include "platform/framework/Report.h"
 #include "platform/value/ValueText.h"
 #include "resources/Property.h"
 
@@ -53,6 +54,7 @@ void moveList(Response response, std::string_view key, Dictionary& config) {
 
 Response LumioRequestHandler::readSettingsWithRequest(const Dictionary& request) {
     const std::int32_t status = setupPreferences();
+    adminhost::announceReading();  // the script may have changed the settings
     const Value& variantValue = request.at("optionalArguments.variant");
     const bool all = variantValue.isNull();
     const auto variantIs = [&](std::string_view name) { return variantValue == Value(name); };

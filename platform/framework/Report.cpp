@@ -23,6 +23,12 @@ void announceSecret(const SecretPart& part) {
     }
 }
 
+void announceReading() {
+    if (theSink != nullptr) {
+        theSink->readingBegins();
+    }
+}
+
 void reportNotDone(NotDone part) {
     if (theSink != nullptr) {
         theSink->notDone(std::move(part));

@@ -54,6 +54,7 @@ class ADMINHOST_EXPORT ReportSink {
     virtual void changed(Change change) = 0;
     virtual void becomesSecret(const SecretPart& part) = 0;
     virtual void notDone(NotDone part) = 0;
+    virtual void readingBegins() {}
 
   protected:
     ~ReportSink() = default;
@@ -67,5 +68,9 @@ ADMINHOST_EXPORT void reportNotDone(NotDone part);
 /// returns, so that none stays readable if the process is killed between the change and its report. They stay hidden if
 /// the change then fails.
 ADMINHOST_EXPORT void announceSecret(const SecretPart& part);
+/// Announces that the operation is about to read what its response shows, and has itself changed what it changes. The
+/// revision that goes with the response is that of this moment: if somebody else writes while it is reading, a later
+/// write with that revision is refused. Without this call, it is the revision after the operation.
+ADMINHOST_EXPORT void announceReading();
 
 }  // namespace adminhost

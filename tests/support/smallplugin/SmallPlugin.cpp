@@ -106,6 +106,7 @@ class SmallPlugin final : public adminhost::Plugin {
 
     Response perform(std::string_view command, const Dictionary& request) override {
         if (command == "show") {
+            adminhost::announceReading();
             Dictionary values = stored();
             values.remove(secretKey);
             values.set("languages", Array(_languages.begin(), _languages.end()));

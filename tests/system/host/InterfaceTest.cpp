@@ -74,6 +74,16 @@ TEST_F(Interface, AnswerToAWriteCarriesTheNewRevision) {
     EXPECT_NE(client.post("/v1/fixture/look", "{}").headers.at("etag"), first.headers.at("etag"));
 }
 
+TEST_F(Interface, ReadDuringWhichSomebodyElseWritesHasTheRevisionBeforeThat) {
+    const HttpReply read = client.post("/v1/fixture/look", R"({"changes": 1})");
+    ASSERT_EQ(read.status, 200);
+    EXPECT_EQ('"' + std::string(dictionaryOf(read).text("revision")) + '"', read.headers.at("etag"));
+    expectError(client.post("/v1/fixture/change", "{}", {"If-Match: " + read.headers.at("etag")}), 412,
+                "REVISION_CHANGED");
+    const HttpReply again = client.post("/v1/fixture/look", "{}");
+    EXPECT_EQ(client.post("/v1/fixture/change", "{}", {"If-Match: " + again.headers.at("etag")}).status, 200);
+}
+
 TEST_F(Interface, DeadlineOfTheClientShortensThatOfTheOperation) {
     const auto begin = Clock::now();
     const HttpReply reply = client.post("/v1/fixture/run", R"({"script": "sleep 15"})", {"Request-Deadline: 1"});

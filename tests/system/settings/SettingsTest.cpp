@@ -31,38 +31,6 @@ using testing::HasSubstr;
 using testing::Not;
 using testing::StartsWith;
 
-TEST_F(Settings, ReadCarriesTheRevisionThatGuardsAWrite) {
-    const HttpReply read = post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})");
-    ASSERT_EQ(read.status, 200);
-    const std::string revision = read.headers.at("etag");
-    EXPECT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})", {"If-Match: " + revision}).status,
-              200);
-    const std::string before = root.read("/Library/Preferences/com.brenn.lumioserverd.plist");
-    const HttpReply stale =
-        post("writeSettings", R"({"configuration":{"member_uuid":"X"}})", {"If-Match: " + revision});
-    EXPECT_EQ(stale.status, 412);
-    EXPECT_EQ(valueOf(stale).dictionary()->get("error"), Value("REVISION_CHANGED"));
-    EXPECT_EQ(root.read("/Library/Preferences/com.brenn.lumioserverd.plist"), before);
-}
-
-TEST_F(Settings, RevisionOfAReadIsOfWhatItsSetupScriptLeft) {
-    const std::string script = "/usr/share/sorvaneproducer/lumioserverd/script/setup_lumioserverd_preferences";
-    const std::string file = "/Library/SorvaneProducer/Shared/Server/cluster_preferences.plist";
-    root.write("/pending.plist",
-               "<plist><dict><key>submissions_groupname</key><string>of the script</string></dict></plist>");
-    std::string text = root.read(script);
-    text.insert(text.find('\n') + 1, "[ ! -f '" + root.disk("/pending.plist") + "' ] || /bin/mv '" +
-                                         root.disk("/pending.plist") + "' '" + root.disk(file) + "'\n");
-    root.write(script, text);
-    const HttpReply read = post("readSettings", R"({"optionalArguments":{"variant":"getConfig"}})");
-    EXPECT_THAT(read.body, HasSubstr("of the script"));
-    EXPECT_EQ(post("readSettings", "").headers.at("etag"), read.headers.at("etag"));
-    EXPECT_EQ(
-        post("writeSettings", R"({"configuration":{"server_port":9001}})", {"If-Match: " + read.headers.at("etag")})
-            .status,
-        200);
-}
-
 TEST_F(Settings, TwoWritersComeOneAfterTheOtherAndNothingIsMixed) {
     test::UnixHttp first = daemon.connect();
     test::UnixHttp second = daemon.connect();

@@ -1,8 +1,11 @@
 #include "handler/LumioRequestHandler.h"
+#include "platform/framework/Report.h"
 #include "tests/support/ServiceTables.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <filesystem>
+#include <functional>
+#include <utility>
 
 #include <gtest/gtest.h>
 
@@ -66,6 +69,42 @@ class ReadSettings : public testing::Test {
     LumioRequestHandler handler;
     Response response;
 };
+
+/// Calls a function when an operation is about to read.
+class AtReading final : public adminhost::ReportSink {
+  public:
+    explicit AtReading(std::function<void()> function) : _function(std::move(function)) {
+        adminhost::setReportSink(this);
+    }
+    AtReading(const AtReading&) = delete;
+    AtReading& operator=(const AtReading&) = delete;
+    ~AtReading() { adminhost::setReportSink(nullptr); }
+
+    void changed(adminhost::Change) override {}
+    void becomesSecret(const adminhost::SecretPart&) override {}
+    void notDone(adminhost::NotDone) override {}
+    void readingBegins() override { _function(); }
+
+  private:
+    std::function<void()> _function;
+};
+
+TEST_F(ReadSettings, IsAnnouncedAfterTheSetupScriptAndBeforeAnythingIsRead) {
+    writeSettings();
+    writeDatabase();
+    root.writeTool(script, "#!/bin/sh\ntouch '" + root.path("/prepared").string() + "'\n");
+    int announced = 0;
+    const AtReading sink([&] {
+        ++announced;
+        EXPECT_TRUE(std::filesystem::exists(root.path("/prepared")));
+        writeMember("<key>server_host</key><string>later</string>");
+        root.sql(database, "update cameras set name='Later'");
+    });
+    const Dictionary config = read();
+    EXPECT_EQ(announced, 1);
+    EXPECT_EQ(config.get("server_host"), Value("later"));
+    EXPECT_EQ(config.at("cameras").array()->at(0).dictionary()->get("name"), Value("Later"));
+}
 
 TEST_F(ReadSettings, WithoutSettingsFilesAndDatabaseAnswersOnlyTheDefaultSharedFilesystem) {
     EXPECT_EQ(read(), (Dictionary{{"default_shared_filesystem", "/Library/SorvaneProducer/Shared"}}));
