@@ -84,6 +84,9 @@ Front::Front(const OperationQueue::Settings& settings, MonitorLink& monitor, Fro
                   _audit.begun(*operation.record, about);
               },
               [this](const protocol::Unfinished& request) { unfinished(request); },
+              [this](const protocol::Answer& answer) {
+                  _metrics.workDone(answer.toolRuns, answer.directoryLookups, answer.residentBytes);
+              },
               [this](const Operation& operation, OperationQueue::Ending ending) {
                   finished(operation, std::move(ending));
               }}) {

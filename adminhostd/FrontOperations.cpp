@@ -201,9 +201,6 @@ void Front::enqueue(Operation operation) {
 
 void Front::finished(const Operation& operation, OperationQueue::Ending ending) {
     const auto* unserved = std::get_if<Unserved>(&ending);
-    if (const auto* answer = std::get_if<protocol::Answer>(&ending)) {
-        _metrics.workDone(answer->toolRuns, answer->directoryLookups, answer->residentBytes);
-    }
     const bool cancelled = unserved != nullptr && unserved->reason == Unserved::Reason::cancelled;
     if (isDoctor(*operation.record) && !cancelled) {
         return end(operation, doctorAnswer(ending), {});

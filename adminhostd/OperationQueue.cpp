@@ -275,6 +275,7 @@ bool OperationQueue::take(protocol::Answer answer) {
     _state = State::idle;
     _due.reset();
     _changesFrom.reset();
+    _events.worked(answer);
     if (answer.outcome == protocol::Outcome::locked && _running->changes && !_stopping &&
         Clock::now() < *_running->until) {
         waitForLock(std::move(answer));

@@ -55,7 +55,8 @@ class OperationQueue {
         std::function<void(const SecretPart&)> becomesSecret;                 ///< reported by the running operation
         std::function<void(const Operation&, const protocol::Begun&)> begun;  ///< may change something from now on
         std::function<void(const protocol::Unfinished&)> unfinished;          ///< of an earlier worker
-        std::function<void(const Operation&, Ending)> finished;               ///< also its sharers are finished
+        std::function<void(const protocol::Answer&)> worked;     ///< for each run, also one without the lock
+        std::function<void(const Operation&, Ending)> finished;  ///< also its sharers are finished
     };
 
     /// `monitor` starts the workers and configures them. It must outlive the queue.

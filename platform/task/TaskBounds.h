@@ -17,7 +17,7 @@ constexpr std::size_t taskDefaultOutputBound = std::size_t{256} << 20U;  ///< by
 ADMINHOST_EXPORT void setTaskOutputBound(std::size_t bytes) noexcept;
 
 [[nodiscard]] ADMINHOST_EXPORT std::size_t taskOutputBound() noexcept;
-/// How many tools this process has started, those included that could not be started.
+/// How many tools this process has started. Those that were refused or could not be started do not count.
 [[nodiscard]] ADMINHOST_EXPORT std::uint64_t startedTasks() noexcept;
 [[nodiscard]] ADMINHOST_EXPORT std::chrono::steady_clock::time_point taskDeadline() noexcept;  ///< the maximum for none
 

@@ -194,7 +194,10 @@ class TaskGroup::RunningTask {
             !namesVariables(plan.environment) ? EINVAL : _child.start(childPlanOf(plan), plan.input.has_value());
         if (number != 0) {
             fail(std::generic_category().message(number));
-        } else if (_rest.empty()) {
+            return;
+        }
+        ++started;
+        if (_rest.empty()) {
             _child.input.close();
         }
     }
@@ -328,7 +331,6 @@ TaskGroup::TaskGroup() noexcept : _bound(taskOutputBound()) {}
 TaskGroup::~TaskGroup() = default;
 
 TaskGroup::Id TaskGroup::start(TaskPlan plan) {
-    ++started;
     _tasks.push_back(std::make_unique<RunningTask>(std::move(plan), _bound, _held));
     return _tasks.size() - 1;
 }

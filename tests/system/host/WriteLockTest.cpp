@@ -1,6 +1,7 @@
 // Two daemons at once: commands that change something wait for the lock, commands that read do not.
 
 #include "tests/support/Program.h"
+#include "tests/support/PrometheusText.h"
 #include "tests/system/host/Host.h"
 
 #include <csignal>
@@ -101,6 +102,22 @@ TEST_F(TwoDaemons, WhileAHolderIsStoppedReadsAreAnsweredAndAWriteNamesTheHolder)
     EXPECT_EQ(stopped.reply().status, 200);
     EXPECT_EQ(next.reply().status, 200);
     EXPECT_EQ(read("data"), "first\nthird\n");
+}
+
+TEST_F(TwoDaemons, ToolsOfAWriteThatWaitsForTheLockAreCounted) {
+    DaemonProcess holder(options());
+    UnixHttp held = startWrite(holder, "first");
+    DaemonProcess daemon(options());
+    UnixHttp writer = daemon.connect();
+    writer.begin("POST", "/v1/fixture/changeWithTool", "{}");  // each attempt runs one tool before it needs the lock
+    UnixHttp client = daemon.connect();
+    const auto toolRuns = [&] {
+        return parsePrometheusText(client.get("/v1/metrics").body).at("adminhost_tool_runs_total");
+    };
+    EXPECT_TRUE(eventually([&] { return toolRuns() >= 3; }, std::chrono::seconds(30))) << toolRuns();
+    go();
+    EXPECT_EQ(held.reply().status, 200);
+    EXPECT_EQ(writer.reply().status, 200);
 }
 
 TEST_F(TwoDaemons, WriteWithoutTheLockIsAnsweredAtItsDeadlineAlsoWhileAReadIsRunning) {

@@ -169,6 +169,21 @@ TEST_F(TaskGroupOf, AToolThatCannotBeStartedCostsOnlyItself) {
     EXPECT_EQ(group.collect(first).output, "1\n");
 }
 
+TEST_F(TaskGroupOf, OnlyToolsThatWereStartedAreCounted) {
+    const std::uint64_t before = startedTasks();
+    TaskGroup group;
+    TaskPlan refused = shell("exit 0");
+    refused.refusal = "not allowed";
+    EXPECT_EQ(group.collect(group.start(std::move(refused))).status, -1);
+    EXPECT_EQ(group.collect(group.start({DiskPath("/missing"), {}})).status, -1);
+    EXPECT_EQ(startedTasks(), before);
+    EXPECT_EQ(group.collect(group.start(shell("exit 1"))).status, 1);
+    EXPECT_EQ(startedTasks(), before + 1);
+    setTaskDeadline(std::chrono::steady_clock::now());
+    EXPECT_EQ(group.collect(group.start(shell("exit 0"))).status, -1);
+    EXPECT_EQ(startedTasks(), before + 1);
+}
+
 TEST_F(TaskGroupOf, TheDeadlineKillsTheToolsThatStillRunAndTheirGroupsAndKeepsTheOthersResults) {
     setTaskDeadline(std::chrono::steady_clock::now() + 500ms);
     TaskGroup group;
