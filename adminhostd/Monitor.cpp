@@ -46,6 +46,7 @@ constexpr auto longestPause = 30s;
 constexpr auto stableTime = 10s;      ///< a front that has run for so long has not died at its start
 constexpr auto overrunGrace = 5s;     ///< in which worker or front end an operation that overruns its deadline
 constexpr auto overrunInterval = 5s;  ///< at which the monitor looks for such an operation
+constexpr auto unlinkedBound = 2s;    ///< in which a front that has closed its link must have ended
 constexpr auto stopExtension = 10s;   ///< by which the service manager waits longer than a running operation may run
 constexpr int messageMaximum = 32;    ///< that are read from the front in one go
 constexpr int endingWait = 20;        ///< milliseconds for a killed worker
@@ -99,6 +100,7 @@ class Monitor {
     void kill(Worker& worker);
     bool collect(Worker& worker);
     void endOverruns();
+    void endUnlinkedFront();
     void sendToFront(const MonitorMessage& message, std::span<const int> descriptors = {});
     [[nodiscard]] int timeout() const;
 
@@ -115,6 +117,7 @@ class Monitor {
     Clock::time_point _frontSince;
     bool _served = false;  ///< a front has come so far as to ask for a worker
     std::optional<Clock::time_point> _frontDue;
+    std::optional<Clock::time_point> _frontEndBy;  ///< set once it has closed its link
     std::chrono::milliseconds _pause{0};
     std::list<Worker> _workers;
     std::vector<Wanted> _waiting;  ///< that the front has asked for, while the last front's worker is running
@@ -135,6 +138,7 @@ int Monitor::run() {
             signalled();
         }
         endOverruns();
+        endUnlinkedFront();
         extendStop();
         if (_frontDue && Clock::now() >= *_frontDue) {
             startFrontAgain();
@@ -146,6 +150,9 @@ int Monitor::run() {
 int Monitor::timeout() const {
     std::optional<Clock::time_point> due = _frontDue;
     const auto consider = [&](Clock::time_point time) { due = due ? std::min(*due, time) : time; };
+    if (_frontEndBy) {
+        consider(*_frontEndBy);
+    }
     for (const Worker& worker : _workers) {
         // A worker does not announce its operations here: those that begin later are found at the next interval.
         const auto deadline = worker.process.tools.deadline();
@@ -201,6 +208,7 @@ std::chrono::milliseconds Monitor::nextPause() {
 
 void Monitor::frontEnded(int status) {
     _front = 0;
+    _frontEndBy.reset();
     _link.close();
     _waiting.clear();
     for (Worker& worker : _workers) {
@@ -329,6 +337,7 @@ void Monitor::receive() {
         }
         if (received.kind == Kind::closed) {
             _link.close();
+            _frontEndBy = Clock::now() + unlinkedBound;
             return;
         }
         const std::uint32_t number = received.message.worker;
@@ -419,6 +428,15 @@ void Monitor::endOverruns() {
                 fmt::format("adminhostd: the worker {} has overrun its deadline, and is killed", worker.process.pid));
             kill(worker);
         }
+    }
+}
+
+/// A front closes its link only when it ends. One that goes on could neither be given workers nor be waited for.
+void Monitor::endUnlinkedFront() {
+    if (_front != 0 && _frontEndBy && Clock::now() >= *_frontEndBy) {
+        _frontEndBy.reset();
+        logEvent("adminhostd: the front has closed its link to the monitor, and is ended");
+        ::kill(_front, SIGKILL);
     }
 }
 

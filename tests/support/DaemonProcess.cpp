@@ -61,7 +61,8 @@ DaemonProcess::DaemonProcess(const Options& options) {
     std::filesystem::create_directory(_directory / "tmp");
     std::ofstream(_directory / "config") << options.configuration;
 
-    std::vector<std::string> arguments{DAEMON,  "--socket", socket(), "--config", _directory / "config",
+    const std::string program = options.program.empty() ? DAEMON : options.program;
+    std::vector<std::string> arguments{program, "--socket", socket(), "--config", _directory / "config",
                                        "--log", "stderr"};
     arguments.insert(arguments.end(), options.arguments.begin(), options.arguments.end());
     std::vector<std::string> environment = options.environment;
@@ -92,14 +93,14 @@ DaemonProcess::DaemonProcess(const Options& options) {
         const rlimit bound{options.descriptors, before.rlim_max};  // inherited, like ulimit -n in a shell
         ::setrlimit(RLIMIT_NOFILE, &bound);
     }
-    const int failure =
-        ::posix_spawn(&_pid, DAEMON, &actions, nullptr, pointersTo(arguments).data(), pointersTo(environment).data());
+    const int failure = ::posix_spawn(&_pid, program.c_str(), &actions, nullptr, pointersTo(arguments).data(),
+                                      pointersTo(environment).data());
     ::setrlimit(RLIMIT_NOFILE, &before);
     ::posix_spawn_file_actions_destroy(&actions);
     if (failure != 0) {
         _pid = -1;
         std::filesystem::remove_all(_directory);
-        throw std::runtime_error(std::string("cannot start ") + DAEMON + ": " + std::strerror(failure));
+        throw std::runtime_error("cannot start " + program + ": " + std::strerror(failure));
     }
     const auto bound = std::chrono::steady_clock::now() + patience;
     while (options.waitUntilReady) {

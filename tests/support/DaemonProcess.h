@@ -26,6 +26,7 @@ class DaemonProcess {
         std::string socket = {};                    ///< where to listen, instead of in the directory
         unsigned descriptors = 0;                   ///< how many it may have open (ulimit -n); 0: the test's own bound
         int standardError = -1;                     ///< where its log goes, instead of to a file
+        std::string program = {};                   ///< another place of the daemon's program
     };
 
     explicit DaemonProcess(const Options& options);

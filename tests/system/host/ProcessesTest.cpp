@@ -1,5 +1,6 @@
 // Monitor, front and worker: what becomes of requests when one of them ends.
 
+#include "tests/support/TemporaryRoot.h"
 #include "tests/system/host/Host.h"
 
 #include <csignal>
@@ -166,6 +167,30 @@ TEST(ProcessesWithDeadline, MonitorKillsAWorkerThatOverrunsItsDeadlineAfterItsFr
     ::kill(daemon.frontPid(), SIGKILL);
     EXPECT_TRUE(daemon.waitForLog("the worker " + std::to_string(worker) + " has overrun its deadline, and is killed"));
     EXPECT_TRUE(eventually([&] { return daemon.connect().post("/v1/fixture/nothing").status == 204; }));
+}
+
+/// The daemon with a front that closes its link, or its writing half, and ignores a stop.
+DaemonProcess::Options withUnlinkedFront(const fs::path& directory, const std::string& closes) {
+    fs::copy_file(std::string(BINARY_DIR) + "/bin/adminhostd", directory / "adminhostd");
+    fs::create_symlink(std::string(BINARY_DIR) + "/tests/fronts/fixture_unlinked_front",
+                       directory / "adminhostd-front");
+    DaemonProcess::Options options = withFixture();
+    options.program = directory / "adminhostd";
+    options.environment = {"ADMINHOST_TEST_CLOSES=" + closes};
+    options.waitUntilReady = false;
+    return options;
+}
+
+TEST(FrontThatClosesItsLink, IsEndedAndReplacedAndDoesNotHoldUpAStop) {
+    for (const std::string closes : {"all", "writing"}) {
+        const TemporaryRoot place;
+        DaemonProcess daemon(withUnlinkedFront(place.path("/"), closes));
+        EXPECT_TRUE(daemon.waitForLog("is ended")) << closes << ": " << daemon.log();
+        EXPECT_TRUE(daemon.waitForLog("the front was killed by signal 9 (Killed); the next one is started in 100 ms"))
+            << closes << ": " << daemon.log();
+        daemon.signal(SIGTERM);
+        EXPECT_EQ(daemon.wait(), 0) << closes;
+    }
 }
 
 TEST(FrontProgram, IsNotStartedByHand) {
