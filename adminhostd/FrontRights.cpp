@@ -101,7 +101,6 @@ constexpr int allowedCalls[] = {
     SCMP_SYS(close),
     SCMP_SYS(close_range),
     SCMP_SYS(dup),
-    SCMP_SYS(fcntl),
     SCMP_SYS(stat),
     SCMP_SYS(fstat),
     SCMP_SYS(lstat),
@@ -231,6 +230,10 @@ void filterSystemCalls() {
 #ifndef ADMINHOST_SANITIZED
     allow(SCMP_SYS(mprotect), {argument(2, SCMP_CMP_MASKED_EQ, PROT_EXEC, 0)});
 #endif
+    // Not F_SETOWN: with it, the kernel sends signals to other processes of the account.
+    for (const scmp_datum_t command : {F_DUPFD, F_DUPFD_CLOEXEC, F_GETFD, F_SETFD, F_GETFL, F_SETFL}) {
+        allow(SCMP_SYS(fcntl), {argument(1, SCMP_CMP_EQ, command)});
+    }
     for (const scmp_datum_t request : {TCGETS, FIONREAD, FIONBIO}) {
         allow(SCMP_SYS(ioctl), {argument(1, SCMP_CMP_EQ, request)});
     }

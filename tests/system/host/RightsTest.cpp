@@ -357,6 +357,14 @@ TEST(FrontRights, CodeInTheFrontCanSignalAndLimitNoOtherProcessOfItsAccount) {
         << "abort() needs it";
     EXPECT_EQ(attemptAsFront(
                   [&] {
+                      std::array<int, 2> ends{};
+                      return ::socketpair(AF_UNIX, SOCK_STREAM, 0, ends.data()) == 0 &&
+                             ::fcntl(ends[0], F_SETOWN, other) == 0;  // and O_ASYNC would signal it
+                  },
+                  false),
+              EPERM);
+    EXPECT_EQ(attemptAsFront(
+                  [&] {
                       rlimit bound{};
                       return ::prlimit(other, RLIMIT_NOFILE, nullptr, &bound) == 0;
                   },
