@@ -39,16 +39,6 @@ std::vector<char*> pointersTo(std::vector<std::string>& texts) {
     return pointers;
 }
 
-std::vector<pid_t> childrenOf(pid_t process) {
-    const std::string self = std::to_string(process);
-    std::ifstream file("/proc/" + self + "/task/" + self + "/children");
-    std::vector<pid_t> children;
-    for (pid_t pid = 0; file >> pid;) {
-        children.push_back(pid);
-    }
-    return children;
-}
-
 }  // namespace
 
 DaemonProcess::DaemonProcess(const Options& options) {
@@ -209,6 +199,16 @@ bool isRunning(pid_t process) {
     const std::string text = readWhole("/proc/" + std::to_string(process) + "/stat");
     const std::size_t name = text.rfind(") ");
     return name != std::string::npos && text.substr(name + 2, 1) != "Z";
+}
+
+std::vector<pid_t> childrenOf(pid_t process) {
+    const std::string self = std::to_string(process);
+    std::ifstream file("/proc/" + self + "/task/" + self + "/children");
+    std::vector<pid_t> children;
+    for (pid_t pid = 0; file >> pid;) {
+        children.push_back(pid);
+    }
+    return children;
 }
 
 std::size_t descriptorsOf(pid_t pid) {

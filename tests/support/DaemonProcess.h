@@ -69,6 +69,8 @@ class DaemonProcess {
 
 /// Returns false for a process that has ended, also if nobody has collected its status.
 [[nodiscard]] bool isRunning(pid_t process);
+/// The processes that the process's first thread has started and that have not been reaped.
+[[nodiscard]] std::vector<pid_t> childrenOf(pid_t process);
 /// Open descriptors of a process. Always 0 for a daemon if the test does not run as root.
 [[nodiscard]] std::size_t descriptorsOf(pid_t pid);
 /// Resident memory of a process in kilobytes.

@@ -75,6 +75,26 @@ TEST_F(Doctor, WorkerThatDiesLeavesTheFrontsChecks) {
     EXPECT_EQ(check("socket").text("state"), "ok");
 }
 
+TEST_F(Doctor, RunningDoctorThatIsCancelledEndsWithItsWorkerAndTheNextOneIsWhole) {
+    makePlugin("hang");
+    const std::string place = "/v1/requests/00000000-0000-0000-0000-000000000001";
+    UnixHttp doctor(daemon.socket(), std::chrono::seconds(90));
+    doctor.begin("GET", "/v1/doctor", "", {"Request-Id: 00000000-0000-0000-0000-000000000001"});
+    ASSERT_TRUE(eventually([&] {
+        const auto record = parseJson(daemon.connect().get(place).body);
+        return record && record->dictionary()->get("state") == Value("running");
+    }));
+    const pid_t worker = daemon.workerPid();
+    const HttpReply reply = daemon.connect().request("DELETE", place);
+    EXPECT_EQ(reply.status, 200) << reply.body;
+    EXPECT_EQ(dictionaryOf(reply).get("state"), Value("running"));
+    expectError(doctor.reply(), 503, "CANCELLED");
+    EXPECT_TRUE(daemon.waitForLog("was ended because its request was cancelled")) << daemon.log();
+    std::filesystem::remove(daemon.directory() / "root/fixture-diagnose-hang");
+    EXPECT_EQ(check("fixture/sample").text("state"), "warning");
+    EXPECT_NE(daemon.workerPid(), worker);
+}
+
 TEST_F(Doctor, SocketThatWasReplacedIsAFailure) {
     UnixHttp client = daemon.connect();
     std::filesystem::rename(daemon.socket(), daemon.socket() + ".old");

@@ -10,6 +10,8 @@
 
 #include <dirent.h>
 #include <gmock/gmock.h>
+#include <sys/prctl.h>
+#include <unistd.h>
 
 namespace adminhost::test {
 namespace {
@@ -80,15 +82,17 @@ class PluginLoading : public ::testing::Test {
     fs::path directory;
 };
 
-/// Processes whose command line holds the text.
-std::vector<std::string> processesWith(const std::string& text) {
+/// The descendants of a process whose command line holds the text.
+std::vector<std::string> descendantsWith(const std::string& text, pid_t process) {
     std::vector<std::string> found;
-    for (const auto& entry : fs::directory_iterator("/proc")) {
-        std::ifstream file(entry.path() / "cmdline");
+    for (const pid_t child : childrenOf(process)) {
+        std::ifstream file("/proc/" + std::to_string(child) + "/cmdline");
         const std::string line{std::istreambuf_iterator<char>(file), {}};
         if (line.find(text) != std::string::npos) {
             found.push_back(line);
         }
+        const std::vector<std::string> further = descendantsWith(text, child);
+        found.insert(found.end(), further.begin(), further.end());
     }
     return found;
 }
@@ -102,6 +106,7 @@ TEST_F(PluginLoading, CheckNamesEveryBadFileAndWhatIsWrongWithIt) {
 }
 
 TEST_F(PluginLoading, LogNamesEveryBadFileAndTheOthersAreServed) {
+    ASSERT_EQ(::prctl(PR_SET_CHILD_SUBREAPER, 1), 0);  // a trial that has lost its parent stays a descendant
     const DaemonProcess daemon({all(), "", {}});
     EXPECT_EQ(daemon.connect().post("/v1/fixture/echo", "{}").status, 200);
     const std::string log = daemon.log();
@@ -109,7 +114,9 @@ TEST_F(PluginLoading, LogNamesEveryBadFileAndTheOthersAreServed) {
         EXPECT_THAT(log, HasSubstr("adminhostd: a plug-in is refused: " + pluginFile(file.name) + file.expected));
     }
     EXPECT_THAT(log, HasSubstr("serves with the plug-ins fixture\n"));
-    EXPECT_THAT(processesWith("--try"), ::testing::IsEmpty()) << "no trial is left";
+    EXPECT_THAT(descendantsWith("adminhostd-worker", ::getpid()), ::testing::SizeIs(1)) << "of the daemon";
+    EXPECT_THAT(descendantsWith("--try", ::getpid()), ::testing::IsEmpty()) << "no trial is left";
+    ::prctl(PR_SET_CHILD_SUBREAPER, 0);
 }
 
 TEST_F(PluginLoading, FileThatIsNotAPluginIsRefused) {
