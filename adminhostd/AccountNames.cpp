@@ -17,6 +17,11 @@ bool sameContent(const struct stat& a, const struct stat& b) {
 }  // namespace
 
 void AccountNames::readIfChanged() {
+    const auto time = std::chrono::steady_clock::now();
+    if (time < _lookFrom) {
+        return;
+    }
+    _lookFrom = time + _pause;
     struct stat now {};
     if (::stat(_file.c_str(), &now) != 0) {
         _names.clear();

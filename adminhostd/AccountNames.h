@@ -2,6 +2,7 @@
 
 // The names of accounts, for messages and for the log.
 
+#include <chrono>
 #include <cstddef>
 #include <map>
 #include <string>
@@ -11,13 +12,14 @@
 
 namespace adminhost {
 
-/// The names in the password file of this machine, which is read again when it has changed. No directory service is
-/// asked: the front must not wait for one. Accounts of other sources have no name here.
+/// The names in the password file of this machine, which is read again when it has changed; this is looked for once a
+/// second. No directory service is asked: the front must not wait for one. Accounts of other sources have no name here.
 class AccountNames {
   public:
     static constexpr std::size_t maximum = 100'000;  ///< names that are kept
 
-    explicit AccountNames(std::string file = "/etc/passwd") : _file(std::move(file)) {}
+    explicit AccountNames(std::string file = "/etc/passwd", std::chrono::milliseconds pause = std::chrono::seconds(1))
+        : _file(std::move(file)), _pause(pause) {}
 
     /// Empty if the account is not in the file, or if the file cannot be read.
     [[nodiscard]] const std::string& of(uid_t uid);
@@ -26,6 +28,8 @@ class AccountNames {
     void readIfChanged();
 
     std::string _file;
+    std::chrono::milliseconds _pause;
+    std::chrono::steady_clock::time_point _lookFrom;
     std::map<uid_t, std::string> _names;
     struct stat _seen {};
 };

@@ -61,7 +61,7 @@ class Daemon {
                 return;
             }
             wait();
-            _front.queue().run(_entries);
+            const bool conversed = _front.queue().run(_entries);
             _front.events().run();
             if (_signalled || _monitor.closed()) {
                 stop();
@@ -69,9 +69,9 @@ class Daemon {
             if (const auto configuration = _monitor.takeConfiguration(); configuration && !_stopping) {
                 reload(*configuration);
             }
-            if (_server) {
-                _server->run();
-                clearUnusedStack();  // of what has been served in this turn
+            const bool readBody = _server && _server->run(_entries);
+            if (conversed || readBody) {
+                clearUnusedStack();  // which may hold parts of requests and answers
             }
         }
     }

@@ -111,6 +111,7 @@ std::vector<protocol::RefusedPlugin> Front::refusedPlugins() const {
 
 void Front::welcome(protocol::Hello hello) {
     _hello = std::move(hello);
+    ++_hellos;
     for (const protocol::RefusedPlugin& plugin : refusedPlugins()) {
         logEvent(fmt::format("adminhostd: a plug-in is refused: {}", plugin.reason));
     }
@@ -342,7 +343,7 @@ void Front::serve(Exchange& exchange, const Target& target) {
             return;
         case Target::Kind::overview:
         case Target::Kind::unknown:
-            exchange.answer(overview());
+            exchange.answer(overview(exchange));
             return;
     }
 }

@@ -13,11 +13,16 @@
 #include "adminhostd/RequestLog.h"
 #include "adminhostd/Target.h"
 
+#include <chrono>
+#include <cstddef>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <variant>
 #include <vector>
+
+#include <sys/types.h>
 
 namespace adminhost {
 
@@ -66,7 +71,8 @@ class Front {
     [[nodiscard]] std::optional<HttpAnswer> refusal(const Exchange& exchange, const Target& target) const;
     void serve(Exchange& exchange, const Target& target);
     HttpAnswer cancel(const Peer& peer, const RequestRecord& record);
-    [[nodiscard]] HttpAnswer overview() const;
+    [[nodiscard]] HttpAnswer overview(const Exchange& exchange);
+    [[nodiscard]] Dictionary overviewNow() const;
     [[nodiscard]] HttpAnswer metrics() const;
     void operation(Exchange& exchange, const Target& target);
     /// Passes on a request that the worker serves without an operation of a plug-in.
@@ -88,6 +94,17 @@ class Front {
     /// Sends an operation's answer and logs its end.
     void end(const Operation& operation, HttpAnswer answer, std::string_view code);
 
+    /// What the overview depends on while no operation runs.
+    struct OverviewState {
+        unsigned long hellos = 0;
+        std::chrono::milliseconds deadline{};
+        std::size_t waiting = 0;
+        std::optional<std::string> workerProblem = {};
+        std::optional<pid_t> workerPid = {};
+
+        bool operator==(const OverviewState&) const = default;
+    };
+
     FrontChecks _checks;
     BodyBounds _bodyBounds;
     Permissions _permissions;
@@ -97,6 +114,9 @@ class Front {
     Metrics _metrics;
     OwnMemory _memory;
     std::optional<protocol::Hello> _hello;  ///< of the latest worker
+    unsigned long _hellos = 0;
+    OverviewState _overviewState;
+    std::shared_ptr<const std::string> _overviewText;  ///< of that state; null at first
     OperationQueue _queue;
 };
 

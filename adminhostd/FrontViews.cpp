@@ -3,6 +3,7 @@
 #include "adminhostd/Front.h"
 #include "adminhostd/FrontAnswers.h"
 #include "platform/framework/Release.h"
+#include "platform/json/Json.h"
 
 #include <string>
 #include <string_view>
@@ -63,7 +64,22 @@ Array describe(const std::vector<Command>& commands) {
     return described;
 }
 
-HttpAnswer Front::overview() const {
+HttpAnswer Front::overview(const Exchange& exchange) {
+    if (_queue.running() != nullptr || exchange.wantsPropertyList()) {
+        return {200, overviewNow(), {}};
+    }
+    // Monitoring asks for it again and again, and in an idle daemon nothing of it changes.
+    OverviewState now{_hellos, _queue.deadline(), _queue.waiting(), _queue.workerProblem(), _queue.workerPid()};
+    if (!_overviewText || now != _overviewState) {
+        _overviewText = std::make_shared<const std::string>(jsonOf(overviewNow()) + '\n');
+        _overviewState = std::move(now);
+    }
+    HttpAnswer answer;
+    answer.text = AnswerText{_overviewText};
+    return answer;
+}
+
+Dictionary Front::overviewNow() const {
     Array plugins;
     if (_hello) {
         for (const protocol::OfferedPlugin& plugin : _hello->plugins) {
@@ -97,7 +113,7 @@ HttpAnswer Front::overview() const {
     if (const auto pid = _queue.workerPid()) {
         text.set("workerPid", *pid);
     }
-    return {200, std::move(text), {}};
+    return text;
 }
 
 HttpAnswer Front::metrics() const {

@@ -1,6 +1,7 @@
 #include "adminhostd/Http.h"
 
 #include "adminhostd/HttpHead.h"
+#include "adminhostd/Polled.h"
 #include "adminhostd/RequestBody.h"
 #include "platform/framework/PluginRequestHandler.h"
 #include "platform/json/Json.h"
@@ -25,14 +26,15 @@ namespace {
 using namespace std::chrono_literals;
 
 constexpr int acceptedAtOnce = 64;  ///< connections in one turn, so that a flood of them does not hold up the others
-constexpr auto shortagePause = 1s;  ///< until the next try when no descriptor is free
-constexpr auto logPause = 60s;      ///< between two events about the same kind of refusal
+constexpr auto slowClientsPause = 100ms;                    ///< between two looks for slow clients
+constexpr auto shortagePause = 1s;                          ///< until the next try when no descriptor is free
+constexpr auto logPause = 60s;                              ///< between two events about the same kind of refusal
 constexpr std::size_t answerPiece = std::size_t{1} << 20U;  ///< bytes that a client has the time-out to read
 /// Freed buffers of at least this size are worth returning to the system.
 constexpr std::size_t largeBuffer = std::size_t{1} << 20U;
 /// What the library keeps of a request beside its head. A head that exceeds the bound by no more than this is answered
 /// like any other error, a longer one by the library itself.
-constexpr std::size_t headReserve = std::size_t{32} << 10U;
+constexpr std::size_t headReserve = std::size_t{16} << 10U;
 /// A body of unknown length that exceeds the bound is read and dropped up to so many times this size, so that the
 /// client gets its answer.
 constexpr std::size_t discardFactor = 4;
@@ -104,6 +106,7 @@ void Exchange::answer(HttpAnswer answer) {
     _answer = std::move(answer);
     if (_suspended) {
         _suspended = false;
+        _server._resumed = true;
         ::MHD_resume_connection(_connection);
     }
 }
@@ -190,6 +193,9 @@ void HttpServer::addTo(std::vector<pollfd>& entries) const {
 }
 
 std::optional<int> HttpServer::timeout() const {
+    if (_resumed) {
+        return 0;
+    }
     MHD_UNSIGNED_LONG_LONG milliseconds = 0;
     std::optional<int> timeout;
     if (::MHD_get_timeout(_daemon, &milliseconds) == MHD_YES) {
@@ -199,18 +205,34 @@ std::optional<int> HttpServer::timeout() const {
     return _clients.empty() && !_acceptAfter ? timeout : std::min(timeout.value_or(1000), 1000);
 }
 
-void HttpServer::run() {
-    dropSlowClients();
-    if (_acceptAfter && Clock::now() >= *_acceptAfter) {
+bool HttpServer::libraryIsDue() const {
+    MHD_UNSIGNED_LONG_LONG milliseconds = 0;
+    return ::MHD_get_timeout(_daemon, &milliseconds) == MHD_YES && milliseconds == 0;
+}
+
+bool HttpServer::run(std::span<const pollfd> polled) {
+    _readBody = false;
+    const auto now = Clock::now();
+    if (now >= _slowClientsDue) {
+        dropSlowClients(now);
+        _slowClientsDue = now + slowClientsPause;
+    }
+    if (_acceptAfter && now >= *_acceptAfter) {
         _acceptAfter.reset();
     }
-    ::MHD_run(_daemon);
-    accept();
+    // Each of these asks the system once more, which costs as much as serving a small request.
+    if (std::exchange(_resumed, false) || isReady(polled, _descriptor) || libraryIsDue()) {
+        ::MHD_run(_daemon);
+    }
+    if (isReady(polled, _listener.get())) {
+        accept();
+    }
     if (_returnMemory) {
         // The allocator keeps freed memory below anything that is still in use: after large answers, most of it.
         ::malloc_trim(0);
         _returnMemory = false;
     }
+    return _readBody;
 }
 
 void HttpServer::accept() {
@@ -247,7 +269,8 @@ bool HttpServer::acceptOne() {
         }
     }
     try {
-        _clients.push_back({socket.get(), peerOf(socket.get(), credentials), true, Clock::now()});
+        _clients.push_back(
+            {socket.get(), std::make_shared<const Peer>(peerOf(socket.get(), credentials)), true, Clock::now()});
     } catch (...) {
         _limits.remove(credentials.uid);
         throw;
@@ -284,7 +307,7 @@ void HttpServer::refuse(int socket, uid_t uid) {
 }
 
 void HttpServer::closed(const Client& client) noexcept {
-    _limits.remove(client.peer.uid);
+    _limits.remove(client.peer->uid);
     _clients.remove_if([&](const Client& other) { return &other == &client; });
     _acceptAfter.reset();  // its descriptor is about to be free
 }
@@ -294,9 +317,8 @@ HttpServer::Client* HttpServer::clientOf(MHD_Connection* connection) {
     return info == nullptr ? nullptr : static_cast<Client*>(info->socket_context);
 }
 
-void HttpServer::dropSlowClients() {
+void HttpServer::dropSlowClients(Clock::time_point now) {
     // The library only bounds silence; a client that sends one byte every few seconds would hold a connection for ever.
-    const auto now = Clock::now();
     for (Client& client : _clients) {
         if ((client.receiving && now - client.since > _bounds.clientTimeout) ||
             (client.readBy && now > *client.readBy)) {
@@ -309,15 +331,14 @@ void HttpServer::dropSlowClients() {
 
 int HttpServer::begin(MHD_Connection* connection, const char* url, const char* method, const char* version,
                       Exchange** place) {
-    auto exchange = std::unique_ptr<Exchange>(new Exchange);
+    auto exchange = std::unique_ptr<Exchange>(new Exchange(*this));
     exchange->_connection = connection;
     exchange->_id = fmt::format("{}-{}", _idPrefix, ++_idCount);
     exchange->_method = method;
     exchange->_path = pathOf(url);
-    if (const Client* client = clientOf(connection)) {
-        exchange->_peer = client->peer;
-        exchange->_socket = client->socket;
-    }
+    const Client* client = clientOf(connection);
+    exchange->_peer = client != nullptr ? client->peer : std::make_shared<const Peer>();
+    exchange->_socket = client != nullptr ? client->socket : -1;
     *place = exchange.release();
     ++_open;
     Exchange& begun = **place;
@@ -353,6 +374,7 @@ int HttpServer::access(MHD_Connection* connection, const char* url, const char* 
     Exchange& exchange = **place;
     if (*size > 0) {
         exchange._received += *size;
+        _readBody = true;
         if (exchange._received > exchange._bodyMaximum) {
             exchange.dropBody();
             exchange._refusal = bodyTooLarge(exchange._bodyMaximum);

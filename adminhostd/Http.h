@@ -15,6 +15,7 @@
 #include <list>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -47,6 +48,8 @@ struct HttpAnswer {
     std::optional<AnswerText> text = std::nullopt;  ///< sent as it is, instead of a body
 };
 
+class HttpServer;
+
 /// One request and the place for its answer. Owned by the server; alive until it has been answered.
 class Exchange {
   public:
@@ -54,7 +57,7 @@ class Exchange {
     Exchange& operator=(const Exchange&) = delete;
 
     [[nodiscard]] const std::string& id() const noexcept { return _id; }
-    [[nodiscard]] const Peer& peer() const noexcept { return _peer; }
+    [[nodiscard]] const Peer& peer() const noexcept { return *_peer; }
     [[nodiscard]] const std::string& method() const noexcept { return _method; }
     [[nodiscard]] const std::string& path() const noexcept { return _path; }  ///< decoded, without the query
     [[nodiscard]] const std::string& body() const noexcept { return _body; }
@@ -79,13 +82,14 @@ class Exchange {
     void answer(HttpAnswer answer);
 
   private:
-    friend class HttpServer;
-    Exchange() = default;
+    friend HttpServer;
+    explicit Exchange(HttpServer& server) noexcept : _server(server) {}
 
+    HttpServer& _server;
     MHD_Connection* _connection = nullptr;
     int _socket = -1;
     std::string _id;
-    Peer _peer;
+    std::shared_ptr<const Peer> _peer;
     std::string _method;
     std::string _path;
     std::string _body;
@@ -122,8 +126,9 @@ class HttpServer {
     void addTo(std::vector<pollfd>& entries) const;
     /// Milliseconds until run() must be called; nullopt if there is no limit.
     [[nodiscard]] std::optional<int> timeout() const;
-    /// Accepts, reads, serves and sends everything that needs no waiting.
-    void run();
+    /// Accepts, reads, serves and sends everything that needs no waiting. Called after a poll of these entries. Returns
+    /// true if it has read of a request's body, which may hold a secret.
+    [[nodiscard]] bool run(std::span<const pollfd> polled);
     /// Changes the bound on bodies, for requests whose heads arrive from now on. The others are fixed at the start.
     void setBodyMaximum(std::size_t bytes) noexcept { _bounds.bodyBytes = bytes; }
     /// Closes the listening socket: accepts no further connection.
@@ -132,10 +137,11 @@ class HttpServer {
     [[nodiscard]] std::size_t open() const noexcept { return _open; }
 
   private:
+    friend Exchange;
     using Clock = std::chrono::steady_clock;
     struct Client {
         int socket;
-        Peer peer;
+        std::shared_ptr<const Peer> peer;
         bool receiving;
         Clock::time_point since;
         std::optional<Clock::time_point> readBy = {};  ///< while an answer is sent: when it must have been read
@@ -151,7 +157,8 @@ class HttpServer {
     void accept();
     bool acceptOne();
     void refuse(int socket, uid_t uid);
-    void dropSlowClients();
+    [[nodiscard]] bool libraryIsDue() const;
+    void dropSlowClients(Clock::time_point now);
     void dropOldAnswers(const Exchange& newest);
     void forgetAnswer(Exchange& exchange) noexcept;
     void closed(const Client& client) noexcept;
@@ -163,6 +170,7 @@ class HttpServer {
     int _descriptor = -1;  ///< the library's: readable when it has something to do
     ConnectionLimits _limits;
     std::list<Client> _clients;
+    Clock::time_point _slowClientsDue;              ///< when slow clients are looked for again
     std::optional<Clock::time_point> _acceptAfter;  ///< set while no descriptor is free
     std::optional<Clock::time_point> _refusalLogged;
     std::optional<Clock::time_point> _shortageLogged;
@@ -170,6 +178,8 @@ class HttpServer {
     std::list<Exchange*> _sending;  ///< whose answers count as unread, the oldest first
     std::size_t _unread = 0;        ///< their bytes
     bool _returnMemory = false;     ///< large buffers have been freed
+    bool _readBody = false;         ///< in this run
+    bool _resumed = false;          ///< an answer has come that the library has to send
     std::string _idPrefix;
     unsigned long _idCount = 0;
 };

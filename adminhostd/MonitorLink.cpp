@@ -1,5 +1,7 @@
 #include "adminhostd/MonitorLink.h"
 
+#include "adminhostd/Polled.h"
+
 #include <cerrno>
 #include <utility>
 
@@ -23,7 +25,10 @@ void MonitorLink::kill(std::uint32_t worker) noexcept {
     static_cast<void>(sendMonitorMessage(_socket.get(), {MonitorMessage::Kind::kill, worker, 0, 0}));
 }
 
-void MonitorLink::run() {
+void MonitorLink::run(std::span<const pollfd> polled) {
+    if (!isReady(polled, _socket.get())) {
+        return;
+    }
     while (!closed()) {
         ReceivedMessage received = receiveMonitorMessage(_socket.get());
         if (received.kind == ReceivedMessage::Kind::none) {

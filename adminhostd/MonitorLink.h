@@ -46,8 +46,8 @@ class MonitorLink {
     [[nodiscard]] bool closed() const noexcept { return !_socket.isOpen(); }
 
     void addTo(std::vector<pollfd>& entries) const { entries.push_back({_socket.get(), POLLIN, 0}); }
-    /// Passes on everything that has arrived. Does not wait.
-    void run();
+    /// Passes on everything that has arrived, if the poll of these entries has found something. Does not wait.
+    void run(std::span<const pollfd> polled);
 
   private:
     FileDescriptor _socket;

@@ -119,12 +119,10 @@ void OperationQueue::failWaiting(Unserved::Reason reason, const std::string& mes
     }
 }
 
-void OperationQueue::run(std::span<const pollfd> polled) {
-    _monitor.run();
+bool OperationQueue::run(std::span<const pollfd> polled) {
+    _monitor.run(polled);
     noteStart();
-    if (_worker) {
-        converse(polled);
-    }
+    const bool conversed = _worker && converse(polled);
     if (_state == State::idle && !sendRecorded()) {
         endWorker("could not be sent which ends have been logged");
     }
@@ -133,6 +131,7 @@ void OperationQueue::run(std::span<const pollfd> polled) {
         timeUp();
     }
     giveUpWaiting();
+    return conversed;
 }
 
 void OperationQueue::giveUpWaiting() {
@@ -155,11 +154,11 @@ void OperationQueue::giveUpWaiting() {
     }
 }
 
-void OperationQueue::converse(std::span<const pollfd> polled) {
+bool OperationQueue::converse(std::span<const pollfd> polled) {
     // Checked first: then everything that the worker sent before its end is still read below.
     const bool ended = _worker->ending().has_value();
     if (!ended && !_worker->mayConverse(polled)) {
-        return;
+        return false;
     }
     const unsigned long asked = _starts;
     const auto same = [&] { return _worker && _starts == asked; };
@@ -177,6 +176,7 @@ void OperationQueue::converse(std::span<const pollfd> polled) {
         const std::string how = *_worker->ending();  // a copy, because the worker is destroyed below
         workerEnded(how);
     }
+    return true;
 }
 
 void OperationQueue::receive(Frame frame) {

@@ -107,8 +107,8 @@ class OperationQueue {
     void addTo(std::vector<pollfd>& entries) const;
     [[nodiscard]] std::optional<std::chrono::steady_clock::time_point> due() const;
     /// Does everything that needs no waiting. Called after a poll of these entries, to which addTo() has added the
-    /// queue's.
-    void run(std::span<const pollfd> polled);
+    /// queue's. Returns true if the worker has sent something.
+    bool run(std::span<const pollfd> polled);
 
   private:
     using Clock = std::chrono::steady_clock;
@@ -117,7 +117,7 @@ class OperationQueue {
     void start();
     void noteStart();
     void startFailed(const std::string& reason);
-    void converse(std::span<const pollfd> polled);
+    [[nodiscard]] bool converse(std::span<const pollfd> polled);
     void receive(Frame frame);
     /// Each returns true if the message was expected.
     bool take(protocol::Hello hello);

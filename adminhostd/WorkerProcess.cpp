@@ -1,8 +1,8 @@
 #include "adminhostd/WorkerProcess.h"
 
+#include "adminhostd/Polled.h"
 #include "adminhostd/WorkerStart.h"
 
-#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <utility>
@@ -16,11 +16,6 @@ namespace {
 
 /// Bytes that are read in one go. A worker that sends without end must not keep the front from its clients.
 constexpr std::size_t readMaximum = std::size_t{1} << 20U;
-
-bool isReady(std::span<const pollfd> polled, int descriptor) noexcept {
-    return std::any_of(polled.begin(), polled.end(),
-                       [&](const pollfd& entry) { return entry.fd == descriptor && entry.revents != 0; });
-}
 
 }  // namespace
 

@@ -79,12 +79,13 @@ class Server {
     /// Runs until nothing is left to do without waiting for the client.
     void settle() {
         for (;;) {
-            _server->run();
             std::vector<pollfd> entries;
             _server->addTo(entries);
-            if (::poll(entries.data(), entries.size(), 0) <= 0) {
+            const bool ready = ::poll(entries.data(), entries.size(), 0) > 0;
+            if (!ready && _server->timeout() != 0) {
                 return;
             }
+            static_cast<void>(_server->run(entries));
         }
     }
 

@@ -39,17 +39,26 @@ std::string journalDatagramOf(std::string_view message, const LogFields& fields)
     return datagram;
 }
 
+bool JournalSocket::connect() {
+    const auto now = std::chrono::steady_clock::now();
+    if (now < _lookFrom) {
+        return false;
+    }
+    _socket = datagramSocketTo(_path);
+    if (!_socket.isOpen()) {
+        _lookFrom = now + _pause;
+    }
+    return _socket.isOpen();
+}
+
 JournalSocket::Sent JournalSocket::send(const std::string& datagram) {
     if (datagram.size() > entryMaximum) {
         return Sent::never;
     }
     // A second try for a journal that was restarted.
     for (int tries = 0; tries < 2; ++tries) {
-        if (!_socket.isOpen()) {
-            _socket = datagramSocketTo(_path);
-            if (!_socket.isOpen()) {
-                return Sent::nobodyListens;
-            }
+        if (!_socket.isOpen() && !connect()) {
+            return Sent::nobodyListens;
         }
         if (::send(_socket.get(), datagram.data(), datagram.size(), MSG_DONTWAIT | MSG_NOSIGNAL) >= 0) {
             return Sent::yes;

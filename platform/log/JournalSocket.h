@@ -6,6 +6,7 @@
 #include "platform/framework/Export.h"
 #include "platform/log/Log.h"
 
+#include <chrono>
 #include <cstddef>
 #include <deque>
 #include <mutex>
@@ -21,7 +22,9 @@ class ADMINHOST_EXPORT JournalSocket {
     static constexpr std::size_t queueMaximum = std::size_t{1} << 20U;    ///< bytes
     static constexpr std::size_t entryMaximum = std::size_t{128} << 10U;  ///< bytes; the socket accepts some more
 
-    explicit JournalSocket(std::string path) : _path(std::move(path)) {}
+    /// `pause`: while no journal listens, it is looked for once in this time.
+    explicit JournalSocket(std::string path, std::chrono::milliseconds pause = std::chrono::seconds(1))
+        : _path(std::move(path)), _pause(pause) {}
 
     /// Writes or queues an entry. Returns false if no journal listens at the path; then the entry is not lost, but the
     /// caller's.
@@ -35,12 +38,15 @@ class ADMINHOST_EXPORT JournalSocket {
 
   private:
     enum class Sent { yes, later, never, nobodyListens };
+    [[nodiscard]] bool connect();
     [[nodiscard]] Sent send(const std::string& datagram);
     [[nodiscard]] bool drain();
 
     std::string _path;
     mutable std::mutex _mutex;
     FileDescriptor _socket;
+    std::chrono::milliseconds _pause;
+    std::chrono::steady_clock::time_point _lookFrom;  ///< when the journal is looked for again
     std::deque<std::string> _queue;
     std::size_t _bytes = 0;
     std::size_t _lost = 0;

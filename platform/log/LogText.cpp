@@ -1,6 +1,8 @@
 #include "platform/log/Log.h"
 #include "platform/text/Utf8.h"
 
+#include <algorithm>
+
 #include <fmt/format.h>
 
 namespace adminhost {
@@ -30,6 +32,9 @@ void append(std::string& text, std::string_view bytes, const Utf8Character& char
 
 std::string logTextOf(std::string_view event) {
     event = event.substr(0, event.find_last_not_of('\n') + 1);
+    if (std::all_of(event.begin(), event.end(), [](char c) { return c >= 0x20 && c < 0x7f; })) {
+        return std::string(event);  // almost always
+    }
     std::string text;
     text.reserve(event.size() + 1);
     while (!event.empty()) {

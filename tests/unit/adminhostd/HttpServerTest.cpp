@@ -58,7 +58,7 @@ class Server : public ::testing::Test {
             std::vector<pollfd> entries;
             server.addTo(entries);
             ::poll(entries.data(), entries.size(), 10);
-            server.run();
+            static_cast<void>(server.run(entries));
         }
     }
     [[nodiscard]] bool accepting() const {

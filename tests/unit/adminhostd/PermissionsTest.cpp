@@ -150,7 +150,7 @@ TEST(Permissions, EachAccessClassOfCommandsHasARightOfItsName) {
 TEST(AccountNames, FollowTheFileAndAreEmptyForOthers) {
     const test::TemporaryRoot root;
     root.write("/passwd", "anna:x:5:5::/:/bin/sh\nalias:x:5:5::/:/bin/sh\nnot a line\nbert:x:6:6::/:/bin/sh\n");
-    AccountNames names(root.path("/passwd"));
+    AccountNames names(root.path("/passwd"), std::chrono::milliseconds(0));
     EXPECT_EQ(names.of(5), "anna");
     EXPECT_EQ(names.of(6), "bert");
     EXPECT_EQ(names.of(7), "");

@@ -314,7 +314,7 @@ TEST_F(SystemLogSocket, TextThatIsTooLongIsCutBetweenCharacters) {
 /// The journal's end of its socket is the same kind of socket.
 class JournalEnd : public SystemLogSocket {
   protected:
-    JournalSocket journal{path()};
+    JournalSocket journal{path(), std::chrono::milliseconds(0)};
 };
 
 TEST_F(JournalEnd, EntryIsOneDatagramWithItsFields) {
@@ -358,6 +358,16 @@ TEST_F(JournalEnd, RestartedJournalIsFoundAgainAndAMissingOneLeavesTheEntryToThe
     EXPECT_TRUE(journal.write("three", {}));
     EXPECT_THAT(message().value_or(""), testing::StartsWith("MESSAGE=three\n"));
     EXPECT_EQ(journal.lostInTotal(), 0U);
+}
+
+TEST_F(JournalEnd, MissingJournalIsLookedForAgainAfterAPauseOnly) {
+    JournalSocket patient(path(), std::chrono::hours(1));
+    ::close(socket);
+    EXPECT_FALSE(patient.write("one", {}));
+    listen();
+    EXPECT_FALSE(patient.write("two", {}));
+    EXPECT_TRUE(JournalSocket(path()).write("three", {}));
+    EXPECT_TRUE(journal.write("four", {}));
 }
 
 TEST_F(JournalEnd, EntryThatIsTooLargeIsLostAndCounted) {
