@@ -285,7 +285,7 @@ constexpr std::array table = {
          {{"history --since yesterday", "--format json history --user anna --key server_port"}}},
     Verb{"rollback",
          "NUMBER [--dry-run]",
-         "Restore what a change of the history has changed",
+         "Restore the state before a change of the history",
          1,
          1,
          &rollback,

@@ -438,7 +438,7 @@ ExitStatus history(const Context& context, std::span<const std::string>) {
     }
     context.out << table.text(context.options.width, 0) << '\n';
     for (const std::string& line :
-         wrapped("adminhostctl rollback NUMBER restores what that change has changed; --dry-run shows it.",
+         wrapped("adminhostctl rollback NUMBER restores the state before that change; --dry-run shows how.",
                  context.options.width)) {
         context.out << line << '\n';
     }
