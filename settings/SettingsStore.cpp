@@ -16,7 +16,6 @@ namespace lumio {
 
 using adminhost::Dictionary;
 using adminhost::HostPath;
-using adminhost::Value;
 
 namespace {
 
