@@ -6,6 +6,11 @@ target_compile_options(room_options INTERFACE
     -Wall -Wextra -Wpedantic -Werror -Wshadow -Wnon-virtual-dtor -Wold-style-cast -Woverloaded-virtual
     -Wformat=2 -Wundef -fstack-protector-strong)
 target_link_options(room_options INTERFACE -Wl,-z,relro,-z,now -Wl,--as-needed)
+# For targets whose files are compiled together, and see each other's names. Linked last, because it takes back a warning.
+add_library(compiled_together INTERFACE)
+if(ADMINHOST_TOGETHER)
+    target_compile_options(compiled_together INTERFACE -Wno-shadow)
+endif()
 if(ADMINHOST_SANITIZE)
     # Instrumented code hides from GCC what is initialised; clang has no such warning.
     target_compile_options(room_options INTERFACE $<$<CXX_COMPILER_ID:GNU>:-Wno-maybe-uninitialized>)

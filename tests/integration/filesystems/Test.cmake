@@ -1,1 +1,2 @@
 set(TEST_LIBS handler host)
+set(TEST_ALONE SharedFileSystemTest.cpp)

@@ -1,1 +1,2 @@
 set(TEST_LIBS krb5)
+set(TEST_COST 25)

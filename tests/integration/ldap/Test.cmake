@@ -1,3 +1,5 @@
 find_package(OpenSSL REQUIRED)
 pkg_check_modules(LDAP REQUIRED IMPORTED_TARGET ldap lber)
 set(TEST_LIBS OpenSSL::Crypto PkgConfig::LDAP)
+set(TEST_COST 11)
+set(TEST_ALONE OddServersTest.cpp)

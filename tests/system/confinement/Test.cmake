@@ -1,2 +1,3 @@
 set(TEST_LIBS host)
 set(TEST_DEPENDS adminhostd adminhostctl adminhost_lumio)
+set(TEST_COST 9)

@@ -1,1 +1,2 @@
 set(TEST_LIBS handler commands)
+set(TEST_ALONE ReadSettingsTest.cpp RefusedRequestsTest.cpp)

@@ -1,1 +1,2 @@
 set(TEST_LIBS handler)
+set(TEST_ALONE StatementBatchTest.cpp)

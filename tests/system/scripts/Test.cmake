@@ -1,0 +1,1 @@
+set(TEST_COST 8)

@@ -1,0 +1,1 @@
+set(TEST_ALONE TaskGroupTest.cpp)
