@@ -167,10 +167,10 @@ void offerArgument(const Context& context, const Verb& verb, std::span<const std
 CompletionTarget completionTarget(std::span<const std::string> words) {
     CompletionTarget target;
     for (std::size_t i = 0; i < words.size(); ++i) {
-        for (const auto& [name, place] :
-             {std::pair<std::string, std::optional<std::string>*>{"--socket", &target.socket},
-              {"--languages", &target.languages},
-              {"--timeout", &target.timeout}}) {
+        for (const auto& [name, place] : {std::pair<std::string, std::optional<std::string>*>{"--host", &target.host},
+                                          {"--socket", &target.socket},
+                                          {"--languages", &target.languages},
+                                          {"--timeout", &target.timeout}}) {
             if (words[i] == name && i + 1 < words.size()) {
                 *place = words[i + 1];
             } else if (words[i].starts_with(name + '=')) {

@@ -14,6 +14,7 @@ namespace adminhost::ctl {
 
 /// The options on the command line that is being completed which say what daemon to ask, and how.
 struct CompletionTarget {
+    std::optional<std::string> host;
     std::optional<std::string> socket;
     std::optional<std::string> languages;
     std::optional<std::string> timeout;

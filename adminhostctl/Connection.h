@@ -1,8 +1,9 @@
 #pragma once
 
-// HTTP over the daemon's Unix socket.
+// HTTP over the daemon's Unix socket, or over ssh to the one of another machine.
 
 #include "adminhostctl/Failure.h"
+#include "adminhostctl/RemoteHost.h"
 
 #include <chrono>
 #include <memory>
@@ -39,12 +40,13 @@ struct PostHeaders {
 class Connection {
   public:
     explicit Connection(std::string socketPath);
+    /// To the daemon of another machine. Further failures are those of RemoteHost::connect().
+    explicit Connection(std::unique_ptr<RemoteHost> host);
     ~Connection();
     Connection(Connection&&) noexcept;
-    Connection& operator=(Connection&&) noexcept;
 
     /// The path is the address below "http://host", each of its segments already escaped. The timeout is that of the
-    /// whole exchange.
+    /// whole exchange, without the time of a login that may ask for a password.
     [[nodiscard]] DaemonReply get(const std::string& path, std::chrono::milliseconds timeout);
     /// The same with the method DELETE.
     [[nodiscard]] DaemonReply remove(const std::string& path, std::chrono::milliseconds timeout);
@@ -52,17 +54,32 @@ class Connection {
     [[nodiscard]] DaemonReply post(const std::string& path, const std::string& body, std::chrono::milliseconds timeout,
                                    const PostHeaders& headers = {});
 
-    [[nodiscard]] const std::string& socketPath() const noexcept { return _socketPath; }
+    /// The path of the daemon's socket, or the host on which the daemon is running.
+    [[nodiscard]] const std::string& place() const noexcept { return _host ? _host->host() : _socketPath; }
+    [[nodiscard]] bool isRemote() const noexcept { return _host != nullptr; }
+    /// How long logins have taken so far that may have asked for a password. No timeout has counted it.
+    [[nodiscard]] std::chrono::steady_clock::duration loginTime() const noexcept { return _loginTime; }
     /// Escapes one segment of a path, or a value in its query.
     [[nodiscard]] static std::string escaped(const std::string& segment);
 
   private:
     class Transfer;
+    class Sockets;
     struct Exchange;
     [[nodiscard]] DaemonReply send(const Exchange& exchange);
+    /// Returns true if the library must use a new connection. Reduces the timeout of an exchange by the time of a login
+    /// that asks for nothing.
+    [[nodiscard]] bool connectToHost(std::chrono::milliseconds& timeout);
+    [[noreturn]] void fail(const Exchange& exchange, int result) const;
 
-    std::string _socketPath;
-    std::unique_ptr<Transfer> _transfer;
+    std::string _socketPath;            ///< empty: the daemon is on another machine
+    std::unique_ptr<RemoteHost> _host;  ///< null: the daemon is on this machine
+    std::unique_ptr<Sockets> _sockets;
+    std::unique_ptr<Transfer> _transfer;  ///< last: it closes its sockets
+    std::chrono::steady_clock::duration _loginTime{};
 };
+
+/// Throws the Failure for a daemon's socket that this process could not connect to, with the system's error number.
+[[noreturn]] void throwNotConnected(const std::string& socketPath, int number, const std::string& why);
 
 }  // namespace adminhost::ctl

@@ -3,6 +3,7 @@
 #include "adminhostctl/Interrupt.h"
 #include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
+#include "platform/framework/Release.h"
 #include "platform/json/Json.h"
 #include "platform/text/Uuid.h"
 #include "platform/value/ValueText.h"
@@ -10,6 +11,8 @@
 #include <algorithm>
 #include <chrono>
 #include <thread>
+
+#include <fmt/format.h>
 
 namespace adminhost::ctl {
 namespace {
@@ -30,6 +33,8 @@ constexpr auto quickTimeout = seconds(30);
 constexpr auto margin = seconds(10);
 constexpr auto usualDeadline = seconds(300);
 constexpr int repeats = 3;
+/// The number of the daemon's interface that this program was written for. Additions do not raise it.
+constexpr std::int64_t interfaceNeeded = 1;
 
 constexpr const char* overviewPath = "/v1/";
 constexpr const char* requestsPath = "/v1/requests/";
@@ -140,8 +145,10 @@ DaemonClient::Milliseconds DaemonClient::timeoutOf(std::optional<seconds> deadli
 
 template <typename Send>
 DaemonReply DaemonClient::patiently(Milliseconds timeout, const Send& send) {
-    const auto end = std::chrono::steady_clock::now() + timeout;
-    const auto left = [&] { return std::chrono::ceil<Milliseconds>(end - std::chrono::steady_clock::now()); };
+    const auto end = std::chrono::steady_clock::now() + timeout - _connection.loginTime();
+    const auto left = [&] {
+        return std::chrono::ceil<Milliseconds>(end + _connection.loginTime() - std::chrono::steady_clock::now());
+    };
     for (int repeat = 0;; ++repeat) {
         DaemonReply reply = send(left());
         const auto pause = seconds(reply.retryAfter);
@@ -182,8 +189,15 @@ void DaemonClient::fail(const DaemonReply& reply) {
 
 Value DaemonClient::overview() {
     Value overview = get(overviewPath);
-    const auto deadline =
-        overview.dictionary() != nullptr ? overview.dictionary()->get("deadlineSeconds").integer() : std::nullopt;
+    const Dictionary said = overview.dictionary() != nullptr ? *overview.dictionary() : Dictionary();
+    if (said.get("interface").integer().value_or(interfaceNeeded) < interfaceNeeded) {
+        throw Failure(
+            ExitStatus::failed,
+            fmt::format("the daemon at {} has the release {}, which is too old for this adminhostctl; install "
+                        "the release " ADMINHOST_RELEASE " there",
+                        place(), shownText(said, "release")));
+    }
+    const auto deadline = said.get("deadlineSeconds").integer();
     _deadline = deadline ? seconds(*deadline) : usualDeadline;
     return overview;
 }
@@ -387,7 +401,9 @@ RequestReport DaemonClient::settledReport(const std::string& requestId) {
         if (settled || std::chrono::steady_clock::now() >= end) {
             return found;
         }
-        std::this_thread::sleep_for(pause);
+        // Each attempt over ssh is a login.
+        const bool isFarAway = isRemote() && found.state == RequestReport::State::notReachable;
+        std::this_thread::sleep_for(isFarAway ? std::chrono::milliseconds(2000) : pause);
     }
 }
 

@@ -98,9 +98,13 @@ class DaemonClient {
     /// A timeout also shortens the operations' deadlines, so that they end before it.
     explicit DaemonClient(std::string socketPath, std::optional<std::vector<std::string>> languages = std::nullopt,
                           std::optional<std::chrono::milliseconds> timeout = std::nullopt)
-        : _connection(std::move(socketPath)), _languages(std::move(languages)), _timeout(timeout) {}
+        : DaemonClient(Connection(std::move(socketPath)), std::move(languages), timeout) {}
+    explicit DaemonClient(Connection connection, std::optional<std::vector<std::string>> languages = std::nullopt,
+                          std::optional<std::chrono::milliseconds> timeout = std::nullopt)
+        : _connection(std::move(connection)), _languages(std::move(languages)), _timeout(timeout) {}
 
-    /// The daemon's overview: the running request, how many wait, and the plug-ins.
+    /// The daemon's overview: the running request, how many wait, and the plug-ins. Throws Failure if the daemon's
+    /// interface is older than this program needs.
     [[nodiscard]] Value overview();
     /// Every plug-in with its commands.
     [[nodiscard]] const std::vector<PluginInfo>& plugins();
@@ -130,7 +134,10 @@ class DaemonClient {
     [[nodiscard]] Value get(const std::string& path);
     /// Cancels a request that waits or is running. Throws Failure as ask() does.
     void cancel(const std::string& requestId);
-    [[nodiscard]] const std::string& socketPath() const noexcept { return _connection.socketPath(); }
+    /// The path of the daemon's socket, or the host on which the daemon is running.
+    [[nodiscard]] const std::string& place() const noexcept { return _connection.place(); }
+    /// Whether the daemon is on another machine.
+    [[nodiscard]] bool isRemote() const noexcept { return _connection.isRemote(); }
 
   private:
     using Milliseconds = std::chrono::milliseconds;

@@ -58,9 +58,15 @@ Dictionary socketCheck(const std::string& path) {
 
 /// The checks that remain if the daemon does not serve them.
 Array ownChecks(const Context& context, const std::string& why) {
-    return {check("daemon", failureState, why, "see its log (journalctl -u adminhostd); adminhostd --check shows more"),
-            socketCheck(context.service.socketPath()),
-            check("command line", okState, fmt::format("The command line has the release {}.", ownRelease), "")};
+    const std::string where = context.service.isRemote() ? "on " + context.service.place() + " " : "";
+    Array checks{check("daemon", failureState, why,
+                       "see its log " + where + "(journalctl -u adminhostd); adminhostd --check shows more")};
+    if (!context.service.isRemote()) {
+        checks.emplace_back(socketCheck(context.service.place()));
+    }
+    checks.emplace_back(
+        check("command line", okState, fmt::format("The command line has the release {}.", ownRelease), ""));
+    return checks;
 }
 
 /// A state that this release does not know is a failure: it must not look as if everything were in order.

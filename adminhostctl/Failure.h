@@ -13,8 +13,9 @@ enum class ExitStatus : int {
     usage = 2,
     notReachable = 3,  ///< no daemon at the socket, or it does not answer
     notPermitted = 4,
-    changes = 5,       ///< only with --exit-code: something differs, or was changed
-    conflict = 7,      ///< another client has changed the state since it was read; nothing was written
+    changes = 5,           ///< only with --exit-code: something differs, or was changed
+    hostNotReachable = 8,  ///< the machine of --host, or its adminhostctl, cannot be reached
+    conflict = 7,          ///< another client has changed the state since it was read; nothing was written
     undetermined = 6,  ///< the answer to a write is missing, and whether everything was written cannot be determined
 
     // Of "doctor", which has numbers of its own.

@@ -1,6 +1,7 @@
 #include "adminhostctl/GeneralVerbs.h"
 
 #include "adminhostctl/AuditVerb.h"
+#include "adminhostctl/Bridge.h"
 #include "adminhostctl/Complete.h"
 #include "adminhostctl/DirectoryNames.h"
 #include "adminhostctl/DoctorVerb.h"
@@ -132,6 +133,13 @@ constexpr std::array table = {
          0,
          &audit,
          {{"audit --since 2h", "audit -f --user anna"}}},
+    Verb{"bridge",
+         "",
+         "Connect standard input and output with the daemon, for --host on another machine",
+         0,
+         0,
+         &bridge,
+         {{"bridge", "--socket /run/adminhostd/adminhostd.sock bridge"}}},
     Verb{"whois",
          "NAME|UUID",
          "Show the people and groups with this name or UUID",

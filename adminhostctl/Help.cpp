@@ -92,6 +92,7 @@ std::string optionList(const Context& context, const Verb& verb) {
 }
 
 constexpr std::array common = {
+    VerbOption{"--host", "HOST", "Ask the daemon of another machine, by ssh: USER@SERVER, or a host of ~/.ssh/config"},
     VerbOption{"--socket", "PATH", "The daemon's socket; without it that of ADMINHOST_SOCKET, or the usual one"},
     VerbOption{"--format", "FORMAT", "text for reading, json or plist for programs"},
     VerbOption{"--languages", "LIST",

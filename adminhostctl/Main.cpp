@@ -3,12 +3,14 @@
 
 #include "adminhostctl/CallerLanguages.h"
 #include "adminhostctl/Complete.h"
+#include "adminhostctl/Connection.h"
 #include "adminhostctl/DaemonClient.h"
 #include "adminhostctl/Failure.h"
 #include "adminhostctl/GeneralVerbs.h"
 #include "adminhostctl/Help.h"
 #include "adminhostctl/Interrupt.h"
 #include "adminhostctl/Prompt.h"
+#include "adminhostctl/RemoteHost.h"
 #include "adminhostctl/RequestArguments.h"
 #include "adminhostctl/Similar.h"
 #include "adminhostctl/Verb.h"
@@ -16,6 +18,7 @@
 #include "adminhostctl/desired/DesiredVerbs.h"
 #include "adminhostctl/lumio/LumioVerbs.h"
 #include "adminhostctl/lumio/ServiceVerbs.h"
+#include "platform/files/FileDescriptor.h"
 #include "platform/files/StandardDescriptors.h"
 #include "platform/framework/Release.h"
 
@@ -24,12 +27,15 @@
 #include <chrono>
 #include <cstdlib>
 #include <iostream>
+#include <memory>
+#include <optional>
 #include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
 
 #include <CLI/CLI.hpp>
+#include <fcntl.h>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
@@ -39,6 +45,7 @@ using adminhost::ctl::ExitStatus;
 using adminhost::ctl::Format;
 
 constexpr const char* defaultSocket = "/run/adminhostd/adminhostd.sock";
+constexpr const char* unreachableSocket = "/dev/null";
 constexpr std::size_t widthWithoutTerminal = 120;
 constexpr std::chrono::milliseconds completionLimit(100);  ///< a person who presses the tab key does not wait longer
 
@@ -171,13 +178,36 @@ std::optional<std::chrono::milliseconds> timeoutOf(const std::optional<std::stri
     return std::chrono::milliseconds(static_cast<long>(seconds * 1000));
 }
 
+/// Whether a program in the foreground of this process's terminal can ask there.
+bool canAsk() {
+    const adminhost::FileDescriptor terminal(::open("/dev/tty", O_RDWR | O_CLOEXEC | O_NOCTTY));
+    return terminal.isOpen() && ::tcgetpgrp(terminal.get()) == ::getpgrp();
+}
+
+/// Throws Failure(usage) if the host or the socket's path is not usable.
+adminhost::ctl::Connection connectionTo(const std::optional<std::string>& host,
+                                        const std::optional<std::string>& socket,
+                                        std::optional<std::chrono::milliseconds> timeout) {
+    if (!host) {
+        const char* const usual = std::getenv("ADMINHOST_SOCKET");
+        return adminhost::ctl::Connection(socket.value_or(usual != nullptr && *usual != 0 ? usual : defaultSocket));
+    }
+    adminhost::ctl::RemoteHost::Options options{*host, socket, canAsk()};
+    if (timeout) {
+        options.connectTimeout = std::chrono::ceil<std::chrono::seconds>(*timeout);
+    }
+    return adminhost::ctl::Connection(std::make_unique<adminhost::ctl::RemoteHost>(std::move(options)));
+}
+
 int runMain(int count, char** words) {
     adminhost::ctl::VerbOptions options;
-    std::string socket = defaultSocket;
+    std::optional<std::string> socket;
+    std::optional<std::string> host;
     std::string format = "text";
     std::vector<std::string> rest;
     CLI::App app;  // the help is our own (Help.h)
-    app.add_option("--socket", socket)->envname("ADMINHOST_SOCKET")->type_name("PATH");
+    app.add_option("--host", host)->type_name("HOST");
+    app.add_option("--socket", socket)->type_name("PATH");
     app.add_option("--format", format)->type_name("FORMAT");
     std::optional<std::string> languages;
     app.add_option("--languages", languages)->type_name("LIST");
@@ -216,14 +246,19 @@ int runMain(int count, char** words) {
     if (completes) {
         rest.erase(rest.begin());
         const adminhost::ctl::CompletionTarget target = adminhost::ctl::completionTarget(rest);
-        socket = target.socket.value_or(socket);
+        socket = target.socket ? target.socket : socket;
+        if (host || target.host) {  // a key that is pressed for completion starts no login
+            host.reset();
+            socket = unreachableSocket;
+        }
         languages = target.languages ? target.languages : languages;
         timeout = target.timeout ? target.timeout : timeout;
     }
     try {
         options.format = formatOf(format);
         adminhost::ctl::DaemonClient service(
-            socket, languages ? adminhost::ctl::languagesOfText(*languages) : adminhost::ctl::callerLanguages(),
+            connectionTo(host, socket, timeoutOf(timeout)),
+            languages ? adminhost::ctl::languagesOfText(*languages) : adminhost::ctl::callerLanguages(),
             timeoutOf(timeout));
         const adminhost::ctl::Sources sources{&adminhost::ctl::readSource,
                                               &adminhost::ctl::askSecret,

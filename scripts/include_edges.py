@@ -16,6 +16,7 @@ INCLUDE = re.compile(r'^\s*#\s*include\s*"([^"]+)"')
 # a file's path counts, so an entry for a room, folder or file inside another room overrides that room's entry.
 CONTROL = {"platform/value", "platform/text", "platform/plist", "platform/json", "platform/files",
            "platform/framework/Release.h"}
+CLIENT = CONTROL | {"platform/task"}
 MAY_INCLUDE = {
     "platform": set(),
     "codec": {"platform"},
@@ -26,7 +27,7 @@ MAY_INCLUDE = {
     "handler": {"platform", "codec", "krb5", "settings", "resources", "commands"},
     "plugin": {"platform", "codec", "krb5", "settings", "resources", "commands", "handler"},
     "adminhostd": {"platform"},
-    "adminhostctl": CONTROL,
+    "adminhostctl": CLIENT,
     "adminhostctl/desired": CONTROL | {"adminhostctl"},
     "adminhostctl/lumio": CONTROL | {"adminhostctl", "adminhostctl/desired"},
     "adminhostctl/Main.cpp": CONTROL | {"adminhostctl", "adminhostctl/desired", "adminhostctl/lumio"},

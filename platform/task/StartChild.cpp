@@ -41,6 +41,7 @@ struct ChildSide {
     std::size_t groupCount;
     bool noNewPrivileges;
     int confinement;
+    bool ownGroup;
     std::atomic<pid_t>* registration;
     pid_t parent;
 };
@@ -122,7 +123,8 @@ NOT_INSTRUMENTED bool signals() {
 }
 
 NOT_INSTRUMENTED bool prepare(const ChildSide& side) {
-    return ::syscall(SYS_setpgid, 0, 0) == 0 && enter(side) && place(side) && drop(side) && signals();
+    return (!side.ownGroup || ::syscall(SYS_setpgid, 0, 0) == 0) && enter(side) && place(side) && drop(side) &&
+           signals();
 }
 
 NOT_INSTRUMENTED int runChild(void* argument) {
@@ -249,6 +251,7 @@ Result<StartedChild> startChild(const ChildPlan& plan) {
     side.groupCount = plan.rights ? plan.rights->groups.size() : 0;
     side.noNewPrivileges = plan.noNewPrivileges;
     side.confinement = confinement;
+    side.ownGroup = plan.ownGroup;
     side.registration = plan.registration;
     side.parent = ::getpid();
     const int dumpable = ::prctl(PR_GET_DUMPABLE);

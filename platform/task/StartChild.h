@@ -3,9 +3,9 @@
 // Starts a child process. Every child of this system is started here: tools, the worker, and trials of plug-ins.
 //
 // The child shares our memory until it executes its program, so that starting it costs the same however much memory we
-// use; in that time it makes raw system calls only. It gets its own process group, no blocked signal, every signal at
-// its default action, and exactly the descriptors of the plan. Nothing else is inherited: not even a descriptor that
-// is not close-on-exec.
+// use; in that time it makes raw system calls only. It gets its own process group unless the plan keeps ours, no
+// blocked signal, every signal at its default action, and exactly the descriptors of the plan. Nothing else is
+// inherited: not even a descriptor that is not close-on-exec.
 
 #include "platform/files/FileDescriptor.h"
 #include "platform/framework/Export.h"
@@ -45,10 +45,13 @@ struct ADMINHOST_EXPORT ChildPlan {
     /// What confines the child (Confinement::descriptor()), or -1. Needs noNewPrivileges. The program, and its loader,
     /// must be allowed.
     int confinement = -1;
+    /// Without it, the child stays in our process group: it can then read from our terminal, and gets the signals of
+    /// that terminal.
+    bool ownGroup = true;
 };
 
 struct ADMINHOST_EXPORT StartedChild {
-    pid_t pid = 0;        ///< also the id of its process group
+    pid_t pid = 0;        ///< also the id of its process group, if it has its own
     FileDescriptor exit;  ///< a pidfd: readable when the child has exited
 };
 

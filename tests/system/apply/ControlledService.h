@@ -27,10 +27,14 @@ class ControlledService : public testing::Test {
         options.arguments = {"--root", root.path(), "--plugin", std::string(BINARY_DIR) + "/lib/adminhost_lumio.so"};
         return options;
     }
-    /// Output and messages together.
-    [[nodiscard]] ProgramResult ctl(std::vector<std::string> words) const {
+    /// This build's command line with the daemon's socket.
+    [[nodiscard]] std::vector<std::string> command(std::vector<std::string> words) const {
         words.insert(words.begin(), {std::string(BINARY_DIR) + "/bin/adminhostctl", "--socket", daemon.socket()});
-        return runProgram(words, Errors::merge);
+        return words;
+    }
+    /// Output and messages together.
+    [[nodiscard]] ProgramResult ctl(const std::vector<std::string>& words) const {
+        return runProgram(command(words), Errors::merge);
     }
     /// Writes a file for the test and returns its path.
     [[nodiscard]] std::string file(const std::string& name, const std::string& content) const {

@@ -221,6 +221,13 @@ class ExitStatuses : public OvertakenService {
         root.sql("alter table gone rename to access_control_entries");
     }
 
+    void machineThatIsNotThere() {
+        expect(8, "daemon",
+               runProgram({"/usr/bin/env", "PATH=/nowhere", std::string(BINARY_DIR) + "/bin/adminhostctl", "--host",
+                           "studio", "daemon"},
+                          Errors::merge));
+    }
+
     void stateOfTheService() {
         expect(3, {"status"});
         expect(0, {"start"});
@@ -255,6 +262,7 @@ TEST_F(ExitStatuses, EveryMistakeHasItsRowInTheManualPageAndEveryRowIsReached) {
     differences();
     otherClient();
     lostAnswer();
+    machineThatIsNotThere();
     stateOfTheService();
     health();
     EXPECT_EQ(reached, table);

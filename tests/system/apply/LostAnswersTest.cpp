@@ -1,14 +1,10 @@
 // Writes whose answer is lost: the outcome is determined and reported, and nothing is written a second time.
 
 #include "tests/support/Eventually.h"
+#include "tests/support/RunningProgram.h"
 #include "tests/system/apply/ControlledService.h"
 
-#include <algorithm>
-#include <array>
 #include <csignal>
-
-#include <sys/wait.h>
-#include <unistd.h>
 
 namespace adminhost::test {
 namespace {
@@ -16,67 +12,6 @@ namespace {
 using testing::AllOf;
 using testing::HasSubstr;
 using testing::Not;
-
-/// A command line that is running in the background; output and messages together.
-class RunningCtl {
-  public:
-    RunningCtl(const std::string& socket, const std::vector<std::string>& words) {
-        std::array<int, 2> ends{};
-        EXPECT_EQ(::pipe(ends.data()), 0);
-        _pid = ::fork();
-        if (_pid == 0) {
-            ::dup2(ends[1], STDOUT_FILENO);
-            ::dup2(ends[1], STDERR_FILENO);
-            ::close(ends[0]);
-            ::close(ends[1]);
-            const std::string program = std::string(BINARY_DIR) + "/bin/adminhostctl";
-            std::vector<const char*> arguments{program.c_str(), "--socket", socket.c_str()};
-            for (const std::string& word : words) {
-                arguments.push_back(word.c_str());
-            }
-            arguments.push_back(nullptr);
-            ::execv(program.c_str(), const_cast<char**>(arguments.data()));
-            ::_exit(127);
-        }
-        ::close(ends[1]);
-        _output = ends[0];
-    }
-    ~RunningCtl() { ::close(_output); }
-    RunningCtl(const RunningCtl&) = delete;
-    RunningCtl& operator=(const RunningCtl&) = delete;
-
-    void signal(int number) const { ::kill(_pid, number); }
-    /// Reads its output until the text has come.
-    void waitFor(const std::string& text) {
-        while (_text.find(text) == std::string::npos) {
-            ASSERT_TRUE(readSome()) << "it has ended: " << _text;
-        }
-    }
-    /// Its whole output and its status; 128 + number if a signal ended it.
-    ProgramResult wait() {
-        while (readSome()) {
-        }
-        ProgramResult result;
-        result.output = _text;
-        int status = 0;
-        EXPECT_EQ(::waitpid(_pid, &status, 0), _pid);
-        result.status = WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status);
-        return result;
-    }
-
-  private:
-    /// Returns false at the end of the output.
-    bool readSome() {
-        std::array<char, 4096> bytes{};
-        const ssize_t count = ::read(_output, bytes.data(), bytes.size());
-        _text.append(bytes.data(), static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
-        return count > 0;
-    }
-
-    pid_t _pid = -1;
-    int _output = -1;
-    std::string _text;
-};
 
 class LostAnswers : public ControlledService {
   protected:
@@ -118,7 +53,7 @@ TEST_F(Deadline, CommandReportsThatTheRequestHasEnded) {
 TEST_F(LostAnswers, KilledWorkerIsReportedAndNothingIsWrittenTwice) {
     root.recordToolCalls();
     holdWrite();
-    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    RunningProgram set(command({"settings", "set", "server_port", "8180"}));
     waitForWrite();
     ::kill(daemon.workerPid(), SIGKILL);
     const ProgramResult result = set.wait();
@@ -131,7 +66,7 @@ TEST_F(LostAnswers, KilledWorkerIsReportedAndNothingIsWrittenTwice) {
 TEST_F(LostAnswers, StateThatCannotBeReadBackCompletelyLeavesItUndetermined) {
     holdWrite();
     // A verb that concerns one setting would not read the access lists.
-    RunningCtl set(daemon.socket(), {"apply", file("port.toml", "[settings]\nserver_port = 8180\n")});
+    RunningProgram set(command({"apply", file("port.toml", "[settings]\nserver_port = 8180\n")}));
     waitForWrite();
     root.sql("alter table access_control_entries rename to gone");
     ::kill(daemon.workerPid(), SIGKILL);
@@ -144,7 +79,7 @@ TEST_F(LostAnswers, StateThatCannotBeReadBackCompletelyLeavesItUndetermined) {
 
 TEST_F(LostAnswers, DaemonThatIsGoneLeavesItUndetermined) {
     holdWrite();
-    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    RunningProgram set(command({"settings", "set", "server_port", "8180"}));
     waitForWrite();
     const pid_t front = daemon.frontPid();
     const pid_t worker = daemon.workerPid();
@@ -162,7 +97,7 @@ TEST_F(LostAnswers, DaemonThatIsGoneLeavesItUndetermined) {
 
 TEST_F(LostAnswers, InterruptedWriteIsReportedAndTheProgramEndsByTheSignal) {
     holdWrite();
-    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    RunningProgram set(command({"settings", "set", "server_port", "8180"}));
     waitForWrite();
     set.signal(SIGINT);
     set.waitFor("interrupted");
@@ -176,7 +111,7 @@ TEST_F(LostAnswers, InterruptedWriteIsReportedAndTheProgramEndsByTheSignal) {
 
 TEST_F(LostAnswers, InterruptedCommandPrintsTheChangesThatTheDaemonReports) {
     holdWrite();
-    RunningCtl write(daemon.socket(), {"writeSettings", "configuration.server_port=8180"});
+    RunningProgram write(command({"writeSettings", "configuration.server_port=8180"}));
     waitForWrite();
     write.signal(SIGINT);
     write.waitFor("interrupted");
@@ -190,7 +125,7 @@ TEST_F(LostAnswers, InterruptedCommandPrintsTheChangesThatTheDaemonReports) {
 
 TEST_F(LostAnswers, SecondInterruptEndsTheProgramAtOnceAndTheWriteIsCompleted) {
     holdWrite();
-    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    RunningProgram set(command({"settings", "set", "server_port", "8180"}));
     waitForWrite();
     set.signal(SIGINT);
     set.waitFor("interrupted");
@@ -202,7 +137,7 @@ TEST_F(LostAnswers, SecondInterruptEndsTheProgramAtOnceAndTheWriteIsCompleted) {
 
 TEST_F(LostAnswers, InterruptBeforeTheWriteEndsTheProgramAndNothingIsWritten) {
     root.hold("setup_preferences");
-    RunningCtl set(daemon.socket(), {"settings", "set", "server_port", "8180"});
+    RunningProgram set(command({"settings", "set", "server_port", "8180"}));
     ASSERT_TRUE(root.waitForHeld("setup_preferences"));
     set.signal(SIGINT);
     const ProgramResult result = set.wait();

@@ -161,8 +161,9 @@ TEST(DaemonClient, TriesAgainWhenTheDaemonAsksForItButNotForever) {
 
 TEST(DaemonClient, SendsADeadlineThatEndsBeforeItsTimeout) {
     const PlayedServer server([](const std::string& request) {
-        return request.starts_with("GET") ? "HTTP/1.1 200 OK\r\nContent-Length: 23\r\n\r\n{\"deadlineSeconds\":120}"
-                                          : ok();
+        return request.starts_with("GET")
+                   ? "HTTP/1.1 200 OK\r\nContent-Length: 37\r\n\r\n{\"interface\":1,\"deadlineSeconds\":120}"
+                   : ok();
     });
     const CommandRef command{"p", Description({{"name", "c"}, {"access", "read"}})};
     for (const auto& [timeout, header] : {std::pair{60, "Request-Deadline: 50\r\n"},

@@ -170,6 +170,13 @@ TEST(StartChild, SignalsAreAtTheirDefaultAndUnblockedAndOurMaskStays) {
     EXPECT_FALSE(::sigismember(&after, SIGINT));
 }
 
+TEST(StartChild, ChildHasAProcessGroupOfItsOwnUnlessThePlanKeepsOurs) {
+    ChildPlan plan = shell("ps -o pgid= -p $$");
+    EXPECT_NE(std::stoi(run(plan).output), ::getpgrp());
+    plan.ownGroup = false;
+    EXPECT_EQ(std::stoi(run(plan).output), ::getpgrp());
+}
+
 TEST(StartChild, ProgramThatCannotBeExecutedIsAnErrorAndNoChildIsLeft) {
     const std::size_t before =
         static_cast<std::size_t>(std::distance(fs::directory_iterator("/proc/self/fd"), fs::directory_iterator{}));
