@@ -106,7 +106,7 @@ TEST_F(Generate, RequestKeysAreTakenOverFromOtherCommandsAndFromTheSameOne) {
 }
 
 TEST_F(Generate, RefusesWordsOfTheDesiredStateThatNameNothing) {
-    EXPECT_THAT(with("order = 1", "order = 1\nstate = \"change\""), HasSubstr("state is read, write or try"));
+    EXPECT_THAT(with("order = 1", "order = 1\nstate = \"change\""), HasSubstr("state is read, write, try or names"));
     EXPECT_THAT(with("help", "identity = \"_id_\"\nhelp"), HasSubstr("key a: identity is not described"));
     EXPECT_THAT(with("help", "secret_if = \"hidden\"\nhelp"), HasSubstr("key a: secret_if is not described"));
     EXPECT_THAT(with("help", "looked_up = \"always\"\nhelp"), HasSubstr("key a: unknown word in looked_up"));
