@@ -206,8 +206,9 @@ void Connection::fail(const Exchange& exchange, int result) const {
         number != 0 ? std::strerror(static_cast<int>(number)) : curl_easy_strerror(static_cast<CURLcode>(result));
     ExitStatus status = ExitStatus::notReachable;
     if (_host) {
-        // One that hangs is ended at once.
-        const std::optional<int> ssh = _host->statusOf(_sockets->current(), std::chrono::seconds(isLate ? 0 : 2));
+        // One that is still connected is ended at once.
+        const bool isConnected = isLate || isInterrupted();
+        const std::optional<int> ssh = _host->statusOf(_sockets->current(), std::chrono::seconds(isConnected ? 0 : 2));
         if (ssh == statusOfSsh) {
             status = ExitStatus::hostNotReachable;
         }

@@ -86,9 +86,9 @@ TEST_F(RemoteFailures, ShellThatPrintsForeverIsEnded) {
 
 TEST_F(RemoteFailures, LoginThatHangsEndsWithTheTimeout) {
     server.installThere("adminhostctl", "exec sleep 60\n");
-    const ProgramResult result = remote({"--timeout", "1", "settings", "get", "server_port"});
+    const ProgramResult result = remote({"--timeout", "3", "settings", "get", "server_port"});
     EXPECT_EQ(result.status, 8);
-    EXPECT_THAT(result.output, HasSubstr("studio has not answered within 1 s\n"));
+    EXPECT_THAT(result.output, HasSubstr("studio has not answered within 3 s\n"));
 }
 
 TEST_F(RemoteFailures, MissingSshIsNamed) {

@@ -1,5 +1,6 @@
 // The command line for the service of another machine.
 
+#include "tests/support/Eventually.h"
 #include "tests/support/OnTerminal.h"
 #include "tests/system/remote/RemoteService.h"
 
@@ -77,7 +78,11 @@ TEST_F(RemoteHost, SshIsRunWithTheseArgumentsAndNeverReadsStandardInput) {
 
 TEST_F(RemoteHost, NoSshIsLeft) {
     EXPECT_EQ(remote({"camera", "list"}).status, 0);
-    EXPECT_EQ(runProgram({"pgrep", "-f", server.toolDirectory().parent_path().string() + "/config"}).status, 1);
+    EXPECT_TRUE(eventually(
+        [&] {
+            return runProgram({"pgrep", "-f", server.toolDirectory().parent_path().string() + "/config"}).status == 1;
+        },
+        std::chrono::seconds(30)));
 }
 
 TEST_F(RemoteHost, NameThatLooksLikeAnOptionAndUnsafePathsAreRejected) {
@@ -122,11 +127,11 @@ TEST_F(RemoteHost, BridgeConnectsStandardInputAndOutputWithTheDaemon) {
 
 TEST_F(RemoteHost, TimeOfAPasswordPromptDoesNotCount) {
     server.setPassphrase("open sesame");
-    std::vector<std::string> command = remoteCommand({"--timeout", "2", "settings", "get", "server_port"});
+    std::vector<std::string> command = remoteCommand({"--timeout", "5", "settings", "get", "server_port"});
     command.erase(command.begin(), command.begin() + 2);  // with the terminal
     OnTerminal terminal(command);
     EXPECT_THAT(terminal.showsUntil("Enter passphrase"), HasSubstr("Enter passphrase"));
-    ::usleep(2'500'000);  // longer than the timeout
+    ::usleep(5'500'000);  // longer than the timeout
     terminal.type("open sesame\n");
     EXPECT_THAT(terminal.showsUntil("8170"), HasSubstr("8170"));
     EXPECT_EQ(terminal.wait(), 0);
