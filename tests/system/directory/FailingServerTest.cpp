@@ -81,12 +81,24 @@ TEST_F(ServerThatIsDown, VerbsThatChangeAccessOrCompareItFailAndWriteNothing) {
     EXPECT_EQ(root.sql("select * from access_control_entries; select * from cameras; select * from workflows"), before);
 }
 
-TEST_F(ServerThatIsDown, RollbackFailsAndSettingsCanStillBeSet) {
+TEST_F(ServerThatIsDown, SettingIsSetAndRestoredAndRollbackOfAccessFails) {
     ASSERT_EQ(ctl({"settings", "set", "server_port", "8180"}).status, 0);
-    const ProgramResult rollback = ctl({"rollback", "1"});
-    EXPECT_EQ(rollback.status, 1);
-    EXPECT_THAT(rollback.output, HasSubstr(reason));
-    EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8180\n");
+    const ProgramResult setting = ctl({"rollback", "1"});
+    EXPECT_EQ(setting.status, 0) << "it reads no access list: " << setting.output;
+    EXPECT_EQ(ctl({"settings", "get", "server_port"}).output, "8170\n");
+
+    const std::string uuid = root.sql("select uuid from cameras where name = 'Main hall'");
+    ASSERT_EQ(daemon.connect()
+                  .post("/v1/lumio/writeSettings", R"({"configuration":{"cameras":[{"_id_":")" +
+                                                       uuid.substr(0, uuid.find('\n')) +
+                                                       R"(","access_control_enabled":false}]}})")
+                  .status,
+              200);
+    ASSERT_EQ(root.sql("select access_control_enabled from cameras where name = 'Main hall'"), "f\n");
+    const ProgramResult access = ctl({"rollback", "r1"});
+    EXPECT_EQ(access.status, 1);
+    EXPECT_THAT(access.output, HasSubstr(reason));
+    EXPECT_EQ(root.sql("select access_control_enabled from cameras where name = 'Main hall'"), "f\n");
 }
 
 TEST_F(ServerThatIsDown, WhoisFailsWithTheReason) {

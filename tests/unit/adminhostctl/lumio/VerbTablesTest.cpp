@@ -53,7 +53,8 @@ std::vector<std::string> argumentsOf(const Verb& verb, std::string_view example)
     std::vector<std::string> plain;
     const std::vector<std::string> words = split(example);
     for (std::size_t i = 0; i < words.size(); ++i) {
-        if (words[i] == "--format" || words[i] == "--languages" || words[i] == "--timeout") {
+        if (words[i] == "--format" || words[i] == "--languages" || words[i] == "--timeout" || words[i] == "--socket" ||
+            words[i] == "--host") {
             ++i;  // every verb has them
         } else if (words[i].starts_with("-") && words[i] != "-" && words[i] != "--names" && words[i] != "--clear") {
             const std::vector<VerbOption> options = allOptions();
