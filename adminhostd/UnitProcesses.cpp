@@ -2,10 +2,10 @@
 
 #include <charconv>
 #include <fstream>
-#include <iterator>
 #include <optional>
 #include <sstream>
 #include <string_view>
+#include <utility>
 
 #include <fmt/format.h>
 
@@ -14,9 +14,13 @@ namespace {
 
 constexpr int deepest = 64;  ///< ancestors of a process that are looked at
 
+/// What can be read of the file. A process that ends meanwhile is an error of reading, which the operator does not
+/// throw.
 std::string textOf(const std::string& path) {
-    std::ifstream file(path);
-    return {std::istreambuf_iterator<char>(file), {}};
+    const std::ifstream file(path);
+    std::ostringstream text;
+    text << file.rdbuf();
+    return std::move(text).str();
 }
 
 std::string membersOf(const KernelPlaces& places, const std::string& group) {

@@ -1,6 +1,7 @@
 #include "adminhostd/UnitProcesses.h"
 #include "tests/support/TemporaryRoot.h"
 
+#include <filesystem>
 #include <string>
 
 #include <gtest/gtest.h>
@@ -49,6 +50,12 @@ TEST_F(UnitProcessesTest, ServiceThatAControlToolLeftInTheUnitIsAStray) {
 TEST_F(UnitProcessesTest, ProcessThatHasJustEndedIsNoStray) {
     members("100\n300\n");
     EXPECT_TRUE(found().strays.empty());
+}
+
+TEST_F(UnitProcessesTest, FileThatIsOpenedAndCannotBeReadIsEmpty) {
+    // A process that ends between the two fails the same way, and any client's may.
+    std::filesystem::create_directories(root.path("/proc/300/cgroup"));
+    EXPECT_EQ(controlGroupOf(300, {root.path("/proc").string(), root.path("/cgroup").string()}), "");
 }
 
 TEST_F(UnitProcessesTest, GroupThatIsNotAServiceOfTheManagerIsNotJudged) {
