@@ -176,7 +176,7 @@ void Reading::appendTable(std::string& text, const Array& rows, const std::strin
         }
     }
     Table table(std::move(headings));
-    // A list of people answers the question that most tables with one are read for.
+    // In a narrow terminal the list of people is omitted last: it is why most such tables are shown.
     for (std::size_t i = 0; i < keys.size(); ++i) {
         if (const DescribedKey* key = _description.answerKey(element + keys[i]);
             key != nullptr && key->unit == "people") {

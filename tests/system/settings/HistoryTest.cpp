@@ -30,6 +30,15 @@ using testing::HasSubstr;
 using testing::Not;
 using testing::StartsWith;
 
+/// Changes the port from 9001 to 9002 in the settings file itself.
+void editPortOutsideTheDaemon(const test::SampleRoot& root) {
+    const std::string file = "/Library/SorvaneProducer/Shared/Server/member_preferences_" +
+                             test::SampleRoot::uuidOf("member", "media1") + ".plist";
+    std::string text = root.read(file);
+    ASSERT_NE(text.find("9001"), std::string::npos);
+    root.write(file, text.replace(text.find("9001"), 4, "9002"));
+}
+
 TEST_F(Settings, HistoryTellsWhatEachWriteChangedAndRollbackGoesBackThroughTheSameWrite) {
     ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
     ASSERT_EQ(post("writeSettings", R"({"configuration":{"nimbo_client_username":"other"}})").status, 200);
@@ -102,11 +111,7 @@ TEST_F(Settings, WriteThatCanHaveNoEntryInTheHistoryIsCarriedOutAndReportsIt) {
 
 TEST_F(Settings, HistoryTellsWhatEachWriteChangedFromWhatWasEditedOutside) {
     ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
-    const std::string file = "/Library/SorvaneProducer/Shared/Server/member_preferences_" +
-                             test::SampleRoot::uuidOf("member", "media1") + ".plist";
-    std::string text = root.read(file);
-    ASSERT_NE(text.find("9001"), std::string::npos);
-    root.write(file, text.replace(text.find("9001"), 4, "9002"));
+    ASSERT_NO_FATAL_FAILURE(editPortOutsideTheDaemon(root));
     ASSERT_EQ(post("writeSettings", R"({"configuration":{"nimbo_client_password":"another one"}})").status, 200);
     ASSERT_EQ(post("writeSettings", R"({"configuration":{"properties":[]}})").status, 200);
     const Value answer = valueOf(daemon.connect().get("/v1/lumio/history"));
@@ -125,11 +130,7 @@ TEST_F(Settings, HistoryTellsWhatEachWriteChangedFromWhatWasEditedOutside) {
 
 TEST_F(Settings, HistoryShowsEachWriteAndEachEditOutsideAsARowOfItsOwn) {
     ASSERT_EQ(post("writeSettings", R"({"configuration":{"server_port":9001}})").status, 200);
-    const std::string file = "/Library/SorvaneProducer/Shared/Server/member_preferences_" +
-                             test::SampleRoot::uuidOf("member", "media1") + ".plist";
-    std::string text = root.read(file);
-    ASSERT_NE(text.find("9001"), std::string::npos);
-    root.write(file, text.replace(text.find("9001"), 4, "9002"));
+    ASSERT_NO_FATAL_FAILURE(editPortOutsideTheDaemon(root));
     ASSERT_EQ(post("writeSettings", R"({"configuration":{"nimbo_client_password":"planted","properties":[)"
                                     R"({"_newid_":true,"name":"two lines","value":"a"}]}})")
                   .status,
