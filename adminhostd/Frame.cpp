@@ -25,6 +25,8 @@ struct Header {
 
 /// Above this capacity, a reader's buffer is freed once its content has been read.
 constexpr std::size_t keptCapacity = std::size_t{256} << 10U;
+/// Bytes of one reading to their place. Memory is used for what has arrived, not for what is announced.
+constexpr std::size_t pieceMaximum = std::size_t{256} << 10U;
 
 bool fits(const Header& header) {
     return header.payload <= frameMaximum && header.bytes <= frameMaximum - header.payload;
@@ -70,6 +72,27 @@ void FrameReader::append(std::string_view bytes) {
         _bytes.erase(0, read);
     }
     _bytes += bytes;
+}
+
+FrameReader::Reading FrameReader::readFrom(int descriptor) {
+    if (_missing > 0) {
+        std::string& bytes = _begun->bytes;
+        const std::size_t had = bytes.size();
+        const std::size_t wanted = std::min(_missing, pieceMaximum);
+        bytes.resize(had + wanted);
+        const ssize_t count = ::read(descriptor, bytes.data() + had, wanted);
+        const std::size_t arrived = count > 0 ? static_cast<std::size_t>(count) : 0;
+        bytes.resize(had + arrived);
+        _missing -= arrived;
+        return {count, arrived == wanted};
+    }
+    char buffer[16 << 10];
+    const ssize_t count = ::read(descriptor, buffer, sizeof buffer);
+    if (count > 0) {
+        append({buffer, static_cast<std::size_t>(count)});
+        ::explicit_bzero(buffer, static_cast<std::size_t>(count));
+    }
+    return {count, count == sizeof buffer};
 }
 
 std::optional<Frame> FrameReader::next() {
@@ -152,16 +175,10 @@ std::optional<Frame> readFrame(int descriptor, FrameReader& reader) {
         if (auto frame = reader.next()) {
             return frame;
         }
-        char buffer[16 << 10];
-        const ssize_t count = reader.broken() ? 0 : ::read(descriptor, buffer, sizeof buffer);
-        if (count < 0 && errno == EINTR) {
-            continue;
-        }
-        if (count <= 0) {
+        const ssize_t count = reader.broken() ? 0 : reader.readFrom(descriptor).count;
+        if (count == 0 || (count < 0 && errno != EINTR)) {
             return std::nullopt;
         }
-        reader.append({buffer, static_cast<std::size_t>(count)});
-        ::explicit_bzero(buffer, static_cast<std::size_t>(count));
     }
 }
 

@@ -14,6 +14,8 @@
 #include <string>
 #include <string_view>
 
+#include <sys/types.h>
+
 namespace adminhost {
 
 enum class FrameType : std::uint32_t {
@@ -58,6 +60,12 @@ class FrameReader {
     ~FrameReader();
 
     void append(std::string_view bytes);
+    struct Reading {
+        ssize_t count = 0;    ///< of read(2), which sets errno
+        bool filled = false;  ///< as many as were asked for: there may be more
+    };
+    /// Appends what one read(2) returns. Bytes of a frame whose head is known are read to their place, not copied.
+    Reading readFrom(int descriptor);
     /// The next whole frame; nullopt if bytes are missing, or if the stream is broken.
     [[nodiscard]] std::optional<Frame> next();
     /// Returns true if the stream has contained something that is not a frame. Nothing after it can be read.

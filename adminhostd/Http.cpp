@@ -30,6 +30,8 @@ constexpr auto slowClientsPause = 100ms;                    ///< between two loo
 constexpr auto shortagePause = 1s;                          ///< until the next try when no descriptor is free
 constexpr auto logPause = 60s;                              ///< between two events about the same kind of refusal
 constexpr std::size_t answerPiece = std::size_t{1} << 20U;  ///< bytes that a client has the time-out to read
+/// Answers above this size do not fit a socket's buffer of ordinary size.
+constexpr std::size_t ordinaryBuffer = std::size_t{64} << 10U;
 /// Freed buffers of at least this size are worth returning to the system.
 constexpr std::size_t largeBuffer = std::size_t{1} << 20U;
 /// What the library keeps of a request beside its head. A head that exceeds the bound by no more than this is answered
@@ -459,6 +461,11 @@ int HttpServer::send(Exchange& exchange) {
         _unread += exchange._unread;
         _returnMemory |= exchange._unread >= largeBuffer;
         dropOldAnswers(exchange);
+    }
+    if (bytes.size() > ordinaryBuffer) {
+        // The fewer pieces it is sent in, the less often client and front wake each other. The system limits the size.
+        const int size = static_cast<int>(std::min(bytes.size(), largeBuffer));
+        ::setsockopt(exchange._socket, SOL_SOCKET, SO_SNDBUF, &size, sizeof size);
     }
     if (Client* client = clientOf(exchange._connection)) {
         // A client that reads a byte a second would hold the answer's memory for ever.

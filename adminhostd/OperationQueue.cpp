@@ -19,6 +19,7 @@ constexpr auto startBound = 30s;
 constexpr auto overrunGrace = 2s;
 constexpr auto lockPause = 50ms;     ///< until the lock for changes is tried again
 constexpr auto abandonedPause = 1s;  ///< between two looks for clients that have gone
+constexpr int readingsAtOnce = 16;   ///< a worker that sends without end must not keep the front from its clients
 constexpr auto firstPause = 100ms;
 constexpr auto longestPause = 30s;
 
@@ -162,13 +163,16 @@ bool OperationQueue::converse(std::span<const pollfd> polled) {
     }
     const unsigned long asked = _starts;
     const auto same = [&] { return _worker && _starts == asked; };
-    const bool more = _worker->converse();
-    while (same()) {
-        auto frame = _worker->next();
-        if (!frame) {
-            break;
+    bool more = true;
+    for (int i = 0; i < readingsAtOnce && more && same(); ++i) {
+        more = _worker->converse();
+        while (same()) {
+            auto frame = _worker->next();
+            if (!frame) {
+                break;
+            }
+            receive(std::move(*frame));
         }
-        receive(std::move(*frame));
     }
     if (same() && _worker->broken()) {
         endWorker("sent what cannot be read");

@@ -12,12 +12,6 @@
 #include <sys/socket.h>
 
 namespace adminhost {
-namespace {
-
-/// Bytes that are read in one go. A worker that sends without end must not keep the front from its clients.
-constexpr std::size_t readMaximum = std::size_t{1} << 20U;
-
-}  // namespace
 
 std::unique_ptr<WorkerProcess> WorkerProcess::start(MonitorLink& monitor, Purpose purpose) {
     std::unique_ptr<WorkerProcess> worker(new WorkerProcess(monitor));
@@ -98,24 +92,18 @@ bool WorkerProcess::converse() {
     if (!_unsent.empty()) {
         write();
     }
-    char buffer[64 << 10];
-    std::size_t taken = 0;
-    while (_socket.isOpen() && !_closed && taken < readMaximum) {
-        const ssize_t count = ::recv(_socket.get(), buffer, sizeof buffer, 0);
-        if (count > 0) {
-            _reader.append({buffer, static_cast<std::size_t>(count)});
-            ::explicit_bzero(buffer, static_cast<std::size_t>(count));
-            taken += static_cast<std::size_t>(count);
-            if (static_cast<std::size_t>(count) < sizeof buffer) {
-                return false;
-            }
-        } else if (count == 0 || (errno != EINTR && errno != EAGAIN)) {
-            _closed = true;
-        } else if (errno == EAGAIN) {
-            return false;
-        }
+    if (!_socket.isOpen() || _closed) {
+        return false;
     }
-    return _socket.isOpen() && !_closed;
+    const auto [count, filled] = _reader.readFrom(_socket.get());
+    if (count > 0) {
+        return filled;
+    }
+    if (count < 0 && errno == EINTR) {
+        return true;
+    }
+    _closed = count == 0 || errno != EAGAIN;
+    return false;
 }
 
 const std::optional<std::string>& WorkerProcess::ending() {

@@ -43,8 +43,8 @@ class WorkerProcess {
 
     /// Queues a frame and sends what can be sent. Returns false if it is too large.
     [[nodiscard]] bool send(const Frame& frame);
-    /// Reads and writes what can be done without waiting, up to a bound. Returns true when the bound ended it: call
-    /// again.
+    /// Writes what can be written without waiting, and reads once. Returns true if there may be more to read, after the
+    /// frames that have arrived were taken by next().
     bool converse();
     /// The next frame that has arrived.
     [[nodiscard]] std::optional<Frame> next() { return _reader.next(); }

@@ -185,9 +185,9 @@ void Writer::write(const Value& value, std::size_t level) {
             writeWrapped("$data", base64TextOf(*value.data()));
             return;
         case Value::Type::array: {
-            const char* separator = "[";
+            std::string_view separator = "[";
             for (const Value& element : *value.array()) {
-                put(std::exchange(separator, ","));
+                put(std::exchange(separator, std::string_view(",")));
                 newLine(level + 1);
                 write(element, level + 1);
             }
@@ -200,9 +200,9 @@ void Writer::write(const Value& value, std::size_t level) {
             return;
         }
         case Value::Type::dictionary: {
-            const char* separator = "{";
+            std::string_view separator = "{";
             for (const DictionaryEntry& entry : *value.dictionary()) {
-                put(std::exchange(separator, ","));
+                put(std::exchange(separator, std::string_view(",")));
                 newLine(level + 1);
                 if (entry.key.starts_with('$')) {
                     writeString('$' + entry.key);

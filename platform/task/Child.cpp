@@ -13,6 +13,8 @@
 namespace adminhost {
 namespace {
 
+constexpr int outputRoom = 1 << 20;  ///< bytes: what every process may have
+
 /// A descriptor above the standard streams: a process that was started with one of them closed would otherwise get
 /// pipe ends in their places, and setting up the child's streams would overwrite one end with another.
 bool liftAboveStandardStreams(FileDescriptor& descriptor) noexcept {
@@ -53,6 +55,8 @@ int Child::start(ChildPlan plan, bool withInput) {
     if (const int failure = makePipe(output, childOutput, true); failure != 0) {
         return failure;
     }
+    // A tool should not wait while what it has written is read. If the system refuses the size, the pipe keeps its own.
+    static_cast<void>(::fcntl(output.get(), F_SETPIPE_SZ, outputRoom));
     if (const int failure = makePipe(error, childError, true); failure != 0) {
         return failure;
     }

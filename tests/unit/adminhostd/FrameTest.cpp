@@ -78,6 +78,64 @@ TEST(FrameReader, BytesBehindThePayloadArriveInAnyPiecesAndAreFollowedByTheNextF
     }
 }
 
+TEST(FrameReader, ReadsFramesFromASocketInPiecesOfAnySize) {
+    const std::string large(700'001, 'y');
+    const std::string stream = *encodeFrame({FrameType::log, Value("before"), {}}) +
+                               *encodeFrame({FrameType::answer, sample, large}) + large +
+                               *encodeFrame({FrameType::answer, Value(1), "x"}) + "x" +
+                               *encodeFrame({FrameType::log, Value("after"), {}});
+    for (const std::size_t piece : {std::size_t{7'001}, std::size_t{16'384}, std::size_t{100'000}, stream.size()}) {
+        int ends[2];
+        ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
+        std::thread writer([&] {
+            for (std::string_view left = stream; !left.empty();) {
+                const ssize_t sent = ::write(ends[0], left.data(), std::min(piece, left.size()));
+                ASSERT_GT(sent, 0);
+                left.remove_prefix(static_cast<std::size_t>(sent));
+            }
+            ::close(ends[0]);
+        });
+        FrameReader reader;
+        std::vector<Frame> frames;
+        std::size_t arrived = 0;
+        for (FrameReader::Reading reading; (reading = reader.readFrom(ends[1])).count > 0;) {
+            arrived += static_cast<std::size_t>(reading.count);
+            while (auto frame = reader.next()) {
+                frames.push_back(std::move(*frame));
+            }
+        }
+        EXPECT_EQ(arrived, stream.size());
+        ASSERT_EQ(frames.size(), 4U) << piece;
+        EXPECT_EQ(frames[0].payload, Value("before"));
+        EXPECT_EQ(frames[1].payload, sample);
+        EXPECT_TRUE(frames[1].bytes == large);
+        EXPECT_EQ(frames[2].bytes, "x");
+        EXPECT_EQ(frames[3].payload, Value("after"));
+        writer.join();
+        ::close(ends[1]);
+    }
+}
+
+TEST(FrameReader, StatesWhetherThereMayBeMoreToRead) {
+    int ends[2];
+    ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends), 0);
+    FrameReader reader;
+    const std::string frame = *encodeFrame({FrameType::answer, sample, "0123456789"}) + "01234";
+    ASSERT_EQ(::write(ends[0], frame.data(), frame.size()), static_cast<ssize_t>(frame.size()));
+    EXPECT_FALSE(reader.readFrom(ends[1]).filled);
+    EXPECT_FALSE(reader.next());
+    ASSERT_EQ(::write(ends[0], "56789more", 9), 9);
+    const FrameReader::Reading rest = reader.readFrom(ends[1]);
+    EXPECT_EQ(rest.count, 5) << "no byte of the next frame";
+    EXPECT_TRUE(rest.filled);
+    EXPECT_EQ(reader.next()->bytes, "0123456789");
+    EXPECT_EQ(reader.readFrom(ends[1]).count, 4);
+    EXPECT_EQ(reader.readFrom(ends[1]).count, -1) << "nothing is there";
+    for (const int end : ends) {
+        ::close(end);
+    }
+}
+
 TEST(FrameReader, PayloadAndBytesShareOneMaximum) {
     std::string bytes = *encodeFrame({FrameType::answer, sample, {}});
     const std::uint64_t most = frameMaximum;
