@@ -1,6 +1,10 @@
 // The daemon under 1, 8 and 64 clients at once, against an echo server over epoll that sends as many bytes. One program
 // is the client of all: each of its connections sends its next request when the answer to the last one has arrived.
 // Rounds of the compared servers take turns, so that disturbances on the machine affect both equally.
+//
+// "apart" keeps the client on the first processor and each server, with all of its processes, on the second one: then
+// client and server wake a sleeping processor for each message, whichever server it is. Without it, the system places
+// them, the echo server often on its client's processor and the front on the other one.
 
 #include "bench/HostClient.h"
 #include "tests/support/DaemonProcess.h"
@@ -15,6 +19,7 @@
 #include <vector>
 
 #include <benchmark/benchmark.h>
+#include <sched.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
@@ -188,11 +193,38 @@ class EpollEcho {
     pid_t _child = -1;
 };
 
+/// Keeps this process, and those that it starts from now on, on one processor.
+void stayOn(std::size_t processor) {
+    cpu_set_t processors;
+    CPU_ZERO(&processors);
+    CPU_SET(processor, &processors);
+    if (::sched_setaffinity(0, sizeof processors, &processors) != 0) {
+        throw std::runtime_error("cannot be kept on one processor");
+    }
+}
+
+/// Undoes stayOn() when the scope ends.
+class ScopedPlacement {
+  public:
+    ScopedPlacement() { ::sched_getaffinity(0, sizeof _before, &_before); }
+    ScopedPlacement(const ScopedPlacement&) = delete;
+    ScopedPlacement& operator=(const ScopedPlacement&) = delete;
+    ~ScopedPlacement() { ::sched_setaffinity(0, sizeof _before, &_before); }
+
+  private:
+    cpu_set_t _before{};
+};
+
 /// Each client sends so many requests in a round; a round is one iteration.
 constexpr int requestsPerRound = 64;
 
 void against(benchmark::State& state, std::string_view request) {
     const auto count = static_cast<std::size_t>(state.range(0));
+    const bool apart = state.range(1) != 0;
+    const ScopedPlacement placement;
+    if (apart) {
+        stayOn(1);
+    }
     auto options = bench::fixture();
     options.configuration = "queue_limit = 256\n";
     const DaemonProcess daemon(options);
@@ -202,6 +234,9 @@ void against(benchmark::State& state, std::string_view request) {
     clients.exchange(1, ours);
     const std::string path = (daemon.directory() / "echo").string();
     const EpollEcho server(path, clients.lastAnswer());
+    if (apart) {
+        stayOn(0);
+    }
     Clients echoClients(path, count, request);
     clients.exchange(requestsPerRound, ours);  // warm
     echoClients.exchange(requestsPerRound, echo);
@@ -229,8 +264,12 @@ void nullOperation(benchmark::State& state) {
     against(state, bench::nothingRequest);
 }
 
-BENCHMARK(overview)->Arg(1)->Arg(8)->Arg(64)->Iterations(100)->Unit(benchmark::kMillisecond);
-BENCHMARK(nullOperation)->Arg(1)->Arg(8)->Arg(64)->Iterations(100)->Unit(benchmark::kMillisecond);
+void eachNumberAndPlacement(benchmark::internal::Benchmark* benchmark) {
+    benchmark->ArgNames({"clients", "apart"})->ArgsProduct({{1, 8, 64}, {0, 1}})->Iterations(100);
+    benchmark->Unit(benchmark::kMillisecond);
+}
+BENCHMARK(overview)->Apply(eachNumberAndPlacement);
+BENCHMARK(nullOperation)->Apply(eachNumberAndPlacement);
 
 }  // namespace
 
