@@ -333,8 +333,10 @@ void OperationQueue::timeUp() {
             endWorker("did not get ready in time and was killed");
             break;
         case State::busy:
-            finish(_stopping ? Unserved{Unserved::Reason::stopping, "The daemon was stopped before the command ended."}
-                             : Unserved{Unserved::Reason::overrun, {}});
+            // A change is never reported as stopped: clients would take it as not run and send it again.
+            finish(_stopping && !_running->changes
+                       ? Unserved{Unserved::Reason::stopping, "The daemon was stopped before the command ended."}
+                       : Unserved{Unserved::Reason::overrun, {}});
             endWorker("did not stop in time and was killed");
             break;
         case State::idle:

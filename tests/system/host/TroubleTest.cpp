@@ -343,6 +343,21 @@ TEST(End, RunningWriteIsEndedAtItsDeadline) {
     EXPECT_EQ(daemon.wait(), 0);
 }
 
+TEST(End, RunningWriteWhoseWorkerHangsIsNotAnsweredAsIfItHadNotRun) {
+    DaemonProcess daemon(withFixture("request_deadline_seconds = 2\n"));
+    const std::string begun = daemon.directory() / "begun";
+    const pid_t worker = daemon.workerPid();
+    UnixHttp writer(daemon.socket(), std::chrono::seconds(60));
+    writer.begin("POST", "/v1/fixture/runWrite", "{\"script\": \"touch " + begun + "; sleep 300\"}");
+    ASSERT_TRUE(eventually([&] { return std::filesystem::exists(begun); }));
+    ::kill(worker, SIGSTOP);  // it does not report the overrun itself
+    daemon.signal(SIGTERM);
+    const HttpReply reply = writer.reply();
+    expectError(reply, 504, "DEADLINE_EXCEEDED");
+    EXPECT_FALSE(reply.headers.contains("retry-after")) << "a client would send it to the next daemon";
+    EXPECT_EQ(daemon.wait(), 0);
+}
+
 TEST(End, InterruptLeavesNothingBehind) {
     DaemonProcess daemon(withFixture());
     const pid_t worker = daemon.workerPid();
