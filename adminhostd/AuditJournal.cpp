@@ -205,7 +205,8 @@ int seek(sd_journal* journal, const protocol::ReadAudit& order, bool& gap) {
         return result;
     }
     gap = ::sd_journal_test_cursor(journal, order.after.c_str()) <= 0;
-    return gap ? ::sd_journal_previous(journal) : result;
+    // After a gap, this entry is the first one that is left: it has not been returned yet.
+    return gap ? ::sd_journal_seek_cursor(journal, order.after.c_str()) : result;
 }
 
 }  // namespace

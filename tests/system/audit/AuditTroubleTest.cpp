@@ -214,6 +214,42 @@ TEST_F(AuditTest, WorkerShowsEntriesOfItsOwnUnitOnly) {
     daemon.reset();
 }
 
+TEST_F(AuditTest, ReadingAfterAPlaceThatTheJournalHasRemovedReportsAGapAndEverythingThatIsLeft) {
+    awaitEntries(daemon->connect().post("/v1/fixture/echo").headers.at("request-id"), 1);
+    const std::string place(page("").text("next"));
+    ASSERT_NE(place, "");
+    const auto archived = [] {
+        std::vector<fs::path> files;
+        for (const auto& file : fs::recursive_directory_iterator("/run/log/journal")) {
+            if (file.path().filename().string().starts_with("system@")) {
+                files.push_back(file.path());
+            }
+        }
+        return files;
+    };
+    pid_t journald = 0;
+    std::ifstream("/run/journald.pid") >> journald;
+    ::kill(journald, SIGUSR2);  // rotates the files
+    ASSERT_TRUE(eventually([&] { return !archived().empty(); }));
+    std::vector<std::string> left;
+    for (int i = 0; i < 3; ++i) {
+        left.push_back(daemon->connect().post("/v1/fixture/echo").headers.at("request-id"));
+        awaitEntries(left.back(), 1);
+    }
+    for (const fs::path& file : archived()) {
+        fs::remove(file);
+    }
+    const Dictionary rest = page("after=" + place);
+    EXPECT_EQ(rest.get("gap"), Value(true));
+    std::vector<std::string> found;
+    for (const Value& entry : *rest.get("entries").array()) {
+        if (entry.dictionary()->text("command") == "echo") {
+            found.emplace_back(entry.dictionary()->text("request"));
+        }
+    }
+    EXPECT_EQ(found, left);
+}
+
 /// A journal that does not read what it is sent.
 class StuckJournal {
   public:
