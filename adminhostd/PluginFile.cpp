@@ -105,7 +105,7 @@ std::optional<std::string> distrust(const DiskPath& path) {
     if (::stat(path.c_str(), &status) != 0) {
         return fmt::format("{}: {}; create it or choose another place", path.text(), std::strerror(errno));
     }
-    if (status.st_uid != 0 && status.st_uid != ::geteuid()) {
+    if (status.st_uid != 0 && status.st_uid != startAccount) {
         return fmt::format("{} belongs to uid {}; chown it to root", path.text(), status.st_uid);
     }
     if ((status.st_mode & (S_IWGRP | S_IWOTH)) != 0) {

@@ -239,6 +239,23 @@ TEST_F(AccountRights, DaemonWithAnAccountForItsFrontServesWhatItServesWithout) {
     EXPECT_EQ(daemon.wait(), 0);
 }
 
+TEST_F(AccountRights, DirectoryOfTheFrontsAccountIsAFailureOfTheDoctor) {
+    if (!isSuperuser()) {
+        return;
+    }
+    const TemporaryRoot root;
+    const passwd* const account = ::getpwnam(otherAccount);
+    ASSERT_NE(account, nullptr);
+    fs::permissions(root.path("/"), fs::perms(0755));
+    root.write("/var/lib/adminhostd/file", "");
+    ASSERT_EQ(::chown(root.path("/var/lib/adminhostd").c_str(), account->pw_uid, account->pw_gid), 0);
+    auto options = withFixture(ofOtherAccount);
+    options.arguments.insert(options.arguments.end(), {"--root", root.path("/")});
+    const DaemonProcess daemon(options);
+    EXPECT_THAT(daemon.connect().get("/v1/doctor").body,
+                HasSubstr("belongs to uid " + std::to_string(account->pw_uid) + R"(.","fix":"chown it to root")"));
+}
+
 TEST_F(AccountRights, FrontThatCannotReadTheFileGetsTheConfigurationAtAReload) {
     if (!isSuperuser()) {
         return;
