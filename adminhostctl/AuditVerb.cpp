@@ -91,12 +91,14 @@ std::string resultText(const Dictionary& entry) {
         return "unfinished: " + std::string(entry.text("result"));
     }
     const auto status = entry.get("status").unsignedInteger().value_or(0);
-    if (event == "cancelled" && status < 300) {
-        return "cancelled; " + std::string(entry.text("result"));
-    }
-    const std::string result = status < 300 ? "done" : fmt::format("{} {}", status, entry.text("result"));
     const auto refusals = entry.get("refusalsNotLogged").unsignedInteger();
-    return checkOnly + result + (refusals ? fmt::format(" ({} more before it)", *refusals) : "");
+    const std::string before = refusals ? fmt::format(" ({} more before it)", *refusals) : "";
+    if (event == "cancelled") {
+        return (status < 300 ? "cancelled; " + std::string(entry.text("result"))
+                             : fmt::format("is not cancelled; {} {}", status, entry.text("result"))) +
+               before;
+    }
+    return checkOnly + (status < 300 ? "done" : fmt::format("{} {}", status, entry.text("result"))) + before;
 }
 
 std::string valueText(const Value& value) {
@@ -110,13 +112,16 @@ std::string changeText(const Dictionary& change) {
         text.append(part.empty() ? "" : " ").append(part);
     }
     text += ": ";
+    const Value& from = change.get("from");
+    const Value& to = change.get("to");
     if (change.get("secret") == Value(true)) {
-        return text + "(secret) changed";
+        text += "(secret) changed";
+    } else if (change.text("key").empty()) {
+        text += to.isNull() ? "removed" : from.isNull() ? "added" : "replaced";
+    } else {
+        text += valueText(from) + " -> " + valueText(to);
     }
-    if (change.text("key").empty()) {
-        return text + (change.get("to").isNull() ? "removed" : "added");
-    }
-    return text + valueText(change.get("from")) + " -> " + valueText(change.get("to"));
+    return text + (change.get("unverified") == Value(true) ? " (if it exists)" : "");
 }
 
 /// What was changed and what was not done, one part in each text.
@@ -170,7 +175,8 @@ void printTable(const Context& context, const std::deque<Dictionary>& entries) {
     // A beginning is of interest only while its end is missing.
     std::set<std::string, std::less<>> ended;
     for (const Dictionary& entry : entries) {
-        if (entry.text("event") != "begun") {
+        // A change that could not be cancelled is still running.
+        if (entry.text("event") != "begun" && entry.text("event") != "cancelled") {
             ended.emplace(entry.text("request"));
         }
     }

@@ -15,6 +15,7 @@ namespace {
 
 using testing::AllOf;
 using testing::Contains;
+using testing::ContainsRegex;
 using testing::EndsWith;
 using testing::HasSubstr;
 using testing::Not;
@@ -113,6 +114,33 @@ TEST(OtherVersion, AnswerOfAnyFormEndsInAMessageAndAStatus) {
             }
         }
     }
+}
+
+/// A change that is still running, although an account that may not do so has tried to cancel it.
+std::string auditOfARunningChange(const std::string&) {
+    return PlayedServer::reply(
+        R"({"more": false, "next": "n", "entries": [)"
+        R"({"event": "begun", "request": "1", "plugin": "p", "command": "change", "uid": 0, "user": "root"},)"
+        R"({"event": "cancelled", "request": "1", "plugin": "p", "command": "change", "uid": 20002, "user": "bert",)"
+        R"( "status": 403, "result": "NOT_PERMITTED"},)"
+        R"({"event": "begun", "request": "2", "plugin": "p", "command": "done", "uid": 0, "user": "root"},)"
+        R"({"event": "ended", "request": "2", "plugin": "p", "command": "done", "uid": 0, "user": "root",)"
+        R"( "status": 200, "changes": [)"
+        R"({"section": "cameras", "name": "Gate", "key": "", "from": "a", "to": null, "unverified": true},)"
+        R"({"section": "cameras", "name": "Roof", "key": "", "from": "a", "to": "b"}]}]})");
+}
+
+TEST(AuditVerb, RefusedCancellationIsShownAsSuchBesideTheChangeThatIsStillRunning) {
+    const PlayedServer server(auditOfARunningChange);
+    const std::string table = ctl(server, {"audit"}).output;
+    EXPECT_THAT(table, HasSubstr("is not cancelled; 403 NOT_PERMITTED"));
+    EXPECT_THAT(table, AllOf(ContainsRegex("root +p/change +begins"), Not(ContainsRegex("root +p/done +begins"))));
+}
+
+TEST(AuditVerb, ChangesHaveTheWordsOfTheDaemonsLog) {
+    const PlayedServer server(auditOfARunningChange);
+    EXPECT_THAT(ctl(server, {"audit"}).output,
+                AllOf(HasSubstr("cameras Gate: removed (if it exists)"), HasSubstr("cameras Roof: replaced")));
 }
 
 TEST(SlowDaemon, AnswerThatComesByteByByteIsReadToItsEnd) {
