@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <set>
 #include <utility>
 #include <vector>
 
@@ -16,6 +17,9 @@ namespace adminhost {
 namespace {
 
 constexpr std::size_t lineReportsMaximum = 1500;  ///< bytes of a line's changes, and as many of what was not done
+// The journal drops an event of more than 1024 fields. 32 KiB hold some 550 reports at the most.
+constexpr std::size_t keysMaximum = 400;
+constexpr std::size_t keyBytesMaximum = std::size_t{16} << 10U;
 
 /// The text up to a bound, without half a character, and the number of omitted bytes.
 std::string cut(const std::string& text, std::size_t maximum) {
@@ -76,31 +80,39 @@ void addReports(LogFields& fields, const AuditedReports& reports, const char* co
     if (reports.reported > 0) {
         fields.emplace_back(countField, std::to_string(reports.reported));
     }
-    std::vector<std::string> keys;
+    std::set<std::string> keys;
+    std::size_t keyBytes = 0;
+    bool full = false;
     std::int64_t number = 1;
     for (const Value& element : reports.kept) {
         const Dictionary& report = *element.dictionary();
+        if (report.contains("section")) {  // also of a change that is left out: it can be searched for
+            for (const std::string& key : keysOf(report)) {
+                std::string bounded = cut(key);
+                const std::size_t size = bounded.size();
+                if (keys.size() < keysMaximum && keyBytes + size <= keyBytesMaximum &&
+                    keys.insert(std::move(bounded)).second) {
+                    keyBytes += size;
+                }
+            }
+        }
+        if (full) {
+            continue;
+        }
         // The journal does not keep the order of fields.
         Dictionary numbered{{std::string(reportNumber), number++}};
         for (const DictionaryEntry& entry : bounded(report)) {
             numbered.set(entry.key, entry.value);
         }
         std::string text = jsonOf(numbered);
-        if (text.size() > left) {
-            break;
-        }
-        left -= text.size();
-        fields.emplace_back(field, std::move(text));
-        if (report.contains("section")) {
-            for (std::string& key : keysOf(report)) {
-                keys.push_back(cut(key));
-            }
+        full = text.size() > left;
+        if (!full) {
+            left -= text.size();
+            fields.emplace_back(field, std::move(text));
         }
     }
-    std::sort(keys.begin(), keys.end());
-    keys.erase(std::unique(keys.begin(), keys.end()), keys.end());
-    for (std::string& key : keys) {
-        fields.emplace_back("ADMINHOST_KEY", std::move(key));
+    for (const std::string& key : keys) {
+        fields.emplace_back("ADMINHOST_KEY", key);
     }
 }
 

@@ -70,8 +70,8 @@ constexpr std::size_t auditReportsMaximum = std::size_t{32} << 10U;  ///< bytes 
 /// In the JSON of a report's field: its number in the event, from 1.
 inline constexpr std::string_view reportNumber = "n";
 
-/// The fields beside the line itself. Long texts are cut; of many reports only the first are included, and the number
-/// of all.
+/// The fields beside the line itself. Long texts are cut; of many reports only the first are included, the number of
+/// all, and the first keys of all, up to a bound.
 [[nodiscard]] LogFields fieldsOf(const AuditEvent& event);
 /// "adminhostd: request ID PLUGIN/COMMAND by uid 1000 (anna) pid 42: ...", with the first reports.
 [[nodiscard]] std::string lineOf(const AuditEvent& event);

@@ -244,6 +244,35 @@ TEST(AuditEvent, LongTextsAndManyReportsAreCutAndCounted) {
     EXPECT_THAT(lineOf(event), HasSubstr(" more)"));
 }
 
+TEST(AuditEvent, KeysOfChangesThatAreLeftOutCanBeSearchedFor) {
+    AuditEvent event = sampleEvent();
+    event.changes = {};
+    for (int i = 0; i < 300; ++i) {
+        event.changes.kept.emplace_back(
+            Dictionary{{"section", "settings"}, {"key", i == 299 ? "port" : "note"}, {"to", std::string(200, 'x')}});
+    }
+    event.changes.reported = 300;
+    EXPECT_THAT(fieldOf(event, "ADMINHOST_CHANGE"), Not(HasSubstr("port")));
+    EXPECT_EQ(fieldOf(event, "ADMINHOST_KEY"), "note|port|settings|settings.note|settings.port");
+}
+
+TEST(AuditEvent, SearchedKeysAreBoundedSoThatTheJournalAcceptsTheEvent) {
+    AuditEvent event = sampleEvent();
+    event.changes = {};
+    for (int i = 0; i < 3000; ++i) {
+        event.changes.kept.emplace_back(
+            Dictionary{{"section", "s"}, {"key", (i % 2 == 0 ? "k" : std::string(1000, 'x')) + std::to_string(i)}});
+    }
+    event.changes.reported = 3000;
+    const LogFields fields = fieldsOf(event);
+    std::size_t bytes = 0;
+    for (const auto& [name, value] : fields) {
+        bytes += name.size() + value.size();
+    }
+    EXPECT_LT(fields.size(), 1024U) << "the journal drops an event with more fields";
+    EXPECT_LT(bytes, 64U << 10U);
+}
+
 TEST(AuditEvent, TextsCannotBreakTheLine) {
     AuditEvent event = sampleEvent();
     event.changes = {{Dictionary{{"section", "s"}, {"key", "k"}, {"to", "a\nadminhostd: forged\x1b[2J"}}}, 1};
