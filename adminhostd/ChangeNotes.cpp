@@ -51,6 +51,8 @@ bool ChangeNotes::begin(const LoadedPlugin& loaded, const protocol::Perform& ord
     about.caller = order.caller;
     about.user = accountNameOf(order.caller.uid);
     about.loginUser = order.caller.login == noLogin ? std::string() : accountNameOf(order.caller.login);
+    // The front knows this request. Its note may stay for long after its end: until the end has been logged.
+    _reported.insert(order.request);
     _note.emplace(about, command == nullptr ? Redaction() : Redaction(*command, order.arguments));
     if (!_note->problem().empty()) {
         logEvent("adminhostd: the beginning of a change cannot be noted: " + _note->problem());
@@ -63,6 +65,11 @@ bool ChangeNotes::begin(const LoadedPlugin& loaded, const protocol::Perform& ord
     _note->ended("nothing was run");
     _note.reset();
     return false;
+}
+
+void ChangeNotes::recorded(const protocol::Recorded& message) {
+    BegunRequest::remove(message.request);
+    _reported.erase(message.request);
 }
 
 void ChangeNotes::end(Outcome outcome) {

@@ -29,7 +29,7 @@ class ChangeNotes {
     /// The operation has ended. Does nothing if none has begun.
     void end(protocol::Outcome outcome);
     /// The front has logged the end.
-    static void recorded(const protocol::Recorded& message) { BegunRequest::remove(message.request); }
+    void recorded(const protocol::Recorded& message);
 
   private:
     [[nodiscard]] bool awaitProceed(const std::string& request);
@@ -38,7 +38,7 @@ class ChangeNotes {
     FrameReader& _reader;
     ForwardingSink& _sink;
     std::optional<BegunRequest> _note;  ///< about the operation that is running
-    std::set<std::string> _reported;    ///< requests of earlier workers
+    std::set<std::string> _reported;    ///< requests that the front knows, until their notes are removed
 };
 
 }  // namespace adminhost

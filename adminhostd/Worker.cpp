@@ -425,7 +425,7 @@ std::optional<int> Worker::serve(protocol::ToWorker message) {
         return std::nullopt;
     }
     if (const auto* recorded = std::get_if<protocol::Recorded>(&message)) {
-        ChangeNotes::recorded(*recorded);
+        _notes.recorded(*recorded);
         return std::nullopt;
     }
     protocol::Answer answered;

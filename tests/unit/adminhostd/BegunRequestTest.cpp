@@ -6,6 +6,9 @@
 
 #include <filesystem>
 #include <string>
+#include <utility>
+#include <variant>
+#include <vector>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -145,6 +148,40 @@ TEST_F(BegunRequests, NoteOfARequestThatIsRepeatedIsNotTakenForItsFormerOne) {
         EXPECT_EQ(BegunRequest::all().front().command, "again");
         changes.end(protocol::Outcome::answered);
     }
+}
+
+TEST_F(BegunRequests, WorkerDoesNotReportItsOwnNotesAsThoseOfAnEarlierWorker) {
+    int pair[2] = {-1, -1};
+    ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, pair), 0);
+    FileDescriptor ours(pair[0]);
+    const FileDescriptor fronts(pair[1]);
+    std::vector<std::string> unfinished;
+    {
+        ForwardingSink sink(ours.get());
+        FrameReader reader;
+        ChangeNotes changes(ours.get(), reader, sink);
+        protocol::Perform order;
+        order.command = "c";
+        for (const char* request : {"1-1", "1-2"}) {
+            ASSERT_TRUE(writeFrame(fronts.get(), protocol::frameOf(protocol::Proceed{request})));
+            order.request = request;
+            changes.reportUnfinished();
+            EXPECT_TRUE(changes.begin(LoadedPlugin(), order));
+            changes.end(protocol::Outcome::answered);
+        }
+        changes.reportUnfinished();
+    }
+    ours.close();
+    FrameReader reader;
+    while (auto frame = readFrame(fronts.get(), reader)) {
+        const auto message = protocol::toFront(*std::move(frame));
+        ASSERT_TRUE(message);
+        if (const auto* one = std::get_if<protocol::Unfinished>(&*message)) {
+            unfinished.push_back(one->request);
+        }
+    }
+    EXPECT_THAT(unfinished, IsEmpty()) << "the front has still to log the ends that it knows";
+    EXPECT_EQ(BegunRequest::all().size(), 2U) << "a next worker reports them";
 }
 
 }  // namespace
