@@ -254,7 +254,7 @@ std::optional<HttpAnswer> Front::refusal(const Exchange& exchange, const Target&
             return answer;
         }
     }
-    if (target.kind == Kind::request && _log.find(target.command) == nullptr) {
+    if (target.kind == Kind::request && requestFor(exchange.peer(), target.command) == nullptr) {
         return unknownRequest(target.command);
     }
     const bool post = target.kind == Kind::command;

@@ -9,6 +9,7 @@
 #include <iostream>
 #include <map>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <fmt/format.h>
@@ -207,7 +208,19 @@ TEST_F(Permission, RequestsOfOthersAreShownWithTheClassReadAndWithoutTheirReport
     ASSERT_TRUE(seen && seen->dictionary() != nullptr);
     EXPECT_EQ(seen->dictionary()->text("command"), "getState");
     EXPECT_FALSE(seen->dictionary()->contains("changes"));
-    EXPECT_EQ(as({test::bert}).get(address).status, 404) << "as for a request that does not exist";
+    const std::string absent = "/v1/requests/00000000-0000-4000-8000-000000000000";
+    for (const auto& [method, suffix, headers] :
+         std::vector<std::tuple<const char*, const char*, test::UnixHttp::Headers>>{
+             {"GET", "", {}},
+             {"DELETE", "", {}},
+             {"POST", "", {}},
+             {"GET", "?check=1", {}},
+             {"GET", "", {"Request-Deadline: soon"}}}) {
+        for (const std::string& one : {address, absent}) {
+            EXPECT_EQ(as({test::bert}).request(method, one + suffix, "", headers).status, 404)
+                << method << suffix << ": as for a request that does not exist";
+        }
+    }
 
     const test::HttpReply own = as({test::bert}).post("/v1/lumio/writeSettings", "{");
     const auto shown = parseJson(as({test::bert}).get("/v1/requests/" + own.headers.at("request-id")).body);
