@@ -26,12 +26,12 @@ ForwardingSink::~ForwardingSink() {
 }
 
 void ForwardingSink::beginOperation(std::string_view plugin, std::function<void()> onReading) {
-    _changes.clear();
+    _changes = {};
     _onReading = std::move(onReading);
     _former.emplace(plugin);
 }
 
-std::vector<Change> ForwardingSink::takeChanges() {
+ReportedChanges ForwardingSink::takeChanges() {
     _onReading = {};
     return std::exchange(_changes, {});
 }
@@ -49,8 +49,10 @@ void ForwardingSink::changed(Change change) {
         becomesSecret({change.section, change.identity, change.key});
     }
     // Beyond the bound, secret ones are kept: their former values are hidden once more when the entry is added.
-    if (change.secret || _changes.size() < changesMaximum) {
-        _changes.push_back(change);
+    if (change.secret || _changes.kept.size() < changesMaximum) {
+        _changes.kept.push_back(change);
+    } else if (change.section != "settings") {
+        ++_changes.droppedOfResources;
     }
     if (_note != nullptr) {
         _note->add(change);

@@ -11,12 +11,19 @@
 #include "platform/log/Log.h"
 
 #include <cstddef>
+#include <cstdint>
 #include <functional>
 #include <optional>
 #include <string_view>
 #include <vector>
 
 namespace adminhost {
+
+/// What an operation has changed.
+struct ReportedChanges {
+    std::vector<Change> kept;
+    std::uint64_t droppedOfResources = 0;  ///< changes beyond the bound; those of settings are not counted
+};
 
 /// The process's log and report sink while it lives.
 class ForwardingSink final : public LogSink, public ReportSink {
@@ -36,7 +43,7 @@ class ForwardingSink final : public LogSink, public ReportSink {
     void beginOperation(std::string_view plugin, std::function<void()> onReading = {});
     /// Called after the operation. Returns its changes: at most changesMaximum, and all secret ones above it. They are
     /// then forgotten.
-    [[nodiscard]] std::vector<Change> takeChanges();
+    [[nodiscard]] ReportedChanges takeChanges();
 
     void write(std::string_view event) noexcept override;
     /// A secret change first hides the former values in the plug-in's history: neither a worker that is killed in the
@@ -49,7 +56,7 @@ class ForwardingSink final : public LogSink, public ReportSink {
   private:
     int _descriptor;
     BegunRequest* _note = nullptr;
-    std::vector<Change> _changes;
+    ReportedChanges _changes;
     std::optional<FormerValues> _former;
     std::function<void()> _onReading;
 };

@@ -43,8 +43,8 @@ void KeptWrite::begin() {
     _entry = *entry;
 }
 
-void KeptWrite::complete(const std::vector<Change>& changes) const {
-    if (!_entry && changes.empty()) {
+void KeptWrite::complete(const ReportedChanges& changes) const {
+    if (!_entry && changes.kept.empty()) {
         return;
     }
     const auto history = historyOf(_loaded);
@@ -52,7 +52,7 @@ void KeptWrite::complete(const std::vector<Change>& changes) const {
         reportNoEntry(history.error());
         return;
     }
-    if (const auto error = history->keepResources(changes, _about)) {
+    if (const auto error = history->keepResources(changes.kept, _about, changes.droppedOfResources)) {
         logEvent("adminhostd: the history of this write is incomplete: " + textOf(*error));
         reportNotDone({"", "the history of this write is incomplete", textOf(error->description)});
     }

@@ -5,12 +5,12 @@
 // A history that cannot be written does not stop a write: on a full disk, this write may be what fixes it. The failure
 // is logged and reported.
 
+#include "adminhostd/ForwardingSink.h"
 #include "adminhostd/PluginFile.h"
 #include "adminhostd/SettingsHistory.h"
 
 #include <cstdint>
 #include <optional>
-#include <vector>
 
 namespace adminhost {
 
@@ -25,7 +25,7 @@ class KeptWrite {
     /// Adds the entry with the settings before the write.
     void begin();
     /// Adds what the write has changed: the settings to the entry, if there is one, and the other changes.
-    void complete(const std::vector<Change>& changes) const;
+    void complete(const ReportedChanges& changes) const;
 
   private:
     const LoadedPlugin& _loaded;

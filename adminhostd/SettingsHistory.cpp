@@ -297,7 +297,8 @@ std::optional<Error> SettingsHistory::hideFormerValues(const std::vector<SecretP
     return failed;
 }
 
-std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& changes, const Dictionary& about) const {
+std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& changes, const Dictionary& about,
+                                                    std::uint64_t dropped) const {
     std::vector<SecretPart> secret;
     Array kept;
     for (const Change& change : changes) {
@@ -309,7 +310,7 @@ std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& c
         }
     }
     std::optional<Error> notHidden = hideFormerValues(secret);
-    if (kept.empty()) {
+    if (kept.empty() && dropped == 0) {
         return notHidden;
     }
     // The same request may have set a plain value first.
@@ -324,6 +325,9 @@ std::optional<Error> SettingsHistory::keepResources(const std::vector<Change>& c
     Dictionary entry = about;
     entry.set("format", format);
     entry.set("changes", std::move(kept));
+    if (dropped > 0) {
+        entry.set("changesDropped", dropped);
+    }
     if (auto error = replacePlainly(entry, resourceEntryOf(_resources, number))) {
         return notHidden ? notHidden : error;
     }

@@ -45,14 +45,17 @@ class SettingsHistory {
     /// Adds an entry of the resources with these changes. Those of the section "settings" are left out; if there are no
     /// others, no entry is added. A value that has become secret is replaced by "(secret)" in this and all stored
     /// entries; if one of them cannot be replaced, the others are, the entry is added, and the error is returned.
-    [[nodiscard]] std::optional<Error> keepResources(const std::vector<Change>& changes, const Dictionary& about) const;
+    /// `dropped` changes of the same request are not in the list; the entry has their number.
+    [[nodiscard]] std::optional<Error> keepResources(const std::vector<Change>& changes, const Dictionary& about,
+                                                     std::uint64_t dropped = 0) const;
 
     /// The entries, oldest first: `about` with "number", "settings" (a secret's value is "(secret)") and, for a write
     /// that has ended, "changes" ({"key", "from", "to"}; a secret's have "secret" and, in place of values, "(secret)"
     /// and "(secret) changed"). An entry of an edit outside has "outside": true. An entry that lacks one of its files
     /// or cannot be read is left out. Entries of a newer format are counted in one log line.
     [[nodiscard]] Array settingsEntries() const;
-    /// The same for the resources: `about` with "number" and "changes", as requests report them.
+    /// The same for the resources: `about` with "number" and "changes", as requests report them, and, if there were too
+    /// many changes to keep, "changesDropped", the number of the others.
     [[nodiscard]] Array resourceEntries() const;
 
     /// Removes the remains of a process that was killed while it added an entry; keep() does so too. No other process

@@ -304,7 +304,7 @@ protocol::Answer Worker::perform(const LoadedPlugin& loaded, const protocol::Per
     const bool readsWithRevision = order.showsRevision && !held;  // a write has the revision that it leaves
     _sink.beginOperation(loaded.name, readsWithRevision ? [&] { ofRead = revisionNow(); } : std::function<void()>());
     auto response = callPlugin([&] { return plugin.perform(order.command, order.arguments); });
-    const std::vector<Change> reported = _sink.takeChanges();
+    const ReportedChanges reported = _sink.takeChanges();
     if (write) {
         write->complete(reported);
     }

@@ -11,6 +11,7 @@
 #include "platform/value/ValueText.h"
 
 #include <algorithm>
+#include <cstdint>
 #include <ctime>
 #include <iterator>
 #include <map>
@@ -20,6 +21,8 @@
 
 namespace adminhost::ctl {
 namespace {
+
+constexpr std::string_view droppedKey = "changesDropped";
 
 /// Names of the settings that a write can set and reading shows.
 std::vector<std::string> writableKeys(const StateForm& form) {
@@ -77,6 +80,11 @@ std::string elementChangeText(const StateForm& form, const Dictionary& change) {
     return entry + ": " + valueText(from, "(not known)") + " -> " + valueText(to, "(not set)") + doubt;
 }
 
+/// How many changes of a request its entry does not hold, because there were too many.
+std::uint64_t droppedChanges(const Dictionary& entry) {
+    return entry.get(droppedKey).unsignedInteger().value_or(0);
+}
+
 /// What an entry changed, a line each.
 std::vector<std::string> changeTexts(const StateForm& form, const Dictionary& entry) {
     const Array* changes = entry.get("changes").array();
@@ -89,6 +97,9 @@ std::vector<std::string> changeTexts(const StateForm& form, const Dictionary& en
             texts.push_back(change->contains("section") ? elementChangeText(form, *change)
                                                         : settingChangeText(form, *change));
         }
+    }
+    if (const std::uint64_t dropped = droppedChanges(entry); dropped > 0) {
+        texts.push_back(fmt::format("and {} more, which are not recorded", dropped));
     }
     return texts;
 }
@@ -114,6 +125,9 @@ bool addTo(Array& entries, const Dictionary& resources) {
         if (!request.empty() && value.dictionary()->text("request") == request && changes != nullptr &&
             changes->array() != nullptr && more != nullptr) {
             changes->array()->insert(changes->array()->end(), more->begin(), more->end());
+            if (resources.contains(droppedKey)) {
+                value.dictionary()->set(droppedKey, resources.get(droppedKey));
+            }
             return true;
         }
     }
@@ -304,13 +318,20 @@ std::string kindOf(const ListForm& list, const std::string& inFile) {
 void restoreChange(Restoration& restoration, const ListForm& list, const Dictionary& change,
                    const CurrentState& current) {
     const std::string key(change.text("key"));
-    const std::string line = elementChangeText(current.form, change);
-    const auto lose = [&](const char* why) { restoration.lost.push_back(line + ": not restored, " + why); };
     const std::vector<Element>& all = elementsOf(current.state, list);
-    const auto present = std::find_if(
-        all.begin(), all.end(), [&](const Element& element) { return element.identity == change.text("identity"); });
+    // The database chooses the identity of an element that is added: the change has only its name.
+    const auto present = std::find_if(all.begin(), all.end(), [&](const Element& element) {
+        return change.text("identity").empty() ? element.label == change.text("name")
+                                               : element.identity == change.text("identity");
+    });
     const bool isPresent = present != all.end();
     const std::string name(!isPresent ? change.text("name") : present->label);
+    Dictionary named = change;
+    if (named.text("name").empty()) {
+        named.set("name", name);
+    }
+    const std::string line = elementChangeText(current.form, named);
+    const auto lose = [&](const char* why) { restoration.lost.push_back(line + ": not restored, " + why); };
     WantedElement wanted{list.byIdentity && isPresent ? present->identity : name, {}, {}, {}, false, false};
     wanted.shownAs = name;
     if (change.get("secret") == Value(true)) {
@@ -343,6 +364,9 @@ void restoreChange(Restoration& restoration, const ListForm& list, const Diction
         } else {
             wanted.lists[key] = {textOf(from)};
         }
+    } else if (list.fieldOf(key) == nullptr) {
+        lose("a rollback cannot write this part");
+        return;
     } else if (const Value before = valueBefore(list, change); !before.isNull()) {
         wanted.fields.set(key, before);
     } else {
@@ -381,11 +405,22 @@ Restoration restorationOf(const Array& entries, Array::const_iterator entry, con
     // The last change of a thing is undone first.
     for (std::size_t i = changes == nullptr ? 0 : changes->size(); i > 0; --i) {
         const Dictionary* change = (*changes)[i - 1].dictionary();
-        for (const ListForm& list : current.form.lists()) {
-            if (change != nullptr && change->get("section") == Value(list.key)) {
-                restoreChange(restoration, list, *change, current);
-            }
+        if (change == nullptr || !change->contains("section")) {
+            continue;  // a setting
         }
+        const std::vector<ListForm>& lists = current.form.lists();
+        const auto list = std::find_if(lists.begin(), lists.end(),
+                                       [&](const ListForm& one) { return change->get("section") == Value(one.key); });
+        if (list != lists.end()) {
+            restoreChange(restoration, *list, *change, current);
+        } else {
+            restoration.lost.push_back(elementChangeText(current.form, *change) +
+                                       ": not restored, a rollback cannot write this part");
+        }
+    }
+    if (const std::uint64_t dropped = droppedChanges(*entry->dictionary()); dropped > 0) {
+        restoration.lost.push_back(
+            fmt::format("{} more changes of that request: not restored, the history does not hold them", dropped));
     }
     return restoration;
 }

@@ -128,6 +128,15 @@ void SampleRoot::remove(const std::string& hostPath) const {
     fs::remove_all(disk(hostPath));
 }
 
+void SampleRoot::removeAccount(const std::string& name) const {
+    std::istringstream all(read("/etc/passwd"));
+    std::string left;
+    for (std::string line; std::getline(all, line);) {
+        left += line.starts_with(name + ':') ? "" : line + '\n';
+    }
+    write("/etc/passwd", left);
+}
+
 void SampleRoot::setSwitch(const std::string& name, const std::string& content) const {
     write("/etc/demo/" + name, content);
 }

@@ -63,6 +63,8 @@ class SampleRoot {
     /// Writes a file, with its directories. A link there (the SQL tool's) is replaced, never followed.
     void write(const std::string& hostPath, const std::string& content) const;
     void remove(const std::string& hostPath) const;  ///< a file or a whole directory; may be missing
+    /// Removes a user from the account files. The access lists keep the user's UUID.
+    void removeAccount(const std::string& name) const;
 
     /// Sets a switch of a stand-in, for example ("lumioctl.exit", "3"). See demo/README.md.
     void setSwitch(const std::string& name, const std::string& content) const;

@@ -1,6 +1,7 @@
 // The history of properties, cameras and access lists, and their recovery.
 
 #include "platform/json/Json.h"
+#include "platform/plist/PropertyList.h"
 #include "platform/value/ValueText.h"
 #include "tests/system/apply/ControlledService.h"
 
@@ -85,6 +86,47 @@ TEST_F(LookingBack, WhatCannotBeRestoredIsSaidBeforeAnythingIsWritten) {
     ASSERT_EQ(ctl({"property", "set", "upload_token", "@" + file("token", "new")}).status, 0);
     const ProgramResult secret = ctl({"rollback", newest(), "--dry-run"});
     EXPECT_THAT(secret.output, HasSubstr("not restored, a stored secret cannot be written back\nno change\n"));
+}
+
+TEST_F(LookingBack, RenamedPropertyIsNotRestoredAndFailsTheRollback) {
+    std::string id = root.sql("select id from properties where name='default_language'");
+    id.pop_back();
+    ASSERT_EQ(ctl({"writeSettings", "configuration.properties.0._id_=" + id,
+                   "configuration.properties.0.name=first_language"})
+                  .status,
+              0);
+    const ProgramResult renamed = ctl({"rollback", newest()});
+    EXPECT_EQ(renamed.status, 1);
+    EXPECT_THAT(
+        renamed.output,
+        AllOf(HasSubstr("properties.default_language.name: \"default_language\" -> \"first_language\": not restored, "),
+              HasSubstr("no change\n")));
+}
+
+TEST_F(LookingBack, AccessOfAnAccountThatIsGoneIsNotRestoredAndFailsTheRollback) {
+    const std::string uuid = SampleRoot::uuidOf("user", "juergen");
+    root.removeAccount("juergen");
+    ASSERT_EQ(ctl({"access", uuid, "--revoke"}).status, 0);
+    const ProgramResult revoked = ctl({"rollback", newest()});
+    EXPECT_EQ(revoked.status, 1);
+    EXPECT_THAT(revoked.output,
+                AllOf(HasSubstr("cameras.\"Studio A\".access: \"" + uuid + "\" -> (not set): not restored, "),
+                      HasSubstr("no change\n")));
+}
+
+TEST_F(LookingBack, ChangesThatTheHistoryCouldNotKeepAreCountedAndFailTheRollback) {
+    ASSERT_EQ(ctl({"property", "set", "colour", "blue"}).status, 0);
+    const HostPath entry(root.path() + "/var/lib/adminhostd/history/lumio/resources/00000001.plist");
+    auto stored = readPropertyList(diskPath(entry));
+    ASSERT_TRUE(stored && stored->dictionary() != nullptr);
+    stored->dictionary()->set("changesDropped", 200);
+    ASSERT_TRUE(writePropertyList(*stored, entry));
+    EXPECT_THAT(ctl({"history"}).output, ContainsRegex("colour.*\n +and 200 more, which are not recorded"));
+    const ProgramResult rollback = ctl({"rollback", newest()});
+    EXPECT_EQ(rollback.status, 1);
+    EXPECT_THAT(rollback.output, AllOf(HasSubstr("200 more changes of that request: not restored, "),
+                                       HasSubstr("properties.colour: \"blue\" -> (removed): applied\n")));
+    EXPECT_EQ(row("colour"), "");
 }
 
 TEST_F(LookingBack, HistoryIsFilteredAndHasSecondsAndZone) {

@@ -31,14 +31,6 @@ class People : public OvertakenService {
         }
         return names;
     }
-    void dismiss(const std::string& name) const {
-        std::istringstream all(root.read("/etc/passwd"));
-        std::string left;
-        for (std::string line; std::getline(all, line);) {
-            left += line.starts_with(name + ':') ? "" : line + '\n';
-        }
-        root.write("/etc/passwd", left);
-    }
     [[nodiscard]] std::size_t writes() const {
         std::istringstream lines(daemon.log());
         std::size_t count = 0;
@@ -156,7 +148,7 @@ TEST_F(People, RevokeOfEntriesThatAnotherClientHasRemovedIsSuccess) {
 
 TEST_F(People, AccountThatIsGoneIsShownAndRemovedByItsUuid) {
     const std::string uuid = SampleRoot::uuidOf("user", "juergen");
-    dismiss("juergen");
+    root.removeAccount("juergen");
     const ProgramResult shownByUuid = ctl({"access", uuid, "--languages", "en"});
     EXPECT_EQ(shownByUuid.status, 0) << shownByUuid.output;
     EXPECT_THAT(shownByUuid.output, AllOf(HasSubstr(uuid + " is not in the directory"), HasSubstr("Studio A"),
@@ -175,7 +167,7 @@ TEST_F(People, AccountThatIsGoneIsShownAndRemovedByItsUuid) {
 
 TEST_F(People, EntryThatTheServiceLeavesIsAFailure) {
     const std::string uuid = SampleRoot::uuidOf("user", "juergen");
-    dismiss("juergen");
+    root.removeAccount("juergen");
     root.setSwitch("lumioconfig.error", "no such name");
     root.setSwitch("lumioconfig.exit", "2");
     const ProgramResult result = ctl({"access", uuid, "--revoke"});

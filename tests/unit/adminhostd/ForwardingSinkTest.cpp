@@ -79,7 +79,7 @@ TEST_F(Forwarding, FormerValueIsHiddenWhenItsSecretIsAnnounced) {
     EXPECT_EQ(formerValue(), Value("plain")) << "another property's";
     announceSecret({"properties", "3", "value"});
     EXPECT_EQ(formerValue(), Value("(secret)"));
-    EXPECT_TRUE(sink.takeChanges().empty()) << "an announcement is no change";
+    EXPECT_TRUE(sink.takeChanges().kept.empty()) << "an announcement is no change";
 }
 
 TEST_F(Forwarding, SecretChangeAfterTheMaximumOfChangesHidesTheFormerValuesAndIsKept) {
@@ -96,9 +96,11 @@ TEST_F(Forwarding, SecretChangeAfterTheMaximumOfChangesHidesTheFormerValuesAndIs
         }
         reportChange(changeOf("3", nullptr, true));
         EXPECT_EQ(formerValue(), Value("(secret)"));
-        const std::vector<Change> changes = sink.takeChanges();
-        EXPECT_EQ(changes.size(), ForwardingSink::changesMaximum + 1);
-        EXPECT_EQ(changes.back().identity, "3");
+        const ReportedChanges changes = sink.takeChanges();
+        EXPECT_EQ(changes.kept.size(), ForwardingSink::changesMaximum + 1);
+        EXPECT_EQ(changes.kept.back().identity, "3");
+        EXPECT_EQ(changes.droppedOfResources, 5U);
+        EXPECT_EQ(sink.takeChanges().droppedOfResources, 0U);
     }
     ::shutdown(ends[0], SHUT_RDWR);
     front.join();

@@ -141,6 +141,17 @@ TEST_F(HistoryTest, OnlyItsOwnerCanEnterTheDirectory) {
     }
 }
 
+TEST_F(HistoryTest, EntryHasTheNumberOfChangesThatItDoesNotHold) {
+    ASSERT_FALSE(history.keepResources({resourceChange("value", 1, 2)}, {}, 200));
+    ASSERT_FALSE(history.keepResources({}, {}, 3));
+    ASSERT_FALSE(history.keepResources({resourceChange("value", 2, 3)}, {}));
+    const Array entries = history.resourceEntries();
+    ASSERT_EQ(entries.size(), 3U);
+    EXPECT_EQ(entries[0].dictionary()->get("changesDropped"), Value(200));
+    EXPECT_EQ(entries[1].dictionary()->get("changesDropped"), Value(3));
+    EXPECT_FALSE(entries[2].dictionary()->contains("changesDropped"));
+}
+
 TEST_F(HistoryTest, SettingsAndResourcesHaveBoundsOfTheirOwnAndAreNeverRenumbered) {
     for (int i = 0; i < 53; ++i) {
         write({{"a", i}}, Dictionary{{"a", i + 1}});
