@@ -178,6 +178,16 @@ std::vector<Entry> entriesOf(const Rows& rows, const std::string& account, std::
     return entries;
 }
 
+void reportRemoved(const Entry& entry, bool unverified) {
+    adminhost::reportChange(
+        {entry.type + 's', entry.resource, "", "access", entry.uuid, Value(), false, {}, unverified});
+}
+
+void reportLeft(const Entry& entry, const std::string& reason, const std::string& words) {
+    adminhost::reportNotDone(
+        {"resources", "not removed from the " + entry.type + ' ' + entry.resource + ": " + reason, words});
+}
+
 bool isListed(const Lists& lists, const Entry& entry) {
     const auto list = lists.find(entry.list);
     return list != lists.end() && std::find(list->second.begin(), list->second.end(), entry.uuid) != list->second.end();
@@ -249,31 +259,37 @@ Result<AccessRemoval> removeUnknownAccount(const std::string& uuid, std::span<co
         if (left.empty()) {
             break;
         }
+        std::set<std::string> failed;  // lists, in this round
         for (const Entry& entry : left) {
             if (const auto error = resourceOf(entry)->_executeLumioConfigWithCommand(
                     "--remove_access", entry.type, entry.resource, kind, {entry.uuid})) {
                 words[entry.list] = error->description.value_or("");
+                failed.insert(entry.list);
             }
         }
         const auto now = accessLists();
         if (!now) {
+            // Past the deadline, for example. What may be gone must still be in the audit and in the history.
+            for (const Entry& entry : left) {
+                if (failed.contains(entry.list)) {
+                    reportLeft(entry, "the configuration tool failed", words[entry.list]);
+                } else {
+                    reportRemoved(entry, true);
+                }
+            }
             return failure(now.error());
         }
         std::erase_if(left, [&](const Entry& entry) {
             if (isListed(*now, entry)) {
                 return false;
             }
-            adminhost::reportChange(
-                {entry.type + 's', entry.resource, "", "access", entry.uuid, Value(), false, {}, false});
+            reportRemoved(entry, false);
             ++removed;
             return true;
         });
     }
     for (const Entry& entry : left) {
-        adminhost::reportNotDone(
-            {"resources",
-             "not removed from the " + entry.type + ' ' + entry.resource + ": the configuration tool left the entry",
-             words[entry.list]});
+        reportLeft(entry, "the configuration tool left the entry", words[entry.list]);
     }
     return AccessRemoval{removed, left.size()};
 }

@@ -29,7 +29,8 @@ struct AccessRemoval {
 /// Removes the account from the access lists of the named resources (UUIDs), of all without names, with the
 /// configuration tool, which is given the UUID in place of a short name: an account that the directory does not know
 /// has none. Reports each removal, and each entry that is still in the database afterwards. Fails, and runs nothing, if
-/// the directory knows the account or cannot be asked, or if the database cannot be read.
+/// the directory knows the account or cannot be asked, or if the database cannot be read. If the database cannot be
+/// read afterwards, it reports what the tool has removed as unverified, and fails.
 [[nodiscard]] adminhost::Result<AccessRemoval> removeUnknownAccount(const std::string& uuid,
                                                                     std::span<const std::string> resources);
 

@@ -143,6 +143,20 @@ TEST_F(AccessOverview, EntryThatTheToolLeavesIsReported) {
     EXPECT_THAT(reports.changes, IsEmpty());
 }
 
+TEST_F(AccessOverview, RemovalsAreReportedAsUnverifiedIfTheListsCannotBeReadAgain) {
+    root.writeTool(tool, "#!/bin/sh\n[ \"$3\" = camera ] || { echo 'no such name' >&2; exit 2; }\necho broken > '" +
+                             root.path(database).string() + "'\n");
+    const adminhost::test::CapturedReports reports;
+    EXPECT_FALSE(removeUnknownAccount(gone, {}));
+    ASSERT_THAT(reports.changes, SizeIs(1)) << "what is gone must be in the audit and in the history";
+    EXPECT_EQ(reports.changes[0].identity, "C-7");
+    EXPECT_EQ(reports.changes[0].from, Value(gone));
+    EXPECT_TRUE(reports.changes[0].unverified);
+    ASSERT_THAT(reports.parts, SizeIs(1));
+    EXPECT_EQ(reports.parts[0].reason, "not removed from the workflow W-7: the configuration tool failed");
+    EXPECT_EQ(reports.parts[0].toolMessage, "no such name");
+}
+
 TEST_F(AccessOverview, AccountThatTheDirectoryKnowsIsNotRemoved) {
     const auto outcome = removeUnknownAccount(uuidOf("user:anna"), {});
     ASSERT_FALSE(outcome);
