@@ -202,17 +202,28 @@ std::int32_t LumioRequestHandler::writeSettingsFiles(Dictionary& config, Diction
 
 namespace {
 
+struct FileWrite {
+    std::int32_t status = 0;
+    bool isInPlace = false;  ///< also true if only the flush of the directory has failed
+};
+
 /// Writes the file of one set operation and reports the outcome for its keys.
-std::int32_t writeAndReport(const SettingKeys& keys, const Dictionary& config, const Dictionary& before,
-                            const Dictionary& after, const HostPath& path, Dictionary& result) {
-    const std::int32_t status = statusOf(writeSettingsFile(after, path), result);
-    if (status == 0) {
+FileWrite writeAndReport(const SettingKeys& keys, const Dictionary& config, const Dictionary& before,
+                         const Dictionary& after, const HostPath& path, Dictionary& result) {
+    const auto error = writeSettingsFile(after, path);
+    const std::int32_t status = statusOf(error, result);
+    const bool isInPlace = !error || error->underlying.domain == adminhost::notFlushed;
+    if (isInPlace) {
         reportSettingChanges(keys, before, after);
     } else {
         reportSettingsNotDone(keys, config, "not written: the file cannot be written",
                               textOf(result.get("errorDescription")));
     }
-    return status;
+    if (isInPlace && error) {
+        reportSettingNotDone({}, "written, but the settings file might be lost in a power cut",
+                             textOf(result.get("errorDescription")));
+    }
+    return {status, isInPlace};
 }
 
 /// The status if the identity preferences cannot be read. The place of the other files is not known then, so no file is
@@ -237,7 +248,8 @@ std::int32_t LumioRequestHandler::setIdentityPreferencesFromConfig(Dictionary& c
         result.set("needsRecycleOrRestart", true);
     }
     copyKeys(identityPreferencesKeysToCopy(), config, prefs);
-    return writeAndReport(identityPreferencesKeysToCopy(), config, before, prefs, identityPreferencesPath(), result);
+    return writeAndReport(identityPreferencesKeysToCopy(), config, before, prefs, identityPreferencesPath(), result)
+        .status;
 }
 
 std::int32_t LumioRequestHandler::setMemberPreferencesFromConfig(Dictionary& config, Dictionary& result) {
@@ -249,7 +261,7 @@ std::int32_t LumioRequestHandler::setMemberPreferencesFromConfig(Dictionary& con
     const Dictionary before = startAt(path, cachedMemberPreferencesPath());
     Dictionary prefs = before;
     copyKeys(memberPreferencesKeysToCopy(), config, prefs);
-    return writeAndReport(memberPreferencesKeysToCopy(), config, before, prefs, path, result);
+    return writeAndReport(memberPreferencesKeysToCopy(), config, before, prefs, path, result).status;
 }
 
 std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& config, Dictionary& result) {
@@ -290,8 +302,8 @@ std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& co
             unresolved = host.error().description.value_or("not found");
         }
     }
-    const std::int32_t status = writeAndReport(clusterPreferencesKeysToCopy(), config, before, prefs, path, result);
-    if (status == 0) {
+    const FileWrite write = writeAndReport(clusterPreferencesKeysToCopy(), config, before, prefs, path, result);
+    if (write.isInPlace) {
         reportSecretChange(passwordKey, before, prefs);
         if (!unresolved.empty()) {
             reportSettingNotDone(controllerKey, "stored as given: the name cannot be resolved", unresolved);
@@ -300,7 +312,7 @@ std::int32_t LumioRequestHandler::setClusterPreferencesFromConfig(Dictionary& co
         reportSettingNotDone(passwordKey, "not written: the file cannot be written",
                              textOf(result.get("errorDescription")));
     }
-    return status;
+    return write.status;
 }
 
 std::optional<SettingsWriteError> LumioRequestHandler::writeIdentityPreferences(const Dictionary& prefs) {

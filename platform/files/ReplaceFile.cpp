@@ -317,7 +317,9 @@ Result<void> replaceFile(std::string_view bytes, const HostPath& path, mode_t ne
         return failed("replace", path, number);
     }
     if (const int number = flushDirectory(place); number != 0) {
-        return failed("flush the directory after replacing", path, number);
+        auto error = failed("flush the directory after replacing", path, number);
+        error.value().domain = notFlushed;
+        return error;
     }
     return {};
 }

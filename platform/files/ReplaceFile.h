@@ -12,6 +12,10 @@
 
 namespace adminhost {
 
+/// The domain of replaceFile()'s error if the new file is in place, but its directory could not be flushed: the file
+/// might be lost in a power cut.
+inline constexpr std::string_view notFlushed = "not_flushed";
+
 /// Writes a temporary file ".NAME.adminhost-" + 16 hexadecimal digits beside the file, flushes it, renames it over the
 /// file and flushes the directory. Owner, mode, access control list and extended attributes of the old file are kept;
 /// a new file has the given mode and belongs to the process's user. Labels and attributes that only the system may set,
@@ -22,7 +26,7 @@ namespace adminhost {
 ///
 /// On failure the old file is unchanged and no temporary file is left. The error (domain "posix", the system's number)
 /// names the step, the host path and the system's text. One failure comes too late for that: if the directory cannot be
-/// flushed, the new file is in place, but might be lost in a power cut. The error reports that.
+/// flushed, the new file is in place. That error has the domain notFlushed.
 ///
 /// Temporary files that killed processes left for the same file are removed first; those of running writers are not.
 /// Several processes may write the same file at once, also from machines that share the directory: one of them is the

@@ -6,6 +6,25 @@
 #include "tests/unit/handler/WriteSettingsFixture.h"
 
 #include <algorithm>
+#include <cerrno>
+
+#include <sys/syscall.h>
+#include <unistd.h>
+
+namespace {
+
+bool directoryFlushFails = false;
+
+}  // namespace
+
+extern "C" int fsync(int descriptor) {
+    struct stat status {};
+    if (directoryFlushFails && ::fstat(descriptor, &status) == 0 && S_ISDIR(status.st_mode)) {
+        errno = EIO;
+        return -1;
+    }
+    return static_cast<int>(::syscall(SYS_fsync, descriptor));
+}
 
 namespace lumio {
 namespace {
@@ -111,6 +130,28 @@ TEST_F(SettingsReports, PasswordIsReportedWithoutItsValues) {
     (void)write({{"nimbo_client_password", "another"}});
     (void)write({{"nimbo_client_password", ""}});
     EXPECT_THAT(reports.changes, ElementsAre(first, secret, secret));
+}
+
+TEST_F(SettingsReports, FileThatIsInPlaceButCannotBeFlushedHasItsChangesReported) {
+    directoryFlushFails = true;
+    const Dictionary answer = write({{"server_port", 9000}, {"member_uuid", "N"}});
+    directoryFlushFails = false;
+    EXPECT_EQ(answer.get("writeStatus"), Value(400));
+    EXPECT_EQ(file(identityFile).get("member_uuid"), Value("N"));
+    EXPECT_THAT(changedKeys(), ElementsAre("member_uuid"));
+    EXPECT_THAT(reports.parts, ElementsAre(IsNotDone("configuration", "cannot flush the directory"),
+                                           IsNotDone("configuration.server_port", "cannot flush the directory")));
+}
+
+TEST_F(SettingsReports, PasswordInAFileThatCannotBeFlushedIsReportedAsChanged) {
+    Dictionary config{{"nimbo_client_password", plainPassword}};
+    Dictionary result;
+    directoryFlushFails = true;
+    EXPECT_EQ(handler.setClusterPreferencesFromConfig(config, result), 400);
+    directoryFlushFails = false;
+    EXPECT_TRUE(file(clusterFile).contains("nimbo_client_password"));
+    EXPECT_THAT(changedKeys(), ElementsAre("nimbo_client_password"));
+    EXPECT_THAT(reports.parts, ElementsAre(IsNotDone("configuration", "cannot flush the directory")));
 }
 
 TEST_F(SettingsReports, FlagWithoutTheNameThatItIsAboutIsReportedAsIgnored) {
