@@ -160,7 +160,7 @@ constexpr std::array options = {
         sinceOption, "TIME",
         "Only from this time on: a date, today, yesterday, or 90min, 2h or 3d ago (with audit 24h if not given)"},
     VerbOption{userOption, "NAME", "Only by this account, by name or number"},
-    VerbOption{keyOption, "KEY", "Only changes of this setting, property, list or section (port, cameras.users)"},
+    VerbOption{keyOption, "KEY", "Only changes of this setting, list or section"},
 };
 
 }  // namespace

@@ -18,6 +18,7 @@
 #include "adminhostctl/desired/DesiredVerbs.h"
 #include "adminhostctl/lumio/LumioVerbs.h"
 #include "adminhostctl/lumio/ServiceVerbs.h"
+#include "adminhostctl/lumio/VerbExamples.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/StandardDescriptors.h"
 #include "platform/framework/Release.h"
@@ -71,6 +72,7 @@ std::vector<adminhost::ctl::Verb> allVerbs() {
                               adminhost::ctl::lumioVerbs(), adminhost::ctl::desiredVerbs()}) {
         all.insert(all.end(), table.begin(), table.end());
     }
+    adminhost::ctl::addExamples(all);
     return all;
 }
 

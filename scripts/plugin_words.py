@@ -6,7 +6,8 @@ usage: plugin_words.py [ROOT]   (the project's root: by default the directory ab
 The words are not listed here: they are the commands, keys, words and columns in the descriptions (commands/*.toml), and the
 tools, tables and names of several words that the plug-in's own rooms have in literals. A compound word ("server_port",
 "getCameras") is looked for everywhere, because it is not written by chance. Of the plain words, only the names of lists and
-dictionaries ("cameras") are looked for, as whole string literals: the name of a single value ("name") may be anyone's.
+dictionaries are looked for, because the name of a single value ("name") may be anyone's: a dictionary's ("configuration") as a
+whole string literal, a list's ("cameras") as a word within one.
 
 Some words of the plug-in are not its own and are permitted: plain words that the daemon's own documentation defines
 (docs/http.md, and the form of a description in commands/README.md), and a key that a room of platform/ documents in a header
@@ -21,8 +22,8 @@ sys.dont_write_bytecode = True
 import tree_check  # noqa: E402
 
 HOST = ["adminhostd", "platform", "adminhostctl"]
-# The verbs of this one service, and the program that joins them.
-NOT_HOST = ["adminhostctl/lumio", "adminhostctl/desired", "adminhostctl/Main.cpp"]
+# The verbs of this one service with examples of the others, and the program that joins them.
+NOT_HOST = ["adminhostctl/lumio", "adminhostctl/Main.cpp"]
 PLUGIN = ["plugin", "handler", "resources", "settings", "commands"]
 SOURCES = {".cpp", ".h"}
 TEXT = re.compile(r'"((?:[^"\\\n]|\\.)*)"')
@@ -38,9 +39,10 @@ def read(path):
 
 
 def described(root):
-    """The words of the descriptions, and those of them that name lists and dictionaries."""
+    """The words of the descriptions, and those of them that name lists and dictionaries, and lists only."""
     words = set()
     containers = set()
+    lists = set()
     for path in sorted((root / "commands").glob("*.toml")):
         command = tomllib.loads(read(path))
         words.add(path.stem)
@@ -50,9 +52,11 @@ def described(root):
                 words |= set(steps)
                 if description["type"] in ("list", "dictionary"):
                     containers.add(steps[-1])
+                if description["type"] == "list":
+                    lists.add(steps[-1])
                 words |= set(description.get("allowed", []))
                 words |= set(description.get("entry", {}).get("columns", []))
-    return words, containers
+    return words, containers, lists
 
 
 def named(root):
@@ -89,15 +93,21 @@ def of_the_platform(root):
     return keys
 
 
+def one_of(words):
+    """A pattern that finds each of them as a whole word, and no word if there are none."""
+    return re.compile(r"(?<![A-Za-z0-9_])(" + ("|".join(sorted(map(re.escape, words))) or "(?!)") + r")(?![A-Za-z0-9_])")
+
+
 def findings(root):
-    words, containers = described(root)
+    words, containers, lists = described(root)
     words |= named(root)
     rare = {word for word in words if COMPOUND.search(word)} - of_the_platform(root)
     plain = containers - rare - documented(root) - of_the_platform(root)
     if len(rare) < 20:
         yield f"only {len(rare)} words are known: the descriptions are not where they were"
         return
-    anywhere = re.compile(r"(?<![A-Za-z0-9_])(" + "|".join(sorted(map(re.escape, rare))) + r")(?![A-Za-z0-9_])")
+    anywhere = one_of(rare)
+    in_literals = one_of(plain & lists)
     for room in HOST:
         for path in sorted((root / room).rglob("*")):
             name = path.relative_to(root).as_posix()
@@ -105,7 +115,10 @@ def findings(root):
                 continue
             for number, line in enumerate(read(path).splitlines(), 1):
                 code = line.partition("//")[0]
-                for word in anywhere.findall(line) + [text for text in TEXT.findall(code) if text in plain]:
+                found = anywhere.findall(line)
+                for text in TEXT.findall(code):
+                    found += [text] if text in plain else in_literals.findall(text)
+                for word in found:
                     yield f"{name}:{number}: names \"{word}\", which only the plug-in knows"
 
 

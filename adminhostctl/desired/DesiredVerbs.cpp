@@ -128,7 +128,7 @@ ExitStatus settingsGet(const Context& context, Words arguments) {
                              "\" shows whether it is set");
         }
     }
-    const Dictionary settings = readSettings(context).state.settings;
+    const Dictionary settings = readSettingsSection(context).state.settings;
     if (arguments.empty()) {
         writeValue(context, settings, command.description, form.root());
         return ExitStatus::done;
@@ -164,7 +164,7 @@ ExitStatus settingsSet(const Context& context, Words arguments) {
         wanted.settings.set(name, valueOfWord(key, wordAt(arguments, 1), context.sources));
     }
     wanted.lookUp = true;
-    const CurrentState current = readSettings(context);
+    const CurrentState current = readSettingsSection(context);
     if (context.options.has(validateOption) && !passTrials(context, wanted, current)) {
         throw Failure(ExitStatus::failed, "nothing was written, because the setting failed a trial");
     }
@@ -231,21 +231,14 @@ std::vector<std::string> historyNumbers(const Context& context, const TypedArgum
 }
 
 constexpr std::array table = {
-    Verb{"settings get",
-         "[KEY]",
-         "Show the settings, or one of them",
-         0,
-         1,
-         &settingsGet,
-         {{"settings get", "settings get server_port"}},
-         &settingsAnd},
+    Verb{"settings get", "[KEY]", "Show the settings, or one of them", 0, 1, &settingsGet, {}, &settingsAnd},
     Verb{"explain",
          "KEY",
          "Explain a setting: unit, range, default, restart, last change",
          1,
          1,
          &explain,
-         {{"explain server_port", "--format json explain shared_filesystem"}},
+         {},
          &settingsAnd},
     Verb{"settings set",
          "KEY [VALUE|@FILE|@-] [--clear] [--force] [--dry-run] [--validate [--password-file FILE]]",
@@ -253,7 +246,7 @@ constexpr std::array table = {
          1,
          2,
          &settingsSet,
-         {{"settings set server_port 8170", "settings set nimbo_client_password @password.txt --validate"}},
+         {},
          &writableSettings},
     Verb{"export",
          "[FILE]",
@@ -268,7 +261,7 @@ constexpr std::array table = {
          1,
          mostFiles,
          &planFiles,
-         {{"plan host.toml", "plan base.toml host2.toml --only settings,cameras --exit-code"}}},
+         {}},
     Verb{"apply",
          "FILE... [--only SECTIONS] [--password-file FILE] [--force] [--dry-run] [--exit-code]",
          "Change what differs from the files, of which the later ones win",
@@ -282,7 +275,7 @@ constexpr std::array table = {
          0,
          0,
          &history,
-         {{"history --since yesterday", "--format json history --user anna --key server_port"}}},
+         {}},
     Verb{"rollback",
          "NUMBER [--dry-run]",
          "Restore the state before a change of the history",

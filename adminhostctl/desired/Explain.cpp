@@ -85,7 +85,7 @@ ExitStatus explain(const Context& context, std::span<const std::string> argument
         throw usageError("setting not found: " + name + didYouMean(name, known) +
                          "; \"adminhostctl settings get\" lists them");
     }
-    const State state = readSettings(context).state;
+    const State state = readSettingsSection(context).state;
     Dictionary all{{"setting", name}, {"meaning", key->help}};
     all.set("type", secret != nullptr ? "text, secret" : typeText(*key));
     const DescribedKey* answered = read.description.answerKey(form.root() + '.' + name);

@@ -284,7 +284,7 @@ CurrentState readState(const Context& context, const std::string& section) {
     return {std::move(form), std::move(state), answer.revision, std::move(unread), section, std::move(log)};
 }
 
-CurrentState readSettings(const Context& context) {
+CurrentState readSettingsSection(const Context& context) {
     return readState(context, StateForm(context.service.stateCommand("write").description).settingsSection());
 }
 

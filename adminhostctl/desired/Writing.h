@@ -24,7 +24,7 @@ struct CurrentState {
 [[nodiscard]] CurrentState readState(const Context& context, const std::string& section = {});
 
 /// Reads the section of the settings only.
-[[nodiscard]] CurrentState readSettings(const Context& context);
+[[nodiscard]] CurrentState readSettingsSection(const Context& context);
 
 /// Throws Failure(failed) with the reasons and the log lines if parts of the state could not be read.
 void requireWhole(const CurrentState& current);

@@ -108,7 +108,7 @@ std::string stepLeft(const Context& context, const NewAccount& account, const st
         return "the account has no Kerberos authority: create its principal on the Kerberos server with the account's "
                "password, and store it in the account's record, or name the node's realm in the daemon's configuration";
     }
-    const Value controller = readSettings(context).state.settings.get(controllerSetting);
+    const Value controller = readSettingsSection(context).state.settings.get(controllerSetting);
     if (controller.string() == nullptr || controller.string()->empty()) {
         return "no grid controller is set, so the sign-in was not tried: adminhostctl settings set " +
                std::string(controllerSetting) + " HOST";
@@ -160,7 +160,7 @@ ExitStatus accountCreate(const Context& context, std::span<const std::string> ar
     // Before the account is created: its password would be lost if the state cannot be read.
     std::optional<CurrentState> current;
     if (context.options.has(saveOption)) {
-        current = readSettings(context);
+        current = readSettingsSection(context);
     }
     ExitStatus status = ExitStatus::done;
     const auto answer = askOnce(context, command, request, status);

@@ -60,7 +60,18 @@ TEST_F(PluginWords, CommandKeyColumnToolAndTableAreNamedWithFileAndLine) {
     EXPECT_THAT(of("platform/json/Extra.h", "/// \"server_port\""), testing::StartsWith("platform/json/Extra.h:1: "));
 }
 
-TEST_F(PluginWords, PlainWordsCountOnlyAsWholeLiterals) {
+TEST_F(PluginWords, DesiredStateKnowsNoServiceAndTheVerbsOfThisOneDo) {
+    EXPECT_THAT(of("adminhostctl/desired/Extra.cpp", "call(\"server_port\");"), testing::HasSubstr("\"server_port\""));
+    EXPECT_EQ(of("adminhostctl/lumio/Extra.cpp", "call(\"server_port\");"), "");
+}
+
+TEST_F(PluginWords, NameOfAListCountsWithinALiteralAndNotWithinAWord) {
+    EXPECT_THAT(of("adminhostctl/Extra.cpp", "say(\"a section (cameras.users)\");"),
+                testing::HasSubstr("names \"cameras\""));
+    EXPECT_EQ(of("adminhostctl/Extra.cpp", "say(\"camerashop\"); // cameras"), "");
+}
+
+TEST_F(PluginWords, PlainWordsOfDictionariesCountOnlyAsWholeLiterals) {
     EXPECT_THAT(of("adminhostd/Extra.cpp", "find(\"cameras\");"), testing::HasSubstr("names \"cameras\""));
     EXPECT_THAT(of("adminhostd/Extra.cpp", "find(\"configuration\");"), testing::HasSubstr("names \"configuration\""));
     EXPECT_EQ(of("adminhostd/Extra.cpp", "// the daemon's configuration, and no cameras"), "");

@@ -4,6 +4,7 @@
 #include "adminhostctl/desired/DesiredVerbs.h"
 #include "adminhostctl/lumio/LumioVerbs.h"
 #include "adminhostctl/lumio/ServiceVerbs.h"
+#include "adminhostctl/lumio/VerbExamples.h"
 
 #include <algorithm>
 #include <sstream>
@@ -21,6 +22,7 @@ std::vector<Verb> allVerbs() {
     for (const auto& table : {serviceVerbs(), generalVerbs(), lumioVerbs(), desiredVerbs()}) {
         all.insert(all.end(), table.begin(), table.end());
     }
+    addExamples(all);
     return all;
 }
 
