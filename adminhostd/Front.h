@@ -48,7 +48,7 @@ class Front {
 
     /// Handles a request whose head has arrived. Returns the answer if it needs no body (not permitted, not found,
     /// malformed), else the function that serves it once its body is there: at once, or, for an operation, after it has
-    /// run. Permission, address and id are checked here only.
+    /// run. The id is checked here only; permission and address are checked again before an operation.
     [[nodiscard]] std::variant<HttpAnswer, HttpServer::Serve> head(Exchange& exchange);
 
   private:

@@ -235,14 +235,14 @@ class Check {
                                                 std::all_of(text->begin(), text->end(), isDigit)
                                           : value.unsignedInteger().has_value();
         if (!good) {
-            add(path, "must be a row number: decimal digits only", "send the number that reading answered");
+            add(path, "must be a row number: decimal digits only", "send the number that reading returned");
         }
     }
 
     void identifier(const std::string& text, const std::string& path) {
         if (text.empty() || text.front() == '-' || !std::all_of(text.begin(), text.end(), isIdentifierCharacter)) {
             add(path, "must be an identifier: letters, digits and hyphens, not beginning with a hyphen",
-                "send the identifier that reading answered");
+                "send the identifier that reading returned");
         }
         length(text, path);
     }

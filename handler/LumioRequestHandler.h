@@ -3,8 +3,8 @@
 // The request handler: the operations through which administrators reach the service.
 //
 // An operation that serves a command has the command's name followed by WithRequest. It blocks until its response is
-// built and reports failure in that response. Nothing is kept between requests. Every diagnostic line starts with
-// "adminhost_lumio: ". Each operation is in the source file of its group.
+// built and reports failure in that response. Nothing is kept between requests. Every log line of this room starts
+// with "adminhost_lumio: ". Each operation is in the source file of its group.
 
 #include "platform/framework/PluginRequestHandler.h"
 #include "platform/value/Error.h"
