@@ -120,8 +120,9 @@ ExitStatus bridge(const Context& context, std::span<const std::string> /*argumen
     if (context.service.isRemote()) {
         throw usageError("bridge connects with the daemon of this machine; --host cannot be used with it");
     }
-    const FileDescriptor socket = connectedTo(context.service.place());
     static_cast<void>(std::signal(SIGPIPE, SIG_IGN));
+    context.out << bridgeBegin << std::flush;
+    const FileDescriptor socket = connectedTo(context.service.place());
     context.out << bridgeGreeting << std::flush;
     if (context.out) {
         carry(socket.get());

@@ -184,13 +184,11 @@ bool Connection::connectToHost(std::chrono::milliseconds& timeout) {
         return false;
     }
     const auto begin = std::chrono::steady_clock::now();
-    _sockets->provide(_host->connect(timeout));
-    const auto taken = std::chrono::steady_clock::now() - begin;
-    if (_host->asks()) {
-        _loginTime += taken;
-    } else {
-        timeout -= std::chrono::floor<std::chrono::milliseconds>(taken);
-    }
+    const RemoteHost::Connected connected = _host->connect(timeout);
+    _sockets->provide(connected.socket);
+    _loginTime += connected.login;
+    timeout -=
+        std::chrono::floor<std::chrono::milliseconds>(std::chrono::steady_clock::now() - begin - connected.login);
     return true;
 }
 

@@ -162,7 +162,16 @@ DaemonReply DaemonClient::patiently(Milliseconds timeout, const Send& send) {
     }
 }
 
+void DaemonClient::refuseOlderDaemon() {
+    if (isRemote() && !_isChecked) {
+        static_cast<void>(overview());
+    }
+}
+
 Value DaemonClient::get(const std::string& path) {
+    if (path != overviewPath) {
+        refuseOlderDaemon();
+    }
     const bool isQuick = path == overviewPath || path.starts_with(requestsPath);
     const Milliseconds timeout = _timeout ? *_timeout : isQuick ? Milliseconds(quickTimeout) : timeoutOf(std::nullopt);
     const DaemonReply answer = patiently(timeout, [&](Milliseconds left) { return _connection.get(path, left); });
@@ -199,10 +208,12 @@ Value DaemonClient::overview() {
     }
     const auto deadline = said.get("deadlineSeconds").integer();
     _deadline = deadline ? seconds(*deadline) : usualDeadline;
+    _isChecked = true;
     return overview;
 }
 
 void DaemonClient::cancel(const std::string& requestId) {
+    refuseOlderDaemon();
     const std::string path = requestsPath + Connection::escaped(requestId);
     const DaemonReply reply = _connection.remove(path, _timeout.value_or(quickTimeout));
     if (reply.status < statusOk || reply.status >= 300) {
@@ -283,6 +294,7 @@ CommandRef DaemonClient::stateCommand(std::string_view state) {
 }
 
 CommandAnswer DaemonClient::ask(const CommandRef& command, Dictionary request, const std::string& revision) {
+    refuseOlderDaemon();
     if (_languages) {
         addLanguages(request, command.description, *_languages);
     }
@@ -331,6 +343,7 @@ CommandAnswer DaemonClient::ask(const CommandRef& command, Dictionary request, c
 }
 
 void DaemonClient::check(const CommandRef& command, const Dictionary& request) {
+    refuseOlderDaemon();
     const std::string path = commandPath(command) + "?check=1";
     const std::string body = jsonOf(request);
     const DaemonReply reply = patiently(timeoutOf(command.description.deadline()), [&](Milliseconds left) {
@@ -394,11 +407,11 @@ std::vector<ReportedGap> DaemonClient::gapsOf(const CommandAnswer& answer) {
 RequestReport DaemonClient::settledReport(const std::string& requestId) {
     constexpr auto patience = std::chrono::seconds(10);
     constexpr auto pause = std::chrono::milliseconds(100);
-    const auto end = std::chrono::steady_clock::now() + patience;
+    const auto end = std::chrono::steady_clock::now() + patience - _connection.loginTime();
     while (true) {
         RequestReport found = report(requestId);
         const bool settled = found.state == RequestReport::State::done || found.state == RequestReport::State::unknown;
-        if (settled || std::chrono::steady_clock::now() >= end) {
+        if (settled || std::chrono::steady_clock::now() >= end + _connection.loginTime()) {
             return found;
         }
         // Each attempt over ssh is a login.

@@ -143,6 +143,9 @@ class DaemonClient {
     using Milliseconds = std::chrono::milliseconds;
 
     [[noreturn]] void fail(const DaemonReply& answer);
+    /// Before the first call to the daemon of another machine, which may be of any release: asks for its overview, with
+    /// a timeout of its own. Throws Failure as overview() does.
+    void refuseOlderDaemon();
     /// The time that an operation with this limit (the daemon's without one) may take here.
     [[nodiscard]] Milliseconds timeoutOf(std::optional<std::chrono::seconds> deadline);
     template <typename Send>
@@ -153,6 +156,7 @@ class DaemonClient {
     std::optional<std::vector<PluginInfo>> _plugins;
     std::optional<Milliseconds> _timeout;
     std::optional<std::chrono::seconds> _deadline;  ///< the daemon's, once it is known
+    bool _isChecked = false;                        ///< the daemon's interface is not too old
 };
 
 /// Adds the languages to the request, under the key that the description fills with languages, unless the request has

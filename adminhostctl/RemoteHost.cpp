@@ -20,6 +20,7 @@
 #include <fmt/format.h>
 #include <poll.h>
 #include <sys/socket.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -29,11 +30,12 @@ namespace {
 using std::chrono::milliseconds;
 using std::chrono::steady_clock;
 
-constexpr int statusOfOldRelease = 2;  // "bridge" is not one of its words
+constexpr int statusOfUsage = 2;  // "bridge" is not one of its words, or it rejects the other ones
 constexpr int statusNotExecutable = 126;
 constexpr int statusNotFound = 127;
 constexpr int statusOfSsh = 255;
 constexpr std::size_t longestText = std::size_t{64} << 10U;  ///< that start files of a shell may print
+constexpr std::size_t longestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
 constexpr auto patience = milliseconds(2000);
 
 /// The first ssh of PATH; empty if there is none. Relative directories do not count.
@@ -63,30 +65,32 @@ Failure sshFailure(const std::string& text) {
     return {ExitStatus::hostNotReachable, text};
 }
 
-}  // namespace
-
-Failure failureOfSsh(const std::string& host, int status) {
+/// Throws why ssh has ended with this status before it was connected.
+[[noreturn]] void throwFailureOfSsh(const std::string& host, int status) {
     const std::string install = "install the release " ADMINHOST_RELEASE " there";
     switch (status) {
         case statusOfSsh:
-            return Unavailable(ExitStatus::hostNotReachable, host + " cannot be reached: ssh ended with status 255");
+            throw Unavailable(ExitStatus::hostNotReachable, host + " cannot be reached: ssh ended with status 255");
         case statusNotFound:
-            return sshFailure("adminhostctl is not found on " + host + "; " + install +
-                              ", or add its directory to the PATH of a login without a terminal");
+            throw sshFailure("adminhostctl is not found on " + host + "; " + install +
+                             ", or add its directory to the PATH of a login without a terminal");
         case statusNotExecutable:
-            return sshFailure("adminhostctl on " + host + " cannot be executed; " + install);
-        case statusOfOldRelease:
-            return sshFailure("adminhostctl on " + host + " has no verb \"bridge\": its release is older; " + install);
+            throw sshFailure("adminhostctl on " + host + " cannot be executed; " + install);
+        case statusOfUsage:
+            throw sshFailure("adminhostctl on " + host +
+                             " has no verb \"bridge\", or rejected its arguments: its release may be older; " +
+                             install);
         case static_cast<int>(ExitStatus::notReachable):
-            return Unavailable(ExitStatus::notReachable, "the daemon of " + host + " cannot be reached");
+            throw Unavailable(ExitStatus::notReachable, "the daemon of " + host + " cannot be reached");
         case static_cast<int>(ExitStatus::notPermitted):
-            return {ExitStatus::notPermitted,
-                    "permission denied by the daemon's socket on " + host + "; its group and root may use it"};
+            throw Failure(ExitStatus::notPermitted,
+                          "permission denied by the daemon's socket on " + host + "; its group and root may use it");
         default:
-            return sshFailure(
-                fmt::format("adminhostctl on {} could not be run: it ended with status {}", host, status));
+            throw sshFailure(fmt::format("adminhostctl on {} could not be run: it ended with status {}", host, status));
     }
 }
+
+}  // namespace
 
 RemoteHost::RemoteHost(Options options) : _options(std::move(options)) {
     const std::string& host = _options.host;
@@ -97,6 +101,10 @@ RemoteHost::RemoteHost(Options options) : _options(std::move(options)) {
     if (_options.socket && !isSafePath(*_options.socket)) {
         throw usageError(
             "--socket: with --host, the path must begin with / and have only letters, digits and /._-+@%,=:");
+    }
+    if (_options.socket && _options.socket->size() > longestSocketPath) {
+        throw usageError(fmt::format("--socket: \"{}\" is too long for the path of a socket; use {} bytes at most",
+                                     *_options.socket, longestSocketPath));
     }
 }
 
@@ -156,35 +164,41 @@ RemoteHost::Ssh RemoteHost::start(FileDescriptor& ours) {
     return ssh;
 }
 
-int RemoteHost::connect(Milliseconds limit) {
+RemoteHost::Connected RemoteHost::connect(Milliseconds limit) {
     std::erase_if(_all, [&](Ssh& ssh) { return ssh.closed && waitFor(ssh, milliseconds(0)); });
     FileDescriptor ours;
     Ssh& ssh = _all.emplace_back(start(ours));
+    Connected connected;
     try {
-        awaitGreeting(ssh, limit);
+        connected.login = awaitGreeting(ssh, limit);
     } catch (...) {
         ours.close();
         ssh.closed = true;
         throw;
     }
-    return ours.release();
+    connected.socket = ours.release();
+    return connected;
 }
 
-void RemoteHost::awaitGreeting(Ssh& ssh, Milliseconds limit) {
-    const auto end = steady_clock::now() + limit;
+steady_clock::duration RemoteHost::awaitGreeting(Ssh& ssh, Milliseconds limit) {
+    const auto start = steady_clock::now();
+    auto end = start + limit;
+    bool hasBegun = false;
+    bool mayAsk = _options.asks;
+    steady_clock::duration login{};
     std::string line;
     std::size_t size = 0;
     while (size < longestText) {
         std::array<pollfd, 2> waited{pollfd{ssh.socket, POLLIN, 0},
                                      pollfd{ssh.messages.isOpen() ? ssh.messages.get() : -1, POLLIN, 0}};
         const auto left = std::chrono::ceil<milliseconds>(end - steady_clock::now());
-        if (!_options.asks && left <= milliseconds(0)) {
+        if (!mayAsk && left <= milliseconds(0)) {
             this->end(ssh);
-            throw Unavailable(ExitStatus::hostNotReachable,
-                              fmt::format("{} has not answered within {:g} s", _options.host,
-                                          std::chrono::duration<double>(limit).count()));
+            throw Unavailable(hasBegun ? ExitStatus::notReachable : ExitStatus::hostNotReachable,
+                              fmt::format("{}{} has not answered within {:g} s", hasBegun ? "the daemon of " : "",
+                                          _options.host, std::chrono::duration<double>(limit).count()));
         }
-        const auto pause = _options.asks ? milliseconds(1000) : std::min(left, milliseconds(1000));
+        const auto pause = mayAsk ? milliseconds(1000) : std::min(left, milliseconds(1000));
         static_cast<void>(::poll(waited.data(), waited.size(), static_cast<int>(pause.count())));
         if (isInterrupted()) {
             this->end(ssh);
@@ -205,13 +219,21 @@ void RemoteHost::awaitGreeting(Ssh& ssh, Milliseconds limit) {
             if (!waitFor(ssh, patience)) {
                 this->end(ssh);
             }
-            throw failureOfSsh(_options.host, ssh.status.value_or(statusOfSsh));
+            throwFailureOfSsh(_options.host, ssh.status.value_or(statusOfSsh));
         }
         ++size;
         line.push_back(c);
         if (c == '\n') {
-            if (line == bridgeGreeting) {
-                return;
+            // A start file may have printed text without a line end before it, such as a terminal's title.
+            if (line.ends_with(bridgeGreeting)) {
+                return mayAsk ? steady_clock::now() - start : login;
+            }
+            if (line.ends_with(bridgeBegin)) {
+                hasBegun = true;
+                if (std::exchange(mayAsk, false)) {
+                    login = steady_clock::now() - start;
+                    end = steady_clock::now() + limit;
+                }
             }
             line.clear();
         }

@@ -29,6 +29,12 @@ class RemoteHost {
         std::optional<std::chrono::seconds> connectTimeout{};  ///< how long ssh may try to reach the machine
     };
 
+    /// A socket that is connected with the daemon.
+    struct Connected {
+        int socket = -1;
+        std::chrono::steady_clock::duration login{};  ///< how long ssh may have waited for a password
+    };
+
     /// Throws Failure(usage) if the host or the socket's path is not usable.
     explicit RemoteHost(Options options);
     RemoteHost(const RemoteHost&) = delete;
@@ -39,10 +45,11 @@ class RemoteHost {
     [[nodiscard]] const std::string& host() const noexcept { return _options.host; }
     [[nodiscard]] bool asks() const noexcept { return _options.asks; }
 
-    /// Starts ssh, and returns a socket that is connected with the daemon there. The caller ends it with close().
-    /// Throws Unavailable if the machine (hostNotReachable) or its daemon (notReachable) cannot be reached, and
-    /// Failure with the reason if it has no usable adminhostctl. An ssh that may ask has no limit.
-    [[nodiscard]] int connect(Milliseconds limit);
+    /// Starts ssh, and connects a socket with the daemon there. The caller ends it with close(). Throws Unavailable if
+    /// the machine (hostNotReachable) or its daemon (notReachable) cannot be reached in time, and Failure with the
+    /// reason if it has no usable adminhostctl. The login of an ssh that may ask has no limit: the limit begins with
+    /// its end.
+    [[nodiscard]] Connected connect(Milliseconds limit);
     /// Returns false if the connection has ended, or if the socket is not one of connect().
     [[nodiscard]] bool isConnected(int socket) const noexcept;
     void close(int socket) noexcept;
@@ -66,7 +73,8 @@ class RemoteHost {
         std::optional<int> status{};
     };
     [[nodiscard]] Ssh start(FileDescriptor& ours);
-    void awaitGreeting(Ssh& ssh, Milliseconds limit);
+    /// Returns how long ssh may have waited for a password.
+    [[nodiscard]] std::chrono::steady_clock::duration awaitGreeting(Ssh& ssh, Milliseconds limit);
     /// Returns true if it has exited within the limit.
     bool waitFor(Ssh& ssh, Milliseconds limit);
     void end(Ssh& ssh);
@@ -76,8 +84,5 @@ class RemoteHost {
     std::vector<Ssh> _all;
     std::set<std::string> _printed;
 };
-
-/// Why ssh has ended with this status before it was connected.
-[[nodiscard]] Failure failureOfSsh(const std::string& host, int status);
 
 }  // namespace adminhost::ctl

@@ -48,6 +48,8 @@ class SshServer {
     void forgetHostKey() const { writeFile(_directory / "known_hosts", ""); }
     /// From now on the server does not know the user's key.
     void forgetUserKey() const { writeFile(_directory / "authorized_keys", ""); }
+    /// From now on the server knows the user's key again.
+    void knowUserKey() const { writeFile(_directory / "authorized_keys", contentsOf(_directory / "user_key.pub")); }
     /// Encrypts the user's key.
     void setPassphrase(const std::string& passphrase) const;
 

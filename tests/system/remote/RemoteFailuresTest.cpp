@@ -6,6 +6,8 @@
 
 #include <algorithm>
 #include <csignal>
+#include <filesystem>
+#include <fstream>
 
 namespace adminhost::test {
 namespace {
@@ -55,7 +57,7 @@ TEST_F(RemoteFailures, MissingCommandLineThereIsNamed) {
 TEST_F(RemoteFailures, OlderCommandLineThereIsNamed) {
     server.installThere("adminhostctl", "echo \"adminhostctl: command not found: $1\" >&2; exit 2\n");
     expectFailure(8, AllOf(HasSubstr("command not found: bridge\n"),
-                           HasSubstr("studio has no verb \"bridge\": its release is older; install the release ")));
+                           HasSubstr("studio has no verb \"bridge\", or rejected its arguments: ")));
 }
 
 TEST_F(RemoteFailures, OlderDaemonThereIsNamed) {
@@ -122,6 +124,25 @@ TEST_F(RemoteFailures, WriteWhoseConnectionBreaksIsLookedUpOverANewOneAndNotRepe
                                      HasSubstr("has ended; it was not repeated"),
                                      HasSubstr("settings.server_port: 8170 -> 8180: applied\n")));
     EXPECT_EQ(writes(), 1U);
+}
+
+TEST_F(RemoteFailures, FollowedLogGoesOnOnceALoginSucceedsAgain) {
+    const std::filesystem::path log = root.path() + "/Library/Logs/lumioserverd/startup.log";
+    std::filesystem::create_directories(log.parent_path());
+    std::ofstream(log) << "first\n";
+    RunningProgram follow(remoteCommand({"logs", "--follow", "startup_log"}));
+    follow.waitFor("first\n");
+    server.forgetUserKey();
+    server.breakSessions();
+    follow.waitFor("trying again");
+    const std::size_t logins = server.calls().size();
+    EXPECT_TRUE(eventually([&] { return server.calls().size() > logins + 1; }, std::chrono::seconds(30)))
+        << "a login that fails is tried again";
+    server.knowUserKey();
+    std::ofstream(log, std::ios::app) << "second\n";
+    follow.waitFor("second\n");
+    follow.signal(SIGTERM);
+    EXPECT_EQ(follow.wait().status, 128 + SIGTERM);
 }
 
 TEST_F(RemoteFailures, WriteWhoseMachineIsGoneIsUndetermined) {

@@ -105,7 +105,7 @@ TEST_F(RemoteHost, NameThatLooksLikeAnOptionAndUnsafePathsAreRejected) {
 }
 
 TEST_F(RemoteHost, TextOfTheShellsStartFilesIsIgnored) {
-    installCommandLine("echo 'Welcome to this machine'; printf 'No line end '; echo\n");
+    installCommandLine("echo 'Welcome to this machine'; printf 'No line end '\n");
     EXPECT_EQ(remote({"settings", "get", "server_port"}).output, "8170\n");
 }
 
@@ -121,8 +121,11 @@ TEST_F(RemoteHost, BridgeConnectsStandardInputAndOutputWithTheDaemon) {
     const ProgramResult result = runProgram(command({"bridge"}), Errors::merge,
                                             "GET /v1/ HTTP/1.1\r\nHost: localhost\r\nConnection: close\r\n\r\n");
     EXPECT_EQ(result.status, 0);
-    EXPECT_THAT(result.output, AllOf(StartsWith("adminhostctl bridge\nHTTP/1.1 200 "), HasSubstr("\"interface\":1")));
+    EXPECT_THAT(result.output, AllOf(StartsWith("adminhostctl bridge begins\nadminhostctl bridge\nHTTP/1.1 200 "),
+                                     HasSubstr("\"interface\":1")));
     EXPECT_EQ(remote({"bridge"}).status, 2) << "it is for this machine only";
+    EXPECT_THAT(runProgram({program(), "--socket", "/nowhere/socket", "bridge"}, Errors::merge, "").output,
+                StartsWith("adminhostctl bridge begins\nadminhostctl: the daemon cannot be reached at "));
 }
 
 TEST_F(RemoteHost, TimeOfAPasswordPromptDoesNotCount) {
