@@ -25,7 +25,7 @@ constexpr std::size_t notesMaximum = 1000;  ///< that are read
 constexpr const char* interrupted = "its operation was interrupted";
 
 DiskPath notesDirectory() {
-    return diskPath(HostPath("/var/lib/adminhostd/begun"));
+    return diskPath(HostPath(std::string(BegunRequest::directory)));
 }
 
 /// Ids are chosen by the front, or are UUIDs. Nothing else names a file.
@@ -64,6 +64,13 @@ void read(const Dictionary& line, protocol::Unfinished& note) {
                    std::string(line.text("unit"))};
     note.user = line.text("user");
     note.loginUser = line.text("loginUser");
+}
+
+/// Whether the first line is that of a note of a later release.
+bool isOfLaterRelease(const std::string& text) {
+    const auto value = parseJson(std::string_view(text).substr(0, text.find('\n')));
+    const Dictionary* line = value ? value->dictionary() : nullptr;
+    return line != nullptr && line->get("format").integer().value_or(0) > noteFormat;
 }
 
 /// The note in a file; nullopt if it is not one of this format. Its last line may be incomplete.
@@ -159,7 +166,7 @@ void BegunRequest::ended(std::string_view end) {
     append({{"end", end}});
 }
 
-std::vector<protocol::Unfinished> BegunRequest::all() {
+BegunRequest::Left BegunRequest::left() {
     std::vector<std::pair<std::filesystem::file_time_type, std::string>> files;
     std::error_code failure;
     for (std::filesystem::directory_iterator entry(notesDirectory().text(), failure), end; !failure && entry != end;
@@ -170,17 +177,19 @@ std::vector<protocol::Unfinished> BegunRequest::all() {
         }
     }
     std::sort(files.begin(), files.end());
-    std::vector<protocol::Unfinished> notes;
+    Left left;
     for (const auto& [time, file] : files) {
         const auto text = readFile(DiskPath(file), noteMaximum);
         auto note = text ? noteIn(*text) : std::nullopt;
         if (note && file == noteOf(note->request)) {
-            notes.push_back(*std::move(note));
+            left.notes.push_back(*std::move(note));
+        } else if (text && isOfLaterRelease(*text)) {
+            ++left.ofLaterRelease;
         } else {
             ::unlink(file.c_str());  // nothing can be learnt from it
         }
     }
-    return notes;
+    return left;
 }
 
 void BegunRequest::remove(std::string_view request) {

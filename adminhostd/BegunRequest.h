@@ -22,6 +22,7 @@ namespace adminhost {
 
 class BegunRequest {
   public:
+    static constexpr std::string_view directory = "/var/lib/adminhostd/begun";
     static constexpr std::size_t noteMaximum = std::size_t{1} << 20U;  ///< bytes; further reports are not in the note
 
     /// Creates the note. `about` has no reports and no end yet.
@@ -35,8 +36,13 @@ class BegunRequest {
     /// Notes how the operation ended: "its operation was completed".
     void ended(std::string_view end);
 
-    /// What is noted, oldest first. A note that cannot be read is left out.
-    [[nodiscard]] static std::vector<protocol::Unfinished> all();
+    /// What earlier workers have left.
+    struct Left {
+        std::vector<protocol::Unfinished> notes;  ///< oldest first
+        std::size_t ofLaterRelease = 0;           ///< notes that only a later release can read
+    };
+    /// Removes notes that cannot be read, except for those of a later release, which may be installed again.
+    [[nodiscard]] static Left left();
     /// Removes the note about a request, if there is one.
     static void remove(std::string_view request);
 

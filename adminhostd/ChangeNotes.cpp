@@ -7,6 +7,8 @@
 
 #include <utility>
 
+#include <fmt/format.h>
+
 namespace adminhost {
 namespace {
 
@@ -19,7 +21,12 @@ void send(int descriptor, protocol::ToFront message) {
 }  // namespace
 
 void ChangeNotes::reportUnfinished() {
-    for (protocol::Unfinished& request : BegunRequest::all()) {
+    BegunRequest::Left left = BegunRequest::left();
+    if (left.ofLaterRelease != 0 && !std::exchange(_laterReleaseLogged, true)) {
+        logEvent(fmt::format("adminhostd: {}: notes of a later release, which are kept until it is started again: {}",
+                             BegunRequest::directory, left.ofLaterRelease));
+    }
+    for (protocol::Unfinished& request : left.notes) {
         if (_reported.insert(request.request).second) {
             send(_descriptor, std::move(request));
         }

@@ -39,6 +39,7 @@ class ChangeNotes {
     ForwardingSink& _sink;
     std::optional<BegunRequest> _note;  ///< about the operation that is running
     std::set<std::string> _reported;    ///< requests that the front knows, until their notes are removed
+    bool _laterReleaseLogged = false;
 };
 
 }  // namespace adminhost

@@ -1,16 +1,18 @@
 #include "adminhostd/HistoryFiles.h"
 
 #include "platform/files/File.h"
+#include "platform/files/FileDescriptor.h"
 #include "platform/plist/PropertyList.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
 #include <filesystem>
-#include <fstream>
 #include <string>
 
+#include <fcntl.h>
 #include <fmt/format.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace adminhost {
@@ -79,12 +81,24 @@ Error stepFailed(const char* step, const std::error_code& code) {
 }
 
 std::optional<Error> writePlainly(std::string_view bytes, const HostPath& path) {
-    errno = 0;
-    std::ofstream file(diskPath(path).text(), std::ios::binary);
-    file << bytes;
-    file.close();
-    if (!file) {
+    const auto failed = [] {
         return stepFailed("cannot write the entry", std::error_code(errno, std::generic_category()));
+    };
+    // The mode keeps a copy of the directory private too.
+    FileDescriptor file(::open(diskPath(path).text().c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_CLOEXEC,
+                               S_IRUSR | S_IWUSR));
+    if (!file.isOpen() || ::fchmod(file.get(), S_IRUSR | S_IWUSR) != 0) {
+        return failed();
+    }
+    while (!bytes.empty()) {
+        const ssize_t written = ::write(file.get(), bytes.data(), bytes.size());
+        if (written < 0 && errno != EINTR) {
+            return failed();
+        }
+        bytes.remove_prefix(written < 0 ? 0 : static_cast<std::size_t>(written));
+    }
+    if (const int number = file.close(); number != 0) {
+        return stepFailed("cannot write the entry", std::error_code(number, std::generic_category()));
     }
     return std::nullopt;
 }

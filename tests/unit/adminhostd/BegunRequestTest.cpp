@@ -2,6 +2,7 @@
 #include "adminhostd/ChangeNotes.h"
 #include "adminhostd/ForwardingSink.h"
 #include "adminhostd/Frame.h"
+#include "tests/support/CapturedLog.h"
 #include "tests/support/TemporaryRoot.h"
 
 #include <filesystem>
@@ -19,6 +20,7 @@ namespace adminhost {
 namespace {
 
 namespace fs = std::filesystem;
+using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
@@ -47,7 +49,7 @@ TEST_F(BegunRequests, NoteHasTheRequestItsReportsAndItsEnd) {
         BegunRequest request(about("1-1"), Redaction());
         EXPECT_EQ(request.problem(), "");
         expected.end = "its operation was interrupted";
-        EXPECT_EQ(BegunRequest::all(), std::vector{expected}) << "nothing is known yet";
+        EXPECT_EQ(BegunRequest::left().notes, std::vector{expected}) << "nothing is known yet";
         request.add(Change{"settings", "", "", "port", 80, 443, false, Dictionary{{"port", 80}}});
         request.add(NotDone{"configuration.x", "not known", "words"});
         expected.changes = {Dictionary{{"section", "settings"},
@@ -59,13 +61,13 @@ TEST_F(BegunRequests, NoteHasTheRequestItsReportsAndItsEnd) {
                                        {"secret", false}}};
         expected.notDone = {
             Dictionary{{"keyPath", "configuration.x"}, {"reason", "not known"}, {"toolMessage", "words"}}};
-        EXPECT_EQ(BegunRequest::all(), std::vector{expected});
+        EXPECT_EQ(BegunRequest::left().notes, std::vector{expected});
         request.ended("its operation failed");
     }
     expected.end = "its operation failed";
-    EXPECT_EQ(BegunRequest::all(), std::vector{expected});
+    EXPECT_EQ(BegunRequest::left().notes, std::vector{expected});
     BegunRequest::remove("1-1");
-    EXPECT_THAT(BegunRequest::all(), IsEmpty());
+    EXPECT_THAT(BegunRequest::left().notes, IsEmpty());
     BegunRequest::remove("1-1");
 }
 
@@ -95,7 +97,7 @@ TEST_F(BegunRequests, LastLineMayBeIncompleteAndOtherFilesAreRemovedOrIgnored) {
     root.write(std::string(notes) + "/1-2", "garbage\n");
     root.write(std::string(notes) + "/1-3", whole);
     root.write(std::string(notes) + "/not a request", "kept");
-    const auto all = BegunRequest::all();
+    const auto all = BegunRequest::left().notes;
     ASSERT_EQ(all.size(), 1U);
     EXPECT_EQ(all[0].request, "1-1");
     EXPECT_EQ(all[0].notDone.size(), 1U);
@@ -104,13 +106,39 @@ TEST_F(BegunRequests, LastLineMayBeIncompleteAndOtherFilesAreRemovedOrIgnored) {
     EXPECT_TRUE(fs::exists(root.path(std::string(notes) + "/not a request")));
 }
 
+TEST_F(BegunRequests, NotesOfALaterReleaseStayForItAndTheirNumberIsLoggedOnce) {
+    const std::string later = R"({"format": 2, "request": "1-1", "more": true})"
+                              "\n";
+    root.write(std::string(notes) + "/1-1", later);
+    root.write(std::string(notes) + "/1-2", later);
+    root.write(std::string(notes) + "/1-3", "{\"format\": 0}\n");
+    root.write(std::string(notes) + "/1-4", "{\"format\": \"2\"}\n");
+    int pair[2] = {-1, -1};
+    ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, pair), 0);
+    const FileDescriptor ours(pair[0]);
+    const FileDescriptor fronts(pair[1]);
+    ForwardingSink sink(ours.get());
+    FrameReader reader;
+    ChangeNotes changes(ours.get(), reader, sink);
+    const test::CapturedLog log;
+    changes.reportUnfinished();
+    changes.reportUnfinished();
+    EXPECT_THAT(log.lines,
+                ElementsAre("adminhostd: /var/lib/adminhostd/begun: notes of a later release, which are kept "
+                            "until it is started again: 2"));
+    EXPECT_EQ(root.read(std::string(notes) + "/1-1"), later);
+    EXPECT_TRUE(fs::exists(root.path(std::string(notes) + "/1-2")));
+    EXPECT_FALSE(fs::exists(root.path(std::string(notes) + "/1-3")));
+    EXPECT_FALSE(fs::exists(root.path(std::string(notes) + "/1-4")));
+}
+
 TEST_F(BegunRequests, RequestThatCannotBeNotedSaysWhy) {
     root.write(notes, "a file in the place of the directory");
     BegunRequest request(about("1-1"), Redaction());
     EXPECT_THAT(request.problem(), HasSubstr("begun"));
     request.add(NotDone{"x", "why", ""});
     request.ended("its operation failed");
-    EXPECT_THAT(BegunRequest::all(), IsEmpty());
+    EXPECT_THAT(BegunRequest::left().notes, IsEmpty());
     EXPECT_NE(BegunRequest(about("../../etc/passwd"), Redaction()).problem(), "");
 }
 
@@ -120,7 +148,7 @@ TEST_F(BegunRequests, NoteIsBounded) {
         request.add(NotDone{"x", std::string(100'000, 'x'), ""});
     }
     EXPECT_LE(fs::file_size(root.path(std::string(notes) + "/1-1")), BegunRequest::noteMaximum);
-    EXPECT_EQ(BegunRequest::all().size(), 1U);
+    EXPECT_EQ(BegunRequest::left().notes.size(), 1U);
 }
 
 TEST_F(BegunRequests, NoteOfARequestThatIsRepeatedIsNotTakenForItsFormerOne) {
@@ -143,9 +171,9 @@ TEST_F(BegunRequests, NoteOfARequestThatIsRepeatedIsNotTakenForItsFormerOne) {
         order.request = "1-1";
         order.command = "again";
         EXPECT_TRUE(changes.begin(LoadedPlugin(), order));
-        ASSERT_EQ(BegunRequest::all().size(), 1U);
-        EXPECT_EQ(BegunRequest::all().front().request, "1-1");
-        EXPECT_EQ(BegunRequest::all().front().command, "again");
+        ASSERT_EQ(BegunRequest::left().notes.size(), 1U);
+        EXPECT_EQ(BegunRequest::left().notes.front().request, "1-1");
+        EXPECT_EQ(BegunRequest::left().notes.front().command, "again");
         changes.end(protocol::Outcome::answered);
     }
 }
@@ -181,7 +209,7 @@ TEST_F(BegunRequests, WorkerDoesNotReportItsOwnNotesAsThoseOfAnEarlierWorker) {
         }
     }
     EXPECT_THAT(unfinished, IsEmpty()) << "the front has still to log the ends that it knows";
-    EXPECT_EQ(BegunRequest::all().size(), 2U) << "a next worker reports them";
+    EXPECT_EQ(BegunRequest::left().notes.size(), 2U) << "a next worker reports them";
 }
 
 }  // namespace

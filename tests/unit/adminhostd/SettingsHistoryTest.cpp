@@ -134,11 +134,21 @@ TEST_F(HistoryTest, EntryThatLacksOneOfItsFilesIsNotListed) {
     EXPECT_EQ(entry(0).get("number"), Value(2));
 }
 
-TEST_F(HistoryTest, OnlyItsOwnerCanEnterTheDirectory) {
+TEST_F(HistoryTest, OnlyItsOwnerCanEnterTheDirectoryAndReadTheFiles) {
+    root.write("/two.plist", "text");
     write({{"a", 1}}, Dictionary{{"a", 2}});
     for (const char* path : {"", "/00000001"}) {
         EXPECT_EQ(fs::status(root.path(std::string(directory) + path)).permissions(), fs::perms(0700)) << path;
     }
+    ASSERT_FALSE(history.keepResources({resourceChange("value", "left", "right")}, {}));
+    std::size_t regular = 0;
+    for (const fs::directory_entry& entry : fs::recursive_directory_iterator(root.path(std::string(directory)))) {
+        if (entry.is_regular_file()) {
+            ++regular;
+            EXPECT_EQ(entry.status().permissions(), fs::perms(0600)) << entry.path();
+        }
+    }
+    EXPECT_GE(regular, 3U) << "what is kept of the settings and of the resources";
 }
 
 TEST_F(HistoryTest, EntryHasTheNumberOfChangesThatItDoesNotHold) {
