@@ -4,6 +4,7 @@
 #include "adminhostd/RunDirectory.h"
 #include "adminhostd/UnitProcesses.h"
 #include "platform/framework/Release.h"
+#include "platform/log/Log.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -111,6 +112,21 @@ Diagnosis spaceOf(const std::string& what, const std::string& path) {
         return {Health::warning, "free space, " + what, path + ": " + errorText(errno) + '.', "check the file system"};
     }
     return spaceCheck("free space, " + what, path, space);
+}
+
+/// journald drops events without a word to their senders when its disk is full.
+Diagnosis journalSpaceCheck() {
+    const std::string name = "free space, journal";
+    for (const char* place : {"/var/log/journal", "/run/log/journal"}) {
+        struct statvfs space {};
+        if (::statvfs(place, &space) == 0) {
+            return spaceCheck(name, place, space, "The journal drops events.");
+        }
+        if (errno != ENOENT) {
+            return {Health::warning, name, fmt::format("{}: {}.", place, errorText(errno)), "check the file system"};
+        }
+    }
+    return {Health::ok, name, "The journal is not stored on this machine.", ""};
 }
 
 Diagnosis unitCheck() {
@@ -227,6 +243,9 @@ std::vector<Diagnosis> FrontChecks::run(const Workers& workers) const {
             checks.push_back(spaceOf(what, path));
         }
     }
+    if (journalIsThere()) {
+        checks.push_back(journalSpaceCheck());
+    }
     checks.push_back(unitCheck());
     timex clock{};
     const int state = ::adjtimex(&clock);
@@ -254,14 +273,15 @@ Diagnosis clockCheck(int state, const timex& clock, bool reported) {
     return {Health::ok, "clock", "The clock is synchronised.", ""};
 }
 
-Diagnosis spaceCheck(const std::string& name, const std::string& directory, const struct statvfs& space) {
+Diagnosis spaceCheck(const std::string& name, const std::string& directory, const struct statvfs& space,
+                     const std::string& effect) {
     const std::uint64_t bytes = std::uint64_t{space.f_bavail} * space.f_frsize;
     const bool countsFiles = space.f_files > 0;
     const std::string found = fmt::format("{} MB are free for {}{}.", bytes / megabyte, directory,
                                           countsFiles ? fmt::format(", and {} files", space.f_favail) : "");
     const std::string fix = "remove files, or enlarge the file system";
     if (bytes < fullBytes || (countsFiles && space.f_favail == 0)) {
-        return {Health::failure, name, found + " Changes cannot be stored.", fix};
+        return {Health::failure, name, found + ' ' + effect, fix};
     }
     if (bytes < scarceBytes || (countsFiles && space.f_favail < scarceFiles)) {
         return {Health::warning, name, found, fix};

@@ -68,7 +68,8 @@ class FrontChecks {
 /// The clock: `state` and `clock` are adjtimex()'s result and data. `reported`: the time service has reported that the
 /// clock is synchronised, which counts if the daemon may not ask the kernel.
 [[nodiscard]] Diagnosis clockCheck(int state, const timex& clock, bool reported);
-/// The space that is left for a directory; `name` is the check's.
-[[nodiscard]] Diagnosis spaceCheck(const std::string& name, const std::string& directory, const struct statvfs& space);
+/// The space that is left for a directory; `name` is the check's, `effect` the sentence with what happens without any.
+[[nodiscard]] Diagnosis spaceCheck(const std::string& name, const std::string& directory, const struct statvfs& space,
+                                   const std::string& effect = "Changes cannot be stored.");
 
 }  // namespace adminhost

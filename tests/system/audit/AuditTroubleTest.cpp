@@ -331,6 +331,28 @@ TEST_F(AuditTest, JournalThatIsStuckStopsNoRequestAndLostEventsAreAFinding) {
     })) << "once the journal reads again, events arrive again";
 }
 
+TEST_F(AuditTest, FreeSpaceOfTheJournalIsChecked) {
+    const std::string finding = findingOf(*daemon, "free space, journal");
+    EXPECT_THAT(finding, HasSubstr(" are free for /run/log/journal, "));
+    fs::create_directory("/var/log/journal");
+    const std::string kept = findingOf(*daemon, "free space, journal");
+    fs::remove("/var/log/journal");
+    EXPECT_THAT(kept, HasSubstr(" are free for /var/log/journal, ")) << "where the journal is kept over a start";
+}
+
+TEST_F(AuditTest, FullDiskOfTheJournalIsAFinding) {
+    fs::create_directory("/var/log/journal");
+    std::string finding;
+    {
+        const test::Mount disk("/var/log/journal");
+        disk.fill();
+        finding = findingOf(*daemon, "free space, journal");
+    }
+    fs::remove("/var/log/journal");
+    EXPECT_THAT(finding, HasSubstr("failure: 0 MB are free for /var/log/journal"));
+    EXPECT_THAT(finding, HasSubstr("The journal drops events."));
+}
+
 TEST_F(AuditTest, FullDiskStopsNoChangeAndIsAFinding) {
     const test::Mount disk(root.disk("/var/lib/adminhostd"));
     disk.fill();
