@@ -120,8 +120,8 @@ class Daemon {
         static_cast<void>(keepFixedSettings(read, _options));  // the monitor has logged them
         _options = std::move(read);
         // Names of accounts are looked up again even if the tables are the same.
-        _front.reconfigure(_options,
-                           Permissions(_options.permissions, _front.permissions().own(), configurationFile(_options)));
+        _front.reconfigure(_options, Permissions(_options.permissions, _front.permissions().own(),
+                                                 configurationFile(_options), &_front.permissions()));
         _front.setBodyBounds(_options.bounds.body);
         if (_server) {
             _server->setBodyMaximum(_options.bounds.bodyBytes);

@@ -100,8 +100,10 @@ void Front::reconfigure(const Options& options, Permissions permissions) {
 }
 
 void Front::logProblems() const {
-    for (const std::string& problem : _permissions.problems()) {
-        logEvent("adminhostd: " + problem);
+    for (const auto* problems : {&_permissions.problems(), &_permissions.kept()}) {
+        for (const std::string& problem : *problems) {
+            logEvent("adminhostd: " + problem);
+        }
     }
 }
 

@@ -56,15 +56,31 @@ Right rightFor(Access access) noexcept {
     return Right::account;
 }
 
-Permissions::Permissions(const std::vector<PermissionOptions>& options, uid_t own, std::string file)
+Permissions::Permissions(const std::vector<PermissionOptions>& options, uid_t own, std::string file,
+                         const Permissions* former)
     : _own(own), _file(std::move(file)) {
     for (const PermissionOptions& table : options) {
         Grant& grant = _grants.emplace_back(Grant{{}, {}, table.rights});
         const auto resolve = [&](const std::vector<ConfiguredAccount>& accounts, std::string_view kind, auto lookUp,
                                  auto& numbers) {
             for (const ConfiguredAccount& account : accounts) {
-                if (const auto number = account.id ? account.id : lookUp(account.name)) {
+                if (account.id) {
+                    numbers.push_back(*account.id);
+                    continue;
+                }
+                const std::pair<std::string_view, std::string> name(kind, account.name);
+                auto number = lookUp(account.name);
+                if (!number && former != nullptr && former->_numbers.contains(name)) {
+                    number = former->_numbers.at(name);
+                    _kept.push_back(
+                        fmt::format("{}: {} not found any more: \"{}\"; its number {} stays in effect until the daemon "
+                                    "is restarted: "
+                                    "remove the name if the {} was deleted",
+                                    account.place, kind, account.name, *number, kind));
+                }
+                if (number) {
                     numbers.push_back(*number);
+                    _numbers.emplace(name, *number);
                 } else {
                     _problems.push_back(fmt::format(
                         "{}: {} not found: \"{}\"; create the {}, or correct the name, and reload the daemon",
@@ -108,14 +124,25 @@ Diagnosis Permissions::check() const {
                 "Only root and the daemon's account may use the daemon: the configuration grants nothing to others.",
                 ""};
     }
-    if (_problems.empty()) {
+    if (_problems.empty() && _kept.empty()) {
         return {Diagnosis::Health::ok, "permissions",
                 fmt::format("All users and groups of the {} tables [[permission]] exist.", _grants.size()), ""};
     }
-    return {Diagnosis::Health::warning, "permissions",
-            fmt::format("Names in [[permission]] were not found when the daemon read them, and grant nothing: {}.",
-                        fmt::join(_problems, "; ")),
-            "create the accounts or correct the names, and reload the daemon"};
+    std::string found;
+    if (!_problems.empty()) {
+        found = fmt::format("Names in [[permission]] were not found when the daemon read them, and grant nothing: {}.",
+                            fmt::join(_problems, "; "));
+    }
+    if (!_kept.empty()) {
+        found += fmt::format(
+            "{}Names in [[permission]] were not found when the daemon was reloaded, and keep the numbers that they "
+            "had: "
+            "{}.",
+            found.empty() ? "" : " ", fmt::join(_kept, "; "));
+    }
+    return {Diagnosis::Health::warning, "permissions", found,
+            _problems.empty() ? "remove the names of deleted accounts, or restart the daemon"
+                              : "create the accounts or correct the names, and reload the daemon"};
 }
 
 }  // namespace adminhost

@@ -10,6 +10,7 @@
 #include "platform/framework/Plugin.h"
 
 #include <cstdint>
+#include <map>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -75,8 +76,11 @@ class Permissions {
   public:
     /// Looks up the names with the machine's account sources, which may ask a directory service: to be created at the
     /// start and when the configuration is read again, never for a request. `own` is the account that the daemon runs
-    /// as, `file` the configuration that refusals name.
-    Permissions(const std::vector<PermissionOptions>& options, uid_t own, std::string file);
+    /// as, `file` the configuration that refusals name. A name that is not found any more keeps the number that it has
+    /// in `former`: the front, which has given up its rights, cannot use every account source, and a reload must not
+    /// take grants away because of that.
+    Permissions(const std::vector<PermissionOptions>& options, uid_t own, std::string file,
+                const Permissions* former = nullptr);
 
     [[nodiscard]] Rights of(const Peer& peer) const;
     /// The account that the daemon runs as.
@@ -91,7 +95,9 @@ class Permissions {
     /// The names that were not found, as sentences with a suggested fix. They grant nothing, and the others count: a
     /// directory service that is down at the start must not lock out everybody.
     [[nodiscard]] const std::vector<std::string>& problems() const noexcept { return _problems; }
-    /// The same as a check of the installation.
+    /// The names that keep their former numbers, as sentences.
+    [[nodiscard]] const std::vector<std::string>& kept() const noexcept { return _kept; }
+    /// Both as a check of the installation.
     [[nodiscard]] Diagnosis check() const;
 
   private:
@@ -103,6 +109,8 @@ class Permissions {
 
     std::vector<Grant> _grants;
     std::vector<std::string> _problems;
+    std::vector<std::string> _kept;
+    std::map<std::pair<std::string_view, std::string>, id_t> _numbers;  ///< by kind ("user", "group") and name
     uid_t _own;
     std::string _file;
 };

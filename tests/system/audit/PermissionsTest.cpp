@@ -3,9 +3,13 @@
 #include "adminhostd/Permissions.h"
 #include "platform/json/Json.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/Eventually.h"
 #include "tests/support/Journal.h"
 #include "tests/support/SampleRoot.h"
 
+#include <csignal>
+#include <filesystem>
+#include <fstream>
 #include <iostream>
 #include <map>
 #include <string>
@@ -239,6 +243,33 @@ TEST_F(Permission, RefusedRequestLeavesTheIdUnused) {
 TEST_F(Permission, NameThatIsNotFoundIsReportedAndTheOthersCount) {
     EXPECT_TRUE(daemon.waitForLog("user not found: \"nobody-of-this-name\"; create the user")) << daemon.log();
     EXPECT_THAT(daemon.log(), HasSubstr("line 17, column 10: user not found"));
+}
+
+TEST_F(Permission, NameThatAReloadNoLongerFindsKeepsItsNumberUntilTheTablesDoNotNameIt) {
+    const std::filesystem::path file = "/etc/passwd";
+    const std::filesystem::path saved = "/etc/passwd.saved";
+    std::filesystem::copy_file(file, saved);
+    {
+        std::ifstream lines(saved);
+        std::ofstream others(file);
+        for (std::string line; std::getline(lines, line);) {
+            others << (line.starts_with("anna:") ? "" : line + '\n');
+        }
+    }
+    daemon.signal(SIGHUP);
+    const bool reloaded = daemon.waitForLog("the configuration has been read again");
+    const int status = as({test::anna}).get("/v1/doctor").status;
+    const test::HttpReply doctor = daemon.connect().get("/v1/doctor");
+    std::ofstream(daemon.directory() / "config") << "[[permission]]\nusers = [\"bert\"]\nclasses = [\"read\"]\n";
+    daemon.signal(SIGHUP);
+    EXPECT_TRUE(test::eventually([&] { return as({test::anna}).get("/v1/doctor").status == 403; }))
+        << "the new tables do not name it";
+    std::filesystem::rename(saved, file);
+    ASSERT_TRUE(reloaded) << daemon.log();
+    EXPECT_EQ(status, 200) << daemon.log();
+    EXPECT_THAT(daemon.log(), HasSubstr("user not found any more: \"anna\"; its number 20001 stays in effect"));
+    EXPECT_THAT(daemon.log(), Not(HasSubstr("user not found any more: \"nobody-of-this-name\"")));
+    EXPECT_THAT(doctor.body, HasSubstr("keep the numbers that they had"));
 }
 
 }  // namespace
