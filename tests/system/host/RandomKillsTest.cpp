@@ -1,4 +1,4 @@
-// Monitor, front and worker are killed at any time while clients write. ADMINHOST_SEED repeats the times of a run.
+// Monitor, front and worker get signals at any time while clients write. ADMINHOST_SEED repeats the draws of a run.
 
 #include "tests/support/TemporaryRoot.h"
 #include "tests/system/host/Host.h"
@@ -21,7 +21,8 @@ namespace {
 
 using namespace std::chrono_literals;
 
-constexpr int kills = 24;
+constexpr int signalCount = 36;
+constexpr std::array drawn{SIGTERM, SIGHUP, SIGKILL};
 constexpr int writers = 4;
 constexpr auto patience = 60s;
 
@@ -73,12 +74,14 @@ class RandomKills : public ::testing::Test {
         }
         return counts;
     }
-    /// Kills one of the three; a new daemon follows a monitor.
-    void killOne(unsigned which) {
+    /// Sends the signal to one of the three; a new daemon follows a monitor that it ends.
+    void signalOne(unsigned which, int number) {
         if (which == 0) {
-            daemon->signal(SIGKILL);
-            static_cast<void>(daemon->wait());
-            start();
+            daemon->signal(number);
+            if (number != SIGHUP) {
+                static_cast<void>(daemon->wait());
+                start();
+            }
             return;
         }
         pid_t victim = -1;
@@ -88,7 +91,7 @@ class RandomKills : public ::testing::Test {
             // it is being replaced at this moment
         }
         if (victim > 0) {
-            ::kill(victim, SIGKILL);
+            ::kill(victim, number);
         }
     }
 
@@ -119,9 +122,10 @@ TEST_F(RandomKills, AcknowledgedWritesAreFoundOnceAndOthersAtMostOnce) {
             }
         });
     }
-    for (int i = 0; i < kills; ++i) {
-        std::this_thread::sleep_for(std::chrono::milliseconds(random() % 400));
-        killOne(random() % 3);
+    for (int i = 0; i < signalCount; ++i) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(random() % 300));
+        const unsigned which = random() % 3;
+        signalOne(which, drawn.at(random() % drawn.size()));
     }
     const std::size_t before = [&] {
         const std::lock_guard lock(mutex);
@@ -133,7 +137,7 @@ TEST_F(RandomKills, AcknowledgedWritesAreFoundOnceAndOthersAtMostOnce) {
             return acknowledged.size() >= before + 10;
         },
         patience))
-        << "writes go on after the last kill";
+        << "writes go on after the last signal";
     stopping = true;
     for (std::thread& client : clients) {
         client.join();
