@@ -60,7 +60,10 @@ void refuseLivingDaemon(const std::string& path, const sockaddr_un& address) {
         fail("another daemon serves " + path + "; stop it or choose another path");
     }
     if (errno != ECONNREFUSED && errno != ENOENT) {
-        failWithErrno("cannot find out whether a daemon serves " + path);
+        fail(
+            fmt::format("cannot find out whether a daemon serves {}, which belongs to uid {}: {}; stop that daemon and "
+                        "remove the socket, or choose another path",
+                        path, status.st_uid, std::strerror(errno)));
     }
 }
 
@@ -163,7 +166,18 @@ ListeningSocket::ListeningSocket(std::string path, gid_t group) : _path(std::mov
     if (::bind(_socket.get(), reinterpret_cast<const sockaddr*>(&placeAddress), sizeof placeAddress) != 0 ||
         (group != sameGroup && ::lchown(place.c_str(), static_cast<uid_t>(-1), group) != 0) ||
         ::chmod(place.c_str(), 0660) != 0 || ::listen(_socket.get(), SOMAXCONN) != 0 ||
-        ::lstat(place.c_str(), &status) != 0 || ::rename(place.c_str(), _path.c_str()) != 0) {
+        ::lstat(place.c_str(), &status) != 0) {
+        failWithErrno("cannot create the socket " + _path);
+    }
+    if (::rename(place.c_str(), _path.c_str()) != 0) {
+        const int error = errno;
+        struct stat former {};
+        if (::lstat(_path.c_str(), &former) == 0) {  // of another account, in a directory with the sticky bit
+            fail(fmt::format(
+                "cannot replace the socket {}, which belongs to uid {}: {}; remove it, or choose another path", _path,
+                former.st_uid, std::strerror(error)));
+        }
+        errno = error;
         failWithErrno("cannot create the socket " + _path);
     }
     _device = status.st_dev;

@@ -2,6 +2,7 @@
 // was taken over by a client could do.
 
 #include "adminhostd/FrontRights.h"
+#include "adminhostd/ListeningSocket.h"
 #include "platform/files/FileDescriptor.h"
 #include "tests/support/Program.h"
 #include "tests/support/TemporaryRoot.h"
@@ -17,6 +18,7 @@
 #include <map>
 #include <optional>
 #include <sstream>
+#include <stdexcept>
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -289,6 +291,65 @@ TEST_F(AccountRights, AccountThatIsMissingOrTheSuperusersIsAnErrorAtTheStart) {
         EXPECT_EQ(daemon.wait(), 1);
         EXPECT_THAT(daemon.log(), HasSubstr(expected));
     }
+}
+
+/// The message with which a daemon of the other account fails to create its socket; empty if it does not fail.
+std::string socketProblemOfOther(const std::string& path) {
+    std::array<int, 2> ends{};
+    EXPECT_EQ(::pipe2(ends.data(), O_CLOEXEC), 0);
+    const passwd* const account = ::getpwnam(otherAccount);
+    const pid_t child = ::fork();
+    if (child == 0) {
+        std::string problem;
+        try {
+            if (::setresgid(account->pw_gid, account->pw_gid, account->pw_gid) != 0 ||
+                ::setresuid(account->pw_uid, account->pw_uid, account->pw_uid) != 0) {
+                throw std::runtime_error("the account cannot be changed");
+            }
+            const ListeningSocket socket(path, ListeningSocket::sameGroup);
+        } catch (const std::exception& error) {
+            problem = error.what();
+        }
+        ::_exit(::write(ends[1], problem.data(), problem.size()) == static_cast<ssize_t>(problem.size()) ? 0 : 1);
+    }
+    ::close(ends[1]);
+    std::string problem(4096, '\0');
+    const ssize_t count = ::read(ends[0], problem.data(), problem.size());
+    problem.resize(count < 0 ? 0 : static_cast<std::size_t>(count));
+    ::close(ends[0]);
+    int status = -1;
+    EXPECT_EQ(::waitpid(child, &status, 0), child);
+    EXPECT_EQ(status, 0);
+    return problem;
+}
+
+TEST_F(AccountRights, SocketOfAnotherAccountIsNeverReplacedAndTheMessageHasAFix) {
+    if (!isSuperuser()) {
+        return;
+    }
+    const TemporaryRoot root;
+    fs::permissions(root.path("/"), fs::perms(0755));
+    const std::string path = root.path("/open/socket");
+    fs::create_directory(root.path("/open"));
+    fs::permissions(root.path("/open"), fs::perms(01777));
+    {
+        const ListeningSocket live(path, ListeningSocket::sameGroup);
+        fs::create_hard_link(path, path + ".stale");
+        fs::permissions(path, fs::perms(0600));
+        EXPECT_EQ(socketProblemOfOther(path),
+                  "cannot find out whether a daemon serves " + path +
+                      ", which belongs to uid 0: Permission denied; stop that daemon and remove the socket, or choose "
+                      "another path");
+        fs::permissions(path, fs::perms(0666));
+        EXPECT_EQ(socketProblemOfOther(path), "another daemon serves " + path + "; stop it or choose another path");
+    }
+    fs::rename(path + ".stale", path);
+    EXPECT_EQ(socketProblemOfOther(path), "cannot replace the socket " + path +
+                                              ", which belongs to uid 0: Operation not permitted; remove it, or choose "
+                                              "another path");
+    EXPECT_TRUE(fs::is_socket(path));
+    fs::remove(path);
+    EXPECT_EQ(socketProblemOfOther(path), "");
 }
 
 TEST(UserNamespace, WithAMappedRangeHasTheSameRights) {
