@@ -1,7 +1,8 @@
 // The daemon's own units: what they restrict breaks no command, no tool and no service that is started from the daemon.
 //
 // As root the daemon runs from the units of this build beside a real systemd. Another account has no systemd that runs
-// units for it: there the same requests are made to a daemon without restrictions.
+// units for it: there the same requests are made to a daemon without restrictions, and each test prints that it has
+// shown nothing about the units.
 
 #include "platform/json/Json.h"
 #include "tests/support/AdministratorTree.h"
@@ -16,6 +17,7 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <iostream>
 #include <iterator>
 #include <optional>
 #include <string>
@@ -70,6 +72,8 @@ class DaemonUnit : public testing::Test {
             "[[directory.node]]\nname = \"/Local\"\nkind = \"local\"\n";
         const std::string plugin = std::string(BINARY_DIR) + "/lib/adminhost_lumio.so";
         if (!isRealServiceManager()) {
+            std::cout << "NOT SHOWN: that the units' restrictions break nothing. This needs root, for a systemd of the "
+                         "test's own; the daemon runs without them here.\n";
             process.emplace(
                 DaemonProcess::Options{{"--root", root.path(), "--plugin", plugin}, configuration, {}, true, {}});
             socket = process->socket();
