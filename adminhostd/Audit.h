@@ -2,8 +2,9 @@
 
 // The audit: who has asked for what, what it has changed, and how it ended.
 //
-// A command that may change something has two events, one before it runs and one when it has ended; every other request
-// that the worker serves, and every refused one, has one event when it has been answered. Events are written to the
+// A command that may change something has two events, one before it runs and one when it has ended. Every other request
+// that the worker serves, every request that is not permitted, and every refused POST whose body did not exceed the
+// bound of its bytes has one event when it has been answered. Events are written to the
 // log's journal with fields, or to the log as lines (platform/log/Log.h). Writing never blocks: what cannot be written
 // is counted, and the request goes on.
 
