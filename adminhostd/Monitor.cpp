@@ -413,10 +413,13 @@ void Monitor::startNow(Wanted wanted) {
 
 void Monitor::kill(Worker& worker) {
     ::kill(worker.process.pid, SIGKILL);
-    // Its tools must have ended before the next operation. A worker that the kernel cannot end yet, because it waits
-    // for a dead mount, is reaped later.
+    // Its tools must have ended before the next operation.
     pollfd entry{worker.process.process.get(), POLLIN, 0};
-    ::poll(&entry, 1, endingWait);
+    if (::poll(&entry, 1, endingWait) <= 0) {
+        // The kernel cannot end it yet, because it waits for a dead mount. It starts no tool any more, and cannot reap
+        // those it has started: their process ids are still theirs. It is reaped later itself.
+        worker.process.tools.killRemaining();
+    }
 }
 
 void Monitor::endOverruns() {
