@@ -230,7 +230,7 @@ TEST_F(AuditTest, ReadingAfterAPlaceThatTheJournalHasRemovedReportsAGapAndEveryt
     pid_t journald = 0;
     std::ifstream("/run/journald.pid") >> journald;
     ::kill(journald, SIGUSR2);  // rotates the files
-    ASSERT_TRUE(eventually([&] { return !archived().empty(); }));
+    ASSERT_TRUE(eventually([&] { return !archived().empty(); }, std::chrono::seconds(30)));
     std::vector<std::string> left;
     for (int i = 0; i < 3; ++i) {
         left.push_back(daemon->connect().post("/v1/fixture/echo").headers.at("request-id"));

@@ -262,7 +262,8 @@ TEST_F(Permission, NameThatAReloadNoLongerFindsKeepsItsNumberUntilTheTablesDoNot
     const test::HttpReply doctor = daemon.connect().get("/v1/doctor");
     std::ofstream(daemon.directory() / "config") << "[[permission]]\nusers = [\"bert\"]\nclasses = [\"read\"]\n";
     daemon.signal(SIGHUP);
-    EXPECT_TRUE(test::eventually([&] { return as({test::anna}).get("/v1/doctor").status == 403; }))
+    EXPECT_TRUE(
+        test::eventually([&] { return as({test::anna}).get("/v1/doctor").status == 403; }, std::chrono::seconds(30)))
         << "the new tables do not name it";
     std::filesystem::rename(saved, file);
     ASSERT_TRUE(reloaded) << daemon.log();

@@ -349,7 +349,7 @@ TEST(End, RunningWriteWhoseWorkerHangsIsNotAnsweredAsIfItHadNotRun) {
     const pid_t worker = daemon.workerPid();
     UnixHttp writer(daemon.socket(), std::chrono::seconds(60));
     writer.begin("POST", "/v1/fixture/runWrite", "{\"script\": \"touch " + begun + "; sleep 300\"}");
-    ASSERT_TRUE(eventually([&] { return std::filesystem::exists(begun); }));
+    ASSERT_TRUE(eventually([&] { return std::filesystem::exists(begun); }, std::chrono::seconds(30)));
     ::kill(worker, SIGSTOP);  // it does not report the overrun itself
     daemon.signal(SIGTERM);
     const HttpReply reply = writer.reply();
