@@ -25,7 +25,7 @@ bool isNumber(std::string_view text) {
            text.find('.') == text.rfind('.') && text.rfind('-') + 1 <= 1;
 }
 
-std::size_t longestWord(std::string_view text) {
+std::size_t lengthOfLongestWord(std::string_view text) {
     std::size_t longest = 0;
     while (!text.empty()) {
         const std::size_t end = std::min(text.find_first_of(" \n"), text.size());
@@ -74,12 +74,12 @@ bool Table::narrow(std::vector<Column>& columns, std::size_t width, std::size_t 
 std::vector<Table::Column> Table::columns() const {
     std::vector<Column> columns;
     for (std::size_t at = 0; at < _headings.size(); ++at) {
-        Column column{at, widthOf(_headings[at]), longestWord(_headings[at]), true};
+        Column column{at, widthOf(_headings[at]), lengthOfLongestWord(_headings[at]), true};
         bool empty = true;
         for (const auto& row : _rows) {
             empty = empty && row[at].empty();
             column.number = column.number && (row[at].empty() || isNumber(row[at]));
-            column.word = std::max(column.word, longestWord(row[at]));
+            column.word = std::max(column.word, lengthOfLongestWord(row[at]));
             for (const std::string& line : wrapped(row[at], SIZE_MAX)) {
                 column.width = std::max(column.width, widthOf(line));
             }

@@ -16,7 +16,7 @@ constexpr int deepest = 64;  ///< ancestors of a process that are looked at
 
 /// What can be read of the file. A process that ends meanwhile is an error of reading, which the operator does not
 /// throw.
-std::string textOf(const std::string& path) {
+std::string contentOf(const std::string& path) {
     const std::ifstream file(path);
     std::ostringstream text;
     text << file.rdbuf();
@@ -25,7 +25,7 @@ std::string textOf(const std::string& path) {
 
 std::string membersOf(const KernelPlaces& places, const std::string& group) {
     for (const char* hierarchy : {"", "/unified", "/systemd"}) {
-        std::string members = textOf(places.groups + hierarchy + group + "/cgroup.procs");
+        std::string members = contentOf(places.groups + hierarchy + group + "/cgroup.procs");
         if (!members.empty()) {
             return members;
         }
@@ -39,7 +39,7 @@ struct Status {
     pid_t parent = 0;
 };
 std::optional<Status> statusOf(const KernelPlaces& places, pid_t pid) {
-    const std::string text = textOf(fmt::format("{}/{}/stat", places.processes, pid));
+    const std::string text = contentOf(fmt::format("{}/{}/stat", places.processes, pid));
     // "PID (NAME) STATE PARENT ..."; the name may hold blanks and parentheses.
     const std::size_t open = text.find('(');
     const std::size_t close = text.rfind(')');
@@ -69,7 +69,7 @@ bool descendsFrom(const KernelPlaces& places, pid_t pid, pid_t ancestor) {
 }  // namespace
 
 std::string controlGroupOf(pid_t pid, const KernelPlaces& places) {
-    std::istringstream lines(textOf(fmt::format("{}/{}/cgroup", places.processes, pid)));
+    std::istringstream lines(contentOf(fmt::format("{}/{}/cgroup", places.processes, pid)));
     std::string found;
     for (std::string line; std::getline(lines, line);) {
         for (const std::string_view hierarchy : {"0::", "1:name=systemd:"}) {

@@ -6,11 +6,16 @@ target_compile_options(room_options INTERFACE
     -Wall -Wextra -Wpedantic -Werror -Wshadow -Wnon-virtual-dtor -Wold-style-cast -Woverloaded-virtual
     -Wformat=2 -Wundef -fstack-protector-strong)
 target_link_options(room_options INTERFACE -Wl,-z,relro,-z,now -Wl,--as-needed)
-# For targets whose files are compiled together, and see each other's names. Linked last, because it takes back a warning.
+# compile_together(TARGET WHETHER): several of a target's files at a time, which then see each other's names.
+function(compile_together target whether)
+    if(whether)
+        # Linked last, because it takes back warnings.
+        target_link_libraries(${target} PRIVATE compiled_together)
+        set_target_properties(${target} PROPERTIES UNITY_BUILD ON UNITY_BUILD_BATCH_SIZE 4)
+    endif()
+endfunction()
 add_library(compiled_together INTERFACE)
-if(ADMINHOST_TOGETHER)
-    target_compile_options(compiled_together INTERFACE -Wno-shadow)
-endif()
+target_compile_options(compiled_together INTERFACE -Wno-shadow $<$<CXX_COMPILER_ID:GNU>:-Wno-subobject-linkage>)
 if(ADMINHOST_SANITIZE)
     # Instrumented code hides from GCC what is initialised; clang has no such warning.
     target_compile_options(room_options INTERFACE $<$<CXX_COMPILER_ID:GNU>:-Wno-maybe-uninitialized>)
@@ -26,9 +31,13 @@ if(ADMINHOST_FUZZ)  # everything that a harness reaches reports its coverage
     add_link_options(-fsanitize=address,undefined)
 endif()
 
-# adminhost_room(NAME SOURCES... LIBS...): a static library of a room's sources.
+# adminhost_room(NAME [APART] SOURCES... LIBS...): a static library of a room's sources. APART is for one of which programs link
+# single files: they are never compiled together.
 function(adminhost_room name)
-    cmake_parse_arguments(ROOM "" "" "SOURCES;LIBS" ${ARGN})
+    cmake_parse_arguments(ROOM "APART" "" "SOURCES;LIBS" ${ARGN})
     add_library(${name} STATIC ${ROOM_SOURCES})
     target_link_libraries(${name} PUBLIC room_options ${ROOM_LIBS})
+    if(NOT ROOM_APART)
+        compile_together(${name} ${ADMINHOST_ROOMS_TOGETHER})
+    endif()
 endfunction()

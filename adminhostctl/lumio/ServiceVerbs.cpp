@@ -46,7 +46,7 @@ ExitStatus recycle(const Context& context, Words) {
                    "and then \"adminhostctl start\".");
 }
 
-constexpr std::array table = {
+constexpr std::array verbsOfTheService = {
     Verb{"status",
          "",
          "Show the service's state, and the daemon's",
@@ -73,18 +73,18 @@ constexpr std::array table = {
            "account create /Example diradmin --password-file admin.txt --save --yes"}}},
 };
 
-constexpr std::array options = {
+constexpr std::array optionsOfTheService = {
     VerbOption{saveOption, "", "Write the account's name and password into the settings"},
 };
 
 }  // namespace
 
 std::span<const VerbOption> serviceOptions() noexcept {
-    return options;
+    return optionsOfTheService;
 }
 
 std::span<const Verb> serviceVerbs() noexcept {
-    return table;
+    return verbsOfTheService;
 }
 
 }  // namespace adminhost::ctl

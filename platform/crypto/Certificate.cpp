@@ -33,7 +33,7 @@ Date dateOf(const ASN1_TIME* time) {
     return ::ASN1_TIME_to_tm(time, &parts) == 1 ? Date(std::chrono::seconds(::timegm(&parts))) : Date();
 }
 
-auto failed(std::string text) {
+auto unusable(std::string text) {
     ::ERR_clear_error();  // the queue is the thread's
     return failure({"certificate", 1, std::move(text)});
 }
@@ -46,15 +46,15 @@ Result<CertificateFacts> examineCertificate(std::string_view certificate, std::s
     const std::unique_ptr<X509, decltype(&X509_free)> parsed(
         ::PEM_read_bio_X509(certificateText.get(), nullptr, nullptr, nullptr), &X509_free);
     if (!parsed) {
-        return failed("the file does not hold a certificate in PEM form");
+        return unusable("the file does not hold a certificate in PEM form");
     }
     bool wasAsked = false;
     const Text keyText = openText(key);
     const std::unique_ptr<EVP_PKEY, decltype(&EVP_PKEY_free)> parsedKey(
         ::PEM_read_bio_PrivateKey(keyText.get(), nullptr, &noPassphrase, &wasAsked), &EVP_PKEY_free);
     if (!parsedKey) {
-        return failed(wasAsked ? "the key is protected by a passphrase"
-                               : "the file does not hold a private key in PEM form");
+        return unusable(wasAsked ? "the key is protected by a passphrase"
+                                 : "the file does not hold a private key in PEM form");
     }
     CertificateFacts facts;
     facts.notBefore = dateOf(::X509_get0_notBefore(parsed.get()));
