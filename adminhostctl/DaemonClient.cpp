@@ -75,11 +75,6 @@ Failure unknownCommand(const std::string& name, const std::vector<PluginInfo>& p
     return usageError("command not found: " + name + didYouMean(name, known) + "; the commands are " + list);
 }
 
-std::string rawTextAt(const Dictionary& dictionary, std::string_view key) {
-    const std::string* text = dictionary.get(key).string();
-    return text != nullptr ? *text : std::string();
-}
-
 std::uint64_t countAt(const Dictionary& dictionary, std::string_view key) {
     return static_cast<std::uint64_t>(std::max<std::int64_t>(dictionary.get(key).integer().value_or(0), 0));
 }
@@ -369,20 +364,21 @@ RequestReport DaemonClient::report(const std::string& requestId) {
     if (said == nullptr) {
         return report;
     }
-    const std::string state = rawTextAt(*said, "state");
+    const std::string_view state = said->text("state");
     report.state = state == "waiting"   ? RequestReport::State::waiting
                    : state == "running" ? RequestReport::State::running
                    : state == "done"    ? RequestReport::State::done
                                         : RequestReport::State::unknown;
     for (const Dictionary* change : dictionariesAt(*said, "changes")) {
-        report.changes.push_back({rawTextAt(*change, "section"), rawTextAt(*change, "identity"),
-                                  rawTextAt(*change, "name"), rawTextAt(*change, "key"), change->get("from"),
-                                  change->get("to"), change->get("secret").boolean().value_or(false),
+        report.changes.push_back({std::string(change->text("section")), std::string(change->text("identity")),
+                                  std::string(change->text("name")), std::string(change->text("key")),
+                                  change->get("from"), change->get("to"),
+                                  change->get("secret").boolean().value_or(false),
                                   change->get("unverified").boolean().value_or(false)});
     }
     for (const Dictionary* gap : dictionariesAt(*said, "notDone")) {
-        report.notDone.push_back(
-            {rawTextAt(*gap, "keyPath"), rawTextAt(*gap, "reason"), rawTextAt(*gap, "toolMessage")});
+        report.notDone.push_back({std::string(gap->text("keyPath")), std::string(gap->text("reason")),
+                                  std::string(gap->text("toolMessage"))});
     }
     report.changesDropped = countAt(*said, "changesDropped");
     report.notDoneDropped = countAt(*said, "notDoneDropped");

@@ -2,6 +2,7 @@
 
 #include "adminhostctl/Connection.h"
 #include "adminhostctl/Similar.h"
+#include "platform/text/Utf8.h"
 
 #include <algorithm>
 #include <set>
@@ -9,20 +10,16 @@
 namespace adminhost::ctl {
 namespace {
 
-bool isContinuation(char byte) {
-    return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U;
-}
-
 /// Short names that the name, which is not empty, may be a typo of. The daemon does not return all of a large
 /// directory: those that begin with the same letter are asked for, and those that begin as all of the name but its last
 /// letter.
 std::vector<std::string> similarNames(const Context& context, const std::string& name) {
     std::size_t first = 1;
-    while (first < name.size() && isContinuation(name[first])) {
+    while (first < name.size() && continuesCharacter(name[first])) {
         ++first;
     }
     std::size_t last = name.size() - 1;
-    while (last > first && isContinuation(name[last])) {
+    while (last > first && continuesCharacter(name[last])) {
         --last;
     }
     std::vector<std::string> names;

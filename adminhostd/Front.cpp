@@ -4,6 +4,7 @@
 #include "adminhostd/RequestBody.h"
 #include "platform/framework/Release.h"
 #include "platform/log/Log.h"
+#include "platform/text/Uuid.h"
 
 #include <algorithm>
 #include <functional>
@@ -188,7 +189,7 @@ std::optional<HttpAnswer> Front::adoptId(Exchange& exchange, const Target& targe
     if (!id || !target.isOperation()) {
         return std::nullopt;
     }
-    if (!isCanonicalUuid(*id)) {
+    if (!uuidOf(*id)) {
         return errorAnswer(400, "MALFORMED_REQUEST_ID",
                            "Request-Id must be a UUID in its canonical form of 36 characters.");
     }

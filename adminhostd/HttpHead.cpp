@@ -1,7 +1,8 @@
 #include "adminhostd/HttpHead.h"
 
+#include "platform/text/Hex.h"
+
 #include <algorithm>
-#include <cctype>
 #include <charconv>
 #include <cstring>
 #include <vector>
@@ -96,10 +97,10 @@ std::optional<HttpAnswer> headRefusal(MHD_Connection* connection, std::string_vi
 std::size_t decodeEscapes(void*, MHD_Connection*, char* text) {
     char* to = text;
     for (const char* from = text; *from != '\0'; ++to) {
-        unsigned code = 0;
-        if (*from == '%' && std::isxdigit(static_cast<unsigned char>(from[1])) != 0 &&
-            std::from_chars(from + 1, from + 3, code, 16).ptr == from + 3 && code != 0) {
-            *to = static_cast<char>(code);
+        const int high = *from == '%' ? hexValueOf(from[1]) : -1;
+        const int low = high >= 0 ? hexValueOf(from[2]) : -1;
+        if (low >= 0 && high + low > 0) {
+            *to = static_cast<char>(high * 16 + low);
             from += 3;
         } else {
             *to = *from++;

@@ -1,5 +1,6 @@
 #include "adminhostd/RequestLog.h"
 
+#include "adminhostd/ReportForm.h"
 #include "platform/value/ValueCodec.h"
 
 #include <algorithm>
@@ -34,19 +35,11 @@ void RequestRecord::add(std::string_view event) {
 }
 
 void RequestRecord::add(const Change& change) {
-    keep(_changes, Dictionary{{"section", change.section},
-                              {"identity", change.identity},
-                              {"name", change.name},
-                              {"key", change.key},
-                              {"from", change.from},
-                              {"to", change.to},
-                              {"secret", change.secret},
-                              {"undo", change.undo},
-                              {"unverified", change.unverified ? Value(true) : Value()}});
+    keep(_changes, reportOf(change));
 }
 
 void RequestRecord::add(const NotDone& part) {
-    keep(_notDone, Dictionary{{"keyPath", part.keyPath}, {"reason", part.reason}, {"toolMessage", part.toolMessage}});
+    keep(_notDone, reportOf(part));
 }
 
 void RequestRecord::hide(const SecretPart& part) {
@@ -181,14 +174,6 @@ bool RequestLog::use(std::string_view id) {
         _usedInOrder.pop_front();
     }
     return true;
-}
-
-bool isCanonicalUuid(std::string_view text) noexcept {
-    constexpr std::string_view form = "00000000-0000-0000-0000-000000000000";
-    return std::equal(text.begin(), text.end(), form.begin(), form.end(), [](char c, char wanted) {
-        const char lower = lowerCase(c);
-        return wanted == '-' ? c == '-' : (lower >= '0' && lower <= '9') || (lower >= 'a' && lower <= 'f');
-    });
 }
 
 }  // namespace adminhost

@@ -116,8 +116,4 @@ class RequestLog {
     std::unordered_set<std::string> _used;
 };
 
-/// Returns true if the text is a UUID in its canonical form: 32 hexadecimal digits of either case with hyphens
-/// (8-4-4-4-12).
-[[nodiscard]] bool isCanonicalUuid(std::string_view text) noexcept;
-
 }  // namespace adminhost

@@ -10,7 +10,7 @@ std::string toolWords(std::string_view error, std::string_view output) {
     words = words.substr(0, words.find_last_not_of(" \n") + 1);
     // A character that the bound would cut is left out.
     std::size_t length = std::min(words.size(), maximum);
-    while (length < words.size() && length > 0 && (static_cast<unsigned char>(words[length]) & 0xC0U) == 0x80U) {
+    while (length < words.size() && length > 0 && adminhost::continuesCharacter(words[length])) {
         --length;
     }
     return adminhost::utf8Of(words.substr(0, length));

@@ -1,6 +1,7 @@
 #include "platform/log/SystemLog.h"
 
 #include "platform/log/DatagramSocket.h"
+#include "platform/text/Utf8.h"
 
 #include <array>
 #include <cerrno>
@@ -19,7 +20,7 @@ constexpr std::size_t cutSize = std::size_t{64} << 10U;  ///< bytes of a text th
 /// The place where the text may be cut without damaging a character.
 std::string_view cut(std::string_view text) {
     std::size_t size = cutSize;
-    while (size > 0 && (static_cast<unsigned char>(text[size]) & 0xc0U) == 0x80U) {
+    while (size > 0 && continuesCharacter(text[size])) {
         --size;
     }
     return text.substr(0, size);

@@ -129,15 +129,5 @@ TEST(RequestLog, OldestUsedIdIsForgottenBeyondTheBound) {
     EXPECT_TRUE(log.use("0"));
 }
 
-TEST(IsCanonicalUuid, AcceptsOneFormInEitherCase) {
-    EXPECT_TRUE(isCanonicalUuid("6ba7b810-9dad-11d1-80b4-00c04fd430c8"));
-    EXPECT_TRUE(isCanonicalUuid("6BA7B810-9DAD-11D1-80B4-00C04FD430C8"));
-    EXPECT_FALSE(isCanonicalUuid(""));
-    EXPECT_FALSE(isCanonicalUuid("6ba7b8109dad11d180b400c04fd430c8"));
-    EXPECT_FALSE(isCanonicalUuid("6ba7b810-9dad-11d1-80b4-00c04fd430c8 "));
-    EXPECT_FALSE(isCanonicalUuid("6ba7b810-9dad-11d1-80b4-00c04fd430cg"));
-    EXPECT_FALSE(isCanonicalUuid("6ba7b810-9dad-11d1-80b4-00c04fd430c"));
-}
-
 }  // namespace
 }  // namespace adminhost
