@@ -1,5 +1,7 @@
 #include "adminhostd/Audit.h"
 
+#include "adminhostd/Permissions.h"
+#include "adminhostd/ReportForm.h"
 #include "platform/log/Log.h"
 
 #include <algorithm>
@@ -140,18 +142,32 @@ void Audit::ended(RequestRecord& record) {
     write(event, redaction);
 }
 
+namespace {
+
+template <class Report>
+Array reportsOf(const std::vector<Report>& reports) {
+    Array all;
+    all.reserve(reports.size());
+    for (const Report& report : reports) {
+        all.emplace_back(reportOf(report));
+    }
+    return all;
+}
+
+}  // namespace
+
 void Audit::unfinished(const protocol::Unfinished& request) {
     AuditEvent event;
     event.kind = AuditEvent::Kind::unfinished;
     event.request = request.request;
     event.plugin = request.plugin;
     event.command = request.command;
-    event.access = request.access;
+    event.access = nameOf(rightFor(request.access));
     const protocol::Caller& caller = request.caller;
     event.client = {caller.uid, request.user, caller.login, request.loginUser, caller.pid, caller.unit};
     event.result = request.end;
-    event.changes = {Array(request.changes.begin(), request.changes.end()), request.changes.size()};
-    event.notDone = {Array(request.notDone.begin(), request.notDone.end()), request.notDone.size()};
+    event.changes = {reportsOf(request.changes), request.changes.size()};
+    event.notDone = {reportsOf(request.notDone), request.notDone.size()};
     write(event, Redaction());
 }
 

@@ -1,5 +1,7 @@
 #include "adminhostd/BegunRequest.h"
 
+#include "adminhostd/Permissions.h"
+#include "adminhostd/ReportForm.h"
 #include "platform/files/CreateMissing.h"
 #include "platform/files/File.h"
 #include "platform/json/Json.h"
@@ -40,15 +42,14 @@ std::string noteOf(std::string_view request) {
     return notesDirectory().text() + '/' + std::string(request);
 }
 
-Dictionary reportOf(const Change& change) {
-    return {{"section", change.section}, {"identity", change.identity},
-            {"name", change.name},       {"key", change.key},
-            {"from", change.from},       {"to", change.to},
-            {"secret", change.secret},   {"unverified", change.unverified ? Value(true) : Value()}};
-}
-
-Dictionary reportOf(const NotDone& part) {
-    return {{"keyPath", part.keyPath}, {"reason", part.reason}, {"toolMessage", part.toolMessage}};
+/// A note has the same words as permissions. One of another release counts as the most confined class.
+Access accessOf(std::string_view word) {
+    for (const Access access : {Access::read, Access::write, Access::control}) {
+        if (word == nameOf(rightFor(access))) {
+            return access;
+        }
+    }
+    return Access::account;
 }
 
 std::uint32_t numberAt(const Dictionary& line, std::string_view key) {
@@ -59,7 +60,7 @@ void read(const Dictionary& line, protocol::Unfinished& note) {
     note.request = line.text("request");
     note.plugin = line.text("plugin");
     note.command = line.text("command");
-    note.access = line.text("access");
+    note.access = accessOf(line.text("access"));
     note.caller = {numberAt(line, "uid"), static_cast<pid_t>(numberAt(line, "pid")), numberAt(line, "login"),
                    std::string(line.text("unit"))};
     note.user = line.text("user");
@@ -90,9 +91,9 @@ std::optional<protocol::Unfinished> noteIn(const std::string& text) {
             }
             read(*line, note);
         } else if (const Dictionary* change = line->get("change").dictionary()) {
-            note.changes.push_back(*change);
+            note.changes.push_back(changeOf(*change));
         } else if (const Dictionary* part = line->get("notDone").dictionary()) {
-            note.notDone.push_back(*part);
+            note.notDone.push_back(notDoneOf(*part));
         } else if (const std::string* how = line->get("end").string()) {
             note.end = *how;
         }
@@ -123,7 +124,7 @@ BegunRequest::BegunRequest(const protocol::Unfinished& about, Redaction redactio
             {"request", about.request},
             {"plugin", about.plugin},
             {"command", about.command},
-            {"access", about.access},
+            {"access", nameOf(rightFor(about.access))},
             {"uid", about.caller.uid},
             {"pid", about.caller.pid},
             {"login", about.caller.login},

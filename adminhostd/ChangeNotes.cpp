@@ -2,7 +2,6 @@
 
 #include "adminhostd/LoadedPlugins.h"
 #include "adminhostd/Login.h"
-#include "adminhostd/Permissions.h"
 #include "platform/log/Log.h"
 
 #include <utility>
@@ -54,7 +53,7 @@ bool ChangeNotes::begin(const LoadedPlugin& loaded, const protocol::Perform& ord
     about.request = order.request;
     about.plugin = loaded.name;
     about.command = order.command;
-    about.access = nameOf(rightFor(command == nullptr ? Access::account : command->access));
+    about.access = command == nullptr ? Access::account : command->access;
     about.caller = order.caller;
     about.user = accountNameOf(order.caller.uid);
     about.loginUser = order.caller.login == noLogin ? std::string() : accountNameOf(order.caller.login);

@@ -83,7 +83,8 @@ void apply(const ConfigurationEntry& entry, Options& options) {
     } else if (entry.key() == "account_uuids") {
         options.accountUuids = entry.text();
     } else if (entry.key() == "service_manager") {
-        options.serviceManager = entry.choice<std::string>({{"systemd", "systemd"}, {"pidfile", "pidfile"}});
+        options.serviceManager =
+            entry.choice<ServiceManager>({{"systemd", ServiceManager::systemd}, {"pidfile", ServiceManager::pidFile}});
     } else if (entry.key() == "request_deadline_seconds") {
         options.deadline = std::chrono::milliseconds(std::llround(std::ceil(entry.seconds() * 1000)));
     } else if (entry.key() == "queue_limit") {

@@ -20,7 +20,7 @@ consteval Member<Owner, T> member(const char* name, T Owner::*place) {
     return {name, place};
 }
 
-/// A message's members and their names. The names occur nowhere else: scripts/check looks for them.
+/// A message's members and their names. The names occur nowhere else: scripts/message_members.py looks for them.
 template <class T>
 constexpr std::nullptr_t members = nullptr;
 

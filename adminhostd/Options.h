@@ -7,6 +7,7 @@
 #include "adminhostd/Permissions.h"
 #include "adminhostd/RequestBounds.h"
 #include "platform/files/Path.h"
+#include "platform/service/ServiceState.h"
 #include "platform/value/Value.h"
 
 #include <chrono>
@@ -26,7 +27,7 @@ struct Options {
     std::string account;             ///< of the front, if started as the superuser; empty: see frontAccount()
     std::optional<Array> languages;  ///< instead of those of the environment
     std::string accountUuids;        ///< host path of the accounts' UUIDs; empty: name-based ones
-    std::string serviceManager;      ///< "systemd" or "pidfile"; empty: the platform's default
+    std::optional<ServiceManager> serviceManager;  ///< nullopt: the platform's default
     DirectoryOptions directory;
     std::chrono::milliseconds deadline{300'000};  ///< of one operation
     RequestBounds bounds;

@@ -73,6 +73,12 @@ constexpr Word<Access> accessWords[] = {
 constexpr Word<Diagnosis::Health> healthWords[] = {
     {Diagnosis::Health::ok, "ok"}, {Diagnosis::Health::warning, "warning"}, {Diagnosis::Health::failure, "failure"}};
 
+constexpr Word<ServiceManager> managerWords[] = {{ServiceManager::systemd, "systemd"},
+                                                 {ServiceManager::pidFile, "pidfile"}};
+
+constexpr auto& wordsOf(ServiceManager) {
+    return managerWords;
+}
 constexpr auto& wordsOf(Diagnosis::Health) {
     return healthWords;
 }

@@ -11,6 +11,7 @@
 #include "adminhostd/RequestBody.h"
 #include "platform/framework/Plugin.h"
 #include "platform/framework/Report.h"
+#include "platform/service/ServiceState.h"
 #include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
@@ -72,8 +73,8 @@ struct RefusedPlugin {
 struct Configure {
     std::string build;  ///< the front's; must be the worker's
     std::string root;
-    std::string accountUuids;    ///< host path of a file; empty: none
-    std::string serviceManager;  ///< "systemd" or "pidfile"; empty: the default
+    std::string accountUuids;                      ///< host path of a file; empty: none
+    std::optional<ServiceManager> serviceManager;  ///< nullopt: the platform's default
     std::vector<std::string> plugins;
     std::vector<RefusedPlugin> refused;  ///< plug-ins that the monitor does not offer, for Hello
     std::vector<std::string> languages;
@@ -193,12 +194,12 @@ struct Unfinished {
     std::string request;
     std::string plugin;
     std::string command;
-    std::string access;  ///< "write"
+    Access access = Access::account;
     Caller caller;
     std::string user;
     std::string loginUser;
-    std::vector<Dictionary> changes;  ///< as requests report them, without secrets
-    std::vector<Dictionary> notDone;
+    std::vector<Change> changes;  ///< without secrets, and without what would undo them
+    std::vector<NotDone> notDone;
     std::string end;  ///< what is known of its end, as a part of a sentence
     bool operator==(const Unfinished&) const = default;
 };

@@ -176,9 +176,8 @@ protocol::Hello Worker::configure(const protocol::Configure& configuration) {
     for (const std::string& problem : nodeProblems) {
         logEvent("adminhostd: " + problem);
     }
-    if (!configuration.serviceManager.empty()) {
-        setServiceManager(configuration.serviceManager == "pidfile" ? ServiceManager::pidFile
-                                                                    : ServiceManager::systemd);
+    if (configuration.serviceManager) {
+        setServiceManager(*configuration.serviceManager);
     }
     _plugins.setToolEnvironment(configuration.toolEnvironment);
     if (const auto found = configuration.toolEnvironment.find(toolConfigurationVariable);

@@ -33,7 +33,7 @@ class BegunRequests : public testing::Test {
         about.request = request;
         about.plugin = "p";
         about.command = "c";
-        about.access = "write";
+        about.access = Access::write;
         about.caller = {1000, 42, 1005, "session-3.scope"};
         about.user = "anna";
         about.loginUser = "eva";
@@ -52,15 +52,8 @@ TEST_F(BegunRequests, NoteHasTheRequestItsReportsAndItsEnd) {
         EXPECT_EQ(BegunRequest::left().notes, std::vector{expected}) << "nothing is known yet";
         request.add(Change{"settings", "", "", "port", 80, 443, false, Dictionary{{"port", 80}}});
         request.add(NotDone{"configuration.x", "not known", "words"});
-        expected.changes = {Dictionary{{"section", "settings"},
-                                       {"identity", ""},
-                                       {"name", ""},
-                                       {"key", "port"},
-                                       {"from", 80},
-                                       {"to", 443},
-                                       {"secret", false}}};
-        expected.notDone = {
-            Dictionary{{"keyPath", "configuration.x"}, {"reason", "not known"}, {"toolMessage", "words"}}};
+        expected.changes = {Change{"settings", "", "", "port", 80, 443, false, {}, false}};
+        expected.notDone = {NotDone{"configuration.x", "not known", "words"}};
         EXPECT_EQ(BegunRequest::left().notes, std::vector{expected});
         request.ended("its operation failed");
     }
@@ -69,6 +62,21 @@ TEST_F(BegunRequests, NoteHasTheRequestItsReportsAndItsEnd) {
     BegunRequest::remove("1-1");
     EXPECT_THAT(BegunRequest::left().notes, IsEmpty());
     BegunRequest::remove("1-1");
+}
+
+TEST_F(BegunRequests, EachAccessIsNotedAndAnUnknownOneCountsAsThatOfAccounts) {
+    for (const Access access : {Access::read, Access::write, Access::control, Access::account}) {
+        protocol::Unfinished one = about("1-1");
+        one.access = access;
+        const BegunRequest request(one, Redaction());
+        ASSERT_EQ(BegunRequest::left().notes.size(), 1U);
+        EXPECT_EQ(BegunRequest::left().notes[0].access, access);
+    }
+    std::string note = root.read(std::string(notes) + "/1-1");
+    note.replace(note.find("\"account\""), 9, "\"another\"");
+    root.write(std::string(notes) + "/1-1", note);
+    ASSERT_EQ(BegunRequest::left().notes.size(), 1U);
+    EXPECT_EQ(BegunRequest::left().notes[0].access, Access::account);
 }
 
 TEST_F(BegunRequests, NotesAreForTheDaemonAlone) {

@@ -63,7 +63,7 @@ std::vector<ToWorker> messagesToWorker() {
     return {Configure{.build = "b",
                       .root = "/r",
                       .accountUuids = "/u",
-                      .serviceManager = "pidfile",
+                      .serviceManager = ServiceManager::pidFile,
                       .plugins = {"/a.so", "/b.so"},
                       .refused = {{"/c.so", "reason"}},
                       .languages = {"de"},
@@ -121,12 +121,12 @@ std::vector<ToFront> messagesToFront() {
         Unfinished{"r",
                    "p",
                    "c",
-                   "write",
+                   Access::write,
                    {7, 8, 9, "u.scope"},
                    "anna",
                    "eva",
-                   {Dictionary{{"key", "port"}}},
-                   {Dictionary{{"reason", "why"}}},
+                   {Change{"settings", "", "", "port", Value(1), Value(2), false, {}, false}},
+                   {NotDone{"configuration.a", "why", "words"}},
                    "its end"}};
     for (const Outcome outcome : outcomes()) {
         messages.emplace_back(answer(outcome));
@@ -185,10 +185,11 @@ void spoilEveryMember(const auto& messages, Decode decode) {
             missing.payload.dictionary()->remove(entry.key);
             Frame wrong = frame;
             wrong.payload.dictionary()->set(entry.key, Value(Data{1}));
-            const bool mayBeAbsent =
+            const bool isAnyValue =
                 entry.key.ends_with(".from") || entry.key.ends_with(".to") || entry.key.ends_with(".undo");
+            const bool mayBeAbsent = isAnyValue || entry.key.ends_with(".serviceManager");
             EXPECT_EQ(decode(missing).has_value(), mayBeAbsent) << entry.key;
-            EXPECT_EQ(decode(wrong).has_value(), mayBeAbsent) << entry.key;
+            EXPECT_EQ(decode(wrong).has_value(), isAnyValue) << entry.key;
         }
     }
 }
@@ -216,6 +217,19 @@ TEST(Protocol, UnknownWordIsAnError) {
     const auto read = toFront(frame);
     ASSERT_FALSE(read);
     EXPECT_NE(read.error().description->find("is missing or wrong"), std::string::npos);
+}
+
+TEST(Protocol, UnknownServiceManagerIsAnError) {
+    Configure configuration;
+    configuration.serviceManager = ServiceManager::systemd;
+    Frame frame = frameOf(configuration);
+    EXPECT_TRUE(toWorker(frame));
+    for (const DictionaryEntry& entry : Dictionary(*frame.payload.dictionary())) {
+        if (entry.value == Value("systemd")) {
+            frame.payload.dictionary()->set(entry.key, "another");
+        }
+    }
+    EXPECT_FALSE(toWorker(frame));
 }
 
 TEST(Protocol, NumberOutsideTheRangeOfItsMemberIsAnError) {
