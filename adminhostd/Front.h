@@ -23,6 +23,7 @@
 #include <vector>
 
 #include <sys/types.h>
+#include <tl/expected.hpp>
 
 namespace adminhost {
 
@@ -77,9 +78,9 @@ class Front {
     void operation(Exchange& exchange, const Target& target);
     /// Passes on a request that the worker serves without an operation of a plug-in.
     void query(Exchange& exchange, const Target& target);
-    /// The order for such a request; nullopt, with the answer, if its arguments are malformed.
-    [[nodiscard]] static std::optional<protocol::ToWorker> orderFor(const Exchange& exchange, const Target& target,
-                                                                    HttpAnswer& malformed);
+    /// The order for such a request; the answer if its arguments are malformed.
+    [[nodiscard]] static tl::expected<protocol::ToWorker, HttpAnswer> orderFor(const Exchange& exchange,
+                                                                               const Target& target);
     void enqueue(Operation operation);
     void finished(const Operation& operation, OperationQueue::Ending ending);
     /// The front's own checks, and those of the worker or the reason why it made none.

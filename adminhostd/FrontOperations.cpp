@@ -53,12 +53,11 @@ void Front::operation(Exchange& exchange, const Target& target) {
         }
     }
     const Command& command = *commandOf(target);
-    BodyProblem problem;
-    auto request =
-        requestOf(exchange.body(), *bodyFormOf(exchange.header("Content-Type").value_or("")), problem, _bodyBounds);
+    auto request = requestOf(exchange.body(), *bodyFormOf(exchange.header("Content-Type").value_or("")), _bodyBounds);
     exchange.dropBody();
     if (!request) {
         using Kind = BodyProblem::Kind;
+        const BodyProblem& problem = request.error();
         return refuse(problem.kind == Kind::tooManyValues ? errorAnswer(413, "BODY_TOO_LARGE", problem.text)
                       : problem.kind == Kind::tooDeep     ? errorAnswer(413, "BODY_TOO_DEEP", problem.text)
                                                           : errorAnswer(400, "MALFORMED_BODY", problem.text));
@@ -95,11 +94,9 @@ void Front::operation(Exchange& exchange, const Target& target) {
     enqueue(std::move(operation));
 }
 
-std::optional<protocol::ToWorker> Front::orderFor(const Exchange& exchange, const Target& target,
-                                                  HttpAnswer& malformed) {
-    const auto refuse = [&](const char* what) {
-        malformed = errorAnswer(400, "MALFORMED_ADDRESS", what);
-        return std::nullopt;
+tl::expected<protocol::ToWorker, HttpAnswer> Front::orderFor(const Exchange& exchange, const Target& target) {
+    const auto refuse = [](const char* what) {
+        return tl::unexpected<HttpAnswer>(errorAnswer(400, "MALFORMED_ADDRESS", what));
     };
     for (const char* argument : {"match", "is", "plugin", "user", "key", "after"}) {
         if (!isUtf8(exchange.argument(argument))) {
@@ -154,11 +151,10 @@ void Front::query(Exchange& exchange, const Target& target) {
         operation.record->place = fmt::format("{}?{}", exchange.path(), exchange.argument("plugin"));
     }
     name(*operation.record, target);
-    HttpAnswer malformed;
-    auto order = orderFor(exchange, target, malformed);
+    auto order = orderFor(exchange, target);
     if (!order) {
-        const std::string code(codeOf(malformed));
-        end(operation, std::move(malformed), code);
+        const std::string code(codeOf(order.error()));
+        end(operation, std::move(order.error()), code);
         return;
     }
     operation.order = *std::move(order);

@@ -66,29 +66,29 @@ std::optional<BodyForm> bodyFormOf(std::string_view contentType) {
     return same(type, "application/x-plist") ? std::optional(BodyForm::propertyList) : std::nullopt;
 }
 
-std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem,
-                                    const BodyBounds& bounds) {
+tl::expected<Dictionary, BodyProblem> requestOf(std::string_view body, BodyForm form, const BodyBounds& bounds) {
+    using Kind = BodyProblem::Kind;
+    const auto refused = [](Kind kind, std::string text) {
+        return tl::unexpected<BodyProblem>(BodyProblem{kind, std::move(text)});
+    };
     if (body.empty()) {
         return Dictionary();
     }
     auto value = form == BodyForm::json ? parseJson(body, bounds.values) : parsePropertyList(body, bounds.values);
     if (!value) {
         const Error& error = value.error();
-        if (error.code == (form == BodyForm::json ? jsonTooManyValues : plistTooManyValues)) {
-            problem.kind = BodyProblem::Kind::tooManyValues;
-        }
-        problem.text = error.description.value_or("The body cannot be read.");
-        return std::nullopt;
+        const bool isTooMany = error.code == (form == BodyForm::json ? jsonTooManyValues : plistTooManyValues);
+        return refused(isTooMany ? Kind::tooManyValues : Kind::malformed,
+                       error.description.value_or("The body cannot be read."));
     }
     if (value->dictionary() == nullptr) {
-        problem.text =
-            fmt::format("line 1, column 1: a request is a dictionary, not a value of type {}", nameOf(value->type()));
-        return std::nullopt;
+        return refused(
+            Kind::malformed,
+            fmt::format("line 1, column 1: a request is a dictionary, not a value of type {}", nameOf(value->type())));
     }
     if (isDeeper(*value, bounds.depth)) {
-        problem.kind = BodyProblem::Kind::tooDeep;
-        problem.text = fmt::format("Lists and dictionaries of a request may be nested {} deep at most.", bounds.depth);
-        return std::nullopt;
+        return refused(Kind::tooDeep,
+                       fmt::format("Lists and dictionaries of a request may be nested {} deep at most.", bounds.depth));
     }
     return std::move(*value->dictionary());
 }

@@ -12,6 +12,8 @@
 #include <string_view>
 #include <vector>
 
+#include <tl/expected.hpp>
+
 namespace adminhost {
 
 struct BodyBounds {
@@ -32,10 +34,9 @@ struct BodyProblem {
     std::string text;             ///< with line and column where they are known
 };
 
-/// The request dictionary of a body; an empty one for an empty body. Returns nullopt, with the problem, if the body is
-/// not a dictionary.
-[[nodiscard]] std::optional<Dictionary> requestOf(std::string_view body, BodyForm form, BodyProblem& problem,
-                                                  const BodyBounds& bounds = {});
+/// The request dictionary of a body; an empty one for an empty body.
+[[nodiscard]] tl::expected<Dictionary, BodyProblem> requestOf(std::string_view body, BodyForm form,
+                                                              const BodyBounds& bounds = {});
 
 /// Returns true when an Accept header prefers a property list to JSON, by a higher weight or by naming it first.
 [[nodiscard]] bool prefersPropertyList(std::string_view accept);

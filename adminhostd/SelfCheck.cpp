@@ -23,19 +23,19 @@
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <sys/wait.h>
+#include <tl/expected.hpp>
 #include <unistd.h>
 
 namespace adminhost {
 namespace {
 
-/// The worker's first message. If there is none, `problem` describes why.
-protocol::Hello helloOf(const protocol::Configure& configuration, std::string& problem) {
+/// The worker's first message, or why there is none.
+tl::expected<protocol::Hello, std::string> helloOf(const protocol::Configure& configuration) {
     protocol::Hello hello;
-    hello.refused = configuration.refused;
     auto worker = startWorker(true);
     if (!worker) {
-        problem = fmt::format("The worker cannot be started: {}", worker.error().description.value_or(""));
-        return hello;
+        return tl::unexpected<std::string>(
+            fmt::format("The worker cannot be started: {}", worker.error().description.value_or("")));
     }
     const int socket = worker->conversation.get();
     const timeval bound{30, 0};
@@ -63,8 +63,9 @@ protocol::Hello helloOf(const protocol::Configure& configuration, std::string& p
     }
     worker->tools.killRemaining();
     if (!ready) {
-        problem = hangs ? "The worker is not ready in time: a plug-in hangs while it is loaded."
-                        : "The worker " + endingText(status) + " before it was ready.";
+        return tl::unexpected<std::string>(hangs
+                                               ? "The worker is not ready in time: a plug-in hangs while it is loaded."
+                                               : "The worker " + endingText(status) + " before it was ready.");
     }
     return hello;
 }
@@ -101,12 +102,14 @@ int check(const Options& options) {
         const std::string parent = privateParent(options);
         const bool writable = ::access(parent.c_str(), W_OK | X_OK) == 0;
         const ToolConfiguration tools(writable ? parent : std::filesystem::temp_directory_path().string());
-        std::string problem;
         protocol::Configure configuration = workerConfiguration(options, plugins, tools.directory());
         configuration.tryOnly = true;
-        const protocol::Hello hello = helloOf(configuration, problem);
-        if (!problem.empty()) {
-            problems.push_back(problem);
+        protocol::Hello hello;
+        if (auto received = helloOf(configuration)) {
+            hello = *std::move(received);
+        } else {
+            problems.push_back(received.error());
+            hello.refused = configuration.refused;
         }
         for (const protocol::RefusedPlugin& plugin : hello.refused) {
             problems.push_back(plugin.reason);

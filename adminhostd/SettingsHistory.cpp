@@ -184,13 +184,12 @@ Result<Dictionary> SettingsHistory::snapshotOf(const Dictionary& values) const {
     return Dictionary{{"settings", std::move(settings)}, {"digests", std::move(digests)}};
 }
 
-std::optional<Error> SettingsHistory::add(const std::vector<HostPath>& files, Dictionary about,
-                                          std::uint64_t& number) const {
+Result<std::uint64_t> SettingsHistory::add(const std::vector<HostPath>& files, Dictionary about) const {
     std::vector<std::uint64_t> numbers = numbersIn(_directory);
-    number = nextAfter(numbers);
+    const std::uint64_t number = nextAfter(numbers);
     const HostPath making = below(_directory, std::string(unfinished) + std::to_string(number));
     if (auto created = createDirectories(diskPath(making), historyOwner()); !created) {
-        return std::move(created.error());
+        return failure(std::move(created.error()));
     }
     Array kept;
     std::optional<Error> error = copy(files, making, kept);
@@ -208,13 +207,13 @@ std::optional<Error> SettingsHistory::add(const std::vector<HostPath>& files, Di
     }
     if (error) {
         removeAll(making);
-        return error;
+        return failure(*std::move(error));
     }
     numbers.push_back(number);
     for (std::size_t i = 0; i + settingsMaximum < numbers.size(); ++i) {
         removeAll(entryOf(_directory, numbers[i]));
     }
-    return std::nullopt;
+    return number;
 }
 
 std::optional<Error> SettingsHistory::keepOutsideEdit(const Dictionary& snapshot, const Dictionary& about) const {
@@ -234,8 +233,8 @@ std::optional<Error> SettingsHistory::keepOutsideEdit(const Dictionary& snapshot
     edit.set("digests", after.get("digests"));
     edit.set("after", snapshot);
     edit.set("changes", std::move(changes));
-    std::uint64_t number = 0;
-    return add({}, std::move(edit), number);
+    const auto added = add({}, std::move(edit));
+    return added ? std::nullopt : std::optional(added.error());
 }
 
 Result<std::uint64_t> SettingsHistory::keep(const std::vector<HostPath>& files, const Dictionary& values,
@@ -255,11 +254,7 @@ Result<std::uint64_t> SettingsHistory::keep(const std::vector<HostPath>& files, 
     for (const DictionaryEntry& part : *snapshot) {
         entry.set(part.key, part.value);
     }
-    std::uint64_t number = 0;
-    if (auto error = add(files, std::move(entry), number)) {
-        return failure(*std::move(error));
-    }
-    return number;
+    return add(files, std::move(entry));
 }
 
 std::optional<Error> SettingsHistory::complete(std::uint64_t number, const Dictionary& values) const {

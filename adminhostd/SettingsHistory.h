@@ -67,8 +67,8 @@ class SettingsHistory {
     [[nodiscard]] Result<Dictionary> snapshotOf(const Dictionary& values) const;
     [[nodiscard]] Result<std::string> digestKey() const;
     [[nodiscard]] std::optional<Error> keepOutsideEdit(const Dictionary& snapshot, const Dictionary& about) const;
-    [[nodiscard]] std::optional<Error> add(const std::vector<HostPath>& files, Dictionary about,
-                                           std::uint64_t& number) const;
+    /// Adds an entry and returns its number.
+    [[nodiscard]] Result<std::uint64_t> add(const std::vector<HostPath>& files, Dictionary about) const;
     [[nodiscard]] std::optional<Error> hideFormerValues(const std::vector<SecretPart>& secret) const;
 
     HostPath _directory;

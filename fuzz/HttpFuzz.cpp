@@ -37,11 +37,10 @@ void serve(Exchange& exchange) {
     static_cast<void>(exchange.argument("after"));
     HttpAnswer answer;
     if (const auto form = bodyFormOf(exchange.header("Content-Type").value_or(""))) {
-        BodyProblem problem;
-        if (auto request = requestOf(exchange.body(), *form, problem)) {
+        if (auto request = requestOf(exchange.body(), *form)) {
             answer.body = Value(*std::move(request));
         } else {
-            require(!problem.text.empty());
+            require(!request.error().text.empty());
             answer.status = 400;
         }
     }

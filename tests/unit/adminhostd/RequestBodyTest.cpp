@@ -19,17 +19,23 @@ TEST(BodyFormOf, ReadsTypeAndCharacterSetInAnyCase) {
     }
 }
 
-TEST(RequestOf, TakesDictionariesOnly) {
-    BodyProblem problem;
-    EXPECT_EQ(requestOf("", BodyForm::json, problem), Dictionary());
-    EXPECT_EQ(requestOf("", BodyForm::propertyList, problem), Dictionary());
-    EXPECT_EQ(requestOf("{\"a\":1}", BodyForm::json, problem), (Dictionary{{"a", 1}}));
-    EXPECT_FALSE(requestOf("null", BodyForm::json, problem));
-    EXPECT_FALSE(requestOf("\"text\"", BodyForm::json, problem));
-    EXPECT_EQ(problem.text, "line 1, column 1: a request is a dictionary, not a value of type text");
-    EXPECT_FALSE(requestOf("{", BodyForm::propertyList, problem));
+/// The problem of a body that has one.
+BodyProblem problemOf(std::string_view body, BodyForm form, const BodyBounds& bounds = {}) {
+    const auto request = requestOf(body, form, bounds);
+    EXPECT_FALSE(request) << body.substr(0, 100);
+    return request ? BodyProblem{} : request.error();
+}
+
+TEST(RequestOf, AcceptsDictionariesOnly) {
+    EXPECT_EQ(requestOf("", BodyForm::json), Dictionary());
+    EXPECT_EQ(requestOf("", BodyForm::propertyList), Dictionary());
+    EXPECT_EQ(requestOf("{\"a\":1}", BodyForm::json), (Dictionary{{"a", 1}}));
+    EXPECT_FALSE(requestOf("null", BodyForm::json));
+    EXPECT_EQ(problemOf("\"text\"", BodyForm::json).text,
+              "line 1, column 1: a request is a dictionary, not a value of type text");
+    const BodyProblem problem = problemOf("{", BodyForm::propertyList);
     EXPECT_NE(problem.text.find("line"), std::string::npos) << problem.text;
-    EXPECT_FALSE((problem.kind == BodyProblem::Kind::tooManyValues));
+    EXPECT_EQ(problem.kind, BodyProblem::Kind::malformed);
 }
 
 TEST(RequestOf, BoundsTheNumberOfValuesInBothForms) {
@@ -48,16 +54,14 @@ TEST(RequestOf, BoundsTheNumberOfValuesInBothForms) {
         }
         return text + "</array></dict></plist>";
     };
-    BodyProblem problem;
-    EXPECT_TRUE(requestOf(json(BodyBounds().values), BodyForm::json, problem)) << problem.text;
-    EXPECT_TRUE(requestOf(list(BodyBounds().values), BodyForm::propertyList, problem)) << problem.text;
-    EXPECT_FALSE(requestOf(json(BodyBounds().values + 1), BodyForm::json, problem));
-    EXPECT_TRUE((problem.kind == BodyProblem::Kind::tooManyValues));
-    EXPECT_EQ(problem.text, "line 1, column 200005: there are more than 100000 values");
-    problem = {};
-    EXPECT_FALSE(requestOf(list(BodyBounds().values + 1), BodyForm::propertyList, problem));
-    EXPECT_TRUE((problem.kind == BodyProblem::Kind::tooManyValues));
-    EXPECT_TRUE(problem.text.starts_with("line 1, column ")) << problem.text;
+    EXPECT_TRUE(requestOf(json(BodyBounds().values), BodyForm::json));
+    EXPECT_TRUE(requestOf(list(BodyBounds().values), BodyForm::propertyList));
+    const BodyProblem ofJson = problemOf(json(BodyBounds().values + 1), BodyForm::json);
+    EXPECT_EQ(ofJson.kind, BodyProblem::Kind::tooManyValues);
+    EXPECT_EQ(ofJson.text, "line 1, column 200005: there are more than 100000 values");
+    const BodyProblem ofList = problemOf(list(BodyBounds().values + 1), BodyForm::propertyList);
+    EXPECT_EQ(ofList.kind, BodyProblem::Kind::tooManyValues);
+    EXPECT_TRUE(ofList.text.starts_with("line 1, column ")) << ofList.text;
 }
 
 TEST(PrefersPropertyList, WeighsWhatIsAcceptedAndTakesTheFirstOfEquals) {
@@ -88,14 +92,13 @@ TEST(RevisionsOf, ReadsAListOfQuotedTexts) {
 }
 
 TEST(RequestBody, DepthIsBoundedInBothForms) {
-    BodyProblem problem;
     const BodyBounds bounds{.values = 100, .depth = 3};
-    EXPECT_TRUE(requestOf(R"({"a":[{"b":1}]})", BodyForm::json, problem, bounds));
-    EXPECT_FALSE(requestOf(R"({"a":[{"b":[]}]})", BodyForm::json, problem, bounds));
-    EXPECT_EQ(problem.kind, BodyProblem::Kind::tooDeep);
-    EXPECT_FALSE(requestOf("<plist><dict><key>a</key><array><array><array/></array></array></dict></plist>",
-                           BodyForm::propertyList, problem, bounds));
-    EXPECT_EQ(problem.kind, BodyProblem::Kind::tooDeep);
+    EXPECT_TRUE(requestOf(R"({"a":[{"b":1}]})", BodyForm::json, bounds));
+    EXPECT_EQ(problemOf(R"({"a":[{"b":[]}]})", BodyForm::json, bounds).kind, BodyProblem::Kind::tooDeep);
+    EXPECT_EQ(problemOf("<plist><dict><key>a</key><array><array><array/></array></array></dict></plist>",
+                        BodyForm::propertyList, bounds)
+                  .kind,
+              BodyProblem::Kind::tooDeep);
 }
 
 TEST(RequestDeadline, IsAWholeNumberOfSecondsFromOne) {
