@@ -32,6 +32,7 @@ MAY_INCLUDE = {
     "adminhostctl/lumio": CONTROL | {"adminhostctl", "adminhostctl/desired"},
     "adminhostctl/Main.cpp": CONTROL | {"adminhostctl", "adminhostctl/desired", "adminhostctl/lumio"},
 }
+PICTURE = "A room may include only the rooms to its right:"
 TOP = {room.split("/", 1)[0] for room in MAY_INCLUDE}
 FREE = {"tests", "bench", "fuzz"}
 
@@ -51,7 +52,35 @@ def refused(source, included):
     return f"{origin} must not include {target}"
 
 
+def pictured(text):
+    """The table that the picture in the text draws: in each of its lines, a room may include all rooms to its right."""
+    picture = text.partition(PICTURE)[2].lstrip("\n").partition("\n\n")[0]
+    table = {}
+    for line in re.sub(r"\n +->", " ->", picture).splitlines():
+        groups = [set(re.split(r", *", group.strip(" {}"))) for group in line.split("->")]
+        for i, group in enumerate(groups):
+            for room in group:
+                table.setdefault(room, set()).update(*groups[i + 1:])
+    return table
+
+
+def differences(root):
+    """Rooms for which the table and the picture differ."""
+    document = root / "docs/architecture.md"
+    if not document.exists():
+        return
+    picture = pictured(document.read_text(encoding="utf-8"))
+    for room, allowed in MAY_INCLUDE.items():
+        if room not in picture or picture[room] != allowed:
+            shown = ", ".join(sorted(picture.get(room, set()) ^ allowed)) or "the room itself"
+            yield f"docs/architecture.md: the picture differs from the table of include_edges.py for {room}: {shown}"
+    parts = set().union(*MAY_INCLUDE.values())  # "platform/value": a part of a room, without an entry of its own
+    for room in sorted(picture.keys() - MAY_INCLUDE.keys() - parts):
+        yield f"docs/architecture.md: the picture has the room {room}, which the table of include_edges.py does not have"
+
+
 def check(root):
+    yield from differences(root)
     for path in sorted(root.glob("*/**/*")):
         name = path.relative_to(root).as_posix()
         top = name.split("/", 1)[0]

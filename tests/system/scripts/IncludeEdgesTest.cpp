@@ -3,6 +3,8 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
+#include <sstream>
 #include <string>
 
 #include <gmock/gmock.h>
@@ -91,6 +93,32 @@ TEST_F(IncludeEdges, EdgesOfThePictureAreAccepted) {
         const ProgramResult result = checkEdge(source, included);
         EXPECT_EQ(result.status, 0) << source << " -> " << included << ": " << result.output;
     }
+}
+
+TEST_F(IncludeEdges, PictureThatDiffersFromTheTableIsReportedWithTheRoom) {
+    std::ostringstream picture;
+    picture << std::ifstream(SOURCE_DIR "/docs/architecture.md").rdbuf();
+    const std::pair<const char*, const char*> changes[] = {
+        {"    adminhostd -> platform\n", "    adminhostd -> {platform, codec}\n"},
+        {"{plugin, handler} -> commands", "plugin -> commands"},
+        {"    adminhostctl -> platform/task\n", ""},
+        {"        -> {platform/value, ", "        -> {"},
+    };
+    const char* const rooms[] = {"adminhostd: codec\n", "handler: commands\n", "adminhostctl: platform/task\n",
+                                 "adminhostctl/desired: platform/value\n"};
+    fs::create_directories(_tree + "/tree/docs");
+    for (std::size_t i = 0; i < std::size(changes); ++i) {
+        std::string text = picture.str();
+        const std::size_t at = text.find(changes[i].first);
+        ASSERT_NE(at, std::string::npos) << changes[i].first;
+        text.replace(at, std::string(changes[i].first).size(), changes[i].second);
+        std::ofstream(_tree + "/tree/docs/architecture.md") << text;
+        const ProgramResult result = check(_tree + "/tree");
+        EXPECT_EQ(result.status, 1);
+        EXPECT_THAT(result.output, testing::HasSubstr(rooms[i]));
+    }
+    std::ofstream(_tree + "/tree/docs/architecture.md") << picture.str();
+    EXPECT_EQ(check(_tree + "/tree").output, "");
 }
 
 TEST_F(IncludeEdges, ARoomThatThePictureDoesNotHaveIsRefused) {
