@@ -11,7 +11,7 @@ struct Examples {
     std::array<std::string_view, 2> examples;
 };
 
-constexpr std::array table = {
+constexpr std::array examplesOfVerbs = {
     Examples{"settings get", {{"settings get", "settings get server_port"}}},
     Examples{"explain", {{"explain server_port", "--format json explain shared_filesystem"}}},
     Examples{"settings set",
@@ -24,7 +24,7 @@ constexpr std::array table = {
 
 void addExamples(std::vector<Verb>& verbs) {
     for (Verb& verb : verbs) {
-        for (const Examples& one : table) {
+        for (const Examples& one : examplesOfVerbs) {
             if (verb.words == one.words && verb.examples.front().empty()) {
                 verb.examples = one.examples;
             }
