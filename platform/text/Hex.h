@@ -2,6 +2,7 @@
 
 // Hexadecimal digits.
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <span>

@@ -148,6 +148,19 @@ TEST_F(LoneWorker, ConfigurationAfterThatOfTheMonitorIsRefusedAndNothingOfItIsUs
     EXPECT_NE(log.find("the worker was sent what it may not be sent, and ends"), std::string::npos) << log;
 }
 
+TEST_F(LoneWorker, WorkerOfAnotherBuildThanTheDaemonLoadsNothingAndEnds) {
+    protocol::Configure other = configuration("fixture_good");
+    other.build += "x";
+    ASSERT_TRUE(send(std::move(other)));
+    std::vector<std::string> loaded;
+    std::string log;
+    EXPECT_EQ(end(loaded, log), 1);
+    EXPECT_TRUE(loaded.empty());
+    EXPECT_NE(log.find("adminhostd: the worker is of another release than the daemon; restart the daemon"),
+              std::string::npos)
+        << log;
+}
+
 TEST_F(LoneWorker, OrderBeforeItsConfigurationEndsIt) {
     ASSERT_TRUE(send(protocol::ReadHistory{"fixture", BodyForm::json}));
     std::vector<std::string> loaded;
