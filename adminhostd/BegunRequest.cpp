@@ -137,7 +137,7 @@ BegunRequest::BegunRequest(const protocol::Unfinished& about, Redaction redactio
 }
 
 void BegunRequest::append(Dictionary line) {
-    const std::string text = jsonOf(line) + '\n';
+    const std::string text = jsonOf(std::move(line)) + '\n';
     if (!_file.isOpen() || _bytes + text.size() > noteMaximum) {
         return;
     }

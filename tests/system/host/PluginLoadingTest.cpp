@@ -188,6 +188,7 @@ TEST_P(ThrowingFunction, CostsItsOwnCallAndIsLogged) {
     const pid_t worker = daemon.workerPid();
     EXPECT_EQ(daemon.connect().post("/v1/throwing/work", "{}").status, GetParam().status);
     static_cast<void>(daemon.connect().get("/v1/throwing/history"));
+    EXPECT_EQ(daemon.connect().get("/v1/logs").status, 200) << "those of the other plug-ins";
     EXPECT_TRUE(daemon.waitForLog(GetParam().line)) << daemon.log();
     EXPECT_TRUE(daemon.waitForLog(std::string(GetParam().function) + " throws")) << daemon.log();
     EXPECT_EQ(daemon.connect().post("/v1/fixture/echo", "{}").status, 200);
@@ -206,7 +207,8 @@ INSTANTIATE_TEST_SUITE_P(
         Throwing{"revision", 200, "adminhostd: throwing failed to give its revision: "},
         Throwing{"settingsFiles", 200, "could not be kept: "}, Throwing{"settingKeys", 200, "could not be kept: "},
         Throwing{"settings", 200, "could not be kept: "},
-        Throwing{"leftovers", 200, "failed to name what interrupted operations left: "}),
+        Throwing{"leftovers", 200, "failed to name what interrupted operations left: "},
+        Throwing{"logs", 200, "adminhostd: the plug-in throwing failed to name its log files: "}),
     [](const auto& about) { return about.param.function; });
 
 }  // namespace
