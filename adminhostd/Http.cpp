@@ -32,6 +32,8 @@ constexpr auto logPause = 60s;                              ///< between two eve
 constexpr std::size_t answerPiece = std::size_t{1} << 20U;  ///< bytes that a client has the time-out to read
 /// Answers above this size do not fit a socket's buffer of ordinary size.
 constexpr std::size_t ordinaryBuffer = std::size_t{64} << 10U;
+/// For them. The system doubles it, and a client that does not read has it in the kernel's memory.
+constexpr int roomForAnswers = 256 << 10U;
 /// Freed buffers of at least this size are worth returning to the system.
 constexpr std::size_t largeBuffer = std::size_t{1} << 20U;
 /// What the library keeps of a request beside its head. A head that exceeds the bound by no more than this is answered
@@ -463,9 +465,8 @@ int HttpServer::send(Exchange& exchange) {
         dropOldAnswers(exchange);
     }
     if (bytes.size() > ordinaryBuffer) {
-        // The fewer pieces it is sent in, the less often client and front wake each other. The system limits the size.
-        const int size = static_cast<int>(std::min(bytes.size(), largeBuffer));
-        ::setsockopt(exchange._socket, SOL_SOCKET, SO_SNDBUF, &size, sizeof size);
+        // The fewer pieces it is sent in, the less often client and front wake each other.
+        ::setsockopt(exchange._socket, SOL_SOCKET, SO_SNDBUF, &roomForAnswers, sizeof roomForAnswers);
     }
     if (Client* client = clientOf(exchange._connection)) {
         // A client that reads a byte a second would hold the answer's memory for ever.

@@ -4,6 +4,7 @@
 #include "adminhostd/FrontRights.h"
 #include "adminhostd/ListeningSocket.h"
 #include "platform/files/FileDescriptor.h"
+#include "tests/support/OwnMounts.h"
 #include "tests/support/Program.h"
 #include "tests/support/TemporaryRoot.h"
 #include "tests/system/host/Host.h"
@@ -241,10 +242,33 @@ TEST_F(AccountRights, DaemonWithAnAccountForItsFrontServesWhatItServesWithout) {
     EXPECT_EQ(daemon.wait(), 0);
 }
 
+/// A temporary directory that every account can reach, for this process and as long as the object exists: TMPDIR is
+/// often closed to others.
+class OpenTemporaryDirectory {
+  public:
+    OpenTemporaryDirectory() : _former(fs::temp_directory_path()) {
+        if (::unshare(CLONE_NEWNS) != 0 || ::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0) {
+            throw std::runtime_error(std::string("a mount namespace cannot be created; in a container, allow it with "
+                                                 "its option for unshare and mount: ") +
+                                     std::strerror(errno));
+        }
+        _mount.emplace("/media", "mode=1777");
+        ::setenv("TMPDIR", "/media", 1);
+    }
+    OpenTemporaryDirectory(const OpenTemporaryDirectory&) = delete;
+    OpenTemporaryDirectory& operator=(const OpenTemporaryDirectory&) = delete;
+    ~OpenTemporaryDirectory() { ::setenv("TMPDIR", _former.c_str(), 1); }
+
+  private:
+    fs::path _former;
+    std::optional<Mount> _mount;
+};
+
 TEST_F(AccountRights, DirectoryOfTheFrontsAccountIsAFailureOfTheDoctor) {
     if (!isSuperuser()) {
         return;
     }
+    const OpenTemporaryDirectory open;
     const TemporaryRoot root;
     const passwd* const account = ::getpwnam(otherAccount);
     ASSERT_NE(account, nullptr);
@@ -327,6 +351,7 @@ TEST_F(AccountRights, SocketOfAnotherAccountIsNeverReplacedAndTheMessageHasAFix)
     if (!isSuperuser()) {
         return;
     }
+    const OpenTemporaryDirectory open;
     const TemporaryRoot root;
     fs::permissions(root.path("/"), fs::perms(0755));
     const std::string path = root.path("/open/socket");
