@@ -187,6 +187,10 @@ Diagnosis FrontChecks::daemonCheck() const {
 Diagnosis FrontChecks::socketCheck() const {
     struct stat status {};
     const bool exists = ::lstat(_socket.path.c_str(), &status) == 0;
+    if (!exists && errno != ENOENT && errno != ENOTDIR) {
+        return {Health::failure, "socket", fmt::format("{}: {}.", _socket.path, errorText(errno)),
+                "make its directory accessible for the daemon"};
+    }
     if (!exists || status.st_dev != _socket.device || status.st_ino != _socket.inode) {
         return {Health::failure, "socket",
                 fmt::format("{} {}: new clients do not reach this daemon.", _socket.path,

@@ -39,6 +39,7 @@ namespace {
 
 namespace fs = std::filesystem;
 using testing::HasSubstr;
+using testing::Not;
 
 constexpr const char* otherAccount = "nobody";
 constexpr const char* ofOtherAccount = "account = \"nobody\"\n";
@@ -280,6 +281,17 @@ TEST_F(AccountRights, DirectoryOfTheFrontsAccountIsAFailureOfTheDoctor) {
     const DaemonProcess daemon(options);
     EXPECT_THAT(daemon.connect().get("/v1/doctor").body,
                 HasSubstr("belongs to uid " + std::to_string(account->pw_uid) + R"(.","fix":"chown it to root")"));
+}
+
+TEST_F(AccountRights, SocketThatTheFrontCannotReachIsNotCalledRemoved) {
+    if (!isSuperuser()) {
+        return;
+    }
+    const DaemonProcess daemon(withFixture(ofOtherAccount));
+    fs::permissions(daemon.directory(), fs::perms::owner_all);
+    const std::string doctor = daemon.connect().get("/v1/doctor").body;
+    EXPECT_THAT(doctor, HasSubstr(daemon.socket() + ": Permission denied."));
+    EXPECT_THAT(doctor, Not(HasSubstr("has been removed")));
 }
 
 TEST_F(AccountRights, FrontThatCannotReadTheFileGetsTheConfigurationAtAReload) {
