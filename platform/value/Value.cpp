@@ -181,6 +181,12 @@ Value& Value::operator=(Value&& other) noexcept {
 }
 Value::~Value() = default;
 
+Value::Type Value::type() const noexcept {
+    constexpr Type types[] = {Type::null,   Type::boolean, Type::integer, Type::integer, Type::real,
+                              Type::string, Type::date,    Type::data,    Type::array,   Type::dictionary};
+    return types[_value.index()];
+}
+
 std::optional<bool> Value::boolean() const noexcept {
     const bool* value = std::get_if<bool>(&_value);
     return value == nullptr ? std::nullopt : std::optional(*value);

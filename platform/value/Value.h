@@ -118,7 +118,7 @@ class ADMINHOST_EXPORT Value {
     Value& operator=(Value&&) noexcept;
     ~Value();
 
-    [[nodiscard]] Type type() const noexcept { return types[_value.index()]; }
+    [[nodiscard]] Type type() const noexcept;
     [[nodiscard]] bool isNull() const noexcept { return std::holds_alternative<std::monostate>(_value); }
     [[nodiscard]] bool isInteger() const noexcept { return type() == Type::integer; }
 
@@ -140,10 +140,6 @@ class ADMINHOST_EXPORT Value {
     ADMINHOST_EXPORT friend bool operator==(const Value& a, const Value& b);
 
   private:
-    /// Those of the alternatives below.
-    static constexpr Type types[] = {Type::null,   Type::boolean, Type::integer, Type::integer, Type::real,
-                                     Type::string, Type::date,    Type::data,    Type::array,   Type::dictionary};
-
     std::variant<std::monostate, bool, std::int64_t, std::uint64_t, double, std::string, Date, Data, Array, Dictionary>
         _value;
 };

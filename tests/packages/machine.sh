@@ -35,11 +35,11 @@ create_base() {
         { tail "$base/log"; fail "the packages could not be installed: $*"; }
 }
 
-# dependencies_of FILE...: what the package files need besides each other.
+# dependencies_of FILE...: what the package files need besides each other, and what apt installs with them.
 dependencies_of() {
     local file own
     own=$(for file; do dpkg-deb --field "$file" Package Provides; done | sed 's/.*: //')
-    for file; do dpkg-deb --field "$file" Depends; done | tr ',' '\n' | sed 's/|.*//; s/(.*//; s/ //g; /^$/d' | sort -u |
+    for file; do dpkg-deb --field "$file" Depends Recommends | sed 's/^[A-Za-z]*: //'; done | tr ',' '\n' | sed 's/|.*//; s/(.*//; s/ //g; /^$/d' | sort -u |
         grep -vxF "$own"
 }
 

@@ -88,6 +88,7 @@ TEST_F(Processes, FrontsThatKeepDyingAreStartedAfterAGrowingPause) {
     EXPECT_TRUE(serves());
 }
 
+#ifndef ADMINHOST_SANITIZED  // a sanitizer needs descriptors of its own
 TEST_F(Processes, FrontThatCannotBeStartedAgainIsTriedUntilItCan) {
     rlimit bound{};
     ASSERT_EQ(::prlimit(_daemon.pid(), RLIMIT_NOFILE, nullptr, &bound), 0);
@@ -102,6 +103,7 @@ TEST_F(Processes, FrontThatCannotBeStartedAgainIsTriedUntilItCan) {
     EXPECT_TRUE(serves());
     EXPECT_EQ(data(), "written\n");
 }
+#endif
 
 TEST_F(Processes, MonitorThatIsKilledLetsTheFrontFinishTheWriteAndAnswerItsClient) {
     // Here the front is not left to another process, so that its end can be seen.
@@ -117,7 +119,9 @@ TEST_F(Processes, MonitorThatIsKilledLetsTheFrontFinishTheWriteAndAnswerItsClien
     EXPECT_EQ(data(), "written\n");
     int status = -1;
     EXPECT_EQ(::waitpid(front, &status, 0), front);
-    EXPECT_EQ(status, 0);
+#ifndef ADMINHOST_SANITIZED  // the search for leaks fails in a process that may not open its own directory of threads
+    EXPECT_EQ(status, 0) << _daemon.log();
+#endif
     EXPECT_EQ(::waitpid(worker, nullptr, 0), worker);
     ::prctl(PR_SET_CHILD_SUBREAPER, 0);
 }

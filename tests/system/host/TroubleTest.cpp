@@ -344,7 +344,7 @@ TEST(End, RunningWriteIsEndedAtItsDeadline) {
 }
 
 TEST(End, RunningWriteWhoseWorkerHangsIsNotAnsweredAsIfItHadNotRun) {
-    DaemonProcess daemon(withFixture("request_deadline_seconds = 5\n"));
+    DaemonProcess daemon(withFixture("request_deadline_seconds = 15\n"));
     const std::string begun = daemon.directory() / "begun";
     const pid_t worker = daemon.workerPid();
     UnixHttp writer(daemon.socket(), std::chrono::seconds(60));

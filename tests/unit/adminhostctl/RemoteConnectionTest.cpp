@@ -83,7 +83,8 @@ TEST_F(RemoteConnection, DaemonThatDoesNotAcceptTheConnectionIsLateAlsoAfterALog
         ADD_FAILURE();
     } catch (const Unavailable& failure) {
         EXPECT_EQ(failure.status(), ExitStatus::notReachable);
-        EXPECT_STREQ(failure.what(), "the daemon of studio has not answered within 1.5 s");
+        // What is left of the 1.5 seconds when the connection begins.
+        EXPECT_TRUE(std::string(failure.what()).starts_with("the daemon of studio has not answered within 1."));
     }
 }
 
