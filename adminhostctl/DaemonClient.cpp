@@ -3,8 +3,8 @@
 #include "adminhostctl/Interrupt.h"
 #include "adminhostctl/Similar.h"
 #include "adminhostctl/Width.h"
-#include "platform/framework/Release.h"
 #include "platform/json/Json.h"
+#include "platform/release/Release.h"
 #include "platform/text/Uuid.h"
 #include "platform/value/ValueText.h"
 

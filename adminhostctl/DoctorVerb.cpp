@@ -1,7 +1,7 @@
 #include "adminhostctl/DoctorVerb.h"
 
 #include "adminhostctl/Width.h"
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 #include "platform/value/Value.h"
 
 #include <algorithm>

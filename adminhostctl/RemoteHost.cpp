@@ -3,7 +3,7 @@
 #include "adminhostctl/Bridge.h"
 #include "adminhostctl/Interrupt.h"
 #include "adminhostctl/Width.h"
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 #include "platform/task/StartChild.h"
 
 #include <algorithm>

@@ -2,8 +2,8 @@
 
 #include "adminhostd/FrontAnswers.h"
 #include "adminhostd/RequestBody.h"
-#include "platform/framework/Release.h"
 #include "platform/log/Log.h"
+#include "platform/release/Release.h"
 #include "platform/text/Uuid.h"
 
 #include <algorithm>

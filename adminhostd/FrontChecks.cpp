@@ -3,8 +3,8 @@
 #include "adminhostd/PluginFile.h"
 #include "adminhostd/RunDirectory.h"
 #include "adminhostd/UnitProcesses.h"
-#include "platform/framework/Release.h"
 #include "platform/log/Log.h"
+#include "platform/release/Release.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -2,8 +2,8 @@
 
 #include "adminhostd/Front.h"
 #include "adminhostd/FrontAnswers.h"
-#include "platform/framework/Release.h"
 #include "platform/json/Json.h"
+#include "platform/release/Release.h"
 
 #include <string>
 #include <string_view>

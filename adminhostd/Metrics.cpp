@@ -1,6 +1,6 @@
 #include "adminhostd/Metrics.h"
 
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 
 #include <algorithm>
 

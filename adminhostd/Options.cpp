@@ -1,7 +1,7 @@
 #include "adminhostd/Options.h"
 
 #include "adminhostd/PluginFile.h"
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 
 #include <cstdlib>
 #include <filesystem>

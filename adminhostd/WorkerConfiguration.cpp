@@ -4,7 +4,7 @@
 #include "adminhostd/Login.h"
 #include "adminhostd/ToolConfiguration.h"
 #include "platform/framework/BuildNote.h"
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 #include "platform/text/EnvironmentLanguages.h"
 
 #include <cstdint>

@@ -23,7 +23,7 @@ import tree_check  # noqa: E402
 
 HOST = ["adminhostd", "platform", "adminhostctl"]
 # The verbs of this one service with examples of the others, and the program that joins them.
-NOT_HOST = ["adminhostctl/lumio", "adminhostctl/Main.cpp"]
+NOT_HOST = ["adminhostctl/lumio", "adminhostctl/program"]
 PLUGIN = ["plugin", "handler", "resources", "settings", "commands"]
 SOURCES = {".cpp", ".h"}
 TEXT = re.compile(r'"((?:[^"\\\n]|\\.)*)"')

@@ -1,6 +1,6 @@
 // Every kind of mistake, and the exit status that the manual page has for it.
 
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 #include "tests/support/OnTerminal.h"
 #include "tests/system/apply/OvertakenService.h"
 

@@ -1,8 +1,8 @@
 // The command line with the daemon of this build: with the service's plug-in on a sample root, and with a plug-in that
 // returns the answers that a test chooses.
 
-#include "platform/framework/Release.h"
 #include "platform/json/Json.h"
+#include "platform/release/Release.h"
 #include "platform/task/Task.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Program.h"

@@ -1,6 +1,6 @@
 // What the daemon rejects before it serves, and what --check reports: configuration, command line, root.
 
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 #include "tests/support/TemporaryRoot.h"
 #include "tests/system/host/StartFixture.h"
 

@@ -1,6 +1,6 @@
 // The checks of the installation, with the daemon of this build and the fixture plug-in.
 
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 #include "tests/system/host/Host.h"
 
 #include <csignal>

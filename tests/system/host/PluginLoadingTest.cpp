@@ -1,7 +1,7 @@
 // Which plug-in files are loaded, and what the log and --check report about the others.
 
 #include "adminhostd/PluginFile.h"
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 #include "tests/support/Program.h"
 #include "tests/system/host/Host.h"
 

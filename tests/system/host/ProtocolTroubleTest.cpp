@@ -3,7 +3,7 @@
 #include "adminhostd/Protocol.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/framework/BuildNote.h"
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 #include "platform/task/StartChild.h"
 #include "platform/task/ToolRegister.h"
 #include "tests/support/TemporaryRoot.h"

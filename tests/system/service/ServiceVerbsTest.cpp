@@ -1,7 +1,7 @@
 // The verbs for the service as a whole, on the sample service. Below another root its pid file shows whether it runs.
 
-#include "platform/framework/Release.h"
 #include "platform/json/Json.h"
+#include "platform/release/Release.h"
 #include "platform/value/Value.h"
 #include "tests/system/apply/ControlledService.h"
 

@@ -21,7 +21,7 @@
 #include "adminhostctl/lumio/VerbExamples.h"
 #include "platform/files/FileDescriptor.h"
 #include "platform/files/StandardDescriptors.h"
-#include "platform/framework/Release.h"
+#include "platform/release/Release.h"
 
 #include <algorithm>
 #include <charconv>
